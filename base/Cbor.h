@@ -1,0 +1,146 @@
+#pragma once
+
+#include "base/Dictionary.h"
+#include "base/TextBuffer.h"
+#include "base/Value.h"
+
+#include <array>
+#include <cstdint>
+#include <memory>
+#include <optional>
+#include <span>
+#include <string_view>
+#include <vector>
+
+namespace tamblo {
+
+/// What is wrong with bytes that should be CBOR. The first two say that they are not well-formed (RFC 8949,
+/// section 5.3.1); the others, that a well-formed item is none of the values that are accepted.
+enum class CborError : std::uint8_t {
+    none,
+    truncated,
+    malformed,
+    tooDeep,
+    nullValue,
+    unsupportedTag,
+    unsupportedSimple,
+    keyNotText,
+    duplicateKey,
+    notUtf8,
+    integerOutOfRange,
+};
+
+[[nodiscard]] constexpr bool isNotWellFormed(CborError error) noexcept {
+    return error == CborError::truncated || error == CborError::malformed;
+}
+/// For people: "a map holds a key twice".
+[[nodiscard]] std::string_view describe(CborError error) noexcept;
+
+/// Writes CBOR items in their shortest heads, definite lengths, maps in key order.
+class CborWriter {
+public:
+    explicit CborWriter(TextBuffer& out) noexcept : out_(out) {}
+
+    void arrayHead(std::uint64_t count) { head(4, count); }
+    void mapHead(std::uint64_t count) { head(5, count); }
+    void unsignedInteger(std::uint64_t value) { head(0, value); }
+    void integer(std::int64_t value);
+    void boolean(bool value);
+    void null();
+    void text(std::string_view text);
+    void value(const Value& value);
+    void dictionary(const Dictionary& dictionary);
+
+private:
+    void head(unsigned major, std::uint64_t argument);
+
+    TextBuffer& out_;
+};
+
+/// Remembers the key sets of maps that were read, in the order in which their keys came, so that the maps of one
+/// kind of message share one key set and are read without sorting or comparing keys with each other. Bounded: a
+/// client that invents keys only pushes others out. Used by one thread at a time.
+class KeySetCache {
+public:
+    KeySetCache();
+    ~KeySetCache();
+    KeySetCache(const KeySetCache&) = delete;
+    KeySetCache& operator=(const KeySetCache&) = delete;
+
+private:
+    friend class CborReader;
+    struct Shape;
+    static constexpr std::size_t kSlots = 512;
+    std::array<std::unique_ptr<Shape>, kSlots> slots_;
+};
+
+/// Reads CBOR (RFC 8949) that nobody vouches for: a cursor over bytes that it never leaves, that allocates nothing
+/// from a declared count, and that stays at its first error. Definite and indefinite lengths are accepted.
+///
+/// The values accepted are those that `Value` has: text, integers from −2^63 to 2^64−1, floats, booleans, dates
+/// (tag 1), byte strings, arrays and maps with text keys, each key once; nesting to a depth of 32.
+class CborReader {
+public:
+    static constexpr int kMaximumDepth = 32;
+
+    enum class Type : std::uint8_t { unsignedInteger, negativeInteger, bytes, text, array, map, tag, simple, end };
+
+    explicit CborReader(std::span<const std::uint8_t> bytes, KeySetCache* keySets = nullptr) noexcept
+        : position_(bytes.data()), end_(bytes.data() + bytes.size()), keySets_(keySets) {}
+
+    [[nodiscard]] CborError error() const noexcept { return error_; }
+    [[nodiscard]] bool atEnd() const noexcept { return position_ == end_; }
+    /// The type of the next item; `end` at the end of the bytes or after an error.
+    [[nodiscard]] Type peek() const noexcept;
+    [[nodiscard]] bool nextIsNull() const noexcept { return position_ != end_ && *position_ == 0xF6; }
+
+    /// Each reads the next item when it is of that kind; otherwise leaves it and answers nothing, without an error.
+    [[nodiscard]] std::optional<std::uint64_t> readUnsigned() noexcept;
+    [[nodiscard]] std::optional<std::int64_t> readInteger() noexcept;
+    [[nodiscard]] std::optional<bool> readBoolean() noexcept;
+    /// A text that stands in the bytes themselves (definite length), UTF-8.
+    [[nodiscard]] std::optional<std::string_view> readText() noexcept;
+    [[nodiscard]] bool readNull() noexcept;
+
+    /// The head of an array; its elements follow. `count` is what the head declares and is trusted for nothing;
+    /// without it the length is indefinite. Ask `moreElements` before each element.
+    struct ArrayHead {
+        std::optional<std::uint64_t> count;
+        std::uint64_t read = 0;
+    };
+    [[nodiscard]] std::optional<ArrayHead> readArrayHead() noexcept;
+    [[nodiscard]] bool moreElements(ArrayHead& array) noexcept;
+
+    /// The next item as a value; nothing after an error. `spare` is room for keys that are yet to be added to it.
+    [[nodiscard]] std::optional<Value> readValue();
+    [[nodiscard]] std::optional<Dictionary> readDictionary(std::size_t spare = 0);
+    /// Steps over one well-formed item, whatever it is, acceptable as a value or not.
+    bool skip() noexcept;
+
+private:
+    struct Head {
+        std::uint8_t major;
+        std::uint8_t info;
+        std::uint64_t argument;
+    };
+    struct MapScratch;
+
+    bool fail(CborError error) noexcept;
+    bool readHead(Head& head) noexcept;
+    bool readItem(Value& value, int depth);
+    bool readFloat(const Head& head, Value& value) noexcept;
+    bool readString(const Head& head, Value& value);
+    bool readChunks(const Head& head, Value& value);
+    bool readTag(const Head& head, Value& value, int depth);
+    bool readArray(const Head& head, Value& value, int depth);
+    bool readMap(const Head& head, Dictionary& dictionary, int depth, std::size_t spare);
+    bool readSimple(const Head& head, Value& value) noexcept;
+    bool skipItem(int depth) noexcept;
+
+    const std::uint8_t* position_;
+    const std::uint8_t* end_;
+    KeySetCache* keySets_;
+    CborError error_ = CborError::none;
+};
+
+} // namespace tamblo

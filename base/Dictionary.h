@@ -1,0 +1,81 @@
+#pragma once
+
+#include "base/KeySet.h"
+#include "base/Value.h"
+
+#include <atomic>
+#include <initializer_list>
+#include <span>
+#include <string>
+#include <string_view>
+#include <utility>
+
+namespace tamblo {
+
+/// String keys to values, sorted by key, with value semantics: the payload of every message.
+///
+/// One pointer wide. Copies share a block until one of them is changed (copy on write), so handing a payload on is
+/// one atomic increment; the keys lie in a `KeySet` that dictionaries of the same keys share. Two threads may use
+/// two copies at the same time; one object is, like any value, used by one thread at a time.
+class Dictionary {
+public:
+    using Entry = std::pair<std::string_view, Value>;
+
+    Dictionary() noexcept = default;
+    Dictionary(std::initializer_list<Entry> entries);
+    Dictionary(const Dictionary& other) noexcept;
+    Dictionary(Dictionary&& other) noexcept : block_(other.block_) { other.block_ = nullptr; }
+    Dictionary& operator=(const Dictionary& other) noexcept;
+    Dictionary& operator=(Dictionary&& other) noexcept;
+    ~Dictionary();
+
+    [[nodiscard]] std::size_t size() const noexcept;
+    [[nodiscard]] bool empty() const noexcept { return size() == 0; }
+
+    /// Entries in key order. A reference to a key or value holds until the dictionary is changed or destroyed.
+    [[nodiscard]] std::string_view keyAt(std::size_t index) const noexcept { return keys().key(index); }
+    [[nodiscard]] const Value& valueAt(std::size_t index) const noexcept { return values()[index]; }
+    [[nodiscard]] const KeySet& keys() const noexcept;
+    [[nodiscard]] std::span<const Value> values() const noexcept;
+
+    /// The value of the key, or null. Allocates nothing.
+    [[nodiscard]] const Value* find(std::string_view key) const noexcept;
+    [[nodiscard]] bool contains(std::string_view key) const noexcept { return find(key) != nullptr; }
+
+    void set(std::string_view key, Value value);
+    /// Replaces the value at an index; the keys stay.
+    void setValueAt(std::size_t index, Value value);
+    bool remove(std::string_view key);
+    /// Adds every entry of the other dictionary; its values win.
+    void merge(const Dictionary& other);
+    void reserve(std::size_t capacity);
+
+    /// Builds a dictionary whose values already stand in the order of the sorted keys. `spare` is room for keys to
+    /// come. The values are moved from.
+    static Dictionary adopt(KeySetRef keys, std::span<Value> values, std::size_t spare = 0);
+
+    [[nodiscard]] bool operator==(const Dictionary& other) const noexcept;
+    /// Equal but for the entries of the ignored keys, wherever they stand.
+    [[nodiscard]] bool equalsIgnoring(const Dictionary& other,
+                                      std::span<const std::string_view> ignoredKeys) const noexcept;
+
+    /// Whether both are the same block, and so equal for as long as neither is changed.
+    [[nodiscard]] bool sharesStorageWith(const Dictionary& other) const noexcept {
+        return block_ == other.block_;
+    }
+    /// A dictionary that shares nothing with this one but immutable keys.
+    [[nodiscard]] Dictionary deepCopy() const;
+    [[nodiscard]] std::size_t heapBytes() const noexcept;
+
+private:
+    friend class Value;
+    struct Block;
+
+    void detach(std::size_t capacity);
+    static void retain(Block* block) noexcept;
+    static void release(Block* block) noexcept;
+
+    Block* block_ = nullptr;
+};
+
+} // namespace tamblo

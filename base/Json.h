@@ -1,0 +1,45 @@
+#pragma once
+
+#include "base/Dictionary.h"
+#include "base/TextBuffer.h"
+#include "base/Value.h"
+
+#include <cstddef>
+#include <string>
+#include <string_view>
+#include <variant>
+
+namespace tamblo {
+
+/// Appends a value as JSON (RFC 8259), without white space, keys in their order. Doubles print the shortest text
+/// that reads back the same, with `.0` when integral; single-precision floats likewise in single precision. Dates
+/// become RFC 3339 texts, byte strings Base64 texts, numbers that are not finite `null`.
+void appendJson(TextBuffer& out, const Value& value);
+void appendJson(TextBuffer& out, const Dictionary& dictionary);
+/// Appends a text in quotes, escaped.
+void appendJsonString(TextBuffer& out, std::string_view text);
+/// Appends a double by the rule above.
+void appendJsonNumber(TextBuffer& out, double number);
+
+[[nodiscard]] std::string jsonText(const Value& value);
+[[nodiscard]] std::string jsonText(const Dictionary& dictionary);
+
+/// Where and why a text is not JSON, for people: line and column count from 1.
+struct JsonError {
+    std::size_t line = 0;
+    std::size_t column = 0;
+    std::string message;
+};
+
+struct JsonReadOptions {
+    /// A `null` has no place among property-list values: members and elements that are null are left out, or, when
+    /// refused, make the text an error.
+    bool refuseNull = false;
+};
+
+/// Reads one JSON value, with nothing but white space around it. Integers within 64 bits stay integers (the
+/// unsigned range included), other numbers are doubles. An object that names a key twice, nesting deeper than 32
+/// and text that is not UTF-8 are errors. A bare `null` is an error.
+[[nodiscard]] std::variant<Value, JsonError> readJson(std::string_view text, JsonReadOptions options = {});
+
+} // namespace tamblo

@@ -1,0 +1,120 @@
+#pragma once
+
+#include <atomic>
+#include <cstddef>
+#include <cstdint>
+#include <memory>
+#include <span>
+#include <string_view>
+
+namespace tamblo {
+
+class KeySet;
+
+/// Shared ownership of a key set; one pointer wide.
+class KeySetRef {
+public:
+    KeySetRef() noexcept = default;
+    explicit KeySetRef(const KeySet* keys) noexcept;
+    KeySetRef(const KeySetRef& other) noexcept;
+    KeySetRef(KeySetRef&& other) noexcept : keys_(other.keys_) { other.keys_ = nullptr; }
+    KeySetRef& operator=(KeySetRef other) noexcept;
+    ~KeySetRef();
+
+    [[nodiscard]] const KeySet* get() const noexcept { return keys_; }
+    const KeySet* operator->() const noexcept { return keys_; }
+    const KeySet& operator*() const noexcept { return *keys_; }
+    explicit operator bool() const noexcept { return keys_ != nullptr; }
+
+private:
+    const KeySet* keys_ = nullptr;
+};
+
+/// The sorted keys of a dictionary, apart from its values.
+///
+/// Messages of one kind all have the same keys, so their dictionaries share one key set: comparing two of them
+/// compares a pointer and the values, a message takes no memory for its keys, and what follows from the keys alone
+/// (the JSON text of each, whether one holds a space) is worked out once. A key set is immutable and lives as long
+/// as a dictionary, or a key set that was derived from, refers to it. Safe on any thread.
+class KeySet {
+public:
+    static constexpr std::size_t kNotFound = static_cast<std::size_t>(-1);
+
+    /// `sortedKeys` ascending by bytes, each once.
+    static KeySetRef make(std::span<const std::string_view> sortedKeys);
+    static const KeySetRef& empty();
+
+    [[nodiscard]] std::size_t size() const noexcept { return count_; }
+    [[nodiscard]] std::string_view key(std::size_t index) const noexcept;
+    /// The key as it stands in JSON, quotes and colon included: `"key":`.
+    [[nodiscard]] std::string_view jsonKey(std::size_t index) const noexcept;
+    [[nodiscard]] std::size_t find(std::string_view key) const noexcept;
+    /// Whether a key holds U+0020.
+    [[nodiscard]] bool anyKeyHasSpace() const noexcept { return anyKeyHasSpace_; }
+    [[nodiscard]] bool operator==(const KeySet& other) const noexcept;
+
+    struct Extension {
+        KeySetRef keys;
+        std::size_t index; ///< of the added key
+    };
+    /// The key set with one more key, which it must not hold. The few keys that are added again and again are
+    /// remembered, so that this is a look-up.
+    [[nodiscard]] Extension adding(std::string_view key) const;
+    [[nodiscard]] KeySetRef removing(std::size_t index) const;
+
+private:
+    friend class KeySetRef;
+
+    /// Eight leading bytes of the key, most significant first: most comparisons end here.
+    struct Entry {
+        std::uint64_t prefix;
+        std::uint32_t offset;
+        std::uint32_t length;
+        std::uint32_t jsonOffset;
+        std::uint32_t jsonLength;
+    };
+    struct Transition;
+
+    explicit KeySet(std::span<const std::string_view> sortedKeys);
+    ~KeySet();
+    KeySet(const KeySet&) = delete;
+    KeySet& operator=(const KeySet&) = delete;
+
+    void retain() const noexcept { references_.fetch_add(1, std::memory_order_relaxed); }
+    void release() const noexcept;
+
+    mutable std::atomic<std::uint32_t> references_{0};
+    std::uint32_t count_ = 0;
+    bool anyKeyHasSpace_ = false;
+    std::unique_ptr<Entry[]> entries_;
+    std::unique_ptr<char[]> text_;
+    std::uint32_t textLength_ = 0;
+    mutable std::atomic<std::uint32_t> transitionCount_{0};
+    mutable std::atomic<Transition*> transitions_{nullptr};
+};
+
+inline KeySetRef::KeySetRef(const KeySet* keys) noexcept : keys_(keys) {
+    if (keys_ != nullptr) {
+        keys_->retain();
+    }
+}
+inline KeySetRef::KeySetRef(const KeySetRef& other) noexcept : KeySetRef(other.keys_) {}
+inline KeySetRef& KeySetRef::operator=(KeySetRef other) noexcept {
+    const KeySet* mine = keys_;
+    keys_ = other.keys_;
+    other.keys_ = mine;
+    return *this;
+}
+inline KeySetRef::~KeySetRef() {
+    if (keys_ != nullptr) {
+        keys_->release();
+    }
+}
+inline std::string_view KeySet::key(std::size_t index) const noexcept {
+    return {text_.get() + entries_[index].offset, entries_[index].length};
+}
+inline std::string_view KeySet::jsonKey(std::size_t index) const noexcept {
+    return {text_.get() + entries_[index].jsonOffset, entries_[index].jsonLength};
+}
+
+} // namespace tamblo
