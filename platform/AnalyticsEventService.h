@@ -1,0 +1,22 @@
+#pragma once
+
+#include "base/Dictionary.h"
+
+#include <functional>
+#include <string_view>
+
+namespace tamblo {
+
+/// The analytics-event service: collects named events with a payload. Any thread; neither operation blocks, and
+/// what cannot be recorded is the service's own to report.
+class AnalyticsEventService {
+public:
+    virtual ~AnalyticsEventService() = default;
+    /// Whether events of this name are collected now.
+    [[nodiscard]] virtual bool isEventInUse(std::string_view eventName) = 0;
+    /// Records one event. The provider is called at most once, only if the event is recorded, and before this
+    /// returns; what it returns is the event's payload as of then.
+    virtual void sendEventLazy(std::string_view eventName, const std::function<Dictionary()>& payload) = 0;
+};
+
+} // namespace tamblo

@@ -1,0 +1,21 @@
+#pragma once
+
+#include <chrono>
+
+namespace tamblo {
+
+/// A point of civil time. Payloads carry it as seconds since 1970 in a double.
+using WallTime = std::chrono::time_point<std::chrono::system_clock, std::chrono::nanoseconds>;
+
+[[nodiscard]] constexpr double secondsSince1970(WallTime time) noexcept {
+    return std::chrono::duration<double>(time.time_since_epoch()).count();
+}
+
+/// The time of day, on any thread, without blocking. It may step backwards. Read once per message and passed down.
+class Clock {
+public:
+    virtual ~Clock() = default;
+    [[nodiscard]] virtual WallTime now() const noexcept = 0;
+};
+
+} // namespace tamblo

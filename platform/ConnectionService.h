@@ -1,0 +1,54 @@
+#pragma once
+
+#include "base/UniqueFunction.h"
+#include "platform/ZRReportingServiceProtocol.h"
+
+#include <memory>
+#include <string>
+#include <string_view>
+
+#include <sys/types.h>
+
+namespace tamblo {
+
+/// One client's connection. Set up inside the accept callback, then resumed; from then on the service holds it no
+/// longer and hears of it through the handlers, on the connection's thread.
+class ClientConnection {
+public:
+    virtual ~ClientConnection() = default;
+    [[nodiscard]] virtual pid_t peerProcessIdentifier() const noexcept = 0;
+    /// The object that answers the client's requests; held until the connection has ended.
+    virtual void setExportedObject(std::shared_ptr<ZRReportingServiceProtocol> object) = 0;
+    /// Called once when the connection breaks off (a reset, a protocol error).
+    virtual void setInterruptionHandler(UniqueFunction<void()> handler) = 0;
+    /// Called once when the connection has ended for good, after any interruption.
+    virtual void setInvalidationHandler(UniqueFunction<void()> handler) = 0;
+    virtual void resume() = 0;
+    [[nodiscard]] virtual std::string description() const = 0;
+};
+
+/// Decides about each new connection; called on the listener's thread.
+class ListenerDelegate {
+public:
+    virtual ~ListenerDelegate() = default;
+    /// False turns the client away.
+    virtual bool shouldAcceptNewConnection(ClientConnection& connection) = 0;
+};
+
+/// The named listener of the interprocess connection service. Accepts from `resume` on.
+class ConnectionListener {
+public:
+    virtual ~ConnectionListener() = default;
+    /// The delegate must outlive the listener.
+    virtual void setDelegate(ListenerDelegate& delegate) = 0;
+    virtual void resume() = 0;
+};
+
+class ConnectionService {
+public:
+    virtual ~ConnectionService() = default;
+    /// The listener for an interprocess service name; one per process.
+    [[nodiscard]] virtual ConnectionListener& listenerForServiceName(std::string_view serviceName) = 0;
+};
+
+} // namespace tamblo

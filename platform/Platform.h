@@ -1,0 +1,34 @@
+#pragma once
+
+#include "platform/AnalyticsEventService.h"
+#include "platform/Clock.h"
+#include "platform/ConnectionService.h"
+#include "platform/DeviceProperties.h"
+#include "platform/Preferences.h"
+#include "platform/ProcessInformation.h"
+#include "platform/StructuredLog.h"
+#include "platform/TracePoints.h"
+#include "platform/WorkQueue.h"
+
+namespace tamblo {
+
+/// The services that the system finds on the device, one of each. Installed once, before anything else runs, and
+/// alive until the process ends; a test installs its fakes the same way.
+struct Platform {
+    Clock& clock;
+    WorkQueues& workQueues;
+    StructuredLog& log;
+    TracePoints& tracePoints;
+    DeviceProperties& deviceProperties;
+    Preferences& preferences;
+    ProcessInformation& processInformation;
+    AnalyticsEventService& analyticsEvents;
+    ConnectionService& connections;
+};
+
+/// Makes these the platform of the process, in place of any before. Not while work runs.
+void installPlatform(const Platform& platform);
+/// The installed platform. Before one is installed there is none, and calling this is a fault.
+[[nodiscard]] const Platform& platform() noexcept;
+
+} // namespace tamblo

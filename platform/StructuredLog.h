@@ -1,0 +1,20 @@
+#pragma once
+
+#include <cstdint>
+#include <string_view>
+
+namespace tamblo {
+
+enum class LogLevel : std::uint8_t { debug, info, standard, error, fault };
+
+/// Where log lines go. Any thread; must not fail and should not block.
+class StructuredLog {
+public:
+    virtual ~StructuredLog() = default;
+    /// The least level written for a category, by its four-letter code. Constant for the life of the process.
+    [[nodiscard]] virtual LogLevel threshold(std::string_view categoryCode) const noexcept = 0;
+    /// One line, without its line end; control characters in it are the implementation's to make harmless.
+    virtual void write(LogLevel level, std::string_view categoryCode, std::string_view line) noexcept = 0;
+};
+
+} // namespace tamblo

@@ -1,0 +1,50 @@
+#pragma once
+
+#include "base/UniqueFunction.h"
+
+#include <chrono>
+#include <memory>
+#include <string_view>
+
+namespace tamblo {
+
+/// One piece of queued work. What a request's work captures fits without an allocation.
+using Work = UniqueFunction<void(), 144>;
+
+/// What a piece of work may do to the thread that runs it.
+enum class Pace {
+    quick,    ///< neither waits nor computes for long; may run on a thread that must stay responsive
+    mayBlock, ///< may wait for a disk, a lock or another process, or takes milliseconds
+};
+
+/// Runs work one piece at a time, in the order posted, on whatever thread suits. Destroying a queue first finishes
+/// what was posted.
+class SerialQueue {
+public:
+    virtual ~SerialQueue() = default;
+    /// From any thread, without blocking. The work runs later, never inside this call.
+    virtual void post(Work work, Pace pace = Pace::quick) = 0;
+    /// Called after each run of pieces, on the thread that ran them, before others run. Set before the first post.
+    virtual void setBatchEnd(Work batchEnd) = 0;
+    [[nodiscard]] virtual std::string_view label() const noexcept = 0;
+};
+
+/// Ticks at an interval on a thread of its own from `start` on. Destroying or invalidating it ends that: after
+/// `invalidate`, which may be called from the tick itself, no further tick begins; the destructor also waits for a
+/// running tick, unless it is called from that tick.
+class RepeatingTimer {
+public:
+    virtual ~RepeatingTimer() = default;
+    virtual void start() = 0;
+    virtual void invalidate() = 0;
+};
+
+class WorkQueues {
+public:
+    virtual ~WorkQueues() = default;
+    [[nodiscard]] virtual std::unique_ptr<SerialQueue> makeSerialQueue(std::string_view label) = 0;
+    [[nodiscard]] virtual std::unique_ptr<RepeatingTimer>
+    makeRepeatingTimer(std::chrono::milliseconds interval, UniqueFunction<void()> tick) = 0;
+};
+
+} // namespace tamblo
