@@ -59,8 +59,10 @@ public:
     void commit(std::size_t count) noexcept { size_ += count; }
 
     void append(std::string_view text) {
-        std::memcpy(room(text.size()), text.data(), text.size());
-        size_ += text.size();
+        if (!text.empty()) {
+            std::memcpy(room(text.size()), text.data(), text.size());
+            size_ += text.size();
+        }
     }
     void append(char character) {
         *room(1) = character;
