@@ -6,9 +6,11 @@
 
 #include <array>
 #include <cstdint>
+#include <deque>
 #include <memory>
 #include <optional>
 #include <span>
+#include <string>
 #include <string_view>
 #include <vector>
 
@@ -57,6 +59,18 @@ private:
     TextBuffer& out_;
 };
 
+namespace detail {
+
+/// The entries of the maps that are being read, the inner ones on top of the outer ones.
+struct MapScratch {
+    std::vector<std::string_view> keys;
+    std::vector<Value> values;
+    std::vector<std::uint32_t> places;
+    std::deque<std::string> assembledKeys; ///< of keys that came in chunks
+};
+
+} // namespace detail
+
 /// Remembers the key sets of maps that were read, in the order in which their keys came, so that the maps of one
 /// kind of message share one key set and are read without sorting or comparing keys with each other. Bounded: a
 /// client that invents keys only pushes others out. Used by one thread at a time.
@@ -71,7 +85,9 @@ private:
     friend class CborReader;
     struct Shape;
     static constexpr std::size_t kSlots = 512;
+
     std::array<std::unique_ptr<Shape>, kSlots> slots_;
+    detail::MapScratch scratch_;
 };
 
 /// Reads CBOR (RFC 8949) that nobody vouches for: a cursor over bytes that it never leaves, that allocates nothing
@@ -87,6 +103,8 @@ public:
 
     explicit CborReader(std::span<const std::uint8_t> bytes, KeySetCache* keySets = nullptr) noexcept
         : position_(bytes.data()), end_(bytes.data() + bytes.size()), keySets_(keySets) {}
+    CborReader(const CborReader&) = delete;
+    CborReader& operator=(const CborReader&) = delete;
 
     [[nodiscard]] CborError error() const noexcept { return error_; }
     [[nodiscard]] bool atEnd() const noexcept { return position_ == end_; }
@@ -114,8 +132,8 @@ public:
     /// The next item as a value; nothing after an error. `spare` is room for keys that are yet to be added to it.
     [[nodiscard]] std::optional<Value> readValue();
     [[nodiscard]] std::optional<Dictionary> readDictionary(std::size_t spare = 0);
-    /// Steps over one well-formed item, whatever it is, acceptable as a value or not.
-    bool skip() noexcept;
+    /// Steps over one well-formed item, whatever it is and however deep, acceptable as a value or not.
+    bool skip();
 
 private:
     struct Head {
@@ -123,23 +141,29 @@ private:
         std::uint8_t info;
         std::uint64_t argument;
     };
-    struct MapScratch;
 
     bool fail(CborError error) noexcept;
     bool readHead(Head& head) noexcept;
     bool readItem(Value& value, int depth);
-    bool readFloat(const Head& head, Value& value) noexcept;
+    bool readFloatingPoint(const Head& head, Value& value) noexcept;
+    bool readSimple(const Head& head, Value& value) noexcept;
     bool readString(const Head& head, Value& value);
-    bool readChunks(const Head& head, Value& value);
-    bool readTag(const Head& head, Value& value, int depth);
+    bool readKey(std::string_view& key);
+    bool takeBytes(const Head& head, std::string_view& bytes) noexcept;
+    bool assembleChunks(std::uint8_t major, std::string& bytes);
+    bool readDate(const Head& head, Value& value, int depth);
     bool readArray(const Head& head, Value& value, int depth);
     bool readMap(const Head& head, Dictionary& dictionary, int depth, std::size_t spare);
-    bool readSimple(const Head& head, Value& value) noexcept;
-    bool skipItem(int depth) noexcept;
+    bool readEntries(const Head& head, int depth);
+    bool buildDictionary(Dictionary& dictionary, std::size_t firstEntry, std::size_t spare);
+    bool skipChunks(std::uint8_t major) noexcept;
+    bool atBreak() noexcept;
+    detail::MapScratch& scratch() noexcept;
 
     const std::uint8_t* position_;
     const std::uint8_t* end_;
     KeySetCache* keySets_;
+    detail::MapScratch ownScratch_; ///< without a cache
     CborError error_ = CborError::none;
 };
 

@@ -3,7 +3,7 @@
 #include "base/KeySet.h"
 #include "base/Value.h"
 
-#include <atomic>
+#include <cstdint>
 #include <initializer_list>
 #include <span>
 #include <string>
@@ -50,9 +50,10 @@ public:
     void merge(const Dictionary& other);
     void reserve(std::size_t capacity);
 
-    /// Builds a dictionary whose values already stand in the order of the sorted keys. `spare` is room for keys to
-    /// come. The values are moved from.
-    static Dictionary adopt(KeySetRef keys, std::span<Value> values, std::size_t spare = 0);
+    /// Builds a dictionary from one value for each key; `places[i]` is the index of the key that `values[i]` belongs
+    /// to, each index once. `spare` is room for keys to come. The values are moved from.
+    static Dictionary adopt(KeySetRef keys, std::span<Value> values, std::span<const std::uint32_t> places,
+                            std::size_t spare = 0);
 
     [[nodiscard]] bool operator==(const Dictionary& other) const noexcept;
     /// Equal but for the entries of the ignored keys, wherever they stand.

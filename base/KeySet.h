@@ -49,6 +49,9 @@ public:
     /// The key as it stands in JSON, quotes and colon included: `"key":`.
     [[nodiscard]] std::string_view jsonKey(std::size_t index) const noexcept;
     [[nodiscard]] std::size_t find(std::string_view key) const noexcept;
+    /// The first index from `start` on whose key is not below the other set's key; the count when there is none.
+    [[nodiscard]] std::size_t findFrom(std::size_t start, const KeySet& other, std::size_t otherIndex) const noexcept;
+    [[nodiscard]] bool sameKey(std::size_t index, const KeySet& other, std::size_t otherIndex) const noexcept;
     /// Whether a key holds U+0020.
     [[nodiscard]] bool anyKeyHasSpace() const noexcept { return anyKeyHasSpace_; }
     [[nodiscard]] bool operator==(const KeySet& other) const noexcept;

@@ -1,0 +1,281 @@
+#include "base/Dictionary.h"
+
+#include <algorithm>
+#include <atomic>
+#include <cstring>
+#include <memory>
+#include <new>
+
+namespace tamblo {
+
+/// The values, in the order of the keys; they follow the block. Room beyond the keys' count is uninitialised.
+struct Dictionary::Block {
+    std::atomic<std::uint32_t> references{1};
+    std::uint32_t capacity;
+    KeySetRef keys;
+
+    Block(std::size_t room, KeySetRef keySet)
+        : capacity(static_cast<std::uint32_t>(room)), keys(std::move(keySet)) {}
+
+    [[nodiscard]] std::size_t count() const noexcept { return keys->size(); }
+    [[nodiscard]] Value* values() noexcept { return reinterpret_cast<Value*>(this + 1); }
+
+    static Block* make(std::size_t capacity, KeySetRef keys) {
+        void* memory = ::operator new(sizeof(Block) + capacity * sizeof(Value));
+        return new (memory) Block(capacity, std::move(keys));
+    }
+    /// Frees the block alone; its values are gone already.
+    static void free(Block* block) noexcept {
+        block->~Block();
+        ::operator delete(block);
+    }
+};
+
+namespace {
+
+/// A value is sixteen bytes that may be moved as bytes, the place left behind being uninitialised.
+void relocate(Value* to, const Value* from, std::size_t count) noexcept {
+    std::memmove(static_cast<void*>(to), static_cast<const void*>(from), count * sizeof(Value));
+}
+
+} // namespace
+
+Dictionary::Dictionary(std::initializer_list<Entry> entries) {
+    for (const Entry& entry : entries) {
+        set(entry.first, entry.second);
+    }
+}
+
+Dictionary::Dictionary(const Dictionary& other) noexcept : block_(other.block_) {
+    retain(block_);
+}
+
+Dictionary& Dictionary::operator=(const Dictionary& other) noexcept {
+    retain(other.block_);
+    release(block_);
+    block_ = other.block_;
+    return *this;
+}
+
+Dictionary& Dictionary::operator=(Dictionary&& other) noexcept {
+    std::swap(block_, other.block_);
+    return *this;
+}
+
+Dictionary::~Dictionary() {
+    release(block_);
+}
+
+void Dictionary::retain(Block* block) noexcept {
+    if (block != nullptr) {
+        block->references.fetch_add(1, std::memory_order_relaxed);
+    }
+}
+
+void Dictionary::release(Block* block) noexcept {
+    if (block == nullptr || block->references.fetch_sub(1, std::memory_order_acq_rel) != 1) {
+        return;
+    }
+    std::destroy_n(block->values(), block->count());
+    Block::free(block);
+}
+
+std::size_t Dictionary::size() const noexcept {
+    return block_ == nullptr ? 0 : block_->count();
+}
+
+const KeySet& Dictionary::keys() const noexcept {
+    return block_ == nullptr ? *KeySet::empty() : *block_->keys;
+}
+
+std::span<const Value> Dictionary::values() const noexcept {
+    if (block_ == nullptr) {
+        return {};
+    }
+    return {block_->values(), block_->count()};
+}
+
+const Value* Dictionary::find(std::string_view key) const noexcept {
+    if (block_ == nullptr) {
+        return nullptr;
+    }
+    const std::size_t index = block_->keys->find(key);
+    return index == KeySet::kNotFound ? nullptr : block_->values() + index;
+}
+
+void Dictionary::detach(std::size_t capacity) {
+    if (block_ == nullptr) {
+        block_ = Block::make(std::max<std::size_t>(capacity, 4), KeySet::empty());
+        return;
+    }
+    const bool isShared = block_->references.load(std::memory_order_acquire) != 1;
+    if (!isShared && block_->capacity >= capacity) {
+        return;
+    }
+    const std::size_t room = capacity > block_->capacity ? capacity + capacity / 4 : capacity;
+    Block* mine = Block::make(std::max(room, block_->count()), block_->keys);
+    if (isShared) {
+        std::uninitialized_copy_n(block_->values(), block_->count(), mine->values());
+        release(block_);
+    } else {
+        relocate(mine->values(), block_->values(), block_->count());
+        Block::free(block_);
+    }
+    block_ = mine;
+}
+
+void Dictionary::reserve(std::size_t capacity) {
+    detach(std::max(capacity, size()));
+}
+
+void Dictionary::setValueAt(std::size_t index, Value value) {
+    detach(block_->count());
+    block_->values()[index] = std::move(value);
+}
+
+void Dictionary::set(std::string_view key, Value value) {
+    const std::size_t found = block_ == nullptr ? KeySet::kNotFound : block_->keys->find(key);
+    if (found != KeySet::kNotFound) {
+        setValueAt(found, std::move(value));
+        return;
+    }
+    const std::size_t count = size();
+    detach(count + 1);
+    KeySet::Extension extension = block_->keys->adding(key);
+    Value* values = block_->values();
+    relocate(values + extension.index + 1, values + extension.index, count - extension.index);
+    new (values + extension.index) Value(std::move(value));
+    block_->keys = std::move(extension.keys);
+}
+
+bool Dictionary::remove(std::string_view key) {
+    const std::size_t index = block_ == nullptr ? KeySet::kNotFound : block_->keys->find(key);
+    if (index == KeySet::kNotFound) {
+        return false;
+    }
+    detach(block_->count());
+    const std::size_t count = block_->count();
+    Value* values = block_->values();
+    values[index].~Value();
+    relocate(values + index, values + index + 1, count - index - 1);
+    block_->keys = block_->keys->removing(index);
+    return true;
+}
+
+void Dictionary::merge(const Dictionary& other) {
+    if (other.empty() || block_ == other.block_) {
+        return;
+    }
+    if (empty()) {
+        *this = other;
+        return;
+    }
+    const KeySet& theirs = *other.block_->keys;
+    const Value* incoming = other.block_->values();
+    detach(block_->count());
+    if (block_->keys.get() == &theirs) {
+        std::copy_n(incoming, theirs.size(), block_->values());
+        return;
+    }
+    // Both are sorted: each key is looked for from where the one before was found.
+    bool anyMissing = false;
+    std::size_t mine = 0;
+    for (std::size_t i = 0; i < theirs.size(); ++i) {
+        mine = block_->keys->findFrom(mine, theirs, i);
+        if (mine < block_->count() && block_->keys->sameKey(mine, theirs, i)) {
+            block_->values()[mine] = incoming[i];
+        } else {
+            anyMissing = true;
+        }
+    }
+    if (!anyMissing) {
+        return;
+    }
+    for (std::size_t i = 0; i < theirs.size(); ++i) {
+        if (block_->keys->find(theirs.key(i)) == KeySet::kNotFound) {
+            set(theirs.key(i), incoming[i]);
+        }
+    }
+}
+
+Dictionary Dictionary::adopt(KeySetRef keys, std::span<Value> values, std::span<const std::uint32_t> places,
+                             std::size_t spare) {
+    Dictionary dictionary;
+    dictionary.block_ = Block::make(values.size() + spare, std::move(keys));
+    Value* to = dictionary.block_->values();
+    for (std::size_t i = 0; i < values.size(); ++i) {
+        new (to + places[i]) Value(std::move(values[i]));
+    }
+    return dictionary;
+}
+
+bool Dictionary::operator==(const Dictionary& other) const noexcept {
+    if (block_ == other.block_) {
+        return true;
+    }
+    const std::span<const Value> mine = values();
+    const std::span<const Value> theirs = other.values();
+    return keys() == other.keys() && std::equal(mine.begin(), mine.end(), theirs.begin(), theirs.end());
+}
+
+bool Dictionary::equalsIgnoring(const Dictionary& other,
+                                std::span<const std::string_view> ignoredKeys) const noexcept {
+    if (block_ == other.block_) {
+        return true;
+    }
+    const auto isIgnored = [ignoredKeys](std::string_view key) {
+        return std::find(ignoredKeys.begin(), ignoredKeys.end(), key) != ignoredKeys.end();
+    };
+    const KeySet& mine = keys();
+    const KeySet& theirs = other.keys();
+    if (&mine == &theirs) {
+        for (std::size_t i = 0; i < mine.size(); ++i) {
+            if (!(valueAt(i) == other.valueAt(i)) && !isIgnored(mine.key(i))) {
+                return false;
+            }
+        }
+        return true;
+    }
+    std::size_t i = 0;
+    std::size_t j = 0;
+    for (;;) {
+        while (i < mine.size() && isIgnored(mine.key(i))) {
+            ++i;
+        }
+        while (j < theirs.size() && isIgnored(theirs.key(j))) {
+            ++j;
+        }
+        if (i == mine.size() || j == theirs.size()) {
+            return i == mine.size() && j == theirs.size();
+        }
+        if (mine.key(i) != theirs.key(j) || !(valueAt(i) == other.valueAt(j))) {
+            return false;
+        }
+        ++i;
+        ++j;
+    }
+}
+
+Dictionary Dictionary::deepCopy() const {
+    Dictionary copy(*this);
+    if (block_ != nullptr) {
+        copy.detach(size());
+        for (Value& value : std::span(copy.block_->values(), copy.size())) {
+            value = value.deepCopy();
+        }
+    }
+    return copy;
+}
+
+std::size_t Dictionary::heapBytes() const noexcept {
+    if (block_ == nullptr) {
+        return 0;
+    }
+    std::size_t total = sizeof(Block) + block_->capacity * sizeof(Value);
+    for (const Value& value : values()) {
+        total += value.heapBytes();
+    }
+    return total;
+}
+
+} // namespace tamblo

@@ -1,0 +1,411 @@
+#include "base/Value.h"
+
+#include "base/Dictionary.h"
+
+#include <algorithm>
+#include <atomic>
+#include <charconv>
+#include <cmath>
+#include <limits>
+#include <new>
+#include <utility>
+
+namespace tamblo {
+
+/// A text or byte string too long for the value itself; the bytes follow the block.
+struct Value::TextBlock {
+    std::atomic<std::uint32_t> references{1};
+    std::uint32_t length;
+
+    explicit TextBlock(std::uint32_t bytes) : length(bytes) {}
+    char* text() noexcept { return reinterpret_cast<char*>(this + 1); }
+    [[nodiscard]] std::string_view view() const noexcept {
+        return {reinterpret_cast<const char*>(this + 1), length};
+    }
+};
+
+struct Value::ArrayBlock {
+    std::atomic<std::uint32_t> references{1};
+    Array elements;
+
+    explicit ArrayBlock(Array values) : elements(std::move(values)) {}
+};
+
+namespace {
+
+constexpr double kTwoTo63 = 9223372036854775808.0;
+constexpr double kTwoTo64 = 18446744073709551616.0;
+
+/// The number at the beginning of a text, after white space, as far as it reads; 0 when there is none.
+double leadingNumber(std::string_view text) noexcept {
+    const std::size_t start = text.find_first_not_of(" \t\n\v\f\r");
+    if (start == std::string_view::npos) {
+        return 0.0;
+    }
+    text.remove_prefix(start);
+    const bool negative = text.front() == '-';
+    if (negative || text.front() == '+') {
+        text.remove_prefix(1);
+    }
+    // Words such as "inf" or "nan" are no numbers here, though the library would read them.
+    if (text.empty() || !((text.front() >= '0' && text.front() <= '9') || text.front() == '.')) {
+        return 0.0;
+    }
+    double number = 0.0;
+    const auto result = std::from_chars(text.data(), text.data() + text.size(), number);
+    if (result.ec == std::errc::result_out_of_range) {
+        const std::string_view read(text.data(), static_cast<std::size_t>(result.ptr - text.data()));
+        const bool isTiny = read.find("e-") != std::string_view::npos || read.find("E-") != std::string_view::npos;
+        number = isTiny ? 0.0 : std::numeric_limits<double>::infinity();
+    }
+    return negative ? -number : number;
+}
+
+template <typename Integer> Integer clamped(double number, double limit) noexcept {
+    if (std::isnan(number)) {
+        return 0;
+    }
+    if (number >= limit) {
+        return std::numeric_limits<Integer>::max();
+    }
+    if (number <= static_cast<double>(std::numeric_limits<Integer>::min())) {
+        return std::numeric_limits<Integer>::min();
+    }
+    return static_cast<Integer>(number);
+}
+
+std::int64_t signedFrom(double number) noexcept {
+    return clamped<std::int64_t>(number, kTwoTo63);
+}
+
+std::uint64_t unsignedFrom(double number) noexcept {
+    return clamped<std::uint64_t>(number, kTwoTo64);
+}
+
+/// An integer at the beginning of a text, exact where a double would round.
+template <typename Integer> Integer leadingInteger(std::string_view text, double asDouble) noexcept {
+    const std::size_t start = text.find_first_not_of(" \t\n\v\f\r");
+    if (start != std::string_view::npos) {
+        text.remove_prefix(start);
+        if (text.starts_with('+')) {
+            text.remove_prefix(1);
+        }
+        Integer number = 0;
+        const auto result = std::from_chars(text.data(), text.data() + text.size(), number);
+        const bool isWhole = result.ptr == text.data() + text.size() || (*result.ptr | 0x20) != 'e';
+        if (result.ec == std::errc{} && isWhole) {
+            return number;
+        }
+    }
+    if constexpr (std::is_signed_v<Integer>) {
+        return signedFrom(asDouble);
+    } else {
+        return unsignedFrom(asDouble);
+    }
+}
+
+bool equalsInteger(double number, std::int64_t integer) noexcept {
+    return number >= -kTwoTo63 && number < kTwoTo63 && static_cast<std::int64_t>(number) == integer &&
+           static_cast<double>(static_cast<std::int64_t>(number)) == number;
+}
+
+bool equalsUnsigned(double number, std::uint64_t integer) noexcept {
+    return number >= 0.0 && number < kTwoTo64 && static_cast<std::uint64_t>(number) == integer &&
+           static_cast<double>(static_cast<std::uint64_t>(number)) == number;
+}
+
+bool beginsWithYes(std::string_view text) noexcept {
+    for (const std::string_view yes : {"YES", "yes", "Yes", "TRUE", "true", "True"}) {
+        if (text.starts_with(yes)) {
+            return true;
+        }
+    }
+    return false;
+}
+
+} // namespace
+
+Value::Value(bool value) noexcept {
+    store<std::int64_t>(value ? 1 : 0, Kind::boolean);
+}
+Value::Value(int value) noexcept : Value(static_cast<long long>(value)) {}
+Value::Value(unsigned value) noexcept : Value(static_cast<long long>(value)) {}
+Value::Value(long value) noexcept : Value(static_cast<long long>(value)) {}
+Value::Value(long long value) noexcept {
+    store<std::int64_t>(value, Kind::integer);
+}
+Value::Value(unsigned long value) noexcept : Value(static_cast<unsigned long long>(value)) {}
+Value::Value(unsigned long long value) noexcept {
+    const bool fitsSigned = value <= static_cast<unsigned long long>(std::numeric_limits<std::int64_t>::max());
+    store<std::uint64_t>(value, fitsSigned ? Kind::integer : Kind::unsignedInteger);
+}
+Value::Value(float value) noexcept {
+    store(value, Kind::singleFloat);
+}
+Value::Value(double value) noexcept {
+    store(value, Kind::doubleFloat);
+}
+Value::Value(const char* text) : Value(std::string_view(text)) {}
+Value::Value(std::string_view text) {
+    storeText(text, Kind::string);
+}
+Value::Value(const std::string& text) : Value(std::string_view(text)) {}
+
+Value::Value(Array elements) {
+    store(new ArrayBlock(std::move(elements)), Kind::array);
+}
+
+Value::Value(Dictionary dictionary) noexcept {
+    store(std::exchange(dictionary.block_, nullptr), Kind::dictionary);
+}
+
+Value Value::date(double secondsSince1970) noexcept {
+    Value value;
+    value.store(secondsSince1970, Kind::date);
+    return value;
+}
+
+Value Value::data(std::span<const std::uint8_t> bytes) {
+    Value value;
+    value.storeText({reinterpret_cast<const char*>(bytes.data()), bytes.size()}, Kind::data);
+    return value;
+}
+
+void Value::storeText(std::string_view text, Kind kind) {
+    std::memset(bytes_, 0, sizeof bytes_);
+    bytes_[kKindAt] = static_cast<std::uint8_t>(kind);
+    if (text.size() <= kInlineCapacity) {
+        if (!text.empty()) {
+            std::memcpy(bytes_, text.data(), text.size());
+        }
+        bytes_[kLengthAt] = static_cast<std::uint8_t>(text.size());
+        return;
+    }
+    void* memory = ::operator new(sizeof(TextBlock) + text.size());
+    auto* block = new (memory) TextBlock(static_cast<std::uint32_t>(text.size()));
+    std::memcpy(block->text(), text.data(), text.size());
+    std::memcpy(bytes_, &block, sizeof block);
+    bytes_[kLengthAt] = kInBlock;
+}
+
+std::string_view Value::textBytes() const noexcept {
+    if (bytes_[kLengthAt] == kInBlock) {
+        return load<const TextBlock*>()->view();
+    }
+    return {reinterpret_cast<const char*>(bytes_), bytes_[kLengthAt]};
+}
+
+void Value::retain() const noexcept {
+    if (!ownsBlock()) {
+        return;
+    }
+    switch (kind()) {
+    case Kind::array:
+        load<ArrayBlock*>()->references.fetch_add(1, std::memory_order_relaxed);
+        break;
+    case Kind::dictionary:
+        Dictionary::retain(load<Dictionary::Block*>());
+        break;
+    default:
+        load<TextBlock*>()->references.fetch_add(1, std::memory_order_relaxed);
+        break;
+    }
+}
+
+void Value::releaseBlock() noexcept {
+    switch (kind()) {
+    case Kind::array: {
+        auto* block = load<ArrayBlock*>();
+        if (block->references.fetch_sub(1, std::memory_order_acq_rel) == 1) {
+            delete block;
+        }
+        break;
+    }
+    case Kind::dictionary:
+        Dictionary::release(load<Dictionary::Block*>());
+        break;
+    default: {
+        auto* block = load<TextBlock*>();
+        if (block->references.fetch_sub(1, std::memory_order_acq_rel) == 1) {
+            block->~TextBlock();
+            ::operator delete(block);
+        }
+        break;
+    }
+    }
+}
+
+double Value::doubleValue() const noexcept {
+    switch (kind()) {
+    case Kind::boolean:
+    case Kind::integer:
+        return static_cast<double>(rawInteger());
+    case Kind::unsignedInteger:
+        return static_cast<double>(rawUnsigned());
+    case Kind::singleFloat:
+        return static_cast<double>(rawSingle());
+    case Kind::doubleFloat:
+        return rawDouble();
+    case Kind::string:
+        return leadingNumber(textBytes());
+    default:
+        return 0.0;
+    }
+}
+
+std::int64_t Value::integerValue() const noexcept {
+    switch (kind()) {
+    case Kind::boolean:
+    case Kind::integer:
+        return rawInteger();
+    case Kind::unsignedInteger:
+        return std::numeric_limits<std::int64_t>::max();
+    case Kind::string:
+        return leadingInteger<std::int64_t>(textBytes(), doubleValue());
+    default:
+        return signedFrom(doubleValue());
+    }
+}
+
+std::uint64_t Value::unsignedValue() const noexcept {
+    switch (kind()) {
+    case Kind::boolean:
+    case Kind::integer:
+        return rawInteger() < 0 ? 0 : static_cast<std::uint64_t>(rawInteger());
+    case Kind::unsignedInteger:
+        return rawUnsigned();
+    case Kind::string:
+        return leadingInteger<std::uint64_t>(textBytes(), doubleValue());
+    default:
+        return unsignedFrom(doubleValue());
+    }
+}
+
+bool Value::boolValue() const noexcept {
+    if (kind() == Kind::string) {
+        return beginsWithYes(textBytes()) || leadingNumber(textBytes()) != 0.0;
+    }
+    const double number = doubleValue();
+    return number != 0.0 && !std::isnan(number);
+}
+
+std::string_view Value::stringValue() const noexcept {
+    return kind() == Kind::string ? textBytes() : std::string_view();
+}
+
+double Value::dateSeconds() const noexcept {
+    return kind() == Kind::date ? load<double>() : 0.0;
+}
+
+std::span<const std::uint8_t> Value::dataValue() const noexcept {
+    if (kind() != Kind::data) {
+        return {};
+    }
+    const std::string_view bytes = textBytes();
+    return {reinterpret_cast<const std::uint8_t*>(bytes.data()), bytes.size()};
+}
+
+std::span<const Value> Value::arrayValue() const noexcept {
+    if (kind() != Kind::array) {
+        return {};
+    }
+    return load<const ArrayBlock*>()->elements;
+}
+
+const Dictionary& Value::dictionaryValue() const noexcept {
+    static const Dictionary none;
+    if (kind() != Kind::dictionary) {
+        return none;
+    }
+    // A dictionary is one pointer to its block, and so are the first bytes of a value that holds one.
+    static_assert(sizeof(Dictionary) == sizeof(void*));
+    return *std::launder(reinterpret_cast<const Dictionary*>(bytes_));
+}
+
+bool Value::numberEquals(const Value& other) const noexcept {
+    const auto isDouble = [](Kind kind) { return kind == Kind::singleFloat || kind == Kind::doubleFloat; };
+    const auto isUnsigned = [](Kind kind) { return kind == Kind::unsignedInteger; };
+    if (isDouble(kind()) && isDouble(other.kind())) {
+        const double mine = doubleValue();
+        const double theirs = other.doubleValue();
+        return mine == theirs || (std::isnan(mine) && std::isnan(theirs));
+    }
+    if (isDouble(kind())) {
+        return isUnsigned(other.kind()) ? equalsUnsigned(doubleValue(), other.rawUnsigned())
+                                        : equalsInteger(doubleValue(), other.rawInteger());
+    }
+    if (isDouble(other.kind())) {
+        return other.numberEquals(*this);
+    }
+    // An unsigned integer lies above the signed range, so it equals only another one.
+    return isUnsigned(kind()) == isUnsigned(other.kind()) && rawUnsigned() == other.rawUnsigned();
+}
+
+bool Value::operator==(const Value& other) const noexcept {
+    if (std::memcmp(bytes_, other.bytes_, sizeof bytes_) == 0) {
+        return true;
+    }
+    if (isNumber() || other.isNumber()) {
+        return isNumber() && other.isNumber() && numberEquals(other);
+    }
+    if (kind() != other.kind()) {
+        return false;
+    }
+    switch (kind()) {
+    case Kind::date: {
+        const double mine = dateSeconds();
+        const double theirs = other.dateSeconds();
+        return mine == theirs || (std::isnan(mine) && std::isnan(theirs));
+    }
+    case Kind::array: {
+        const std::span<const Value> mine = arrayValue();
+        const std::span<const Value> theirs = other.arrayValue();
+        return std::equal(mine.begin(), mine.end(), theirs.begin(), theirs.end());
+    }
+    case Kind::dictionary:
+        return dictionaryValue() == other.dictionaryValue();
+    default:
+        return textBytes() == other.textBytes();
+    }
+}
+
+Value Value::deepCopy() const {
+    switch (kind()) {
+    case Kind::string:
+        return {textBytes()};
+    case Kind::data:
+        return data(dataValue());
+    case Kind::array: {
+        Array copies;
+        for (const Value& element : arrayValue()) {
+            copies.push_back(element.deepCopy());
+        }
+        return {std::move(copies)};
+    }
+    case Kind::dictionary:
+        return {dictionaryValue().deepCopy()};
+    default:
+        return *this;
+    }
+}
+
+std::size_t Value::heapBytes() const noexcept {
+    if (!ownsBlock()) {
+        return 0;
+    }
+    switch (kind()) {
+    case Kind::array: {
+        std::size_t total = sizeof(ArrayBlock);
+        for (const Value& element : arrayValue()) {
+            total += sizeof(Value) + element.heapBytes();
+        }
+        return total;
+    }
+    case Kind::dictionary:
+        return dictionaryValue().heapBytes();
+    default:
+        return sizeof(TextBlock) + textBytes().size();
+    }
+}
+
+} // namespace tamblo
