@@ -18,8 +18,9 @@ constexpr std::uint8_t kIndefinite = 31;
 constexpr std::uint8_t kBreak = 0xFF;
 constexpr std::uint64_t kDateTag = 1;
 
-/// A map of more keys is no ordinary message; remembering its keys would cost memory and help nobody.
-constexpr std::size_t kLargestRememberedMap = 64;
+// A map beyond these is no ordinary message; remembering its keys would cost memory and help nobody.
+constexpr std::size_t kMostRememberedKeys = 64;
+constexpr std::size_t kMostRememberedKeyBytes = 4096;
 
 std::uint64_t loadBigEndian(const std::uint8_t* from, unsigned count) noexcept {
     std::uint64_t value = 0;
@@ -500,8 +501,10 @@ bool CborReader::buildDictionary(Dictionary& dictionary, std::size_t firstEntry,
     }
 
     std::vector<std::uint32_t> order(arrived.size());
+    std::size_t keyBytes = 0;
     for (std::size_t i = 0; i < order.size(); ++i) {
         order[i] = static_cast<std::uint32_t>(i);
+        keyBytes += arrived[i].size();
         if (!isUtf8(arrived[i])) {
             return fail(CborError::notUtf8);
         }
@@ -519,7 +522,7 @@ bool CborReader::buildDictionary(Dictionary& dictionary, std::size_t firstEntry,
     }
     KeySetRef keys = KeySet::make(sorted);
     dictionary = Dictionary::adopt(keys, values, places, spare);
-    if (slot != nullptr && sorted.size() <= kLargestRememberedMap) {
+    if (slot != nullptr && sorted.size() <= kMostRememberedKeys && keyBytes <= kMostRememberedKeyBytes) {
         *slot = std::make_unique<KeySetCache::Shape>(hash, std::move(keys), std::move(places));
     }
     return true;

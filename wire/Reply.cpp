@@ -1,0 +1,125 @@
+#include "wire/Reply.h"
+
+#include "base/Cbor.h"
+#include "wire/FrameScope.h"
+
+namespace tamblo::wire {
+
+namespace {
+
+/// Everything of a successful reply but its result.
+void beginReply(CborWriter& writer, std::uint64_t id) {
+    writer.arrayHead(4);
+    writer.unsignedInteger(static_cast<std::uint64_t>(FrameKind::reply));
+    writer.unsignedInteger(id);
+    writer.null();
+}
+
+template <typename WriteResult> void appendReply(TextBuffer& out, std::uint64_t id, const WriteResult& writeResult) {
+    FrameScope frame(out);
+    CborWriter writer(out);
+    beginReply(writer, id);
+    writeResult(writer);
+    if (!frame.finish()) {
+        appendErrorReply(out, id, {std::string(kProtocolErrorDomain), kNotARequest, "the result is too long"});
+    }
+}
+
+std::optional<Error> errorFrom(const Dictionary& dictionary) {
+    const Value* domain = dictionary.find("domain");
+    const Value* code = dictionary.find("code");
+    if (domain == nullptr || code == nullptr || !domain->isString() || !code->isNumber()) {
+        return std::nullopt;
+    }
+    Error error{std::string(domain->stringValue()), code->integerValue(), {}};
+    if (const Value* message = dictionary.find("message")) {
+        error.message = message->stringValue();
+    }
+    return error;
+}
+
+} // namespace
+
+void appendNullReply(TextBuffer& out, std::uint64_t id) {
+    appendReply(out, id, [](CborWriter& writer) { writer.null(); });
+}
+
+void appendBooleanReply(TextBuffer& out, std::uint64_t id, bool result) {
+    appendReply(out, id, [result](CborWriter& writer) { writer.boolean(result); });
+}
+
+void appendUnsignedReply(TextBuffer& out, std::uint64_t id, std::uint64_t result) {
+    appendReply(out, id, [result](CborWriter& writer) { writer.unsignedInteger(result); });
+}
+
+void appendDictionaryReply(TextBuffer& out, std::uint64_t id, const Dictionary& result) {
+    appendReply(out, id, [&result](CborWriter& writer) { writer.dictionary(result); });
+}
+
+void appendIntegersReply(TextBuffer& out, std::uint64_t id, std::span<const std::int64_t> result) {
+    appendReply(out, id, [result](CborWriter& writer) {
+        writer.arrayHead(result.size());
+        for (const std::int64_t number : result) {
+            writer.integer(number);
+        }
+    });
+}
+
+void appendErrorReply(TextBuffer& out, std::uint64_t id, const Error& error) {
+    FrameScope frame(out);
+    CborWriter writer(out);
+    writer.arrayHead(4);
+    writer.unsignedInteger(static_cast<std::uint64_t>(FrameKind::reply));
+    writer.unsignedInteger(id);
+    writer.mapHead(error.message.empty() ? 2 : 3);
+    writer.text("domain");
+    writer.text(error.domain);
+    writer.text("code");
+    writer.integer(error.code);
+    if (!error.message.empty()) {
+        writer.text("message");
+        writer.text(error.message);
+    }
+    writer.null();
+    (void)frame.finish();
+}
+
+std::optional<Reply> decodeReply(std::span<const std::uint8_t> item) {
+    CborReader reader(item);
+    auto array = reader.readArrayHead();
+    if (!array || !reader.moreElements(*array) ||
+        reader.readUnsigned() != static_cast<std::uint64_t>(FrameKind::reply) || !reader.moreElements(*array)) {
+        return std::nullopt;
+    }
+    const auto id = reader.readUnsigned();
+    if (!id || !reader.moreElements(*array)) {
+        return std::nullopt;
+    }
+    Reply reply;
+    reply.id = *id;
+    if (!reader.readNull()) {
+        const auto dictionary = reader.readDictionary();
+        if (!dictionary) {
+            return std::nullopt;
+        }
+        reply.error = errorFrom(*dictionary);
+        if (!reply.error) {
+            return std::nullopt;
+        }
+    }
+    if (!reader.moreElements(*array)) {
+        return std::nullopt;
+    }
+    if (!reader.readNull()) {
+        reply.result = reader.readValue();
+        if (!reply.result) {
+            return std::nullopt;
+        }
+    }
+    if (reader.moreElements(*array) || reader.error() != CborError::none || !reader.atEnd()) {
+        return std::nullopt;
+    }
+    return reply;
+}
+
+} // namespace tamblo::wire
