@@ -11,22 +11,13 @@ namespace {
 /// The keys that the service adds to a payload: timestamp, its rejected predecessor, audio tag, application name.
 constexpr std::size_t kKeysYetToCome = 4;
 
-/// Why one parameter was not read: the parameter, and what it should have been.
-struct WrongParameter {
-    std::string_view name;
-    std::string_view wanted;
-};
-
 class ParameterReader {
 public:
     ParameterReader(CborReader& reader, CborReader::ArrayHead& array) noexcept : reader_(reader), array_(array) {}
 
     [[nodiscard]] bool next() noexcept {
-        if (wrong_ || !reader_.moreElements(array_)) {
-            isShort_ = isShort_ || !wrong_;
-            return false;
-        }
-        return true;
+        isShort_ = !reader_.moreElements(array_);
+        return !isShort_;
     }
 
     bool signedInteger(std::string_view name, std::int64_t& number) noexcept {
@@ -96,7 +87,7 @@ public:
 
     /// Whether all were read and none is left.
     [[nodiscard]] bool finish() noexcept {
-        if (wrong_ || isShort_) {
+        if (isWrong() || isShort_) {
             return false;
         }
         isLong_ = reader_.moreElements(array_);
@@ -105,8 +96,8 @@ public:
 
     [[nodiscard]] std::string message(Method method) const {
         std::string text(methodName(method));
-        if (wrong_) {
-            text.append(": ").append(wrong_->name).append(": wanted ").append(wrong_->wanted);
+        if (isWrong()) {
+            text.append(": ").append(wrong_).append(": wanted ").append(wanted_);
             if (reader_.error() != CborError::none) {
                 text.append(", found ").append(describe(reader_.error()));
             }
@@ -117,13 +108,16 @@ public:
 
 private:
     bool refuse(std::string_view name, std::string_view wanted) noexcept {
-        wrong_ = WrongParameter{name, wanted};
+        wrong_ = name;
+        wanted_ = wanted;
         return false;
     }
+    [[nodiscard]] bool isWrong() const noexcept { return !wrong_.empty(); }
 
     CborReader& reader_;
     CborReader::ArrayHead& array_;
-    std::optional<WrongParameter> wrong_;
+    std::string_view wrong_; ///< the parameter that was not read, and what it should have been
+    std::string_view wanted_;
     bool isShort_ = false;
     bool isLong_ = false;
 };
@@ -192,9 +186,14 @@ std::optional<Refusal> readHead(CborReader& reader, CborReader::ArrayHead& frame
             return refusal(request, kNotARequest, "the request's id is not an unsigned integer");
         }
     }
-    const auto name = reader.moreElements(frame) ? reader.readText() : std::nullopt;
-    if (!name) {
+    if (!reader.moreElements(frame) || reader.peek() != CborReader::Type::text) {
         return refusal(request, kNotARequest, "the request's method is not a text");
+    }
+    std::optional<std::string_view> name = reader.readText();
+    std::optional<Value> assembled;
+    if (!name) {
+        assembled = reader.readValue();
+        name = assembled ? assembled->stringValue() : std::string_view();
     }
     const auto method = methodNamed(*name);
     if (!method) {
