@@ -447,13 +447,15 @@ bool Reader::buildDictionary(std::vector<Member>& members, Item& item) {
     }
     std::vector<std::string_view> keys;
     std::vector<Value> values;
+    std::vector<std::uint32_t> places;
     for (Member& member : members) {
         if (member.item) {
+            places.push_back(static_cast<std::uint32_t>(keys.size()));
             keys.push_back(member.key);
             values.push_back(*std::move(member.item));
         }
     }
-    item.emplace(keys.empty() ? Dictionary() : Dictionary::adopt(KeySet::make(keys), values));
+    item.emplace(keys.empty() ? Dictionary() : Dictionary::adopt(KeySet::make(keys), values, places));
     return true;
 }
 
