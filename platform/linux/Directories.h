@@ -1,0 +1,46 @@
+#pragma once
+
+#include <functional>
+#include <string>
+#include <string_view>
+#include <variant>
+
+namespace tamblo {
+
+/// The directories that the service lives in: its three roots and what lies at fixed places below them.
+///
+/// The roots come from the variables that systemd sets for a unit, or, without them, from where such files are kept
+/// for the system or for one user. Found once, at the start; plain values from then on.
+struct Directories {
+    std::string runtime;
+    std::string configuration;
+    std::string logs;
+
+    [[nodiscard]] std::string socketFile() const { return runtime + "/com.vandra.tamblo.reporting"; }
+    [[nodiscard]] std::string notifications() const { return runtime + "/notifications"; }
+    [[nodiscard]] std::string driverChannels() const { return runtime + "/chanlog"; }
+    [[nodiscard]] std::string preferences() const { return configuration + "/preferences"; }
+    [[nodiscard]] std::string deviceProperties() const { return configuration + "/device-properties.json"; }
+    [[nodiscard]] std::string diagnosticLogs() const { return logs + "/DiagnosticLogs/Audio/Reporting"; }
+
+    /// What the places are worked out from.
+    struct Environment {
+        /// The value of a variable, empty when it is unset.
+        std::function<std::string(std::string_view name)> variable;
+        bool isRoot = false;
+        /// The user's home directory, empty when there is none.
+        std::string home;
+
+        static Environment ofThisProcess();
+    };
+
+    /// The three roots, without touching the file system, or a line that says what is missing and what to do.
+    [[nodiscard]] static std::variant<Directories, std::string> find(const Environment& environment);
+    /// Finds the roots and creates them where they are missing, mode 0700, parents included; the directories below
+    /// them that others put files into are created too where that is possible. A root that cannot be had is a
+    /// failure, told in a line that says what to do; one that exists but cannot be written is not.
+    [[nodiscard]] static std::variant<Directories, std::string>
+    prepare(const Environment& environment = Environment::ofThisProcess());
+};
+
+} // namespace tamblo

@@ -1,0 +1,36 @@
+#pragma once
+
+#include "platform/DeviceProperties.h"
+#include "platform/StructuredLog.h"
+#include "platform/linux/JsonFile.h"
+
+#include <mutex>
+#include <optional>
+#include <string>
+#include <string_view>
+
+#include <sys/stat.h>
+
+namespace tamblo {
+
+/// Device properties from a file that holds one JSON object.
+///
+/// The file is looked at whenever a property is asked for, which is rarely, and read again when it has changed.
+/// Any thread.
+class LinuxDeviceProperties final : public DeviceProperties {
+public:
+    /// The log must outlive the properties.
+    LinuxDeviceProperties(std::string path, StructuredLog& log);
+
+    [[nodiscard]] std::optional<bool> booleanProperty(std::string_view name) const override;
+
+private:
+    StructuredLog& log_;
+    mutable std::mutex mutex_; ///< guards what follows
+    mutable JsonFile file_;
+    mutable bool isCurrent_ = false;
+    mutable struct stat status_ {};
+    mutable std::optional<Dictionary> properties_;
+};
+
+} // namespace tamblo
