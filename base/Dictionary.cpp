@@ -5,6 +5,7 @@
 #include <cstring>
 #include <memory>
 #include <new>
+#include <vector>
 
 namespace tamblo {
 
@@ -33,6 +34,10 @@ struct Dictionary::Block {
 
 namespace {
 
+/// Up to this many keys are added one after the other, which is a look-up where it was done before; more of them at
+/// once, so that the time it takes does not grow with the square of their number.
+constexpr std::size_t kMaximumKeysAddedSingly = 8;
+
 /// A value is sixteen bytes that may be moved as bytes, the place left behind being uninitialised.
 void relocate(Value* to, const Value* from, std::size_t count) noexcept {
     std::memmove(static_cast<void*>(to), static_cast<const void*>(from), count * sizeof(Value));
@@ -51,9 +56,11 @@ Dictionary::Dictionary(const Dictionary& other) noexcept : block_(other.block_) 
 }
 
 Dictionary& Dictionary::operator=(const Dictionary& other) noexcept {
-    retain(other.block_);
+    // The other may lie in a value of this one and go with it.
+    Block* const incoming = other.block_;
+    retain(incoming);
     release(block_);
-    block_ = other.block_;
+    block_ = incoming;
     return *this;
 }
 
@@ -170,32 +177,63 @@ void Dictionary::merge(const Dictionary& other) {
         *this = other;
         return;
     }
-    const KeySet& theirs = *other.block_->keys;
-    const Value* incoming = other.block_->values();
+    // Held, as the other may lie in a value of this one that is replaced.
+    const Dictionary source(other);
+    const KeySet& theirs = source.keys();
+    const std::span<const Value> incoming = source.values();
     detach(block_->count());
     if (block_->keys.get() == &theirs) {
-        std::copy_n(incoming, theirs.size(), block_->values());
+        std::copy_n(incoming.data(), theirs.size(), block_->values());
         return;
     }
     // Both are sorted: each key is looked for from where the one before was found.
-    bool anyMissing = false;
+    std::size_t missing = 0;
     std::size_t mine = 0;
     for (std::size_t i = 0; i < theirs.size(); ++i) {
         mine = block_->keys->findFrom(mine, theirs, i);
         if (mine < block_->count() && block_->keys->sameKey(mine, theirs, i)) {
             block_->values()[mine] = incoming[i];
         } else {
-            anyMissing = true;
+            ++missing;
         }
     }
-    if (!anyMissing) {
+    if (missing > kMaximumKeysAddedSingly) {
+        addAll(source);
         return;
     }
-    for (std::size_t i = 0; i < theirs.size(); ++i) {
+    for (std::size_t i = 0; missing != 0 && i < theirs.size(); ++i) {
         if (block_->keys->find(theirs.key(i)) == KeySet::kNotFound) {
             set(theirs.key(i), incoming[i]);
+            --missing;
         }
     }
+}
+
+void Dictionary::addAll(const Dictionary& other) {
+    const KeySet& theirs = other.keys();
+    const std::size_t count = block_->count();
+    std::vector<std::string_view> merged;
+    std::vector<Value> mergedValues;
+    std::vector<std::uint32_t> places;
+    const auto add = [&](std::string_view key, const Value& value) {
+        places.push_back(static_cast<std::uint32_t>(merged.size()));
+        merged.push_back(key);
+        mergedValues.push_back(value);
+    };
+    std::size_t mine = 0;
+    for (std::size_t i = 0; i < theirs.size(); ++i) {
+        const std::size_t place = block_->keys->findFrom(mine, theirs, i);
+        for (; mine < place; ++mine) {
+            add(keyAt(mine), valueAt(mine));
+        }
+        if (mine == count || !block_->keys->sameKey(mine, theirs, i)) {
+            add(theirs.key(i), other.valueAt(i));
+        }
+    }
+    for (; mine < count; ++mine) {
+        add(keyAt(mine), valueAt(mine));
+    }
+    *this = adopt(KeySet::make(merged), mergedValues, places);
 }
 
 Dictionary Dictionary::adopt(KeySetRef keys, std::span<Value> values, std::span<const std::uint32_t> places,

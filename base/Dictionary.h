@@ -73,6 +73,8 @@ private:
     struct Block;
 
     void detach(std::size_t capacity);
+    /// Adds the entries whose keys are missing here; the others stay as they are.
+    void addAll(const Dictionary& other);
     static void retain(Block* block) noexcept;
     static void release(Block* block) noexcept;
 

@@ -87,13 +87,17 @@ template <typename Integer> Integer leadingInteger(std::string_view text, double
     const std::size_t start = text.find_first_not_of(" \t\n\v\f\r");
     if (start != std::string_view::npos) {
         text.remove_prefix(start);
-        if (text.starts_with('+')) {
+        if (text.starts_with('+') && !text.starts_with("+-")) {
             text.remove_prefix(1);
         }
         Integer number = 0;
         const auto result = std::from_chars(text.data(), text.data() + text.size(), number);
-        const bool isWhole = result.ptr == text.data() + text.size() || (*result.ptr | 0x20) != 'e';
-        if (result.ec == std::errc{} && isWhole) {
+        text.remove_prefix(static_cast<std::size_t>(result.ptr - text.data()));
+        if (text.starts_with('.')) {
+            text.remove_prefix(std::min(text.find_first_not_of("0123456789", 1), text.size()));
+        }
+        const bool hasExponent = text.starts_with('e') || text.starts_with('E');
+        if (result.ec == std::errc{} && !hasExponent) {
             return number;
         }
     }
@@ -115,7 +119,7 @@ bool equalsUnsigned(double number, std::uint64_t integer) noexcept {
 }
 
 bool beginsWithYes(std::string_view text) noexcept {
-    for (const std::string_view yes : {"YES", "yes", "Yes", "TRUE", "true", "True"}) {
+    for (const std::string_view yes : {"YES", "yes", "TRUE", "true"}) {
         if (text.starts_with(yes)) {
             return true;
         }

@@ -179,12 +179,8 @@ inline Value& Value::operator=(Value&& other) noexcept {
 }
 
 inline Value& Value::operator=(const Value& other) noexcept {
-    if (this != &other) {
-        other.retain();
-        release();
-        std::memcpy(bytes_, other.bytes_, sizeof bytes_);
-    }
-    return *this;
+    // By way of a copy: the other may lie in a block that only this one holds.
+    return *this = Value(other);
 }
 
 } // namespace tamblo
