@@ -523,7 +523,7 @@ bool CborReader::buildDictionary(Dictionary& dictionary, std::size_t firstEntry,
     KeySetRef keys = KeySet::make(sorted);
     dictionary = Dictionary::adopt(keys, values, places, spare);
     if (slot != nullptr && sorted.size() <= kMostRememberedKeys && keyBytes <= kMostRememberedKeyBytes) {
-        *slot = std::make_unique<KeySetCache::Shape>(hash, std::move(keys), std::move(places));
+        slot->reset(new KeySetCache::Shape{hash, std::move(keys), std::move(places)});
     }
     return true;
 }

@@ -90,6 +90,37 @@ template <typename Number> char* writeNumber(char* to, Number number) noexcept {
     return std::to_chars(to, to + kScalarRoom, number).ptr;
 }
 
+/// Writes a number of few decimals, as most measurements are, without the general algorithm; nothing for others.
+/// Among the decimals of as few digits as the type holds exactly, no two read as the same number: the one that reads
+/// back is therefore the shortest.
+template <typename Float> char* writeShortDecimal(char* to, Float number) noexcept {
+    constexpr bool isSingle = std::is_same_v<Float, float>;
+    constexpr std::uint32_t scale = isSingle ? 1'000 : 1'000'000;
+    constexpr Float limit = isSingle ? Float(1e3) : Float(1e9);
+    const Float magnitude = std::abs(number);
+    if (!(magnitude >= Float(1e-3) && magnitude < limit)) {
+        return nullptr;
+    }
+    const auto scaled = static_cast<std::uint64_t>(magnitude * Float(scale) + Float(0.5));
+    auto fraction = static_cast<std::uint32_t>(scaled % scale);
+    if (static_cast<Float>(scaled) / Float(scale) != magnitude || fraction == 0) {
+        return nullptr;
+    }
+    if (number < 0) {
+        *to++ = '-';
+    }
+    to = writeNumber(to, static_cast<std::uint32_t>(scaled / scale));
+    *to++ = '.';
+    std::size_t digits = isSingle ? 3 : 6;
+    for (; fraction % 10 == 0; fraction /= 10) {
+        --digits;
+    }
+    for (std::size_t i = digits; i > 0; fraction /= 10) {
+        to[--i] = static_cast<char>('0' + fraction % 10);
+    }
+    return to + digits;
+}
+
 template <typename Float> char* writeFloat(char* to, Float number) noexcept {
     // Below this every whole number is its own shortest text.
     constexpr Float integral = std::is_same_v<Float, float> ? Float(1U << 24U) : Float(1ULL << 53U);
@@ -100,6 +131,9 @@ template <typename Float> char* writeFloat(char* to, Float number) noexcept {
         }
     } else if (!std::isfinite(number)) {
         return writeText(to, "null");
+    }
+    if (char* const end = writeShortDecimal(to, number)) {
+        return end;
     }
     char* const end = writeNumber(to, number);
     const std::string_view text(to, static_cast<std::size_t>(end - to));
@@ -120,7 +154,7 @@ char* writeDate(char* to, double seconds) {
 char* writeScalar(char* to, const Value& value) {
     switch (value.kind()) {
     case Value::Kind::boolean:
-        return value.boolValue() ? writeText(to, "true") : writeText(to, "false");
+        return value.rawInteger() != 0 ? writeText(to, "true") : writeText(to, "false");
     case Value::Kind::integer:
         return writeNumber(to, value.rawInteger());
     case Value::Kind::unsignedInteger:
