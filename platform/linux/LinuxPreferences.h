@@ -47,6 +47,7 @@ private:
 
     StructuredLog& log_;
     std::atomic<std::uint64_t> generation_{1};
+    std::atomic<bool> isWatched_{false};
     /// Used by `readChanges` alone.
     DirectoryWatcher watcher_;
     int reportedError_ = 0;

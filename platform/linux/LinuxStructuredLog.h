@@ -9,6 +9,8 @@
 #include <cstdint>
 #include <string_view>
 
+#include <sys/types.h>
+
 namespace tamblo {
 
 /// The log on standard error, one line per record: `<P>CODE TEXT`, P the sd-daemon priority.
@@ -33,13 +35,14 @@ public:
 private:
     /// How to write without waiting.
     enum class Channel : std::uint8_t {
-        plain,       ///< a file, or a description of our own that does not block
-        socket,      ///< per call
-        askFirst,    ///< a pipe or terminal that is shared with others and may not be changed
+        plain,    ///< a file, or a description of our own that does not block
+        socket,   ///< per call
+        askFirst, ///< a pipe or terminal that is shared with others and may not be changed
     };
 
     void prepareChannel(int descriptor);
     [[nodiscard]] bool put(std::string_view bytes) noexcept;
+    [[nodiscard]] ssize_t putSome(std::string_view bytes) noexcept;
     [[nodiscard]] bool reportDropped() noexcept;
 
     LogFilter filter_;

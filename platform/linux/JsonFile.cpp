@@ -1,0 +1,98 @@
+#include "platform/linux/JsonFile.h"
+
+#include "base/Format.h"
+#include "base/Json.h"
+#include "platform/linux/FileDescriptor.h"
+
+#include <cerrno>
+#include <system_error>
+#include <utility>
+#include <variant>
+
+#include <fcntl.h>
+#include <sys/stat.h>
+
+namespace tamblo {
+
+namespace {
+
+/// Reads a file up to a size. Returns 0 or an `errno`.
+int readUpTo(int descriptor, std::size_t maximum, std::string& content) {
+    content.resize(maximum);
+    std::size_t filled = 0;
+    while (filled < content.size()) {
+        const ssize_t count = ::read(descriptor, content.data() + filled, content.size() - filled);
+        if (count < 0 && errno == EINTR) {
+            continue;
+        }
+        if (count < 0) {
+            return errno;
+        }
+        if (count == 0) {
+            break;
+        }
+        filled += static_cast<std::size_t>(count);
+    }
+    content.resize(filled);
+    return 0;
+}
+
+std::string stateOf(const struct stat& status) {
+    return formatted("{} {} {} {} {}", status.st_dev, status.st_ino, status.st_size, status.st_mtim.tv_sec,
+                     status.st_mtim.tv_nsec);
+}
+
+std::string systemError(int number) {
+    return std::generic_category().message(number);
+}
+
+} // namespace
+
+std::optional<Dictionary> JsonFile::read(StructuredLog& log) {
+    // Not blocking, or a pipe of that name would hold up the service until somebody writes into it.
+    const FileDescriptor file(::open(path_.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY));
+    if (!file.isOpen()) {
+        if (errno == ENOENT || errno == ENOTDIR) {
+            reported_.clear();
+        } else {
+            report(log, {}, systemError(errno));
+        }
+        return std::nullopt;
+    }
+    struct stat status {};
+    if (::fstat(file.get(), &status) != 0 || !S_ISREG(status.st_mode)) {
+        report(log, {}, "not a regular file");
+        return std::nullopt;
+    }
+    std::string content;
+    const std::size_t size = static_cast<std::size_t>(status.st_size);
+    const int failure = size > kMaximumSize ? EFBIG : readUpTo(file.get(), size, content);
+    if (failure != 0) {
+        report(log, stateOf(status), systemError(failure));
+        return std::nullopt;
+    }
+    const std::variant<Value, JsonError> read = readJson(content);
+    if (const JsonError* error = std::get_if<JsonError>(&read)) {
+        report(log, stateOf(status),
+               formatted("line {}, column {}: {}", error->line, error->column, error->message));
+        return std::nullopt;
+    }
+    const Value& value = std::get<Value>(read);
+    if (!value.isDictionary()) {
+        report(log, stateOf(status), "line 1, column 1: not an object");
+        return std::nullopt;
+    }
+    reported_.clear();
+    return value.dictionaryValue();
+}
+
+void JsonFile::report(StructuredLog& log, std::string state, std::string_view fault) {
+    appendFormatted(state, " {}", fault);
+    if (state == reported_) {
+        return;
+    }
+    reported_ = std::move(state);
+    log.write(LogLevel::error, "zrrs", formatted("{}: {}; nothing of it is used", path_, fault));
+}
+
+} // namespace tamblo
