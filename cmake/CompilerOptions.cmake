@@ -1,0 +1,42 @@
+# Language level, warnings, sanitizers and output places: the same for every target.
+
+set(CMAKE_CXX_STANDARD 20)
+set(CMAKE_CXX_STANDARD_REQUIRED ON)
+set(CMAKE_CXX_EXTENSIONS OFF)
+set(CMAKE_EXPORT_COMPILE_COMMANDS ON)
+set(CMAKE_POSITION_INDEPENDENT_CODE ON) # the folders' objects also make up the shared client library
+set(CMAKE_RUNTIME_OUTPUT_DIRECTORY "${CMAKE_BINARY_DIR}/bin")
+set(CMAKE_LIBRARY_OUTPUT_DIRECTORY "${CMAKE_BINARY_DIR}/lib")
+set(CMAKE_ARCHIVE_OUTPUT_DIRECTORY "${CMAKE_BINARY_DIR}/lib")
+
+if(NOT CMAKE_BUILD_TYPE)
+    set(CMAKE_BUILD_TYPE RelWithDebInfo CACHE STRING "Debug, Release or RelWithDebInfo" FORCE)
+endif()
+set(CMAKE_CXX_FLAGS_RELWITHDEBINFO "-O2 -g") # assertions stay on, as nothing hot asserts
+
+add_compile_options(-Wall -Wextra -Wpedantic -Wconversion -Wshadow -Werror)
+if(CMAKE_CXX_COMPILER_ID MATCHES "Clang")
+    # Part of clang's -Wconversion but not of g++'s: both compilers shall ask for the same.
+    add_compile_options(-Wno-sign-conversion)
+endif()
+
+# The client library's calls within itself need no detour through its symbol table, and the service's idle
+# memory is mostly code that was never reached: the linker drops it.
+add_compile_options(-fno-semantic-interposition -ffunction-sections -fdata-sections)
+add_link_options(-Wl,--gc-sections)
+# Log lines and assertions name files as the checkout does, wherever it was built.
+add_compile_options("-fmacro-prefix-map=${CMAKE_SOURCE_DIR}/=")
+
+if(TAMBLO_SANITIZE)
+    add_compile_options(-fsanitize=${TAMBLO_SANITIZE} -fno-sanitize-recover=all -fno-omit-frame-pointer)
+    add_link_options(-fsanitize=${TAMBLO_SANITIZE})
+endif()
+
+if(TAMBLO_FUZZ)
+    if(NOT CMAKE_CXX_COMPILER_ID MATCHES "Clang")
+        message(FATAL_ERROR "TAMBLO_FUZZ needs clang: configure with -DCMAKE_CXX_COMPILER=clang++-19")
+    endif()
+    set(tamblo_fuzz_sanitizers address,undefined)
+    add_compile_options(-fsanitize=fuzzer-no-link,${tamblo_fuzz_sanitizers} -fno-sanitize-recover=all)
+    add_link_options(-fsanitize=${tamblo_fuzz_sanitizers})
+endif()

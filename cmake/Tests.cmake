@@ -1,0 +1,48 @@
+# tamblo_unit_tests (every folder, against the in-memory platform of tests/fakes) and tamblo_service_tests
+# (the real tamblod and tambloctl). Left out, with a notice, on a machine without the test libraries.
+
+find_package(GTest QUIET)
+find_package(nlohmann_json QUIET)
+if(NOT GTest_FOUND OR NOT nlohmann_json_FOUND)
+    message(STATUS "GoogleTest or nlohmann-json not found: the tests are left out")
+    return()
+endif()
+
+enable_testing()
+include(GoogleTest)
+
+tamblo_folder(tests/fakes PUBLIC session util platform base)
+tamblo_link_headers(tests TRUE tamblo_tests_include)
+
+# tamblo_tests(NAME LABEL label SOURCES files... LIBRARIES folders...)
+function(tamblo_tests name)
+    cmake_parse_arguments(PARSE_ARGV 1 arg "" "LABEL" "SOURCES;LIBRARIES")
+    if(NOT arg_SOURCES)
+        return()
+    endif()
+    add_executable(${name} ${arg_SOURCES})
+    target_include_directories(${name} PRIVATE "${tamblo_tests_include}")
+    target_link_libraries(${name} PRIVATE GTest::gmock GTest::gtest_main nlohmann_json::nlohmann_json)
+    tamblo_link(${name} PRIVATE ${arg_LIBRARIES})
+    target_compile_definitions(${name} PRIVATE "EXAMPLES_DIR=\"${CMAKE_SOURCE_DIR}/examples\"")
+    gtest_discover_tests(${name} DISCOVERY_MODE PRE_TEST PROPERTIES LABELS ${arg_LABEL} TIMEOUT 120)
+endfunction()
+
+file(GLOB_RECURSE unit_sources CONFIGURE_DEPENDS RELATIVE "${CMAKE_SOURCE_DIR}" tests/*.cpp)
+file(GLOB_RECURSE service_sources CONFIGURE_DEPENDS RELATIVE "${CMAKE_SOURCE_DIR}" tests/service/*.cpp)
+list(FILTER unit_sources EXCLUDE REGEX "^tests/(service|fakes)/")
+
+tamblo_tests(tamblo_unit_tests LABEL unit SOURCES ${unit_sources}
+    LIBRARIES tests/fakes service workers system platform/linux client wire)
+tamblo_tests(tamblo_service_tests LABEL service SOURCES ${service_sources} LIBRARIES client wire base)
+
+if(TARGET tamblo_service_tests)
+    target_compile_definitions(tamblo_service_tests PRIVATE
+        "TAMBLOD_PATH=\"${CMAKE_RUNTIME_OUTPUT_DIRECTORY}/tamblod\""
+        "TAMBLOCTL_PATH=\"${CMAKE_RUNTIME_OUTPUT_DIRECTORY}/tambloctl\"")
+    foreach(program tamblod tambloctl)
+        if(TARGET ${program})
+            add_dependencies(tamblo_service_tests ${program})
+        endif()
+    endforeach()
+endif()
