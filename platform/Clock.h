@@ -11,9 +11,10 @@ using WallTime = std::chrono::time_point<std::chrono::system_clock, std::chrono:
     return std::chrono::duration<double>(time.time_since_epoch()).count();
 }
 
-/// The time of day, on any thread, without blocking. It may step backwards. Read once per message and passed down.
+/// The time of day, on any thread, without blocking. It may step backwards. Read once per message and passed
+/// down.
 class Clock {
-public:
+  public:
     virtual ~Clock() = default;
     [[nodiscard]] virtual WallTime now() const noexcept = 0;
 };

@@ -12,8 +12,8 @@
 
 namespace tamblo {
 
-/// The services that the system finds on the device, one of each. Installed once, before anything else runs, and
-/// alive until the process ends; a test installs its fakes the same way.
+/// The services that the system finds on the device, one of each. Installed once, before anything else runs,
+/// and alive until the process ends; a test installs its fakes the same way.
 struct Platform {
     Clock& clock;
     WorkQueues& workQueues;

@@ -17,30 +17,31 @@ enum class Pace {
     mayBlock, ///< may wait for a disk, a lock or another process, or takes milliseconds
 };
 
-/// Runs work one piece at a time, in the order posted, on whatever thread suits. Destroying a queue first finishes
-/// what was posted.
+/// Runs work one piece at a time, in the order posted, on whatever thread suits. Destroying a queue first
+/// finishes what was posted.
 class SerialQueue {
-public:
+  public:
     virtual ~SerialQueue() = default;
     /// From any thread, without blocking. The work runs later, never inside this call.
     virtual void post(Work work, Pace pace = Pace::quick) = 0;
-    /// Called after each run of pieces, on the thread that ran them, before others run. Set before the first post.
+    /// Called after each run of pieces, on the thread that ran them, before others run. Set before the first
+    /// post.
     virtual void setBatchEnd(Work batchEnd) = 0;
     [[nodiscard]] virtual std::string_view label() const noexcept = 0;
 };
 
-/// Ticks at an interval on a thread of its own from `start` on. Destroying or invalidating it ends that: after
-/// `invalidate`, which may be called from the tick itself, no further tick begins; the destructor also waits for a
-/// running tick, unless it is called from that tick.
+/// Ticks at an interval on a thread of its own from `start` on. Destroying or invalidating it ends that:
+/// after `invalidate`, which may be called from the tick itself, no further tick begins; the destructor also
+/// waits for a running tick, unless it is called from that tick.
 class RepeatingTimer {
-public:
+  public:
     virtual ~RepeatingTimer() = default;
     virtual void start() = 0;
     virtual void invalidate() = 0;
 };
 
 class WorkQueues {
-public:
+  public:
     virtual ~WorkQueues() = default;
     [[nodiscard]] virtual std::unique_ptr<SerialQueue> makeSerialQueue(std::string_view label) = 0;
     [[nodiscard]] virtual std::unique_ptr<RepeatingTimer>

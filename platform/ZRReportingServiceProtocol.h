@@ -15,8 +15,9 @@ struct ReplyError {
     std::int64_t code = 0;
 };
 
-/// Replies: the error, null when there is none, then the result. A reply may be called from any thread, more than
-/// once or never, and after its connection is gone; it may be empty, when the client asked for no answer.
+/// Replies: the error, null when there is none, then the result. A reply may be called from any thread, more
+/// than once or never, and after its connection is gone; it may be empty, when the client asked for no
+/// answer.
 using ErrorReply = UniqueFunction<void(const ReplyError*), 32>;
 using BooleanReply = UniqueFunction<void(const ReplyError*, bool), 32>;
 using ServiceTypeReply = UniqueFunction<void(const ReplyError*, std::uint16_t), 32>;
@@ -28,7 +29,7 @@ using ReporterID = std::int64_t;
 /// The eleven requests of a client, as the object that a connection exports answers them. Called on the
 /// connection's thread; no operation blocks.
 class ZRReportingServiceProtocol {
-public:
+  public:
     virtual ~ZRReportingServiceProtocol() = default;
 
     virtual void createReportingSession(ReporterID reporterID, BooleanReply reply) = 0;

@@ -11,18 +11,18 @@ namespace tamblo::wire {
 
 /// Takes the frames off the front of a run of received bytes.
 class FrameSplitter {
-public:
+  public:
     explicit FrameSplitter(std::span<const std::uint8_t> received) noexcept : rest_(received) {}
 
-    /// The CBOR item of the next frame, or nothing: `rest` then is the beginning of a frame that has not arrived in
-    /// full, or of one that is longer than allowed.
+    /// The CBOR item of the next frame, or nothing: `rest` then is the beginning of a frame that has not
+    /// arrived in full, or of one that is longer than allowed.
     [[nodiscard]] std::optional<std::span<const std::uint8_t>> next() noexcept;
     [[nodiscard]] std::span<const std::uint8_t> rest() const noexcept { return rest_; }
     [[nodiscard]] bool tooLong() const noexcept { return tooLong_; }
     /// Bytes of the whole frame that `rest` begins, length included, as far as known.
     [[nodiscard]] std::size_t wanted() const noexcept;
 
-private:
+  private:
     std::span<const std::uint8_t> rest_;
     bool tooLong_ = false;
 };

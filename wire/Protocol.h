@@ -18,8 +18,8 @@ namespace tamblo::wire {
 inline constexpr std::string_view kServiceName = "com.vandra.tamblo.reporting";
 
 inline constexpr std::size_t kLengthBytes = 4;
-/// The longest frame. A message is some hundred bytes; this leaves room for a thousandfold of that and keeps what
-/// one client can make the service hold small.
+/// The longest frame. A message is some hundred bytes; this leaves room for a thousandfold of that and keeps
+/// what one client can make the service hold small.
 inline constexpr std::size_t kMaximumFrameBytes = 1024 * 1024;
 
 enum class FrameKind : std::uint8_t { request = 0, reply = 1, requestWithoutReply = 2 };

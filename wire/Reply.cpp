@@ -15,13 +15,15 @@ void beginReply(CborWriter& writer, std::uint64_t id) {
     writer.null();
 }
 
-template <typename WriteResult> void appendReply(TextBuffer& out, std::uint64_t id, const WriteResult& writeResult) {
+template <typename WriteResult>
+void appendReply(TextBuffer& out, std::uint64_t id, const WriteResult& writeResult) {
     FrameScope frame(out);
     CborWriter writer(out);
     beginReply(writer, id);
     writeResult(writer);
     if (!frame.finish()) {
-        appendErrorReply(out, id, {std::string(kProtocolErrorDomain), kNotARequest, "the result is too long"});
+        appendErrorReply(out, id,
+                         {std::string(kProtocolErrorDomain), kNotARequest, "the result is too long"});
     }
 }
 
@@ -88,7 +90,8 @@ std::optional<Reply> decodeReply(std::span<const std::uint8_t> item) {
     CborReader reader(item);
     auto array = reader.readArrayHead();
     if (!array || !reader.moreElements(*array) ||
-        reader.readUnsigned() != static_cast<std::uint64_t>(FrameKind::reply) || !reader.moreElements(*array)) {
+        reader.readUnsigned() != static_cast<std::uint64_t>(FrameKind::reply) ||
+        !reader.moreElements(*array)) {
         return std::nullopt;
     }
     const auto id = reader.readUnsigned();

@@ -8,12 +8,14 @@ namespace tamblo::wire {
 
 namespace {
 
-/// The keys that the service adds to a payload: timestamp, its rejected predecessor, audio tag, application name.
+/// The keys that the service adds to a payload: timestamp, its rejected predecessor, audio tag, application
+/// name.
 constexpr std::size_t kKeysYetToCome = 4;
 
 class ParameterReader {
-public:
-    ParameterReader(CborReader& reader, CborReader::ArrayHead& array) noexcept : reader_(reader), array_(array) {}
+  public:
+    ParameterReader(CborReader& reader, CborReader::ArrayHead& array) noexcept
+        : reader_(reader), array_(array) {}
 
     [[nodiscard]] bool next() noexcept {
         isShort_ = !reader_.moreElements(array_);
@@ -106,7 +108,7 @@ public:
         return text.append(isLong_ ? ": too many parameters" : ": too few parameters");
     }
 
-private:
+  private:
     bool refuse(std::string_view name, std::string_view wanted) noexcept {
         wrong_ = name;
         wanted_ = wanted;
@@ -156,7 +158,6 @@ bool readParameters(ParameterReader& parameters, Request& request) {
 
 Refusal refusal(const Request& request, std::int64_t code, std::string message) {
     return {.id = request.id.value_or(0),
-            .wantsReply = true,
             .endsConnection = code == kNotWellFormed,
             .error = {std::string(kProtocolErrorDomain), code, std::move(message)}};
 }
@@ -193,11 +194,17 @@ std::optional<Refusal> readHead(CborReader& reader, CborReader::ArrayHead& frame
     std::optional<Value> assembled;
     if (!name) {
         assembled = reader.readValue();
-        name = assembled ? assembled->stringValue() : std::string_view();
+        if (!assembled) {
+            return refusal(request, kNotARequest, "the request's method is not a text");
+        }
+        name = assembled->stringValue();
     }
     const auto method = methodNamed(*name);
     if (!method) {
-        return refusal(request, kUnknownMethod, "unknown method " + std::string(name->substr(0, 64)));
+        constexpr std::size_t longestQuoted = 64;
+        return refusal(request, kUnknownMethod,
+                       name->size() > longestQuoted ? "unknown method"
+                                                    : "unknown method " + std::string(*name));
     }
     request.method = *method;
     return std::nullopt;
@@ -214,7 +221,8 @@ std::optional<Refusal> readRequest(CborReader& reader, Request& request) {
     }
     auto array = reader.moreElements(*frame) ? reader.readArrayHead() : std::nullopt;
     if (!array) {
-        return refusal(request, kWrongParameters, std::string(methodName(request.method)) + ": params: wanted an array");
+        return refusal(request, kWrongParameters,
+                       std::string(methodName(request.method)) + ": params: wanted an array");
     }
     ParameterReader parameters(reader, *array);
     if (!readParameters(parameters, request)) {
@@ -228,7 +236,8 @@ std::optional<Refusal> readRequest(CborReader& reader, Request& request) {
 
 } // namespace
 
-std::optional<Refusal> decodeRequest(std::span<const std::uint8_t> item, KeySetCache& keySets, Request& request) {
+std::optional<Refusal> decodeRequest(std::span<const std::uint8_t> item, KeySetCache& keySets,
+                                     Request& request) {
     CborReader reader(item, &keySets);
     std::optional<Refusal> refused = readRequest(reader, request);
     if (!refused && reader.error() == CborError::none && reader.atEnd()) [[likely]] {

@@ -29,7 +29,6 @@ struct Request {
 /// Why a frame is not carried out.
 struct Refusal {
     std::uint64_t id = 0; ///< the request's; 0 where none could be read
-    bool wantsReply = true;
     bool endsConnection = false;
     Error error;
 };

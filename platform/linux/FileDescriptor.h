@@ -6,31 +6,30 @@
 
 namespace tamblo {
 
-/// Sole ownership of a file descriptor; closed with its owner. Empty at -1.
+/// Owns an open file descriptor and closes it.
 class FileDescriptor {
-public:
+  public:
     FileDescriptor() noexcept = default;
     explicit FileDescriptor(int descriptor) noexcept : descriptor_(descriptor) {}
-    FileDescriptor(FileDescriptor&& other) noexcept : descriptor_(other.release()) {}
+    FileDescriptor(FileDescriptor&& other) noexcept : descriptor_(std::exchange(other.descriptor_, -1)) {}
     FileDescriptor& operator=(FileDescriptor&& other) noexcept {
         if (this != &other) {
-            reset(other.release());
+            reset();
+            descriptor_ = std::exchange(other.descriptor_, -1);
         }
         return *this;
     }
     ~FileDescriptor() { reset(); }
 
     [[nodiscard]] int get() const noexcept { return descriptor_; }
-    explicit operator bool() const noexcept { return descriptor_ >= 0; }
-    [[nodiscard]] int release() noexcept { return std::exchange(descriptor_, -1); }
-    void reset(int descriptor = -1) noexcept {
+    [[nodiscard]] bool isOpen() const noexcept { return descriptor_ >= 0; }
+    void reset() noexcept {
         if (descriptor_ >= 0) {
-            ::close(descriptor_);
+            ::close(std::exchange(descriptor_, -1));
         }
-        descriptor_ = descriptor;
     }
 
-private:
+  private:
     int descriptor_ = -1;
 };
 

@@ -1,0 +1,161 @@
+#include "platform/linux/LinuxPlatform.h"
+
+#include "platform/linux/EventLoop.h"
+#include "platform/linux/LinuxAnalyticsEventService.h"
+#include "platform/linux/LinuxClock.h"
+#include "platform/linux/LinuxConnectionService.h"
+#include "platform/linux/LinuxDeviceProperties.h"
+#include "platform/linux/LinuxPreferences.h"
+#include "platform/linux/LinuxProcessInformation.h"
+#include "platform/linux/LinuxSerialQueue.h"
+#include "platform/linux/LinuxStructuredLog.h"
+#include "platform/linux/LinuxTracePoints.h"
+#include "platform/linux/LinuxWorkQueues.h"
+#include "platform/linux/ServiceManager.h"
+
+#include <csignal>
+#include <cstdlib>
+#include <utility>
+
+#include <sys/epoll.h>
+#include <sys/resource.h>
+#include <sys/signalfd.h>
+
+namespace tamblo {
+
+namespace {
+
+/// Every client is a descriptor: the process takes as many as it may have.
+void raiseDescriptorLimit() noexcept {
+    rlimit limit{};
+    if (::getrlimit(RLIMIT_NOFILE, &limit) == 0) {
+        limit.rlim_cur = limit.rlim_max;
+        ::setrlimit(RLIMIT_NOFILE, &limit);
+    }
+}
+
+} // namespace
+
+/// SIGTERM and SIGINT as a descriptor: the first asks for the end, a second makes it at once.
+class LinuxPlatform::Signals final : public EventSource {
+  public:
+    Signals() {
+        sigset_t signals;
+        sigemptyset(&signals);
+        sigaddset(&signals, SIGTERM);
+        sigaddset(&signals, SIGINT);
+        ::sigprocmask(SIG_BLOCK, &signals, nullptr);
+        descriptor_ = FileDescriptor(::signalfd(-1, &signals, SFD_CLOEXEC | SFD_NONBLOCK));
+        std::signal(SIGPIPE, SIG_IGN);
+    }
+
+    void watch(EventLoop& loop, UniqueFunction<void()> endWanted) {
+        endWanted_ = std::move(endWanted);
+        loop.add(descriptor_.get(), EPOLLIN, *this);
+    }
+
+    void ready(std::uint32_t) override {
+        signalfd_siginfo signal{};
+        while (::read(descriptor_.get(), &signal, sizeof signal) == sizeof signal) {
+            if (!endWanted_) {
+                std::_Exit(EXIT_SUCCESS);
+            }
+            std::exchange(endWanted_, UniqueFunction<void()>())();
+        }
+    }
+
+  private:
+    FileDescriptor descriptor_;
+    UniqueFunction<void()> endWanted_;
+};
+
+class LinuxPlatform::PreferenceChanges final : public EventSource {
+  public:
+    explicit PreferenceChanges(LinuxPreferences& preferences) : preferences_(preferences) {}
+    void ready(std::uint32_t) override { preferences_.readChanges(); }
+    [[nodiscard]] bool comesFirst() const noexcept override { return true; }
+
+  private:
+    LinuxPreferences& preferences_;
+};
+
+/// In the order in which they depend on each other.
+struct LinuxPlatform::Services {
+    explicit Services(const Directories& directories)
+        : deviceProperties(directories.deviceProperties(), log), preferences(directories.preferences(), log),
+          preferenceChanges(preferences), analyticsEvents(directories.logs, clock, preferences, log),
+          connections(loop, log) {}
+
+    Signals signals;
+    LinuxStructuredLog log;
+    LinuxClock clock;
+    LinuxTracePoints tracePoints;
+    LinuxProcessInformation processInformation;
+    LinuxDeviceProperties deviceProperties;
+    LinuxPreferences preferences;
+    PreferenceChanges preferenceChanges;
+    LinuxAnalyticsEventService analyticsEvents;
+    EventLoop loop;
+    LinuxConnectionService connections;
+    LinuxWorkQueues workQueues;
+    std::optional<InlineDrain> drain;
+};
+
+std::variant<std::unique_ptr<LinuxPlatform>, std::string> LinuxPlatform::open() {
+    raiseDescriptorLimit();
+    auto directories = Directories::prepare();
+    if (auto* problem = std::get_if<std::string>(&directories)) {
+        return std::move(*problem);
+    }
+    const auto& places = std::get<Directories>(directories);
+    std::unique_ptr<LinuxPlatform> platform(new LinuxPlatform(places));
+    if (auto problem = platform->services_->connections.open(places.runtime)) {
+        return std::move(*problem);
+    }
+    return platform;
+}
+
+LinuxPlatform::LinuxPlatform(Directories directories) : services_(std::make_unique<Services>(directories)) {}
+
+LinuxPlatform::~LinuxPlatform() = default;
+
+Platform LinuxPlatform::services() {
+    return {.clock = services_->clock,
+            .workQueues = services_->workQueues,
+            .log = services_->log,
+            .tracePoints = services_->tracePoints,
+            .deviceProperties = services_->deviceProperties,
+            .preferences = services_->preferences,
+            .processInformation = services_->processInformation,
+            .analyticsEvents = services_->analyticsEvents,
+            .connections = services_->connections};
+}
+
+void LinuxPlatform::flushSinks() {
+    services_->analyticsEvents.flush();
+}
+
+void LinuxPlatform::run(SerialQueue& requestQueue,
+                        const std::function<void(std::function<void()> completion)>& shutDown) {
+    Services& all = *services_;
+    requestQueue.setBatchEnd([this, &all] {
+        flushSinks();
+        all.connections.releaseReplies();
+    });
+    all.workQueues.setTickEnd([this] { flushSinks(); });
+    all.connections.setRequestQueue(requestQueue);
+    all.loop.setBrackets([&all] { all.drain.emplace(); }, [&all] { all.drain.reset(); });
+    if (all.preferences.fileDescriptor() >= 0) {
+        all.loop.add(all.preferences.fileDescriptor(), EPOLLIN, all.preferenceChanges);
+    }
+    all.signals.watch(all.loop, [&all, &shutDown] {
+        notifyServiceManager("STOPPING=1");
+        all.connections.stop();
+        shutDown([&all] { all.loop.post([&all] { all.loop.stop(); }); });
+    });
+    notifyServiceManager("READY=1");
+    all.loop.run();
+    flushSinks();
+}
+
+} // namespace tamblo

@@ -1,0 +1,46 @@
+#pragma once
+
+#include "platform/Platform.h"
+#include "platform/linux/Directories.h"
+
+#include <functional>
+#include <memory>
+#include <optional>
+#include <string>
+#include <variant>
+
+namespace tamblo {
+
+/// Everything that the service finds on Linux, made and wired once by `main`: the services behind the
+/// platform's interfaces, the event loop that drives them, the signals that end it.
+class LinuxPlatform {
+  public:
+    /// Prepares the directories and opens the socket. A text says why the service cannot start and what to
+    /// do.
+    [[nodiscard]] static std::variant<std::unique_ptr<LinuxPlatform>, std::string> open();
+    ~LinuxPlatform();
+    LinuxPlatform(const LinuxPlatform&) = delete;
+    LinuxPlatform& operator=(const LinuxPlatform&) = delete;
+
+    /// To be installed as the platform of the process.
+    [[nodiscard]] Platform services();
+
+    /// Carries out requests until the first SIGTERM or SIGINT, then `shutDown`, and returns once that has
+    /// called the completion that it is given. The request queue is written out and answered batch by batch:
+    /// first what a batch recorded goes to the sinks' files, then its replies go to the clients.
+    void run(SerialQueue& requestQueue,
+             const std::function<void(std::function<void()> completion)>& shutDown);
+
+  private:
+    class Signals;
+    class PreferenceChanges;
+    struct Services;
+
+    LinuxPlatform(Directories directories);
+
+    void flushSinks();
+
+    std::unique_ptr<Services> services_;
+};
+
+} // namespace tamblo

@@ -1,0 +1,118 @@
+#include "platform/linux/LinuxSerialQueue.h"
+
+#include <utility>
+
+namespace tamblo {
+
+namespace {
+
+thread_local InlineDrain* currentDrain = nullptr;
+
+/// A batch that takes longer than this ran into something slow (a disk that stalls, most likely). For a while
+/// the queue is then left to the pool, so that the responsive thread is held up once and not again and again.
+constexpr std::chrono::milliseconds kSlowBatch{25};
+constexpr std::chrono::seconds kInlineBan{1};
+
+} // namespace
+
+InlineDrain::InlineDrain() {
+    currentDrain = this;
+}
+
+InlineDrain::~InlineDrain() {
+    drain();
+    currentDrain = nullptr;
+}
+
+InlineDrain* InlineDrain::current() noexcept {
+    return currentDrain;
+}
+
+void InlineDrain::drain() {
+    // Draining one queue may post to others, which then join the list.
+    for (std::size_t i = 0; i < queues_.size(); ++i) {
+        queues_[i]->drainInline();
+    }
+    queues_.clear();
+}
+
+LinuxSerialQueue::~LinuxSerialQueue() {
+    std::unique_lock lock(mutex_);
+    isIdle_.wait(lock, [this] { return !isScheduled_; });
+}
+
+void LinuxSerialQueue::post(Work work, Pace pace) {
+    {
+        const std::lock_guard lock(mutex_);
+        pending_.push_back({std::move(work), pace});
+        if (std::exchange(isScheduled_, true)) {
+            return;
+        }
+    }
+    if (currentDrain != nullptr) {
+        currentDrain->queues_.push_back(this);
+    } else {
+        handToPool();
+    }
+}
+
+void LinuxSerialQueue::handToPool() {
+    pool_.post([this] { drainOnPool(); });
+}
+
+bool LinuxSerialQueue::takeBatch() {
+    batch_.clear();
+    next_ = 0;
+    const std::lock_guard lock(mutex_);
+    if (pending_.empty()) {
+        isScheduled_ = false;
+        isIdle_.notify_all();
+        return false;
+    }
+    batch_.swap(pending_);
+    return true;
+}
+
+void LinuxSerialQueue::runBatch(bool stopAtBlocking) {
+    while (next_ != batch_.size()) {
+        Item& item = batch_[next_];
+        if (stopAtBlocking && item.pace == Pace::mayBlock) {
+            break;
+        }
+        item.work();
+        // What the work holds is let go before the next runs, as if it had never been queued.
+        item.work.reset();
+        ++next_;
+    }
+    if (batchEnd_) {
+        batchEnd_();
+    }
+}
+
+void LinuxSerialQueue::drainOnPool() {
+    while (next_ != batch_.size() || takeBatch()) {
+        runBatch(false);
+    }
+}
+
+void LinuxSerialQueue::drainInline() {
+    Time started = std::chrono::steady_clock::now();
+    if (started < inlineAllowedFrom_) {
+        handToPool();
+        return;
+    }
+    while (takeBatch()) {
+        runBatch(true);
+        const Time ended = std::chrono::steady_clock::now();
+        if (ended - started > kSlowBatch) {
+            inlineAllowedFrom_ = ended + kInlineBan;
+        }
+        if (next_ != batch_.size() || ended < inlineAllowedFrom_) {
+            handToPool();
+            return;
+        }
+        started = ended;
+    }
+}
+
+} // namespace tamblo

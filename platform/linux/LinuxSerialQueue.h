@@ -1,0 +1,77 @@
+#pragma once
+
+#include "platform/WorkQueue.h"
+#include "platform/linux/ThreadPool.h"
+
+#include <chrono>
+#include <cstddef>
+#include <mutex>
+#include <string>
+#include <vector>
+
+namespace tamblo {
+
+class LinuxSerialQueue;
+
+/// Lets the thread that holds it run, itself, the quick work that it posts: waking another thread costs more
+/// than a message does. Work is posted as ever, collected, and run in one batch at `drain`, so that a batch
+/// of requests shares one write of the sinks and one send of the replies. Work that may block goes to the
+/// pool, and so does everything behind it. One per thread at a time.
+class InlineDrain {
+  public:
+    InlineDrain();
+    ~InlineDrain();
+    InlineDrain(const InlineDrain&) = delete;
+    InlineDrain& operator=(const InlineDrain&) = delete;
+
+    void drain();
+    /// The calling thread's, or null.
+    [[nodiscard]] static InlineDrain* current() noexcept;
+
+  private:
+    friend class LinuxSerialQueue;
+    std::vector<LinuxSerialQueue*> queues_;
+};
+
+/// A serial queue as a strand: no thread of its own; whoever drains it, the pool or an `InlineDrain`, is the
+/// only one to do so at that time.
+class LinuxSerialQueue final : public SerialQueue {
+  public:
+    LinuxSerialQueue(ThreadPool& pool, std::string_view label) : pool_(pool), label_(label) {}
+    ~LinuxSerialQueue() override;
+
+    void post(Work work, Pace pace) override;
+    void setBatchEnd(Work batchEnd) override { batchEnd_ = std::move(batchEnd); }
+    [[nodiscard]] std::string_view label() const noexcept override { return label_; }
+
+  private:
+    friend class InlineDrain;
+
+    struct Item {
+        Work work;
+        Pace pace;
+    };
+    using Time = std::chrono::steady_clock::time_point;
+
+    void drainOnPool();
+    void drainInline();
+    bool takeBatch();
+    void runBatch(bool stopAtBlocking);
+    void handToPool();
+
+    ThreadPool& pool_;
+    const std::string label_;
+    Work batchEnd_;
+
+    // Touched only by whoever drains.
+    std::vector<Item> batch_;
+    std::size_t next_ = 0;
+    Time inlineAllowedFrom_{};
+
+    std::mutex mutex_; ///< guards what follows
+    std::condition_variable isIdle_;
+    std::vector<Item> pending_;
+    bool isScheduled_ = false;
+};
+
+} // namespace tamblo

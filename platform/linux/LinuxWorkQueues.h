@@ -1,0 +1,31 @@
+#pragma once
+
+#include "platform/WorkQueue.h"
+#include "platform/linux/LinuxRepeatingTimer.h"
+#include "platform/linux/ThreadPool.h"
+
+#include <memory>
+
+namespace tamblo {
+
+/// Serial queues as strands over one pool, and timers. Outlives the queues that it made.
+class LinuxWorkQueues final : public WorkQueues {
+  public:
+    LinuxWorkQueues();
+    ~LinuxWorkQueues() override;
+
+    [[nodiscard]] std::unique_ptr<SerialQueue> makeSerialQueue(std::string_view label) override;
+    [[nodiscard]] std::unique_ptr<RepeatingTimer> makeRepeatingTimer(std::chrono::milliseconds interval,
+                                                                     UniqueFunction<void()> tick) override;
+    /// Called after each tick of any timer, on its thread: what a tick recorded is written out.
+    void setTickEnd(UniqueFunction<void()> tickEnd);
+
+  private:
+    struct TickEnd;
+
+    std::shared_ptr<TickEnd> tickEnd_;
+    std::shared_ptr<LinuxRepeatingTimer::Retired> retired_;
+    ThreadPool pool_;
+};
+
+} // namespace tamblo

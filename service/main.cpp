@@ -1,0 +1,30 @@
+#include "platform/linux/LinuxPlatform.h"
+#include "service/ZRReportingService.h"
+#include "util/ReportingServerQueue.h"
+
+#include <cstdio>
+#include <cstdlib>
+#include <variant>
+
+/// Installs the platform, makes the service the delegate of the process's listener, and runs until a signal
+/// ends it.
+int main() {
+    using namespace tamblo;
+
+    auto opened = LinuxPlatform::open();
+    if (const auto* problem = std::get_if<std::string>(&opened)) {
+        std::fprintf(stderr, "tamblod: %s\n", problem->c_str());
+        return EXIT_FAILURE;
+    }
+    LinuxPlatform& linux_ = *std::get<std::unique_ptr<LinuxPlatform>>(opened);
+    installPlatform(linux_.services());
+
+    ZRReportingService service;
+    ConnectionListener& listener =
+        platform().connections.listenerForServiceName("com.vandra.tamblo.reporting");
+    listener.setDelegate(service);
+    listener.resume();
+    linux_.run(ZRReportingUtilityGetReportingServerQueue(),
+               [&service](auto completion) { service.shutDown(std::move(completion)); });
+    return EXIT_SUCCESS;
+}
