@@ -438,8 +438,10 @@ bool Reader::readMember(std::vector<Member>& members, int depth) {
 }
 
 bool Reader::buildDictionary(std::vector<Member>& members, Item& item) {
-    std::stable_sort(members.begin(), members.end(),
-                     [](const Member& a, const Member& b) { return a.key < b.key; });
+    std::sort(members.begin(), members.end(), [](const Member& a, const Member& b) {
+        const int order = a.key.compare(b.key);
+        return order != 0 ? order < 0 : a.offset < b.offset;
+    });
     const auto twice = std::adjacent_find(members.begin(), members.end(),
                                           [](const Member& a, const Member& b) { return a.key == b.key; });
     if (twice != members.end()) {

@@ -1,0 +1,41 @@
+#include "tests/base/AllocationCount.h"
+
+#include <cstdlib>
+#include <new>
+
+namespace tamblo::test {
+
+namespace {
+thread_local AllocationCount count;
+} // namespace
+
+AllocationCount allocationCount() noexcept {
+    return count;
+}
+
+static void* allocate(std::size_t size) noexcept {
+    ++count.blocks;
+    count.bytes += size;
+    return std::malloc(size == 0 ? 1 : size);
+}
+
+} // namespace tamblo::test
+
+void* operator new(std::size_t size) {
+    if (void* const block = tamblo::test::allocate(size)) {
+        return block;
+    }
+    throw std::bad_alloc();
+}
+void* operator new(std::size_t size, const std::nothrow_t&) noexcept {
+    return tamblo::test::allocate(size);
+}
+void operator delete(void* block) noexcept {
+    std::free(block);
+}
+void operator delete(void* block, std::size_t) noexcept {
+    std::free(block);
+}
+void operator delete(void* block, const std::nothrow_t&) noexcept {
+    std::free(block);
+}

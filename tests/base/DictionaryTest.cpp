@@ -1,0 +1,290 @@
+#include "base/Dictionary.h"
+#include "tests/base/AllocationCount.h"
+
+#include <gtest/gtest.h>
+
+#include <algorithm>
+#include <array>
+#include <map>
+#include <random>
+#include <string>
+#include <thread>
+#include <vector>
+
+namespace tamblo {
+namespace {
+
+using Model = std::map<std::string, Value>;
+
+/// Keys that differ late, early, only in length, or only in bytes that are 0 or above ASCII.
+const std::vector<std::string>& someKeys() {
+    static const std::vector<std::string> keys{"",
+                                               std::string(1, '\0'),
+                                               std::string(9, '\0'),
+                                               "a",
+                                               std::string("a\0", 2),
+                                               "ab",
+                                               "b",
+                                               "spatial-",
+                                               "spatial-audio",
+                                               "spatial-audio-mode",
+                                               "spatialA",
+                                               "\xC3\xA9",
+                                               "\xF0\x90\x85\x91",
+                                               "with space",
+                                               "\"quoted\"",
+                                               "zrreporting_timestamp"};
+    return keys;
+}
+
+/// The same entries with keys that are shared with no other dictionary built so.
+Dictionary unshared(const Model& model) {
+    std::vector<std::string_view> keys;
+    std::vector<Value> values;
+    std::vector<std::uint32_t> places;
+    for (const auto& [key, value] : model) {
+        places.push_back(static_cast<std::uint32_t>(keys.size()));
+        keys.push_back(key);
+        values.push_back(value);
+    }
+    return Dictionary::adopt(KeySet::make(keys), values, places);
+}
+
+void expectHolds(const Dictionary& dictionary, const Model& model) {
+    ASSERT_EQ(dictionary.size(), model.size());
+    ASSERT_EQ(dictionary.empty(), model.empty());
+    std::size_t index = 0;
+    for (const auto& [key, value] : model) {
+        ASSERT_EQ(dictionary.keyAt(index), key);
+        ASSERT_EQ(dictionary.valueAt(index), value);
+        ++index;
+    }
+    for (const std::string& key : someKeys()) {
+        const auto expected = model.find(key);
+        const Value* found = dictionary.find(key);
+        ASSERT_EQ(found != nullptr, expected != model.end());
+        ASSERT_TRUE(found == nullptr || *found == expected->second);
+    }
+}
+
+bool equalsIgnoring(Model a, Model b, const std::vector<std::string_view>& ignored) {
+    for (const std::string_view key : ignored) {
+        a.erase(std::string(key));
+        b.erase(std::string(key));
+    }
+    return a == b;
+}
+
+class DictionaryModelTest : public testing::TestWithParam<std::uint32_t> {
+protected:
+    std::size_t below(std::size_t limit) { return random_() % limit; }
+    const std::string& key() { return someKeys()[below(someKeys().size())]; }
+    Value value() {
+        switch (below(4)) {
+        case 0:
+            return Value(static_cast<int>(below(2)));
+        case 1:
+            return Value(static_cast<double>(below(2)));
+        case 2:
+            return Value(below(2) == 0 ? "short" : "a text that does not lie in the value itself");
+        default:
+            return Value(Array{Value(static_cast<int>(below(2)))});
+        }
+    }
+    void change(std::size_t slot) {
+        Dictionary& dictionary = dictionaries_[slot];
+        Model& model = models_[slot];
+        const std::size_t other = below(dictionaries_.size());
+        switch (below(12)) {
+        case 0:
+            dictionary.merge(dictionaries_[other]);
+            for (const auto& [k, v] : Model(models_[other])) {
+                model.insert_or_assign(k, v);
+            }
+            return;
+        case 1:
+            dictionary = dictionaries_[other];
+            model = Model(models_[other]);
+            return;
+        case 2:
+            dictionary = unshared(model);
+            return;
+        case 3:
+            dictionary = dictionary.deepCopy();
+            return;
+        case 4:
+            dictionary.reserve(below(30));
+            return;
+        case 5:
+            if (const std::size_t size = model.size(); size != 0) {
+                const std::size_t index = below(size);
+                const Value v = value();
+                dictionary.setValueAt(index, v);
+                std::next(model.begin(), static_cast<std::ptrdiff_t>(index))->second = v;
+            }
+            return;
+        case 6:
+        case 7:
+        case 8: {
+            const std::string& k = key();
+            ASSERT_EQ(dictionary.remove(k), model.erase(k) == 1);
+            return;
+        }
+        default: {
+            const std::string& k = key();
+            const Value v = value();
+            dictionary.set(k, v);
+            model.insert_or_assign(k, v);
+        }
+        }
+    }
+
+    std::mt19937 random_{GetParam()};
+    std::array<Dictionary, 4> dictionaries_;
+    std::array<Model, 4> models_;
+};
+
+TEST_P(DictionaryModelTest, DoesWhatASortedMapDoes) {
+    for (int step = 0; step < 3000; ++step) {
+        ASSERT_NO_FATAL_FAILURE(change(below(dictionaries_.size())));
+        const std::size_t a = below(4);
+        const std::size_t b = below(4);
+        ASSERT_EQ(dictionaries_[a] == dictionaries_[b], models_[a] == models_[b]);
+        std::vector<std::string_view> ignored;
+        while (below(4) != 0) {
+            ignored.emplace_back(key());
+        }
+        ASSERT_EQ(dictionaries_[a].equalsIgnoring(dictionaries_[b], ignored),
+                  equalsIgnoring(models_[a], models_[b], ignored));
+        ASSERT_EQ(dictionaries_[a], unshared(models_[a]));
+        // All of them: what shares a block with the changed one must stand as it was.
+        for (std::size_t slot = 0; slot < 4; ++slot) {
+            ASSERT_NO_FATAL_FAILURE(expectHolds(dictionaries_[slot], models_[slot])) << "step " << step;
+        }
+    }
+}
+
+INSTANTIATE_TEST_SUITE_P(Seeds, DictionaryModelTest, testing::Values(1U, 2U, 3U, 4U));
+
+TEST(Dictionary, ACopyIsNotChangedByTheOthersChange) {
+    Dictionary inner{{"deep", "before"}};
+    Dictionary original{{"inner", inner}, {"list", Array{1, 2}}, {"n", 1}};
+    Dictionary copy = original;
+    EXPECT_TRUE(copy.sharesStorageWith(original));
+
+    Dictionary changed = copy.find("inner")->dictionaryValue();
+    changed.set("deep", "after");
+    copy.set("inner", changed);
+    original.remove("n");
+
+    EXPECT_EQ(inner, (Dictionary{{"deep", "before"}}));
+    EXPECT_EQ(original, (Dictionary{{"inner", inner}, {"list", Array{1, 2}}}));
+    EXPECT_EQ(copy, (Dictionary{{"inner", Dictionary{{"deep", "after"}}}, {"list", Array{1, 2}}, {"n", 1}}));
+
+    Dictionary deep = original.deepCopy();
+    EXPECT_FALSE(deep.sharesStorageWith(original));
+    EXPECT_FALSE(deep.find("inner")->dictionaryValue().sharesStorageWith(inner));
+    EXPECT_EQ(deep, original);
+    original.merge(original);
+    EXPECT_EQ(deep, original);
+}
+
+TEST(Dictionary, AValueOfItsOwnCanBeSet) {
+    Dictionary dictionary{{"a", "a text that does not lie in the value itself"}};
+    for (const char* key : {"b", "c", "a", "d", "0"}) {
+        dictionary.set(key, *dictionary.find("a"));
+        dictionary.set("self", dictionary);
+        dictionary.remove("self");
+    }
+    EXPECT_EQ(dictionary.size(), 5U);
+    EXPECT_EQ(dictionary.valueAt(0), dictionary.valueAt(4));
+
+    // Stepping down into what only the assigned one holds, and merging it in.
+    const Dictionary inner{{"b", "another text that does not lie in the value itself"}, {"c", 2}, {"inner", 1}};
+    Dictionary outer = Dictionary{{"inner", inner.deepCopy()}}.deepCopy();
+    outer.merge(outer.find("inner")->dictionaryValue());
+    EXPECT_EQ(outer, inner);
+    outer.set("inner", inner.deepCopy());
+    outer = outer.find("inner")->dictionaryValue();
+    EXPECT_EQ(outer, inner);
+    Value value = Array{Value(Array{inner.deepCopy()})};
+    value = value.arrayValue()[0];
+    value = value.arrayValue()[0];
+    value = *value.dictionaryValue().find("b");
+    EXPECT_EQ(value, inner.valueAt(0));
+}
+
+TEST(Dictionary, MergesManyNewKeysAtOnce) {
+    Model model;
+    Dictionary merged;
+    for (const int step : {3, 7, 1}) {
+        Dictionary other;
+        for (int i = 0; i < 60; i += step) {
+            other.set("key " + std::to_string(i), i * step);
+            model.insert_or_assign("key " + std::to_string(i), i * step);
+        }
+        const Dictionary before = merged;
+        merged.merge(other);
+        expectHolds(merged, model);
+        EXPECT_EQ(before.size(), step == 3 ? 0U : step == 7 ? 20U : 26U);
+    }
+}
+
+TEST(Dictionary, AllocatesOnlyForWhatIsNew) {
+    Dictionary previous{{"a", 1}, {"b", 2}, {"c", 3}};
+    const Dictionary update{{"a", 4}, {"c", "short"}};
+    EXPECT_EQ(test::allocationsOf([&] { EXPECT_NE(previous.find("b"), nullptr); }).blocks, 0U);
+    EXPECT_EQ(test::allocationsOf([&] { EXPECT_EQ(previous.find("missing"), nullptr); }).blocks, 0U);
+    EXPECT_EQ(test::allocationsOf([&] { previous.merge(update); }).blocks, 0U);
+    EXPECT_EQ(test::allocationsOf([&] { const Dictionary copy = previous; }).blocks, 0U);
+    EXPECT_EQ(previous, (Dictionary{{"a", 4}, {"b", 2}, {"c", "short"}}));
+
+    // A key that was added to the same keys before is a look-up; only the values need a block.
+    const auto extend = [&] {
+        Dictionary copy = previous;
+        copy.set("zrreporting_timestamp", 1.5);
+        return copy;
+    };
+    const Dictionary first = extend();
+    EXPECT_LE(test::allocationsOf([&] { EXPECT_EQ(&extend().keys(), &first.keys()); }).blocks, 1U);
+}
+
+TEST(KeySet, KnowsWhatFollowsFromTheKeys) {
+    const Dictionary plain{{"a", 1}, {"\"\n", 2}};
+    EXPECT_FALSE(plain.keys().anyKeyHasSpace());
+    EXPECT_EQ(plain.keys().jsonKey(0), "\"\\\"\\n\":");
+    EXPECT_EQ(plain.keys().jsonKey(1), "\"a\":");
+    Dictionary spaced = plain;
+    spaced.set("a b", 3);
+    EXPECT_TRUE(spaced.keys().anyKeyHasSpace());
+    spaced.remove("a b");
+    EXPECT_FALSE(spaced.keys().anyKeyHasSpace());
+    EXPECT_EQ(spaced.keys(), plain.keys());
+    EXPECT_EQ(plain.keys().find("b"), KeySet::kNotFound);
+    EXPECT_EQ(KeySet::empty()->size(), 0U);
+}
+
+TEST(KeySet, IsSharedBetweenThreads) {
+    const Dictionary base{{"a", 1}, {"b", 2}};
+    const auto work = [&base](int seed) {
+        for (int i = 0; i < 2000; ++i) {
+            Dictionary mine = base;
+            mine.set("k" + std::to_string((i * 7 + seed) % 40), i);
+            mine.set("zrreporting_timestamp", i);
+            mine.remove("a");
+            ASSERT_EQ(mine.size(), 3U);
+            ASSERT_EQ(*mine.find("zrreporting_timestamp"), Value(i));
+        }
+    };
+    std::vector<std::thread> threads;
+    for (int seed = 0; seed < 4; ++seed) {
+        threads.emplace_back(work, seed);
+    }
+    for (std::thread& thread : threads) {
+        thread.join();
+    }
+    EXPECT_EQ(base, (Dictionary{{"a", 1}, {"b", 2}}));
+}
+
+} // namespace
+} // namespace tamblo

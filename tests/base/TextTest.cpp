@@ -1,0 +1,189 @@
+#include "base/Base64.h"
+#include "base/Format.h"
+#include "base/Rfc3339.h"
+#include "base/TextBuffer.h"
+#include "base/Utf8.h"
+
+#include <gtest/gtest.h>
+
+#include <limits>
+#include <string>
+#include <vector>
+
+namespace tamblo {
+
+namespace colours {
+enum class Colour { red };
+void appendText(std::string& out, const Colour&) {
+    out += "red";
+}
+} // namespace colours
+
+namespace {
+
+TEST(Format, PutsArgumentsInTheirPlaces) {
+    EXPECT_EQ(formatted("nothing"), "nothing");
+    EXPECT_EQ(formatted("{}{}", 1, "a"), "1a");
+    EXPECT_EQ(formatted("a={} b={}, {{}", -5, true, std::string("{}")), "a=-5 b=1, {{}");
+    EXPECT_EQ(formatted("{}/{}", std::numeric_limits<std::int64_t>::min(), std::numeric_limits<std::uint64_t>::max()),
+              "-9223372036854775808/18446744073709551615");
+    EXPECT_EQ(formatted("{} {} {}", 1.5, 0.1F, -0.0), "1.500000 0.100000 -0.000000");
+    EXPECT_EQ(formatted("{} {} {}", fixed(2.675, 1), fixed(2.5, 0), fixed(-0.125, 2)), "2.7 2 -0.12");
+    EXPECT_EQ(formatted("{}", std::numeric_limits<double>::max()).size(), 309U + 7U);
+    EXPECT_EQ(formatted("<{}>", colours::Colour::red), "<red>");
+}
+
+TEST(TextBuffer, GrowsAndGivesBack) {
+    TextBuffer buffer;
+    buffer.append("");
+    EXPECT_TRUE(buffer.empty());
+    std::string expected;
+    for (int i = 0; i < 300; ++i) {
+        buffer.append("0123456789");
+        buffer.append('x');
+        expected += "0123456789x";
+    }
+    EXPECT_EQ(buffer.view(), expected);
+    buffer.dropFront(11);
+    buffer.truncate(buffer.size() - 1);
+    EXPECT_EQ(buffer.view(), std::string_view(expected).substr(11, expected.size() - 12));
+    TextBuffer moved = std::move(buffer);
+    EXPECT_EQ(moved.size(), expected.size() - 12);
+    EXPECT_EQ(buffer.size(), 0U);
+    moved.reset();
+    EXPECT_EQ(moved.capacity(), 0U);
+}
+
+TEST(Utf8, TellsWhatIsWellFormed) {
+    const std::vector<std::pair<std::string, bool>> rows{
+        {"", true},
+        {"ascii \x7f", true},
+        {"\xC2\x80", true},
+        {"\xDF\xBF", true},
+        {"\xE0\xA0\x80", true},
+        {"\xED\x9F\xBF", true},
+        {"\xEE\x80\x80", true},
+        {"\xEF\xBF\xBF", true},
+        {"\xF0\x90\x80\x80", true},
+        {"\xF4\x8F\xBF\xBF", true},
+        {"\x80", false},
+        {"\xBF", false},
+        {"\xC0\x80", false},
+        {"\xC1\xBF", false},
+        {"\xC2", false},
+        {"\xC2\x41", false},
+        {"\xC2\xC2\x80", false},
+        {"\xE0\x9F\xBF", false},
+        {"\xE6\xB0", false},
+        {"\xED\xA0\x80", false},
+        {"\xED\xBF\xBF", false},
+        {"\xF0\x8F\xBF\xBF", false},
+        {"\xF0\x90\x85", false},
+        {"\xF4\x90\x80\x80", false},
+        {"\xF5\x80\x80\x80", false},
+        {"\xFF", false},
+    };
+    for (const auto& [text, expected] : rows) {
+        for (std::size_t before = 0; before < 17; ++before) {
+            for (const std::size_t behind : {0U, 1U, 8U}) {
+                EXPECT_EQ(isUtf8(std::string(before, 'a') + text + std::string(behind, 'z')), expected)
+                    << testing::PrintToString(text) << " behind " << before;
+            }
+        }
+    }
+}
+
+TEST(Base64, ReadsAndWritesTheExamplesOfTheStandard) {
+    const std::vector<std::pair<std::string, std::string>> rows{
+        {"", ""},         {"f", "Zg=="},         {"fo", "Zm8="},         {"foo", "Zm9v"},
+        {"foob", "Zm9vYg=="}, {"fooba", "Zm9vYmE="}, {"foobar", "Zm9vYmFy"}, {"\xFB\xFF\xBF", "+/+/"},
+    };
+    for (const auto& [plain, text] : rows) {
+        const std::vector<std::uint8_t> bytes(plain.begin(), plain.end());
+        EXPECT_EQ(encodeBase64(bytes), text);
+        EXPECT_EQ(decodeBase64(text), bytes);
+    }
+    for (const char* text : {"Z", "Zg", "Zg=", "Zg===", "=", "====", "Z===", "Zh==", "Zm9=", "Zm-_", "Zm9v\n", " Zm9v",
+                             "Zg==Zg==", "Zm=v"}) {
+        EXPECT_EQ(decodeBase64(text), std::nullopt) << text;
+    }
+}
+
+TEST(Rfc3339, WritesTimes) {
+    constexpr double infinity = std::numeric_limits<double>::infinity();
+    const std::vector<std::pair<double, const char*>> rows{
+        {0, "1970-01-01T00:00:00.000Z"},
+        {-0.0, "1970-01-01T00:00:00.000Z"},
+        {0.0004, "1970-01-01T00:00:00.000Z"},
+        {0.9994, "1970-01-01T00:00:00.999Z"},
+        {0.9996, "1970-01-01T00:00:01.000Z"},
+        {59.99951, "1970-01-01T00:01:00.000Z"},
+        {-0.25, "1969-12-31T23:59:59.750Z"},
+        {-0.0001, "1970-01-01T00:00:00.000Z"},
+        {-86400, "1969-12-31T00:00:00.000Z"},
+        {1772366400.25, "2026-03-01T12:00:00.250Z"},
+        {1363896240.5, "2013-03-21T20:04:00.500Z"},
+        {1709164800, "2024-02-29T00:00:00.000Z"},
+        {951782399.9996, "2000-02-29T00:00:00.000Z"},
+        {4107542400, "2100-03-01T00:00:00.000Z"},
+        {-62167219200, "0000-01-01T00:00:00.000Z"},
+        {-62167219201, nullptr},
+        {253402300799.999, "9999-12-31T23:59:59.999Z"},
+        {253402300799.9997, nullptr},
+        {253402300800, nullptr},
+        {infinity, nullptr},
+        {-infinity, nullptr},
+        {std::numeric_limits<double>::quiet_NaN(), nullptr},
+        {1e300, nullptr},
+    };
+    for (const auto& [seconds, text] : rows) {
+        const auto written = formatRfc3339(seconds);
+        EXPECT_EQ(written, text == nullptr ? std::nullopt : std::optional<std::string>(text)) << seconds;
+        if (written) {
+            EXPECT_NEAR(parseRfc3339(*written).value_or(infinity), seconds, 0.0006) << *written;
+        }
+    }
+}
+
+TEST(Rfc3339, ReadsTimes) {
+    const std::vector<std::pair<const char*, std::optional<double>>> rows{
+        {"1970-01-01T00:00:00Z", 0},
+        {"1970-01-01t00:00:00z", 0},
+        {"1970-01-01T01:30:00+01:30", 0},
+        {"1969-12-31T16:00:00-08:00", 0},
+        {"1970-01-01T00:00:00-00:00", 0},
+        {"1985-04-12T23:20:50.52Z", 482196050.52},
+        {"1996-12-19T16:39:57-08:00", 851042397},
+        {"1990-12-31T23:59:60Z", 662688000},
+        {"1990-12-31T15:59:60-08:00", 662688000},
+        {"1970-01-01T00:00:00.123456789012345678901Z", 0.123456789012345678901},
+        {"1969-12-31T23:59:59.5Z", -0.5},
+        {"", {}},
+        {"1970-01-01", {}},
+        {"1970-01-01T00:00:00", {}},
+        {"1970-01-01T00:00Z", {}},
+        {"1970-01-01 00:00:00Z", {}},
+        {"1970-01-01T00:00:00.Z", {}},
+        {"1970-01-01T00:00:00,5Z", {}},
+        {"1970-01-01T00:00:00+0100", {}},
+        {"1970-01-01T00:00:00+24:00", {}},
+        {"1970-01-01T24:00:00Z", {}},
+        {"1970-01-01T00:60:00Z", {}},
+        {"1970-01-01T00:00:61Z", {}},
+        {"1970-01-01T12:00:60Z", {}},
+        {"1970-02-29T00:00:00Z", {}},
+        {"1970-13-01T00:00:00Z", {}},
+        {"1970-00-01T00:00:00Z", {}},
+        {"1970-01-00T00:00:00Z", {}},
+        {"1970-1-01T00:00:00Z", {}},
+        {"-970-01-01T00:00:00Z", {}},
+        {"1970-01-01T00:00:00Z ", {}},
+        {"1970-01-01T00:00:00ZZ", {}},
+    };
+    for (const auto& [text, expected] : rows) {
+        EXPECT_EQ(parseRfc3339(text), expected) << text;
+    }
+}
+
+} // namespace
+} // namespace tamblo

@@ -1,0 +1,149 @@
+#include "base/Dictionary.h"
+#include "base/Value.h"
+
+#include <gtest/gtest.h>
+
+#include <cmath>
+#include <limits>
+#include <string>
+#include <vector>
+
+namespace tamblo {
+namespace {
+
+constexpr double kNan = std::numeric_limits<double>::quiet_NaN();
+constexpr double kInfinity = std::numeric_limits<double>::infinity();
+constexpr std::int64_t kLeast = std::numeric_limits<std::int64_t>::min();
+constexpr std::int64_t kMost = std::numeric_limits<std::int64_t>::max();
+constexpr std::uint64_t kMostUnsigned = std::numeric_limits<std::uint64_t>::max();
+constexpr std::int64_t k2To53 = std::int64_t{1} << 53;
+
+TEST(Value, NumbersAreEqualByValueAcrossKinds) {
+    const std::vector<std::vector<Value>> classes{
+        {0, false, 0.0, -0.0, 0.0F, -0.0F, 0U, Value()},
+        {1, true, 1.0, 1.0F, 1ULL},
+        {-1, -1.0, -1.0F},
+        {0.1},
+        {0.1F, static_cast<double>(0.1F)},
+        {k2To53, static_cast<double>(k2To53), static_cast<float>(k2To53)},
+        {k2To53 + 1, static_cast<std::uint64_t>(k2To53) + 1},
+        {k2To53 + 2, static_cast<double>(k2To53 + 2)},
+        {kMost, static_cast<std::uint64_t>(kMost)},
+        {std::uint64_t{1} << 63U, 0x1p63, 0x1p63F},
+        {kMostUnsigned},
+        {0x1p64, 0x1p64F},
+        {kLeast, -0x1p63, -0x1p63F},
+        {kInfinity, std::numeric_limits<float>::infinity()},
+        {-kInfinity},
+        {kNan, std::numeric_limits<float>::quiet_NaN(), -kNan},
+        {"1"},
+        {"1.0"},
+        {""},
+        {Value::date(1)},
+        {Value::date(0)},
+        {Value::date(kNan)},
+        {Value::data({})},
+        {Value(Array{})},
+        {Value(Dictionary{})},
+        {Value(Array{1, "a"}), Value(Array{1.0, "a"})},
+        {Value(Array{1, "b"})},
+        {Value(Array{1})},
+        {Value(Dictionary{{"a", 1}}), Value(Dictionary{{"a", true}})},
+        {Value(Dictionary{{"b", 1}})},
+    };
+    for (std::size_t i = 0; i < classes.size(); ++i) {
+        for (std::size_t j = 0; j < classes.size(); ++j) {
+            for (const Value& a : classes[i]) {
+                for (const Value& b : classes[j]) {
+                    EXPECT_EQ(a == b, i == j) << "classes " << i << " and " << j;
+                }
+            }
+        }
+    }
+}
+
+TEST(Value, ReadingANumberNeverFails) {
+    struct Row {
+        Value value;
+        double real;
+        std::int64_t integer;
+        std::uint64_t natural;
+        bool truth;
+    };
+    const std::vector<Row> rows{
+        {true, 1, 1, 1, true},
+        {-7, -7, -7, 0, true},
+        {2.9, 2.9, 2, 2, true},
+        {-2.9, -2.9, -2, 0, true},
+        {0.5F, 0.5, 0, 0, true},
+        {kMostUnsigned, 0x1p64, kMost, kMostUnsigned, true},
+        {1e300, 1e300, kMost, kMostUnsigned, true},
+        {-1e300, -1e300, kLeast, 0, true},
+        {kInfinity, kInfinity, kMost, kMostUnsigned, true},
+        {-0.0, 0, 0, 0, false},
+        {"12", 12, 12, 12, true},
+        {" \t-3.75e1x", -37.5, -37, 0, true},
+        {"+4 of them", 4, 4, 4, true},
+        {".5", 0.5, 0, 0, true},
+        {"9223372036854775807", 0x1p63, kMost, static_cast<std::uint64_t>(kMost), true},
+        {"18446744073709551615", 0x1p64, kMost, kMostUnsigned, true},
+        {"99999999999999999999", 99999999999999999999.0, kMost, kMostUnsigned, true},
+        {"0", 0, 0, 0, false},
+        {"", 0, 0, 0, false},
+        {"no", 0, 0, 0, false},
+        {"-", 0, 0, 0, false},
+        {"a longer text without a number", 0, 0, 0, false},
+        {"YES", 0, 0, 0, true},
+        {"yes, indeed", 0, 0, 0, true},
+        {"TRUE", 0, 0, 0, true},
+        {"true", 0, 0, 0, true},
+        {Value::date(5), 0, 0, 0, false},
+        {Value::data(std::vector<std::uint8_t>{'1'}), 0, 0, 0, false},
+        {Value(Array{1}), 0, 0, 0, false},
+        {Value(Dictionary{{"a", 1}}), 0, 0, 0, false},
+    };
+    for (std::size_t i = 0; i < rows.size(); ++i) {
+        EXPECT_DOUBLE_EQ(rows[i].value.doubleValue(), rows[i].real) << "row " << i;
+        EXPECT_EQ(rows[i].value.integerValue(), rows[i].integer) << "row " << i;
+        EXPECT_EQ(rows[i].value.unsignedValue(), rows[i].natural) << "row " << i;
+        EXPECT_EQ(rows[i].value.boolValue(), rows[i].truth) << "row " << i;
+    }
+    EXPECT_EQ(Value(kNan).integerValue(), 0);
+    EXPECT_EQ(Value(kNan).unsignedValue(), 0U);
+}
+
+TEST(Value, KeepsItsKindAndContent) {
+    EXPECT_EQ(Value(kMost).kind(), Value::Kind::integer);
+    EXPECT_EQ(Value(static_cast<std::uint64_t>(kMost)).kind(), Value::Kind::integer);
+    EXPECT_EQ(Value(static_cast<std::uint64_t>(kMost) + 1).kind(), Value::Kind::unsignedInteger);
+    EXPECT_EQ(Value("text").kind(), Value::Kind::string);
+    EXPECT_EQ(Value(true).kind(), Value::Kind::boolean);
+    EXPECT_DOUBLE_EQ(Value::date(1.5).dateSeconds(), 1.5);
+    EXPECT_TRUE(Value(1).stringValue().empty());
+    EXPECT_TRUE(Value("x").arrayValue().empty());
+    EXPECT_TRUE(Value("x").dictionaryValue().empty());
+
+    // Lengths on both sides of what lies in the value itself, through copy, move and assignment to itself.
+    for (const std::size_t length : {0U, 1U, 13U, 14U, 15U, 16U, 254U, 255U, 256U, 70'000U}) {
+        std::string text(length, 'x');
+        if (length > 1) {
+            text[length / 2] = '\0';
+        }
+        Value value(text);
+        Value copy = value;
+        Value moved = std::move(value);
+        const Value& self = copy;
+        copy = self;
+        EXPECT_EQ(copy.stringValue(), text);
+        EXPECT_EQ(moved, copy);
+        EXPECT_EQ(moved.deepCopy(), copy);
+        EXPECT_NE(moved, Value(text + "y"));
+        const std::vector<std::uint8_t> bytes(length, 0xFF);
+        const Value data = Value::data(bytes);
+        EXPECT_TRUE(std::equal(bytes.begin(), bytes.end(), data.dataValue().begin(), data.dataValue().end()));
+        EXPECT_NE(data, Value(text));
+    }
+}
+
+} // namespace
+} // namespace tamblo
