@@ -1,0 +1,84 @@
+#include "session/MessageIntake.h"
+
+#include "util/BoundedCache.h"
+#include "util/MessageKeys.h"
+
+#include <algorithm>
+#include <array>
+#include <string>
+#include <string_view>
+#include <vector>
+
+namespace tamblo::intake {
+
+namespace {
+
+constexpr double kOldestAcceptedAge = 31'536'000; // seconds: 365 days
+
+/// Differ between two messages that say the same.
+constexpr std::array<std::string_view, 3> kKeysOfTimes{ZRReportingInternalEventProcessUptimeMS,
+                                                       ZRReportingInternalEventSystemUptimeSec,
+                                                       ZRReportingInternalEventEpochTime};
+
+const Value& audioTag(AudioEventCategory category, AudioEventType type) {
+    // One for each thread that does session work: the tags of a device's messages are few.
+    static thread_local BoundedCache<Value> tags;
+    const std::uint64_t key = (std::uint64_t{1} << 48U) | (std::uint64_t{category} << 16U) | type;
+    return tags.get(key, [&] {
+        std::string tag = ZRReportingUtilityCategoryString(category);
+        tag += ZRReportingUtilityTypeString(type);
+        return Value(tag);
+    });
+}
+
+} // namespace
+
+void addMissingDates(Dictionary& payload, WallTime now) {
+    const double seconds = secondsSince1970(now);
+    if (const Value* timestamp = payload.find(ZRReportingInternalEventEpochTime)) {
+        if (!(timestamp->doubleValue() < seconds - kOldestAcceptedAge)) {
+            return;
+        }
+        payload.set(kInvalidTimestampKey, Value(*timestamp));
+    } else {
+        payload.set(kInvalidTimestampKey, "nil");
+    }
+    payload.set(ZRReportingInternalEventEpochTime, seconds);
+}
+
+void removeWhiteSpaceFromKeys(Dictionary& payload) {
+    if (!payload.keys().anyKeyHasSpace()) {
+        return;
+    }
+    const Dictionary original = payload;
+    for (std::size_t i = 0; i < original.size(); ++i) {
+        std::string key(original.keyAt(i));
+        std::replace(key.begin(), key.end(), ' ', '_');
+        if (key != original.keyAt(i)) {
+            payload.set(key, original.valueAt(i));
+            payload.remove(original.keyAt(i));
+        }
+    }
+}
+
+void addAudioMessageTag(Dictionary& payload, AudioEventCategory category, AudioEventType type) {
+    payload.set(kAudioTagKey, audioTag(category, type));
+}
+
+void addAppName(Dictionary& payload, const Value& appName) {
+    const Value* present = payload.find(ZRReportingApplicationName);
+    if (present == nullptr || present->stringValue() == "Unknown") {
+        payload.set(ZRReportingApplicationName, appName);
+    }
+}
+
+bool isRepetition(const Dictionary& earlier, const Dictionary& payload) noexcept {
+    return earlier.equalsIgnoring(payload, kKeysOfTimes);
+}
+
+double epochTime(const Dictionary& payload) noexcept {
+    const Value* timestamp = payload.find(ZRReportingInternalEventEpochTime);
+    return timestamp != nullptr ? timestamp->doubleValue() : 0.0;
+}
+
+} // namespace tamblo::intake

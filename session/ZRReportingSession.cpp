@@ -1,0 +1,225 @@
+#include "session/ZRReportingSession.h"
+
+#include "platform/Platform.h"
+#include "session/MessageIntake.h"
+#include "util/Log.h"
+#include "util/MessageKeys.h"
+#include "util/TraceEvents.h"
+
+#include <utility>
+
+namespace tamblo {
+
+std::shared_ptr<ZRReportingSession> ZRReportingSession::initWithID(ReporterID reporterID,
+                                                                   std::vector<pid_t> processIdentifiers) {
+    const WorkerClassLists& classes = workerClassLists();
+    auto session = std::make_shared<ZRReportingSession>(Created(), reporterID, std::move(processIdentifiers));
+    session->setServiceType(AudioServiceTypeUnknown);
+    session->startWorkersFromClasses(classes.startOnInit);
+    log::info(ZRReportingSessionCategory(), "created reporting session for ID: {}", reporterID);
+    emitTracePoint(TraceEvent::sessionCreated);
+    return session;
+}
+
+ZRReportingSession::ZRReportingSession(Created, ReporterID reporterID, std::vector<pid_t> processIdentifiers)
+    : reporterID_(reporterID),
+      processIdentifiers_(std::move(processIdentifiers)),
+      appName_(ZRReportingUtilityRetrieveAppName(configuration_)) {}
+
+ZRReportingSession::~ZRReportingSession() {
+    emitTracePoint(TraceEvent::sessionDestroyed);
+    log::info(ZRReportingSessionCategory(), "deallocing this session {}", reporterID_);
+}
+
+void ZRReportingSession::setServiceType(AudioServiceType serviceType) {
+    serviceType_ = serviceType;
+    serviceName_ = ZRReportingUtilityGenerateServiceNameFromServiceType(serviceType);
+    log::info(ZRReportingSessionCategory(), "setting service type {}", serviceName_);
+}
+
+void ZRReportingSession::updateConfigurationWithContentsOfConfiguration(const Dictionary& configuration) {
+    if (const Value* name = configuration.find(ZRReportingMessageQVHostApplicationDisplayID)) {
+        configuration_.set(ZRReportingApplicationName, *name);
+    }
+    configuration_.merge(configuration);
+    appName_ = ZRReportingUtilityRetrieveAppName(configuration_);
+}
+
+std::unique_lock<std::recursive_mutex> ZRReportingSession::monitor() {
+    return isSingleMessageSession_ ? std::unique_lock(mutex_) : std::unique_lock<std::recursive_mutex>();
+}
+
+void ZRReportingSession::start() {
+    const auto held = monitor();
+    recordOwnMessage(AudioEventTypeStart, "start");
+    log::info(ZRReportingSessionCategory(), "start called. reporterID={}", reporterID_);
+    if (started_) {
+        log::info(ZRReportingSessionCategory(), "{} is already started", reporterID_);
+        return;
+    }
+    log::debug(ZRReportingSessionCategory(), "self.started==false. starting. reporterID={}", reporterID_);
+    started_ = true;
+    emitTracePoint(TraceEvent::sessionStarted);
+    startWorkersFromClasses(workerClassLists().valid);
+}
+
+void ZRReportingSession::stop() {
+    const auto held = monitor();
+    recordOwnMessage(AudioEventTypeStop, "stop");
+    log::debug(ZRReportingSessionCategory(), "stop called. reporterID={}", reporterID_);
+    if (!started_) {
+        return;
+    }
+    log::debug(ZRReportingSessionCategory(), "ending session. reporterID={}", reporterID_);
+    emitTracePoint(TraceEvent::sessionStopped);
+    if (ZRReportingSessionMessage::sortMessages(messages_)) {
+        lastMessages_.rebuild(messages_);
+    }
+    for (const Worker& worker :
+         inOrder(producingMessageWorkers_, consumingMessageWorkers_, messageWorkers_)) {
+        if (worker.instance->started()) {
+            worker.instance->stop();
+            worker.instance->setStarted(false);
+            log::debug(ZRReportingSessionCategory(),
+                       "ZRReportingSessionWorker action=stop worker={} reporterID={}", *worker.workerClass,
+                       reporterID_);
+        }
+    }
+    lastMessages_.clear();
+    std::vector<MessageRef>().swap(messages_);
+    totalMessageCount_ = 0;
+    started_ = false;
+}
+
+void ZRReportingSession::recordOwnMessage(AudioEventType type, std::string_view method) {
+    const std::string suffix = "_at_" + std::string(method);
+    const std::size_t count = messages_.size();
+    Dictionary payload{
+        {"method", method},
+        {"messages" + suffix, static_cast<std::int64_t>(count)},
+        {"unique_messages" + suffix, static_cast<std::uint64_t>(count)},
+        {"reporterid", reporterID_},
+        {"running" + suffix, yesOrNo(started_)},
+    };
+    auto message = std::make_shared<ZRReportingSessionMessage>(std::move(payload), AudioEventKindSetup, type);
+    addMissingDates(*message, platform().clock.now());
+    addAudioMessageTag(*message);
+    record(std::move(message));
+}
+
+void ZRReportingSession::record(MessageRef message) {
+    lastMessages_.add(*message);
+    messages_.push_back(std::move(message));
+}
+
+void ZRReportingSession::sendMessage(MessageRef message, ErrorReply reply) {
+    const auto held = monitor();
+    ++totalMessageCount_;
+    normalise(*message);
+    emitTracePoint(TraceEvent::sessionMessage);
+    message->isSessionStarted = started_;
+    message->isRedundant = messageIsRedundant(*message);
+    log::debug(ZRReportingSessionCategory(),
+               "ZRReportingSessionWorker action=sendMessage reporterID={} app={} redundant={} message={}",
+               reporterID_, appName_, yesOrNo(message->isRedundant), message->payload());
+    previousValues_.merge(message->payload());
+    if (!message->isRedundant) {
+        record(message);
+    }
+    deliver(message);
+    if (reply) {
+        reply(nullptr);
+    }
+}
+
+void ZRReportingSession::normalise(ZRReportingSessionMessage& message) const {
+    const WallTime now = platform().clock.now();
+    message.editPayload([&](Dictionary& payload) {
+        intake::addMissingDates(payload, now);
+        intake::removeWhiteSpaceFromKeys(payload);
+        intake::addAudioMessageTag(payload, message.category(), message.type());
+        intake::addAppName(payload, appName_);
+    });
+}
+
+void ZRReportingSession::deliver(const MessageRef& message) {
+    for (const Worker& worker : consumingMessageWorkers_) {
+        if (!worker.consumer->started() ||
+            (message->isRedundant && !worker.consumer->handleRedundantMessages()) ||
+            !message->isFor(*worker.workerClass)) {
+            continue;
+        }
+        worker.consumer->handleMessage(message);
+        log::debug(ZRReportingSessionCategory(),
+                   "ZRReportingSessionWorker action=handleMessage worker={} reporterID={}",
+                   *worker.workerClass, reporterID_);
+    }
+}
+
+std::string ZRReportingSession::description() const {
+    std::string text;
+    appendText(text, *this);
+    return text;
+}
+
+void ZRReportingSession::addMissingDates(ZRReportingSessionMessage& message, WallTime now) {
+    message.editPayload([now](Dictionary& payload) { intake::addMissingDates(payload, now); });
+}
+
+void ZRReportingSession::removeWhiteSpaceFromKeys(ZRReportingSessionMessage& message) {
+    message.editPayload(intake::removeWhiteSpaceFromKeys);
+}
+
+void ZRReportingSession::addAudioMessageTag(ZRReportingSessionMessage& message) {
+    message.editPayload([&message](Dictionary& payload) {
+        intake::addAudioMessageTag(payload, message.category(), message.type());
+    });
+}
+
+void ZRReportingSession::addAppName(ZRReportingSessionMessage& message) const {
+    message.editPayload([this](Dictionary& payload) { intake::addAppName(payload, appName_); });
+}
+
+bool ZRReportingSession::messageIsRedundant(const ZRReportingSessionMessage& message) const {
+    // Errors are all kept: of the type, and of the kind without a subsystem. A subsystem's errors are
+    // compared.
+    if (message.type() == AudioEventTypeError || message.category() == AudioEventKindError) {
+        return false;
+    }
+    const ZRReportingSessionMessage* last = lastMessages_.find(message.category(), message.type());
+    if (last == nullptr || !intake::isRepetition(last->payload(), message.payload())) {
+        return false;
+    }
+    log::debug(ZRReportingSessionCategory(), "marking event redundant");
+    return true;
+}
+
+double ZRReportingSession::getEpochTimeFromZRReportingStateMessage(
+    const ZRReportingSessionMessage& message) noexcept {
+    return intake::epochTime(message.payload());
+}
+
+void appendText(std::string& out, const ZRReportingSession& session) {
+    const std::vector<pid_t>& owners = session.processIdentifiers();
+    appendFormatted(
+        out,
+        "reporterID={},serviceName={},ownerPid={},clientProcessName={},HostApplicationDisplayID={},"
+        "started={},singleMessageSession={}",
+        session.reporterID(), session.serviceName(), owners.empty() ? pid_t{0} : owners.front(),
+        session.clientProcessName() ? std::string_view(*session.clientProcessName()) : "(null)",
+        ZRReportingUtilityRetrieveAppName(session.configuration()), session.started(),
+        session.isSingleMessageSession());
+}
+
+void appendText(std::string& out, const SessionList& list) {
+    out += '[';
+    std::string_view separator;
+    for (const std::shared_ptr<ZRReportingSession>& session : list.sessions) {
+        out += separator;
+        separator = ", ";
+        appendText(out, *session);
+    }
+    out += ']';
+}
+
+} // namespace tamblo

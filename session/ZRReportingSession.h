@@ -1,0 +1,151 @@
+#pragma once
+
+#include "base/Dictionary.h"
+#include "platform/Clock.h"
+#include "platform/ZRReportingServiceProtocol.h"
+#include "session/LastMessageIndex.h"
+#include "session/WorkerClass.h"
+#include "session/ZRReportingSessionMessage.h"
+#include "session/ZRReportingSessionWorkerProtocol.h"
+#include "util/AudioEvents.h"
+
+#include <cstdint>
+#include <memory>
+#include <mutex>
+#include <optional>
+#include <span>
+#include <string>
+#include <string_view>
+#include <vector>
+
+#include <sys/types.h>
+
+namespace tamblo {
+
+/// One reporter's session: its identity, service type and configuration, the messages accepted since its
+/// start, and one worker of each applicable class.
+///
+/// Owned by a client instance, the single-message session by the service. Created (the start-on-init workers
+/// run) → started (all workers run) → stopped (messages emptied, workers kept) → started again …; letting it
+/// go stops nothing. Used on the reporting server queue alone, except the single-message session, which the
+/// reaper's thread stops: that one locks itself, recursively, as producers send from its stop.
+class ZRReportingSession : public std::enable_shared_from_this<ZRReportingSession> {
+    struct Created {
+        explicit Created() = default;
+    };
+
+public:
+    /// A session whose start-on-init workers are made and started.
+    [[nodiscard]] static std::shared_ptr<ZRReportingSession>
+    initWithID(ReporterID reporterID, std::vector<pid_t> processIdentifiers);
+    ZRReportingSession(Created, ReporterID reporterID, std::vector<pid_t> processIdentifiers);
+    ~ZRReportingSession();
+    ZRReportingSession(const ZRReportingSession&) = delete;
+    ZRReportingSession& operator=(const ZRReportingSession&) = delete;
+
+    [[nodiscard]] static std::span<const WorkerClass> getAllWorkerClasses() { return workerClassList(); }
+
+    void setServiceType(AudioServiceType serviceType);
+    /// Before the session is shared with another thread.
+    void setIsSingleMessageSession(bool isSingle) noexcept { isSingleMessageSession_ = isSingle; }
+    void setClientProcessName(std::optional<std::string> name) { clientProcessName_ = std::move(name); }
+    /// Adds the entries to the configuration, which is never replaced.
+    void updateConfigurationWithContentsOfConfiguration(const Dictionary& configuration);
+    void addPreviousValues(const Dictionary& values) { previousValues_.merge(values); }
+
+    void start();
+    /// Normalises the message, records it unless it is redundant, and offers it to the consumer workers,
+    /// whether or not the session is started. May be called by a worker in its `stop`.
+    void sendMessage(MessageRef message, ErrorReply reply = {});
+    void stop();
+
+    /// The start reply that waits for the stop; empty when none does.
+    void setTransactionCompleteBlock(BooleanReply reply) { transactionCompleteBlock_ = std::move(reply); }
+    [[nodiscard]] BooleanReply takeTransactionCompleteBlock() noexcept {
+        return std::move(transactionCompleteBlock_);
+    }
+
+    [[nodiscard]] bool started() const noexcept { return started_; }
+    [[nodiscard]] bool isSingleMessageSession() const noexcept { return isSingleMessageSession_; }
+    [[nodiscard]] AudioServiceType serviceType() const noexcept { return serviceType_; }
+    [[nodiscard]] std::string_view serviceName() const noexcept { return serviceName_; }
+    [[nodiscard]] const Dictionary& configuration() const noexcept { return configuration_; }
+    [[nodiscard]] ReporterID reporterID() const noexcept { return reporterID_; }
+    [[nodiscard]] const std::vector<pid_t>& processIdentifiers() const noexcept {
+        return processIdentifiers_;
+    }
+    [[nodiscard]] const std::optional<std::string>& clientProcessName() const noexcept {
+        return clientProcessName_;
+    }
+    /// In arrival order, from the stop on in the order of their timestamps.
+    [[nodiscard]] const std::vector<MessageRef>& messages() const noexcept { return messages_; }
+    [[nodiscard]] const Dictionary& previousValues() const noexcept { return previousValues_; }
+    [[nodiscard]] std::int64_t totalMessageCount() const noexcept { return totalMessageCount_; }
+    [[nodiscard]] std::size_t workerInstanceCount() const noexcept { return messageWorkers_.size(); }
+    [[nodiscard]] std::string description() const;
+
+    static void addMissingDates(ZRReportingSessionMessage& message, WallTime now);
+    static void removeWhiteSpaceFromKeys(ZRReportingSessionMessage& message);
+    static void addAudioMessageTag(ZRReportingSessionMessage& message);
+    void addAppName(ZRReportingSessionMessage& message) const;
+    /// Whether the message says, times aside, what the last accepted one of its category and type said.
+    [[nodiscard]] bool messageIsRedundant(const ZRReportingSessionMessage& message) const;
+    [[nodiscard]] static double
+    getEpochTimeFromZRReportingStateMessage(const ZRReportingSessionMessage& message) noexcept;
+
+private:
+    struct Worker {
+        const WorkerClass* workerClass;
+        std::shared_ptr<ZRReportingSessionWorkerProtocol> instance;
+        /// The same worker, for the consumers among them.
+        ZRReportingSessionWorkerConsumerProtocol* consumer;
+    };
+    using Workers = std::vector<Worker>;
+
+    /// Held by the single-message session's operations; nothing for any other session.
+    [[nodiscard]] std::unique_lock<std::recursive_mutex> monitor();
+    void startWorkersFromClasses(std::span<const WorkerClass* const> classes);
+    void makeWorker(const WorkerClass& workerClass);
+    [[nodiscard]] bool hasWorkerOf(const WorkerClass& workerClass) const noexcept;
+    void startWorker(const Worker& worker);
+    /// The workers of three lists, each worker once.
+    [[nodiscard]] static Workers inOrder(const Workers& first, const Workers& second, const Workers& third);
+    /// Records a message of the session's own, which no worker is offered.
+    void recordOwnMessage(AudioEventType type, std::string_view method);
+    void record(MessageRef message);
+    void normalise(ZRReportingSessionMessage& message) const;
+    void deliver(const MessageRef& message);
+
+    const ReporterID reporterID_;
+    const std::vector<pid_t> processIdentifiers_;
+    bool started_ = false;
+    bool isSingleMessageSession_ = false;
+    AudioServiceType serviceType_ = AudioServiceTypeUnknown;
+    std::string_view serviceName_ = ZRReportingServiceNameUnknown;
+    std::optional<std::string> clientProcessName_;
+    Dictionary configuration_;
+    /// What the configuration names as the application; payloads share it.
+    Value appName_;
+    BooleanReply transactionCompleteBlock_;
+
+    std::vector<MessageRef> messages_;
+    LastMessageIndex lastMessages_;
+    Dictionary previousValues_;
+    std::int64_t totalMessageCount_ = 0;
+
+    Workers messageWorkers_;
+    Workers consumingMessageWorkers_;
+    Workers producingMessageWorkers_;
+
+    std::recursive_mutex mutex_;
+};
+
+void appendText(std::string& out, const ZRReportingSession& session);
+
+/// Several sessions in a log line: "[first, second]".
+struct SessionList {
+    std::span<const std::shared_ptr<ZRReportingSession>> sessions;
+};
+void appendText(std::string& out, const SessionList& list);
+
+} // namespace tamblo

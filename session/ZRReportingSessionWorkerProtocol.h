@@ -1,0 +1,58 @@
+#pragma once
+
+#include "session/ZRReportingSessionMessage.h"
+
+#include <memory>
+#include <optional>
+#include <utility>
+
+namespace tamblo {
+
+class ZRReportingSession;
+
+/// One worker of one session. Made by its class's factory, owned by the session, and called on the thread
+/// that does the session's work (the reporting server queue, or the reaper's thread for the single-message
+/// session's stop). It holds its session weakly; a session may go without having been stopped, so whatever a
+/// worker registers elsewhere ends with the worker.
+class ZRReportingSessionWorkerProtocol {
+public:
+    explicit ZRReportingSessionWorkerProtocol(std::weak_ptr<ZRReportingSession> session)
+        : session_(std::move(session)) {}
+    virtual ~ZRReportingSessionWorkerProtocol() = default;
+    ZRReportingSessionWorkerProtocol(const ZRReportingSessionWorkerProtocol&) = delete;
+    ZRReportingSessionWorkerProtocol& operator=(const ZRReportingSessionWorkerProtocol&) = delete;
+
+    /// Null once the session is gone.
+    [[nodiscard]] std::shared_ptr<ZRReportingSession> session() const noexcept { return session_.lock(); }
+    void setSession(std::weak_ptr<ZRReportingSession> session) noexcept { session_ = std::move(session); }
+    /// Set by the session around `start` and `stop`.
+    [[nodiscard]] bool started() const noexcept { return started_; }
+    void setStarted(bool started) noexcept { started_ = started; }
+
+    /// Whether the worker is started now; nothing from a worker that has nothing to do at its start, which
+    /// then is.
+    virtual std::optional<bool> start() { return std::nullopt; }
+    /// Called only while started. A producer sends its derived messages from here, through the session.
+    virtual void stop() {}
+
+private:
+    std::weak_ptr<ZRReportingSession> session_;
+    bool started_ = false;
+};
+
+/// A producer derives messages and sends them through its session; that is a matter of its class's role
+/// alone.
+using ZRReportingSessionWorkerProducerProtocol = ZRReportingSessionWorkerProtocol;
+
+/// A worker that is offered the session's messages.
+class ZRReportingSessionWorkerConsumerProtocol : public ZRReportingSessionWorkerProtocol {
+public:
+    using ZRReportingSessionWorkerProtocol::ZRReportingSessionWorkerProtocol;
+
+    /// One message, which other workers share. What goes wrong with it is the worker's own to log.
+    virtual void handleMessage(const MessageRef& message) = 0;
+    /// Whether messages that repeat the last one are offered, too.
+    [[nodiscard]] virtual bool handleRedundantMessages() const { return false; }
+};
+
+} // namespace tamblo

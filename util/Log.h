@@ -1,0 +1,72 @@
+#pragma once
+
+#include "base/Format.h"
+#include "util/LogCategories.h"
+#include "util/LogText.h"
+
+#include <source_location>
+#include <string>
+#include <string_view>
+#include <type_traits>
+
+/// One function per level. A line is the prefix, "%25s:%-5d " of the source unit's name and the line number,
+/// and the formatted text. Arguments become text only when the level is on for the category.
+namespace tamblo::log {
+
+namespace detail {
+
+void appendPrefix(std::string& line, const std::source_location& place);
+void write(const LogCategory& category, LogLevel level, std::string_view line) noexcept;
+
+template <typename... Arguments>
+[[gnu::noinline, gnu::cold]] void writeLine(const LogCategory& category, LogLevel level,
+                                            const FormatString<std::type_identity_t<Arguments>...>& format,
+                                            const Arguments&... arguments) {
+    std::string line;
+    appendPrefix(line, format.location);
+    appendFormatted(line, format.format, arguments...);
+    write(category, level, line);
+}
+
+template <typename... Arguments>
+void at(LogLevel level, const LogCategory& category,
+        const FormatString<std::type_identity_t<Arguments>...>& format, const Arguments&... arguments) {
+    if (category.isOn(level)) [[unlikely]] {
+        writeLine<Arguments...>(category, level, format, arguments...);
+    }
+}
+
+} // namespace detail
+
+template <typename... Arguments>
+void debug(const LogCategory& category, FormatString<std::type_identity_t<Arguments>...> format,
+           const Arguments&... arguments) {
+    detail::at<Arguments...>(LogLevel::debug, category, format, arguments...);
+}
+
+template <typename... Arguments>
+void info(const LogCategory& category, FormatString<std::type_identity_t<Arguments>...> format,
+          const Arguments&... arguments) {
+    detail::at<Arguments...>(LogLevel::info, category, format, arguments...);
+}
+
+/// The default level.
+template <typename... Arguments>
+void standard(const LogCategory& category, FormatString<std::type_identity_t<Arguments>...> format,
+              const Arguments&... arguments) {
+    detail::at<Arguments...>(LogLevel::standard, category, format, arguments...);
+}
+
+template <typename... Arguments>
+void error(const LogCategory& category, FormatString<std::type_identity_t<Arguments>...> format,
+           const Arguments&... arguments) {
+    detail::at<Arguments...>(LogLevel::error, category, format, arguments...);
+}
+
+template <typename... Arguments>
+void fault(const LogCategory& category, FormatString<std::type_identity_t<Arguments>...> format,
+           const Arguments&... arguments) {
+    detail::at<Arguments...>(LogLevel::fault, category, format, arguments...);
+}
+
+} // namespace tamblo::log

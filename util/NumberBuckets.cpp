@@ -1,0 +1,50 @@
+#include "util/NumberBuckets.h"
+
+#include "base/Format.h"
+
+#include <algorithm>
+#include <cmath>
+#include <cstddef>
+
+namespace tamblo {
+
+namespace {
+
+/// More digits than a double tells apart say nothing.
+constexpr unsigned kMostFractionDigits = 60;
+
+std::string bucketText(double bucket, unsigned fractionDigits) {
+    const unsigned digits = std::min(fractionDigits, kMostFractionDigits);
+    std::string text = formatted("{}", fixed(bucket, static_cast<int>(digits)));
+    const std::size_t point = text.find('.');
+    if (point == std::string::npos) {
+        return text;
+    }
+    while (text.back() == '0' && text.size() > point + 2) {
+        text.pop_back();
+    }
+    return text;
+}
+
+} // namespace
+
+std::optional<std::string> ZRReportingUtilityBucketNumberToString(double value,
+                                                                  std::span<const double> buckets,
+                                                                  unsigned fractionDigits) {
+    std::optional<double> best;
+    double bestDistance = 0;
+    for (const double bucket : buckets) {
+        const double distance = std::fabs(value - bucket);
+        if (best && distance > bestDistance) {
+            break;
+        }
+        best = bucket;
+        bestDistance = distance;
+    }
+    if (!best) {
+        return std::nullopt;
+    }
+    return bucketText(*best, fractionDigits);
+}
+
+} // namespace tamblo

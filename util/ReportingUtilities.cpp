@@ -1,0 +1,50 @@
+#include "util/ReportingUtilities.h"
+
+#include "platform/Platform.h"
+#include "util/MessageKeys.h"
+
+#include <algorithm>
+#include <cmath>
+#include <limits>
+
+namespace tamblo {
+
+namespace {
+
+/// Payloads carry these figures as 32-bit integers.
+int roundedTo32Bits(double number) noexcept {
+    constexpr double kLeast = std::numeric_limits<int>::min();
+    constexpr double kMost = std::numeric_limits<int>::max();
+    return static_cast<int>(std::clamp(std::round(number), kLeast, kMost));
+}
+
+} // namespace
+
+bool ZRReportingUtilityKeyIsPresentAndHasChanged(std::string_view key, const Dictionary* first,
+                                                 const Dictionary* second) noexcept {
+    if (first == nullptr || second == nullptr) {
+        return false;
+    }
+    const Value* before = first->find(key);
+    const Value* after = second->find(key);
+    return before != nullptr && after != nullptr && !(*before == *after);
+}
+
+double ZRReportingUtilityRoundWithPlaces(double value, int places) noexcept {
+    const double scale = std::pow(10.0, places);
+    return std::round(value * scale) / scale;
+}
+
+Dictionary ZRReportingUtilityAddDates(const Dictionary& message) {
+    constexpr float kTicksPerSecond = 1'000'000;
+    const Platform& device = platform();
+    const float ticks = static_cast<float>(device.processInformation.processorTime().count());
+    Dictionary dated = message;
+    dated.set(ZRReportingInternalEventEpochTime, secondsSince1970(device.clock.now()));
+    dated.set(ZRReportingInternalEventSystemUptimeSec,
+              roundedTo32Bits(device.processInformation.systemUptime().count()));
+    dated.set(ZRReportingInternalEventProcessUptimeMS, roundedTo32Bits(ticks / kTicksPerSecond * 1000.0F));
+    return dated;
+}
+
+} // namespace tamblo
