@@ -36,7 +36,11 @@ AppendOnlyFile::AppendOnlyFile(std::string path, std::string_view categoryCode, 
 
 AppendOnlyFile::AppendOnlyFile(std::string path, std::string_view categoryCode, StructuredLog& log,
                                FileOperations& operations, Limits limits)
-    : path_(std::move(path)), categoryCode_(categoryCode), limits_(limits), log_(log), operations_(operations) {
+    : path_(std::move(path)),
+      categoryCode_(categoryCode),
+      limits_(limits),
+      log_(log),
+      operations_(operations) {
     // What fails here fails again with the first line, and is told then.
     static_cast<void>(openFile(0));
 }
@@ -65,8 +69,9 @@ void AppendOnlyFile::writeOut() {
         }
     } else {
         if (!std::exchange(isOut_, true)) {
-            log_.write(LogLevel::error, categoryCode_,
-                       formatted("{}: {}; its records are lost until it can be written again", path_, fault_));
+            log_.write(
+                LogLevel::error, categoryCode_,
+                formatted("{}: {}; its records are lost until it can be written again", path_, fault_));
         }
         lostLines_ += countLines(lines);
     }
@@ -137,8 +142,8 @@ bool AppendOnlyFile::writeFully(std::string_view& lines, std::size_t length) {
     return true;
 }
 
-/// Takes back the part of a line that was written last. If that fails too, the line is cut off when the file is
-/// opened again, which is the next thing that happens to it.
+/// Takes back the part of a line that was written last. If that fails too, the line is cut off when the file
+/// is opened again, which is the next thing that happens to it.
 void AppendOnlyFile::cutTornLine(std::size_t tornBytes) noexcept {
     struct stat status {};
     if (tornBytes != 0 && operations_.status(descriptor_, status) == 0 &&
@@ -149,12 +154,18 @@ void AppendOnlyFile::cutTornLine(std::size_t tornBytes) noexcept {
 }
 
 /// Whether the path still leads to the file that is open; takes in its size, in case somebody shortened it.
+/// Looking the path up costs more than a small write: between two ticks of the clock, which a rename may take
+/// to be noticed, it is enough that the file has a name at all, since then no line is lost.
 bool AppendOnlyFile::isStillInPlace() noexcept {
     if (descriptor_ < 0) {
         return false;
     }
     struct stat status {};
-    if (operations_.status(path_.c_str(), status) != 0 || status.st_ino != inode_ || status.st_dev != device_) {
+    const std::chrono::nanoseconds now = operations_.coarseTime();
+    const bool isRecent = std::exchange(pathCheckedAt_, now) == now;
+    const int result =
+        isRecent ? operations_.status(descriptor_, status) : operations_.status(path_.c_str(), status);
+    if (result != 0 || status.st_nlink == 0 || status.st_ino != inode_ || status.st_dev != device_) {
         return false;
     }
     size_ = static_cast<std::uint64_t>(status.st_size);
@@ -227,8 +238,8 @@ bool AppendOnlyFile::findEndOfLastLine(int descriptor, std::uint64_t& end) {
     return true;
 }
 
-/// Moves the file out of the way. Earlier files move up only as far as the first free number, so that a rotation
-/// that fails half-way and is tried again pushes none of them out.
+/// Moves the file out of the way. Earlier files move up only as far as the first free number, so that a
+/// rotation that fails half-way and is tried again pushes none of them out.
 bool AppendOnlyFile::rotate() {
     const auto numbered = [this](int number) {
         return number == 0 ? path_ : formatted("{}.{}", path_, number);

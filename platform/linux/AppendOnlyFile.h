@@ -4,6 +4,7 @@
 #include "platform/StructuredLog.h"
 #include "platform/linux/FileOperations.h"
 
+#include <chrono>
 #include <cstddef>
 #include <cstdint>
 #include <mutex>
@@ -14,15 +15,15 @@ namespace tamblo {
 
 /// A sink: a file of lines that only grows.
 ///
-/// Lines are formatted straight into a buffer and written out together by `flush`, with one system call as a rule,
-/// or by themselves once enough of them wait. Any thread may append and flush; both take a lock, and only writing
-/// blocks on the disk. Owned by the platform service whose records it keeps; what waits is written when it is
-/// destroyed.
+/// Lines are formatted straight into a buffer and written out together by `flush`, with one system call as a
+/// rule, or by themselves once enough of them wait. Any thread may append and flush; both take a lock, and
+/// only writing blocks on the disk. Owned by the platform service whose records it keeps; what waits is
+/// written when it is destroyed.
 ///
-/// What the file holds are whole lines, each once, whatever fails: a line that was torn (by a full disk now, or by a
-/// crash before) is cut off before anything follows it. Lines that cannot be written are lost and counted; an outage
-/// is one error line when it begins and one when it ends. Every flush tries again, from opening the file on, so a
-/// file that was removed, renamed or made unwritable by others costs at most the lines of one flush.
+/// What the file holds are whole lines, each once, whatever fails: a line that was torn (by a full disk now,
+/// or by a crash before) is cut off before anything follows it. Lines that cannot be written are lost and
+/// counted; an outage is one error line when it begins and one when it ends. Every flush tries again, from
+/// opening the file on. A file that others remove or rename is begun anew.
 class AppendOnlyFile {
 public:
     struct Limits {
@@ -34,18 +35,18 @@ public:
     /// How many earlier files are kept, as NAME.1 (the latest) to NAME.4.
     static constexpr int kKeptFiles = 4;
 
-    /// Cuts off a torn last line if the file exists; creates it with the first line. Failures are reported in the
-    /// log, under the category code, which must be a constant. Log and operations must outlive the file.
+    /// Cuts off a torn last line if the file exists; creates it with the first line. Failures are reported in
+    /// the log, under the category code, which must be a constant. Log and operations must outlive the file.
     AppendOnlyFile(std::string path, std::string_view categoryCode, StructuredLog& log,
                    FileOperations& operations = FileOperations::system());
-    AppendOnlyFile(std::string path, std::string_view categoryCode, StructuredLog& log, FileOperations& operations,
-                   Limits limits);
+    AppendOnlyFile(std::string path, std::string_view categoryCode, StructuredLog& log,
+                   FileOperations& operations, Limits limits);
     ~AppendOnlyFile();
     AppendOnlyFile(const AppendOnlyFile&) = delete;
     AppendOnlyFile& operator=(const AppendOnlyFile&) = delete;
 
-    /// Adds one line. `format` is called at once, with the lock held, and appends the line to the `TextBuffer&` that
-    /// it is given, without a line end, touching nothing of what stands there already.
+    /// Adds one line. `format` is called at once, with the lock held, and appends the line to the
+    /// `TextBuffer&` that it is given, without a line end, touching nothing of what stands there already.
     template <typename Format> void append(Format&& format) {
         const std::lock_guard lock(mutex_);
         OpenLine line(*this);
@@ -111,6 +112,7 @@ private:
     std::uint64_t size_ = 0;
     dev_t device_ = 0;
     ino_t inode_ = 0;
+    std::chrono::nanoseconds pathCheckedAt_{0}; ///< on the coarse clock
     bool isOut_ = false;
     std::uint64_t lostLines_ = 0;
     std::string fault_;

@@ -110,8 +110,9 @@ std::variant<Directories, std::string> Directories::find(const Environment& envi
     for (const Root& root : kRoots) {
         std::optional<std::string> place = placeOf(root, environment);
         if (!place) {
-            return formatted("there is no place for the {} directory: set {} to a directory, or {} to its parent",
-                             root.what, root.variable, root.userVariable);
+            return formatted(
+                "there is no place for the {} directory: set {} to a directory, or {} to its parent",
+                root.what, root.variable, root.userVariable);
         }
         directories.*root.directory = std::move(*place);
     }
@@ -128,13 +129,14 @@ std::variant<Directories, std::string> Directories::prepare(const Environment& e
         const std::string& path = directories->*root.directory;
         const int failure = createDirectory(path);
         if (failure != 0) {
-            return formatted("cannot create the {} directory {}: {}; create it, or set {} to a directory that can be "
-                             "used",
-                             root.what, path, std::generic_category().message(failure), root.variable);
+            return formatted(
+                "cannot create the {} directory {}: {}; create it, or set {} to a directory that can be "
+                "used",
+                root.what, path, std::generic_category().message(failure), root.variable);
         }
     }
-    for (const std::string& path : {directories->notifications(), directories->driverChannels(),
-                                    directories->preferences()}) {
+    for (const std::string& path :
+         {directories->notifications(), directories->driverChannels(), directories->preferences()}) {
         // Without it what it would hold is absent, as it is without a file in it.
         static_cast<void>(createDirectory(path));
     }

@@ -9,8 +9,8 @@ namespace tamblo {
 
 /// The directories that the service lives in: its three roots and what lies at fixed places below them.
 ///
-/// The roots come from the variables that systemd sets for a unit, or, without them, from where such files are kept
-/// for the system or for one user. Found once, at the start; plain values from then on.
+/// The roots come from the variables that systemd sets for a unit, or, without them, from where such files
+/// are kept for the system or for one user. Found once, at the start; plain values from then on.
 struct Directories {
     std::string runtime;
     std::string configuration;
@@ -36,9 +36,9 @@ struct Directories {
 
     /// The three roots, without touching the file system, or a line that says what is missing and what to do.
     [[nodiscard]] static std::variant<Directories, std::string> find(const Environment& environment);
-    /// Finds the roots and creates them where they are missing, mode 0700, parents included; the directories below
-    /// them that others put files into are created too where that is possible. A root that cannot be had is a
-    /// failure, told in a line that says what to do; one that exists but cannot be written is not.
+    /// Finds the roots and creates them where they are missing, mode 0700, parents included; the directories
+    /// below them that others put files into are created too where that is possible. A root that cannot be
+    /// had is a failure, told in a line that says what to do; one that exists but cannot be written is not.
     [[nodiscard]] static std::variant<Directories, std::string>
     prepare(const Environment& environment = Environment::ofThisProcess());
 };

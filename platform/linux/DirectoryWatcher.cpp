@@ -11,11 +11,12 @@ namespace tamblo {
 
 namespace {
 
-constexpr std::uint32_t kFilesMask = IN_CLOSE_WRITE | IN_MOVED_TO | IN_MOVED_FROM | IN_DELETE | IN_DELETE_SELF |
-                                     IN_MOVE_SELF | IN_ONLYDIR | IN_EXCL_UNLINK;
+constexpr std::uint32_t kFilesMask = IN_CLOSE_WRITE | IN_MOVED_TO | IN_MOVED_FROM | IN_DELETE |
+                                     IN_DELETE_SELF | IN_MOVE_SELF | IN_ONLYDIR | IN_EXCL_UNLINK;
 constexpr std::uint32_t kParentMask =
     IN_CREATE | IN_MOVED_TO | IN_MOVED_FROM | IN_DELETE | IN_DELETE_SELF | IN_MOVE_SELF | IN_ONLYDIR;
-/// Bounds one call in case files are written faster than they are told of; what is left keeps the descriptor ready.
+/// Bounds one call in case files are written faster than they are told of; what is left keeps the descriptor
+/// ready.
 constexpr int kMaximumReads = 256;
 
 std::string parentOf(const std::string& path) {
@@ -41,9 +42,9 @@ DirectoryWatcher::DirectoryWatcher(std::string directory)
     }
 }
 
-/// The parent comes first: whatever happens to the directory after that is told by an event, so that none is missed
-/// between the two. It stays watched beside the directory, since the kernel tells of a directory's own end only when
-/// nobody uses it any longer.
+/// The parent comes first: whatever happens to the directory after that is told by an event, so that none is
+/// missed between the two. It stays watched beside the directory, since the kernel tells of a directory's own
+/// end only when nobody uses it any longer.
 void DirectoryWatcher::watch() {
     replaceWatch(parentWatch_, watchNearestParent());
     const int parentError = errno;

@@ -14,12 +14,13 @@ namespace tamblo {
 /// Notices files of one directory whose writing has finished, and files that went away.
 ///
 /// One descriptor for an event loop: when it is readable, `read` takes in what happened. The directory may be
-/// missing at first, vanish, or be replaced: then its nearest existing parent is watched until it is there again.
-/// Owned by whoever wants to know; `read` is called by one thread at a time. Without activity it costs nothing.
+/// missing at first, vanish, or be replaced: then its nearest existing parent is watched until it is there
+/// again. Owned by whoever wants to know; `read` is called by one thread at a time. Without activity it costs
+/// nothing.
 class DirectoryWatcher {
 public:
-    /// Called with the name of a file that was written, replaced or removed, or with nothing when any file may have
-    /// been: the directory has come or gone, or more happened than the kernel could remember.
+    /// Called with the name of a file that was written, replaced or removed, or with nothing when any file
+    /// may have been: the directory has come or gone, or more happened than the kernel could remember.
     using Handler = std::function<void(std::optional<std::string_view> fileName)>;
 
     explicit DirectoryWatcher(std::string directory);

@@ -18,8 +18,8 @@ std::uint64_t load(const char* bytes) noexcept {
     return word;
 }
 
-/// Names differ in their last words: the product, the category and the type. Those three dozen bytes and the length
-/// tell them apart well; names that agree in them merely share a place to begin looking.
+/// Names differ in their last words: the product, the category and the type. Those three dozen bytes and the
+/// length tell them apart well; names that agree in them merely share a place to begin looking.
 std::size_t hashOf(std::string_view name) noexcept {
     constexpr std::uint64_t kFactor = 0x9E3779B97F4A7C15U;
     std::uint64_t hash = name.size() * kFactor;
@@ -73,8 +73,8 @@ bool EventsInUse::contains(std::string_view eventName) {
     return workOut(eventName, slot, generation);
 }
 
-/// Answers for a name that is not remembered, or was answered for other preferences. The search goes on from the
-/// slot where it stopped: another thread may have filled it meanwhile.
+/// Answers for a name that is not remembered, or was answered for other preferences. The search goes on from
+/// the slot where it stopped: another thread may have filled it meanwhile.
 bool EventsInUse::workOut(std::string_view eventName, std::size_t slot, std::uint64_t generation) {
     const std::lock_guard lock(mutex_);
     if (generation > patternsGeneration_) {

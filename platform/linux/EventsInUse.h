@@ -15,12 +15,12 @@
 
 namespace tamblo {
 
-/// Answers which analytics events are in use: domain `com.vandra.tamblo.analytics`, key `events_in_use`, an array
-/// of names, each exact or with one trailing `*`; without it all are.
+/// Answers which analytics events are in use: domain `com.vandra.tamblo.analytics`, key `events_in_use`, an
+/// array of names, each exact or with one trailing `*`; without it all are.
 ///
-/// Asked twice for every message, so answers are remembered per name until a preference changes. Remembered names
-/// are never forgotten or moved, which lets any thread look one up without a lock; there is room for far more names
-/// than the service can form, and a name beyond that is merely worked out each time.
+/// Asked twice for every message, so answers are remembered per name until a preference changes. Remembered
+/// names are never forgotten or moved, which lets any thread look one up without a lock; there is room for
+/// far more names than the service can form, and a name beyond that is merely worked out each time.
 class EventsInUse {
 public:
     /// Both must outlive this.
@@ -49,7 +49,7 @@ private:
     std::size_t answers_ = 0;
     std::uint64_t patternsGeneration_ = 0;
     bool allInUse_ = true;
-    std::vector<std::string> names_;    ///< sorted
+    std::vector<std::string> names_; ///< sorted
     std::vector<std::string> prefixes_;
 };
 

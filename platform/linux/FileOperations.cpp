@@ -1,6 +1,7 @@
 #include "platform/linux/FileOperations.h"
 
 #include <cstdio>
+#include <ctime>
 
 #include <fcntl.h>
 #include <unistd.h>
@@ -37,6 +38,12 @@ int FileOperations::status(const char* path, struct stat& status) noexcept {
 
 int FileOperations::rename(const char* from, const char* to) noexcept {
     return ::rename(from, to);
+}
+
+std::chrono::nanoseconds FileOperations::coarseTime() noexcept {
+    timespec time{};
+    ::clock_gettime(CLOCK_MONOTONIC_COARSE, &time);
+    return std::chrono::seconds(time.tv_sec) + std::chrono::nanoseconds(time.tv_nsec);
 }
 
 FileOperations& FileOperations::system() noexcept {

@@ -1,5 +1,6 @@
 #pragma once
 
+#include <chrono>
 #include <cstddef>
 
 #include <sys/stat.h>
@@ -7,8 +8,8 @@
 
 namespace tamblo {
 
-/// The system calls behind a sink file, as they are: -1 and `errno` on failure. A test derives from this class and
-/// makes single ones fail.
+/// The system calls behind a sink file, as they are: -1 and `errno` on failure. A test derives from this
+/// class and makes single ones fail.
 class FileOperations {
 public:
     virtual ~FileOperations() = default;
@@ -20,6 +21,8 @@ public:
     virtual int status(int descriptor, struct stat& status) noexcept;
     virtual int status(const char* path, struct stat& status) noexcept;
     virtual int rename(const char* from, const char* to) noexcept;
+    /// A clock that is cheap to read and advances every few milliseconds.
+    virtual std::chrono::nanoseconds coarseTime() noexcept;
 
     /// The system calls themselves.
     static FileOperations& system() noexcept;

@@ -10,8 +10,9 @@ namespace tamblo {
 
 /// A file that holds one JSON object, written by somebody else: an operator, a test, another program.
 ///
-/// A missing file is no object and no error. One that cannot be read, is not JSON or no object is one error line for
-/// each state of the file that is met, naming the file and the place. Not thread-safe; reading may block on the disk.
+/// A missing file is no object and no error. One that cannot be read, is not JSON or no object is one error
+/// line for each state of the file that is met, naming the file and the place. Not thread-safe; reading may
+/// block on the disk.
 class JsonFile {
 public:
     /// Larger files are refused, unread.

@@ -5,9 +5,10 @@
 namespace tamblo {
 
 LinuxAnalyticsEventService::LinuxAnalyticsEventService(const std::string& logsDirectory, const Clock& clock,
-                                                       const LinuxPreferences& preferences, StructuredLog& log,
-                                                       FileOperations& operations)
-    : clock_(clock), eventsInUse_(preferences, log),
+                                                       const LinuxPreferences& preferences,
+                                                       StructuredLog& log, FileOperations& operations)
+    : clock_(clock),
+      eventsInUse_(preferences, log),
       file_(logsDirectory + "/analytics-events.jsonl", "zrrs", log, operations) {}
 
 bool LinuxAnalyticsEventService::isEventInUse(std::string_view eventName) {

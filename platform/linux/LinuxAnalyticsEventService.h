@@ -20,19 +20,21 @@ namespace tamblo {
 ///
 ///     {"time":1772366400.25,"event":"com.vandra.tamblo.Session_Generic.Summary","payload":{…}}
 ///
-/// Most messages are sent as two events with one payload. Its text is made once: the payload of the last event is
-/// kept until the next flush, and an event whose payload is that very one is given a copy of the text and the time.
+/// Most messages are sent as two events with one payload. Its text is made once: the payload of the last
+/// event is kept until the next flush, and an event whose payload is that very one is given a copy of the
+/// text and the time.
 class LinuxAnalyticsEventService final : public AnalyticsEventService {
 public:
     /// What is referred to must outlive the service.
-    LinuxAnalyticsEventService(const std::string& logsDirectory, const Clock& clock, const LinuxPreferences& preferences,
-                               StructuredLog& log, FileOperations& operations = FileOperations::system());
+    LinuxAnalyticsEventService(const std::string& logsDirectory, const Clock& clock,
+                               const LinuxPreferences& preferences, StructuredLog& log,
+                               FileOperations& operations = FileOperations::system());
 
     [[nodiscard]] bool isEventInUse(std::string_view eventName) override;
     void sendEventLazy(std::string_view eventName, const std::function<Dictionary()>& payload) override;
 
-    /// Writes out the events recorded so far. To be called after each batch of the server queue's work, before its
-    /// replies go.
+    /// Writes out the events recorded so far. To be called after each batch of the server queue's work,
+    /// before its replies go.
     void flush();
 
 private:

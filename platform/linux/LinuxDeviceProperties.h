@@ -15,8 +15,8 @@ namespace tamblo {
 
 /// Device properties from a file that holds one JSON object.
 ///
-/// The file is looked at whenever a property is asked for, which is rarely, and read again when it has changed.
-/// Any thread.
+/// The file is looked at whenever a property is asked for, which is rarely, and read again when it has
+/// changed. Any thread.
 class LinuxDeviceProperties final : public DeviceProperties {
 public:
     /// The log must outlive the properties.

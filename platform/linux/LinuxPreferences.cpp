@@ -34,7 +34,8 @@ void LinuxPreferences::reportUnwatched() {
     }
 }
 
-std::optional<Value> LinuxPreferences::copyPreferenceValue(std::string_view key, std::string_view domain) const {
+std::optional<Value> LinuxPreferences::copyPreferenceValue(std::string_view key,
+                                                           std::string_view domain) const {
     if (!isDomainName(domain)) {
         return std::nullopt;
     }

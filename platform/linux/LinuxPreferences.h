@@ -18,9 +18,10 @@ namespace tamblo {
 
 /// Preferences as files: `<directory>/<domain>.json` holds one object, the domain's values by key.
 ///
-/// A file is read when its domain is first asked for and kept until it changes. Changes are told by the kernel: the
-/// event loop calls `readChanges` when the descriptor is readable, before it handles the sockets of the same
-/// wake-up, so that a preference is in force for every message sent after it was written. Any thread may ask.
+/// A file is read when its domain is first asked for and kept until it changes. Changes are told by the
+/// kernel: the event loop calls `readChanges` when the descriptor is readable, before it handles the sockets
+/// of the same wake-up, so that a preference is in force for every message sent after it was written. Any
+/// thread may ask.
 class LinuxPreferences final : public Preferences {
 public:
     /// The log must outlive the preferences.
@@ -29,12 +30,15 @@ public:
     [[nodiscard]] std::optional<Value> copyPreferenceValue(std::string_view key,
                                                            std::string_view domain) const override;
 
-    /// For the event loop; -1 when changes cannot be noticed (said in the log; files are then read at every request).
+    /// For the event loop; -1 when changes cannot be noticed (said in the log; files are then read at every
+    /// request).
     [[nodiscard]] int fileDescriptor() const noexcept { return watcher_.fileDescriptor(); }
     void readChanges();
-    /// Another number after every change of a preference: what was worked out from preferences holds for as long as
-    /// this stays the same. Never 0. Read it before the preferences themselves.
-    [[nodiscard]] std::uint64_t generation() const noexcept { return generation_.load(std::memory_order_acquire); }
+    /// Another number after every change of a preference: what was worked out from preferences holds for as
+    /// long as this stays the same. Never 0. Read it before the preferences themselves.
+    [[nodiscard]] std::uint64_t generation() const noexcept {
+        return generation_.load(std::memory_order_acquire);
+    }
 
 private:
     struct Domain {

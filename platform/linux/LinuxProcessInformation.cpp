@@ -19,7 +19,8 @@ std::chrono::nanoseconds readClock(clockid_t clock) noexcept {
     return std::chrono::seconds(time.tv_sec) + std::chrono::nanoseconds(time.tv_nsec);
 }
 
-/// The kernel cuts names at 15 bytes, through the middle of a character if need be, and takes any bytes for a name.
+/// The kernel cuts names at 15 bytes, through the middle of a character if need be, and takes any bytes for a
+/// name.
 std::string asUtf8(std::string name) {
     for (std::size_t cut = 0; cut < 4 && cut <= name.size(); ++cut) {
         const std::string_view shorter = std::string_view(name).substr(0, name.size() - cut);

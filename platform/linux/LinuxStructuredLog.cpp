@@ -109,7 +109,8 @@ private:
         case '\t':
             return append("\\t");
         default:
-            const std::array<char, 4> escape{'\\', 'x', kHexDigits[character >> 4U], kHexDigits[character & 0xFU]};
+            const std::array<char, 4> escape{'\\', 'x', kHexDigits[character >> 4U],
+                                             kHexDigits[character & 0xFU]};
             return append({escape.data(), escape.size()});
         }
     }
@@ -139,14 +140,15 @@ LinuxStructuredLog::LinuxStructuredLog(int descriptor, std::string_view filter)
     prepareChannel(descriptor);
     for (const std::string& word : filter_.unknownWords()) {
         write(LogLevel::error, "zrrs",
-              formatted("TAMBLO_LOG: \"{}\" is neither a level (debug, info, default, error, fault) nor CODE=level; it "
+              formatted("TAMBLO_LOG: \"{}\" is neither a level (debug, info, default, error, fault) nor "
+                        "CODE=level; it "
                         "is ignored",
                         word));
     }
 }
 
-/// The description behind standard error may be shared with other processes, which must not find it non-blocking
-/// all at once; a pipe or a terminal is opened once more, for a description of our own.
+/// The description behind standard error may be shared with other processes, which must not find it
+/// non-blocking all at once; a pipe or a terminal is opened once more, for a description of our own.
 void LinuxStructuredLog::prepareChannel(int descriptor) {
     struct stat status {};
     if (::fstat(descriptor, &status) != 0) {
@@ -165,7 +167,7 @@ void LinuxStructuredLog::prepareChannel(int descriptor) {
         return;
     }
     own_ = FileDescriptor(::open(formatted("/proc/self/fd/{}", descriptor).c_str(),
-                      O_WRONLY | O_APPEND | O_NONBLOCK | O_NOCTTY | O_CLOEXEC));
+                                 O_WRONLY | O_APPEND | O_NONBLOCK | O_NOCTTY | O_CLOEXEC));
     if (own_.isOpen()) {
         descriptor_ = own_.get();
     } else {
@@ -177,7 +179,8 @@ LogLevel LinuxStructuredLog::threshold(std::string_view categoryCode) const noex
     return filter_.threshold(categoryCode);
 }
 
-void LinuxStructuredLog::write(LogLevel level, std::string_view categoryCode, std::string_view line) noexcept {
+void LinuxStructuredLog::write(LogLevel level, std::string_view categoryCode,
+                               std::string_view line) noexcept {
     LineBuffer buffer;
     const char prefix[] = {'<', priorityOf(level), '>'};
     buffer.append({prefix, sizeof prefix});

@@ -15,18 +15,19 @@ namespace tamblo {
 
 /// The log on standard error, one line per record: `<P>CODE TEXT`, P the sd-daemon priority.
 ///
-/// A record is one write, of at most `kMaximumLine` bytes. What a client can put into a text cannot make a line of
-/// its own or reach a terminal: control characters are written as escapes. A reader that is slow or gone neither
-/// holds up the service nor ends it: what cannot be written at once is dropped, and the next line that can be is
-/// preceded by one that says how many were. Any thread; nothing is locked or allocated.
+/// A record is one write, of at most `kMaximumLine` bytes. What a client can put into a text cannot make a
+/// line of its own or reach a terminal: control characters are written as escapes. A reader that is slow or
+/// gone neither holds up the service nor ends it: what cannot be written at once is dropped, and the next
+/// line that can be is preceded by one that says how many were. Any thread; nothing is locked or allocated.
 class LinuxStructuredLog final : public StructuredLog {
 public:
     static constexpr std::size_t kMaximumLine = 8192;
 
     /// The log of this process: standard error, filtered by `TAMBLO_LOG`.
     LinuxStructuredLog();
-    /// The descriptor is borrowed. When it is closed, it is opened on nothing, lest the next file that the service
-    /// opens take its number and be given the log. SIGPIPE is ignored from here on, in the whole process.
+    /// The descriptor is borrowed. When it is closed, it is opened on nothing, lest the next file that the
+    /// service opens take its number and be given the log. SIGPIPE is ignored from here on, in the whole
+    /// process.
     LinuxStructuredLog(int descriptor, std::string_view filter);
 
     [[nodiscard]] LogLevel threshold(std::string_view categoryCode) const noexcept override;

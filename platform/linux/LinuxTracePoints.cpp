@@ -10,7 +10,8 @@ namespace tamblo {
 
 namespace {
 
-constexpr const char* kMarkerFiles[] = {"/sys/kernel/tracing/trace_marker", "/sys/kernel/debug/tracing/trace_marker"};
+constexpr const char* kMarkerFiles[] = {"/sys/kernel/tracing/trace_marker",
+                                        "/sys/kernel/debug/tracing/trace_marker"};
 /// How long no mark is tried after one was refused.
 constexpr std::int64_t kPauseSeconds = 1;
 

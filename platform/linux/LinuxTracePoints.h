@@ -12,9 +12,9 @@ namespace tamblo {
 
 /// Trace points as lines of the kernel's trace marker: `tamblo 0x21044838`.
 ///
-/// The marker is opened once, at the start; where that is not allowed a trace point costs one comparison. While
-/// tracing is switched off the kernel refuses marks: then none is tried for a second, so that an idle tracer costs
-/// no system call per message.
+/// The marker is opened once, at the start; where that is not allowed a trace point costs one comparison.
+/// While tracing is switched off the kernel refuses marks: then none is tried for a second, so that an idle
+/// tracer costs no system call per message.
 class LinuxTracePoints final : public TracePoints {
 public:
     /// Takes the marker of the kernel's own trace file system.

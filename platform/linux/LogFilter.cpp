@@ -60,9 +60,9 @@ LogFilter::LogFilter(std::string_view words) {
 }
 
 LogLevel LogFilter::threshold(std::string_view categoryCode) const noexcept {
-    const auto found = std::find_if(categories_.begin(), categories_.end(), [categoryCode](const Category& category) {
-        return category.code == categoryCode;
-    });
+    const auto found =
+        std::find_if(categories_.begin(), categories_.end(),
+                     [categoryCode](const Category& category) { return category.code == categoryCode; });
     return found != categories_.end() ? found->level : level_;
 }
 

@@ -11,8 +11,8 @@ namespace tamblo {
 
 /// The least level written, for all categories and for single ones: `error,zrrs=debug`.
 ///
-/// Words between commas, each a level (`debug`, `info`, `default`, `error`, `fault`) or CODE=level; later ones win.
-/// Without a level for all it is `default`. Constant once made.
+/// Words between commas, each a level (`debug`, `info`, `default`, `error`, `fault`) or CODE=level; later
+/// ones win. Without a level for all it is `default`. Constant once made.
 class LogFilter {
 public:
     explicit LogFilter(std::string_view words);
