@@ -71,9 +71,9 @@ struct MapScratch {
 
 } // namespace detail
 
-/// Remembers the key sets of maps that were read, in the order in which their keys came, so that the maps of one
-/// kind of message share one key set and are read without sorting or comparing keys with each other. Bounded: a
-/// client that invents keys only pushes others out. Used by one thread at a time.
+/// Remembers the key sets of maps that were read, in the order in which their keys came, so that the maps of
+/// one kind of message share one key set and are read without sorting or comparing keys with each other.
+/// Bounded: a client that invents keys only pushes others out. Used by one thread at a time.
 class KeySetCache {
 public:
     KeySetCache();
@@ -90,16 +90,27 @@ private:
     detail::MapScratch scratch_;
 };
 
-/// Reads CBOR (RFC 8949) that nobody vouches for: a cursor over bytes that it never leaves, that allocates nothing
-/// from a declared count, and that stays at its first error. Definite and indefinite lengths are accepted.
+/// Reads CBOR (RFC 8949) that nobody vouches for: a cursor over bytes that it never leaves, that allocates
+/// nothing from a declared count, and that stays at its first error. Definite and indefinite lengths are
+/// accepted.
 ///
-/// The values accepted are those that `Value` has: text, integers from −2^63 to 2^64−1, floats, booleans, dates
-/// (tag 1), byte strings, arrays and maps with text keys, each key once; nesting to a depth of 32.
+/// The values accepted are those that `Value` has: text, integers from −2^63 to 2^64−1, floats, booleans,
+/// dates (tag 1), byte strings, arrays and maps with text keys, each key once; nesting to a depth of 32.
 class CborReader {
 public:
     static constexpr int kMaximumDepth = 32;
 
-    enum class Type : std::uint8_t { unsignedInteger, negativeInteger, bytes, text, array, map, tag, simple, end };
+    enum class Type : std::uint8_t {
+        unsignedInteger,
+        negativeInteger,
+        bytes,
+        text,
+        array,
+        map,
+        tag,
+        simple,
+        end
+    };
 
     explicit CborReader(std::span<const std::uint8_t> bytes, KeySetCache* keySets = nullptr) noexcept
         : position_(bytes.data()), end_(bytes.data() + bytes.size()), keySets_(keySets) {}
@@ -112,7 +123,8 @@ public:
     [[nodiscard]] Type peek() const noexcept;
     [[nodiscard]] bool nextIsNull() const noexcept { return position_ != end_ && *position_ == 0xF6; }
 
-    /// Each reads the next item when it is of that kind; otherwise leaves it and answers nothing, without an error.
+    /// Each reads the next item when it is of that kind; otherwise leaves it and answers nothing, without an
+    /// error.
     [[nodiscard]] std::optional<std::uint64_t> readUnsigned() noexcept;
     [[nodiscard]] std::optional<std::int64_t> readInteger() noexcept;
     [[nodiscard]] std::optional<bool> readBoolean() noexcept;
@@ -120,8 +132,8 @@ public:
     [[nodiscard]] std::optional<std::string_view> readText() noexcept;
     [[nodiscard]] bool readNull() noexcept;
 
-    /// The head of an array; its elements follow. `count` is what the head declares and is trusted for nothing;
-    /// without it the length is indefinite. Ask `moreElements` before each element.
+    /// The head of an array; its elements follow. `count` is what the head declares and is trusted for
+    /// nothing; without it the length is indefinite. Ask `moreElements` before each element.
     struct ArrayHead {
         std::optional<std::uint64_t> count;
         std::uint64_t read = 0;
@@ -129,7 +141,8 @@ public:
     [[nodiscard]] std::optional<ArrayHead> readArrayHead() noexcept;
     [[nodiscard]] bool moreElements(ArrayHead& array) noexcept;
 
-    /// The next item as a value; nothing after an error. `spare` is room for keys that are yet to be added to it.
+    /// The next item as a value; nothing after an error. `spare` is room for keys that are yet to be added to
+    /// it.
     [[nodiscard]] std::optional<Value> readValue();
     [[nodiscard]] std::optional<Dictionary> readDictionary(std::size_t spare = 0);
     /// Steps over one well-formed item, whatever it is and however deep, acceptable as a value or not.

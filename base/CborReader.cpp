@@ -40,7 +40,8 @@ float halfToSingle(std::uint16_t half) noexcept {
     } else if (exponent != 31) {
         magnitude = std::ldexp(static_cast<float>(mantissa + 1024), exponent - 25);
     } else {
-        magnitude = mantissa == 0 ? std::numeric_limits<float>::infinity() : std::numeric_limits<float>::quiet_NaN();
+        magnitude =
+            mantissa == 0 ? std::numeric_limits<float>::infinity() : std::numeric_limits<float>::quiet_NaN();
     }
     return (half & 0x8000) != 0 ? -magnitude : magnitude;
 }
@@ -50,8 +51,8 @@ std::uint64_t mix(std::uint64_t hash, std::uint64_t word) noexcept {
     return hash ^ hash >> 29;
 }
 
-/// A hash of keys in their order, good enough to tell the kinds of messages apart: of each key its length and up to
-/// sixteen of its bytes. What it answers is verified key by key.
+/// A hash of keys in their order, good enough to tell the kinds of messages apart: of each key its length and
+/// up to sixteen of its bytes. What it answers is verified key by key.
 std::uint64_t hashKeys(std::span<const std::string_view> keys) noexcept {
     std::uint64_t hash = keys.size();
     for (const std::string_view key : keys) {
@@ -78,7 +79,8 @@ struct KeySetCache::Shape {
     KeySetRef keys;
     std::vector<std::uint32_t> places;
 
-    [[nodiscard]] bool matches(std::uint64_t otherHash, std::span<const std::string_view> arrived) const noexcept {
+    [[nodiscard]] bool matches(std::uint64_t otherHash,
+                               std::span<const std::string_view> arrived) const noexcept {
         if (hash != otherHash || places.size() != arrived.size()) {
             return false;
         }
@@ -529,7 +531,8 @@ bool CborReader::buildDictionary(Dictionary& dictionary, std::size_t firstEntry,
 }
 
 bool CborReader::skip() {
-    // What is still open, innermost last: how many items are to come, or, for indefinite lengths, how many have.
+    // What is still open, innermost last: how many items are to come, or, for indefinite lengths, how many
+    // have.
     struct Open {
         std::uint64_t items;
         bool isIndefinite;

@@ -34,8 +34,8 @@ struct Dictionary::Block {
 
 namespace {
 
-/// Up to this many keys are added one after the other, which is a look-up where it was done before; more of them at
-/// once, so that the time it takes does not grow with the square of their number.
+/// Up to this many keys are added one after the other, which is a look-up where it was done before; more of
+/// them at once, so that the time it takes does not grow with the square of their number.
 constexpr std::size_t kMaximumKeysAddedSingly = 8;
 
 /// A value is sixteen bytes that may be moved as bytes, the place left behind being uninitialised.

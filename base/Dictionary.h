@@ -14,9 +14,9 @@ namespace tamblo {
 
 /// String keys to values, sorted by key, with value semantics: the payload of every message.
 ///
-/// One pointer wide. Copies share a block until one of them is changed (copy on write), so handing a payload on is
-/// one atomic increment; the keys lie in a `KeySet` that dictionaries of the same keys share. Two threads may use
-/// two copies at the same time; one object is, like any value, used by one thread at a time.
+/// One pointer wide. Copies share a block until one of them is changed (copy on write), so handing a payload
+/// on is one atomic increment; the keys lie in a `KeySet` that dictionaries of the same keys share. Two
+/// threads may use two copies at the same time; one object is, like any value, used by one thread at a time.
 class Dictionary {
 public:
     using Entry = std::pair<std::string_view, Value>;
@@ -32,7 +32,8 @@ public:
     [[nodiscard]] std::size_t size() const noexcept;
     [[nodiscard]] bool empty() const noexcept { return size() == 0; }
 
-    /// Entries in key order. A reference to a key or value holds until the dictionary is changed or destroyed.
+    /// Entries in key order. A reference to a key or value holds until the dictionary is changed or
+    /// destroyed.
     [[nodiscard]] std::string_view keyAt(std::size_t index) const noexcept { return keys().key(index); }
     [[nodiscard]] const Value& valueAt(std::size_t index) const noexcept { return values()[index]; }
     [[nodiscard]] const KeySet& keys() const noexcept;
@@ -50,8 +51,8 @@ public:
     void merge(const Dictionary& other);
     void reserve(std::size_t capacity);
 
-    /// Builds a dictionary from one value for each key; `places[i]` is the index of the key that `values[i]` belongs
-    /// to, each index once. `spare` is room for keys to come. The values are moved from.
+    /// Builds a dictionary from one value for each key; `places[i]` is the index of the key that `values[i]`
+    /// belongs to, each index once. `spare` is room for keys to come. The values are moved from.
     static Dictionary adopt(KeySetRef keys, std::span<Value> values, std::span<const std::uint32_t> places,
                             std::size_t spare = 0);
 

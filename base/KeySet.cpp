@@ -9,8 +9,8 @@
 
 namespace tamblo {
 
-/// A key set that was made from another by adding a key. Kept in a list that only grows, so that it is read without
-/// a lock; the key is the added one's.
+/// A key set that was made from another by adding a key. Kept in a list that only grows, so that it is read
+/// without a lock; the key is the added one's.
 struct KeySet::Transition {
     KeySetRef target;
     std::size_t index;
@@ -19,8 +19,8 @@ struct KeySet::Transition {
 
 namespace {
 
-// Remembering stops at these limits, so that a client that invents keys cannot make the process grow; what is not
-// remembered is made anew each time.
+// Remembering stops at these limits, so that a client that invents keys cannot make the process grow; what is
+// not remembered is made anew each time.
 constexpr std::uint32_t kMaximumTransitionsOfOne = 8;
 constexpr std::uint32_t kMaximumTransitionsOfAll = 4096;
 constexpr std::uint32_t kMaximumKeysToRemember = 64;
@@ -113,7 +113,8 @@ std::size_t KeySet::find(std::string_view key) const noexcept {
         ++entry;
     }
     for (; entry != end && entry->prefix == prefix; ++entry) {
-        if (entry->length == key.size() && std::memcmp(text_.get() + entry->offset, key.data(), key.size()) == 0) {
+        if (entry->length == key.size() &&
+            std::memcmp(text_.get() + entry->offset, key.data(), key.size()) == 0) {
             return static_cast<std::size_t>(entry - entries_.get());
         }
     }
@@ -164,7 +165,8 @@ KeySet::Extension KeySet::adding(std::string_view key) const {
 
     if (count_ < kMaximumKeysToRemember && countUpTo(kMaximumTransitionsOfOne, transitionCount_) &&
         countUpTo(kMaximumTransitionsOfAll, transitionsOfAll())) {
-        auto* transition = new Transition{extension.keys, index, transitions_.load(std::memory_order_relaxed)};
+        auto* transition =
+            new Transition{extension.keys, index, transitions_.load(std::memory_order_relaxed)};
         while (!transitions_.compare_exchange_weak(transition->next, transition, std::memory_order_release,
                                                    std::memory_order_relaxed)) {
         }

@@ -32,10 +32,10 @@ private:
 
 /// The sorted keys of a dictionary, apart from its values.
 ///
-/// Messages of one kind all have the same keys, so their dictionaries share one key set: comparing two of them
-/// compares a pointer and the values, a message takes no memory for its keys, and what follows from the keys alone
-/// (the JSON text of each, whether one holds a space) is worked out once. A key set is immutable and lives as long
-/// as a dictionary, or a key set that was derived from, refers to it. Safe on any thread.
+/// Messages of one kind all have the same keys, so their dictionaries share one key set: comparing two of
+/// them compares a pointer and the values, a message takes no memory for its keys, and what follows from the
+/// keys alone (the JSON text of each, whether one holds a space) is worked out once. A key set is immutable
+/// and lives as long as a dictionary, or a key set that was derived from, refers to it. Safe on any thread.
 class KeySet {
 public:
     static constexpr std::size_t kNotFound = static_cast<std::size_t>(-1);
@@ -49,8 +49,10 @@ public:
     /// The key as it stands in JSON, quotes and colon included: `"key":`.
     [[nodiscard]] std::string_view jsonKey(std::size_t index) const noexcept;
     [[nodiscard]] std::size_t find(std::string_view key) const noexcept;
-    /// The first index from `start` on whose key is not below the other set's key; the count when there is none.
-    [[nodiscard]] std::size_t findFrom(std::size_t start, const KeySet& other, std::size_t otherIndex) const noexcept;
+    /// The first index from `start` on whose key is not below the other set's key; the count when there is
+    /// none.
+    [[nodiscard]] std::size_t findFrom(std::size_t start, const KeySet& other,
+                                       std::size_t otherIndex) const noexcept;
     [[nodiscard]] bool sameKey(std::size_t index, const KeySet& other, std::size_t otherIndex) const noexcept;
     /// Whether a key holds U+0020.
     [[nodiscard]] bool anyKeyHasSpace() const noexcept { return anyKeyHasSpace_; }

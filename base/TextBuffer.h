@@ -9,8 +9,8 @@
 
 namespace tamblo {
 
-/// A growing run of bytes that writers format straight into: what is appended is not first zeroed or copied, as a
-/// `std::string` would. Used for sink lines and for frames.
+/// A growing run of bytes that writers format straight into: what is appended is not first zeroed or copied,
+/// as a `std::string` would. Used for sink lines and for frames.
 class TextBuffer {
 public:
     TextBuffer() noexcept = default;

@@ -10,9 +10,9 @@ namespace tamblo {
 
 template <typename Signature, std::size_t InlineBytes = 48> class UniqueFunction;
 
-/// A callable that is moved, never copied, and may hold what cannot be copied. A target of up to `InlineBytes`
-/// bytes lies in the object itself, so that queueing work allocates nothing. Calling an empty one is a fault;
-/// test it first. A call does not consume the target.
+/// A callable that is moved, never copied, and may hold what cannot be copied. A target of up to
+/// `InlineBytes` bytes lies in the object itself, so that queueing work allocates nothing. Calling an empty
+/// one is a fault; test it first. A call does not consume the target.
 template <typename Result, typename... Arguments, std::size_t InlineBytes>
 class UniqueFunction<Result(Arguments...), InlineBytes> {
 public:
@@ -61,8 +61,9 @@ private:
     };
 
     template <typename Stored>
-    static constexpr bool fits = sizeof(Stored) <= InlineBytes && alignof(Stored) <= alignof(std::max_align_t) &&
-                                 std::is_nothrow_move_constructible_v<Stored>;
+    static constexpr bool
+        fits = sizeof(Stored) <= InlineBytes &&
+               alignof(Stored) <= alignof(std::max_align_t) && std::is_nothrow_move_constructible_v<Stored>;
 
     template <typename Stored>
     static constexpr Operations inlineOperations{

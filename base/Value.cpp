@@ -55,7 +55,8 @@ double leadingNumber(std::string_view text) noexcept {
     const auto result = std::from_chars(text.data(), text.data() + text.size(), number);
     if (result.ec == std::errc::result_out_of_range) {
         const std::string_view read(text.data(), static_cast<std::size_t>(result.ptr - text.data()));
-        const bool isTiny = read.find("e-") != std::string_view::npos || read.find("E-") != std::string_view::npos;
+        const bool isTiny =
+            read.find("e-") != std::string_view::npos || read.find("E-") != std::string_view::npos;
         number = isTiny ? 0.0 : std::numeric_limits<double>::infinity();
     }
     return negative ? -number : number;
@@ -140,7 +141,8 @@ Value::Value(long long value) noexcept {
 }
 Value::Value(unsigned long value) noexcept : Value(static_cast<unsigned long long>(value)) {}
 Value::Value(unsigned long long value) noexcept {
-    const bool fitsSigned = value <= static_cast<unsigned long long>(std::numeric_limits<std::int64_t>::max());
+    const bool fitsSigned =
+        value <= static_cast<unsigned long long>(std::numeric_limits<std::int64_t>::max());
     store<std::uint64_t>(value, fitsSigned ? Kind::integer : Kind::unsignedInteger);
 }
 Value::Value(float value) noexcept {

@@ -18,8 +18,8 @@ using Array = std::vector<Value>;
 /// One property-list value, in sixteen bytes.
 ///
 /// Texts and byte strings of up to 14 bytes lie in the value itself; longer ones, arrays and dictionaries are
-/// immutable, reference-counted blocks, so that a copy of any value costs at most one atomic increment. Values
-/// may be copied to and destroyed on any thread.
+/// immutable, reference-counted blocks, so that a copy of any value costs at most one atomic increment.
+/// Values may be copied to and destroyed on any thread.
 ///
 /// Numbers, booleans among them, are equal by numeric value across kinds: 1, 1.0 and true are the same value.
 /// A not-a-number equals itself, so that a message that repeats one is still seen as a repeat.
@@ -69,9 +69,9 @@ public:
     [[nodiscard]] bool isDictionary() const noexcept { return kind() == Kind::dictionary; }
     [[nodiscard]] bool isArray() const noexcept { return kind() == Kind::array; }
 
-    /// Readings that never fail. A text is read by its leading number (after white space), a number by its value;
-    /// anything else, and what is no number, is 0. Integers are truncated towards zero and kept within their range.
-    /// A date is not a number and reads as 0; its seconds are had from `dateSeconds`.
+    /// Readings that never fail. A text is read by its leading number (after white space), a number by its
+    /// value; anything else, and what is no number, is 0. Integers are truncated towards zero and kept within
+    /// their range. A date is not a number and reads as 0; its seconds are had from `dateSeconds`.
     [[nodiscard]] double doubleValue() const noexcept;
     [[nodiscard]] std::int64_t integerValue() const noexcept;
     [[nodiscard]] std::uint64_t unsignedValue() const noexcept;

@@ -10,7 +10,7 @@ namespace tamblo {
 /// The analytics-event service: collects named events with a payload. Any thread; neither operation blocks,
 /// and what cannot be recorded is the service's own to report.
 class AnalyticsEventService {
-  public:
+public:
     virtual ~AnalyticsEventService() = default;
     /// Whether events of this name are collected now.
     [[nodiscard]] virtual bool isEventInUse(std::string_view eventName) = 0;

@@ -14,7 +14,7 @@ using WallTime = std::chrono::time_point<std::chrono::system_clock, std::chrono:
 /// The time of day, on any thread, without blocking. It may step backwards. Read once per message and passed
 /// down.
 class Clock {
-  public:
+public:
     virtual ~Clock() = default;
     [[nodiscard]] virtual WallTime now() const noexcept = 0;
 };

@@ -14,7 +14,7 @@ namespace tamblo {
 /// One client's connection. Set up inside the accept callback, then resumed; from then on the service holds
 /// it no longer and hears of it through the handlers, on the connection's thread.
 class ClientConnection {
-  public:
+public:
     virtual ~ClientConnection() = default;
     [[nodiscard]] virtual pid_t peerProcessIdentifier() const noexcept = 0;
     /// The object that answers the client's requests; held until the connection has ended.
@@ -29,7 +29,7 @@ class ClientConnection {
 
 /// Decides about each new connection; called on the listener's thread.
 class ListenerDelegate {
-  public:
+public:
     virtual ~ListenerDelegate() = default;
     /// False turns the client away.
     virtual bool shouldAcceptNewConnection(ClientConnection& connection) = 0;
@@ -37,7 +37,7 @@ class ListenerDelegate {
 
 /// The named listener of the interprocess connection service. Accepts from `resume` on.
 class ConnectionListener {
-  public:
+public:
     virtual ~ConnectionListener() = default;
     /// The delegate must outlive the listener.
     virtual void setDelegate(ListenerDelegate& delegate) = 0;
@@ -45,7 +45,7 @@ class ConnectionListener {
 };
 
 class ConnectionService {
-  public:
+public:
     virtual ~ConnectionService() = default;
     /// The listener for an interprocess service name; one per process.
     [[nodiscard]] virtual ConnectionListener& listenerForServiceName(std::string_view serviceName) = 0;

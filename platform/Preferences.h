@@ -9,7 +9,7 @@ namespace tamblo {
 
 /// The preferences store: values by domain and key. Any thread; may read a file.
 class Preferences {
-  public:
+public:
     virtual ~Preferences() = default;
     /// The value that is stored now, or nothing.
     [[nodiscard]] virtual std::optional<Value> copyPreferenceValue(std::string_view key,

@@ -10,7 +10,7 @@ namespace tamblo {
 
 /// Figures of this process, of others, and of the system. Any thread; may read a file of the kernel's.
 class ProcessInformation {
-  public:
+public:
     virtual ~ProcessInformation() = default;
     [[nodiscard]] virtual pid_t ownProcessIdentifier() const noexcept = 0;
     /// The short name of a process; nothing when it has already exited.

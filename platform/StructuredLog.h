@@ -9,7 +9,7 @@ enum class LogLevel : std::uint8_t { debug, info, standard, error, fault };
 
 /// Where log lines go. Any thread; must not fail and should not block.
 class StructuredLog {
-  public:
+public:
     virtual ~StructuredLog() = default;
     /// The least level written for a category, by its four-letter code. Constant for the life of the process.
     [[nodiscard]] virtual LogLevel threshold(std::string_view categoryCode) const noexcept = 0;

@@ -6,7 +6,7 @@ namespace tamblo {
 
 /// The kernel's trace facility. Any thread; does nothing where there is none.
 class TracePoints {
-  public:
+public:
     virtual ~TracePoints() = default;
     virtual void EmitTracePoint(std::uint32_t traceCode) noexcept = 0;
 };

@@ -20,7 +20,7 @@ enum class Pace {
 /// Runs work one piece at a time, in the order posted, on whatever thread suits. Destroying a queue first
 /// finishes what was posted.
 class SerialQueue {
-  public:
+public:
     virtual ~SerialQueue() = default;
     /// From any thread, without blocking. The work runs later, never inside this call.
     virtual void post(Work work, Pace pace = Pace::quick) = 0;
@@ -34,14 +34,14 @@ class SerialQueue {
 /// after `invalidate`, which may be called from the tick itself, no further tick begins; the destructor also
 /// waits for a running tick, unless it is called from that tick.
 class RepeatingTimer {
-  public:
+public:
     virtual ~RepeatingTimer() = default;
     virtual void start() = 0;
     virtual void invalidate() = 0;
 };
 
 class WorkQueues {
-  public:
+public:
     virtual ~WorkQueues() = default;
     [[nodiscard]] virtual std::unique_ptr<SerialQueue> makeSerialQueue(std::string_view label) = 0;
     [[nodiscard]] virtual std::unique_ptr<RepeatingTimer>

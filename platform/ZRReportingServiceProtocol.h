@@ -29,7 +29,7 @@ using ReporterID = std::int64_t;
 /// The eleven requests of a client, as the object that a connection exports answers them. Called on the
 /// connection's thread; no operation blocks.
 class ZRReportingServiceProtocol {
-  public:
+public:
     virtual ~ZRReportingServiceProtocol() = default;
 
     virtual void createReportingSession(ReporterID reporterID, BooleanReply reply) = 0;

@@ -10,7 +10,7 @@ namespace tamblo::wire {
 
 /// Writes a frame's item straight behind the place of its length, which is filled in at the end.
 class FrameScope {
-  public:
+public:
     explicit FrameScope(TextBuffer& out) : out_(out), start_(out.size()) {
         (void)out.room(kLengthBytes);
         out.commit(kLengthBytes);
@@ -32,7 +32,7 @@ class FrameScope {
         return true;
     }
 
-  private:
+private:
     TextBuffer& out_;
     std::size_t start_;
 };

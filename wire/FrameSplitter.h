@@ -11,7 +11,7 @@ namespace tamblo::wire {
 
 /// Takes the frames off the front of a run of received bytes.
 class FrameSplitter {
-  public:
+public:
     explicit FrameSplitter(std::span<const std::uint8_t> received) noexcept : rest_(received) {}
 
     /// The CBOR item of the next frame, or nothing: `rest` then is the beginning of a frame that has not
@@ -22,7 +22,7 @@ class FrameSplitter {
     /// Bytes of the whole frame that `rest` begins, length included, as far as known.
     [[nodiscard]] std::size_t wanted() const noexcept;
 
-  private:
+private:
     std::span<const std::uint8_t> rest_;
     bool tooLong_ = false;
 };

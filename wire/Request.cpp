@@ -13,7 +13,7 @@ namespace {
 constexpr std::size_t kKeysYetToCome = 4;
 
 class ParameterReader {
-  public:
+public:
     ParameterReader(CborReader& reader, CborReader::ArrayHead& array) noexcept
         : reader_(reader), array_(array) {}
 
@@ -108,7 +108,7 @@ class ParameterReader {
         return text.append(isLong_ ? ": too many parameters" : ": too few parameters");
     }
 
-  private:
+private:
     bool refuse(std::string_view name, std::string_view wanted) noexcept {
         wrong_ = name;
         wanted_ = wanted;

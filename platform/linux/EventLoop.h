@@ -13,7 +13,7 @@ namespace tamblo {
 
 /// Something with a file descriptor that the loop watches.
 class EventSource {
-  public:
+public:
     virtual ~EventSource() = default;
     /// On the loop's thread, with the epoll events that are up.
     virtual void ready(std::uint32_t events) = 0;
@@ -25,7 +25,7 @@ class EventSource {
 /// The I/O thread's loop over epoll: one per process, run by the thread that calls `run`. It sleeps without a
 /// time-out unless somebody asked to be called at a time.
 class EventLoop {
-  public:
+public:
     using Task = UniqueFunction<void()>;
 
     EventLoop();
@@ -49,7 +49,7 @@ class EventLoop {
     void run();
     void stop() noexcept { isStopped_ = true; }
 
-  private:
+private:
     using Deadline = std::chrono::steady_clock::time_point;
 
     void wake() noexcept;

@@ -8,7 +8,7 @@ namespace tamblo {
 
 /// Owns an open file descriptor and closes it.
 class FileDescriptor {
-  public:
+public:
     FileDescriptor() noexcept = default;
     explicit FileDescriptor(int descriptor) noexcept : descriptor_(descriptor) {}
     FileDescriptor(FileDescriptor&& other) noexcept : descriptor_(std::exchange(other.descriptor_, -1)) {}
@@ -29,7 +29,7 @@ class FileDescriptor {
         }
     }
 
-  private:
+private:
     int descriptor_ = -1;
 };
 

@@ -27,7 +27,7 @@ class LinuxConnectionService;
 class LinuxConnection final : public ClientConnection,
                               public EventSource,
                               public std::enable_shared_from_this<LinuxConnection> {
-  public:
+public:
     LinuxConnection(LinuxConnectionService& service, FileDescriptor socket, pid_t peer);
 
     [[nodiscard]] pid_t peerProcessIdentifier() const noexcept override { return peer_; }
@@ -50,7 +50,7 @@ class LinuxConnection final : public ClientConnection,
     /// Ends the connection on the I/O thread: handlers first, then the socket.
     void end();
 
-  private:
+private:
     /// How the connection comes to its end; anything but an orderly one is an interruption first.
     enum class Ending : std::uint8_t { none, orderly, interrupted };
 

@@ -40,7 +40,7 @@ inline constexpr std::size_t kRequestsPerBatch = 256;
 /// The interprocess connection service: a local stream socket in the runtime directory, or the one that the
 /// process was started with. Everything but the replies happens on the I/O thread.
 class LinuxConnectionService final : public ConnectionService, public ConnectionListener, public EventSource {
-  public:
+public:
     LinuxConnectionService(EventLoop& loop, StructuredLog& log);
     ~LinuxConnectionService() override;
 
@@ -60,7 +60,7 @@ class LinuxConnectionService final : public ConnectionService, public Connection
     /// Takes no further connections and reads no more from those there are; the socket file goes.
     void stop();
 
-  private:
+private:
     friend class LinuxConnection;
 
     bool adoptActivatedSocket();

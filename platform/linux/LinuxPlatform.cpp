@@ -38,7 +38,7 @@ void raiseDescriptorLimit() noexcept {
 
 /// SIGTERM and SIGINT as a descriptor: the first asks for the end, a second makes it at once.
 class LinuxPlatform::Signals final : public EventSource {
-  public:
+public:
     Signals() {
         sigset_t signals;
         sigemptyset(&signals);
@@ -64,26 +64,28 @@ class LinuxPlatform::Signals final : public EventSource {
         }
     }
 
-  private:
+private:
     FileDescriptor descriptor_;
     UniqueFunction<void()> endWanted_;
 };
 
 class LinuxPlatform::PreferenceChanges final : public EventSource {
-  public:
+public:
     explicit PreferenceChanges(LinuxPreferences& preferences) : preferences_(preferences) {}
     void ready(std::uint32_t) override { preferences_.readChanges(); }
     [[nodiscard]] bool comesFirst() const noexcept override { return true; }
 
-  private:
+private:
     LinuxPreferences& preferences_;
 };
 
 /// In the order in which they depend on each other.
 struct LinuxPlatform::Services {
     explicit Services(const Directories& directories)
-        : deviceProperties(directories.deviceProperties(), log), preferences(directories.preferences(), log),
-          preferenceChanges(preferences), analyticsEvents(directories.logs, clock, preferences, log),
+        : deviceProperties(directories.deviceProperties(), log),
+          preferences(directories.preferences(), log),
+          preferenceChanges(preferences),
+          analyticsEvents(directories.logs, clock, preferences, log),
           connections(loop, log) {}
 
     Signals signals;

@@ -14,7 +14,7 @@ namespace tamblo {
 /// Everything that the service finds on Linux, made and wired once by `main`: the services behind the
 /// platform's interfaces, the event loop that drives them, the signals that end it.
 class LinuxPlatform {
-  public:
+public:
     /// Prepares the directories and opens the socket. A text says why the service cannot start and what to
     /// do.
     [[nodiscard]] static std::variant<std::unique_ptr<LinuxPlatform>, std::string> open();
@@ -31,7 +31,7 @@ class LinuxPlatform {
     void run(SerialQueue& requestQueue,
              const std::function<void(std::function<void()> completion)>& shutDown);
 
-  private:
+private:
     class Signals;
     class PreferenceChanges;
     struct Services;

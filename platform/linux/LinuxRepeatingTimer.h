@@ -10,7 +10,7 @@ namespace tamblo {
 
 /// A repeating timer with a thread of its own, from `start` until it is invalidated.
 class LinuxRepeatingTimer final : public RepeatingTimer {
-  public:
+public:
     /// Threads that could not be joined where their timer ended, since the timer was dropped by its own tick.
     class Retired;
 
@@ -20,7 +20,7 @@ class LinuxRepeatingTimer final : public RepeatingTimer {
     void start() override;
     void invalidate() override;
 
-  private:
+private:
     struct State;
 
     static void run(State& state);

@@ -18,7 +18,7 @@ class LinuxSerialQueue;
 /// of requests shares one write of the sinks and one send of the replies. Work that may block goes to the
 /// pool, and so does everything behind it. One per thread at a time.
 class InlineDrain {
-  public:
+public:
     InlineDrain();
     ~InlineDrain();
     InlineDrain(const InlineDrain&) = delete;
@@ -28,7 +28,7 @@ class InlineDrain {
     /// The calling thread's, or null.
     [[nodiscard]] static InlineDrain* current() noexcept;
 
-  private:
+private:
     friend class LinuxSerialQueue;
     std::vector<LinuxSerialQueue*> queues_;
 };
@@ -36,7 +36,7 @@ class InlineDrain {
 /// A serial queue as a strand: no thread of its own; whoever drains it, the pool or an `InlineDrain`, is the
 /// only one to do so at that time.
 class LinuxSerialQueue final : public SerialQueue {
-  public:
+public:
     LinuxSerialQueue(ThreadPool& pool, std::string_view label) : pool_(pool), label_(label) {}
     ~LinuxSerialQueue() override;
 
@@ -44,7 +44,7 @@ class LinuxSerialQueue final : public SerialQueue {
     void setBatchEnd(Work batchEnd) override { batchEnd_ = std::move(batchEnd); }
     [[nodiscard]] std::string_view label() const noexcept override { return label_; }
 
-  private:
+private:
     friend class InlineDrain;
 
     struct Item {

@@ -10,7 +10,7 @@ namespace tamblo {
 
 /// Serial queues as strands over one pool, and timers. Outlives the queues that it made.
 class LinuxWorkQueues final : public WorkQueues {
-  public:
+public:
     LinuxWorkQueues();
     ~LinuxWorkQueues() override;
 
@@ -20,7 +20,7 @@ class LinuxWorkQueues final : public WorkQueues {
     /// Called after each tick of any timer, on its thread: what a tick recorded is written out.
     void setTickEnd(UniqueFunction<void()> tickEnd);
 
-  private:
+private:
     struct TickEnd;
 
     std::shared_ptr<TickEnd> tickEnd_;

@@ -26,7 +26,7 @@ struct LinuxRepeatingTimer::State {
 };
 
 class LinuxRepeatingTimer::Retired {
-  public:
+public:
     ~Retired() {
         join([](const State&) { return true; });
     }
@@ -40,7 +40,7 @@ class LinuxRepeatingTimer::Retired {
         join([](const State& state) { return state.hasReturned.load(); });
     }
 
-  private:
+private:
     struct Entry {
         std::thread thread;
         std::shared_ptr<State> state;

@@ -15,7 +15,7 @@ namespace tamblo {
 /// and a thread that finds nothing to do for some seconds ends: an idle process has none. The destructor
 /// works off what was posted.
 class ThreadPool {
-  public:
+public:
     static constexpr std::size_t kMaximumThreads = 16;
 
     ThreadPool() = default;
@@ -25,7 +25,7 @@ class ThreadPool {
 
     void post(UniqueFunction<void()> work);
 
-  private:
+private:
     void run();
     void joinFinished();
 
