@@ -10,6 +10,7 @@ endif()
 
 enable_testing()
 include(GoogleTest)
+add_custom_target(tamblo_all_tests)
 
 tamblo_folder(tests/fakes PUBLIC session util platform base)
 tamblo_link_headers(tests TRUE tamblo_tests_include)
@@ -25,6 +26,7 @@ function(tamblo_tests name)
     target_link_libraries(${name} PRIVATE GTest::gmock GTest::gtest_main nlohmann_json::nlohmann_json)
     tamblo_link(${name} PRIVATE ${arg_LIBRARIES})
     target_compile_definitions(${name} PRIVATE "EXAMPLES_DIR=\"${CMAKE_SOURCE_DIR}/examples\"")
+    add_dependencies(tamblo_all_tests ${name})
     gtest_discover_tests(${name} DISCOVERY_MODE PRE_TEST PROPERTIES LABELS ${arg_LABEL} TIMEOUT 120)
 endfunction()
 
