@@ -22,11 +22,16 @@ std::chrono::nanoseconds readClock(clockid_t clock) noexcept {
 /// The kernel cuts names at 15 bytes, through the middle of a character if need be, and takes any bytes for a
 /// name.
 std::string asUtf8(std::string name) {
-    for (std::size_t cut = 0; cut < 4 && cut <= name.size(); ++cut) {
-        const std::string_view shorter = std::string_view(name).substr(0, name.size() - cut);
-        if (isUtf8(shorter)) {
-            return std::string(shorter);
-        }
+    if (isUtf8(name)) {
+        return name;
+    }
+    std::size_t last = name.size() - 1;
+    while (last > 0 && (static_cast<unsigned char>(name[last]) & 0xC0U) == 0x80U) {
+        --last;
+    }
+    if (static_cast<unsigned char>(name[last]) >= 0xC0 && isUtf8(std::string_view(name).substr(0, last))) {
+        name.resize(last);
+        return name;
     }
     for (char& character : name) {
         if (static_cast<unsigned char>(character) >= 0x80) {

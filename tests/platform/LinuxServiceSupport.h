@@ -1,0 +1,68 @@
+#pragma once
+
+#include "platform/StructuredLog.h"
+
+#include <filesystem>
+#include <fstream>
+#include <mutex>
+#include <sstream>
+#include <string>
+#include <utility>
+#include <vector>
+
+#include <stdlib.h>
+
+namespace tamblo {
+
+/// A directory that goes away with its owner.
+class TemporaryDirectory {
+public:
+    TemporaryDirectory() {
+        std::string pattern = (std::filesystem::temp_directory_path() / "tamblo-test-XXXXXX").string();
+        path_ = ::mkdtemp(pattern.data());
+    }
+    ~TemporaryDirectory() {
+        std::error_code ignored;
+        std::filesystem::remove_all(path_, ignored);
+    }
+    TemporaryDirectory(const TemporaryDirectory&) = delete;
+    TemporaryDirectory& operator=(const TemporaryDirectory&) = delete;
+
+    [[nodiscard]] std::string path(const std::string& name = {}) const {
+        return name.empty() ? path_ : path_ + "/" + name;
+    }
+    void write(const std::string& name, const std::string& text) const {
+        std::ofstream(path(name), std::ios::binary) << text;
+    }
+    /// Nothing and an empty file read the same.
+    [[nodiscard]] std::string read(const std::string& name) const {
+        std::ostringstream text;
+        text << std::ifstream(path(name), std::ios::binary).rdbuf();
+        return text.str();
+    }
+
+private:
+    std::string path_;
+};
+
+/// Keeps what is logged, as `LEVEL CODE TEXT` with the level as a digit.
+class RecordingLog final : public StructuredLog {
+public:
+    [[nodiscard]] LogLevel threshold(std::string_view) const noexcept override { return LogLevel::debug; }
+    void write(LogLevel level, std::string_view code, std::string_view line) noexcept override {
+        const std::lock_guard lock(mutex_);
+        lines_.push_back(std::to_string(static_cast<int>(level)) + " " + std::string(code) + " " +
+                         std::string(line));
+    }
+    /// The lines since the last call.
+    [[nodiscard]] std::vector<std::string> take() {
+        const std::lock_guard lock(mutex_);
+        return std::exchange(lines_, {});
+    }
+
+private:
+    std::mutex mutex_;
+    std::vector<std::string> lines_;
+};
+
+} // namespace tamblo
