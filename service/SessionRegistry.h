@@ -1,0 +1,57 @@
+#pragma once
+
+#include "service/ZRReportingServiceDelegateProtocol.h"
+#include "util/Mixing.h"
+
+#include <cstddef>
+#include <cstdint>
+#include <map>
+#include <unordered_map>
+#include <utility>
+#include <vector>
+
+#include <sys/types.h>
+
+namespace tamblo {
+
+/// The sessions of all clients by reporter ID, and the started ones among them in client order: what walks
+/// over the clients would find, at a cost that does not grow with their number. On the reporting server
+/// queue.
+class SessionRegistry {
+public:
+    struct Entry {
+        std::uint64_t clientOrder = 0; ///< the client's place in the order of acceptance
+        pid_t clientProcessIdentifier = 0;
+        SessionRef session;
+    };
+
+    /// What a client now holds under an ID; without a session, nothing.
+    void set(ReporterID reporterID, const Entry& entry);
+    /// The entry of the first client in order of acceptance that has the ID, or null.
+    [[nodiscard]] const Entry* find(ReporterID reporterID) const noexcept;
+    /// Client by client in order of acceptance, by ID within each.
+    [[nodiscard]] std::vector<SessionRef> startedSessions() const;
+
+private:
+    struct Hash {
+        Hash() noexcept : seed(processSeed()) {}
+        std::size_t operator()(ReporterID reporterID) const noexcept {
+            return mixed(static_cast<std::uint64_t>(reporterID) ^ seed);
+        }
+        std::uint64_t seed;
+    };
+    /// Almost always one client; more are in order of acceptance.
+    struct Holders {
+        Entry first;
+        std::vector<Entry> others;
+    };
+
+    static void put(Holders& holders, Entry entry);
+    /// Whether nobody is left.
+    static bool takeOut(Holders& holders, std::uint64_t clientOrder);
+
+    std::unordered_map<ReporterID, Holders, Hash> holders_;
+    std::map<std::pair<std::uint64_t, ReporterID>, SessionRef> started_;
+};
+
+} // namespace tamblo

@@ -1,0 +1,164 @@
+#include "service/ZRReportingService.h"
+
+#include "platform/Platform.h"
+#include "service/ClientUptime.h"
+#include "service/ZRReportingClientServerInstance.h"
+#include "session/ZRReportingSession.h"
+#include "util/Log.h"
+#include "util/ReportingServerQueue.h"
+
+#include <algorithm>
+#include <utility>
+
+namespace tamblo {
+
+ZRReportingService::ZRReportingService(ExitProcess exit)
+    : exitProcess_(exit), self_(this, [](ZRReportingService*) {}) {}
+
+ZRReportingService::~ZRReportingService() {
+    log::standard(ZRReportingClientCategory(), "destroying service");
+    self_.reset();
+}
+
+bool ZRReportingService::shouldAcceptNewConnection(ClientConnection& connection) {
+    const pid_t processIdentifier = connection.peerProcessIdentifier();
+    if (ZRReportingServiceDelegateCategory().isOn(LogLevel::standard)) {
+        log::standard(ZRReportingServiceDelegateCategory(), "newConnection: {}", connection.description());
+    }
+    const auto client = std::make_shared<ZRReportingClientServerInstance>(processIdentifier, self_);
+    connection.setExportedObject(client);
+    const auto addClientPiece = [service = std::weak_ptr(self_), client] {
+        if (const auto held = service.lock()) {
+            held->addClient(client);
+        }
+    };
+    // The process's name is read from a file of the kernel's, which is memory.
+    ZRReportingUtilityGetReportingServerQueue().post(addClientPiece);
+    setHandlers(connection, client);
+    connection.resume();
+    return true;
+}
+
+void ZRReportingService::setHandlers(ClientConnection& connection, const ClientRef& client) {
+    const std::weak_ptr<ZRReportingClientServerInstance> weakClient = client;
+    connection.setInterruptionHandler([weakClient] {
+        log::standard(ZRReportingServiceDelegateCategory(), "interruptionHandler: connection exited");
+        if (const ClientRef held = weakClient.lock()) {
+            held->handleConnectionError();
+        }
+    });
+    connection.setInvalidationHandler([weakClient, processIdentifier = client->processIdentifier()] {
+        const ClientRef held = weakClient.lock();
+        if (held != nullptr) {
+            held->handleConnectionError();
+        }
+        // The client's fields are the queue's to read; it is kept until they are.
+        ZRReportingUtilityGetReportingServerQueue().post(
+            [held, processIdentifier] { reportClientUptime(held, processIdentifier); });
+    });
+}
+
+void ZRReportingService::addClient(const ClientRef& client) {
+    client->setAcceptanceOrder(++lastAcceptanceOrder_);
+    clients_.push_back(client);
+    client->setClientStartDate(platform().clock.now());
+    client->setClientProcessName(
+        platform().processInformation.ProcessNameForPid(client->processIdentifier()));
+}
+
+void ZRReportingService::removeClient(ZRReportingClientServerInstance& client) {
+    const auto place = std::lower_bound(
+        clients_.begin(), clients_.end(), client.acceptanceOrder(),
+        [](const ClientRef& other, std::uint64_t order) { return other->acceptanceOrder() < order; });
+    if (place != clients_.end() && place->get() == &client) {
+        const ClientRef removed = std::move(*place);
+        clients_.erase(place);
+        removed->setAcceptanceOrder(0);
+    }
+}
+
+void ZRReportingService::sessionChanged(const ZRReportingClientServerInstance& client, ReporterID reporterID,
+                                        const SessionRef& session) {
+    // A client that has left, or has yet to come, is none whose sessions are found.
+    if (client.acceptanceOrder() != 0) {
+        sessions_.set(reporterID, {client.acceptanceOrder(), client.processIdentifier(), session});
+    }
+}
+
+std::vector<SessionRef> ZRReportingService::getAllActiveReportingSessions() {
+    if (ZRReportingServiceDelegateCategory().isOn(LogLevel::standard)) {
+        for (const ClientRef& client : clients_) {
+            std::vector<SessionRef> all;
+            for (const auto& [reporterID, session] : client->clientReportingSessionMap()) {
+                all.push_back(session);
+            }
+            log::standard(ZRReportingServiceDelegateCategory(), "sessions for client {} : {}",
+                          client->processIdentifier(), SessionList{all});
+        }
+    }
+    return sessions_.startedSessions();
+}
+
+void ZRReportingService::logReportingSessions() {
+    if (!ZRReportingServiceDelegateCategory().isOn(LogLevel::standard)) {
+        return;
+    }
+    const std::vector<SessionRef> active = getAllActiveReportingSessions();
+    log::standard(ZRReportingServiceDelegateCategory(), "{} active reporting session(s) {}", active.size(),
+                  SessionList{active});
+}
+
+SessionRef ZRReportingService::findReportingSessionForID(ReporterID reporterID) {
+    if (reporterID == 0 || !reportingEnabled_) {
+        return nullptr;
+    }
+    const SessionRegistry::Entry* found = sessions_.find(reporterID);
+    if (found == nullptr) {
+        log::error(ZRReportingServiceDelegateCategory(), "failed to find reporting session {}", reporterID);
+        return nullptr;
+    }
+    log::info(ZRReportingServiceDelegateCategory(), "found reporting session {} for client {}", reporterID,
+              found->clientProcessIdentifier);
+    return found->session;
+}
+
+void ZRReportingService::findReportingSessionsForIDs(std::span<const ReporterID> reporterIDs,
+                                                     std::vector<SessionRef>& found) {
+    for (const ReporterID reporterID : reporterIDs) {
+        if (SessionRef session = findReportingSessionForID(reporterID)) {
+            found.push_back(std::move(session));
+        }
+    }
+    if (!reporterIDs.empty()) {
+        return;
+    }
+    std::vector<SessionRef> active = getAllActiveReportingSessions();
+    logReportingSessions();
+    if (active.empty()) {
+        found.push_back(singleMessages_.retrieve());
+    } else {
+        found.insert(found.end(), active.begin(), active.end());
+    }
+}
+
+void ZRReportingService::shutDown(UniqueFunction<void()> completed) {
+    ZRReportingUtilityGetReportingServerQueue().post(
+        [service = std::weak_ptr(self_), completed = std::move(completed)]() mutable {
+            if (const auto held = service.lock()) {
+                held->endAllClients();
+                held->singleMessages_.stop();
+            }
+            completed();
+        },
+        Pace::mayBlock);
+}
+
+void ZRReportingService::endAllClients() {
+    // Each leaves the list as it ends.
+    const std::vector<ClientRef> leaving = clients_;
+    for (const ClientRef& client : leaving) {
+        client->endConnection();
+    }
+}
+
+} // namespace tamblo

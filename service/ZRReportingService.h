@@ -1,0 +1,72 @@
+#pragma once
+
+#include "base/UniqueFunction.h"
+#include "platform/ConnectionService.h"
+#include "service/SessionRegistry.h"
+#include "service/SingleMessageSessionKeeper.h"
+#include "service/ZRReportingServiceDelegateProtocol.h"
+
+#include <atomic>
+#include <cstdint>
+#include <cstdlib>
+#include <memory>
+#include <span>
+#include <vector>
+
+namespace tamblo {
+
+/// The one service: accepts every client, keeps them in order of acceptance, finds sessions across them, and
+/// owns the single-message session.
+///
+/// Made by the entry point after the platform is installed, and made the delegate of the listener. Acceptance
+/// and the connections' handlers come on other threads and only queue work; everything else happens on the
+/// reporting server queue. Destroy it only when that queue is at rest.
+class ZRReportingService final : public ListenerDelegate, public ZRReportingServiceDelegateProtocol {
+public:
+    using ExitProcess = void (*)(int status);
+
+    /// `exit` ends the process for `killService`; it may be called on any thread.
+    explicit ZRReportingService(ExitProcess exit = std::_Exit);
+    ~ZRReportingService() override;
+    ZRReportingService(const ZRReportingService&) = delete;
+    ZRReportingService& operator=(const ZRReportingService&) = delete;
+
+    bool shouldAcceptNewConnection(ClientConnection& connection) override;
+
+    /// Behind what is queued already: ends every client as if its connection had been lost and stops the
+    /// single-message session, then calls `completed`, all on the reporting server queue. Any thread, once.
+    void shutDown(UniqueFunction<void()> completed);
+
+    /// While it is off, lookups find nothing and messages are refused. No request changes it. Any thread.
+    void setReportingEnabled(bool enabled) noexcept { reportingEnabled_ = enabled; }
+    /// Null when there is none now.
+    [[nodiscard]] SessionRef singleMessageSession() const { return singleMessages_.singleMessageSession(); }
+
+    [[nodiscard]] const std::vector<ClientRef>& getAllClients() const override { return clients_; }
+    [[nodiscard]] bool isReportingEnabled() const noexcept override { return reportingEnabled_; }
+    [[nodiscard]] std::vector<SessionRef> getAllActiveReportingSessions() override;
+    [[nodiscard]] SessionRef findReportingSessionForID(ReporterID reporterID) override;
+    void findReportingSessionsForIDs(std::span<const ReporterID> reporterIDs,
+                                     std::vector<SessionRef>& found) override;
+    void removeClient(ZRReportingClientServerInstance& client) override;
+    void logReportingSessions() override;
+    void sessionChanged(const ZRReportingClientServerInstance& client, ReporterID reporterID,
+                        const SessionRef& session) override;
+    void exitProcess(int status) override { exitProcess_(status); }
+
+private:
+    void addClient(const ClientRef& client);
+    void endAllClients();
+    static void setHandlers(ClientConnection& connection, const ClientRef& client);
+
+    const ExitProcess exitProcess_;
+    std::atomic<bool> reportingEnabled_{true};
+    std::vector<ClientRef> clients_;
+    std::uint64_t lastAcceptanceOrder_ = 0;
+    SessionRegistry sessions_;
+    SingleMessageSessionKeeper singleMessages_;
+    /// Clients and queued work hold the service weakly, through this; it owns nothing.
+    std::shared_ptr<ZRReportingService> self_;
+};
+
+} // namespace tamblo

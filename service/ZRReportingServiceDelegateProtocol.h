@@ -1,0 +1,46 @@
+#pragma once
+
+#include "platform/ZRReportingServiceProtocol.h"
+
+#include <memory>
+#include <span>
+#include <vector>
+
+namespace tamblo {
+
+class ZRReportingClientServerInstance;
+class ZRReportingSession;
+
+using SessionRef = std::shared_ptr<ZRReportingSession>;
+using ClientRef = std::shared_ptr<ZRReportingClientServerInstance>;
+
+/// What a client instance needs of the service. On the reporting server queue, except the two that say
+/// otherwise.
+class ZRReportingServiceDelegateProtocol {
+public:
+    virtual ~ZRReportingServiceDelegateProtocol() = default;
+
+    /// All accepted clients, in order of acceptance.
+    [[nodiscard]] virtual const std::vector<ClientRef>& getAllClients() const = 0;
+    /// Any thread.
+    [[nodiscard]] virtual bool isReportingEnabled() const noexcept = 0;
+    /// The started sessions of all clients, client by client.
+    [[nodiscard]] virtual std::vector<SessionRef> getAllActiveReportingSessions() = 0;
+    /// The session of the first client that has one of this ID, or null. ID 0 names none.
+    [[nodiscard]] virtual SessionRef findReportingSessionForID(ReporterID reporterID) = 0;
+    /// Appends the sessions of these IDs, in their order. Without any ID: every started session, or else the
+    /// single-message session.
+    virtual void findReportingSessionsForIDs(std::span<const ReporterID> reporterIDs,
+                                             std::vector<SessionRef>& found) = 0;
+    virtual void removeClient(ZRReportingClientServerInstance& client) = 0;
+    virtual void logReportingSessions() = 0;
+
+    /// To be told after every change of what a client holds under an ID, its sessions' starts and stops
+    /// included; null when it holds nothing any more.
+    virtual void sessionChanged(const ZRReportingClientServerInstance& client, ReporterID reporterID,
+                                const SessionRef& session) = 0;
+    /// Ends the process at once. Any thread.
+    virtual void exitProcess(int status) = 0;
+};
+
+} // namespace tamblo

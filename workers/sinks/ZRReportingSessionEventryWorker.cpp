@@ -1,0 +1,64 @@
+#include "workers/sinks/ZRReportingSessionEventryWorker.h"
+
+#include "base/Format.h"
+#include "platform/Platform.h"
+#include "session/ZRReportingSession.h"
+#include "util/AudioEvents.h"
+#include "util/BoundedCache.h"
+
+#include <cstdint>
+#include <functional>
+#include <string>
+
+namespace tamblo {
+
+namespace {
+
+struct EventNames {
+    std::string general;
+    std::string ofService;
+};
+
+EventNames makeEventNames(AudioServiceType serviceType, AudioEventCategory category, AudioEventType type) {
+    const std::string categoryName = ZRReportingUtilityCategoryString(category);
+    const std::string_view typeName = ZRReportingUtilityTypeString(type);
+    const std::string_view serviceName = ZRReportingUtilityGenerateServiceNameFromServiceType(serviceType);
+    return {formatted("com.vandra.tamblo.{}.{}", categoryName, typeName),
+            formatted("com.vandra.{}.{}.{}", serviceName, categoryName, typeName)};
+}
+
+const EventNames& eventNames(AudioServiceType serviceType, AudioEventCategory category, AudioEventType type) {
+    // One for each thread that does session work: the names of a device's events are few.
+    static thread_local BoundedCache<EventNames> names;
+    // Service types without a name are one; the key is then 53 bits, and never 0.
+    constexpr std::uint64_t kNoName = 31;
+    const std::uint64_t service = serviceType <= AudioServiceTypeSystemSounds ? serviceType : kNoName;
+    const std::uint64_t key = ((service + 1) << 48U) | (std::uint64_t{category} << 16U) | type;
+    return names.get(key, [&] { return makeEventNames(serviceType, category, type); });
+}
+
+void offer(const std::string& eventName, const ZRReportingSessionMessage& message) {
+    AnalyticsEventService& service = platform().analyticsEvents;
+    if (service.isEventInUse(eventName)) {
+        service.sendEventLazy(eventName, [&message] { return message.payload(); });
+    }
+}
+
+} // namespace
+
+std::shared_ptr<ZRReportingSessionWorkerProtocol>
+ZRReportingSessionEventryWorker::initWithSession(const std::shared_ptr<ZRReportingSession>& session) {
+    return std::make_shared<ZRReportingSessionEventryWorker>(session);
+}
+
+void ZRReportingSessionEventryWorker::handleMessage(const MessageRef& message) {
+    const std::shared_ptr<ZRReportingSession> owner = session();
+    if (owner == nullptr) {
+        return;
+    }
+    const EventNames& names = eventNames(owner->serviceType(), message->category(), message->type());
+    offer(names.general, *message);
+    offer(names.ofService, *message);
+}
+
+} // namespace tamblo

@@ -1,0 +1,21 @@
+#pragma once
+
+#include "session/ZRReportingSessionWorkerProtocol.h"
+
+#include <memory>
+
+namespace tamblo {
+
+/// Offers every message that is not redundant to the analytics-event service, under two names: one of the
+/// category and type, and one that adds the session's service name. The service decides which it wants; a
+/// payload is handed over, as it stands then, only for a name that is in use.
+class ZRReportingSessionEventryWorker final : public ZRReportingSessionWorkerConsumerProtocol {
+public:
+    using ZRReportingSessionWorkerConsumerProtocol::ZRReportingSessionWorkerConsumerProtocol;
+    [[nodiscard]] static std::shared_ptr<ZRReportingSessionWorkerProtocol>
+    initWithSession(const std::shared_ptr<ZRReportingSession>& session);
+
+    void handleMessage(const MessageRef& message) override;
+};
+
+} // namespace tamblo
