@@ -1,0 +1,27 @@
+#include "tests/fakes/FakePlatform.h"
+
+#include "util/InternalBuild.h"
+#include "util/LogCategories.h"
+#include "util/ReportingServerQueue.h"
+
+namespace tamblo {
+
+FakePlatform::FakePlatform(LogLevel threshold, bool isInternalBuild) {
+    log.setThreshold(threshold);
+    deviceProperties.set("InternalBuild", isInternalBuild);
+    installPlatform({clock, workQueues, log, tracePoints, deviceProperties, preferences, processInformation,
+                     analyticsEvents, connections});
+    forgetLogThresholds();
+    forgetInternalBuild();
+    resetReportingServerQueue();
+}
+
+FakePlatform::~FakePlatform() {
+    resetReportingServerQueue();
+}
+
+FakeSerialQueue& FakePlatform::serverQueue() {
+    return static_cast<FakeSerialQueue&>(ZRReportingUtilityGetReportingServerQueue());
+}
+
+} // namespace tamblo

@@ -1,0 +1,40 @@
+#pragma once
+
+#include "platform/Platform.h"
+#include "tests/fakes/FakeAnalyticsEventService.h"
+#include "tests/fakes/FakeClock.h"
+#include "tests/fakes/FakeConnectionService.h"
+#include "tests/fakes/FakeDeviceProperties.h"
+#include "tests/fakes/FakeLog.h"
+#include "tests/fakes/FakePreferences.h"
+#include "tests/fakes/FakeProcessInformation.h"
+#include "tests/fakes/FakeTracePoints.h"
+#include "tests/fakes/FakeWorkQueues.h"
+
+namespace tamblo {
+
+/// A device in memory. Installed for as long as it lives; one at a time, and what a test makes on it goes
+/// first.
+class FakePlatform {
+public:
+    /// Lines from this level on are written; without an internal build unless it is asked for.
+    explicit FakePlatform(LogLevel threshold = LogLevel::debug, bool isInternalBuild = false);
+    ~FakePlatform();
+    FakePlatform(const FakePlatform&) = delete;
+    FakePlatform& operator=(const FakePlatform&) = delete;
+
+    /// The process's reporting server queue, which runs when told.
+    [[nodiscard]] FakeSerialQueue& serverQueue();
+
+    FakeClock clock;
+    FakeWorkQueues workQueues;
+    FakeLog log;
+    FakeTracePoints tracePoints;
+    FakeDeviceProperties deviceProperties;
+    FakePreferences preferences;
+    FakeProcessInformation processInformation;
+    FakeAnalyticsEventService analyticsEvents;
+    FakeConnectionService connections;
+};
+
+} // namespace tamblo

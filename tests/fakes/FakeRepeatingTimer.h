@@ -1,0 +1,30 @@
+#pragma once
+
+#include "platform/WorkQueue.h"
+
+#include <chrono>
+#include <functional>
+#include <memory>
+
+namespace tamblo {
+
+/// Ticks when a test says so. The tick survives the timer while it runs, so that it may destroy the timer.
+class FakeRepeatingTimer final : public RepeatingTimer {
+public:
+    struct State {
+        std::chrono::milliseconds interval;
+        UniqueFunction<void()> tick;
+        bool isRunning = false;
+    };
+
+    explicit FakeRepeatingTimer(std::shared_ptr<State> state) : state_(std::move(state)) {}
+    ~FakeRepeatingTimer() override { state_->isRunning = false; }
+
+    void start() override { state_->isRunning = true; }
+    void invalidate() override { state_->isRunning = false; }
+
+private:
+    const std::shared_ptr<State> state_;
+};
+
+} // namespace tamblo
