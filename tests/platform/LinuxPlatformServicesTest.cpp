@@ -20,6 +20,7 @@
 namespace tamblo {
 namespace {
 
+using namespace std::string_view_literals;
 using testing::AllOf;
 using testing::ElementsAre;
 using testing::HasSubstr;
@@ -191,7 +192,7 @@ TEST_F(LinuxPreferencesTest, AMalformedFileIsAbsentAndToldOncePerState) {
 TEST_F(LinuxPreferencesTest, ADomainNameIsNoPath) {
     directory_.write("outside.json", R"({"k": 1})");
     directory_.write("preferences/.hidden.json", R"({"k": 1})");
-    for (const std::string_view domain : {"../outside", ".hidden", "", std::string_view("d\0x", 3), "/etc/x"}) {
+    for (const std::string_view domain : {"../outside"sv, ".hidden"sv, ""sv, "d\0x"sv, "/etc/x"sv}) {
         EXPECT_EQ(value("k", domain), -1) << domain;
     }
     EXPECT_THAT(log_.take(), IsEmpty());
