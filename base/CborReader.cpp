@@ -522,7 +522,7 @@ bool CborReader::buildDictionary(Dictionary& dictionary, std::size_t firstEntry,
             return fail(CborError::duplicateKey);
         }
     }
-    KeySetRef keys = KeySet::make(sorted);
+    KeySetRef keys = sorted.empty() ? KeySet::empty() : KeySet::make(sorted);
     dictionary = Dictionary::adopt(keys, values, places, spare);
     if (slot != nullptr && sorted.size() <= kMostRememberedKeys && keyBytes <= kMostRememberedKeyBytes) {
         slot->reset(new KeySetCache::Shape{hash, std::move(keys), std::move(places)});

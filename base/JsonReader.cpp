@@ -43,8 +43,8 @@ JsonError errorAt(std::string_view text, std::size_t offset, std::string message
     return error;
 }
 
-/// Whether a number that no double can hold is too small for one, not too large: what counts is the power of ten
-/// in front of which its first digit that is not 0 stands.
+/// Whether a number that no double can hold is too small for one, not too large: what counts is the power of
+/// ten in front of which its first digit that is not 0 stands.
 bool isTiny(std::string_view number) noexcept {
     const std::size_t exponentAt = std::min(number.find_first_of("eE"), number.size());
     const std::string_view digits = number.substr(0, exponentAt);
@@ -66,7 +66,8 @@ bool isTiny(std::string_view number) noexcept {
     if (result.ec != std::errc()) {
         return negative;
     }
-    return (negative ? -exponent : exponent) + static_cast<std::int64_t>(point) - static_cast<std::int64_t>(first) <
+    return (negative ? -exponent : exponent) + static_cast<std::int64_t>(point) -
+               static_cast<std::int64_t>(first) <
            0;
 }
 
@@ -445,7 +446,8 @@ bool Reader::buildDictionary(std::vector<Member>& members, Item& item) {
     const auto twice = std::adjacent_find(members.begin(), members.end(),
                                           [](const Member& a, const Member& b) { return a.key == b.key; });
     if (twice != members.end()) {
-        return failAt(std::next(twice)->offset, formatted("the key \"{}\" stands here a second time", twice->key));
+        return failAt(std::next(twice)->offset,
+                      formatted("the key \"{}\" stands here a second time", twice->key));
     }
     std::vector<std::string_view> keys;
     std::vector<Value> values;

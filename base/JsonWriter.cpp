@@ -36,15 +36,15 @@ char escapeOf(char character) noexcept {
     return kEscapes[static_cast<unsigned char>(character)];
 }
 
-/// Whether one of the eight bytes needs an escape: each test sets the high bit of the bytes that it finds, and
-/// may do so for others only next to one that it found.
+/// Whether one of the eight bytes needs an escape: each test sets the high bit of the bytes that it finds,
+/// and may do so for others only next to one that it found.
 bool anyNeedsEscape(std::uint64_t block) noexcept {
     constexpr std::uint64_t ones = 0x0101'0101'0101'0101;
     constexpr std::uint64_t highBits = ones * 0x80;
     const std::uint64_t quote = block ^ (ones * '"');
     const std::uint64_t backslash = block ^ (ones * '\\');
-    const std::uint64_t found = ((block - ones * 0x20) & ~block) | ((quote - ones) & ~quote) |
-                                ((backslash - ones) & ~backslash);
+    const std::uint64_t found =
+        ((block - ones * 0x20) & ~block) | ((quote - ones) & ~quote) | ((backslash - ones) & ~backslash);
     return (found & highBits) != 0;
 }
 
@@ -90,9 +90,9 @@ template <typename Number> char* writeNumber(char* to, Number number) noexcept {
     return std::to_chars(to, to + kScalarRoom, number).ptr;
 }
 
-/// Writes a number of few decimals, as most measurements are, without the general algorithm; nothing for others.
-/// Among the decimals of as few digits as the type holds exactly, no two read as the same number: the one that reads
-/// back is therefore the shortest.
+/// Writes a number of few decimals, as most measurements are, without the general algorithm; nothing for
+/// others. Among the decimals of as few digits as the type holds exactly, no two read as the same number: the
+/// one that reads back is therefore the shortest.
 template <typename Float> char* writeShortDecimal(char* to, Float number) noexcept {
     constexpr bool isSingle = std::is_same_v<Float, float>;
     constexpr std::uint32_t scale = isSingle ? 1'000 : 1'000'000;

@@ -13,7 +13,8 @@ bool isContinuation(Byte byte) noexcept {
     return (byte & 0xC0U) == 0x80U;
 }
 
-/// The length of the well-formed sequence at `at`, which begins with a byte above ASCII; 0 when there is none.
+/// The length of the well-formed sequence at `at`, which begins with a byte above ASCII; 0 when there is
+/// none.
 std::size_t sequenceLength(const Byte* at, std::size_t available) noexcept {
     const Byte lead = at[0];
     if (lead < 0xC2 || lead > 0xF4) {

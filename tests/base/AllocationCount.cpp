@@ -21,21 +21,22 @@ static void* allocate(std::size_t size) noexcept {
 
 } // namespace tamblo::test
 
-void* operator new(std::size_t size) {
+// Weak, as the runtime of a sanitizer may bring its own; nothing is counted then.
+[[gnu::weak]] void* operator new(std::size_t size) {
     if (void* const block = tamblo::test::allocate(size)) {
         return block;
     }
     throw std::bad_alloc();
 }
-void* operator new(std::size_t size, const std::nothrow_t&) noexcept {
+[[gnu::weak]] void* operator new(std::size_t size, const std::nothrow_t&) noexcept {
     return tamblo::test::allocate(size);
 }
-void operator delete(void* block) noexcept {
+[[gnu::weak]] void operator delete(void* block) noexcept {
     std::free(block);
 }
-void operator delete(void* block, std::size_t) noexcept {
+[[gnu::weak]] void operator delete(void* block, std::size_t) noexcept {
     std::free(block);
 }
-void operator delete(void* block, const std::nothrow_t&) noexcept {
+[[gnu::weak]] void operator delete(void* block, const std::nothrow_t&) noexcept {
     std::free(block);
 }

@@ -200,7 +200,8 @@ TEST(Dictionary, AValueOfItsOwnCanBeSet) {
     EXPECT_EQ(dictionary.valueAt(0), dictionary.valueAt(4));
 
     // Stepping down into what only the assigned one holds, and merging it in.
-    const Dictionary inner{{"b", "another text that does not lie in the value itself"}, {"c", 2}, {"inner", 1}};
+    const Dictionary inner{
+        {"b", "another text that does not lie in the value itself"}, {"c", 2}, {"inner", 1}};
     Dictionary outer = Dictionary{{"inner", inner.deepCopy()}}.deepCopy();
     outer.merge(outer.find("inner")->dictionaryValue());
     EXPECT_EQ(outer, inner);
@@ -231,6 +232,9 @@ TEST(Dictionary, MergesManyNewKeysAtOnce) {
 }
 
 TEST(Dictionary, AllocatesOnlyForWhatIsNew) {
+    if (test::allocationsOf([] { ::operator delete(::operator new(1)); }).blocks == 0) {
+        GTEST_SKIP() << "this build counts no allocations";
+    }
     Dictionary previous{{"a", 1}, {"b", 2}, {"c", 3}};
     const Dictionary update{{"a", 4}, {"c", "short"}};
     EXPECT_EQ(test::allocationsOf([&] { EXPECT_NE(previous.find("b"), nullptr); }).blocks, 0U);

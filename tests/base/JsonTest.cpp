@@ -62,8 +62,7 @@ TEST(JsonWriter, WritesEveryKind) {
         {Array{}, "[]"},
         {Array{1, Array{"a"}, 2.0}, R"([1,["a"],2.0])"},
         {Dictionary{}, "{}"},
-        {Dictionary{{"b", 1}, {"a\n", Dictionary{{"", "x"}}}}, R"({"a\n":{"":"x"},"b":1})"},
-    };
+        {Dictionary{{"b", 1}, {"a\n", Dictionary{{"", "x"}}}}, R"({"a\n":{"":"x"},"b":1})"}};
     for (const auto& [value, text] : rows) {
         EXPECT_EQ(jsonText(value), text);
     }
@@ -97,10 +96,12 @@ TEST(JsonWriter, FloatsReadBackTheSame) {
             const std::string text = jsonText(Value(number));
             float back = 0;
             const auto result = std::from_chars(text.data(), text.data() + text.size(), back);
-            EXPECT_TRUE(std::isfinite(number) ? back == number && *result.ptr == '\0' : text == "null") << text;
+            EXPECT_TRUE(std::isfinite(number) ? back == number && *result.ptr == '\0' : text == "null")
+                << text;
             EXPECT_LE(text.size(), 17U) << text;
         }
-        const double number = std::ldexp(static_cast<double>(random() >> 11U), static_cast<int>(random() % 120) - 90);
+        const double number =
+            std::ldexp(static_cast<double>(random() >> 11U), static_cast<int>(random() % 120) - 90);
         TextBuffer out;
         appendJsonNumber(out, number);
         double back = 0;
@@ -147,11 +148,11 @@ TEST(JsonReader, ReadsWhatIsJson) {
                  value = Value(Array{value});
              }
              return value;
-         }()},
-    };
+         }()}};
     for (const auto& [text, expected] : rows) {
         const auto outcome = readJson(text);
-        ASSERT_TRUE(std::holds_alternative<Value>(outcome)) << text << ": " << std::get<JsonError>(outcome).message;
+        ASSERT_TRUE(std::holds_alternative<Value>(outcome))
+            << text << ": " << std::get<JsonError>(outcome).message;
         EXPECT_EQ(std::get<Value>(outcome), expected) << text;
         EXPECT_EQ(std::get<Value>(outcome).kind(), expected.kind()) << text;
     }
@@ -211,8 +212,7 @@ TEST(JsonReader, SaysWhatIsWrongAndWhere) {
         {"{\"\xFF\":1}", 1, 2, "UTF-8"},
         {repeated("[", 33) + repeated("]", 33), 1, 33, "deeper than 32"},
         {repeated("{\"\":", 200'000), 1, 129, "deeper than 32"},
-        {"// c\n1", 1, 1, "'/'"},
-    };
+        {"// c\n1", 1, 1, "'/'"}};
     for (const Row& row : rows) {
         const auto outcome = readJson(row.text);
         ASSERT_TRUE(std::holds_alternative<JsonError>(outcome)) << row.text;
@@ -263,7 +263,8 @@ TEST(Json, AcceptsNoMoreThanAnIndependentImplementation) {
         if (!ours && !theirs.is_discarded()) {
             const std::string message = std::get<JsonError>(readJson(text)).message;
             EXPECT_TRUE(message.find("second time") != std::string::npos ||
-                        message.find("null") != std::string::npos) << text << ": " << message;
+                        message.find("null") != std::string::npos)
+                << text << ": " << message;
         }
     }
 }

@@ -13,8 +13,8 @@
 
 namespace tamblo::test {
 
-/// Values at random from a seed: every kind, every length around the limits of what is stored in place, numbers of
-/// every magnitude.
+/// Values at random from a seed: every kind, every length around the limits of what is stored in place,
+/// numbers of every magnitude.
 class RandomValues {
 public:
     explicit RandomValues(std::uint32_t seed) : random_(seed) {}
@@ -63,8 +63,9 @@ public:
     }
 
     std::string text() {
-        static const std::vector<std::string> pieces{"a", "Z", "0", " ", "\"", "\\", "/",  "\n", std::string(1, '\0'),
-                                                     "\x1f", "\x7f", "é", "水", "𐅑", "reporting", "\t"};
+        static const std::vector<std::string> pieces{
+            "a",    "Z",    "0", " ",  "\"", "\\",        "/", "\n", std::string(1, '\0'),
+            "\x1f", "\x7f", "é", "水", "𐅑",  "reporting", "\t"};
         std::string text;
         for (std::size_t i = below(22); i > 0; --i) {
             text += pieces[below(4) == 0 ? below(pieces.size()) : below(3)];
@@ -82,7 +83,8 @@ private:
     Value real(bool onlyJson) {
         double number = std::bit_cast<double>(random_());
         if (below(3) != 0 || !std::isfinite(number)) {
-            number = static_cast<double>(static_cast<std::int64_t>(bits())) / static_cast<double>(1U << below(20));
+            number =
+                static_cast<double>(static_cast<std::int64_t>(bits())) / static_cast<double>(1U << below(20));
         }
         return !onlyJson && below(2) == 0 ? Value(static_cast<float>(number)) : Value(number);
     }

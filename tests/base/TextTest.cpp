@@ -25,7 +25,8 @@ TEST(Format, PutsArgumentsInTheirPlaces) {
     EXPECT_EQ(formatted("nothing"), "nothing");
     EXPECT_EQ(formatted("{}{}", 1, "a"), "1a");
     EXPECT_EQ(formatted("a={} b={}, {{}", -5, true, std::string("{}")), "a=-5 b=1, {{}");
-    EXPECT_EQ(formatted("{}/{}", std::numeric_limits<std::int64_t>::min(), std::numeric_limits<std::uint64_t>::max()),
+    EXPECT_EQ(formatted("{}/{}", std::numeric_limits<std::int64_t>::min(),
+                        std::numeric_limits<std::uint64_t>::max()),
               "-9223372036854775808/18446744073709551615");
     EXPECT_EQ(formatted("{} {} {}", 1.5, 0.1F, -0.0), "1.500000 0.100000 -0.000000");
     EXPECT_EQ(formatted("{} {} {}", fixed(2.675, 1), fixed(2.5, 0), fixed(-0.125, 2)), "2.7 2 -0.12");
@@ -55,56 +56,60 @@ TEST(TextBuffer, GrowsAndGivesBack) {
 }
 
 TEST(Utf8, TellsWhatIsWellFormed) {
-    const std::vector<std::pair<std::string, bool>> rows{
-        {"", true},
-        {"ascii \x7f", true},
-        {"\xC2\x80", true},
-        {"\xDF\xBF", true},
-        {"\xE0\xA0\x80", true},
-        {"\xED\x9F\xBF", true},
-        {"\xEE\x80\x80", true},
-        {"\xEF\xBF\xBF", true},
-        {"\xF0\x90\x80\x80", true},
-        {"\xF4\x8F\xBF\xBF", true},
-        {"\x80", false},
-        {"\xBF", false},
-        {"\xC0\x80", false},
-        {"\xC1\xBF", false},
-        {"\xC2", false},
-        {"\xC2\x41", false},
-        {"\xC2\xC2\x80", false},
-        {"\xE0\x9F\xBF", false},
-        {"\xE6\xB0", false},
-        {"\xED\xA0\x80", false},
-        {"\xED\xBF\xBF", false},
-        {"\xF0\x8F\xBF\xBF", false},
-        {"\xF0\x90\x85", false},
-        {"\xF4\x90\x80\x80", false},
-        {"\xF5\x80\x80\x80", false},
-        {"\xFF", false},
-    };
-    for (const auto& [text, expected] : rows) {
-        for (std::size_t before = 0; before < 17; ++before) {
-            for (const std::size_t behind : {0U, 1U, 8U}) {
-                EXPECT_EQ(isUtf8(std::string(before, 'a') + text + std::string(behind, 'z')), expected)
-                    << testing::PrintToString(text) << " behind " << before;
+    const std::vector<std::string> wellFormed{"",
+                                              "ascii \x7f",
+                                              "\xC2\x80",
+                                              "\xDF\xBF",
+                                              "\xE0\xA0\x80",
+                                              "\xED\x9F\xBF",
+                                              "\xEE\x80\x80",
+                                              "\xEF\xBF\xBF",
+                                              "\xF0\x90\x80\x80",
+                                              "\xF4\x8F\xBF\xBF"};
+    const std::vector<std::string> malformed{"\x80",
+                                             "\xBF",
+                                             "\xC0\x80",
+                                             "\xC1\xBF",
+                                             "\xC2",
+                                             "\xC2\x41",
+                                             "\xC2\xC2\x80",
+                                             "\xE0\x9F\xBF",
+                                             "\xE6\xB0",
+                                             "\xED\xA0\x80",
+                                             "\xED\xBF\xBF",
+                                             "\xF0\x8F\xBF\xBF",
+                                             "\xF0\x90\x85",
+                                             "\xF4\x90\x80\x80",
+                                             "\xF5\x80\x80\x80",
+                                             "\xFF"};
+    for (const bool expected : {true, false}) {
+        for (const std::string& text : expected ? wellFormed : malformed) {
+            for (std::size_t before = 0; before < 17; ++before) {
+                for (const char* behind : {"", "z", "zzzzzzzz"}) {
+                    EXPECT_EQ(isUtf8(std::string(before, 'a') + text + behind), expected)
+                        << testing::PrintToString(text) << " behind " << before;
+                }
             }
         }
     }
 }
 
 TEST(Base64, ReadsAndWritesTheExamplesOfTheStandard) {
-    const std::vector<std::pair<std::string, std::string>> rows{
-        {"", ""},         {"f", "Zg=="},         {"fo", "Zm8="},         {"foo", "Zm9v"},
-        {"foob", "Zm9vYg=="}, {"fooba", "Zm9vYmE="}, {"foobar", "Zm9vYmFy"}, {"\xFB\xFF\xBF", "+/+/"},
-    };
+    const std::vector<std::pair<std::string, std::string>> rows{{"", ""},
+                                                                {"f", "Zg=="},
+                                                                {"fo", "Zm8="},
+                                                                {"foo", "Zm9v"},
+                                                                {"foob", "Zm9vYg=="},
+                                                                {"fooba", "Zm9vYmE="},
+                                                                {"foobar", "Zm9vYmFy"},
+                                                                {"\xFB\xFF\xBF", "+/+/"}};
     for (const auto& [plain, text] : rows) {
         const std::vector<std::uint8_t> bytes(plain.begin(), plain.end());
         EXPECT_EQ(encodeBase64(bytes), text);
         EXPECT_EQ(decodeBase64(text), bytes);
     }
-    for (const char* text : {"Z", "Zg", "Zg=", "Zg===", "=", "====", "Z===", "Zh==", "Zm9=", "Zm-_", "Zm9v\n", " Zm9v",
-                             "Zg==Zg==", "Zm=v"}) {
+    for (const char* text : {"Z", "Zg", "Zg=", "Zg===", "=", "====", "Z===", "Zh==", "Zm9=", "Zm-_", "Zm9v\n",
+                             " Zm9v", "Zg==Zg==", "Zm=v"}) {
         EXPECT_EQ(decodeBase64(text), std::nullopt) << text;
     }
 }
@@ -134,8 +139,7 @@ TEST(Rfc3339, WritesTimes) {
         {infinity, nullptr},
         {-infinity, nullptr},
         {std::numeric_limits<double>::quiet_NaN(), nullptr},
-        {1e300, nullptr},
-    };
+        {1e300, nullptr}};
     for (const auto& [seconds, text] : rows) {
         const auto written = formatRfc3339(seconds);
         EXPECT_EQ(written, text == nullptr ? std::nullopt : std::optional<std::string>(text)) << seconds;
@@ -146,7 +150,7 @@ TEST(Rfc3339, WritesTimes) {
 }
 
 TEST(Rfc3339, ReadsTimes) {
-    const std::vector<std::pair<const char*, std::optional<double>>> rows{
+    const std::vector<std::pair<const char*, double>> rows{
         {"1970-01-01T00:00:00Z", 0},
         {"1970-01-01t00:00:00z", 0},
         {"1970-01-01T01:30:00+01:30", 0},
@@ -157,31 +161,32 @@ TEST(Rfc3339, ReadsTimes) {
         {"1990-12-31T23:59:60Z", 662688000},
         {"1990-12-31T15:59:60-08:00", 662688000},
         {"1970-01-01T00:00:00.123456789012345678901Z", 0.123456789012345678901},
-        {"1969-12-31T23:59:59.5Z", -0.5},
-        {"", {}},
-        {"1970-01-01", {}},
-        {"1970-01-01T00:00:00", {}},
-        {"1970-01-01T00:00Z", {}},
-        {"1970-01-01 00:00:00Z", {}},
-        {"1970-01-01T00:00:00.Z", {}},
-        {"1970-01-01T00:00:00,5Z", {}},
-        {"1970-01-01T00:00:00+0100", {}},
-        {"1970-01-01T00:00:00+24:00", {}},
-        {"1970-01-01T24:00:00Z", {}},
-        {"1970-01-01T00:60:00Z", {}},
-        {"1970-01-01T00:00:61Z", {}},
-        {"1970-01-01T12:00:60Z", {}},
-        {"1970-02-29T00:00:00Z", {}},
-        {"1970-13-01T00:00:00Z", {}},
-        {"1970-00-01T00:00:00Z", {}},
-        {"1970-01-00T00:00:00Z", {}},
-        {"1970-1-01T00:00:00Z", {}},
-        {"-970-01-01T00:00:00Z", {}},
-        {"1970-01-01T00:00:00Z ", {}},
-        {"1970-01-01T00:00:00ZZ", {}},
-    };
+        {"1969-12-31T23:59:59.5Z", -0.5}};
     for (const auto& [text, expected] : rows) {
         EXPECT_EQ(parseRfc3339(text), expected) << text;
+    }
+    for (const char* text : {"",
+                             "1970-01-01",
+                             "1970-01-01T00:00:00",
+                             "1970-01-01T00:00Z",
+                             "1970-01-01 00:00:00Z",
+                             "1970-01-01T00:00:00.Z",
+                             "1970-01-01T00:00:00,5Z",
+                             "1970-01-01T00:00:00+0100",
+                             "1970-01-01T00:00:00+24:00",
+                             "1970-01-01T24:00:00Z",
+                             "1970-01-01T00:60:00Z",
+                             "1970-01-01T00:00:61Z",
+                             "1970-01-01T12:00:60Z",
+                             "1970-02-29T00:00:00Z",
+                             "1970-13-01T00:00:00Z",
+                             "1970-00-01T00:00:00Z",
+                             "1970-01-00T00:00:00Z",
+                             "1970-1-01T00:00:00Z",
+                             "-970-01-01T00:00:00Z",
+                             "1970-01-01T00:00:00Z ",
+                             "1970-01-01T00:00:00ZZ"}) {
+        EXPECT_EQ(parseRfc3339(text), std::nullopt) << text;
     }
 }
 

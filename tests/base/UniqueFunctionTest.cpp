@@ -20,9 +20,8 @@ TEST(UniqueFunction, HoldsMovesAndDestroysItsTarget) {
                 return ++*token + *add + ballast[99];
             };
         } else {
-            const auto spent = test::allocationsOf([&] {
-                function = [token](std::unique_ptr<int> add) { return ++*token + *add; };
-            });
+            const auto spent = test::allocationsOf(
+                [&] { function = [token](std::unique_ptr<int> add) { return ++*token + *add; }; });
             EXPECT_EQ(spent.blocks, 0U);
         }
         token.reset();

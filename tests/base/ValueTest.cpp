@@ -1,5 +1,5 @@
-#include "base/Dictionary.h"
 #include "base/Value.h"
+#include "base/Dictionary.h"
 
 #include <gtest/gtest.h>
 
@@ -49,8 +49,7 @@ TEST(Value, NumbersAreEqualByValueAcrossKinds) {
         {Value(Array{1, "b"})},
         {Value(Array{1})},
         {Value(Dictionary{{"a", 1}}), Value(Dictionary{{"a", true}})},
-        {Value(Dictionary{{"b", 1}})},
-    };
+        {Value(Dictionary{{"b", 1}})}};
     for (std::size_t i = 0; i < classes.size(); ++i) {
         for (std::size_t j = 0; j < classes.size(); ++j) {
             for (const Value& a : classes[i]) {
@@ -100,8 +99,7 @@ TEST(Value, ReadingANumberNeverFails) {
         {Value::date(5), 0, 0, 0, false},
         {Value::data(std::vector<std::uint8_t>{'1'}), 0, 0, 0, false},
         {Value(Array{1}), 0, 0, 0, false},
-        {Value(Dictionary{{"a", 1}}), 0, 0, 0, false},
-    };
+        {Value(Dictionary{{"a", 1}}), 0, 0, 0, false}};
     for (std::size_t i = 0; i < rows.size(); ++i) {
         EXPECT_DOUBLE_EQ(rows[i].value.doubleValue(), rows[i].real) << "row " << i;
         EXPECT_EQ(rows[i].value.integerValue(), rows[i].integer) << "row " << i;
