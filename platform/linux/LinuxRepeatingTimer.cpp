@@ -38,6 +38,8 @@ LinuxRepeatingTimer::~LinuxRepeatingTimer() {
 }
 
 void LinuxRepeatingTimer::start() {
+    // The thread waits for this lock first: a tick that drops the timer finds the thread in its place.
+    const std::lock_guard lock(state_->mutex);
     thread_ = std::thread([state = state_] { run(*state); });
 }
 

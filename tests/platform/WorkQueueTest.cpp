@@ -1,0 +1,186 @@
+#include "platform/linux/LinuxSerialQueue.h"
+#include "platform/linux/LinuxWorkQueues.h"
+
+#include <gtest/gtest.h>
+
+#include <algorithm>
+#include <atomic>
+#include <chrono>
+#include <filesystem>
+#include <future>
+#include <latch>
+#include <memory>
+#include <string>
+#include <thread>
+#include <vector>
+
+namespace tamblo {
+namespace {
+
+constexpr std::chrono::seconds kPatience{20};
+
+/// Waits for everything posted before.
+void settle(SerialQueue& queue) {
+    std::promise<void> done;
+    queue.post([&done] { done.set_value(); });
+    ASSERT_EQ(done.get_future().wait_for(kPatience), std::future_status::ready);
+}
+
+TEST(SerialQueue, RunsWorkOfManyThreadsOneAtATimeInTheirOrder) {
+    LinuxWorkQueues queues;
+    const auto queue = queues.makeSerialQueue("order");
+    constexpr int kThreads = 4;
+    constexpr int kEach = 2000;
+    std::vector<std::vector<int>> seen(kThreads); // unguarded: the queue is the guard
+    std::vector<std::thread> threads;
+    for (int thread = 0; thread < kThreads; ++thread) {
+        threads.emplace_back([&, thread] {
+            for (int i = 0; i < kEach; ++i) {
+                queue->post([&, thread, i] { seen[static_cast<std::size_t>(thread)].push_back(i); },
+                            i % 100 == 0 ? Pace::mayBlock : Pace::quick);
+            }
+        });
+    }
+    for (std::thread& thread : threads) {
+        thread.join();
+    }
+    settle(*queue);
+    for (const std::vector<int>& ofThread : seen) {
+        ASSERT_EQ(ofThread.size(), static_cast<std::size_t>(kEach));
+        EXPECT_TRUE(std::is_sorted(ofThread.begin(), ofThread.end()));
+    }
+}
+
+TEST(SerialQueue, QuickWorkIsDrainedByThePosterInOneBatch) {
+    LinuxWorkQueues queues;
+    const auto queue = queues.makeSerialQueue("inline");
+    std::string trace;
+    const std::thread::id me = std::this_thread::get_id();
+    bool allHere = true;
+    queue->setBatchEnd([&] { trace += "|"; });
+    InlineDrain drain;
+    for (const char letter : {'a', 'b', 'c'}) {
+        queue->post([&, letter] {
+            trace += letter;
+            allHere = allHere && std::this_thread::get_id() == me;
+            if (letter == 'a') {
+                queue->post([&] { trace += 'd'; });
+            }
+        });
+    }
+    EXPECT_EQ(trace, "");
+    drain.drain();
+    EXPECT_EQ(trace, "abc|d|");
+    EXPECT_TRUE(allHere);
+}
+
+TEST(SerialQueue, WorkThatMayBlockLeavesThePosterAndTakesWhatFollowsAlong) {
+    LinuxWorkQueues queues;
+    const auto queue = queues.makeSerialQueue("hand over");
+    std::string trace;
+    std::vector<std::thread::id> threads;
+    std::latch mayGoOn(1);
+    const auto step = [&](char letter) {
+        return [&, letter] {
+            trace += letter;
+            threads.push_back(std::this_thread::get_id());
+        };
+    };
+    {
+        InlineDrain drain;
+        queue->post(step('a'));
+        queue->post(
+            [&] {
+                mayGoOn.wait();
+                step('b')();
+            },
+            Pace::mayBlock);
+        queue->post(step('c'));
+        drain.drain(); // returns although b has not run
+        mayGoOn.count_down();
+    }
+    settle(*queue);
+    EXPECT_EQ(trace, "abc");
+    const std::thread::id me = std::this_thread::get_id();
+    EXPECT_EQ(threads[0], me);
+    EXPECT_NE(threads[1], me);
+    EXPECT_NE(threads[2], me);
+}
+
+TEST(SerialQueue, ManyQueuesShareFewThreadsThatGrowWhileWorkBlocks) {
+    LinuxWorkQueues queues;
+    std::vector<std::unique_ptr<SerialQueue>> blocked;
+    constexpr std::size_t kBlocked = 8;
+    std::latch allBlocked(kBlocked);
+    std::latch mayGoOn(1);
+    for (std::size_t i = 0; i < kBlocked; ++i) {
+        blocked.push_back(queues.makeSerialQueue("blocked"));
+        blocked.back()->post([&] {
+            allBlocked.count_down();
+            mayGoOn.wait();
+        });
+    }
+    allBlocked.wait();
+
+    std::vector<std::unique_ptr<SerialQueue>> many;
+    std::atomic<int> ran{0};
+    for (int i = 0; i < 10'000; ++i) {
+        many.push_back(queues.makeSerialQueue("one of many"));
+        many.back()->post([&ran] { ++ran; });
+    }
+    for (const auto& queue : many) {
+        settle(*queue);
+    }
+    EXPECT_EQ(ran, 10'000);
+    const auto tasks = std::distance(std::filesystem::directory_iterator("/proc/self/task"),
+                                     std::filesystem::directory_iterator());
+    EXPECT_LE(tasks, static_cast<std::ptrdiff_t>(ThreadPool::kMaximumThreads) + 4);
+    mayGoOn.count_down();
+}
+
+TEST(SerialQueue, DestroyingItFinishesWhatWasPosted) {
+    LinuxWorkQueues queues;
+    auto queue = queues.makeSerialQueue("last words");
+    std::atomic<int> ran{0};
+    for (int i = 0; i < 1000; ++i) {
+        queue->post([&ran] { ++ran; });
+    }
+    queue.reset();
+    EXPECT_EQ(ran, 1000);
+}
+
+TEST(RepeatingTimer, TicksUntilItIsInvalidatedEvenByItsOwnTick) {
+    LinuxWorkQueues queues;
+    std::atomic<int> tickEnds{0};
+    queues.setTickEnd([&tickEnds] { ++tickEnds; });
+    std::promise<void> dropped;
+    std::unique_ptr<RepeatingTimer> timer;
+    int ticks = 0;
+    timer = queues.makeRepeatingTimer(std::chrono::milliseconds(1), [&] {
+        if (++ticks == 3) {
+            timer.reset();
+            dropped.set_value();
+        }
+    });
+    timer->start();
+    ASSERT_EQ(dropped.get_future().wait_for(kPatience), std::future_status::ready);
+
+    std::atomic<bool> isTicking{false};
+    std::atomic<bool> hasEnded{false};
+    auto other = queues.makeRepeatingTimer(std::chrono::milliseconds(1), [&] {
+        isTicking = true;
+        std::this_thread::sleep_for(std::chrono::milliseconds(20));
+        hasEnded = true;
+    });
+    other->start();
+    while (!isTicking) {
+        std::this_thread::yield();
+    }
+    other.reset();
+    EXPECT_TRUE(hasEnded);
+    EXPECT_EQ(ticks, 3);
+    EXPECT_GE(tickEnds, 3);
+}
+
+} // namespace
+} // namespace tamblo

@@ -1,0 +1,261 @@
+#include "tests/service/RawClient.h"
+#include "tests/service/ServiceProcess.h"
+
+#include <gtest/gtest.h>
+#include <nlohmann/json.hpp>
+
+#include <csignal>
+#include <string>
+
+#include <fcntl.h>
+#include <sys/socket.h>
+#include <sys/stat.h>
+#include <sys/un.h>
+
+// What one client sees of a running service, and what lies on the disk afterwards.
+
+namespace tamblo::test {
+namespace {
+
+using Json = nlohmann::json;
+using wire::Method;
+
+TEST(Service, MessageOfAStartedSessionBecomesTwoEvents) {
+    ServiceProcess service;
+    RawClient client(service.socketPath());
+    EXPECT_EQ(client.call(request(Method::createReportingSession, 7))->result, Value(true));
+    wire::Request type = request(Method::setServiceType, 7);
+    type.serviceType = 7;
+    EXPECT_EQ(client.call(type)->result, Value(true));
+    wire::Request configuration = request(Method::setConfiguration, 7);
+    configuration.dictionary = {{"HostApplicationDisplayID", "com.example.music"}};
+    EXPECT_EQ(client.call(configuration)->result, Value(true));
+    EXPECT_EQ(client.call(request(Method::getServiceNameForReporterID, 7))->result, Value(7));
+    EXPECT_EQ(client.call(request(Method::getAllReporters))->result, Value(Array{7}));
+
+    wire::Request start = request(Method::startReportingSessionForID, 7);
+    start.id = 77;
+    client.send(start);
+    EXPECT_TRUE(client.staysSilent());
+    const Dictionary payload{{"route name", "Speaker"}, {"level", 0.25F}, {"zrreporting_timestamp", 4e9}};
+    const auto answered = client.call(message(payload, {7}, 0x08000004, 1));
+    ASSERT_TRUE(answered);
+    EXPECT_FALSE(answered->error);
+    EXPECT_FALSE(answered->result);
+
+    const std::vector<std::string> lines = service.events();
+    ASSERT_EQ(lines.size(), 2U);
+    const std::string expected =
+        R"("payload":{"HostApplicationDisplayID":"com.example.music","audiotag":"Session_PlaybackStart",)"
+        R"("level":0.25,"route_name":"Speaker","zrreporting_timestamp":4000000000.0}})";
+    EXPECT_EQ(lines[0].substr(0, 8), R"({"time":)");
+    EXPECT_NE(lines[0].find(R"(,"event":"com.vandra.tamblo.Session_Playback.Start",)" + expected),
+              std::string::npos)
+        << lines[0];
+    EXPECT_NE(lines[1].find(R"(,"event":"com.vandra.longformaudio.Session_Playback.Start",)" + expected),
+              std::string::npos)
+        << lines[1];
+
+    // The stop answers the held start first.
+    wire::Request stop = request(Method::stopReportingSessionForID, 7);
+    const auto held = client.call(stop);
+    EXPECT_EQ(held->id, 77U);
+    EXPECT_EQ(held->result, Value(true));
+    EXPECT_EQ(client.receive()->result, Value(true));
+    EXPECT_EQ(client.call(request(Method::destroyReportingSession, 7))->result, Value(true));
+    EXPECT_EQ(client.call(request(Method::getServiceNameForReporterID, 7))->result, Value(65535));
+}
+
+TEST(Service, ReporterZeroIsAnsweredTwice) {
+    ServiceProcess service;
+    RawClient client(service.socketPath());
+    EXPECT_EQ(client.call(request(Method::getServiceNameForReporterID, 0))->result, Value(65535));
+    EXPECT_EQ(client.receive()->result, Value(65535));
+    EXPECT_TRUE(client.staysSilent());
+}
+
+TEST(Service, MessageWithoutReportersReachesAllStartedSessionsOrTheSingleMessageSession) {
+    ServiceProcess service;
+    RawClient first(service.socketPath());
+    first.call(message({{"n", 1}}, {}));
+    EXPECT_EQ(service.countEvents("com.vandra.standalone."), 1U);
+    RawClient second(service.socketPath());
+    startSession(first, 7, 2);
+    startSession(second, 8, 3);
+    first.call(message({{"n", 2}}, {}));
+    EXPECT_EQ(service.countEvents("com.vandra.standalone."), 1U);
+    EXPECT_EQ(service.countEvents("com.vandra.telephony."), 1U);
+    EXPECT_EQ(service.countEvents("com.vandra.haptics."), 1U);
+}
+
+TEST(Service, WhatIsAnsweredSurvivesAKill) {
+    ServiceProcess service;
+    RawClient client(service.socketPath());
+    startSession(client, 7);
+    for (int i = 0; i < 100; ++i) {
+        ASSERT_TRUE(client.call(message({{"n", i}}, {7})));
+    }
+    service.signal(SIGKILL);
+    EXPECT_EQ(service.awaitEnd(), -SIGKILL);
+    EXPECT_EQ(service.events().size(), 200U);
+    // A line torn by a crash is cut off; what stands before it stays.
+    const auto file = service.logs() / "analytics-events.jsonl";
+    writeFile(file, readFile(file) + R"({"time":1.0,"eve)");
+    service.start();
+    RawClient again(service.socketPath());
+    again.call(request(Method::createReportingSession, 7));
+    again.call(message({{"n", 100}}, {7}));
+    const std::vector<std::string> lines = service.events();
+    EXPECT_EQ(lines.size(), 202U);
+    for (const std::string& line : lines) {
+        EXPECT_TRUE(Json::accept(line)) << line;
+    }
+}
+
+TEST(Service, EndsAsAskedTo) {
+    ServiceProcess service;
+    {
+        RawClient client(service.socketPath());
+        startSession(client, 7);
+        client.send(message({{"last", true}}, {7}));
+        EXPECT_EQ(service.stop(), 0);
+        EXPECT_TRUE(client.isClosedByService());
+    }
+    EXPECT_FALSE(std::filesystem::exists(service.socketPath()));
+    EXPECT_EQ(service.countEvents("\"last\":true"), 2U);
+
+    service.start();
+    RawClient killer(service.socketPath());
+    killer.send(request(Method::killService));
+    EXPECT_EQ(service.awaitEnd(), 2);
+    EXPECT_NE(service.errorOutput().find("DESTROYING SERVICE"), std::string::npos);
+    // The socket that the killed service left behind is replaced.
+    service.start();
+    EXPECT_TRUE(RawClient(service.socketPath()).call(request(Method::getAllReporters)));
+}
+
+TEST(Service, ClientThatLeavesIsReportedOnce) {
+    ServiceProcess service;
+    {
+        RawClient client(service.socketPath());
+        startSession(client, 7);
+        client.send(message({{"n", 1}}, {7}));
+    }
+    EXPECT_TRUE(eventually([&] { return service.countEvents("zrreportingclientuptime") == 1; }));
+    RawClient other(service.socketPath());
+    EXPECT_EQ(other.call(request(Method::getAllReporters))->result, Value(Array{}));
+    EXPECT_EQ(service.countEvents("\"n\":1"), 2U);
+    EXPECT_EQ(service.countEvents("zrreportingclientuptime"), 1U);
+}
+
+TEST(Service, SecondInstanceSaysWhyItCannotStart) {
+    ServiceProcess service;
+    ServiceProcess second({.environment = {{"RUNTIME_DIRECTORY", (service.directory() / "run").string()}},
+                           .awaitsReady = false});
+    EXPECT_EQ(second.awaitEnd(), 1);
+    const std::string said = second.errorOutput();
+    EXPECT_NE(said.find("already answers at " + service.socketPath()), std::string::npos) << said;
+    EXPECT_EQ(std::count(said.begin(), said.end(), '\n'), 1);
+    EXPECT_TRUE(RawClient(service.socketPath()).call(request(Method::getAllReporters)));
+}
+
+TEST(Service, UnusableDirectoryIsOneClearLine) {
+    ServiceProcess service({.environment = {{"RUNTIME_DIRECTORY", "/proc/tamblo"}}, .awaitsReady = false});
+    EXPECT_EQ(service.awaitEnd(), 1);
+    EXPECT_NE(service.errorOutput().find("/proc/tamblo"), std::string::npos);
+}
+
+TEST(Service, TakesOverAnActivatedSocketAndTellsItsManager) {
+    const auto bound = [](int type, const std::string& path) {
+        sockaddr_un address{};
+        address.sun_family = AF_UNIX;
+        path.copy(address.sun_path, sizeof address.sun_path - 1);
+        const int socket = ::socket(AF_UNIX, type | SOCK_CLOEXEC, 0);
+        EXPECT_EQ(::bind(socket, reinterpret_cast<const sockaddr*>(&address), sizeof address), 0);
+        return socket;
+    };
+    std::string directory = (std::filesystem::temp_directory_path() / "tamblo-act-XXXXXX").string();
+    ASSERT_NE(::mkdtemp(directory.data()), nullptr);
+    const std::string path = directory + "/activated";
+    const int listening = bound(SOCK_STREAM, path);
+    ASSERT_EQ(::listen(listening, 8), 0);
+    const int manager = bound(SOCK_DGRAM, directory + "/notify");
+    // A client may connect before the service runs.
+    RawClient early(path);
+
+    ServiceProcess service({.environment = {{"NOTIFY_SOCKET", directory + "/notify"}},
+                            .beforeExec =
+                                [listening] {
+                                    ::dup2(listening, 3);
+                                    ::fcntl(3, F_SETFD, 0);
+                                    ::setenv("LISTEN_PID", std::to_string(::getpid()).c_str(), 1);
+                                    ::setenv("LISTEN_FDS", "1", 1);
+                                },
+                            .awaitsReady = false});
+    EXPECT_TRUE(early.call(request(Method::getAllReporters)));
+    EXPECT_FALSE(std::filesystem::exists(service.socketPath()));
+    std::array<char, 64> told{};
+    EXPECT_GT(::recv(manager, told.data(), told.size(), 0), 0);
+    EXPECT_STREQ(told.data(), "READY=1");
+    EXPECT_EQ(service.stop(), 0);
+    told.fill(0);
+    EXPECT_GT(::recv(manager, told.data(), told.size(), 0), 0);
+    EXPECT_STREQ(told.data(), "STOPPING=1");
+    EXPECT_TRUE(std::filesystem::exists(path));
+    ::close(listening);
+    ::close(manager);
+    std::filesystem::remove_all(directory);
+}
+
+TEST(Service, PreferenceIsInForceForTheNextMessage) {
+    ServiceProcess service;
+    const auto preferences = service.preferenceFile("com.vandra.tamblo.analytics");
+    RawClient client(service.socketPath());
+    startSession(client, 7);
+    writeFile(preferences, R"({"events_in_use": ["com.vandra.telephony.*"]})");
+    client.call(message({{"n", 1}}, {7}));
+    EXPECT_EQ(service.events().size(), 1U);
+    writeFile(preferences, R"({"events_in_use": [)");
+    client.call(message({{"n", 2}}, {7}));
+    client.call(message({{"n", 3}}, {7}));
+    EXPECT_EQ(service.events().size(), 5U);
+    const std::string said = service.errorOutput();
+    const auto first = said.find(preferences.string());
+    EXPECT_NE(first, std::string::npos) << said;
+    EXPECT_EQ(said.find(preferences.string(), first + 1), std::string::npos) << said;
+    std::filesystem::remove(preferences);
+    client.call(message({{"n", 4}}, {7}));
+    EXPECT_EQ(service.events().size(), 7U);
+}
+
+TEST(Service, SleepsWhenThereIsNothingToDo) {
+    ServiceProcess service;
+    {
+        RawClient client(service.socketPath());
+        startSession(client, 7);
+        client.call(message({{"n", 1}}, {7}));
+        client.call(request(Method::stopReportingSessionForID, 7));
+    }
+    const auto wakeUps = [&service] {
+        std::size_t count = 0;
+        for (const auto& task :
+             std::filesystem::directory_iterator("/proc/" + std::to_string(service.pid()) + "/task")) {
+            const std::string status = readFile(task.path() / "status");
+            const auto at = status.find("\nvoluntary_ctxt_switches:");
+            count += std::stoul(status.substr(at + 26));
+        }
+        return count;
+    };
+    // The pool's threads end after some idle seconds; then nothing moves any more.
+    EXPECT_TRUE(eventually([&] {
+        return std::distance(
+                   std::filesystem::directory_iterator("/proc/" + std::to_string(service.pid()) + "/task"),
+                   std::filesystem::directory_iterator()) == 1;
+    }));
+    const std::size_t before = wakeUps();
+    ::usleep(1'000'000);
+    EXPECT_EQ(wakeUps(), before);
+}
+
+} // namespace
+} // namespace tamblo::test
