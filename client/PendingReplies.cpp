@@ -1,0 +1,63 @@
+#include "client/PendingReplies.h"
+
+namespace tamblo::client {
+
+std::optional<std::uint64_t> PendingReplies::reserve() {
+    if (firstFree_ == kNone) {
+        if (entries_.size() == kMaximumEntries) {
+            return std::nullopt;
+        }
+        entries_.emplace_back();
+        firstFree_ = static_cast<std::uint32_t>(entries_.size() - 1);
+    }
+    const std::uint32_t index = firstFree_;
+    Entry& entry = entries_[index];
+    firstFree_ = entry.nextFree;
+    entry.id = ++lastNumber_ << kIndexBits | index;
+    return entry.id;
+}
+
+void PendingReplies::expect(std::uint64_t id, ReplyFunction reply, bool everyReply) noexcept {
+    Entry& entry = entries_[indexOf(id)];
+    entry.reply = std::move(reply);
+    entry.everyReply = everyReply;
+    ++waiting_;
+}
+
+void PendingReplies::cancel(std::uint64_t id) noexcept {
+    free(indexOf(id));
+}
+
+bool PendingReplies::deliver(std::uint64_t id, const ReplyView& reply) {
+    const std::size_t index = indexOf(id);
+    if (index >= entries_.size() || entries_[index].id != id || !entries_[index].reply) {
+        return false;
+    }
+    Entry& entry = entries_[index];
+    entry.reply(reply);
+    if (!entry.everyReply) {
+        --waiting_;
+        free(index);
+    }
+    return true;
+}
+
+void PendingReplies::failAll(const Error& error) {
+    const ReplyView reply{.kind = ReplyView::Kind::error, .error = &error};
+    for (std::size_t index = 0; index < entries_.size(); ++index) {
+        if (entries_[index].reply) {
+            entries_[index].everyReply = false;
+            deliver(entries_[index].id, reply);
+        }
+    }
+}
+
+void PendingReplies::free(std::size_t index) noexcept {
+    Entry& entry = entries_[index];
+    entry.reply.reset();
+    entry.id = 0;
+    entry.nextFree = firstFree_;
+    firstFree_ = static_cast<std::uint32_t>(index);
+}
+
+} // namespace tamblo::client
