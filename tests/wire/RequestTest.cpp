@@ -212,7 +212,7 @@ TEST(FrameSplitter, TakesWholeFramesOfAnyCut) {
         stream.insert(stream.end(), length, 0x20);
     }
     for (std::size_t cut = 0; cut <= stream.size(); ++cut) {
-        FrameSplitter frames(std::span(stream).first(cut));
+        FrameSplitter frames({stream.data(), cut});
         std::size_t taken = 0;
         while (const auto frame = frames.next()) {
             taken += kLengthBytes + frame->size();
