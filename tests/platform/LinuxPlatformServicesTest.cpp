@@ -369,19 +369,21 @@ TEST(LinuxStructuredLogTest, NeitherWaitsForAReaderNorEndsWithIt) {
         LogReader reader(isSocket);
         LinuxStructuredLog log(reader.writeEnd(), "");
         EXPECT_EQ(::fcntl(reader.writeEnd(), F_GETFL) & O_NONBLOCK, 0) << "others share that description";
-        const std::string text(5000, 'x');
+        const std::string filling(5000, 'x');
         for (int line = 0; line < 200; ++line) { // more than a pipe or a socket holds
-            log.write(LogLevel::info, "zrrs", text);
+            log.write(LogLevel::info, "zrrs", filling);
         }
         std::size_t whole = 0;
-        std::istringstream first(reader.take());
-        for (std::string line; std::getline(first, line);) {
-            whole += line == "<6>zrrs " + text && !first.eof() ? 1 : 0;
+        std::string text = reader.take();
+        std::istringstream lines(text);
+        for (std::string line; std::getline(lines, line);) {
+            whole += line == "<6>zrrs " + filling && !lines.eof() ? 1 : 0;
         }
         EXPECT_LT(whole, 200U);
         log.write(LogLevel::info, "zrrs", "again");
-        EXPECT_THAT(reader.take(), testing::EndsWith("<3>zrrs " + std::to_string(200 - whole) +
-                                                     " log lines were dropped here\n<6>zrrs again\n"));
+        text += reader.take();
+        EXPECT_THAT(text, testing::EndsWith("\n<3>zrrs " + std::to_string(200 - whole) +
+                                            " log lines were dropped here\n<6>zrrs again\n"));
         reader.close();
         log.write(LogLevel::info, "zrrs", "to nobody");
     }
