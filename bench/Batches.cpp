@@ -1,0 +1,28 @@
+#include "Batches.h"
+
+namespace tamblo::bench {
+
+Batches::Batches(FrameChannel& channel) : channel_(channel) {
+    for (const Message& message : makeMessages(1024, Variety::distinct)) {
+        requests_.push_back(sendRequest(message, 0));
+    }
+}
+
+void Batches::send(std::size_t count, std::int64_t reporterID) {
+    send(channel_, count, reporterID);
+}
+
+void Batches::send(FrameChannel& channel, std::size_t count, std::int64_t reporterID) {
+    while (count > 0) {
+        for (; count > 0 && channel.outstanding() < kInFlight; --count) {
+            wire::Request& request = requests_[next_++ % requests_.size()];
+            request.reporterIDs[0] = reporterID;
+            channel.queue(request);
+        }
+        channel.flush();
+        channel.receive();
+    }
+    channel.finish();
+}
+
+} // namespace tamblo::bench

@@ -1,0 +1,57 @@
+#pragma once
+
+#include "Floors.h"
+#include "ResultRow.h"
+#include "ServiceProcess.h"
+
+#include <cstddef>
+#include <optional>
+#include <string>
+#include <string_view>
+
+namespace tamblo::bench {
+
+enum class Placement { oneCore, twoCores };
+[[nodiscard]] std::string_view describe(Placement placement) noexcept;
+
+/// One run of the benchmark: what was asked for on the command line, and the floors, which are measured once
+/// for each placement, when the first scenario asks for them.
+class Bench {
+public:
+    Bench(std::string tamblod, bool quick) : tamblod_(std::move(tamblod)), quick_(quick) {}
+
+    [[nodiscard]] bool quick() const noexcept { return quick_; }
+    [[nodiscard]] std::size_t repetitions(std::size_t usual) const noexcept {
+        return quick_ ? (usual + 2) / 3 : usual;
+    }
+
+    /// Puts this thread where the placement has the client, and says how to start the service.
+    [[nodiscard]] ServiceProcess::Settings place(Placement placement) const;
+
+    [[nodiscard]] const SocketFloor& socketFloor(Placement placement);
+    void print(const ResultRow& row);
+    [[nodiscard]] bool allMet() const noexcept { return allMet_; }
+
+private:
+    std::string tamblod_;
+    bool quick_;
+    bool allMet_ = true;
+    std::optional<SocketFloor> socketFloors_[2];
+};
+
+// The scenarios. Each starts services of its own and prints its rows.
+void floorSocket(Bench& bench);
+void floorEcho(Bench& bench);
+void ingestPipelined(Bench& bench);
+void ingestOneEvent(Bench& bench);
+void ingestUnwanted(Bench& bench);
+void ingestRepeated(Bench& bench);
+void paced(Bench& bench);
+void roundTrip(Bench& bench);
+void retained(Bench& bench);
+void manyClients(Bench& bench);
+void manySessions(Bench& bench);
+void idle(Bench& bench);
+void startUp(Bench& bench);
+
+} // namespace tamblo::bench

@@ -1,0 +1,36 @@
+#include "ChildProcess.h"
+
+#include "Processes.h"
+
+#include <cerrno>
+#include <csignal>
+#include <system_error>
+
+#include <sys/prctl.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+namespace tamblo::bench {
+
+ChildProcess::ChildProcess(int processor, const std::function<void()>& run) : pid_(::fork()) {
+    if (pid_ < 0) {
+        throw std::system_error(errno, std::generic_category(), "fork");
+    }
+    if (pid_ == 0) {
+        ::prctl(PR_SET_PDEATHSIG, SIGKILL);
+        try {
+            pinThisThread(processor);
+            run();
+        } catch (...) {
+            ::_exit(1);
+        }
+        ::_exit(0);
+    }
+}
+
+ChildProcess::~ChildProcess() {
+    ::kill(pid_, SIGKILL);
+    ::waitpid(pid_, nullptr, 0);
+}
+
+} // namespace tamblo::bench

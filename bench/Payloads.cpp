@@ -1,0 +1,78 @@
+#include "Payloads.h"
+
+#include <array>
+#include <chrono>
+#include <utility>
+
+namespace tamblo::bench {
+
+namespace {
+
+using client::EventKind;
+using client::EventType;
+using client::Subsystem;
+
+const std::array<std::pair<client::EventCategory, EventType>, 4> kKinds{{
+    {client::category(Subsystem::session, EventKind::playback), EventType::start},
+    {client::category(Subsystem::hal, EventKind::io), EventType::state},
+    {client::category(Subsystem::routing, EventKind::routeChange), EventType::activate},
+    {client::category(Subsystem::dsp, EventKind::performance), EventType::generic},
+}};
+
+/// The messages' time begins when the benchmark does.
+double epoch() {
+    static const double seconds =
+        std::chrono::duration<double>(std::chrono::system_clock::now().time_since_epoch()).count();
+    return seconds;
+}
+
+} // namespace
+
+Message makeMessage(std::uint64_t number, Variety variety) {
+    const std::uint64_t content = variety == Variety::distinct ? number : number / 10;
+    const auto step = static_cast<double>(content % 1'000'003);
+    const auto& [category, type] = kKinds[content % kKinds.size()];
+    return {
+        Dictionary{
+            {"HostApplicationDisplayID", "com.vandra.melody.player"},
+            {"audio_route", "headphones-wireless"},
+            {"device_uid", "usb-00000012-stereo-out-0"},
+            {"session_identifier", "6f0c1e5a-52d7-4c0e-9d4c-a3c1b7e2f908"},
+            {"buffer_frames", 512},
+            {"message_counter", static_cast<std::int64_t>(1'000'000 + content)},
+            {"sample_rate", 48'000},
+            {"io_cycle_load", 0.125 + step * 1.0e-7},
+            {"output_latency_ms", 11.6099773 + step * 0.0001},
+            {"playback_position_sec", 0.0213333 * step + 0.5},
+            {"zrreporting_timestamp", epoch() + static_cast<double>(number) * 0.000731},
+            {"is_spatialized", content % 2 == 0},
+        },
+        category,
+        type,
+    };
+}
+
+std::vector<Message> makeMessages(std::size_t count, Variety variety) {
+    std::vector<Message> messages;
+    messages.reserve(count);
+    for (std::size_t i = 0; i < count; ++i) {
+        messages.push_back(makeMessage(i, variety));
+    }
+    return messages;
+}
+
+Dictionary sessionConfiguration() {
+    return {{"HostApplicationDisplayID", "com.vandra.melody.player"}};
+}
+
+wire::Request sendRequest(const Message& message, std::int64_t reporterID) {
+    wire::Request request;
+    request.method = wire::Method::sendMessage;
+    request.dictionary = message.payload;
+    request.category = static_cast<std::uint32_t>(message.category);
+    request.type = static_cast<std::uint16_t>(message.type);
+    request.reporterIDs = {reporterID};
+    return request;
+}
+
+} // namespace tamblo::bench

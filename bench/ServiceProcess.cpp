@@ -1,0 +1,179 @@
+#include "ServiceProcess.h"
+
+#include "Processes.h"
+#include "platform/linux/FileDescriptor.h"
+#include "wire/Protocol.h"
+
+#include <array>
+#include <cerrno>
+#include <csignal>
+#include <cstdio>
+#include <cstdlib>
+#include <cstring>
+#include <fstream>
+#include <sstream>
+#include <stdexcept>
+#include <string_view>
+#include <system_error>
+#include <thread>
+
+#include <fcntl.h>
+#include <poll.h>
+#include <sys/prctl.h>
+#include <sys/socket.h>
+#include <sys/un.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+namespace tamblo::bench {
+
+namespace {
+
+constexpr std::chrono::seconds kStartLimit{10};
+constexpr std::chrono::seconds kStopLimit{60};
+
+[[noreturn]] void fail(const std::string& what) {
+    throw std::system_error(errno, std::generic_category(), what);
+}
+
+/// Where the service announces that it is ready.
+FileDescriptor bindNotifySocket(const std::string& path) {
+    FileDescriptor socket(::socket(AF_UNIX, SOCK_DGRAM | SOCK_CLOEXEC, 0));
+    sockaddr_un address{};
+    address.sun_family = AF_UNIX;
+    if (path.size() >= sizeof address.sun_path) {
+        throw std::runtime_error("the path of the temporary directory is too long for a socket; set TMPDIR");
+    }
+    std::memcpy(address.sun_path, path.c_str(), path.size() + 1);
+    if (!socket.isOpen() ||
+        ::bind(socket.get(), reinterpret_cast<sockaddr*>(&address), sizeof address) != 0) {
+        fail(path);
+    }
+    return socket;
+}
+
+} // namespace
+
+ServiceProcess::ServiceProcess(const Settings& settings) {
+    directory_.makeDirectory("runtime");
+    directory_.makeDirectory("configuration/preferences");
+    directory_.makeDirectory("logs");
+    socketPath_ = wire::socketPath(directory_.path() + "/runtime");
+    if (settings.eventsInUse) {
+        directory_.write("configuration/preferences/com.vandra.tamblo.analytics.json",
+                         "{\"events_in_use\": " + *settings.eventsInUse + "}\n");
+    }
+    const std::string notifyPath = directory_.path() + "/notify";
+    const FileDescriptor notify = bindNotifySocket(notifyPath);
+    start(settings, notifyPath);
+    try {
+        waitUntilReady(notify.get());
+    } catch (...) {
+        ::kill(pid_, SIGKILL);
+        ::waitpid(pid_, nullptr, 0);
+        throw;
+    }
+}
+
+ServiceProcess::~ServiceProcess() {
+    try {
+        stop();
+    } catch (const std::exception& error) {
+        std::fprintf(stderr, "tamblo_bench: %s\n", error.what());
+    }
+}
+
+std::chrono::nanoseconds ServiceProcess::age() const noexcept {
+    return std::chrono::steady_clock::now() - startedAt_;
+}
+
+void ServiceProcess::start(const Settings& settings, const std::string& notifySocket) {
+    const std::string logPath = directory_.path() + "/log";
+    const FileDescriptor log(::open(logPath.c_str(), O_WRONLY | O_CREAT | O_APPEND | O_CLOEXEC, 0600));
+    if (!log.isOpen()) {
+        fail(logPath);
+    }
+    std::array<std::string, 5> variables{
+        "RUNTIME_DIRECTORY=" + directory_.path() + "/runtime",
+        "CONFIGURATION_DIRECTORY=" + directory_.path() + "/configuration",
+        "LOGS_DIRECTORY=" + directory_.path() + "/logs",
+        "NOTIFY_SOCKET=" + notifySocket,
+        "TAMBLO_LOG=default",
+    };
+    std::array<char*, variables.size() + 1> environment{};
+    for (std::size_t i = 0; i < variables.size(); ++i) {
+        environment[i] = variables[i].data();
+    }
+    std::string program = settings.program;
+    std::array<char*, 2> arguments{program.data(), nullptr};
+    cpu_set_t processors;
+    CPU_ZERO(&processors);
+    CPU_SET(static_cast<std::size_t>(settings.processor), &processors);
+    const pid_t parent = ::getpid();
+
+    startedAt_ = std::chrono::steady_clock::now();
+    pid_ = ::fork();
+    if (pid_ < 0) {
+        fail("fork");
+    }
+    if (pid_ == 0) {
+        ::prctl(PR_SET_PDEATHSIG, SIGKILL);
+        if (::getppid() == parent && ::sched_setaffinity(0, sizeof processors, &processors) == 0 &&
+            ::dup2(log.get(), STDERR_FILENO) >= 0) {
+            ::execve(program.c_str(), arguments.data(), environment.data());
+        }
+        ::_exit(127);
+    }
+}
+
+void ServiceProcess::waitUntilReady(int notifySocket) {
+    while (age() < kStartLimit) {
+        pollfd waiting{notifySocket, POLLIN, 0};
+        if (::poll(&waiting, 1, 50) > 0) {
+            std::array<char, 256> text{};
+            const ssize_t count = ::recv(notifySocket, text.data(), text.size(), 0);
+            if (count > 0 && std::string_view(text.data(), static_cast<std::size_t>(count)).find("READY=1") !=
+                                 std::string_view::npos) {
+                timeUntilReady_ = age();
+                return;
+            }
+        }
+        if (::waitpid(pid_, nullptr, WNOHANG) == pid_) {
+            pid_ = -1;
+            throw std::runtime_error("the service ended at once: " + logTail());
+        }
+    }
+    throw std::runtime_error("the service does not get ready: " + logTail());
+}
+
+void ServiceProcess::stop() {
+    if (pid_ < 0) {
+        return;
+    }
+    const pid_t process = std::exchange(pid_, -1);
+    ::kill(process, SIGTERM);
+    const auto limit = std::chrono::steady_clock::now() + kStopLimit;
+    int status = 0;
+    while (::waitpid(process, &status, WNOHANG) == 0) {
+        if (std::chrono::steady_clock::now() > limit) {
+            ::kill(process, SIGKILL);
+            ::waitpid(process, &status, 0);
+            break;
+        }
+        std::this_thread::sleep_for(std::chrono::milliseconds(2));
+    }
+    if (!WIFEXITED(status) || WEXITSTATUS(status) != 0) {
+        throw std::runtime_error("the service did not end in order: " + logTail());
+    }
+}
+
+std::string ServiceProcess::logTail() const {
+    constexpr std::size_t kCharacters = 400;
+    std::ifstream file(directory_.path() + "/log", std::ios::binary);
+    std::ostringstream text;
+    text << file.rdbuf();
+    const std::string all = text.str();
+    return all.size() > kCharacters ? all.substr(all.size() - kCharacters) : all;
+}
+
+} // namespace tamblo::bench

@@ -1,0 +1,52 @@
+#pragma once
+
+#include "TemporaryDirectory.h"
+
+#include <chrono>
+#include <optional>
+#include <string>
+
+#include <sys/types.h>
+
+namespace tamblo::bench {
+
+/// The real service as a child process, as it is shipped, with directories of its own and its log in a file.
+/// The constructor returns once it accepts connections; the destructor ends it, by its own process
+/// identifier, and it ends with this process too.
+class ServiceProcess {
+public:
+    struct Settings {
+        std::string program;
+        int processor = 0;
+        /// The names of the analytics events in use, as a JSON array; all of them without it.
+        std::optional<std::string> eventsInUse;
+    };
+
+    explicit ServiceProcess(const Settings& settings);
+    ~ServiceProcess();
+    ServiceProcess(const ServiceProcess&) = delete;
+    ServiceProcess& operator=(const ServiceProcess&) = delete;
+
+    [[nodiscard]] pid_t pid() const noexcept { return pid_; }
+    [[nodiscard]] const std::string& socketPath() const noexcept { return socketPath_; }
+    /// From just before the fork until the service had said that it is ready.
+    [[nodiscard]] std::chrono::nanoseconds timeUntilReady() const noexcept { return timeUntilReady_; }
+    /// From just before the fork until now.
+    [[nodiscard]] std::chrono::nanoseconds age() const noexcept;
+
+    /// SIGTERM, and throws when the service does not end by itself with status 0.
+    void stop();
+
+private:
+    void start(const Settings& settings, const std::string& notifySocket);
+    void waitUntilReady(int notifySocket);
+    [[nodiscard]] std::string logTail() const;
+
+    TemporaryDirectory directory_;
+    std::string socketPath_;
+    pid_t pid_ = -1;
+    std::chrono::steady_clock::time_point startedAt_;
+    std::chrono::nanoseconds timeUntilReady_{};
+};
+
+} // namespace tamblo::bench

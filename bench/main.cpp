@@ -1,0 +1,102 @@
+#include "Bench.h"
+
+#include <array>
+#include <cstdio>
+#include <cstring>
+#include <exception>
+#include <string>
+#include <string_view>
+#include <vector>
+
+namespace {
+
+using namespace tamblo::bench;
+
+struct Scenario {
+    std::string_view name;
+    std::string_view what;
+    void (*run)(Bench& bench);
+};
+
+constexpr std::array kScenarios{
+    Scenario{"floor_socket", "the frames through a bare socket, read and dropped", floorSocket},
+    Scenario{"floor_echo", "one frame to another process and back", floorEcho},
+    Scenario{"ingest_pipelined", "64 messages in flight, both events of each written", ingestPipelined},
+    Scenario{"ingest_one_event", "the same with only the general event in use", ingestOneEvent},
+    Scenario{"ingest_unwanted", "the same with no event in use", ingestUnwanted},
+    Scenario{"ingest_repeated", "nine of ten messages redundant", ingestRepeated},
+    Scenario{"paced", "1,000 messages a second, evenly", paced},
+    Scenario{"round_trip", "one message outstanding", roundTrip},
+    Scenario{"retained", "the cost of a message with 1,000,000 retained", retained},
+    Scenario{"many_clients", "the cost of a message with 5,000 clients connected", manyClients},
+    Scenario{"many_sessions", "10,000 started sessions", manySessions},
+    Scenario{"idle", "nothing connected", idle},
+    Scenario{"start_up", "from exec to the first accepted connection", startUp},
+};
+
+struct Options {
+    std::string tamblod = TAMBLOD_PATH;
+    bool quick = false;
+    std::vector<const Scenario*> scenarios;
+};
+
+int usage() {
+    std::fputs("usage: tamblo_bench [--quick] [--tamblod PATH] [SCENARIO...]\n\n"
+               "Prints one JSON object per row. Exit status: 0 when all ran, whether or not they met their\n"
+               "targets; 1 when one could not run; 2 for a wrong command line.\n\n",
+               stderr);
+    for (const Scenario& scenario : kScenarios) {
+        std::fprintf(stderr, "  %-18s%s\n", scenario.name.data(), scenario.what.data());
+    }
+    return 2;
+}
+
+bool parse(int count, char** arguments, Options& options) {
+    for (int i = 1; i < count; ++i) {
+        const std::string_view argument = arguments[i];
+        if (argument == "--quick") {
+            options.quick = true;
+        } else if (argument == "--tamblod" && i + 1 < count) {
+            options.tamblod = arguments[++i];
+        } else {
+            bool known = false;
+            for (const Scenario& scenario : kScenarios) {
+                if (scenario.name == argument) {
+                    options.scenarios.push_back(&scenario);
+                    known = true;
+                }
+            }
+            if (!known) {
+                return false;
+            }
+        }
+    }
+    if (options.scenarios.empty()) {
+        for (const Scenario& scenario : kScenarios) {
+            options.scenarios.push_back(&scenario);
+        }
+    }
+    return true;
+}
+
+} // namespace
+
+int main(int count, char** arguments) {
+    Options options;
+    if (!parse(count, arguments, options)) {
+        return usage();
+    }
+    Bench bench(options.tamblod, options.quick);
+    bool allRan = true;
+    for (const Scenario* scenario : options.scenarios) {
+        try {
+            scenario->run(bench);
+        } catch (const std::exception& error) {
+            ResultRow row(scenario->name);
+            row.set("error", error.what());
+            bench.print(row);
+            allRan = false;
+        }
+    }
+    return allRan ? 0 : 1;
+}
