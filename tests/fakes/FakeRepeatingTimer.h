@@ -2,9 +2,10 @@
 
 #include "platform/WorkQueue.h"
 
+#include <atomic>
 #include <chrono>
-#include <functional>
 #include <memory>
+#include <utility>
 
 namespace tamblo {
 
@@ -14,7 +15,7 @@ public:
     struct State {
         std::chrono::milliseconds interval;
         UniqueFunction<void()> tick;
-        bool isRunning = false;
+        std::atomic<bool> isRunning = false;
     };
 
     explicit FakeRepeatingTimer(std::shared_ptr<State> state) : state_(std::move(state)) {}

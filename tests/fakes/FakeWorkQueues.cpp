@@ -10,18 +10,24 @@ std::unique_ptr<RepeatingTimer> FakeWorkQueues::makeRepeatingTimer(std::chrono::
     auto state = std::make_shared<FakeRepeatingTimer::State>();
     state->interval = interval;
     state->tick = std::move(tick);
+    const std::lock_guard held(mutex_);
     timers_.push_back(state);
     return std::make_unique<FakeRepeatingTimer>(std::move(state));
 }
 
-std::size_t FakeWorkQueues::runningTimers() const noexcept {
+std::vector<std::shared_ptr<FakeRepeatingTimer::State>> FakeWorkQueues::timers() const {
+    const std::lock_guard held(mutex_);
+    return timers_;
+}
+
+std::size_t FakeWorkQueues::runningTimers() const {
+    const auto all = timers();
     return static_cast<std::size_t>(
-        std::count_if(timers_.begin(), timers_.end(), [](const auto& timer) { return timer->isRunning; }));
+        std::count_if(all.begin(), all.end(), [](const auto& timer) { return timer->isRunning.load(); }));
 }
 
 void FakeWorkQueues::tick() {
-    const auto timers = timers_;
-    for (const auto& timer : timers) {
+    for (const auto& timer : timers()) {
         if (timer->isRunning) {
             timer->tick();
         }

@@ -4,6 +4,7 @@
 #include "tests/fakes/FakeSerialQueue.h"
 
 #include <memory>
+#include <mutex>
 #include <string_view>
 #include <vector>
 
@@ -19,14 +20,13 @@ public:
                                                                      UniqueFunction<void()> tick) override;
 
     /// Every timer that was made, the latest last; they outlive their timers.
-    [[nodiscard]] const std::vector<std::shared_ptr<FakeRepeatingTimer::State>>& timers() const noexcept {
-        return timers_;
-    }
-    [[nodiscard]] std::size_t runningTimers() const noexcept;
+    [[nodiscard]] std::vector<std::shared_ptr<FakeRepeatingTimer::State>> timers() const;
+    [[nodiscard]] std::size_t runningTimers() const;
     /// Ticks each running timer once.
     void tick();
 
 private:
+    mutable std::mutex mutex_;
     std::vector<std::shared_ptr<FakeRepeatingTimer::State>> timers_;
 };
 

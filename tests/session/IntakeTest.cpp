@@ -1,0 +1,251 @@
+#include "session/LastMessageIndex.h"
+#include "session/ZRReportingSession.h"
+#include "tests/fakes/FakePlatform.h"
+#include "tests/session/ScriptedWorkers.h"
+
+#include <gmock/gmock.h>
+
+#include <cmath>
+#include <limits>
+#include <random>
+
+namespace tamblo {
+namespace {
+
+class IntakeTest : public testing::Test {
+protected:
+    FakePlatform device;
+};
+
+MessageRef makeMessage(Dictionary payload, AudioEventCategory category = 14, AudioEventType type = 11) {
+    return std::make_shared<ZRReportingSessionMessage>(std::move(payload), category, type);
+}
+
+TEST_F(IntakeTest, TimestampsAreRepaired) {
+    const double now = device.clock.seconds();
+    constexpr double kYear = 31'536'000;
+    const struct {
+        const char* what;
+        Dictionary payload;
+        Dictionary repaired;
+    } cases[] = {
+        {"missing", {{"a", 1}}, {{"a", 1}, {"zrreporting_timestamp", now}, {"invalid_timestamp", "nil"}}},
+        {"just 365 days", {{"zrreporting_timestamp", now - kYear}}, {{"zrreporting_timestamp", now - kYear}}},
+        {"a second older",
+         {{"zrreporting_timestamp", now - kYear - 1}},
+         {{"zrreporting_timestamp", now}, {"invalid_timestamp", now - kYear - 1}}},
+        {"the future", {{"zrreporting_timestamp", now + kYear}}, {{"zrreporting_timestamp", now + kYear}}},
+        {"no number",
+         {{"zrreporting_timestamp", "soon"}, {"invalid_timestamp", 5}},
+         {{"zrreporting_timestamp", now}, {"invalid_timestamp", "soon"}}},
+        {"a number as text",
+         {{"zrreporting_timestamp", "99999999999"}},
+         {{"zrreporting_timestamp", "99999999999"}}},
+    };
+    for (const auto& c : cases) {
+        const auto message = makeMessage(c.payload);
+        ZRReportingSession::addMissingDates(*message, device.clock.now());
+        EXPECT_EQ(message->payload(), c.repaired) << c.what;
+        const Value kept = *message->payload().find("zrreporting_timestamp");
+        EXPECT_EQ(ZRReportingSession::getEpochTimeFromZRReportingStateMessage(*message), kept.doubleValue());
+    }
+    EXPECT_EQ(ZRReportingSession::getEpochTimeFromZRReportingStateMessage(*makeMessage({})), 0.0);
+}
+
+TEST_F(IntakeTest, SpacesInKeysBecomeUnderscores) {
+    const auto message = makeMessage(
+        {{"a b", 1}, {"a_b", 2}, {" c ", 3}, {"d\te", 4}, {"plain", 5}, {"x y_z", 6}, {"x_y z", 7}});
+    const Dictionary before = message->message();
+    ZRReportingSession::removeWhiteSpaceFromKeys(*message);
+    EXPECT_EQ(message->payload(),
+              (Dictionary{{"a_b", 1}, {"_c_", 3}, {"d\te", 4}, {"plain", 5}, {"x_y_z", 7}}));
+    EXPECT_EQ(before.size(), 7U) << "a copy taken before does not change";
+}
+
+TEST_F(IntakeTest, TagAndApplicationName) {
+    const auto message =
+        makeMessage({{"audiotag", "mine"}, {"HostApplicationDisplayID", "com.mine"}},
+                    AudioEventSubsystemSession | AudioEventKindPlayback, AudioEventTypeStart);
+    ZRReportingSession::addAudioMessageTag(*message);
+    EXPECT_EQ(message->payload().find("audiotag")->stringValue(), "Session_PlaybackStart");
+
+    const auto session = ZRReportingSession::initWithID(5, {1});
+    session->updateConfigurationWithContentsOfConfiguration({{"HostApplicationDisplayID", "com.configured"}});
+    const std::pair<Value, const char*> names[] = {
+        {"com.mine", "com.mine"}, {"Unknown", "com.configured"}, {"unknown", "unknown"}, {"", ""}};
+    for (const auto& [sent, kept] : names) {
+        const auto named = makeMessage({{"HostApplicationDisplayID", sent}});
+        session->addAppName(*named);
+        EXPECT_EQ(named->payload().find("HostApplicationDisplayID")->stringValue(), kept);
+    }
+    const auto numbered = makeMessage({{"HostApplicationDisplayID", 7}});
+    session->addAppName(*numbered);
+    EXPECT_EQ(numbered->payload().find("HostApplicationDisplayID")->integerValue(), 7);
+}
+
+TEST_F(IntakeTest, ATagIsBuiltForEachCategoryAndTypeHoweverManyThereAre) {
+    for (int round = 0; round < 2; ++round) {
+        for (AudioEventCategory kind = 0; kind < 2000; ++kind) {
+            const auto message = makeMessage({}, AudioEventSubsystemHAL | kind, AudioEventTypeState);
+            ZRReportingSession::addAudioMessageTag(*message);
+            ASSERT_EQ(message->payload().find("audiotag")->stringValue(),
+                      ZRReportingUtilityCategoryString(message->category()) + "State");
+        }
+    }
+}
+
+TEST_F(IntakeTest, WhatIsRedundant) {
+    const struct {
+        const char* what;
+        AudioEventCategory category;
+        AudioEventType type;
+        Dictionary first;
+        Dictionary second;
+        bool isRedundant;
+    } cases[] = {
+        {"a repeat", 14, 11, {{"a", 1}}, {{"a", 1}}, true},
+        {"times apart",
+         14,
+         11,
+         {{"a", 1}, {"systemuptime_sec", 1}, {"processuptime_ms", 1}},
+         {{"a", 1}, {"systemuptime_sec", 2}, {"zrreporting_timestamp", 1e12}, {"invalid_timestamp", "nil"}},
+         true},
+        {"equal numbers of other kinds", 14, 11, {{"a", 1}}, {{"a", 1.0}}, true},
+        {"another value", 14, 11, {{"a", 1}}, {{"a", 2}}, false},
+        {"a key more", 14, 11, {{"a", 1}}, {{"a", 1}, {"b", 1}}, false},
+        {"a key fewer", 14, 11, {{"a", 1}, {"b", 1}}, {{"a", 1}}, false},
+        {"a published key", 14, 11, {{"_throttle_seconds", 1}}, {{"_throttle_seconds", 2}}, false},
+        {"the type Error", 14, 6, {{"a", 1}}, {{"a", 1}}, false},
+        {"the kind Error", 11, 11, {{"a", 1}}, {{"a", 1}}, false},
+        {"a subsystem's Error", 0x2000000B, 11, {{"a", 1}}, {{"a", 1}}, true},
+    };
+    for (const auto& c : cases) {
+        const auto session = ZRReportingSession::initWithID(5, {1});
+        const auto first = makeMessage(c.first, c.category, c.type);
+        const auto second = makeMessage(c.second, c.category, c.type);
+        session->sendMessage(first);
+        session->sendMessage(second);
+        EXPECT_FALSE(first->isRedundant) << c.what;
+        EXPECT_EQ(second->isRedundant, c.isRedundant) << c.what;
+        EXPECT_EQ(session->messages().size(), c.isRedundant ? 1U : 2U) << c.what;
+    }
+}
+
+TEST_F(IntakeTest, OnlyTheLastAcceptedMessageOfItsKindIsCompared) {
+    const auto session = ZRReportingSession::initWithID(5, {1});
+    const auto isRedundant = [&](int value, AudioEventType type) {
+        const auto message = makeMessage({{"a", value}}, 14, type);
+        session->sendMessage(message);
+        return bool{message->isRedundant};
+    };
+    EXPECT_FALSE(isRedundant(1, 11));
+    EXPECT_FALSE(isRedundant(1, 12)) << "of another type";
+    EXPECT_FALSE(isRedundant(2, 11));
+    EXPECT_FALSE(isRedundant(1, 11)) << "another one lies between";
+    EXPECT_TRUE(isRedundant(1, 11));
+    device.clock.advance(std::chrono::hours(24));
+    EXPECT_TRUE(isRedundant(1, 11)) << "however late";
+}
+
+/// What a walk over the session's list from its end says.
+bool walkSaysRedundant(const std::vector<MessageRef>& accepted, const ZRReportingSessionMessage& message) {
+    if (message.type() == AudioEventTypeError || message.category() == AudioEventKindError) {
+        return false;
+    }
+    const auto withoutTimes = [](Dictionary payload) {
+        for (const char* key : {"processuptime_ms", "systemuptime_sec", "zrreporting_timestamp"}) {
+            payload.remove(key);
+        }
+        return payload;
+    };
+    for (auto earlier = accepted.rbegin(); earlier != accepted.rend(); ++earlier) {
+        if ((*earlier)->type() == message.type() && (*earlier)->category() == message.category()) {
+            return withoutTimes((*earlier)->message()) == withoutTimes(message.message());
+        }
+    }
+    return false;
+}
+
+TEST_F(IntakeTest, TheIndexSaysWhatAWalkOverTheListWouldAlsoAfterTheSort) {
+    std::mt19937 random(7);
+    const auto upTo = [&](int most) { return static_cast<int>(random() % static_cast<unsigned>(most + 1)); };
+    const auto session = ZRReportingSession::initWithID(5, {1});
+    int redundant = 0;
+    const auto sendRandom = [&] {
+        constexpr AudioEventCategory kCategories[] = {8, 11, 14, 0x2000000B, 0x08000004};
+        Dictionary payload{{"value", upTo(2)}, {"systemuptime_sec", upTo(9)}};
+        if (upTo(3) != 0) {
+            payload.set("zrreporting_timestamp", device.clock.seconds() + upTo(40) - 20);
+        }
+        const auto message =
+            makeMessage(payload, kCategories[upTo(4)], static_cast<AudioEventType>(upTo(2) + 1));
+        const std::vector<MessageRef> accepted = session->messages();
+        session->sendMessage(message);
+        redundant += message->isRedundant ? 1 : 0;
+        return walkSaysRedundant(accepted, *message) == message->isRedundant;
+    };
+    for (int round = 0; round < 20; ++round) {
+        session->start();
+        for (int i = 0; i < 200; ++i) {
+            ASSERT_TRUE(sendRandom());
+        }
+        int wrongAfterSort = 0;
+        WorkerScript::current().atStop["Producer"] = [&](ZRReportingSession&) {
+            for (int i = 0; i < 50; ++i) {
+                wrongAfterSort += sendRandom() ? 0 : 1;
+            }
+        };
+        session->stop();
+        WorkerScript::current().reset();
+        EXPECT_EQ(wrongAfterSort, 0);
+    }
+    EXPECT_GT(redundant, 100);
+}
+
+TEST_F(IntakeTest, TheIndexHoldsManyKinds) {
+    LastMessageIndex index;
+    std::vector<MessageRef> messages;
+    for (AudioEventCategory category = 0; category < 300; ++category) {
+        for (const AudioEventType type : {AudioEventTypeGeneric, AudioEventTypeUnknown}) {
+            messages.push_back(makeMessage({}, category << 20U, type));
+            index.add(*messages.back());
+        }
+    }
+    for (const MessageRef& message : messages) {
+        ASSERT_EQ(index.find(message->category(), message->type()), message.get());
+    }
+    index.clear();
+    EXPECT_EQ(index.find(0, 0), nullptr);
+}
+
+TEST_F(IntakeTest, RecordsAreIndependentOfWhatTheyWereMadeFrom) {
+    Dictionary sent{{"a", 1}, {"nested", Dictionary{{"x", 1}}}};
+    const auto message = makeMessage(sent, 0xFFFFFFFF, 65535);
+    sent.set("a", 2);
+    EXPECT_EQ(message->payload().find("a")->integerValue(), 1);
+    const auto copy = message->copyWithZone();
+    copy->editPayload([](Dictionary& payload) { payload.set("nested", 3); });
+    EXPECT_EQ(message->description(), "category=Undefined type=Unknown {\"a\":1,\"nested\":{\"x\":1}}");
+    EXPECT_EQ(copy->category(), message->category());
+    EXPECT_EQ(device.log.count("copyWithZone"), 1U);
+}
+
+TEST_F(IntakeTest, SortingKeepsTheOrderOfEqualTimesAndTakesNoNumberForZero) {
+    const double kNaN = std::numeric_limits<double>::quiet_NaN();
+    std::vector<MessageRef> messages;
+    int number = 0;
+    for (const double time : {3.0, 1.0, kNaN, 3.0, -1.0, 1.0}) {
+        messages.push_back(makeMessage({{"n", ++number}, {"zrreporting_timestamp", time}}));
+    }
+    messages.push_back(makeMessage({{"n", 7}}));
+    EXPECT_TRUE(ZRReportingSessionMessage::sortMessages(messages));
+    std::vector<std::int64_t> order;
+    for (const MessageRef& message : messages) {
+        order.push_back(message->payload().find("n")->integerValue());
+    }
+    EXPECT_THAT(order, testing::ElementsAre(5, 3, 7, 2, 6, 1, 4));
+    EXPECT_FALSE(ZRReportingSessionMessage::sortMessages(messages));
+}
+
+} // namespace
+} // namespace tamblo
