@@ -115,18 +115,14 @@ Client::~Client() {
 }
 
 template <typename Write> bool Client::enqueue(ReplyFunction reply, Replies replies, const Write& write) {
-    OutgoingFrame* const frame = engine_->outgoingOrRefused();
-    if (frame == nullptr) {
-        return false;
-    }
-    if (!write(frame->frame, static_cast<bool>(reply))) {
+    ClaimedFrame frame(*engine_);
+    if (!frame || !write(frame->frame, static_cast<bool>(reply))) {
         engine_->countRefused();
-        engine_->abandon(*frame);
         return false;
     }
     frame->reply = std::move(reply);
     frame->wantsEveryReply = replies == Replies::every;
-    engine_->publish(*frame);
+    frame.publish();
     return true;
 }
 

@@ -114,7 +114,7 @@ public:
     bool post(const Dictionary& payload, EventCategory category, EventType type,
               std::initializer_list<std::int64_t> reporterIDs);
     /// The same, written entry by entry.
-    [[nodiscard]] MessageWriter message() { return {*engine_, engine_->outgoingOrRefused()}; }
+    [[nodiscard]] MessageWriter message() { return MessageWriter(*engine_); }
 
     /// Requests that were not queued: the queue was full, or they were longer than the service accepts.
     [[nodiscard]] std::uint64_t refusedMessages() const noexcept { return engine_->refused(); }

@@ -67,14 +67,6 @@ OutgoingFrame* Engine::outgoing() noexcept {
     return isClosed_.load(std::memory_order_relaxed) ? nullptr : queue_.claim();
 }
 
-OutgoingFrame* Engine::outgoingOrRefused() noexcept {
-    OutgoingFrame* const frame = outgoing();
-    if (frame == nullptr) {
-        countRefused();
-    }
-    return frame;
-}
-
 void Engine::publish(OutgoingFrame& frame) noexcept {
     if (announcingEngine == this) [[unlikely]] {
         return;
@@ -169,7 +161,7 @@ Engine::Clock::time_point Engine::nextAttempt() noexcept {
 }
 
 void Engine::announce(ConnectionState state) {
-    stateChanged_ = true;
+    hasNews_ = true;
     if (!options_.onState) {
         return;
     }
@@ -199,6 +191,7 @@ void Engine::failFrame(OutgoingFrame& frame, ErrorCode code) {
         pending_.cancel(std::exchange(frame.id, 0));
     }
     if (reply) {
+        hasNews_ = true;
         const Error error = makeError(code);
         reply({.kind = ReplyView::Kind::error, .error = &error});
     }
@@ -389,7 +382,7 @@ std::size_t Engine::pump(milliseconds timeout) {
     }
     const Scoped<bool> pumping(isPumping_, true);
     const Clock::time_point deadline = Clock::now() + timeout;
-    stateChanged_ = false;
+    hasNews_ = false;
     std::size_t handled = 0;
     do {
         if (socket_ < 0 && Clock::now() >= nextAttempt()) {
@@ -402,11 +395,11 @@ std::size_t Engine::pump(milliseconds timeout) {
             failPrologue(ErrorCode::connectionLost);
             failQueue(ErrorCode::connectionLost);
         }
-        if (stateChanged_) {
+        if (hasNews_) {
             break;
         }
         handled = waitAndReceive(deadline);
-    } while (handled == 0 && !stateChanged_ && !isWakeWanted_.exchange(false) && Clock::now() < deadline);
+    } while (handled == 0 && !hasNews_ && !isWakeWanted_.exchange(false) && Clock::now() < deadline);
     return handled;
 }
 

@@ -12,6 +12,7 @@
 #include <deque>
 #include <span>
 #include <string>
+#include <utility>
 
 struct iovec;
 
@@ -57,8 +58,6 @@ public:
     /// follow. Inside the callback that says `connected` the frame is one that goes ahead of all that waits
     /// in the queue.
     [[nodiscard]] OutgoingFrame* outgoing() noexcept;
-    /// The same, and counts a refusal.
-    [[nodiscard]] OutgoingFrame* outgoingOrRefused() noexcept;
     void publish(OutgoingFrame& frame) noexcept;
     void abandon(OutgoingFrame& frame) noexcept;
 
@@ -120,7 +119,8 @@ private:
     int wakeUp_ = -1;
     bool isPumping_ = false;
     bool isAnnouncing_ = false;
-    bool stateChanged_ = false;
+    /// Something happened that a caller of `pump` may wait for, other than a reply.
+    bool hasNews_ = false;
     bool announcedReconnecting_ = false;
     bool socketIsFull_ = false;
     /// Whether frames waited at the last attempt to connect.
@@ -136,6 +136,28 @@ private:
     std::atomic<bool> isConnected_{false};
     std::atomic<bool> isAsleep_{false};
     std::atomic<std::uint64_t> refused_{0};
+};
+
+/// A claimed place for a frame, given up unless it is published: whatever happens in between, the queue goes
+/// on.
+class ClaimedFrame {
+public:
+    explicit ClaimedFrame(Engine& engine) noexcept : engine_(engine), frame_(engine.outgoing()) {}
+    ClaimedFrame(const ClaimedFrame&) = delete;
+    ClaimedFrame& operator=(const ClaimedFrame&) = delete;
+    ~ClaimedFrame() {
+        if (frame_ != nullptr) {
+            engine_.abandon(*frame_);
+        }
+    }
+
+    explicit operator bool() const noexcept { return frame_ != nullptr; }
+    OutgoingFrame* operator->() noexcept { return frame_; }
+    void publish() noexcept { engine_.publish(*std::exchange(frame_, nullptr)); }
+
+private:
+    Engine& engine_;
+    OutgoingFrame* frame_;
 };
 
 } // namespace tamblo::client

@@ -9,7 +9,6 @@
 #include <span>
 #include <string_view>
 #include <type_traits>
-#include <utility>
 
 namespace tamblo::client {
 
@@ -20,13 +19,12 @@ namespace tamblo::client {
 /// the end.
 class MessageWriter {
 public:
-    MessageWriter(Engine& engine, OutgoingFrame* frame) noexcept;
+    explicit MessageWriter(Engine& engine);
     MessageWriter(const MessageWriter&) = delete;
     MessageWriter& operator=(const MessageWriter&) = delete;
-    ~MessageWriter();
 
     template <typename T> MessageWriter& set(std::string_view key, const T& value) {
-        if (frame_ != nullptr) {
+        if (frame_) {
             CborWriter writer(frame_->frame);
             writer.text(key);
             if constexpr (std::is_convertible_v<const T&, std::string_view>) {
@@ -44,7 +42,7 @@ public:
 
 private:
     Engine& engine_;
-    OutgoingFrame* frame_;
+    ClaimedFrame frame_;
     std::size_t entries_ = 0;
 };
 

@@ -30,14 +30,14 @@ function(tamblo_tests name)
     gtest_discover_tests(${name} DISCOVERY_MODE PRE_TEST PROPERTIES LABELS ${arg_LABEL} TIMEOUT 120)
 endfunction()
 
-file(GLOB_RECURSE unit_sources CONFIGURE_DEPENDS RELATIVE "${CMAKE_SOURCE_DIR}" tests/*.cpp)
+file(GLOB_RECURSE unit_sources CONFIGURE_DEPENDS RELATIVE "${CMAKE_SOURCE_DIR}" tests/*.cpp tests/*.c)
 file(GLOB_RECURSE core_sources CONFIGURE_DEPENDS RELATIVE "${CMAKE_SOURCE_DIR}"
     tests/session/*.cpp tests/service_core/*.cpp)
 file(GLOB_RECURSE service_sources CONFIGURE_DEPENDS RELATIVE "${CMAKE_SOURCE_DIR}" tests/service/*.cpp)
 list(FILTER unit_sources EXCLUDE REGEX "^tests/(service|service_core|session|fakes)/")
 
 tamblo_tests(tamblo_unit_tests LABEL unit SOURCES ${unit_sources}
-    LIBRARIES tests/fakes service workers system platform/linux client wire)
+    LIBRARIES tests/fakes service workers system platform/linux tools client wire)
 # Sessions and the service with a list of worker classes of the tests' own.
 tamblo_tests(tamblo_core_tests LABEL unit SOURCES ${core_sources} LIBRARIES tests/fakes service session)
 tamblo_tests(tamblo_service_tests LABEL service SOURCES ${service_sources} LIBRARIES client wire base)

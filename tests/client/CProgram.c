@@ -1,0 +1,110 @@
+#include "tests/client/CProgram.h"
+
+#include "client/tamblo.h"
+
+#include <string.h>
+
+typedef struct {
+    int replies;
+    int errors;
+    int64_t last_result;
+    int connected;
+    int lost;
+} Seen;
+
+static void on_reply(void* context, const tamblo_error* error, int64_t result) {
+    Seen* seen = context;
+    seen->replies += 1;
+    if (error != NULL && strcmp(error->domain, "com.vandra.tamblo.client") == 0 && error->code != 0) {
+        seen->errors += 1;
+    }
+    seen->last_result = result;
+}
+
+static void on_state(void* context, tamblo_state state) {
+    Seen* seen = context;
+    seen->connected += state == TAMBLO_CONNECTED;
+    seen->lost += state == TAMBLO_LOST;
+}
+
+static tamblo_payload* make_payload(void) {
+    static const unsigned char bytes[] = {0, 1, 255};
+    tamblo_payload* payload = tamblo_payload_create();
+    tamblo_payload_set_string(payload, "gone", "x");
+    tamblo_payload_clear(payload);
+    tamblo_payload_set_string(payload, "string", "text");
+    tamblo_payload_set_int(payload, "int", -5);
+    tamblo_payload_set_uint(payload, "uint", UINT64_MAX);
+    tamblo_payload_set_double(payload, "double", 0.1);
+    tamblo_payload_set_float(payload, "float", 0.5f);
+    tamblo_payload_set_bool(payload, "bool", true);
+    tamblo_payload_set_date(payload, "date", 1.5);
+    tamblo_payload_set_data(payload, "data", bytes, sizeof bytes);
+    return payload;
+}
+
+static int run_session(tamblo_client* client, const tamblo_payload* payload, Seen* seen) {
+    const int64_t reporters[] = {7};
+    if (!tamblo_client_create_session(client, 7, on_reply, seen))
+        return __LINE__;
+    if (!tamblo_client_set_service_type(client, 7, 7, on_reply, seen))
+        return __LINE__;
+    if (!tamblo_client_set_configuration(client, payload, 7, on_reply, seen))
+        return __LINE__;
+    if (!tamblo_client_start_session(client, 7, on_reply, seen))
+        return __LINE__;
+    if (!tamblo_client_send(client, payload, 0x08000004, 1, reporters, 1, on_reply, seen))
+        return __LINE__;
+    if (!tamblo_client_send(client, payload, 14, 0, NULL, 0, NULL, NULL))
+        return __LINE__;
+    if (!tamblo_client_stop_session(client, 7, on_reply, seen))
+        return __LINE__;
+    if (!tamblo_client_destroy_session(client, 7, NULL, NULL))
+        return __LINE__;
+    if (!tamblo_client_get_service_type(client, 7, on_reply, seen))
+        return __LINE__;
+    return 0;
+}
+
+int runCProgram(const char* socket_path) {
+    Seen seen = {0};
+    tamblo_options options = {0};
+    options.socket_path = socket_path;
+    options.threading = TAMBLO_CALLER;
+    options.state_changed = on_state;
+    options.context = &seen;
+    tamblo_client* client = tamblo_client_create(&options);
+    tamblo_payload* payload = make_payload();
+    if (client == NULL || !tamblo_client_connect(client) || !tamblo_client_is_connected(client))
+        return __LINE__;
+    const int failed = run_session(client, payload, &seen);
+    if (failed != 0)
+        return failed;
+    for (int i = 0; i < 1000 && seen.replies < 6; ++i) {
+        tamblo_client_run(client, 5);
+    }
+    if (seen.replies != 6 || seen.errors != 0 || seen.last_result != 7 || seen.connected != 1)
+        return __LINE__;
+    if (tamblo_client_refused_messages(client) != 0 || !tamblo_client_flush(client, 1000))
+        return __LINE__;
+    tamblo_payload_destroy(payload);
+    tamblo_client_destroy(client);
+    return seen.replies == 7 && seen.errors == 1 ? 0 : __LINE__; /* the start was never answered */
+}
+
+int runCProgramInBackground(const char* socket_path) {
+    tamblo_options options = {0};
+    options.socket_path = socket_path;
+    tamblo_client* client = tamblo_client_create(&options);
+    tamblo_payload* payload = make_payload();
+    if (client == NULL || payload == NULL)
+        return __LINE__;
+    Seen seen = {0};
+    const int failed = run_session(client, payload, &seen);
+    if (failed != 0)
+        return failed;
+    tamblo_payload_destroy(payload);
+    tamblo_client_flush(client, 5000);
+    tamblo_client_destroy(client);
+    return seen.replies == 7 ? 0 : __LINE__;
+}

@@ -1,0 +1,370 @@
+#include "client/Client.h"
+
+#include "client/Vocabulary.h"
+#include "tests/base/AllocationCount.h"
+#include "tests/client/FakeService.h"
+
+#include <atomic>
+#include <chrono>
+#include <string>
+#include <thread>
+#include <vector>
+
+#include <gtest/gtest.h>
+
+namespace tamblo::client {
+namespace {
+
+using namespace std::chrono_literals;
+using test::FakeService;
+using wire::Method;
+
+constexpr EventCategory kVolume = category(EventKind::volume);
+
+std::vector<Method> methodsOf(const std::vector<wire::Request>& requests) {
+    std::vector<Method> methods;
+    for (const wire::Request& request : requests) {
+        methods.push_back(request.method);
+    }
+    return methods;
+}
+
+/// Pumps until the condition holds, for at most five seconds.
+template <typename Condition> bool runUntil(Client& client, const Condition& condition) {
+    const auto deadline = std::chrono::steady_clock::now() + 5s;
+    while (!condition() && std::chrono::steady_clock::now() < deadline) {
+        client.run(5ms);
+    }
+    return condition();
+}
+
+class ClientInBothModes : public ::testing::TestWithParam<Client::Threading> {};
+INSTANTIATE_TEST_SUITE_P(, ClientInBothModes,
+                         ::testing::Values(Client::Threading::background, Client::Threading::caller));
+
+TEST_P(ClientInBothModes, AllRequestsReachTheServiceAndTheirRepliesComeBackTyped) {
+    FakeService service;
+    Client client({.socketPath = service.path(), .threading = GetParam()});
+    const std::int64_t reporters[] = {7, -8};
+    auto created = client.createReportingSession(7);
+    auto typed = client.setServiceType(ServiceType::longFormAudio, 7);
+    auto configured = client.setConfiguration({{"HostApplicationDisplayID", "com.example.music"}}, 7);
+    auto sent = client.sendMessage({{"volume", 0.5F}}, kVolume, EventType::start, reporters);
+    auto type = client.getServiceNameForReporterID(7);
+    auto state = client.reporterID(7);
+    auto all = client.getAllReporters();
+    auto stopped = client.stopReportingSessionForID(7);
+    auto destroyed = client.destroyReportingSession(-8);
+    ASSERT_TRUE(client.wait(destroyed, 5s));
+    for (auto* future : {&created, &typed, &configured, &stopped}) {
+        ASSERT_TRUE(client.wait(*future, 5s));
+        const Result<bool> result = future->get();
+        EXPECT_TRUE(result.ok() && result.value);
+    }
+    EXPECT_TRUE(sent.get().ok());
+    EXPECT_EQ(type.get().value, ServiceType::longFormAudio);
+    EXPECT_EQ(state.get().value, (Dictionary{{"reporterID", 7}, {"serviceType", 7}}));
+    EXPECT_EQ(all.get().value, (std::vector<std::int64_t>{7, -8}));
+
+    const auto requests = service.requests();
+    ASSERT_EQ(requests.size(), 9U);
+    EXPECT_EQ(requests[1].serviceType, 7);
+    EXPECT_EQ(requests[2].dictionary, (Dictionary{{"HostApplicationDisplayID", "com.example.music"}}));
+    EXPECT_EQ(requests[3].dictionary.find("volume")->kind(), Value::Kind::singleFloat);
+    EXPECT_EQ(requests[3].category, 14U);
+    EXPECT_EQ(requests[3].type, 1);
+    EXPECT_EQ(requests[3].reporterIDs, (std::vector<std::int64_t>{7, -8}));
+    EXPECT_EQ(requests[8].reporterID, -8);
+    EXPECT_EQ(service.refusals(), 0);
+}
+
+TEST_P(ClientInBothModes, PendingRequestsFailWhenTheServiceGoesAndSessionsAreRemadeBeforeWhatWaits) {
+    FakeService service;
+    std::mutex mutex;
+    std::vector<ConnectionState> states;
+    const auto countOf = [&](ConnectionState state) {
+        const std::lock_guard lock(mutex);
+        return std::count(states.begin(), states.end(), state);
+    };
+    Client* sender = nullptr;
+    std::atomic<bool> isArmed{false};
+    Client client(
+        {.socketPath = service.path(), .threading = GetParam(), .onState = [&](ConnectionState state) {
+             {
+                 const std::lock_guard lock(mutex);
+                 states.push_back(state);
+             }
+             if (state == ConnectionState::connected && isArmed) {
+                 sender->createReportingSession(7, nullptr);
+                 sender->startReportingSessionForID(7, nullptr);
+             }
+         }});
+    sender = &client;
+    auto held = client.startReportingSessionForID(7);
+    auto ready = client.createReportingSession(7);
+    ASSERT_TRUE(client.wait(ready, 5s));
+    isArmed = true;
+
+    service.stop();
+    ASSERT_TRUE(client.wait(held, 5s));
+    const Result<bool> lost = held.get();
+    ASSERT_FALSE(lost.ok());
+    EXPECT_EQ(lost.error->domain, kErrorDomain);
+    EXPECT_EQ(lost.error->code, static_cast<std::int64_t>(ErrorCode::connectionLost));
+    const std::int64_t reporters[] = {7};
+    auto waiting = client.sendMessage({{"n", 1}}, kVolume, EventType::generic, reporters);
+    EXPECT_FALSE(client.wait(waiting, 150ms));
+
+    service.start();
+    ASSERT_TRUE(client.wait(waiting, 5s));
+    EXPECT_TRUE(waiting.get().ok());
+    EXPECT_EQ(methodsOf(service.requests()),
+              (std::vector{Method::startReportingSessionForID, Method::createReportingSession,
+                           Method::createReportingSession, Method::startReportingSessionForID,
+                           Method::sendMessage}));
+    EXPECT_EQ(countOf(ConnectionState::connected), 2);
+    EXPECT_EQ(countOf(ConnectionState::lost), 1);
+    EXPECT_GE(countOf(ConnectionState::reconnecting), 1);
+}
+
+TEST_P(ClientInBothModes, AFullQueueRefusesAndCountsWithoutBlocking) {
+    FakeService service;
+    service.isDeaf = true;
+    Client client({.socketPath = service.path(), .threading = GetParam(), .queueCapacity = 8, .linger = 0ms});
+    const Dictionary payload{{"text", std::string(4000, 'x')}};
+    std::size_t accepted = 0;
+    for (int i = 0; i < 1000; ++i) {
+        accepted += client.post(payload, kVolume, EventType::generic, {7}) ? 1 : 0;
+        if (i % 100 == 0 && GetParam() == Client::Threading::caller) {
+            client.run(0ms);
+        }
+    }
+    EXPECT_GE(accepted, 8U);
+    EXPECT_EQ(client.refusedMessages(), 1000 - accepted);
+    EXPECT_GT(client.refusedMessages(), 500U);
+    auto refused = client.sendMessage(payload, kVolume, EventType::generic, {});
+    if (client.wait(refused, 50ms)) {
+        EXPECT_EQ(refused.get().error->code, static_cast<std::int64_t>(ErrorCode::refused));
+    }
+    service.isDeaf = false;
+    EXPECT_TRUE(client.flush(5s));
+    EXPECT_TRUE(service.waitForRequests(accepted));
+}
+
+TEST_P(ClientInBothModes, FramesOfEverySizeArriveAndOnesOverTheLimitAreRefusedHere) {
+    FakeService service;
+    Client client({.socketPath = service.path(), .threading = GetParam()});
+    std::future<Result<Nothing>> last;
+    for (const std::size_t size : {0U, 900U, 1024U, 5000U, 300000U, 1048000U}) {
+        last = client.sendMessage({{"text", std::string(size, 'x')}}, kVolume, EventType::generic, {});
+    }
+    auto over = client.sendMessage({{"text", std::string(1048577, 'x')}}, kVolume, EventType::generic, {});
+    ASSERT_TRUE(client.wait(over, 0ms));
+    EXPECT_EQ(over.get().error->code, static_cast<std::int64_t>(ErrorCode::refused));
+    EXPECT_EQ(client.refusedMessages(), 1U);
+    ASSERT_TRUE(client.wait(last, 5s));
+    EXPECT_TRUE(last.get().ok());
+    const auto requests = service.requests();
+    ASSERT_EQ(requests.size(), 6U);
+    EXPECT_EQ(requests[4].dictionary.find("text")->stringValue().size(), 300000U);
+}
+
+TEST_P(ClientInBothModes, TheEndSendsWhatIsQueuedAndAnswersWhatWaits) {
+    FakeService service;
+    std::future<Result<bool>> held;
+    {
+        Client client({.socketPath = service.path(), .threading = GetParam()});
+        auto ready = client.createReportingSession(7);
+        ASSERT_TRUE(client.wait(ready, 5s));
+        held = client.startReportingSessionForID(7);
+        client.post({}, kVolume, EventType::generic);
+    }
+    EXPECT_EQ(held.get().error->code, static_cast<std::int64_t>(ErrorCode::closed));
+    EXPECT_TRUE(service.waitForRequests(3));
+}
+
+TEST(Client, SecondRepliesAreDroppedUnlessAskedForAndStrangeOnesHarmNothing) {
+    FakeService service([](const wire::Request& request, TextBuffer& replies) {
+        wire::appendBooleanReply(replies, 12345, true);
+        wire::appendErrorReply(replies, 0, {"com.vandra.tamblo.protocol", -32700, ""});
+        FakeService::answer(request, replies);
+        FakeService::answer(request, replies);
+    });
+    Client client({.socketPath = service.path(), .threading = Client::Threading::caller});
+    int first = 0;
+    int every = 0;
+    int strange = 0;
+    client.getServiceNameForReporterID(0, [&](auto&& reply) { first += reply.ok() ? 1 : 100; });
+    client.getServiceNameForReporterID(
+        0, [&](auto&& reply) { every += reply.ok() ? 1 : 100; }, Replies::every);
+    client.reporterID(1, [&](auto&&) { ++strange; });
+    ASSERT_TRUE(runUntil(client, [&] { return strange == 1; }));
+    auto again = client.getServiceNameForReporterID(0);
+    ASSERT_TRUE(client.wait(again, 5s));
+    EXPECT_EQ(first, 1);
+    EXPECT_EQ(every, 2);
+    service.stop();
+    ASSERT_TRUE(runUntil(client, [&] { return every == 102; })) << every;
+    EXPECT_EQ(first, 1);
+    EXPECT_EQ(strange, 1);
+}
+
+TEST(Client, AReplyOfAnotherKindAndAnErrorReplyAreErrors) {
+    FakeService service([](const wire::Request& request, TextBuffer& replies) {
+        if (request.method == Method::createReportingSession) {
+            wire::appendUnsignedReply(replies, *request.id, 3);
+        } else {
+            wire::appendErrorReply(replies, *request.id, {"com.vandra.audio.reporting", 1, "off"});
+        }
+    });
+    Client client({.socketPath = service.path(), .threading = Client::Threading::caller});
+    auto wrong = client.createReportingSession(7);
+    auto disabled = client.sendMessage({}, kVolume, EventType::generic, {});
+    ASSERT_TRUE(client.wait(disabled, 5s));
+    EXPECT_EQ(wrong.get().error->code, static_cast<std::int64_t>(ErrorCode::unexpectedReply));
+    const auto error = disabled.get().error;
+    EXPECT_EQ(error->domain, "com.vandra.audio.reporting");
+    EXPECT_EQ(error->code, 1);
+    EXPECT_EQ(error->message, "off");
+}
+
+TEST(Client, WithoutReconnectionWhatCannotBeSentIsAnsweredAtOnce) {
+    Client client(
+        {.socketPath = "/nonexistent/socket", .threading = Client::Threading::caller, .reconnect = false});
+    EXPECT_FALSE(client.connect());
+    auto future = client.createReportingSession(7);
+    ASSERT_TRUE(client.wait(future, 1s));
+    EXPECT_EQ(future.get().error->code, static_cast<std::int64_t>(ErrorCode::connectionLost));
+}
+
+TEST(Client, AFrameCutShortByTheEndOfAConnectionIsSentAgainInFull) {
+    FakeService service;
+    service.isDeaf = true;
+    Client client({.socketPath = service.path(), .threading = Client::Threading::caller});
+    ASSERT_TRUE(client.connect());
+    const Dictionary payload{{"text", std::string(900000, 'x')}};
+    auto first = client.sendMessage(payload, kVolume, EventType::generic, {});
+    auto second = client.sendMessage({{"n", 2}}, kVolume, EventType::generic, {});
+    EXPECT_FALSE(client.wait(second, 20ms));
+    service.stop();
+    service.isDeaf = false;
+    service.start();
+    ASSERT_TRUE(client.wait(second, 5s));
+    EXPECT_TRUE(first.get().ok());
+    EXPECT_TRUE(second.get().ok());
+    EXPECT_EQ(service.requests().size(), 2U);
+    EXPECT_EQ(service.requests()[0].dictionary, payload);
+    EXPECT_EQ(service.refusals(), 0);
+}
+
+TEST(Client, MessagesOfOneThreadKeepTheirOrderAndManyThreadsLoseNone) {
+    FakeService service;
+    constexpr int kThreads = 4;
+    constexpr int kMessages = 2000;
+    {
+        Client client({.socketPath = service.path(), .queueCapacity = 256});
+        std::vector<std::thread> threads;
+        for (int thread = 0; thread < kThreads; ++thread) {
+            threads.emplace_back([&client, thread] {
+                for (int i = 0; i < kMessages; ++i) {
+                    const std::int64_t reporters[] = {thread};
+                    while (i % 2 == 0
+                               ? !client.post({{"n", i}}, kVolume, EventType::generic, reporters)
+                               : !client.message().set("n", i).send(kVolume, EventType::generic, reporters)) {
+                        std::this_thread::sleep_for(100us);
+                    }
+                }
+            });
+        }
+        for (std::thread& thread : threads) {
+            thread.join();
+        }
+        ASSERT_TRUE(client.flush(5s));
+    }
+    ASSERT_TRUE(service.waitForRequests(kThreads * kMessages));
+    std::vector<std::int64_t> next(kThreads, 0);
+    for (const wire::Request& request : service.requests()) {
+        ASSERT_EQ(request.dictionary.find("n")->integerValue(),
+                  next[static_cast<std::size_t>(request.reporterIDs.at(0))]++);
+    }
+}
+
+TEST_P(ClientInBothModes, SendingAllocatesNothingOnTheCallingThread) {
+    FakeService service;
+    Client client({.socketPath = service.path(), .threading = GetParam()});
+    const Dictionary payload{{"name", std::string(300, 'x')}, {"volume", 0.5}};
+    const std::int64_t reporters[] = {7};
+    std::atomic<int> replies = 0;
+    const auto allocations = test::allocationsOf([&] {
+        client.post(payload, kVolume, EventType::generic, reporters);
+        client.sendMessage(payload, kVolume, EventType::generic, reporters,
+                           [&replies](auto&&) { ++replies; });
+        client.message().set("name", "text").set("volume", 0.5).send(kVolume, EventType::generic, reporters);
+    });
+    EXPECT_EQ(allocations.blocks, 0U);
+    EXPECT_TRUE(client.flush(5s));
+    EXPECT_TRUE(service.waitForRequests(3));
+}
+
+TEST(MessageWriter, WritesWhatTheServiceReadsAndNothingWhenDropped) {
+    FakeService service;
+    Client client({.socketPath = service.path(), .threading = Client::Threading::caller});
+    client.message().set("lost", 1);
+    const std::int64_t reporters[] = {7, 8};
+    EXPECT_TRUE(client.message()
+                    .set("text", std::string("a"))
+                    .set("on", true)
+                    .set("n", std::int64_t{-5})
+                    .set("float", 0.5F)
+                    .set("when", Value::date(3))
+                    .send(kVolume, EventType::stop, reporters));
+    EXPECT_FALSE(
+        client.message().set("long", std::string(1048577, 'x')).send(kVolume, EventType::stop, reporters));
+    EXPECT_EQ(client.refusedMessages(), 1U);
+    ASSERT_TRUE(client.flush(5s));
+    ASSERT_TRUE(service.waitForRequests(1));
+    const wire::Request request = service.requests().at(0);
+    EXPECT_EQ(
+        request.dictionary,
+        (Dictionary{{"text", "a"}, {"on", true}, {"n", -5}, {"float", 0.5F}, {"when", Value::date(3)}}));
+    EXPECT_EQ(request.type, 2);
+    EXPECT_EQ(request.reporterIDs, (std::vector<std::int64_t>{7, 8}));
+}
+
+TEST(Vocabulary, NamesAndNumbersAreRead) {
+    const struct {
+        std::string_view text;
+        std::optional<std::uint32_t> category;
+    } categories[] = {
+        {"Session_Playback", 0x08000004},
+        {"Toolbox_Wirrels", 0x80000011},
+        {"Volume", 14},
+        {"14", 14},
+        {"0x08000004", 0x08000004},
+        {"Unknown", 0xFFFFFFFF},
+        {"4294967295", 0xFFFFFFFF},
+        {"4294967296", {}},
+        {"volume", {}},
+        {"_Volume", {}},
+        {"Session_", {}},
+        {"0x", {}},
+        {"-1", {}},
+        {"", {}},
+    };
+    for (const auto& row : categories) {
+        const auto parsed = parseCategory(row.text);
+        EXPECT_EQ(parsed ? std::optional(static_cast<std::uint32_t>(*parsed)) : std::nullopt, row.category)
+            << row.text;
+    }
+    EXPECT_EQ(parseType("Listeningenhancement"), EventType::listeningEnhancement);
+    EXPECT_EQ(parseType("65535"), EventType::unknown);
+    EXPECT_FALSE(parseType("65536"));
+    EXPECT_EQ(parseServiceType("longformaudio"), ServiceType::longFormAudio);
+    EXPECT_EQ(parseServiceType("unknown"), ServiceType::unknown);
+    EXPECT_FALSE(parseServiceType("LongFormAudio"));
+    EXPECT_EQ(serviceTypeName(static_cast<ServiceType>(13)), "systemsounds");
+    EXPECT_EQ(serviceTypeName(static_cast<ServiceType>(14)), "unknown");
+}
+
+} // namespace
+} // namespace tamblo::client
