@@ -8,11 +8,28 @@ foreach(target tamblod tambloctl tamblo)
     endif()
 endforeach()
 
+# Adds to the list `headers` the given header and those of this project that it includes, directly or not.
+function(tamblo_add_header_with_includes header)
+    if(header IN_LIST headers OR NOT EXISTS "${CMAKE_SOURCE_DIR}/${header}")
+        return()
+    endif()
+    list(APPEND headers ${header})
+    file(STRINGS "${CMAKE_SOURCE_DIR}/${header}" includes REGEX "^#include \"")
+    foreach(include IN LISTS includes)
+        string(REGEX REPLACE "^#include \"([^\"]+)\".*" "\\1" included "${include}")
+        tamblo_add_header_with_includes("${included}")
+    endforeach()
+    set(headers "${headers}" PARENT_SCOPE)
+endfunction()
+
 # The client library's headers are included as they are in this tree: "client/Client.h" below
-# include/tamblo, which the pkg-config file names.
-foreach(folder base client)
-    install(DIRECTORY "${CMAKE_SOURCE_DIR}/${folder}/" DESTINATION "${CMAKE_INSTALL_INCLUDEDIR}/tamblo/${folder}"
-        FILES_MATCHING PATTERN "*.h")
+# include/tamblo, which the pkg-config file names. What only its own sources include stays here.
+foreach(entry client/Client.h client/Directories.h client/tamblo.h)
+    tamblo_add_header_with_includes(${entry})
+endforeach()
+foreach(header IN LISTS headers)
+    get_filename_component(directory "${header}" DIRECTORY)
+    install(FILES ${header} DESTINATION "${CMAKE_INSTALL_INCLUDEDIR}/tamblo/${directory}")
 endforeach()
 configure_file(packaging/tamblo.pc.in tamblo.pc @ONLY)
 install(FILES "${CMAKE_BINARY_DIR}/tamblo.pc" DESTINATION "${CMAKE_INSTALL_LIBDIR}/pkgconfig")
