@@ -1,0 +1,289 @@
+#include "tests/service_core/ServiceTestBase.h"
+#include "util/LogCategories.h"
+
+#include <atomic>
+#include <random>
+#include <thread>
+
+namespace tamblo {
+namespace {
+
+using std::chrono::milliseconds;
+using testing::ElementsAre;
+using testing::IsEmpty;
+
+constexpr const char* kUptimeEvent = "com.vandra.tamblo.zrreportingclientuptime";
+
+class ServiceTest : public ServiceTestBase {
+protected:
+    Dictionary onlyUptime() {
+        const std::vector<Dictionary> payloads = device.analyticsEvents.payloads(kUptimeEvent);
+        EXPECT_EQ(payloads.size(), 1U);
+        return payloads.empty() ? Dictionary{} : payloads.front();
+    }
+};
+
+TEST_F(ServiceTest, AcceptsEveryClientInOrder) {
+    const Connection first = connect(10);
+    const Connection second = connect(11);
+    ASSERT_EQ(service->getAllClients().size(), 2U);
+    EXPECT_TRUE(first->isResumed());
+    EXPECT_EQ(service->getAllClients()[1]->processIdentifier(), 11);
+    EXPECT_EQ(service->getAllClients()[1]->clientProcessName(), "app11");
+    EXPECT_EQ(service->getAllClients()[1]->clientStartDate(), device.clock.now());
+    EXPECT_EQ(device.log.count("newConnection: connection of 10"), 1U);
+    EXPECT_EQ(device.log.count("new client with pid 11"), 1U);
+}
+
+TEST_F(ServiceTest, FindsSessionsByID) {
+    const Connection first = connect(10);
+    const Connection second = connect(11);
+    open(second, 7);
+    open(second, 8);
+    device.log.clear();
+    EXPECT_THAT(found({7, 0, 7, 8}), ElementsAre(7, 7, 8));
+    EXPECT_THAT(device.log.texts(), ElementsAre("found reporting session 7 for client 11",
+                                                "found reporting session 7 for client 11",
+                                                "found reporting session 8 for client 11"));
+    device.log.clear();
+    EXPECT_THAT(found({9}), IsEmpty()) << "no falling back when IDs were given";
+    EXPECT_THAT(device.log.texts(), ElementsAre("failed to find reporting session 9"));
+    EXPECT_EQ(service->singleMessageSession(), nullptr);
+
+    open(first, 7);
+    EXPECT_EQ(find(7)->processIdentifiers().front(), 10) << "the client that was accepted first wins";
+    first->interrupt();
+    (void)run();
+    EXPECT_EQ(find(7)->processIdentifiers().front(), 11);
+}
+
+TEST_F(ServiceTest, TheRegistryFindsWhatAWalkOverTheClientsWould) {
+    std::mt19937 random(11);
+    const auto upTo = [&](unsigned most) { return random() % (most + 1); };
+    std::vector<Connection> connections;
+    for (int step = 0; step < 3000; ++step) {
+        if (connections.empty() || (connections.size() < 6 && upTo(30) == 0)) {
+            connections.push_back(connect(100 + step));
+        }
+        const std::size_t at = upTo(static_cast<unsigned>(connections.size() - 1));
+        ZRReportingServiceProtocol& client = connections[at]->object();
+        const ReporterID id = upTo(4) + 1;
+        switch (upTo(12)) {
+        case 0:
+            connections[at]->invalidate();
+            connections.erase(connections.begin() + static_cast<int>(at));
+            break;
+        case 1:
+            client.destroyReportingSession(id, {});
+            break;
+        case 2:
+            client.setServiceType(static_cast<std::uint16_t>(upTo(3)), id, {});
+            break;
+        case 3:
+        case 4:
+            client.stopReportingSessionForID(id, {});
+            break;
+        case 5:
+        case 6:
+        case 7:
+            client.startReportingSessionForID(id, {});
+            break;
+        default:
+            client.createReportingSession(id, {});
+            break;
+        }
+        (void)run();
+        std::vector<SessionRef> active;
+        for (const ClientRef& each : service->getAllClients()) {
+            for (const auto& [key, session] : each->clientReportingSessionMap()) {
+                if (session->started()) {
+                    active.push_back(session);
+                }
+            }
+        }
+        ASSERT_EQ(service->getAllActiveReportingSessions(), active) << step;
+        for (ReporterID each = 1; each <= 5; ++each) {
+            SessionRef first;
+            for (const ClientRef& holder : service->getAllClients()) {
+                first = first != nullptr ? first : holder->findReportingSessionForID(each, false);
+            }
+            ASSERT_EQ(find(each), first) << step;
+        }
+        device.log.clear();
+    }
+}
+
+TEST_F(ServiceTest, MessagesWithoutIDsGoToEveryStartedSession) {
+    const Connection first = connect(10);
+    const Connection second = connect(11);
+    open(first, 7);
+    open(second, 8);
+    second->object().createReportingSession(9, {});
+    (void)run();
+    device.log.clear();
+    EXPECT_THAT(found({}), ElementsAre(7, 8));
+    EXPECT_EQ(device.log.count("sessions for client 11 : [reporterID=8,"), 2U);
+    EXPECT_EQ(device.log.count("2 active reporting session(s) [reporterID=7,"), 1U);
+    send(first, {}, {{"to", "both"}});
+    EXPECT_EQ(find(7)->messages().back()->payload(), find(8)->messages().back()->payload());
+    EXPECT_TRUE(find(8)->messages().back()->payload().contains("to"));
+    EXPECT_EQ(service->singleMessageSession(), nullptr);
+}
+
+TEST_F(ServiceTest, TheSingleMessageSessionLivesUntilItIsIdleForMoreThanFiveSeconds) {
+    const Connection client = connect(10);
+    send(client, {});
+    const SessionRef session = service->singleMessageSession();
+    ASSERT_NE(session, nullptr);
+    EXPECT_EQ(session->description(),
+              "reporterID=1,serviceName=standalone,ownerPid=4321,clientProcessName=(null),"
+              "HostApplicationDisplayID=Unknown,started=1,singleMessageSession=1");
+    EXPECT_EQ(session->messages().back()->payload().find("a")->integerValue(), 1);
+    EXPECT_EQ(find(1), nullptr) << "it cannot be had by its ID";
+    ASSERT_EQ(device.workQueues.timers().size(), 1U);
+    EXPECT_EQ(device.workQueues.timers().front()->interval, milliseconds(500));
+
+    device.clock.advance(milliseconds(4000));
+    send(client, {});
+    EXPECT_EQ(service->singleMessageSession(), session);
+    device.clock.advance(milliseconds(5000));
+    device.workQueues.tick();
+    EXPECT_TRUE(session->started()) << "exactly 5 seconds";
+    EXPECT_EQ(device.log.count("Not stopping singleMessageSession. elapsed=5.000000 timeout=5.000000"), 1U);
+    device.clock.advance(milliseconds(1));
+    device.workQueues.tick();
+    EXPECT_FALSE(session->started());
+    EXPECT_EQ(service->singleMessageSession(), nullptr);
+    EXPECT_EQ(device.workQueues.runningTimers(), 0U) << "an idle service makes no wake-ups";
+    EXPECT_EQ(device.log.count("Stopping singleMessageSession after timeout=5.000000"), 1U);
+
+    send(client, {});
+    EXPECT_NE(service->singleMessageSession(), session);
+    EXPECT_EQ(device.log.count("Creating singleMessageSession"), 2U);
+    EXPECT_EQ(device.workQueues.runningTimers(), 1U);
+}
+
+TEST_F(ServiceTest, TheReaperStopsWhileMessagesComeIn) {
+    const Connection client = connect(10);
+    script.atStop["Late"] = [](ZRReportingSession& owner) {
+        owner.sendMessage(std::make_shared<ZRReportingSessionMessage>(Dictionary{{"summary", 1}}, 1, 11));
+    };
+    std::atomic<bool> isDone{false};
+    std::thread reaper([&] {
+        while (!isDone) {
+            device.clock.advance(milliseconds(1200));
+            device.workQueues.tick();
+            std::this_thread::yield();
+        }
+    });
+    for (int i = 0; i < 2000; ++i) {
+        send(client, {}, {{"n", i}});
+    }
+    isDone = true;
+    reaper.join();
+    service->shutDown([] {});
+    (void)run();
+    EXPECT_EQ(script.count("stop Init"), device.log.count("Creating singleMessageSession"));
+    EXPECT_LE(script.count("message Init 14/11"), 2000U);
+    EXPECT_GE(script.count("message Init 14/11"), 1000U);
+}
+
+TEST_F(ServiceTest, ALostClientIsRemovedOnceAndReportedOnce) {
+    Connection client = connect(10);
+    open(client, 7);
+    client->object().createReportingSession(8, {});
+    device.clock.advance(milliseconds(2500));
+    client->interrupt();
+    client->invalidate();
+    EXPECT_EQ(service->getAllClients().size(), 1U) << "on the queue, not on the connection's thread";
+    (void)run();
+    EXPECT_THAT(service->getAllClients(), IsEmpty());
+    EXPECT_EQ(script.count("stop Init"), 1U) << "only what was started is stopped";
+    EXPECT_EQ(find(8), nullptr);
+    EXPECT_EQ(device.log.count("removing 10 from the server client list"), 1U);
+    EXPECT_EQ(device.log.count("interruptionHandler: connection exited"), 1U);
+    EXPECT_EQ(device.log.count("invalidationHandler: connection exited process=app10 uptime_sec=2"), 1U);
+    EXPECT_EQ(device.log.count("dealloc 10 from the server client list"), 1U);
+    EXPECT_EQ(onlyUptime(), (Dictionary{{"processName", "app10"}, {"seconds", 2.5}}));
+}
+
+TEST_F(ServiceTest, UptimeOfAClientThatStartedInTheFuture) {
+    const Connection client = connect(10);
+    device.clock.advance(milliseconds(-3000));
+    client->invalidate();
+    (void)run();
+    EXPECT_EQ(onlyUptime().find("seconds")->doubleValue(), 3.0);
+    EXPECT_EQ(device.log.count("clientStartDate is in the past. clientpid=10 clientprocessname=app10"), 1U);
+}
+
+TEST_F(ServiceTest, UptimeOfAClientThatIsNotKnown) {
+    const auto nameless = device.connections.connect(10);
+    nameless->invalidate();
+    (void)run();
+    const Connection gone = connect(11);
+    gone->interrupt();
+    (void)run();
+    gone->dropObject();
+    gone->invalidate();
+    (void)run();
+    EXPECT_THAT(device.analyticsEvents.events(), IsEmpty());
+    EXPECT_EQ(device.log.count("clientProcessName is nil. clientpid=10"), 1U);
+    EXPECT_EQ(device.log.count("clientStartDate is nil. clientpid=11 clientprocessname=unknown"), 1U);
+    EXPECT_EQ(device.log.count("invalidationHandler: connection exited process=unknown uptime_sec=-1"), 1U);
+    EXPECT_EQ(device.log.count("clientProcessName is nil. clientpid=11"), 1U);
+}
+
+TEST_F(ServiceTest, ShutDownWorksOffWhatIsQueuedThenStopsEverything) {
+    const Connection first = connect(10);
+    const Connection second = connect(11);
+    send(first, {});
+    const SessionRef single = service->singleMessageSession();
+    open(first, 7);
+    open(second, 8);
+    script.atStop["Producer"] = [](ZRReportingSession& owner) {
+        owner.sendMessage(std::make_shared<ZRReportingSessionMessage>(Dictionary{{"summary", 1}}, 1, 11));
+    };
+    (void)script.take();
+    first->object().sendMessage({{"last", 1}}, 14, 11, {7}, note("send"));
+    bool isCompleted = false;
+    service->shutDown([&] { isCompleted = true; });
+    EXPECT_FALSE(isCompleted);
+    (void)run();
+    EXPECT_TRUE(isCompleted);
+    EXPECT_EQ(script.take().front(), "message Init 14/11");
+    EXPECT_THAT(takeReplies(), ElementsAre("send", "send"));
+    EXPECT_THAT(service->getAllClients(), IsEmpty());
+    EXPECT_FALSE(single->started());
+    EXPECT_EQ(service->singleMessageSession(), nullptr);
+    EXPECT_EQ(device.workQueues.runningTimers(), 0U);
+    first->invalidate();
+    (void)run();
+    EXPECT_EQ(device.log.count("removing 10 from the server client list"), 1U);
+    EXPECT_EQ(onlyUptime().find("processName")->stringValue(), "app10");
+}
+
+TEST_F(ServiceTest, DestroyingTheServiceEndsTheReaper) {
+    const Connection client = connect(10);
+    send(client, {});
+    EXPECT_EQ(device.workQueues.runningTimers(), 1U);
+    service.reset();
+    EXPECT_EQ(device.workQueues.runningTimers(), 0U);
+    const auto lines = device.log.lines();
+    EXPECT_THAT(lines,
+                testing::Contains(testing::AllOf(testing::Field(&FakeLog::Line::text, "destroying service"),
+                                                 testing::Field(&FakeLog::Line::category, "zrrc"))));
+}
+
+TEST_F(ServiceTest, NoWalkOverTheClientsWhenTheirLinesAreOff) {
+    const Connection client = connect(10);
+    open(client, 7);
+    device.log.setThreshold(LogLevel::error);
+    forgetLogThresholds();
+    device.log.clear();
+    EXPECT_THAT(found({}), ElementsAre(7));
+    service->logReportingSessions();
+    EXPECT_THAT(device.log.lines(), IsEmpty());
+}
+
+} // namespace
+} // namespace tamblo

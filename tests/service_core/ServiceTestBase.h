@@ -1,0 +1,92 @@
+#pragma once
+
+#include "service/ZRReportingClientServerInstance.h"
+#include "service/ZRReportingService.h"
+#include "session/ZRReportingSession.h"
+#include "tests/fakes/FakePlatform.h"
+#include "tests/session/ScriptedWorkers.h"
+
+#include <gmock/gmock.h>
+
+#include <memory>
+#include <string>
+#include <vector>
+
+namespace tamblo {
+
+/// A service on an in-memory device, with clients that are the test.
+class ServiceTestBase : public testing::Test {
+protected:
+    using Connection = std::unique_ptr<FakeClientConnection>;
+
+    explicit ServiceTestBase(bool isInternalBuild = false) : device(LogLevel::debug, isInternalBuild) {
+        script.reset();
+        exitStatus() = 0;
+        ConnectionListener& listener =
+            device.connections.listenerForServiceName("com.vandra.tamblo.reporting");
+        listener.setDelegate(*service);
+        listener.resume();
+    }
+    ~ServiceTestBase() override {
+        (void)run();
+        script.reset();
+    }
+
+    std::size_t run() { return device.serverQueue().runAll(); }
+
+    Connection connect(pid_t pid) {
+        device.processInformation.names.emplace(pid, "app" + std::to_string(pid));
+        Connection connection = device.connections.connect(pid);
+        (void)run();
+        return connection;
+    }
+    /// A started session of this ID.
+    void open(const Connection& client, ReporterID reporterID) {
+        client->object().createReportingSession(reporterID, {});
+        client->object().startReportingSessionForID(reporterID, {});
+        (void)run();
+    }
+    void send(const Connection& client, std::vector<ReporterID> reporterIDs,
+              Dictionary payload = {{"a", 1}}) {
+        client->object().sendMessage(std::move(payload), 14, 11, std::move(reporterIDs), note("send"));
+        (void)run();
+    }
+    /// A reply that notes the name and what it is called with.
+    template <typename... Result> auto noteWith(std::string name) {
+        return [this, name = std::move(name)](const ReplyError* error, const Result&... result) {
+            std::string text = name;
+            if (error != nullptr) {
+                text += " " + error->domain + " " + std::to_string(error->code);
+            }
+            ((text += " " + std::to_string(result)), ...);
+            replies.push_back(std::move(text));
+        };
+    }
+    ErrorReply note(std::string name) { return noteWith<>(std::move(name)); }
+    BooleanReply noteBoolean(std::string name) { return noteWith<bool>(std::move(name)); }
+    /// What was answered since the last call.
+    std::vector<std::string> takeReplies() { return std::exchange(replies, {}); }
+
+    SessionRef find(ReporterID reporterID) { return service->findReportingSessionForID(reporterID); }
+    std::vector<ReporterID> found(const std::vector<ReporterID>& reporterIDs) {
+        std::vector<SessionRef> sessions;
+        service->findReportingSessionsForIDs(reporterIDs, sessions);
+        std::vector<ReporterID> ids;
+        for (const SessionRef& session : sessions) {
+            ids.push_back(session->reporterID());
+        }
+        return ids;
+    }
+    static int& exitStatus() {
+        static int status = 0;
+        return status;
+    }
+
+    FakePlatform device;
+    WorkerScript& script = WorkerScript::current();
+    std::vector<std::string> replies;
+    std::unique_ptr<ZRReportingService> service =
+        std::make_unique<ZRReportingService>([](int status) { exitStatus() = status; });
+};
+
+} // namespace tamblo
