@@ -20,7 +20,7 @@ public:
         /// Added to the environment, the directories' variables among them if they are to differ.
         std::vector<std::pair<std::string, std::string>> environment;
         /// Called in the child between fork and exec.
-        std::function<void()> beforeExec;
+        std::function<void()> beforeExec{};
         /// Without it, the constructor returns before the service is ready.
         bool awaitsReady = true;
     };
