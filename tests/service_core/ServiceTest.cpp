@@ -23,18 +23,6 @@ protected:
     }
 };
 
-TEST_F(ServiceTest, AcceptsEveryClientInOrder) {
-    const Connection first = connect(10);
-    const Connection second = connect(11);
-    ASSERT_EQ(service->getAllClients().size(), 2U);
-    EXPECT_TRUE(first->isResumed());
-    EXPECT_EQ(service->getAllClients()[1]->processIdentifier(), 11);
-    EXPECT_EQ(service->getAllClients()[1]->clientProcessName(), "app11");
-    EXPECT_EQ(service->getAllClients()[1]->clientStartDate(), device.clock.now());
-    EXPECT_EQ(device.log.count("newConnection: connection of 10"), 1U);
-    EXPECT_EQ(device.log.count("new client with pid 11"), 1U);
-}
-
 TEST_F(ServiceTest, FindsSessionsByID) {
     const Connection first = connect(10);
     const Connection second = connect(11);
@@ -207,15 +195,6 @@ TEST_F(ServiceTest, ALostClientIsRemovedOnceAndReportedOnce) {
     EXPECT_EQ(onlyUptime(), (Dictionary{{"processName", "app10"}, {"seconds", 2.5}}));
 }
 
-TEST_F(ServiceTest, UptimeOfAClientThatStartedInTheFuture) {
-    const Connection client = connect(10);
-    device.clock.advance(milliseconds(-3000));
-    client->invalidate();
-    (void)run();
-    EXPECT_EQ(onlyUptime().find("seconds")->doubleValue(), 3.0);
-    EXPECT_EQ(device.log.count("clientStartDate is in the past. clientpid=10 clientprocessname=app10"), 1U);
-}
-
 TEST_F(ServiceTest, UptimeOfAClientThatIsNotKnown) {
     const auto nameless = device.connections.connect(10);
     nameless->invalidate();
@@ -272,17 +251,6 @@ TEST_F(ServiceTest, DestroyingTheServiceEndsTheReaper) {
     EXPECT_THAT(lines,
                 testing::Contains(testing::AllOf(testing::Field(&FakeLog::Line::text, "destroying service"),
                                                  testing::Field(&FakeLog::Line::category, "zrrc"))));
-}
-
-TEST_F(ServiceTest, NoWalkOverTheClientsWhenTheirLinesAreOff) {
-    const Connection client = connect(10);
-    open(client, 7);
-    device.log.setThreshold(LogLevel::error);
-    forgetLogThresholds();
-    device.log.clear();
-    EXPECT_THAT(found({}), ElementsAre(7));
-    service->logReportingSessions();
-    EXPECT_THAT(device.log.lines(), IsEmpty());
 }
 
 } // namespace

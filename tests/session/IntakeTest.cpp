@@ -131,22 +131,6 @@ TEST_F(IntakeTest, WhatIsRedundant) {
     }
 }
 
-TEST_F(IntakeTest, OnlyTheLastAcceptedMessageOfItsKindIsCompared) {
-    const auto session = ZRReportingSession::initWithID(5, {1});
-    const auto isRedundant = [&](int value, AudioEventType type) {
-        const auto message = makeMessage({{"a", value}}, 14, type);
-        session->sendMessage(message);
-        return bool{message->isRedundant};
-    };
-    EXPECT_FALSE(isRedundant(1, 11));
-    EXPECT_FALSE(isRedundant(1, 12)) << "of another type";
-    EXPECT_FALSE(isRedundant(2, 11));
-    EXPECT_FALSE(isRedundant(1, 11)) << "another one lies between";
-    EXPECT_TRUE(isRedundant(1, 11));
-    device.clock.advance(std::chrono::hours(24));
-    EXPECT_TRUE(isRedundant(1, 11)) << "however late";
-}
-
 /// What a walk over the session's list from its end says.
 bool walkSaysRedundant(const std::vector<MessageRef>& accepted, const ZRReportingSessionMessage& message) {
     if (message.type() == AudioEventTypeError || message.category() == AudioEventKindError) {
@@ -200,22 +184,6 @@ TEST_F(IntakeTest, TheIndexSaysWhatAWalkOverTheListWouldAlsoAfterTheSort) {
         EXPECT_EQ(wrongAfterSort, 0);
     }
     EXPECT_GT(redundant, 100);
-}
-
-TEST_F(IntakeTest, TheIndexHoldsManyKinds) {
-    LastMessageIndex index;
-    std::vector<MessageRef> messages;
-    for (AudioEventCategory category = 0; category < 300; ++category) {
-        for (const AudioEventType type : {AudioEventTypeGeneric, AudioEventTypeUnknown}) {
-            messages.push_back(makeMessage({}, category << 20U, type));
-            index.add(*messages.back());
-        }
-    }
-    for (const MessageRef& message : messages) {
-        ASSERT_EQ(index.find(message->category(), message->type()), message.get());
-    }
-    index.clear();
-    EXPECT_EQ(index.find(0, 0), nullptr);
 }
 
 TEST_F(IntakeTest, RecordsAreIndependentOfWhatTheyWereMadeFrom) {

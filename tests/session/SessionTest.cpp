@@ -182,26 +182,6 @@ TEST_F(SessionTest, ProducersSendWhileConsumersStillRun) {
     EXPECT_THAT(session->messages(), IsEmpty());
 }
 
-TEST_F(SessionTest, ProducersSeeTheMessagesSortedStably) {
-    const auto session = makeSession();
-    std::vector<std::int64_t> seen;
-    script.atStop["Producer"] = [&](ZRReportingSession& owner) {
-        for (const MessageRef& message : owner.messages()) {
-            if (const Value* number = message->payload().find("n")) {
-                seen.push_back(number->integerValue());
-            }
-        }
-    };
-    session->start();
-    const double now = device.clock.seconds();
-    int number = 0;
-    for (const double offset : {5.0, -1.0, 5.0, -2.0, -1.0}) {
-        send(*session, {{"n", ++number}, {"zrreporting_timestamp", now + offset}});
-    }
-    session->stop();
-    EXPECT_THAT(seen, ElementsAre(4, 2, 5, 1, 3));
-}
-
 TEST_F(SessionTest, ConfigurationIsAddedToAndNamesTheApplication) {
     const auto session = makeSession();
     const auto appName = [&] {

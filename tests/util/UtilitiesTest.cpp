@@ -138,13 +138,5 @@ TEST(DataSerializeTest, EveryKindOfValue) {
     EXPECT_EQ(DataSerialize::getPlistBlob(list)->size(), expected.size());
 }
 
-TEST(DataSerializeTest, WhatHasNoFormGivesNothing) {
-    for (const Value& value :
-         {Value("a\x01z"), Value(Array{Value::date(1e300)}), Value(Dictionary{{"\x02", 1}})}) {
-        EXPECT_EQ(DataSerialize::getPlistBlob(value), std::nullopt);
-        EXPECT_EQ(DataSerialize::getBase64XMLBlob(value), std::nullopt);
-    }
-}
-
 } // namespace
 } // namespace tamblo
