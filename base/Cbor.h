@@ -1,18 +1,15 @@
 #pragma once
 
 #include "base/Dictionary.h"
+#include "base/KeySetCache.h"
 #include "base/TextBuffer.h"
 #include "base/Value.h"
 
-#include <array>
 #include <cstdint>
-#include <deque>
-#include <memory>
 #include <optional>
 #include <span>
 #include <string>
 #include <string_view>
-#include <vector>
 
 namespace tamblo {
 
@@ -57,37 +54,6 @@ private:
     void head(unsigned major, std::uint64_t argument);
 
     TextBuffer& out_;
-};
-
-namespace detail {
-
-/// The entries of the maps that are being read, the inner ones on top of the outer ones.
-struct MapScratch {
-    std::vector<std::string_view> keys;
-    std::vector<Value> values;
-    std::vector<std::uint32_t> places;
-    std::deque<std::string> assembledKeys; ///< of keys that came in chunks
-};
-
-} // namespace detail
-
-/// Remembers the key sets of maps that were read, in the order in which their keys came, so that the maps of
-/// one kind of message share one key set and are read without sorting or comparing keys with each other.
-/// Bounded: a client that invents keys only pushes others out. Used by one thread at a time.
-class KeySetCache {
-public:
-    KeySetCache();
-    ~KeySetCache();
-    KeySetCache(const KeySetCache&) = delete;
-    KeySetCache& operator=(const KeySetCache&) = delete;
-
-private:
-    friend class CborReader;
-    struct Shape;
-    static constexpr std::size_t kSlots = 512;
-
-    std::array<std::unique_ptr<Shape>, kSlots> slots_;
-    detail::MapScratch scratch_;
 };
 
 /// Reads CBOR (RFC 8949) that nobody vouches for: a cursor over bytes that it never leaves, that allocates
@@ -149,34 +115,39 @@ public:
     bool skip();
 
 private:
+    static constexpr std::uint8_t kIndefinite = 31; ///< in a head's info: the length is not declared
+
     struct Head {
-        std::uint8_t major;
+        Type major;
         std::uint8_t info;
         std::uint64_t argument;
     };
 
     bool fail(CborError error) noexcept;
     bool readHead(Head& head) noexcept;
+    bool readLongHead(Head& head) noexcept;
+    [[nodiscard]] bool takeShortText(std::string_view& text) noexcept;
+    [[nodiscard]] bool takeDouble(Value& value) noexcept;
     bool readItem(Value& value, int depth);
     bool readFloatingPoint(const Head& head, Value& value) noexcept;
     bool readSimple(const Head& head, Value& value) noexcept;
     bool readString(const Head& head, Value& value);
     bool readKey(std::string_view& key);
     bool takeBytes(const Head& head, std::string_view& bytes) noexcept;
-    bool assembleChunks(std::uint8_t major, std::string& bytes);
-    bool readDate(const Head& head, Value& value, int depth);
+    bool assembleChunks(Type major, std::string& bytes);
+    bool readDate(const Head& head, Value& value);
     bool readArray(const Head& head, Value& value, int depth);
     bool readMap(const Head& head, Dictionary& dictionary, int depth, std::size_t spare);
     bool readEntries(const Head& head, int depth);
-    bool buildDictionary(Dictionary& dictionary, std::size_t firstEntry, std::size_t spare);
-    bool skipChunks(std::uint8_t major) noexcept;
+    bool makeDictionary(Dictionary& dictionary, std::size_t firstEntry, std::size_t spare);
+    bool skipChunks(Type major) noexcept;
     bool atBreak() noexcept;
-    detail::MapScratch& scratch() noexcept;
+    [[nodiscard]] MapEntries& entries() noexcept;
 
     const std::uint8_t* position_;
     const std::uint8_t* end_;
     KeySetCache* keySets_;
-    detail::MapScratch ownScratch_; ///< without a cache
+    MapEntries ownEntries_; ///< without a cache
     CborError error_ = CborError::none;
 };
 

@@ -2,7 +2,6 @@
 
 #include "base/Utf8.h"
 
-#include <algorithm>
 #include <bit>
 #include <cmath>
 #include <cstring>
@@ -12,22 +11,20 @@ namespace tamblo {
 
 namespace {
 
-enum Major : std::uint8_t { kUnsigned, kNegative, kBytes, kText, kArray, kMap, kTag, kSimple };
-
-constexpr std::uint8_t kIndefinite = 31;
 constexpr std::uint8_t kBreak = 0xFF;
+constexpr unsigned kShortText = 0x60; ///< to 0x77: a text whose length is in its first byte
 constexpr std::uint64_t kDateTag = 1;
 
-// A map beyond these is no ordinary message; remembering its keys would cost memory and help nobody.
-constexpr std::size_t kMostRememberedKeys = 64;
-constexpr std::size_t kMostRememberedKeyBytes = 4096;
-
-std::uint64_t loadBigEndian(const std::uint8_t* from, unsigned count) noexcept {
-    std::uint64_t value = 0;
-    for (unsigned i = 0; i < count; ++i) {
-        value = value << 8 | from[i];
+template <typename Unsigned> std::uint64_t loadBigEndian(const std::uint8_t* from) noexcept {
+    Unsigned value;
+    std::memcpy(&value, from, sizeof value);
+    if constexpr (sizeof value == 2) {
+        return __builtin_bswap16(value);
+    } else if constexpr (sizeof value == 4) {
+        return __builtin_bswap32(value);
+    } else {
+        return __builtin_bswap64(value);
     }
-    return value;
 }
 
 /// An IEEE 754 half-precision number, exactly.
@@ -46,55 +43,7 @@ float halfToSingle(std::uint16_t half) noexcept {
     return (half & 0x8000) != 0 ? -magnitude : magnitude;
 }
 
-std::uint64_t mix(std::uint64_t hash, std::uint64_t word) noexcept {
-    hash = (hash ^ word) * 0x9E3779B97F4A7C15U;
-    return hash ^ hash >> 29;
-}
-
-/// A hash of keys in their order, good enough to tell the kinds of messages apart: of each key its length and
-/// up to sixteen of its bytes. What it answers is verified key by key.
-std::uint64_t hashKeys(std::span<const std::string_view> keys) noexcept {
-    std::uint64_t hash = keys.size();
-    for (const std::string_view key : keys) {
-        std::uint64_t first = 0;
-        std::uint64_t last = 0;
-        if (key.size() >= 8) {
-            std::memcpy(&first, key.data(), 8);
-            std::memcpy(&last, key.data() + key.size() - 8, 8);
-        } else {
-            for (const char character : key) {
-                first = first << 8 | static_cast<std::uint8_t>(character);
-            }
-        }
-        hash = mix(hash, first + (last << 1 | last >> 63) + key.size());
-    }
-    return hash;
-}
-
 } // namespace
-
-/// The keys of a map as they came, and where each stands among the sorted ones.
-struct KeySetCache::Shape {
-    std::uint64_t hash;
-    KeySetRef keys;
-    std::vector<std::uint32_t> places;
-
-    [[nodiscard]] bool matches(std::uint64_t otherHash,
-                               std::span<const std::string_view> arrived) const noexcept {
-        if (hash != otherHash || places.size() != arrived.size()) {
-            return false;
-        }
-        for (std::size_t i = 0; i < arrived.size(); ++i) {
-            if (keys->key(places[i]) != arrived[i]) {
-                return false;
-            }
-        }
-        return true;
-    }
-};
-
-KeySetCache::KeySetCache() = default;
-KeySetCache::~KeySetCache() = default;
 
 std::string_view describe(CborError error) noexcept {
     switch (error) {
@@ -142,16 +91,17 @@ bool CborReader::readHead(Head& head) noexcept {
     if (error_ != CborError::none || position_ == end_) {
         return fail(CborError::truncated);
     }
-    head.major = *position_ >> 5;
+    head.major = static_cast<Type>(*position_ >> 5);
     head.info = *position_ & 0x1F;
     ++position_;
-    if (head.info < 24) {
-        head.argument = head.info;
-        return true;
-    }
+    head.argument = head.info;
+    return head.info < 24 || readLongHead(head);
+}
+
+bool CborReader::readLongHead(Head& head) noexcept {
     if (head.info == kIndefinite) {
         head.argument = 0;
-        const bool mayBeIndefinite = head.major >= kBytes && head.major <= kMap;
+        const bool mayBeIndefinite = head.major >= Type::bytes && head.major <= Type::map;
         return mayBeIndefinite || fail(CborError::malformed);
     }
     if (head.info > 27) {
@@ -161,9 +111,22 @@ bool CborReader::readHead(Head& head) noexcept {
     if (static_cast<std::size_t>(end_ - position_) < length) {
         return fail(CborError::truncated);
     }
-    head.argument = loadBigEndian(position_, length);
+    switch (length) {
+    case 1:
+        head.argument = *position_;
+        break;
+    case 2:
+        head.argument = loadBigEndian<std::uint16_t>(position_);
+        break;
+    case 4:
+        head.argument = loadBigEndian<std::uint32_t>(position_);
+        break;
+    default:
+        head.argument = loadBigEndian<std::uint64_t>(position_);
+        break;
+    }
     position_ += length;
-    const bool isReservedSimple = head.major == kSimple && head.info == 24 && head.argument < 32;
+    const bool isReservedSimple = head.major == Type::simple && length == 1 && head.argument < 32;
     return !isReservedSimple || fail(CborError::malformed);
 }
 
@@ -278,21 +241,21 @@ bool CborReader::readItem(Value& value, int depth) {
         return false;
     }
     switch (head.major) {
-    case kUnsigned:
+    case Type::unsignedInteger:
         value = Value(head.argument);
         return true;
-    case kNegative:
+    case Type::negativeInteger:
         if (head.argument > static_cast<std::uint64_t>(std::numeric_limits<std::int64_t>::max())) {
             return fail(CborError::integerOutOfRange);
         }
         value = Value(-1 - static_cast<std::int64_t>(head.argument));
         return true;
-    case kBytes:
-    case kText:
+    case Type::bytes:
+    case Type::text:
         return readString(head, value);
-    case kArray:
+    case Type::array:
         return readArray(head, value, depth + 1);
-    case kMap: {
+    case Type::map: {
         Dictionary dictionary;
         if (!readMap(head, dictionary, depth + 1, 0)) {
             return false;
@@ -300,8 +263,8 @@ bool CborReader::readItem(Value& value, int depth) {
         value = Value(std::move(dictionary));
         return true;
     }
-    case kTag:
-        return readDate(head, value, depth + 1);
+    case Type::tag:
+        return readDate(head, value);
     default:
         return readSimple(head, value);
     }
@@ -349,7 +312,7 @@ bool CborReader::takeBytes(const Head& head, std::string_view& bytes) noexcept {
     return true;
 }
 
-bool CborReader::assembleChunks(std::uint8_t major, std::string& bytes) {
+bool CborReader::assembleChunks(Type major, std::string& bytes) {
     while (!atBreak()) {
         Head head{};
         std::string_view chunk;
@@ -363,7 +326,7 @@ bool CborReader::assembleChunks(std::uint8_t major, std::string& bytes) {
             return false;
         }
         // Each chunk of a text is a text of its own (RFC 8949, section 3.2.3).
-        if (major == kText && !isUtf8(chunk)) {
+        if (major == Type::text && !isUtf8(chunk)) {
             return fail(CborError::notUtf8);
         }
         bytes += chunk;
@@ -383,11 +346,11 @@ bool CborReader::readString(const Head& head, Value& value) {
         if (!takeBytes(head, bytes)) {
             return false;
         }
-        if (head.major == kText && !isUtf8(bytes)) {
+        if (head.major == Type::text && !isUtf8(bytes)) {
             return fail(CborError::notUtf8);
         }
     }
-    if (head.major == kText) {
+    if (head.major == Type::text) {
         value = Value(bytes);
     } else {
         value = Value::data({reinterpret_cast<const std::uint8_t*>(bytes.data()), bytes.size()});
@@ -395,24 +358,18 @@ bool CborReader::readString(const Head& head, Value& value) {
     return true;
 }
 
-bool CborReader::readDate(const Head& head, Value& value, int depth) {
+bool CborReader::readDate(const Head& head, Value& value) {
     if (head.argument != kDateTag) {
         return fail(CborError::unsupportedTag);
     }
-    if (depth > kMaximumDepth) {
-        return fail(CborError::tooDeep);
-    }
     const Type type = peek();
+    if (type == Type::end) {
+        return fail(CborError::truncated);
+    }
     const bool mayBeNumber =
         type == Type::unsignedInteger || type == Type::negativeInteger || type == Type::simple;
-    if (!mayBeNumber) {
-        return fail(type == Type::end ? CborError::truncated : CborError::unsupportedTag);
-    }
     Value seconds;
-    if (!readItem(seconds, depth)) {
-        return false;
-    }
-    if (seconds.kind() == Value::Kind::boolean) {
+    if (!mayBeNumber || !readItem(seconds, 0) || seconds.kind() == Value::Kind::boolean) {
         return fail(CborError::unsupportedTag);
     }
     value = Value::date(seconds.doubleValue());
@@ -438,32 +395,72 @@ bool CborReader::readMap(const Head& head, Dictionary& dictionary, int depth, st
     if (depth > kMaximumDepth) {
         return fail(CborError::tooDeep);
     }
-    detail::MapScratch& scratch = this->scratch();
-    const std::size_t first = scratch.keys.size();
-    const std::size_t assembled = scratch.assembledKeys.size();
-    const bool isRead = readEntries(head, depth) && buildDictionary(dictionary, first, spare);
-    scratch.keys.resize(first);
-    scratch.values.resize(first);
-    scratch.assembledKeys.resize(assembled);
+    MapEntries& entries = this->entries();
+    const std::size_t first = entries.keys.size();
+    const std::size_t assembled = entries.assembledKeys.size();
+    const bool isRead = readEntries(head, depth) && makeDictionary(dictionary, first, spare);
+    entries.keys.resize(first);
+    entries.values.resize(first);
+    entries.assembledKeys.resize(assembled);
     return isRead;
 }
 
-detail::MapScratch& CborReader::scratch() noexcept {
-    return keySets_ != nullptr ? keySets_->scratch_ : ownScratch_;
+MapEntries& CborReader::entries() noexcept {
+    return keySets_ != nullptr ? keySets_->entries() : ownEntries_;
+}
+
+bool CborReader::makeDictionary(Dictionary& dictionary, std::size_t firstEntry, std::size_t spare) {
+    MapEntries& entries = this->entries();
+    const auto keys = std::span<const std::string_view>(entries.keys).subspan(firstEntry);
+    const auto values = std::span(entries.values).subspan(firstEntry);
+    switch (keySets_ != nullptr ? keySets_->makeDictionary(keys, values, spare, dictionary)
+                                : KeySetCache::makeDictionaryOnce(keys, values, spare, dictionary)) {
+    case KeySetCache::Fault::none:
+        return true;
+    case KeySetCache::Fault::notUtf8:
+        return fail(CborError::notUtf8);
+    case KeySetCache::Fault::duplicateKey:
+        return fail(CborError::duplicateKey);
+    }
+    return false;
 }
 
 bool CborReader::readEntries(const Head& head, int depth) {
-    detail::MapScratch& scratch = this->scratch();
+    MapEntries& entries = this->entries();
     const bool isIndefinite = head.info == kIndefinite;
     for (std::uint64_t i = 0; isIndefinite ? !atBreak() : i < head.argument; ++i) {
         std::string_view key;
         Value value;
-        if (!readKey(key) || !readItem(value, depth)) {
+        // The two commonest items of a message are taken without looking at all that an item may be.
+        if (!(takeShortText(key) || readKey(key)) || !(takeDouble(value) || readItem(value, depth))) {
             return false;
         }
-        scratch.keys.push_back(key);
-        scratch.values.push_back(std::move(value));
+        entries.keys.push_back(key);
+        entries.values.push_back(std::move(value));
     }
+    return true;
+}
+
+bool CborReader::takeShortText(std::string_view& text) noexcept {
+    if (position_ == end_) {
+        return false;
+    }
+    const unsigned length = *position_ - kShortText;
+    if (length >= 24 || static_cast<std::size_t>(end_ - position_) <= length) {
+        return false;
+    }
+    text = {reinterpret_cast<const char*>(position_ + 1), length};
+    position_ += 1 + length;
+    return true;
+}
+
+bool CborReader::takeDouble(Value& value) noexcept {
+    constexpr std::uint8_t doubleHead = 0xFB;
+    if (end_ - position_ < 9 || *position_ != doubleHead) {
+        return false;
+    }
+    value = Value(std::bit_cast<double>(loadBigEndian<std::uint64_t>(position_ + 1)));
+    position_ += 9;
     return true;
 }
 
@@ -472,135 +469,18 @@ bool CborReader::readKey(std::string_view& key) {
     if (!readHead(head)) {
         return false;
     }
-    if (head.major != kText) {
+    if (head.major != Type::text) {
         return fail(CborError::keyNotText);
     }
     if (head.info != kIndefinite) {
         return takeBytes(head, key);
     }
-    detail::MapScratch& scratch = this->scratch();
+    MapEntries& entries = this->entries();
     std::string assembled;
-    if (!assembleChunks(kText, assembled)) {
+    if (!assembleChunks(Type::text, assembled)) {
         return false;
     }
-    key = scratch.assembledKeys.emplace_back(std::move(assembled));
-    return true;
-}
-
-bool CborReader::buildDictionary(Dictionary& dictionary, std::size_t firstEntry, std::size_t spare) {
-    detail::MapScratch& scratch = this->scratch();
-    const std::span<const std::string_view> arrived = std::span(scratch.keys).subspan(firstEntry);
-    const std::span<Value> values = std::span(scratch.values).subspan(firstEntry);
-    std::unique_ptr<KeySetCache::Shape>* slot = nullptr;
-    std::uint64_t hash = 0;
-    if (keySets_ != nullptr) {
-        hash = hashKeys(arrived);
-        slot = &keySets_->slots_[hash % KeySetCache::kSlots];
-        if (*slot && (*slot)->matches(hash, arrived)) {
-            dictionary = Dictionary::adopt((*slot)->keys, values, (*slot)->places, spare);
-            return true;
-        }
-    }
-
-    std::vector<std::uint32_t> order(arrived.size());
-    std::size_t keyBytes = 0;
-    for (std::size_t i = 0; i < order.size(); ++i) {
-        order[i] = static_cast<std::uint32_t>(i);
-        keyBytes += arrived[i].size();
-        if (!isUtf8(arrived[i])) {
-            return fail(CborError::notUtf8);
-        }
-    }
-    std::sort(order.begin(), order.end(),
-              [arrived](std::uint32_t a, std::uint32_t b) { return arrived[a] < arrived[b]; });
-    std::vector<std::string_view> sorted(arrived.size());
-    std::vector<std::uint32_t> places(arrived.size());
-    for (std::size_t i = 0; i < order.size(); ++i) {
-        sorted[i] = arrived[order[i]];
-        places[order[i]] = static_cast<std::uint32_t>(i);
-        if (i != 0 && sorted[i] == sorted[i - 1]) {
-            return fail(CborError::duplicateKey);
-        }
-    }
-    KeySetRef keys = sorted.empty() ? KeySet::empty() : KeySet::make(sorted);
-    dictionary = Dictionary::adopt(keys, values, places, spare);
-    if (slot != nullptr && sorted.size() <= kMostRememberedKeys && keyBytes <= kMostRememberedKeyBytes) {
-        slot->reset(new KeySetCache::Shape{hash, std::move(keys), std::move(places)});
-    }
-    return true;
-}
-
-bool CborReader::skip() {
-    // What is still open, innermost last: how many items are to come, or, for indefinite lengths, how many
-    // have.
-    struct Open {
-        std::uint64_t items;
-        bool isIndefinite;
-        bool isMap;
-    };
-    std::vector<Open> open;
-    do {
-        if (!open.empty() && open.back().isIndefinite && atBreak()) {
-            if (open.back().isMap && open.back().items % 2 != 0) {
-                return fail(CborError::malformed);
-            }
-            open.pop_back();
-        } else {
-            if (!open.empty()) {
-                Open& container = open.back();
-                container.items += container.isIndefinite ? 1 : static_cast<std::uint64_t>(-1);
-            }
-            Head head{};
-            if (!readHead(head)) {
-                return false;
-            }
-            const bool isIndefinite = head.info == kIndefinite;
-            std::string_view bytes;
-            switch (head.major) {
-            case kBytes:
-            case kText:
-                if (isIndefinite ? !skipChunks(head.major) : !takeBytes(head, bytes)) {
-                    return false;
-                }
-                break;
-            case kArray:
-                open.push_back({head.argument, isIndefinite, false});
-                break;
-            case kMap:
-                // Every item takes a byte, so a count that overflows when doubled cannot be there in full.
-                if (head.argument > static_cast<std::uint64_t>(end_ - position_)) {
-                    return fail(CborError::truncated);
-                }
-                open.push_back({head.argument * 2, isIndefinite, true});
-                break;
-            case kTag:
-                open.push_back({1, false, false});
-                break;
-            default:
-                break;
-            }
-        }
-        while (!open.empty() && !open.back().isIndefinite && open.back().items == 0) {
-            open.pop_back();
-        }
-    } while (!open.empty());
-    return true;
-}
-
-bool CborReader::skipChunks(std::uint8_t major) noexcept {
-    while (!atBreak()) {
-        Head head{};
-        std::string_view chunk;
-        if (!readHead(head)) {
-            return false;
-        }
-        if (head.major != major || head.info == kIndefinite) {
-            return fail(CborError::malformed);
-        }
-        if (!takeBytes(head, chunk)) {
-            return false;
-        }
-    }
+    key = entries.assembledKeys.emplace_back(std::move(assembled));
     return true;
 }
 

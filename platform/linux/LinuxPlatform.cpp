@@ -46,7 +46,6 @@ public:
         sigaddset(&signals, SIGINT);
         ::sigprocmask(SIG_BLOCK, &signals, nullptr);
         descriptor_ = FileDescriptor(::signalfd(-1, &signals, SFD_CLOEXEC | SFD_NONBLOCK));
-        std::signal(SIGPIPE, SIG_IGN);
     }
 
     void watch(EventLoop& loop, UniqueFunction<void()> endWanted) {
@@ -88,8 +87,9 @@ struct LinuxPlatform::Services {
           analyticsEvents(directories.logs, clock, preferences, log),
           connections(loop, log) {}
 
-    Signals signals;
+    // First, as it makes sure that standard error is open before anything else can take its number.
     LinuxStructuredLog log;
+    Signals signals;
     LinuxClock clock;
     LinuxTracePoints tracePoints;
     LinuxProcessInformation processInformation;
