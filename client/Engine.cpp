@@ -71,13 +71,16 @@ void Engine::publish(OutgoingFrame& frame) noexcept {
     if (announcingEngine == this) [[unlikely]] {
         return;
     }
-    queue_.publish(static_cast<SendQueue::Slot&>(frame));
-    if (wakeUp_ >= 0) {
-        // Either the pumping thread sees the frame before it sleeps, or this thread sees that it sleeps.
-        std::atomic_thread_fence(std::memory_order_seq_cst);
-        if (isAsleep_.load(std::memory_order_relaxed) && isAsleep_.exchange(false)) {
-            writeWakeUp();
-        }
+    auto& slot = static_cast<SendQueue::Slot&>(frame);
+    if (wakeUp_ < 0) {
+        queue_.publish(slot, std::memory_order_release);
+        return;
+    }
+    // In the one total order of these operations and those of `mayFallAsleep`, either the pumping thread sees the
+    // frame before it sleeps, or this thread sees that it sleeps.
+    queue_.publish(slot, std::memory_order_seq_cst);
+    if (isAsleep_.load(std::memory_order_seq_cst) && isAsleep_.exchange(false)) {
+        writeWakeUp();
     }
 }
 
@@ -461,8 +464,7 @@ bool Engine::mayFallAsleep() noexcept {
     if (wakeUp_ < 0 || !isFlushed()) {
         return true;
     }
-    isAsleep_.store(true, std::memory_order_relaxed);
-    std::atomic_thread_fence(std::memory_order_seq_cst);
+    isAsleep_.store(true, std::memory_order_seq_cst);
     if (isFlushed()) {
         return true;
     }

@@ -54,7 +54,7 @@ SendQueue::Slot* SendQueue::claim() noexcept {
 SendQueue::Slot* SendQueue::peek(std::size_t offset) noexcept {
     const std::size_t position = head_ + offset;
     Slot& slot = slots_[position & mask_];
-    return slot.sequence.load(std::memory_order_acquire) == position + 1 ? &slot : nullptr;
+    return slot.sequence.load(std::memory_order_seq_cst) == position + 1 ? &slot : nullptr;
 }
 
 void SendQueue::pop() {

@@ -1,0 +1,190 @@
+#include "base/Format.h"
+#include "base/Json.h"
+#include "client/NumberText.h"
+#include "tools/Command.h"
+#include "tools/Payload.h"
+#include "tools/ServiceConnection.h"
+#include "tools/SessionPlayer.h"
+
+#include <cmath>
+#include <fstream>
+#include <iostream>
+#include <memory>
+
+#include <unistd.h>
+
+namespace tamblo::tools {
+
+namespace {
+
+constexpr Option kOptions[] = {
+    {"--reporter", "ID", "the session's reporter, not 0; needed"},
+    {"--service-type", "TYPE", "by name (longformaudio) or number (generic)"},
+    {"--configuration", "JSON", "an object"},
+    {"--play", "FILE", "the messages, JSON lines; - is standard input; without it none are sent"},
+    {"--speed", "N", "play N times as fast as recorded"},
+    {"--fast", "", "play as fast as the service takes the messages"},
+    {"--restamp", "", "give every message a fresh timestamp, not just those without one"},
+    {"--progress", "", "show progress though standard error is no terminal"},
+    {"--quiet", "", "no progress and no report"},
+    kJsonOption,
+    kSocketOption,
+    kTimeoutOption,
+};
+
+/// What the command line asks for.
+struct Plan {
+    SessionPlayer::Options player;
+    client::ServiceType serviceType{};
+    std::optional<Dictionary> configuration;
+    std::string file;
+};
+
+std::variant<Plan, std::string> makePlan(const Arguments& arguments) {
+    Plan plan;
+    if (!arguments.rest().empty()) {
+        return formatted("session takes no \"{}\"; a file to play is named with --play", arguments.rest()[0]);
+    }
+    const auto reporter = client::parseInteger(arguments.last("--reporter").value_or(""));
+    if (!reporter || *reporter == 0) {
+        return std::string("--reporter needs a signed 64-bit number other than 0");
+    }
+    plan.player.reporterID = *reporter;
+    const auto serviceType = client::parseServiceType(arguments.last("--service-type").value_or("generic"));
+    if (!serviceType) {
+        return std::string(
+            "--service-type needs the name of a service type, such as longformaudio, or its number");
+    }
+    plan.serviceType = *serviceType;
+    if (const auto text = arguments.last("--configuration")) {
+        auto configuration = parseJsonObject(*text);
+        if (const auto* wrong = std::get_if<std::string>(&configuration)) {
+            return "--configuration is " + *wrong;
+        }
+        plan.configuration = std::get<Dictionary>(std::move(configuration));
+    }
+    if (arguments.has("--fast")) {
+        plan.player.speed.reset();
+    } else if (const auto text = arguments.last("--speed")) {
+        const Value speed = parseScalar(*text);
+        if (!speed.isNumber() || !(speed.doubleValue() > 0) || !std::isfinite(speed.doubleValue())) {
+            return std::string("--speed needs a number above 0");
+        }
+        plan.player.speed = speed.doubleValue();
+    }
+    plan.player.restamp = arguments.has("--restamp");
+    plan.player.showsProgress =
+        !arguments.has("--quiet") && (arguments.has("--progress") || ::isatty(STDERR_FILENO) != 0);
+    plan.file = arguments.last("--play").value_or("");
+    return plan;
+}
+
+/// Makes the session, up to its start, whose reply is held and is noted in `isStartAnswered` when it comes.
+std::optional<ExitStatus> begin(ServiceConnection& service, const Plan& plan,
+                                const std::shared_ptr<bool>& isStartAnswered) {
+    client::Client& client = service.client();
+    const std::int64_t reporter = plan.player.reporterID;
+    bool answer = false;
+    auto created = client.createReportingSession(reporter);
+    if (const auto failure = service.await(created, answer)) {
+        return failure;
+    }
+    auto typed = client.setServiceType(plan.serviceType, reporter);
+    if (const auto failure = service.await(typed, answer)) {
+        return failure;
+    }
+    if (plan.configuration) {
+        auto configured = client.setConfiguration(*plan.configuration, reporter);
+        if (const auto failure = service.await(configured, answer)) {
+            return failure;
+        }
+    }
+    client.startReportingSessionForID(reporter, [isStartAnswered](client::Result<bool>&& result) {
+        *isStartAnswered = result.ok() && result.value;
+    });
+    return std::nullopt;
+}
+
+void printReport(const Arguments& arguments, const SessionPlayer::Report& report, bool isStartAnswered) {
+    if (arguments.has("--json")) {
+        printLine(jsonText(Dictionary{{"messages_sent", report.sent},
+                                      {"messages_refused", report.refused},
+                                      {"replies", report.answered},
+                                      {"seconds", report.seconds},
+                                      {"start_reply", isStartAnswered}}));
+    } else if (!arguments.has("--quiet")) {
+        printLine(formatted("{} messages sent, {} refused, {} replies, {} s; the held start reply {}",
+                            report.sent, report.refused, report.answered, fixed(report.seconds, 3),
+                            isStartAnswered ? "arrived" : "did not arrive"));
+    }
+}
+
+ExitStatus playAndStop(ServiceConnection& service, const Arguments& arguments, const Plan& plan,
+                       std::istream* lines) {
+    const auto isStartAnswered = std::make_shared<bool>(false);
+    if (const auto failure = begin(service, plan, isStartAnswered)) {
+        return *failure;
+    }
+    SessionPlayer player(service.client(), plan.player);
+    std::optional<std::string> wrong;
+    if (lines != nullptr) {
+        wrong = player.play(*lines, plan.file);
+    }
+    auto stopped = service.client().stopReportingSessionForID(plan.player.reporterID);
+    bool answer = false;
+    const auto failure = service.await(stopped, answer);
+    printReport(arguments, player.report(), *isStartAnswered);
+    if (wrong) {
+        return complain(ExitStatus::usage, *wrong);
+    }
+    if (failure) {
+        return *failure;
+    }
+    if (player.report().firstError) {
+        return ServiceConnection::complainAbout(*player.report().firstError);
+    }
+    return *isStartAnswered && player.report().answered == player.report().sent ? ExitStatus::done
+                                                                                : ExitStatus::failed;
+}
+
+ExitStatus run(const Arguments& arguments) {
+    auto made = makePlan(arguments);
+    if (const auto* wrong = std::get_if<std::string>(&made)) {
+        return complain(ExitStatus::usage, *wrong);
+    }
+    Plan& plan = std::get<Plan>(made);
+    std::ifstream file;
+    std::istream* lines = plan.file == "-" ? &std::cin : nullptr;
+    if (!plan.file.empty() && lines == nullptr) {
+        file.open(plan.file);
+        if (!file) {
+            return complain(ExitStatus::usage, formatted("cannot read {}", plan.file));
+        }
+        lines = &file;
+    }
+    ServiceConnection service(arguments);
+    if (!service.connect()) {
+        return ExitStatus::unreachable;
+    }
+    plan.player.timeout = service.timeout();
+    return playAndStop(service, arguments, plan, lines);
+}
+
+} // namespace
+
+constexpr Command kCommandSession{
+    "session",
+    "make a session, play recorded messages to it, and stop it",
+    "--reporter ID [--service-type TYPE] [--configuration JSON] [--play FILE [--speed N | --fast]]",
+    "A line of the file: {\"offset_s\": 0.5, \"category\": \"Session_Playback\", \"type\": \"Start\", "
+    "\"payload\": {...}}.\n"
+    "Messages are sent at their offsets, in seconds since the session's start, or, without those, spaced "
+    "like their\n"
+    "payloads' zrreporting_timestamp. Exits with 1 when a message was refused or the held reply to the start "
+    "did\n"
+    "not come, with 2 at a line that cannot be read (the session is stopped first).",
+    kOptions,
+    run,
+};
+
+} // namespace tamblo::tools

@@ -1,0 +1,52 @@
+#include "tools/Payload.h"
+
+#include "base/Format.h"
+#include "base/Json.h"
+
+namespace tamblo::tools {
+
+std::variant<Dictionary, std::string> parseJsonObject(std::string_view text) {
+    auto read = readJson(text);
+    if (const auto* error = std::get_if<JsonError>(&read)) {
+        return formatted("not JSON: line {}, column {}: {}", error->line, error->column, error->message);
+    }
+    const Value& value = std::get<Value>(read);
+    if (!value.isDictionary()) {
+        return std::string("not a JSON object");
+    }
+    return value.dictionaryValue();
+}
+
+Value parseScalar(std::string_view text) {
+    auto read = readJson(text);
+    const Value* value = std::get_if<Value>(&read);
+    if (value == nullptr || value->isDictionary() || value->isArray()) {
+        return Value(text);
+    }
+    return *value;
+}
+
+std::variant<Dictionary, std::string> parsePayload(std::span<const std::string_view> words) {
+    if (words.size() == 1 && words[0].starts_with('{')) {
+        auto payload = parseJsonObject(words[0]);
+        if (const auto* wrong = std::get_if<std::string>(&payload)) {
+            return "the payload is " + *wrong;
+        }
+        return payload;
+    }
+    Dictionary payload;
+    for (const std::string_view word : words) {
+        const std::size_t equals = word.find('=');
+        if (equals == std::string_view::npos || equals == 0) {
+            return formatted("\"{}\" is not KEY=VALUE; a payload is such words, or one JSON object", word);
+        }
+        const std::string_view key = word.substr(0, equals);
+        if (payload.contains(key)) {
+            return formatted("the payload has the key \"{}\" twice", key);
+        }
+        payload.set(key, parseScalar(word.substr(equals + 1)));
+    }
+    return payload;
+}
+
+} // namespace tamblo::tools

@@ -1,0 +1,51 @@
+#pragma once
+
+#include "client/Client.h"
+#include "tools/Command.h"
+
+#include <chrono>
+#include <cstdint>
+#include <optional>
+#include <string_view>
+
+namespace tamblo::tools {
+
+/// The options of every command that talks to the service.
+inline constexpr Option kSocketOption{"--socket", "PATH",
+                                      "the service's socket, when it is not in its usual place"};
+inline constexpr Option kTimeoutOption{"--timeout", "SECONDS", "how long to wait for an answer (10)"};
+inline constexpr Option kJsonOption{"--json", "", "print JSON, for scripts"};
+
+/// A command's connection to the service, without a thread and without a second attempt.
+class ServiceConnection {
+public:
+    explicit ServiceConnection(const Arguments& arguments);
+
+    /// Connects; else says so, and what to do about it.
+    [[nodiscard]] bool connect();
+    [[nodiscard]] client::Client& client() noexcept { return client_; }
+    [[nodiscard]] std::chrono::milliseconds timeout() const noexcept { return timeout_; }
+
+    /// Waits for the answer; without a good one, complains and answers the status to exit with.
+    template <typename T> std::optional<ExitStatus> await(std::future<client::Result<T>>& future, T& value) {
+        if (!client_.wait(future, timeout_)) {
+            return complain(ExitStatus::failed, "the service did not answer in time");
+        }
+        client::Result<T> result = future.get();
+        if (result.error) {
+            return complainAbout(*result.error);
+        }
+        value = std::move(result.value);
+        return std::nullopt;
+    }
+    [[nodiscard]] static ExitStatus complainAbout(const client::Error& error);
+
+private:
+    std::chrono::milliseconds timeout_;
+    client::Client client_;
+};
+
+/// The reporter ID that the text is; else complains.
+[[nodiscard]] std::optional<std::int64_t> parseReporterID(std::string_view text);
+
+} // namespace tamblo::tools

@@ -1,0 +1,114 @@
+#include "tools/SessionPlayer.h"
+
+#include "base/Format.h"
+
+#include <algorithm>
+#include <cstdio>
+#include <utility>
+
+namespace tamblo::tools {
+
+using namespace std::chrono_literals;
+using std::chrono::milliseconds;
+
+namespace {
+
+/// Messages that wait for their replies before no more are sent.
+constexpr std::uint64_t kMostUnderWay = 512;
+constexpr milliseconds kProgressInterval{100};
+constexpr double kLongestOffset = 1e8;
+
+double secondsSince1970() {
+    return std::chrono::duration<double>(std::chrono::system_clock::now().time_since_epoch()).count();
+}
+
+} // namespace
+
+std::optional<std::string> SessionPlayer::play(std::istream& lines, const std::string& name) {
+    start_ = Clock::now();
+    SessionSpacing spacing;
+    std::optional<std::string> wrong;
+    std::string text;
+    for (std::size_t number = 1; !isLost() && std::getline(lines, text); ++number) {
+        if (text.find_first_not_of(" \t\r") == std::string::npos) {
+            continue;
+        }
+        auto parsed = parseSessionLine(text);
+        if (const auto* problem = std::get_if<std::string>(&parsed)) {
+            wrong = formatted("{}:{}: {}", name, number, *problem);
+            break;
+        }
+        auto& line = std::get<SessionLine>(parsed);
+        if (options_.speed) {
+            const std::chrono::duration<double> due(std::min(spacing.due(line), kLongestOffset) /
+                                                    *options_.speed);
+            waitUntil(start_ + std::chrono::duration_cast<Clock::duration>(due));
+        }
+        send(line);
+        showProgress(false);
+    }
+    waitForReplies();
+    report_->seconds = std::chrono::duration<double>(Clock::now() - start_).count();
+    showProgress(true);
+    return wrong;
+}
+
+void SessionPlayer::waitUntil(Clock::time_point time) {
+    while (!isLost()) {
+        const auto left = std::chrono::ceil<milliseconds>(time - Clock::now());
+        client_.run(std::clamp<milliseconds>(left, 0ms, kProgressInterval));
+        if (left <= 0ms) {
+            return;
+        }
+        showProgress(false);
+    }
+}
+
+void SessionPlayer::send(SessionLine& line) {
+    if (options_.restamp || !line.payload.contains(kTimestampKey)) {
+        line.payload.set(kTimestampKey, secondsSince1970());
+    }
+    while (report_->sent - report_->answered >= kMostUnderWay && !isLost()) {
+        client_.run(kProgressInterval);
+    }
+    const std::int64_t reporters[] = {options_.reporterID};
+    const bool isQueued = client_.sendMessage(line.payload, line.category, line.type, reporters,
+                                              [report = report_](client::Result<client::Nothing>&& result) {
+                                                  ++report->answered;
+                                                  if (result.error) {
+                                                      ++report->refused;
+                                                      report->firstError = std::move(result.error);
+                                                  }
+                                              });
+    ++report_->sent;
+    if (!isQueued) {
+        ++report_->answered;
+        ++report_->refused;
+        report_->firstError = client::makeError(client::ErrorCode::refused);
+    }
+    if (options_.speed) {
+        client_.run(0ms);
+    }
+}
+
+void SessionPlayer::waitForReplies() {
+    const auto deadline = Clock::now() + options_.timeout;
+    while (report_->answered < report_->sent && !isLost() && Clock::now() < deadline) {
+        client_.run(kProgressInterval);
+    }
+}
+
+void SessionPlayer::showProgress(bool isLast) {
+    const auto now = Clock::now();
+    if (!options_.showsProgress || (!isLast && now - lastShown_ < kProgressInterval)) {
+        return;
+    }
+    lastShown_ = now;
+    const double seconds = std::chrono::duration<double>(now - start_).count();
+    std::fprintf(stderr, "\r%llu sent, %llu answered, %.1f s%s",
+                 static_cast<unsigned long long>(report_->sent),
+                 static_cast<unsigned long long>(report_->answered), seconds, isLast ? "\n" : "");
+    std::fflush(stderr);
+}
+
+} // namespace tamblo::tools

@@ -1,0 +1,159 @@
+#include "tools/SinkFile.h"
+
+#include "base/Format.h"
+#include "base/Json.h"
+
+#include <algorithm>
+#include <array>
+#include <utility>
+
+#include <fcntl.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+namespace tamblo::tools {
+
+namespace {
+
+constexpr int kKeptFiles = 4;
+constexpr std::size_t kPieceBytes = 256 * 1024;
+
+std::string rotated(const std::string& path, int number) {
+    return number == 0 ? path : formatted("{}.{}", path, number);
+}
+
+/// Hands over the whole lines from an offset on, and says how many bytes they have.
+std::size_t readLines(int descriptor, off_t offset, LineFunction& line) {
+    std::string held;
+    std::size_t done = 0;
+    while (true) {
+        const std::size_t before = held.size();
+        held.resize(before + kPieceBytes);
+        const ssize_t count = ::pread(descriptor, held.data() + before, kPieceBytes,
+                                      offset + static_cast<off_t>(done + before));
+        held.resize(before + static_cast<std::size_t>(std::max<ssize_t>(count, 0)));
+        if (count <= 0) {
+            return done;
+        }
+        std::size_t start = 0;
+        for (std::size_t end = held.find('\n', before); end != std::string::npos;
+             end = held.find('\n', start)) {
+            line(std::string_view(held).substr(start, end - start));
+            start = end + 1;
+        }
+        held.erase(0, start);
+        done += start;
+    }
+}
+
+bool exists(const std::string& path) {
+    return ::access(path.c_str(), F_OK) == 0;
+}
+
+} // namespace
+
+std::string sinkPath(std::string_view logsDirectory, std::string_view typed) {
+    std::string path(typed);
+    if (typed.find('/') == std::string_view::npos) {
+        path.insert(0, std::string(logsDirectory) + "/");
+    }
+    if (!typed.ends_with(".jsonl") && !exists(path)) {
+        path += ".jsonl";
+    }
+    return path;
+}
+
+std::vector<std::string> filesOfSink(const std::string& path) {
+    std::vector<std::string> files;
+    for (int number = kKeptFiles; number >= 0; --number) {
+        if (exists(rotated(path, number))) {
+            files.push_back(rotated(path, number));
+        }
+    }
+    return files;
+}
+
+void SinkFollower::close() noexcept {
+    if (descriptor_ >= 0) {
+        ::close(std::exchange(descriptor_, -1));
+    }
+}
+
+SinkFollower::~SinkFollower() {
+    close();
+}
+
+void SinkFollower::openFile(const std::string& path) {
+    close();
+    struct stat status {};
+    descriptor_ = ::open(path.c_str(), O_RDONLY | O_CLOEXEC);
+    if (descriptor_ < 0 || ::fstat(descriptor_, &status) != 0) {
+        close();
+        return;
+    }
+    device_ = status.st_dev;
+    inode_ = status.st_ino;
+    offset_ = 0;
+}
+
+void SinkFollower::readNew(LineFunction& line) {
+    if (descriptor_ < 0) {
+        openFile(path_);
+    }
+    while (descriptor_ >= 0) {
+        // Asked before reading: once renamed, the file is not written to any more, and what is read is all of
+        // it.
+        const bool isRenamed = !isFile(path_);
+        readToEnd(line);
+        if (!isRenamed) {
+            return;
+        }
+        openNext();
+    }
+}
+
+bool SinkFollower::isFile(const std::string& path) const {
+    struct stat status {};
+    return ::stat(path.c_str(), &status) == 0 && status.st_dev == device_ && status.st_ino == inode_;
+}
+
+void SinkFollower::openNext() {
+    int number = kKeptFiles;
+    while (number > 0 && !isFile(rotated(path_, number))) {
+        --number;
+    }
+    // One that is kept no more was followed by all that are.
+    int next = number > 0 ? number - 1 : kKeptFiles;
+    while (next > 0 && !exists(rotated(path_, next))) {
+        --next;
+    }
+    openFile(rotated(path_, next));
+}
+
+void SinkFollower::readToEnd(LineFunction& line) {
+    struct stat status {};
+    if (::fstat(descriptor_, &status) == 0 && status.st_size < offset_) {
+        offset_ = status.st_size;
+    }
+    offset_ += static_cast<off_t>(readLines(descriptor_, offset_, line));
+}
+
+void readLines(const std::string& path, LineFunction& line) {
+    const int descriptor = ::open(path.c_str(), O_RDONLY | O_CLOEXEC);
+    if (descriptor >= 0) {
+        (void)readLines(descriptor, 0, line);
+        ::close(descriptor);
+    }
+}
+
+std::string nameOfRecord(const Dictionary& record) {
+    constexpr std::array<std::string_view, 5> keys{"event", "op", "captureType", "reason", "metric"};
+    for (const std::string_view key : keys) {
+        if (const Value* name = record.find(key)) {
+            return name->isString() ? std::string(name->stringValue()) : jsonText(*name);
+        }
+    }
+    return "?";
+}
+
+} // namespace tamblo::tools

@@ -1,0 +1,58 @@
+#pragma once
+
+#include "base/Dictionary.h"
+#include "base/UniqueFunction.h"
+
+#include <cstdint>
+#include <optional>
+#include <string>
+#include <string_view>
+#include <vector>
+
+#include <sys/types.h>
+
+namespace tamblo::tools {
+
+/// The path of a report sink from what was typed: a name with or without its ending, or a path.
+[[nodiscard]] std::string sinkPath(std::string_view logsDirectory, std::string_view typed);
+
+/// The sink's files that exist, the oldest first: NAME.4 … NAME.1, NAME.
+[[nodiscard]] std::vector<std::string> filesOfSink(const std::string& path);
+
+using LineFunction = UniqueFunction<void(std::string_view line)>;
+
+/// Reads the lines of a sink's file as they are written, and goes on with the next file when the sink has
+/// renamed the one that it reads. A line counts once its end has been written; one that is cut off again
+/// never shows.
+class SinkFollower {
+public:
+    explicit SinkFollower(std::string path) : path_(std::move(path)) {}
+    ~SinkFollower();
+    SinkFollower(const SinkFollower&) = delete;
+    SinkFollower& operator=(const SinkFollower&) = delete;
+
+    /// Hands over every line that has come since the last call, in the file that stands there now at the
+    /// first, and follows renames.
+    void readNew(LineFunction& line);
+
+private:
+    void readToEnd(LineFunction& line);
+    void openFile(const std::string& path);
+    void openNext();
+    [[nodiscard]] bool isFile(const std::string& path) const;
+    void close() noexcept;
+
+    const std::string path_;
+    int descriptor_ = -1;
+    off_t offset_ = 0; ///< behind the last whole line
+    dev_t device_ = 0;
+    ino_t inode_ = 0;
+};
+
+/// Hands over every whole line of a file.
+void readLines(const std::string& path, LineFunction& line);
+
+/// What a line counts as: its event, or, in a sink without events, what comes nearest.
+[[nodiscard]] std::string nameOfRecord(const Dictionary& record);
+
+} // namespace tamblo::tools
