@@ -12,8 +12,6 @@ enable_testing()
 include(GoogleTest)
 add_custom_target(tamblo_all_tests)
 
-tamblo_folder(tests/fakes PUBLIC session util platform base)
-tamblo_link_headers(tests TRUE tamblo_tests_include)
 
 # tamblo_tests(NAME LABEL label SOURCES files... LIBRARIES folders...)
 function(tamblo_tests name)
