@@ -122,11 +122,8 @@ void SinkFollower::openNext() {
     while (number > 0 && !isFile(rotated(path_, number))) {
         --number;
     }
-    // One that is kept no more was followed by all that are.
-    int next = number > 0 ? number - 1 : kKeptFiles;
-    while (next > 0 && !exists(rotated(path_, next))) {
-        --next;
-    }
+    // One that is found nowhere was deleted: what is older may have been read, so that the newest comes next.
+    const int next = std::max(number - 1, 0);
     openFile(rotated(path_, next));
 }
 

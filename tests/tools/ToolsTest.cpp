@@ -1,0 +1,225 @@
+#include "base/Json.h"
+#include "tools/Arguments.h"
+#include "tools/AtomicFile.h"
+#include "tools/Payload.h"
+#include "tools/RecordFilter.h"
+#include "tools/SessionFile.h"
+#include "tools/SessionPlayer.h"
+#include "tools/SinkFile.h"
+
+#include <cstdlib>
+#include <filesystem>
+#include <fstream>
+#include <sstream>
+#include <string>
+#include <vector>
+
+#include "tests/client/FakeService.h"
+#include <gtest/gtest.h>
+
+namespace tamblo::tools {
+namespace {
+
+namespace fs = std::filesystem;
+
+class TemporaryDirectory {
+public:
+    TemporaryDirectory() {
+        char name[] = "/tmp/tamblo-tools-XXXXXX";
+        path_ = ::mkdtemp(name);
+    }
+    ~TemporaryDirectory() { fs::remove_all(path_); }
+    TemporaryDirectory(const TemporaryDirectory&) = delete;
+    TemporaryDirectory& operator=(const TemporaryDirectory&) = delete;
+
+    [[nodiscard]] std::string file(const std::string& name) const { return path_ + "/" + name; }
+
+private:
+    std::string path_;
+};
+
+void append(const std::string& path, std::string_view text) {
+    std::ofstream(path, std::ios::app) << text;
+}
+
+TEST(Payload, WordsAndObjectsAreRead) {
+    const struct {
+        std::vector<std::string_view> words;
+        std::string json; ///< empty: refused
+    } cases[] = {
+        {{}, "{}"},
+        {{"n=5", "f=0.5", "b=true", "t=text"}, R"({"b":true,"f":0.5,"n":5,"t":"text"})"},
+        {{"quoted=\"5\"", "empty=", "eq=a=b", "date=2026-01-01"},
+         R"({"date":"2026-01-01","empty":"","eq":"a=b","quoted":"5"})"},
+        {{"array=[1]", "null=null", "big=18446744073709551615"},
+         R"({"array":"[1]","big":18446744073709551615,"null":"null"})"},
+        {{R"({"a":{"b":[1,2]}})"}, R"({"a":{"b":[1,2]}})"},
+        {{"a=1", "a=2"}, ""},
+        {{"=1"}, ""},
+        {{"word"}, ""},
+        {{"{}", "a=1"}, ""},
+        {{R"({"a":1,"a":2})"}, ""},
+    };
+    for (const auto& row : cases) {
+        const auto payload = parsePayload(row.words);
+        const auto* dictionary = std::get_if<Dictionary>(&payload);
+        EXPECT_EQ(dictionary == nullptr ? "" : jsonText(*dictionary), row.json);
+    }
+}
+
+TEST(Arguments, OptionsAreTakenApart) {
+    const Option options[] = {{"--name", "X", ""}, {"--flag", "", ""}};
+    const std::string_view words[] = {"a", "--name", "1", "--flag", "--name=2=3", "b", "--", "--flag"};
+    const auto parsed = Arguments::parse(options, words);
+    const auto& arguments = std::get<Arguments>(parsed);
+    EXPECT_EQ(arguments.all("--name"), (std::vector<std::string_view>{"1", "2=3"}));
+    EXPECT_TRUE(arguments.has("--flag"));
+    EXPECT_EQ(arguments.rest(), (std::vector<std::string_view>{"a", "b", "--flag"}));
+    for (const std::vector<std::string_view>& wrong :
+         {std::vector<std::string_view>{"--other"}, {"--name"}, {"--flag=1"}, {"--nam=1"}}) {
+        EXPECT_TRUE(std::holds_alternative<std::string>(Arguments::parse(options, wrong))) << wrong[0];
+    }
+}
+
+TEST(SessionFile, LinesAreReadAndWrongOnesRefused) {
+    const auto parsed = parseSessionLine(
+        R"({"offset_s": 0.5, "category": "Session_Playback", "type": 2, "payload": {"a": 1}, "note": "x"})");
+    const auto& line = std::get<SessionLine>(parsed);
+    EXPECT_EQ(line.offset, 0.5);
+    EXPECT_EQ(static_cast<std::uint32_t>(line.category), 0x08000004U);
+    EXPECT_EQ(line.type, client::EventType::stop);
+    EXPECT_EQ(line.payload, (Dictionary{{"a", 1}}));
+    const auto bare = parseSessionLine(R"({"category": 14})");
+    EXPECT_EQ(std::get<SessionLine>(bare).type, client::EventType::generic);
+    EXPECT_FALSE(std::get<SessionLine>(bare).offset);
+    for (const std::string_view wrong :
+         {"", "[]", "{", R"({"type": "Start"})", R"({"category": "Nope"})", R"({"category": 14.5})",
+          R"({"category": 14, "type": "Nope"})", R"({"category": 14, "type": 65536})",
+          R"({"category": 14, "offset_s": -1})", R"({"category": 14, "offset_s": "1"})",
+          R"({"category": 14, "payload": [1]})"}) {
+        EXPECT_TRUE(std::holds_alternative<std::string>(parseSessionLine(wrong))) << wrong;
+    }
+}
+
+TEST(SessionSpacing, OffsetsWinOverTimestampsAndNeitherKeepsTheTime) {
+    SessionSpacing spacing;
+    const auto due = [&spacing](std::optional<double> offset, std::optional<double> timestamp) {
+        SessionLine line;
+        line.offset = offset;
+        if (timestamp) {
+            line.payload.set(kTimestampKey, *timestamp);
+        }
+        return spacing.due(line);
+    };
+    EXPECT_EQ(due({}, {}), 0);
+    EXPECT_EQ(due({}, 1000.0), 0);
+    EXPECT_EQ(due({}, 1002.5), 2.5);
+    EXPECT_EQ(due({}, {}), 2.5);
+    EXPECT_EQ(due({}, 1001.0), 2.5);
+    EXPECT_EQ(due(4.0, 1001.0), 4);
+    EXPECT_EQ(due({}, 1005.0), 5);
+}
+
+TEST(SessionPlayer, PlaysInTimeAndStampsWhatHasNoTimestamp) {
+    test::FakeService service;
+    client::Client client({.socketPath = service.path(), .threading = client::Client::Threading::caller});
+    ASSERT_TRUE(client.connect());
+    std::istringstream lines("{\"category\": 14, \"payload\": {\"zrreporting_timestamp\": 5}}\n\n"
+                             "{\"category\": 14, \"offset_s\": 0.4}\n"
+                             "{\"category\": }\n"
+                             "{\"category\": 14}\n");
+    SessionPlayer player(client, {.reporterID = 7, .speed = 10, .timeout = std::chrono::seconds(5)});
+    const auto wrong = player.play(lines, "file");
+    ASSERT_TRUE(wrong);
+    EXPECT_TRUE(wrong->starts_with("file:4: ")) << *wrong;
+    EXPECT_EQ(player.report().sent, 2U);
+    EXPECT_EQ(player.report().answered, 2U);
+    EXPECT_EQ(player.report().refused, 0U);
+    EXPECT_GE(player.report().seconds, 0.04);
+    const auto requests = service.requests();
+    ASSERT_EQ(requests.size(), 2U);
+    EXPECT_EQ(requests[0].dictionary.find(kTimestampKey)->doubleValue(), 5);
+    EXPECT_GT(requests[1].dictionary.find(kTimestampKey)->doubleValue(), 1.7e9);
+    EXPECT_EQ(requests[1].reporterIDs, std::vector<std::int64_t>{7});
+}
+
+TEST(RecordFilter, WantsOneOfTheEventsAndAllOfTheKeys) {
+    const Dictionary record{
+        {"time", 1}, {"event", "com.vandra.a"}, {"payload", Dictionary{{"n", 5}, {"t", "5"}}}};
+    const struct {
+        std::vector<std::string_view> events;
+        std::vector<std::string_view> keys;
+        bool accepts;
+    } cases[] = {
+        {{}, {}, true},
+        {{"com.vandra.a"}, {}, true},
+        {{"x", "com.*"}, {}, true},
+        {{"com.vandra"}, {}, false},
+        {{"com.vandra.a*"}, {"n"}, true},
+        {{}, {"n=5", "t=5"}, true},
+        {{}, {"n=5.0"}, true},
+        {{}, {"n=6"}, false},
+        {{}, {"n", "missing"}, false},
+        {{}, {"time=1"}, true},
+    };
+    for (const auto& row : cases) {
+        RecordFilter filter;
+        for (const auto event : row.events) {
+            filter.wantEvent(event);
+        }
+        for (const auto key : row.keys) {
+            filter.wantKey(key);
+        }
+        EXPECT_EQ(filter.accepts(record), row.accepts) << (row.keys.empty() ? "" : row.keys[0]);
+    }
+}
+
+TEST(SinkFollower, ReadsWholeLinesThroughRotationsAndTornEnds) {
+    const TemporaryDirectory directory;
+    const std::string path = directory.file("events.jsonl");
+    SinkFollower follower(path);
+    std::string seen;
+    LineFunction collect = [&seen](std::string_view line) { seen.append(line).append(" "); };
+    const auto read = [&] {
+        seen.clear();
+        follower.readNew(collect);
+        return seen;
+    };
+    EXPECT_EQ(read(), "");
+    append(path, "1\n2\nto");
+    EXPECT_EQ(read(), "1 2 ");
+    fs::resize_file(path, 4);
+    append(path, "3\n");
+    EXPECT_EQ(read(), "3 ");
+    append(path, "4\n" + std::string(600000, 'x') + "\n");
+    fs::rename(path, path + ".1");
+    append(path, "5\n");
+    fs::rename(path + ".1", path + ".2");
+    fs::rename(path, path + ".1");
+    append(path, "6\n");
+    EXPECT_EQ(read(), "4 " + std::string(600000, 'x') + " 5 6 ");
+    EXPECT_EQ(filesOfSink(path), (std::vector{path + ".2", path + ".1", path}));
+    fs::remove(path);
+    EXPECT_EQ(read(), "");
+    append(path, "7\n");
+    EXPECT_EQ(read(), "7 ");
+    EXPECT_EQ(sinkPath(directory.file(""), path), path);
+}
+
+TEST(AtomicFile, ReplacesOrLeavesAlone) {
+    const TemporaryDirectory directory;
+    const std::string path = directory.file("a/b/file");
+    EXPECT_TRUE(replaceFile(path, path + ".new", "x"));
+    EXPECT_FALSE(createDirectories(directory.file("a/b")));
+    EXPECT_FALSE(replaceFile(path, path + ".new", "one"));
+    EXPECT_FALSE(replaceFile(path, path + ".new", "two"));
+    EXPECT_EQ(readFile(path), "two");
+    EXPECT_FALSE(fs::exists(path + ".new"));
+    fs::create_directory(directory.file("a/b/directory"));
+    EXPECT_TRUE(replaceFile(directory.file("a/b/directory"), path + ".new", "x"));
+    EXPECT_FALSE(fs::exists(path + ".new"));
+    EXPECT_FALSE(readFile(directory.file("none")));
+}
+
+} // namespace
+} // namespace tamblo::tools
