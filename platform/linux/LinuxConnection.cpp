@@ -1,13 +1,13 @@
 #include "platform/linux/LinuxConnection.h"
 
 #include "platform/linux/LinuxConnectionService.h"
+#include "platform/linux/RequestDispatch.h"
 #include "wire/FrameSplitter.h"
 #include "wire/Reply.h"
 
 #include <algorithm>
 #include <cerrno>
 #include <cstring>
-#include <type_traits>
 #include <utility>
 
 #include <sys/epoll.h>
@@ -151,7 +151,7 @@ void LinuxConnection::carryOut(std::span<const std::uint8_t> item) {
         refuse(*refusal);
         return;
     }
-    dispatch(request);
+    dispatchRequest(*exportedObject_, request, shared_from_this());
 }
 
 void LinuxConnection::refuse(const wire::Refusal& refusal) {
@@ -165,90 +165,9 @@ void LinuxConnection::refuse(const wire::Refusal& refusal) {
     }
 }
 
-template <typename AppendFrame> void LinuxConnection::reply(const AppendFrame& appendFrame) {
-    const std::lock_guard lock(mutex_);
-    if (isUnwritable_) {
-        return;
-    }
-    appendFrame(held_);
+void LinuxConnection::replied() {
     if (!std::exchange(hasHeldReplies_, true)) {
         service_.hasReplies(shared_from_this());
-    }
-}
-
-template <typename Result> auto LinuxConnection::replyTo(const wire::Request& request) {
-    using Function = UniqueFunction<void(const ReplyError*, Result), 32>;
-    if (!request.id) {
-        return Function();
-    }
-    return Function([self = shared_from_this(), id = *request.id](const ReplyError* error, Result result) {
-        self->reply([&](TextBuffer& out) {
-            if (error != nullptr) {
-                wire::appendErrorReply(out, id, {error->domain, error->code, {}});
-            } else if constexpr (std::is_same_v<Result, bool>) {
-                wire::appendBooleanReply(out, id, result);
-            } else if constexpr (std::is_same_v<Result, std::uint16_t>) {
-                wire::appendUnsignedReply(out, id, result);
-            } else if constexpr (std::is_same_v<Result, const Dictionary&>) {
-                wire::appendDictionaryReply(out, id, result);
-            } else {
-                wire::appendIntegersReply(out, id, result);
-            }
-        });
-    });
-}
-
-void LinuxConnection::dispatch(wire::Request& request) {
-    ZRReportingServiceProtocol& object = *exportedObject_;
-    const ReporterID reporterID = request.reporterID;
-    switch (request.method) {
-    case wire::Method::createReportingSession:
-        object.createReportingSession(reporterID, replyTo<bool>(request));
-        break;
-    case wire::Method::setServiceType:
-        object.setServiceType(request.serviceType, reporterID, replyTo<bool>(request));
-        break;
-    case wire::Method::getServiceNameForReporterID:
-        object.getServiceNameForReporterID(reporterID, replyTo<std::uint16_t>(request));
-        break;
-    case wire::Method::setConfiguration:
-        object.setConfiguration(std::move(request.dictionary), reporterID, replyTo<bool>(request));
-        break;
-    case wire::Method::startReportingSessionForID:
-        object.startReportingSessionForID(reporterID, replyTo<bool>(request));
-        break;
-    case wire::Method::sendMessage: {
-        ErrorReply reply;
-        if (request.id) {
-            reply = ErrorReply([self = shared_from_this(), id = *request.id](const ReplyError* error) {
-                self->reply([error, id](TextBuffer& out) {
-                    if (error != nullptr) {
-                        wire::appendErrorReply(out, id, {error->domain, error->code, {}});
-                    } else {
-                        wire::appendNullReply(out, id);
-                    }
-                });
-            });
-        }
-        object.sendMessage(std::move(request.dictionary), request.category, request.type,
-                           std::move(request.reporterIDs), std::move(reply));
-        break;
-    }
-    case wire::Method::stopReportingSessionForID:
-        object.stopReportingSessionForID(reporterID, replyTo<bool>(request));
-        break;
-    case wire::Method::destroyReportingSession:
-        object.destroyReportingSession(reporterID, replyTo<bool>(request));
-        break;
-    case wire::Method::reporterID:
-        object.reporterID(reporterID, replyTo<const Dictionary&>(request));
-        break;
-    case wire::Method::getAllReporters:
-        object.getAllReporters(replyTo<const std::vector<std::int64_t>&>(request));
-        break;
-    case wire::Method::killService:
-        object.killService();
-        break;
     }
 }
 

@@ -40,7 +40,13 @@ public:
     void ready(std::uint32_t events) override;
 
     /// Appends the frame of a reply to those that are held back. From any thread.
-    template <typename AppendFrame> void reply(const AppendFrame& appendFrame);
+    template <typename AppendFrame> void reply(const AppendFrame& appendFrame) {
+        const std::lock_guard lock(mutex_);
+        if (!isUnwritable_) {
+            appendFrame(held_);
+            replied();
+        }
+    }
     /// Lets go of the replies that are held back. From any thread.
     void releaseReplies();
     /// Requests that were handed on have been carried out.
@@ -60,11 +66,11 @@ private:
     void keepRest(std::span<const std::uint8_t> rest, std::size_t wanted);
     void carryOut(std::span<const std::uint8_t> item);
     void refuse(const wire::Refusal& refusal);
-    void dispatch(wire::Request& request);
     void beginEnd(Ending ending);
+    // With the lock held.
+    void replied();
     void sendLocked();
     void watchLocked();
-    template <typename Result> [[nodiscard]] auto replyTo(const wire::Request& request);
 
     LinuxConnectionService& service_;
     const pid_t peer_;
