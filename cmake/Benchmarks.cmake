@@ -17,9 +17,11 @@ if(benchmark_FOUND)
     if(NOT TARGET tamblo_tests_fakes)
         tamblo_folder(tests/fakes PUBLIC session util platform base)
     endif()
-    tamblo_program(tamblo_microbench GLOB bench/micro/*.cpp
+    tamblo_program(tamblo_microbench
+        GLOB bench/micro/*.cpp SOURCES bench/Payloads.cpp bench/TemporaryDirectory.cpp
         LIBRARIES tests/fakes service workers system platform/linux client wire)
     if(TARGET tamblo_microbench)
         target_link_libraries(tamblo_microbench PRIVATE benchmark::benchmark benchmark::benchmark_main)
+        target_compile_definitions(tamblo_microbench PRIVATE "BENCH_DIRECTORY=\"${CMAKE_BINARY_DIR}\"")
     endif()
 endif()
