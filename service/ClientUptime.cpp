@@ -33,6 +33,9 @@ Value uptimeSince(const std::optional<WallTime>& start, pid_t processIdentifier,
 } // namespace
 
 void reportClientUptime(const ClientRef& client, pid_t processIdentifier) {
+    if (client != nullptr && !client->claimUptimeReport()) {
+        return;
+    }
     const std::optional<std::string> knownName =
         client != nullptr ? client->clientProcessName() : std::nullopt;
     const std::string name = knownName.value_or("unknown");

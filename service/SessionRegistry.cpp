@@ -28,11 +28,11 @@ const SessionRegistry::Entry* SessionRegistry::find(ReporterID reporterID) const
     return held != holders_.end() ? &held->second.first : nullptr;
 }
 
-std::vector<SessionRef> SessionRegistry::startedSessions() const {
+std::vector<SessionRef> SessionRegistry::startedSessions(std::size_t atMost) const {
     std::vector<SessionRef> sessions;
-    sessions.reserve(started_.size());
-    for (const auto& [key, session] : started_) {
-        sessions.push_back(session);
+    sessions.reserve(std::min(atMost, started_.size()));
+    for (auto started = started_.begin(); started != started_.end() && sessions.size() != atMost; ++started) {
+        sessions.push_back(started->second);
     }
     return sessions;
 }

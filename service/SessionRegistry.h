@@ -29,8 +29,10 @@ public:
     void set(ReporterID reporterID, const Entry& entry);
     /// The entry of the first client in order of acceptance that has the ID, or null.
     [[nodiscard]] const Entry* find(ReporterID reporterID) const noexcept;
-    /// Client by client in order of acceptance, by ID within each.
-    [[nodiscard]] std::vector<SessionRef> startedSessions() const;
+    /// Client by client in order of acceptance, by ID within each; the first of them when fewer are wanted.
+    [[nodiscard]] std::vector<SessionRef>
+    startedSessions(std::size_t atMost = static_cast<std::size_t>(-1)) const;
+    [[nodiscard]] std::size_t startedCount() const noexcept { return started_.size(); }
 
 private:
     struct Hash {

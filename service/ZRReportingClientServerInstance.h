@@ -10,6 +10,7 @@
 #include <memory>
 #include <optional>
 #include <string>
+#include <utility>
 #include <vector>
 
 #include <sys/types.h>
@@ -65,6 +66,8 @@ public:
     }
     void setClientStartDate(std::optional<WallTime> date) noexcept { clientStartDate_ = date; }
     void setClientProcessName(std::optional<std::string> name) { clientProcessName_ = std::move(name); }
+    /// True for the first caller alone, who then reports how long the client was there.
+    [[nodiscard]] bool claimUptimeReport() noexcept { return !std::exchange(isUptimeReported_, true); }
     /// The client's place in the order of acceptance, from 1; 0 while it is not among the service's clients.
     [[nodiscard]] std::uint64_t acceptanceOrder() const noexcept { return acceptanceOrder_; }
     void setAcceptanceOrder(std::uint64_t order) noexcept { acceptanceOrder_ = order; }
@@ -95,6 +98,7 @@ private:
     std::optional<std::string> clientProcessName_;
     SessionMap clientReportingSessionMap_;
     std::uint64_t acceptanceOrder_ = 0;
+    bool isUptimeReported_ = false;
     /// The sessions of the message at hand; kept for its memory.
     std::vector<SessionRef> recipients_;
 };

@@ -86,26 +86,36 @@ void ZRReportingService::sessionChanged(const ZRReportingClientServerInstance& c
 }
 
 std::vector<SessionRef> ZRReportingService::getAllActiveReportingSessions() {
-    if (ZRReportingServiceDelegateCategory().isOn(LogLevel::standard)) {
-        for (const ClientRef& client : clients_) {
-            std::vector<SessionRef> all;
-            for (const auto& [reporterID, session] : client->clientReportingSessionMap()) {
-                all.push_back(session);
-            }
-            log::standard(ZRReportingServiceDelegateCategory(), "sessions for client {} : {}",
-                          client->processIdentifier(), SessionList{all});
-        }
-    }
+    logSessionsOfClients();
     return sessions_.startedSessions();
+}
+
+void ZRReportingService::logSessionsOfClients() const {
+    if (!ZRReportingServiceDelegateCategory().isOn(LogLevel::standard)) {
+        return;
+    }
+    std::vector<SessionRef> shown;
+    for (const ClientRef& client : clients_) {
+        const auto& all = client->clientReportingSessionMap();
+        shown.clear();
+        for (auto entry = all.begin(); entry != all.end() && shown.size() != SessionList::kMost; ++entry) {
+            shown.push_back(entry->second);
+        }
+        log::standard(ZRReportingServiceDelegateCategory(), "sessions for client {} : {}",
+                      client->processIdentifier(), SessionList{shown, all.size()});
+    }
 }
 
 void ZRReportingService::logReportingSessions() {
     if (!ZRReportingServiceDelegateCategory().isOn(LogLevel::standard)) {
         return;
     }
-    const std::vector<SessionRef> active = getAllActiveReportingSessions();
-    log::standard(ZRReportingServiceDelegateCategory(), "{} active reporting session(s) {}", active.size(),
-                  SessionList{active});
+    // A client may have ten thousand of them and start one more: what the line does not show is not gathered.
+    logSessionsOfClients();
+    const std::vector<SessionRef> shown = sessions_.startedSessions(SessionList::kMost);
+    const std::size_t count = sessions_.startedCount();
+    log::standard(ZRReportingServiceDelegateCategory(), "{} active reporting session(s) {}", count,
+                  SessionList{shown, count});
 }
 
 SessionRef ZRReportingService::findReportingSessionForID(ReporterID reporterID) {
@@ -158,6 +168,7 @@ void ZRReportingService::endAllClients() {
     const std::vector<ClientRef> leaving = clients_;
     for (const ClientRef& client : leaving) {
         client->endConnection();
+        reportClientUptime(client, client->processIdentifier());
     }
 }
 

@@ -57,6 +57,7 @@ public:
 private:
     void addClient(const ClientRef& client);
     void endAllClients();
+    void logSessionsOfClients() const;
     static void setHandlers(ClientConnection& connection, const ClientRef& client);
 
     const ExitProcess exitProcess_;

@@ -6,6 +6,7 @@
 #include "util/MessageKeys.h"
 #include "util/TraceEvents.h"
 
+#include <algorithm>
 #include <utility>
 
 namespace tamblo {
@@ -214,10 +215,14 @@ void appendText(std::string& out, const ZRReportingSession& session) {
 void appendText(std::string& out, const SessionList& list) {
     out += '[';
     std::string_view separator;
-    for (const std::shared_ptr<ZRReportingSession>& session : list.sessions) {
+    const auto shown = list.sessions.first(std::min(list.sessions.size(), SessionList::kMost));
+    for (const std::shared_ptr<ZRReportingSession>& session : shown) {
         out += separator;
         separator = ", ";
         appendText(out, *session);
+    }
+    if (shown.size() != list.count) {
+        appendFormatted(out, " and {} more", list.count - shown.size());
     }
     out += ']';
 }

@@ -142,9 +142,13 @@ private:
 
 void appendText(std::string& out, const ZRReportingSession& session);
 
-/// Several sessions in a log line: "[first, second]".
+/// Several sessions in a log line: "[first, second]"; of more than fit a line that somebody reads, the first
+/// ones and how many there are besides.
 struct SessionList {
+    static constexpr std::size_t kMost = 16;
+
     std::span<const std::shared_ptr<ZRReportingSession>> sessions;
+    std::size_t count; ///< of all sessions; `sessions` need not hold more than `kMost` of them
 };
 void appendText(std::string& out, const SessionList& list);
 

@@ -123,6 +123,7 @@ TEST(Service, EndsAsAskedTo) {
     }
     EXPECT_FALSE(std::filesystem::exists(service.socketPath()));
     EXPECT_EQ(service.countEvents("\"last\":true"), 2U);
+    EXPECT_EQ(service.countEvents("zrreportingclientuptime"), 1U);
 
     service.start();
     RawClient killer(service.socketPath());

@@ -238,7 +238,10 @@ TEST_F(ServiceTest, ShutDownWorksOffWhatIsQueuedThenStopsEverything) {
     first->invalidate();
     (void)run();
     EXPECT_EQ(device.log.count("removing 10 from the server client list"), 1U);
-    EXPECT_EQ(onlyUptime().find("processName")->stringValue(), "app10");
+    const auto uptimes = device.analyticsEvents.payloads(kUptimeEvent);
+    ASSERT_EQ(uptimes.size(), 2U);
+    EXPECT_EQ(uptimes[0].find("processName")->stringValue(), "app10");
+    EXPECT_EQ(uptimes[1].find("processName")->stringValue(), "app11");
 }
 
 TEST_F(ServiceTest, DestroyingTheServiceEndsTheReaper) {
