@@ -8,10 +8,12 @@ namespace {
 
 thread_local InlineDrain* currentDrain = nullptr;
 
-/// A batch that takes longer than this ran into something slow (a disk that stalls, most likely). For a while
-/// the queue is then left to the pool, so that the responsive thread is held up once and not again and again.
+/// A batch that takes longer than this ran into something slow (a disk that stalls, most likely). For this
+/// many times as long the queue is then left to the pool, so that the responsive thread is held up for a
+/// small share of the time, and so that a short hold-up, when other programs had the processor, has no
+/// lasting effect.
 constexpr std::chrono::milliseconds kSlowBatch{25};
-constexpr std::chrono::seconds kInlineBan{1};
+constexpr int kInlineBanFactor = 4;
 
 } // namespace
 
@@ -105,7 +107,7 @@ void LinuxSerialQueue::drainInline() {
         runBatch(true);
         const Time ended = std::chrono::steady_clock::now();
         if (ended - started > kSlowBatch) {
-            inlineAllowedFrom_ = ended + kInlineBan;
+            inlineAllowedFrom_ = ended + kInlineBanFactor * (ended - started);
         }
         if (next_ != batch_.size() || ended < inlineAllowedFrom_) {
             handToPool();
