@@ -76,8 +76,8 @@ void Engine::publish(OutgoingFrame& frame) noexcept {
         queue_.publish(slot, std::memory_order_release);
         return;
     }
-    // In the one total order of these operations and those of `mayFallAsleep`, either the pumping thread sees the
-    // frame before it sleeps, or this thread sees that it sleeps.
+    // In the one total order of these operations and those of `mayFallAsleep`, either the pumping thread sees
+    // the frame before it sleeps, or this thread sees that it sleeps.
     queue_.publish(slot, std::memory_order_seq_cst);
     if (isAsleep_.load(std::memory_order_seq_cst) && isAsleep_.exchange(false)) {
         writeWakeUp();
@@ -158,9 +158,9 @@ bool Engine::connect() {
     return true;
 }
 
-Engine::Clock::time_point Engine::nextAttempt() noexcept {
-    const bool isFirstWaiting = !hadWaiting_ && !isFlushed();
-    return lastAttempt_ + (isFirstWaiting ? std::min(delay_, kFirstDelay) : delay_);
+Engine::Clock::time_point Engine::nextAttempt(bool framesWait) const noexcept {
+    const bool areFirst = framesWait && !hadWaiting_;
+    return lastAttempt_ + (areFirst ? std::min(delay_, kFirstDelay) : delay_);
 }
 
 void Engine::announce(ConnectionState state) {
@@ -388,7 +388,7 @@ std::size_t Engine::pump(milliseconds timeout) {
     hasNews_ = false;
     std::size_t handled = 0;
     do {
-        if (socket_ < 0 && Clock::now() >= nextAttempt()) {
+        if (socket_ < 0 && Clock::now() >= nextAttempt(!isFlushed())) {
             connect();
         }
         if (socket_ >= 0) {
@@ -408,7 +408,13 @@ std::size_t Engine::pump(milliseconds timeout) {
 
 std::size_t Engine::waitAndReceive(Clock::time_point deadline) {
     if (socket_ < 0) {
-        (void)sleepUntil(options_.reconnect ? std::min(deadline, nextAttempt()) : deadline);
+        if (!options_.reconnect) {
+            (void)sleepUntil(deadline, true);
+            return 0;
+        }
+        // The first frame brings the next attempt forward; more of them change nothing.
+        const bool framesWait = !isFlushed();
+        (void)sleepUntil(std::min(deadline, nextAttempt(framesWait)), !framesWait);
         return 0;
     }
     const auto left = std::chrono::floor<milliseconds>(deadline - Clock::now());
@@ -421,7 +427,7 @@ std::size_t Engine::waitAndReceive(Clock::time_point deadline) {
         setReceiveTimeout(milliseconds(std::bit_floor(static_cast<std::uint64_t>(left.count()))))) {
         return readReplies(0);
     }
-    return sleepUntil(deadline) ? readReplies(MSG_DONTWAIT) : 0;
+    return sleepUntil(deadline, !socketIsFull_) ? readReplies(MSG_DONTWAIT) : 0;
 }
 
 bool Engine::setReceiveTimeout(milliseconds timeout) noexcept {
@@ -438,8 +444,8 @@ bool Engine::setReceiveTimeout(milliseconds timeout) noexcept {
     return true;
 }
 
-bool Engine::sleepUntil(Clock::time_point time) {
-    if (!mayFallAsleep()) {
+bool Engine::sleepUntil(Clock::time_point time, bool framesWake) {
+    if (framesWake && !mayFallAsleep()) {
         return false;
     }
     pollfd watched[2] = {{.fd = wakeUp_, .events = POLLIN, .revents = 0},
@@ -460,8 +466,7 @@ bool Engine::sleepUntil(Clock::time_point time) {
 }
 
 bool Engine::mayFallAsleep() noexcept {
-    // While frames wait for the socket or for a connection, more of them change nothing.
-    if (wakeUp_ < 0 || !isFlushed()) {
+    if (wakeUp_ < 0) {
         return true;
     }
     isAsleep_.store(true, std::memory_order_seq_cst);

@@ -86,7 +86,7 @@ private:
 
     [[nodiscard]] OutgoingFrame* frameAt(std::size_t index) noexcept;
     [[nodiscard]] bool open();
-    [[nodiscard]] Clock::time_point nextAttempt() noexcept;
+    [[nodiscard]] Clock::time_point nextAttempt(bool framesWait) const noexcept;
     void announce(ConnectionState state);
     void lose();
     void failFrame(OutgoingFrame& frame, ErrorCode code);
@@ -103,8 +103,10 @@ private:
     [[nodiscard]] std::size_t handleReceived();
     [[nodiscard]] bool handleReply(std::span<const std::uint8_t> item);
     [[nodiscard]] bool setReceiveTimeout(std::chrono::milliseconds timeout) noexcept;
-    /// Whether the socket has something to read.
-    [[nodiscard]] bool sleepUntil(Clock::time_point time);
+    /// Sleeps until then, or until there is something to read, room to send, or, if asked for, a frame to
+    /// send. Whether there is something to read.
+    [[nodiscard]] bool sleepUntil(Clock::time_point time, bool framesWake);
+    /// Has senders wake this thread from now on; false when a frame has come already.
     [[nodiscard]] bool mayFallAsleep() noexcept;
     void writeWakeUp() noexcept;
 
