@@ -62,11 +62,9 @@ constexpr Command kCommandSend{
     "send",
     "send one message",
     "--category CATEGORY [--type TYPE] [--reporter ID]... [KEY=VALUE... | JSON]",
-    "A value that is a JSON scalar is taken as one; any other is a text. Sessions belong to the connection "
-    "that\n"
-    "made them, but a message reaches a reporter of any connection. Without a reporter the message goes to "
-    "the\n"
-    "single-message session, when the payload asks for that with sendSingleMessage=1.",
+    "A value that is a JSON scalar is taken as one; any other is a text. A message reaches a reporter "
+    "whichever\n"
+    "client made it. Without a reporter it goes to the service's single-message session.",
     kOptions,
     run,
 };
