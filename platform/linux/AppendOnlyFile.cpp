@@ -18,6 +18,9 @@ namespace {
 /// A buffer that once held an unusually long line gives its memory back.
 constexpr std::size_t kKeptCapacity = 1U << 20U;
 
+/// How often the path of an open file is looked up.
+constexpr std::chrono::milliseconds kPathCheckInterval{100};
+
 std::uint64_t countLines(std::string_view lines) noexcept {
     return static_cast<std::uint64_t>(std::count(lines.begin(), lines.end(), '\n'));
 }
@@ -153,19 +156,21 @@ void AppendOnlyFile::cutTornLine(std::size_t tornBytes) noexcept {
     closeFile();
 }
 
-/// Whether the path still leads to the file that is open; takes in its size, in case somebody shortened it.
-/// Looking the path up costs more than a small write: between two ticks of the clock, which a rename may take
-/// to be noticed, it is enough that the file has a name at all, since then no line is lost.
+/// Whether the path still leads to the file that is open; takes in its size, in case somebody shortened it. A
+/// look costs half of what a small write does, so it is taken now and then: what is written to a file in the
+/// moments after somebody removed it goes with it.
 bool AppendOnlyFile::isStillInPlace() noexcept {
     if (descriptor_ < 0) {
         return false;
     }
-    struct stat status {};
     const std::chrono::nanoseconds now = operations_.coarseTime();
-    const bool isRecent = std::exchange(pathCheckedAt_, now) == now;
-    const int result =
-        isRecent ? operations_.status(descriptor_, status) : operations_.status(path_.c_str(), status);
-    if (result != 0 || status.st_nlink == 0 || status.st_ino != inode_ || status.st_dev != device_) {
+    if (now - pathCheckedAt_ < kPathCheckInterval) {
+        return true;
+    }
+    pathCheckedAt_ = now;
+    struct stat status {};
+    if (operations_.status(path_.c_str(), status) != 0 || status.st_ino != inode_ ||
+        status.st_dev != device_) {
         return false;
     }
     size_ = static_cast<std::uint64_t>(status.st_size);

@@ -23,7 +23,7 @@ namespace tamblo {
 /// What the file holds are whole lines, each once, whatever fails: a line that was torn (by a full disk now,
 /// or by a crash before) is cut off before anything follows it. Lines that cannot be written are lost and
 /// counted; an outage is one error line when it begins and one when it ends. Every flush tries again, from
-/// opening the file on. A file that others remove or rename is begun anew.
+/// opening the file on. A file that others remove or rename is begun anew within a tenth of a second.
 class AppendOnlyFile {
 public:
     struct Limits {
