@@ -108,7 +108,8 @@ public:
     std::future<Result<std::vector<std::int64_t>>> getAllReporters();
     std::future<Result<bool>> killService();
 
-    /// A message that wants no answer. Without reporter IDs it goes to the single-message session.
+    /// A message that wants no answer. Without reporter IDs it goes to every started session of every client,
+    /// or, when none is started, to the service's single-message session.
     bool post(const Dictionary& payload, EventCategory category, EventType type,
               std::span<const std::int64_t> reporterIDs = {});
     bool post(const Dictionary& payload, EventCategory category, EventType type,

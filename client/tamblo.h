@@ -71,7 +71,8 @@ void tamblo_payload_set_bool(tamblo_payload* payload, const char* key, bool valu
 void tamblo_payload_set_date(tamblo_payload* payload, const char* key, double seconds);
 void tamblo_payload_set_data(tamblo_payload* payload, const char* key, const void* bytes, size_t length);
 
-/* A message to these reporters; without any, to the single-message session. */
+/* A message to these reporters; without any, to every started session of every client, or, when none is
+   started, to the service's single-message session. */
 bool tamblo_client_send(tamblo_client* client, const tamblo_payload* payload, uint32_t category,
                         uint16_t type, const int64_t* reporter_ids, size_t reporter_count, tamblo_reply reply,
                         void* context);
