@@ -64,8 +64,8 @@ constexpr Command kCommandSend{
     "--category CATEGORY [--type TYPE] [--reporter ID]... [KEY=VALUE... | JSON]",
     "A value that is a JSON scalar is taken as one; any other is a text. A message reaches a reporter "
     "whichever\n"
-    "client made it. Without a reporter it goes to every started session",
-    "of every client or, when none is started, to the service's single-message session.",
+    "client made it. Without a reporter it goes to every started session of every client or, when none is\n"
+    "started, to the service's single-message session.",
     kOptions,
     run,
 };
