@@ -4,6 +4,7 @@
 #include "base/Rfc3339.h"
 
 #include <array>
+#include <bit>
 #include <charconv>
 #include <cmath>
 #include <cstdint>
@@ -121,6 +122,52 @@ template <typename Float> char* writeShortDecimal(char* to, Float number) noexce
     return to + digits;
 }
 
+/// The shortest text of a number with a fraction, in exact fixed-point arithmetic: its digits, up to the
+/// first place at which the decimal below or the one above what is left is nearer to the number than any
+/// other number is (G. Steele, J. White: "How to Print Floating-Point Numbers Accurately", 1990). Nothing for
+/// numbers that are whole, small or large, for powers of two (their neighbours are not equally far) and for a
+/// tie.
+char* writeFraction(char* to, double number) noexcept {
+    constexpr unsigned kStoredBits = 52;
+    constexpr int kMostFractionBits = 59; // leaves room for ten times twice the fraction
+    constexpr std::uint64_t kHiddenBit = std::uint64_t{1} << kStoredBits;
+    const auto bits = std::bit_cast<std::uint64_t>(number);
+    const int fractionBits = 1075 - static_cast<int>(bits >> kStoredBits & 0x7FFU);
+    const std::uint64_t stored = bits & (kHiddenBit - 1);
+    if (fractionBits <= 0 || fractionBits > kMostFractionBits || stored == 0) {
+        return nullptr;
+    }
+    const std::uint64_t significand = stored | kHiddenBit;
+    if (number < 0) {
+        *to++ = '-';
+    }
+    to = writeNumber(to, significand >> fractionBits);
+    *to++ = '.';
+    // In units of half of the significand's last place, which is how far the number's own decimals reach;
+    // those at the end of the reach are read as the number when its significand is even.
+    const auto unitBits = static_cast<unsigned>(fractionBits) + 1;
+    const std::uint64_t one = std::uint64_t{1} << unitBits;
+    const std::uint64_t end = significand % 2 == 0 ? 1 : 0;
+    std::uint64_t rest = significand * 2 & (one - 1);
+    for (std::uint64_t reach = 10;; reach *= 10) {
+        rest *= 10;
+        const auto digit = static_cast<char>('0' + (rest >> unitBits));
+        rest &= one - 1;
+        const bool below = rest < reach + end;
+        const bool above = rest + reach + end > one;
+        if (!below && !above) {
+            *to++ = digit;
+            continue;
+        }
+        if (below && above && rest == one / 2) {
+            return nullptr;
+        }
+        const bool roundsUp = above && (!below || rest > one / 2);
+        *to++ = static_cast<char>(digit + (roundsUp ? 1 : 0)); // never past 9: it would have ended before
+        return to;
+    }
+}
+
 template <typename Float> char* writeFloat(char* to, Float number) noexcept {
     // Below this every whole number is its own shortest text.
     constexpr Float integral = std::is_same_v<Float, float> ? Float(1U << 24U) : Float(1ULL << 53U);
@@ -131,6 +178,11 @@ template <typename Float> char* writeFloat(char* to, Float number) noexcept {
         }
     } else if (!std::isfinite(number)) {
         return writeText(to, "null");
+    }
+    if constexpr (std::is_same_v<Float, double>) {
+        if (char* const end = writeFraction(to, number)) {
+            return end;
+        }
     }
     if (char* const end = writeShortDecimal(to, number)) {
         return end;

@@ -3,7 +3,9 @@
 
 #include <gtest/gtest.h>
 
+#include <array>
 #include <charconv>
+#include <cmath>
 #include <limits>
 #include <random>
 #include <string>
@@ -100,14 +102,22 @@ TEST(JsonWriter, FloatsReadBackTheSame) {
                 << text;
             EXPECT_LE(text.size(), 17U) << text;
         }
-        const double number =
-            std::ldexp(static_cast<double>(random() >> 11U), static_cast<int>(random() % 120) - 90);
-        TextBuffer out;
-        appendJsonNumber(out, number);
-        double back = 0;
-        std::from_chars(out.data(), out.data() + out.size(), back);
-        EXPECT_EQ(back, number) << out.view();
-        EXPECT_NE(out.view().find_first_of(".e"), std::string_view::npos) << out.view();
+        const double few = static_cast<double>(random() % 1'000'000'000) / std::pow(10.0, random() % 12);
+        for (const double number :
+             {std::ldexp(static_cast<double>(random() >> 11U), static_cast<int>(random() % 120) - 90), few,
+              -std::nextafter(few, 0.0)}) {
+            TextBuffer out;
+            appendJsonNumber(out, number);
+            double back = 0;
+            std::from_chars(out.data(), out.data() + out.size(), back);
+            EXPECT_EQ(back, number) << out.view();
+            EXPECT_NE(out.view().find_first_of(".e"), std::string_view::npos) << out.view();
+            if (number != std::trunc(number)) {
+                std::array<char, 32> shortest{};
+                std::to_chars(shortest.data(), shortest.data() + shortest.size(), number);
+                EXPECT_EQ(out.view(), std::string_view(shortest.data()));
+            }
+        }
     }
 }
 
