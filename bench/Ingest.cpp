@@ -82,25 +82,27 @@ void measure(Bench& bench, const Scenario& scenario, Placement placement) {
     bench.print(row);
 }
 
-} // namespace
-
-void ingestPipelined(Bench& bench) {
-    const Scenario scenario{"ingest_pipelined", Variety::distinct, {}, 2.5, true};
+void measureBoth(Bench& bench, const Scenario& scenario) {
     measure(bench, scenario, Placement::twoCores);
     measure(bench, scenario, Placement::oneCore);
 }
 
+} // namespace
+
+void ingestPipelined(Bench& bench) {
+    measureBoth(bench, {"ingest_pipelined", Variety::distinct, {}, 2.5, true});
+}
+
 void ingestOneEvent(Bench& bench) {
-    measure(bench, {"ingest_one_event", Variety::distinct, R"(["com.vandra.tamblo.*"])", 1.8},
-            Placement::twoCores);
+    measureBoth(bench, {"ingest_one_event", Variety::distinct, R"(["com.vandra.tamblo.*"])", 1.8});
 }
 
 void ingestUnwanted(Bench& bench) {
-    measure(bench, {"ingest_unwanted", Variety::distinct, "[]", 1.2}, Placement::twoCores);
+    measureBoth(bench, {"ingest_unwanted", Variety::distinct, "[]", 1.2});
 }
 
 void ingestRepeated(Bench& bench) {
-    measure(bench, {"ingest_repeated", Variety::repeated, {}, 1.0}, Placement::twoCores);
+    measureBoth(bench, {"ingest_repeated", Variety::repeated, {}, 1.0});
 }
 
 } // namespace tamblo::bench
