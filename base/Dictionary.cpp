@@ -201,8 +201,10 @@ void Dictionary::merge(const Dictionary& other) {
         addAll(source);
         return;
     }
+    mine = 0;
     for (std::size_t i = 0; missing != 0 && i < theirs.size(); ++i) {
-        if (block_->keys->find(theirs.key(i)) == KeySet::kNotFound) {
+        mine = block_->keys->findFrom(mine, theirs, i);
+        if (mine == block_->count() || !block_->keys->sameKey(mine, theirs, i)) {
             set(theirs.key(i), incoming[i]);
             --missing;
         }

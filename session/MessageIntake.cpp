@@ -5,8 +5,12 @@
 
 #include <algorithm>
 #include <array>
+#include <cstdint>
+#include <map>
+#include <numeric>
 #include <string>
 #include <string_view>
+#include <utility>
 #include <vector>
 
 namespace tamblo::intake {
@@ -14,6 +18,9 @@ namespace tamblo::intake {
 namespace {
 
 constexpr double kOldestAcceptedAge = 31'536'000; // seconds: 365 days
+
+/// The audio tag and the application's name.
+constexpr std::size_t kKeysAddedAfterwards = 2;
 
 /// Differ between two messages that say the same.
 constexpr std::array<std::string_view, 3> kKeysOfTimes{ZRReportingInternalEventProcessUptimeMS,
@@ -50,15 +57,27 @@ void removeWhiteSpaceFromKeys(Dictionary& payload) {
     if (!payload.keys().anyKeyHasSpace()) {
         return;
     }
-    const Dictionary original = payload;
-    for (std::size_t i = 0; i < original.size(); ++i) {
-        std::string key(original.keyAt(i));
-        std::replace(key.begin(), key.end(), ' ', '_');
-        if (key != original.keyAt(i)) {
-            payload.set(key, original.valueAt(i));
-            payload.remove(original.keyAt(i));
+    // Built anew at once: key by key, the time would grow with the square of their number, which is a
+    // client's choice. The keys with a space come second, as their values win.
+    std::map<std::string, Value> cleaned;
+    for (const bool hasSpace : {false, true}) {
+        for (std::size_t i = 0; i < payload.size(); ++i) {
+            std::string key(payload.keyAt(i));
+            if ((key.find(' ') != std::string::npos) == hasSpace) {
+                std::replace(key.begin(), key.end(), ' ', '_');
+                cleaned.insert_or_assign(std::move(key), payload.valueAt(i));
+            }
         }
     }
+    std::vector<std::string_view> keys;
+    std::vector<Value> values;
+    for (const auto& [key, value] : cleaned) {
+        keys.push_back(key);
+        values.push_back(value);
+    }
+    std::vector<std::uint32_t> places(keys.size());
+    std::iota(places.begin(), places.end(), 0U);
+    payload = Dictionary::adopt(KeySet::make(keys), values, places, kKeysAddedAfterwards);
 }
 
 void addAudioMessageTag(Dictionary& payload, AudioEventCategory category, AudioEventType type) {
