@@ -55,8 +55,9 @@ double leadingNumber(std::string_view text) noexcept {
     const auto result = std::from_chars(text.data(), text.data() + text.size(), number);
     if (result.ec == std::errc::result_out_of_range) {
         const std::string_view read(text.data(), static_cast<std::size_t>(result.ptr - text.data()));
-        const bool isTiny =
-            read.find("e-") != std::string_view::npos || read.find("E-") != std::string_view::npos;
+        const std::size_t exponent = read.find_first_of("eE");
+        const bool isTiny = exponent != std::string_view::npos ? read[exponent + 1] == '-'
+                                                               : read[read.find_first_not_of('0')] == '.';
         number = isTiny ? 0.0 : std::numeric_limits<double>::infinity();
     }
     return negative ? -number : number;
