@@ -191,10 +191,13 @@ TEST_F(IntakeTest, RecordsAreIndependentOfWhatTheyWereMadeFrom) {
     const auto message = makeMessage(sent, 0xFFFFFFFF, 65535);
     sent.set("a", 2);
     EXPECT_EQ(message->payload().find("a")->integerValue(), 1);
+    message->isRedundant = true;
+    message->isSessionStarted = true;
     const auto copy = message->copyWithZone();
+    EXPECT_TRUE(copy->isRedundant && copy->isSessionStarted);
     copy->editPayload([](Dictionary& payload) { payload.set("nested", 3); });
     EXPECT_EQ(message->description(), "category=Undefined type=Unknown {\"a\":1,\"nested\":{\"x\":1}}");
-    EXPECT_EQ(copy->category(), message->category());
+    EXPECT_EQ(copy->description(), "category=Undefined type=Unknown {\"a\":1,\"nested\":3}");
     EXPECT_EQ(device.log.count("copyWithZone"), 1U);
 }
 

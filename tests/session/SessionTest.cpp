@@ -1,3 +1,4 @@
+#include "base/Format.h"
 #include "session/ZRReportingSession.h"
 #include "tests/fakes/FakePlatform.h"
 #include "tests/session/ScriptedWorkers.h"
@@ -85,9 +86,13 @@ TEST_F(SessionTest, ASingleMessageSessionLeavesOutTheWorkersThatAreNotForIt) {
     session->setIsSingleMessageSession(true);
     session->start();
     EXPECT_THAT(script.take(), ElementsAre("start Late"));
-    EXPECT_EQ(device.log.count("Skipping ZRReportingSessionWorker for single message session. action=skipped "
-                               "worker=Both reporterID=77"),
-              1U);
+    EXPECT_EQ(session->workerInstanceCount(), 3U) << "Redundant was made before the session was such a one";
+    for (const char* name : {"Both", "Redundant"}) {
+        EXPECT_EQ(device.log.count(formatted("Skipping ZRReportingSessionWorker for single message session. "
+                                             "action=skipped worker={} reporterID=77",
+                                             name)),
+                  1U);
+    }
     EXPECT_THAT(workerClassLists().valid, testing::Not(Contains(workerClassNamed("Absent"))));
 }
 
@@ -157,25 +162,33 @@ TEST_F(SessionTest, OwnRecordsOfStartAndStop) {
     EXPECT_EQ(session->messages()[2]->category(), AudioEventKindSetup);
 
     // They are what a client's message of their kind is compared with.
-    const auto repeat = send(*session,
-                             {{"method", "start"},
-                              {"messages_at_start", 2},
-                              {"unique_messages_at_start", 2},
-                              {"reporterid", 77},
-                              {"running_at_start", "YES"},
-                              {"invalid_timestamp", "nil"},
-                              {"HostApplicationDisplayID", "x"}},
-                             AudioEventKindSetup, AudioEventTypeStart);
-    EXPECT_FALSE(repeat->isRedundant) << "it has an application's name, the record has none";
+    const auto isRepeat = [&] {
+        return send(*session, {{"a", 1}}, AudioEventKindSetup, AudioEventTypeStart)->isRedundant;
+    };
+    EXPECT_FALSE(isRepeat());
+    EXPECT_TRUE(isRepeat());
+    session->start();
+    EXPECT_FALSE(isRepeat()) << "the start's own record lies between";
 }
 
 TEST_F(SessionTest, ProducersSendWhileConsumersStillRun) {
     const auto session = makeSession();
-    script.atStop["Producer"] = [](ZRReportingSession& owner) { send(owner, {{"sum", 1}}, 1, 11); };
+    std::vector<std::int64_t> seen;
+    script.atStop["Producer"] = [&seen](ZRReportingSession& owner) {
+        for (const MessageRef& message : owner.messages()) {
+            const Value* number = message->payload().find("n");
+            seen.push_back(number != nullptr ? number->integerValue() : 0);
+        }
+        EXPECT_TRUE(send(owner, {{"sum", 1}}, 1, 11)->isSessionStarted);
+    };
     script.atStop["Late"] = [](ZRReportingSession& owner) { send(owner, {{"late", 1}}, 2, 11); };
     session->start();
+    const double now = device.clock.seconds();
+    send(*session, {{"n", 2}, {"zrreporting_timestamp", now + 2}});
+    send(*session, {{"n", 1}, {"zrreporting_timestamp", now + 1}});
     (void)script.take();
     session->stop();
+    EXPECT_THAT(seen, ElementsAre(0, 0, 1, 2)) << "the session's own records, then by time";
     EXPECT_THAT(script.take(), ElementsAre("stop Producer", "message Init 1/11", "message Redundant 1/11",
                                            "message Both 1/11", "message Late 1/11", "stop Both", "stop Init",
                                            "stop Redundant", "stop Late", "message Late 2/11", "stop Only"));
@@ -207,16 +220,29 @@ TEST_F(SessionTest, TracePointsAndLifeCycleLines) {
     auto session = makeSession();
     session->start();
     send(*session, {{"a", 1}});
+    send(*session, {{"a", 1}});
     session->stop();
     session.reset();
     EXPECT_THAT(device.tracePoints.take(),
-                ElementsAre(0x21044828, 0x2104482C, 0x21044838, 0x21044830, 0x21044834));
+                ElementsAre(0x21044828, 0x2104482C, 0x21044838, 0x21044838, 0x21044830, 0x21044834));
     const auto lines = device.log.lines();
-    for (const char* text :
-         {"created reporting session for ID: 77", "setting service type unknown",
-          "start called. reporterID=77", "self.started==false. starting. reporterID=77",
-          "stop called. reporterID=77", "ending session. reporterID=77", "deallocing this session 77"}) {
-        EXPECT_THAT(lines, Contains(testing::AllOf(testing::Field(&FakeLog::Line::text, text),
+    const std::string worker = "ZRReportingSessionWorker action=";
+    const std::pair<LogLevel, std::string> expected[] = {
+        {LogLevel::info, "created reporting session for ID: 77"},
+        {LogLevel::info, "setting service type unknown"},
+        {LogLevel::info, "start called. reporterID=77"},
+        {LogLevel::debug, "self.started==false. starting. reporterID=77"},
+        {LogLevel::debug, "Initializing ZRReportingSessionWorker. action=init worker=Late reporterID=77"},
+        {LogLevel::debug, worker + "added worker=Late reporterID=77"},
+        {LogLevel::debug, worker + "handleMessage worker=Late reporterID=77"},
+        {LogLevel::debug, "marking event redundant"},
+        {LogLevel::debug, "stop called. reporterID=77"},
+        {LogLevel::debug, "ending session. reporterID=77"},
+        {LogLevel::debug, worker + "stop worker=Only reporterID=77"},
+        {LogLevel::info, "deallocing this session 77"}};
+    for (const auto& [level, text] : expected) {
+        EXPECT_THAT(lines, Contains(testing::AllOf(testing::Field(&FakeLog::Line::level, level),
+                                                   testing::Field(&FakeLog::Line::text, text),
                                                    testing::Field(&FakeLog::Line::category, "zrrr"))))
             << text;
     }
