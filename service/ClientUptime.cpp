@@ -13,26 +13,26 @@ namespace tamblo {
 
 namespace {
 
-/// Seconds from the start to now, either way round; −1 without a start.
-Value uptimeSince(const std::optional<WallTime>& start, pid_t processIdentifier, const std::string& name) {
+/// Seconds from the start to the end, either way round; −1 without a start.
+Value uptimeBetween(const std::optional<WallTime>& start, WallTime end, pid_t processIdentifier,
+                    const std::string& name) {
     if (!start) {
         log::standard(ZRReportingServiceDelegateCategory(),
                       "clientStartDate is nil. clientpid={} clientprocessname={}", processIdentifier, name);
         return -1;
     }
-    const WallTime now = platform().clock.now();
-    if (*start > now) {
+    if (*start > end) {
         // The text says "past" for a start in the future; those who search the log know it so.
         log::standard(ZRReportingServiceDelegateCategory(),
                       "clientStartDate is in the past. clientpid={} clientprocessname={}", processIdentifier,
                       name);
     }
-    return std::chrono::duration<double>(std::chrono::abs(now - *start)).count();
+    return std::chrono::duration<double>(std::chrono::abs(end - *start)).count();
 }
 
 } // namespace
 
-void reportClientUptime(const ClientRef& client, pid_t processIdentifier) {
+void reportClientUptime(const ClientRef& client, pid_t processIdentifier, WallTime end) {
     if (client != nullptr && !client->claimUptimeReport()) {
         return;
     }
@@ -40,7 +40,7 @@ void reportClientUptime(const ClientRef& client, pid_t processIdentifier) {
         client != nullptr ? client->clientProcessName() : std::nullopt;
     const std::string name = knownName.value_or("unknown");
     const std::optional<WallTime> start = client != nullptr ? client->clientStartDate() : std::nullopt;
-    const Value uptime = uptimeSince(start, processIdentifier, name);
+    const Value uptime = uptimeBetween(start, end, processIdentifier, name);
     log::standard(ZRReportingServiceDelegateCategory(),
                   "invalidationHandler: connection exited process={} uptime_sec={}", name,
                   uptime.integerValue());

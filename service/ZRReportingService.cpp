@@ -52,9 +52,12 @@ void ZRReportingService::setHandlers(ClientConnection& connection, const ClientR
         if (held != nullptr) {
             held->handleConnectionError();
         }
-        // The client's fields are the queue's to read; it is kept until they are.
+        // The client's fields are the queue's to read; it is kept until they are. What the queue has to do
+        // before is none of the client's time.
         ZRReportingUtilityGetReportingServerQueue().post(
-            [held, processIdentifier] { reportClientUptime(held, processIdentifier); });
+            [held, processIdentifier, end = platform().clock.now()] {
+                reportClientUptime(held, processIdentifier, end);
+            });
     });
 }
 
@@ -167,8 +170,9 @@ void ZRReportingService::endAllClients() {
     // Each leaves the list as it ends.
     const std::vector<ClientRef> leaving = clients_;
     for (const ClientRef& client : leaving) {
+        const WallTime end = platform().clock.now();
         client->endConnection();
-        reportClientUptime(client, client->processIdentifier());
+        reportClientUptime(client, client->processIdentifier(), end);
     }
 }
 

@@ -19,6 +19,10 @@ protected:
 };
 
 TEST_F(RequestsTest, UnknownReportersAreAnsweredWithSuccess) {
+    // ID 0 names no session, even once there is one.
+    requests.createReportingSession(0, {});
+    (void)run();
+    (void)script.take();
     for (const ReporterID id : {ReporterID{0}, ReporterID{99}}) {
         requests.setServiceType(2, id, noteBoolean("type"));
         requests.setConfiguration({{"a", 1}}, id, noteBoolean("configure"));
@@ -41,17 +45,71 @@ TEST_F(RequestsTest, UnknownReportersAreAnsweredWithSuccess) {
     send(client, {99});
     EXPECT_THAT(takeReplies(), ElementsAre("send"));
     EXPECT_THAT(script.take(), IsEmpty());
-    EXPECT_EQ(device.log.count("fetching seviceType"), 2U);
-    EXPECT_EQ(device.log.count("stopping 99"), 1U);
     EXPECT_EQ(device.log.count("stopping 0"), 0U);
-    EXPECT_EQ(device.log.count("Stop called, but session==nil or session.started==false. reporterID=99 "
-                               "session=(null) session.started=0"),
-              1U);
-    EXPECT_EQ(device.log.count("returning service type 65535 for reporter  99"), 1U);
+    EXPECT_EQ(device.log.count("destroying 0"), 0U);
+}
+
+TEST_F(RequestsTest, LinesOfAClient) {
+    device.log.clear();
+    Connection other = connect(11);
+    ZRReportingServiceProtocol& of11 = other->object();
+    of11.createReportingSession(7, {});
+    of11.setServiceType(2, 7, {});
+    of11.setConfiguration({}, 7, {});
+    of11.startReportingSessionForID(7, {});
+    of11.sendMessage({}, 1, 1, {7, 99}, {});
+    of11.getServiceNameForReporterID(7, {});
+    of11.reporterID(7, {});
+    of11.stopReportingSessionForID(7, {});
+    of11.stopReportingSessionForID(99, {});
+    of11.destroyReportingSession(7, {});
+    (void)run();
+    other->interrupt();
+    other->invalidate();
+    (void)run();
+    const std::vector<std::string> expected{
+        "s: newConnection: connection of 11",
+        "s: new client with pid 11",
+        "d: creating session for reporter 7",
+        "s: session created for reporter 7",
+        "d: setting service type 2 for reporter 7",
+        "s: service type 2 set for reporter  7",
+        "d: setting configuration",
+        "d: starting session for reporter 7",
+        "s: sessions for client 10 :",
+        "s: sessions for client 11 :",
+        "s: 1 active reporting session(s)",
+        "d: sending message for reporter",
+        "i: found reporting session 7 for client 11",
+        "e: failed to find reporting session 99",
+        "d: fetching seviceType",
+        "s: returning service type 2 for reporter  7",
+        "d: validating reporter 7",
+        "s: validating reporter 7",
+        "d: stopping session for reporter 7",
+        "s: sessions for client 10 :",
+        "s: sessions for client 11 :",
+        "s: 0 active reporting session(s)",
+        "s: stopping 7",
+        "d: stopping session for reporter 99",
+        "d: Stop called, but session==nil or session.started==false. reporterID=99 session=(null) "
+        "session.started=0",
+        "s: stopping 99",
+        "d: destroying session for reporter 7",
+        "s: destroying 7",
+        "s: sessions for client 10 :",
+        "s: sessions for client 11 :",
+        "s: 0 active reporting session(s)",
+        "s: interruptionHandler: connection exited",
+        "s: removing 11 from the server client list",
+        "s: invalidationHandler: connection exited process=app11 uptime_sec=0",
+        "s: dealloc 11 from the server client list"};
+    EXPECT_EQ(serviceLines(), expected);
 }
 
 TEST_F(RequestsTest, TheStartReplyIsHeldUntilTheStop) {
     requests.createReportingSession(7, noteBoolean("create"));
+    requests.setServiceType(AudioServiceTypeTest, 7, {});
     requests.startReportingSessionForID(7, noteBoolean("start"));
     requests.startReportingSessionForID(7, noteBoolean("again"));
     (void)run();
@@ -62,12 +120,10 @@ TEST_F(RequestsTest, TheStartReplyIsHeldUntilTheStop) {
     requests.stopReportingSessionForID(7, noteBoolean("stop"));
     (void)run();
     EXPECT_THAT(takeReplies(), ElementsAre("stop 1")) << "answered once";
-    EXPECT_EQ(
-        device.log.count("Stop called, but session==nil or session.started==false. reporterID=7 "
-                         "session=reporterID=7,serviceName=unknown,ownerPid=10,clientProcessName=app10"),
-        1U);
+    EXPECT_EQ(device.log.count("Stop called, but session==nil or session.started==false. reporterID=7 "
+                               "session=reporterID=7,serviceName=test,ownerPid=10,clientProcessName=app10"),
+              1U);
     EXPECT_EQ(device.log.count("1 active reporting session(s) [reporterID=7,"), 1U);
-    EXPECT_EQ(device.log.count("0 active reporting session(s) []"), 1U);
 }
 
 TEST_F(RequestsTest, AReplyHeldByASessionThatGoesIsNeverAnswered) {
@@ -92,6 +148,8 @@ TEST_F(RequestsTest, AReplyHeldByASessionThatGoesIsNeverAnswered) {
 }
 
 TEST_F(InternalBuildRequestsTest, ATestSessionAnswersItsStartAtOnceAndAtTheStop) {
+    requests.createReportingSession(8, {});
+    requests.startReportingSessionForID(8, noteBoolean("other"));
     requests.createReportingSession(7, {});
     requests.setServiceType(AudioServiceTypeTest, 7, {});
     requests.startReportingSessionForID(7, noteBoolean("start"));
@@ -128,9 +186,9 @@ TEST_F(RequestsTest, AChangeOfServiceTypeMakesAFreshSessionOfTheSameClient) {
     EXPECT_THAT(after->messages(), IsEmpty());
     EXPECT_EQ(after->serviceName(), "telephony");
     EXPECT_EQ(after->clientProcessName(), "app10");
+    EXPECT_THAT(after->processIdentifiers(), ElementsAre(10));
     EXPECT_EQ(after->configuration().find("HostApplicationDisplayID")->stringValue(), "com.app");
     EXPECT_EQ(after->previousValues().find("volume")->integerValue(), 3);
-    EXPECT_EQ(device.log.count("service type 2 set for reporter  7"), 1U);
     EXPECT_THAT(service->getAllActiveReportingSessions(), IsEmpty());
 }
 
@@ -151,20 +209,30 @@ TEST_F(RequestsTest, DisabledReportingRefusesMessages) {
 TEST_F(RequestsTest, LookupsCrossClientsChangesDoNot) {
     const Connection other = connect(11);
     open(client, 7);
-    requests.setServiceType(2, 7, {});
-    open(other, 8);
-    other->object().setServiceType(3, 7, noteBoolean("type"));
+    requests.createReportingSession(8, {});
+    requests.createReportingSession(9, {});
+    requests.setServiceType(2, 8, {});
+    open(other, 9);
+    other->object().setServiceType(3, 8, noteBoolean("type"));
+    other->object().setConfiguration({{"a", 1}}, 8, {});
+    other->object().startReportingSessionForID(8, noteBoolean("start"));
+    other->object().stopReportingSessionForID(7, noteBoolean("stop"));
     other->object().destroyReportingSession(7, noteBoolean("destroy"));
-    other->object().getServiceNameForReporterID(7, noteWith<std::uint16_t>("name"));
+    other->object().getServiceNameForReporterID(8, noteWith<std::uint16_t>("name"));
+    other->object().setServiceType(4, 9, {});
+    other->object().getServiceNameForReporterID(9, noteWith<std::uint16_t>("own"));
     Dictionary validated;
-    other->object().reporterID(7, [&](const ReplyError*, const Dictionary& result) { validated = result; });
+    other->object().reporterID(8, [&](const ReplyError*, const Dictionary& result) { validated = result; });
     std::vector<ReporterID> all;
     other->object().getAllReporters(
         [&](const ReplyError*, const std::vector<ReporterID>& result) { all = result; });
     (void)run();
-    EXPECT_THAT(takeReplies(), ElementsAre("type 1", "destroy 1", "name 2"));
-    EXPECT_EQ(validated, (Dictionary{{"reporterID", 7}, {"serviceType", 2}}));
-    EXPECT_THAT(all, ElementsAre(7, 8));
+    EXPECT_THAT(takeReplies(), ElementsAre("type 1", "start 1", "stop 1", "destroy 1", "name 2", "own 4"));
+    EXPECT_EQ(validated, (Dictionary{{"reporterID", 8}, {"serviceType", 2}}));
+    EXPECT_THAT(all, ElementsAre(7, 8, 9, 9));
+    EXPECT_TRUE(find(7)->started());
+    EXPECT_FALSE(find(8)->started());
+    EXPECT_FALSE(find(8)->configuration().contains("a"));
 }
 
 TEST_F(RequestsTest, PacesAndTracePoints) {

@@ -77,6 +77,18 @@ protected:
         }
         return ids;
     }
+    /// The lines of the service's category, each with its level's first letter, up to a list in it.
+    std::vector<std::string> serviceLines() {
+        std::vector<std::string> found;
+        for (const FakeLog::Line& line : device.log.lines()) {
+            if (line.category == "zrrs") {
+                const char level = "disef"[static_cast<std::size_t>(line.level)];
+                found.push_back(level + (": " + line.text.substr(0, line.text.find(" ["))));
+            }
+        }
+        device.log.clear();
+        return found;
+    }
     static int& exitStatus() {
         static int status = 0;
         return status;
