@@ -76,15 +76,13 @@ void SessionPlayer::send(SessionLine& line) {
                                               [report = report_](client::Result<client::Nothing>&& result) {
                                                   ++report->answered;
                                                   if (result.error) {
-                                                      ++report->refused;
-                                                      report->firstError = std::move(result.error);
+                                                      report->noteRefusal(*std::move(result.error));
                                                   }
                                               });
     ++report_->sent;
     if (!isQueued) {
         ++report_->answered;
-        ++report_->refused;
-        report_->firstError = client::makeError(client::ErrorCode::refused);
+        report_->noteRefusal(client::makeError(client::ErrorCode::refused));
     }
     if (options_.speed) {
         client_.run(0ms);

@@ -9,6 +9,7 @@
 #include <memory>
 #include <optional>
 #include <string>
+#include <utility>
 
 namespace tamblo::tools {
 
@@ -31,6 +32,13 @@ public:
         std::uint64_t refused = 0; ///< answered with an error
         double seconds = 0;
         std::optional<client::Error> firstError;
+
+        void noteRefusal(client::Error error) {
+            ++refused;
+            if (!firstError) {
+                firstError = std::move(error);
+            }
+        }
     };
 
     SessionPlayer(client::Client& client, Options options)
