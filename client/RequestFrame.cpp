@@ -3,7 +3,6 @@
 #include "base/Cbor.h"
 #include "wire/FrameScope.h"
 
-#include <array>
 #include <string_view>
 
 namespace tamblo::client::request_frame {
@@ -103,11 +102,8 @@ bool finishMessage(TextBuffer& out, bool wantsReply, std::size_t entries, EventC
         out.clear();
         return false;
     }
-    char* const bytes = out.data();
-    for (std::size_t i = 0; i < wire::kLengthBytes; ++i) {
-        bytes[i] = static_cast<char>(length >> (8 * i));
-    }
-    char* const map = bytes + mapOffset(wantsReply);
+    wire::storeLength(out.data(), length);
+    char* const map = out.data() + mapOffset(wantsReply);
     map[1] = static_cast<char>(entries >> 8);
     map[2] = static_cast<char>(entries);
     return true;

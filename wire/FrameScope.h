@@ -4,9 +4,15 @@
 #include "wire/Protocol.h"
 
 #include <cstddef>
-#include <cstdint>
 
 namespace tamblo::wire {
+
+/// Writes a frame's length to its place in front of the item.
+inline void storeLength(char* to, std::size_t length) noexcept {
+    for (std::size_t i = 0; i < kLengthBytes; ++i) {
+        to[i] = static_cast<char>(length >> (8 * i));
+    }
+}
 
 /// Writes a frame's item straight behind the place of its length, which is filled in at the end.
 class FrameScope {
@@ -25,10 +31,7 @@ public:
             out_.truncate(start_);
             return false;
         }
-        char* to = out_.data() + start_;
-        for (std::size_t i = 0; i < kLengthBytes; ++i) {
-            to[i] = static_cast<char>(length >> (8 * i));
-        }
+        storeLength(out_.data() + start_, length);
         return true;
     }
 
