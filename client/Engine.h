@@ -76,7 +76,6 @@ public:
 
     void countRefused() noexcept { refused_.fetch_add(1, std::memory_order_relaxed); }
     [[nodiscard]] std::uint64_t refused() const noexcept { return refused_.load(std::memory_order_relaxed); }
-    [[nodiscard]] std::size_t pendingReplies() const noexcept { return pending_.size(); }
     [[nodiscard]] const std::string& socketPath() const noexcept { return options_.socketPath; }
 
 private:

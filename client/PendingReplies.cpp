@@ -21,7 +21,6 @@ void PendingReplies::expect(std::uint64_t id, ReplyFunction reply, bool everyRep
     Entry& entry = entries_[indexOf(id)];
     entry.reply = std::move(reply);
     entry.everyReply = everyReply;
-    ++waiting_;
 }
 
 void PendingReplies::cancel(std::uint64_t id) noexcept {
@@ -36,7 +35,6 @@ bool PendingReplies::deliver(std::uint64_t id, const ReplyView& reply) {
     Entry& entry = entries_[index];
     entry.reply(reply);
     if (!entry.everyReply) {
-        --waiting_;
         free(index);
     }
     return true;

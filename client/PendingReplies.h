@@ -29,8 +29,6 @@ public:
     /// Answers all that were sent. Ids that are only reserved stay.
     void failAll(const Error& error);
 
-    [[nodiscard]] std::size_t size() const noexcept { return waiting_; }
-
 private:
     static constexpr unsigned kIndexBits = 20;
     static constexpr std::uint32_t kNone = 0xFFFFFFFF;
@@ -49,7 +47,6 @@ private:
     std::vector<Entry> entries_;
     std::uint32_t firstFree_ = kNone;
     std::uint64_t lastNumber_ = 0;
-    std::size_t waiting_ = 0;
 };
 
 } // namespace tamblo::client

@@ -16,12 +16,10 @@ struct Directories {
     std::string configuration;
     std::string logs;
 
-    [[nodiscard]] std::string socketFile() const { return runtime + "/com.vandra.tamblo.reporting"; }
     [[nodiscard]] std::string notifications() const { return runtime + "/notifications"; }
     [[nodiscard]] std::string driverChannels() const { return runtime + "/chanlog"; }
     [[nodiscard]] std::string preferences() const { return configuration + "/preferences"; }
     [[nodiscard]] std::string deviceProperties() const { return configuration + "/device-properties.json"; }
-    [[nodiscard]] std::string diagnosticLogs() const { return logs + "/DiagnosticLogs/Audio/Reporting"; }
 
     /// What the places are worked out from.
     struct Environment {
