@@ -1,7 +1,6 @@
 #pragma once
 
 #include "client/Reply.h"
-#include "wire/Reply.h"
 
 #include <cstddef>
 #include <cstdint>

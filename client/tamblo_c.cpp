@@ -4,9 +4,7 @@
 #include <chrono>
 #include <exception>
 #include <new>
-#include <span>
 #include <type_traits>
-#include <utility>
 
 using namespace tamblo::client;
 

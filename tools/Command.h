@@ -2,7 +2,6 @@
 
 #include "tools/Arguments.h"
 
-#include <cstdint>
 #include <span>
 #include <string_view>
 

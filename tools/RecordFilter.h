@@ -1,7 +1,6 @@
 #pragma once
 
 #include "base/Dictionary.h"
-#include "tools/Arguments.h"
 
 #include <optional>
 #include <string>

@@ -2,7 +2,6 @@
 
 #include "base/Format.h"
 #include "client/NumberText.h"
-#include "tools/Payload.h"
 
 #include <algorithm>
 

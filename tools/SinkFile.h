@@ -3,8 +3,6 @@
 #include "base/Dictionary.h"
 #include "base/UniqueFunction.h"
 
-#include <cstdint>
-#include <optional>
 #include <string>
 #include <string_view>
 #include <vector>

@@ -1,9 +1,11 @@
 #include "tools/Command.h"
 
 #include <algorithm>
-#include <csignal>
 #include <cstdio>
+#include <span>
 #include <string>
+#include <string_view>
+#include <variant>
 #include <vector>
 
 namespace {

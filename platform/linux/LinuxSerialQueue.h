@@ -4,9 +4,11 @@
 #include "platform/linux/ThreadPool.h"
 
 #include <chrono>
+#include <condition_variable>
 #include <cstddef>
 #include <mutex>
 #include <string>
+#include <string_view>
 #include <vector>
 
 namespace tamblo {

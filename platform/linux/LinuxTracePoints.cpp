@@ -3,6 +3,7 @@
 #include <array>
 #include <cstring>
 #include <ctime>
+#include <string_view>
 
 #include <fcntl.h>
 

@@ -6,7 +6,6 @@
 #include <atomic>
 #include <cstdint>
 #include <span>
-#include <string_view>
 
 namespace tamblo {
 

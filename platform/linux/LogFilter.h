@@ -2,7 +2,6 @@
 
 #include "platform/StructuredLog.h"
 
-#include <cstdint>
 #include <string>
 #include <string_view>
 #include <vector>
