@@ -57,7 +57,8 @@ void SessionRegistry::put(Holders& holders, Entry entry) {
 
 bool SessionRegistry::takeOut(Holders& holders, std::uint64_t clientOrder) {
     if (holders.first.clientOrder != clientOrder) {
-        std::erase_if(holders.others, [=](const Entry& other) { return other.clientOrder == clientOrder; });
+        std::erase_if(holders.others,
+                      [clientOrder](const Entry& other) { return other.clientOrder == clientOrder; });
         return false;
     }
     if (holders.others.empty()) {

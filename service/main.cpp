@@ -4,6 +4,9 @@
 
 #include <cstdio>
 #include <cstdlib>
+#include <memory>
+#include <string>
+#include <utility>
 #include <variant>
 
 /// Installs the platform, makes the service the delegate of the process's listener, and runs until a signal
@@ -16,15 +19,15 @@ int main() {
         std::fprintf(stderr, "tamblod: %s\n", problem->c_str());
         return EXIT_FAILURE;
     }
-    LinuxPlatform& linux_ = *std::get<std::unique_ptr<LinuxPlatform>>(opened);
-    installPlatform(linux_.services());
+    LinuxPlatform& linuxPlatform = *std::get<std::unique_ptr<LinuxPlatform>>(opened);
+    installPlatform(linuxPlatform.services());
 
     ZRReportingService service;
     ConnectionListener& listener =
         platform().connections.listenerForServiceName("com.vandra.tamblo.reporting");
     listener.setDelegate(service);
     listener.resume();
-    linux_.run(ZRReportingUtilityGetReportingServerQueue(),
-               [&service](auto completion) { service.shutDown(std::move(completion)); });
+    linuxPlatform.run(ZRReportingUtilityGetReportingServerQueue(),
+                      [&service](auto completion) { service.shutDown(std::move(completion)); });
     return EXIT_SUCCESS;
 }

@@ -5,7 +5,6 @@
 #include "tools/Payload.h"
 
 #include <algorithm>
-#include <cmath>
 
 namespace tamblo::tools {
 
@@ -55,13 +54,13 @@ std::variant<SessionLine, std::string> parseSessionLine(std::string_view text) {
 
 double SessionSpacing::due(const SessionLine& line) {
     const Value* const timestamp = line.payload.find(kTimestampKey);
-    if (timestamp != nullptr && !firstTimestamp_) {
-        firstTimestamp_ = timestamp->doubleValue() - line.offset.value_or(last_);
+    if (timestamp != nullptr && !timestampOfStart_) {
+        timestampOfStart_ = timestamp->doubleValue() - line.offset.value_or(last_);
     }
     if (line.offset) {
         last_ = *line.offset;
     } else if (timestamp != nullptr) {
-        last_ = std::max(last_, timestamp->doubleValue() - *firstTimestamp_);
+        last_ = std::max(last_, timestamp->doubleValue() - *timestampOfStart_);
     }
     return last_;
 }

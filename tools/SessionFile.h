@@ -36,7 +36,7 @@ public:
     [[nodiscard]] double due(const SessionLine& line);
 
 private:
-    std::optional<double> firstTimestamp_;
+    std::optional<double> timestampOfStart_; ///< what offset 0 is
     double last_ = 0;
 };
 

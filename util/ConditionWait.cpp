@@ -21,8 +21,7 @@ bool ZRReportingUtilityWait(ConditionLock& lock, std::chrono::duration<double> t
     std::unique_lock held(lock.mutex);
     while (!flag) {
         log::info(category, "{}", waitingMessage);
-        if (lock.condition.wait_until(held, std::chrono::steady_clock::now() + wait) ==
-            std::cv_status::timeout) {
+        if (lock.condition.wait_for(held, wait) == std::cv_status::timeout) {
             log::error(category, "{}", timeoutMessage);
             return false;
         }

@@ -15,6 +15,7 @@
 
 #include <csignal>
 #include <cstdlib>
+#include <optional>
 #include <utility>
 
 #include <sys/epoll.h>
@@ -117,7 +118,8 @@ std::variant<std::unique_ptr<LinuxPlatform>, std::string> LinuxPlatform::open() 
     return platform;
 }
 
-LinuxPlatform::LinuxPlatform(Directories directories) : services_(std::make_unique<Services>(directories)) {}
+LinuxPlatform::LinuxPlatform(const Directories& directories)
+    : services_(std::make_unique<Services>(directories)) {}
 
 LinuxPlatform::~LinuxPlatform() = default;
 

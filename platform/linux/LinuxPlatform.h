@@ -5,7 +5,6 @@
 
 #include <functional>
 #include <memory>
-#include <optional>
 #include <string>
 #include <variant>
 
@@ -36,7 +35,7 @@ private:
     class PreferenceChanges;
     struct Services;
 
-    LinuxPlatform(Directories directories);
+    explicit LinuxPlatform(const Directories& directories);
 
     void flushSinks();
 
