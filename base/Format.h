@@ -18,7 +18,9 @@ struct FixedPoint {
     double value;
     int digits;
 };
-[[nodiscard]] inline FixedPoint fixed(double value, int digits) { return {value, digits}; }
+[[nodiscard]] inline FixedPoint fixed(double value, int digits) {
+    return {value, digits};
+}
 
 void appendText(std::string& out, std::string_view text);
 void appendText(std::string& out, std::int64_t number);
@@ -75,9 +77,7 @@ template <typename... Arguments> struct FormatString {
 
 template <typename... Arguments>
 void appendFormatted(std::string& out, std::string_view format, const Arguments&... arguments) {
-    ((format_detail::appendUpToPlaceholder(out, format),
-      format_detail::appendArgument(out, arguments)),
-     ...);
+    ((format_detail::appendUpToPlaceholder(out, format), format_detail::appendArgument(out, arguments)), ...);
     out += format;
 }
 

@@ -11,9 +11,9 @@
 
 namespace tamblo {
 
-/// Appends a value as JSON (RFC 8259), without white space, keys in their order. Doubles print the shortest text
-/// that reads back the same, with `.0` when integral; single-precision floats likewise in single precision. Dates
-/// become RFC 3339 texts, byte strings Base64 texts, numbers that are not finite `null`.
+/// Appends a value as JSON (RFC 8259), without white space, keys in their order. Doubles print the shortest
+/// text that reads back the same, with `.0` when integral; single-precision floats likewise in single
+/// precision. Dates become RFC 3339 texts, byte strings Base64 texts, numbers that are not finite `null`.
 void appendJson(TextBuffer& out, const Value& value);
 void appendJson(TextBuffer& out, const Dictionary& dictionary);
 /// Appends a text in quotes, escaped.
@@ -32,14 +32,14 @@ struct JsonError {
 };
 
 struct JsonReadOptions {
-    /// A `null` has no place among property-list values: members and elements that are null are left out, or, when
-    /// refused, make the text an error.
+    /// A `null` has no place among property-list values: members and elements that are null are left out, or,
+    /// when refused, make the text an error.
     bool refuseNull = false;
 };
 
 /// Reads one JSON value, with nothing but white space around it. Integers within 64 bits stay integers (the
-/// unsigned range included), other numbers are doubles. An object that names a key twice, nesting deeper than 32
-/// and text that is not UTF-8 are errors. A bare `null` is an error.
+/// unsigned range included), other numbers are doubles. An object that names a key twice, nesting deeper than
+/// 32 and text that is not UTF-8 are errors. A bare `null` is an error.
 [[nodiscard]] std::variant<Value, JsonError> readJson(std::string_view text, JsonReadOptions options = {});
 
 } // namespace tamblo

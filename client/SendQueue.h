@@ -47,7 +47,9 @@ public:
 
     /// Any thread: a slot to write to, or null when the queue is full. It has to be published, come what may.
     [[nodiscard]] Slot* claim() noexcept;
-    void publish(Slot& slot, std::memory_order order) noexcept { slot.sequence.store(slot.position + 1, order); }
+    void publish(Slot& slot, std::memory_order order) noexcept {
+        slot.sequence.store(slot.position + 1, order);
+    }
 
     /// The consumer: the slot at this distance from the front, or null when it is not published yet.
     [[nodiscard]] Slot* peek(std::size_t offset) noexcept;

@@ -1,6 +1,6 @@
-// Any bytes as the stream of one client, against the whole service on an in-memory device: nothing may crash, what
-// is refused is refused once, what is answered is a well-formed reply, and what asks for a reply gets one unless its
-// method may hold it back.
+// Any bytes as the stream of one client, against the whole service on an in-memory device: nothing may crash,
+// what is refused is refused once, what is answered is a well-formed reply, and what asks for a reply gets
+// one unless its method may hold it back.
 
 #include "platform/linux/RequestDispatch.h"
 #include "service/ZRReportingService.h"

@@ -31,8 +31,8 @@ void ZRReportingSession::makeWorker(const WorkerClass& workerClass) {
     log::debug(ZRReportingSessionCategory(),
                "Initializing ZRReportingSessionWorker. action=init worker={} reporterID={}", workerClass,
                reporterID_);
-    std::shared_ptr<ZRReportingSessionWorkerProtocol> instance = workerClass.initWithSession(
-        shared_from_this());
+    std::shared_ptr<ZRReportingSessionWorkerProtocol> instance =
+        workerClass.initWithSession(shared_from_this());
     if (instance == nullptr) {
         // Not remembered, so that the next start tries again.
         log::debug(ZRReportingSessionCategory(),

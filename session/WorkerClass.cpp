@@ -39,6 +39,8 @@ const WorkerClassLists& workerClassLists() {
     return lists;
 }
 
-void appendText(std::string& out, const WorkerClass& workerClass) { out += workerClass.name; }
+void appendText(std::string& out, const WorkerClass& workerClass) {
+    out += workerClass.name;
+}
 
 } // namespace tamblo

@@ -27,6 +27,8 @@ bool ZRReportingUtilityIsInternalBuild() {
     return answer == Answer::yes;
 }
 
-void forgetInternalBuild() noexcept { cachedAnswer.store(Answer::notAsked, std::memory_order_relaxed); }
+void forgetInternalBuild() noexcept {
+    cachedAnswer.store(Answer::notAsked, std::memory_order_relaxed);
+}
 
 } // namespace tamblo

@@ -5,7 +5,9 @@
 
 namespace tamblo {
 
-void appendText(std::string& out, const Dictionary& dictionary) { out += jsonText(dictionary); }
+void appendText(std::string& out, const Dictionary& dictionary) {
+    out += jsonText(dictionary);
+}
 
 void appendText(std::string& out, const Value& value) {
     if (value.isString()) {

@@ -21,6 +21,8 @@ struct NumberList {
 };
 void appendText(std::string& out, const NumberList& list);
 
-[[nodiscard]] constexpr std::string_view yesOrNo(bool value) noexcept { return value ? "YES" : "NO"; }
+[[nodiscard]] constexpr std::string_view yesOrNo(bool value) noexcept {
+    return value ? "YES" : "NO";
+}
 
 } // namespace tamblo

@@ -17,7 +17,9 @@ namespace tamblo {
 /// is stored as "processuptime_ms" is consumed processor time, whatever the name says.
 [[nodiscard]] Dictionary ZRReportingUtilityAddDates(const Dictionary& message);
 
-[[nodiscard]] constexpr bool ZRReportingUtilityShouldSendMessage() noexcept { return true; }
+[[nodiscard]] constexpr bool ZRReportingUtilityShouldSendMessage() noexcept {
+    return true;
+}
 /// A session is identified by its reporter's ID.
 [[nodiscard]] constexpr std::int64_t
 ZRReportingUtilityExtractSessionIDFromReporterID(ReporterID reporterID) noexcept {

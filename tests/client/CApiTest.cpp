@@ -1,5 +1,5 @@
-#include "tests/client/FakeService.h"
 #include "tests/client/CProgram.h"
+#include "tests/client/FakeService.h"
 
 #include <cstdint>
 #include <limits>
