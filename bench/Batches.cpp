@@ -9,20 +9,16 @@ Batches::Batches(FrameChannel& channel) : channel_(channel) {
 }
 
 void Batches::send(std::size_t count, std::int64_t reporterID) {
-    send(channel_, count, reporterID);
-}
-
-void Batches::send(FrameChannel& channel, std::size_t count, std::int64_t reporterID) {
     while (count > 0) {
-        for (; count > 0 && channel.outstanding() < kInFlight; --count) {
+        for (; count > 0 && channel_.outstanding() < kInFlight; --count) {
             wire::Request& request = requests_[next_++ % requests_.size()];
             request.reporterIDs[0] = reporterID;
-            channel.queue(request);
+            channel_.queue(request);
         }
-        channel.flush();
-        channel.receive();
+        channel_.flush();
+        channel_.receive();
     }
-    channel.finish();
+    channel_.finish();
 }
 
 } // namespace tamblo::bench

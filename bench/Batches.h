@@ -14,8 +14,6 @@ class Batches {
 public:
     explicit Batches(FrameChannel& channel);
     void send(std::size_t count, std::int64_t reporterID);
-    /// Over another channel than its own.
-    void send(FrameChannel& channel, std::size_t count, std::int64_t reporterID);
 
 private:
     static constexpr std::size_t kInFlight = 64;

@@ -9,7 +9,6 @@
 
 #include <cerrno>
 #include <chrono>
-#include <optional>
 #include <system_error>
 
 #include <sys/socket.h>

@@ -44,6 +44,7 @@ public:
     virtual void resume() = 0;
 };
 
+/// Where clients come from. Used by the entry point, before anything else runs.
 class ConnectionService {
 public:
     virtual ~ConnectionService() = default;

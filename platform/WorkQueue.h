@@ -40,6 +40,7 @@ public:
     virtual void invalidate() = 0;
 };
 
+/// Makes queues and timers, which their users own and let go before the process ends. Any thread.
 class WorkQueues {
 public:
     virtual ~WorkQueues() = default;
