@@ -1,6 +1,8 @@
 #pragma once
 
 #include <cstdint>
+#include <source_location>
+#include <string>
 #include <string_view>
 
 namespace tamblo {
@@ -15,6 +17,12 @@ public:
     [[nodiscard]] virtual LogLevel threshold(std::string_view categoryCode) const noexcept = 0;
     /// One line, without its line end; control characters in it are the implementation's to make harmless.
     virtual void write(LogLevel level, std::string_view categoryCode, std::string_view line) noexcept = 0;
+    /// A line of a platform service's own: gives the text its prefix, and writes it when its level is on.
+    void report(LogLevel level, std::string_view categoryCode, std::string_view text,
+                const std::source_location& place = std::source_location::current());
 };
+
+/// What every line begins with, "%25s:%-5d " of the source unit's name and the line number.
+void appendLinePrefix(std::string& line, const std::source_location& place);
 
 } // namespace tamblo

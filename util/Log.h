@@ -1,10 +1,10 @@
 #pragma once
 
 #include "base/Format.h"
+#include "platform/StructuredLog.h"
 #include "util/LogCategories.h"
 #include "util/LogText.h"
 
-#include <source_location>
 #include <string>
 #include <string_view>
 #include <type_traits>
@@ -15,7 +15,6 @@ namespace tamblo::log {
 
 namespace detail {
 
-void appendPrefix(std::string& line, const std::source_location& place);
 void write(const LogCategory& category, LogLevel level, std::string_view line) noexcept;
 
 template <typename... Arguments>
@@ -23,7 +22,7 @@ template <typename... Arguments>
                                             const FormatString<std::type_identity_t<Arguments>...>& format,
                                             const Arguments&... arguments) {
     std::string line;
-    appendPrefix(line, format.location);
+    appendLinePrefix(line, format.location);
     appendFormatted(line, format.format, arguments...);
     write(category, level, line);
 }

@@ -72,7 +72,7 @@ void AppendOnlyFile::writeOut() {
         }
     } else {
         if (!std::exchange(isOut_, true)) {
-            log_.write(
+            log_.report(
                 LogLevel::error, categoryCode_,
                 formatted("{}: {}; its records are lost until it can be written again", path_, fault_));
         }
@@ -86,8 +86,8 @@ void AppendOnlyFile::writeOut() {
 
 void AppendOnlyFile::endOutage(std::string_view ending) {
     isOut_ = false;
-    log_.write(LogLevel::error, categoryCode_,
-               formatted("{}: {}; {} records were lost", path_, ending, std::exchange(lostLines_, 0)));
+    log_.report(LogLevel::error, categoryCode_,
+                formatted("{}: {}; {} records were lost", path_, ending, std::exchange(lostLines_, 0)));
 }
 
 /// Takes the lines that have been written off the front.

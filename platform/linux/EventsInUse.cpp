@@ -117,9 +117,9 @@ void EventsInUse::readPatterns(std::uint64_t generation) {
         std::sort(names_.begin(), names_.end());
     }
     if (isMalformed) {
-        log_.write(LogLevel::error, "zrrs",
-                   allInUse_ ? "preference events_in_use is no array; all analytics events are in use"
-                             : "preference events_in_use holds what is no name; that is ignored");
+        log_.report(LogLevel::error, "zrrs",
+                    allInUse_ ? "preference events_in_use is no array; all analytics events are in use"
+                              : "preference events_in_use holds what is no name; that is ignored");
     }
 }
 

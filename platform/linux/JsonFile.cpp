@@ -92,7 +92,7 @@ void JsonFile::report(StructuredLog& log, std::string state, std::string_view fa
         return;
     }
     reported_ = std::move(state);
-    log.write(LogLevel::error, "zrrs", formatted("{}: {}; nothing of it is used", path_, fault));
+    log.report(LogLevel::error, "zrrs", formatted("{}: {}; nothing of it is used", path_, fault));
 }
 
 } // namespace tamblo

@@ -140,7 +140,7 @@ void LinuxConnectionService::ready(std::uint32_t) {
         FileDescriptor socket(::accept4(socket_.get(), nullptr, nullptr, SOCK_CLOEXEC | SOCK_NONBLOCK));
         if (socket.isOpen()) {
             if (std::exchange(isPaused_, false)) {
-                log_.write(LogLevel::error, kLogCategory, "accepting connections again");
+                log_.report(LogLevel::error, kLogCategory, "accepting connections again");
             }
             accept(std::move(socket));
             continue;
@@ -156,7 +156,7 @@ void LinuxConnectionService::ready(std::uint32_t) {
 
 void LinuxConnectionService::pauseAccepting(int error) {
     if (!std::exchange(isPaused_, true)) {
-        log_.write(LogLevel::error, kLogCategory, because("accepting connections rests", error));
+        log_.report(LogLevel::error, kLogCategory, because("accepting connections rests", error));
     }
     loop_.remove(socket_.get());
     loop_.callAfter(kAcceptPause, [this] {

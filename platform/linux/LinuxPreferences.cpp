@@ -28,9 +28,9 @@ void LinuxPreferences::reportUnwatched() {
     const int error = watcher_.error();
     isWatched_.store(error == 0, std::memory_order_relaxed);
     if (error != std::exchange(reportedError_, error) && error != 0) {
-        log_.write(LogLevel::error, "zrrs",
-                   formatted("{}: {}; changes of the preferences there are not noticed", watcher_.directory(),
-                             std::generic_category().message(error)));
+        log_.report(LogLevel::error, "zrrs",
+                    formatted("{}: {}; changes of the preferences there are not noticed",
+                              watcher_.directory(), std::generic_category().message(error)));
     }
 }
 

@@ -10,6 +10,7 @@
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
+#include <source_location>
 
 #include <fcntl.h>
 #include <poll.h>
@@ -20,6 +21,7 @@ namespace tamblo {
 
 namespace {
 
+constexpr std::string_view kOwnCategory = "zrrs";
 constexpr std::string_view kCut = "…";
 constexpr std::string_view kHexDigits = "0123456789abcdef";
 
@@ -139,11 +141,11 @@ LinuxStructuredLog::LinuxStructuredLog(int descriptor, std::string_view filter)
     std::signal(SIGPIPE, SIG_IGN);
     prepareChannel(descriptor);
     for (const std::string& word : filter_.unknownWords()) {
-        write(LogLevel::error, "zrrs",
-              formatted("TAMBLO_LOG: \"{}\" is neither a level (debug, info, default, error, fault) nor "
-                        "CODE=level; it "
-                        "is ignored",
-                        word));
+        report(LogLevel::error, kOwnCategory,
+               formatted("TAMBLO_LOG: \"{}\" is neither a level (debug, info, default, error, fault) nor "
+                         "CODE=level; it "
+                         "is ignored",
+                         word));
     }
 }
 
@@ -194,12 +196,14 @@ void LinuxStructuredLog::write(LogLevel level, std::string_view categoryCode,
 
 bool LinuxStructuredLog::reportDropped() noexcept {
     const std::uint64_t dropped = dropped_.exchange(0, std::memory_order_relaxed);
-    if (dropped == 0) {
+    if (dropped == 0 || filter_.threshold(kOwnCategory) > LogLevel::error) {
         return true;
     }
-    std::array<char, 80> text;
-    const int length = std::snprintf(text.data(), text.size(), "<3>zrrs %llu log lines were dropped here\n",
-                                     static_cast<unsigned long long>(dropped));
+    std::array<char, 128> text;
+    const int length =
+        std::snprintf(text.data(), text.size(), "<3>zrrs %25s:%-5u %llu log lines were dropped here\n",
+                      "LinuxStructuredLog", static_cast<unsigned>(std::source_location::current().line()),
+                      static_cast<unsigned long long>(dropped));
     if (put({text.data(), static_cast<std::size_t>(length)})) {
         return true;
     }

@@ -2,6 +2,10 @@
 
 #include "platform/StructuredLog.h"
 
+#include <gtest/gtest.h>
+
+#include <algorithm>
+#include <cstddef>
 #include <filesystem>
 #include <fstream>
 #include <mutex>
@@ -45,14 +49,15 @@ private:
     std::string path_;
 };
 
-/// Keeps what is logged, as `LEVEL CODE TEXT` with the level as a digit.
+/// Keeps what is logged, as `LEVEL CODE TEXT` with the level as a digit, without the prefix of 32 bytes.
 class RecordingLog final : public StructuredLog {
 public:
     [[nodiscard]] LogLevel threshold(std::string_view) const noexcept override { return LogLevel::debug; }
     void write(LogLevel level, std::string_view code, std::string_view line) noexcept override {
         const std::lock_guard lock(mutex_);
+        EXPECT_EQ(line.find(':'), 25U) << line;
         lines_.push_back(std::to_string(static_cast<int>(level)) + " " + std::string(code) + " " +
-                         std::string(line));
+                         std::string(line.substr(std::min<std::size_t>(line.size(), 32))));
     }
     /// The lines since the last call.
     [[nodiscard]] std::vector<std::string> take() {
