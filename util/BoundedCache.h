@@ -1,6 +1,7 @@
 #pragma once
 
 #include <array>
+#include <bit>
 #include <cstddef>
 #include <cstdint>
 
@@ -12,7 +13,8 @@ template <typename Built, std::size_t Sets = 64> class BoundedCache {
 public:
     /// What is remembered for the key, else what `build` returns. The reference holds until the next call.
     template <typename Build> const Built& get(std::uint64_t key, Build&& build) {
-        Set& set = sets_[(key * 0x9E3779B97F4A7C15ULL) >> 32U & (Sets - 1)];
+        // Only the highest bits of the product depend on every bit of the key.
+        Set& set = sets_[(key * 0x9E3779B97F4A7C15ULL) >> (64U - kSetBits)];
         for (std::size_t way = 0; way < kWays; ++way) {
             if (set.keys[way] == key) {
                 return set.built[way];
@@ -26,7 +28,8 @@ public:
 
 private:
     static constexpr std::size_t kWays = 4;
-    static_assert((Sets & (Sets - 1)) == 0, "the set is chosen by the low bits");
+    static constexpr std::size_t kSetBits = std::countr_zero(Sets);
+    static_assert(Sets > 1 && std::has_single_bit(Sets), "the set is chosen by some bits of a product");
 
     struct Set {
         std::array<std::uint64_t, kWays> keys{};

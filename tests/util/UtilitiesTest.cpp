@@ -1,4 +1,5 @@
 #include "tests/fakes/FakePlatform.h"
+#include "util/BoundedCache.h"
 #include "util/ConditionWait.h"
 #include "util/DataSerialize.h"
 #include "util/LogCategories.h"
@@ -62,19 +63,32 @@ TEST(ReportingUtilitiesTest, ChangesAndRounding) {
 TEST(ReportingUtilitiesTest, AddDates) {
     FakePlatform device;
     device.processInformation.uptime = std::chrono::duration<double>(1234.5);
-    device.processInformation.consumed = std::chrono::microseconds(2'500'400);
+    device.processInformation.consumed = std::chrono::microseconds(123'456'789'012);
     const Dictionary sent{{"a", 1}, {"systemuptime_sec", "old"}};
     const Dictionary expected{{"a", 1},
                               {"zrreporting_timestamp", device.clock.seconds()},
                               {"systemuptime_sec", 1235},
-                              {"processuptime_ms", 2500}};
+                              {"processuptime_ms", 123'456'792}}; // in single precision
     EXPECT_EQ(ZRReportingUtilityAddDates(sent), expected);
     EXPECT_EQ(sent.size(), 2U);
     device.processInformation.uptime = std::chrono::duration<double>(1e12);
     EXPECT_EQ(ZRReportingUtilityAddDates({}).find("systemuptime_sec")->integerValue(), 2147483647);
 }
 
-TEST(ReportingServerQueueTest, IsOneAndSerial) {
+TEST(BoundedCacheTest, KeysThatDifferInAnyBitsAreRememberedTogether) {
+    for (unsigned shift = 0; shift <= 56; shift += 4) {
+        BoundedCache<std::uint64_t> cache;
+        int built = 0;
+        for (int round = 0; round < 2; ++round) {
+            for (std::uint64_t key = 1; key <= 16; ++key) {
+                EXPECT_EQ(cache.get(key << shift, [&] { return ++built, key; }), key);
+            }
+        }
+        EXPECT_EQ(built, 16) << "shifted by " << shift;
+    }
+}
+
+TEST(ReportingServerQueueTest, IsOneForTheProcess) {
     FakePlatform device;
     SerialQueue& queue = ZRReportingUtilityGetReportingServerQueue();
     EXPECT_EQ(&queue, &ZRReportingUtilityGetReportingServerQueue());
@@ -88,21 +102,30 @@ TEST(ConditionWaitTest, SignalledAndTimedOut) {
     bool flag = false;
     EXPECT_FALSE(ZRReportingUtilityWait(lock, std::chrono::seconds(0), flag, "waiting", "timeout", category));
     EXPECT_THAT(device.log.texts(), testing::ElementsAre("waiting", "timeout"));
+    EXPECT_EQ(device.log.lines().front().level, LogLevel::info);
     EXPECT_EQ(device.log.lines().back().level, LogLevel::error);
+    EXPECT_EQ(device.log.lines().back().category, "zrri");
     device.log.clear();
 
     std::thread signaller([&] {
-        while (device.log.count("waiting") == 0) {
-            std::this_thread::yield();
-        }
+        const auto awaitWait = [&](std::size_t number) {
+            while (device.log.count("waiting") < number) {
+                std::this_thread::yield();
+            }
+            const std::lock_guard held(lock.mutex); // free once the waiter sleeps
+        };
+        awaitWait(1);
+        lock.condition.notify_one();
+        awaitWait(2);
         ZRReportingUtilitySignal(lock, flag);
     });
     EXPECT_TRUE(
         ZRReportingUtilityWait(lock, std::chrono::hours(1'000'000), flag, "waiting", "timeout", category));
     signaller.join();
-    EXPECT_THAT(device.log.texts(), testing::ElementsAre("waiting", "continuing"));
+    EXPECT_THAT(device.log.texts(), testing::ElementsAre("waiting", "continuing", "waiting", "continuing"))
+        << "woken by something else first";
     EXPECT_TRUE(ZRReportingUtilityWait(lock, std::chrono::seconds(0), flag, "waiting", "timeout", category));
-    EXPECT_EQ(device.log.lines().size(), 2U) << "nothing is written when the flag is set already";
+    EXPECT_EQ(device.log.lines().size(), 4U) << "nothing is written when the flag is set already";
 }
 
 TEST(DataSerializeTest, EveryKindOfValue) {
@@ -134,8 +157,14 @@ TEST(DataSerializeTest, EveryKindOfValue) {
     EXPECT_EQ(DataSerialize::getDataXMLInfo(list), expected);
     EXPECT_EQ(DataSerialize::getXMLInfo(list), std::nullopt) << "not ASCII";
     EXPECT_EQ(DataSerialize::getXMLInfo("x"), DataSerialize::getDataXMLInfo("x"));
-    EXPECT_EQ(DataSerialize::getBase64XMLBlob(list)->substr(0, 12), "PD94bWwgdmVy");
-    EXPECT_EQ(DataSerialize::getPlistBlob(list)->size(), expected.size());
+    EXPECT_THAT(*DataSerialize::getPlistBlob(list), testing::ElementsAreArray(expected));
+    EXPECT_EQ(
+        DataSerialize::getBase64XMLBlob(true),
+        "PD94bWwgdmVyc2lvbj0iMS4wIiBlbmNvZGluZz0iVVRGLTgiPz4KPCFET0NUWVBFIHBsaXN0Pgo8cGxpc3QgdmVyc2lvbj0i"
+        "MS4wIj4KPHRydWUvPgo8L3BsaXN0Pgo=");
+    const Array unwritable{Dictionary{{"a", "\x01"}}};
+    EXPECT_EQ(DataSerialize::getPlistBlob(unwritable), std::nullopt);
+    EXPECT_EQ(DataSerialize::getBase64XMLBlob(unwritable), std::nullopt);
 }
 
 } // namespace

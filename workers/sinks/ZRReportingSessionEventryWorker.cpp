@@ -30,7 +30,7 @@ EventNames makeEventNames(AudioServiceType serviceType, AudioEventCategory categ
 const EventNames& eventNames(AudioServiceType serviceType, AudioEventCategory category, AudioEventType type) {
     // One for each thread that does session work: the names of a device's events are few.
     static thread_local BoundedCache<EventNames> names;
-    // Service types without a name are one; the key is then 53 bits, and never 0.
+    // Service types without a name are one; the key is then 54 bits, and never 0.
     constexpr std::uint64_t kNoName = 31;
     const std::uint64_t service = serviceType <= AudioServiceTypeSystemSounds ? serviceType : kNoName;
     const std::uint64_t key = ((service + 1) << 48U) | (std::uint64_t{category} << 16U) | type;
