@@ -3,6 +3,7 @@
 #include "client/Vocabulary.h"
 #include "tests/base/AllocationCount.h"
 #include "tests/client/FakeService.h"
+#include "util/AudioEvents.h"
 
 #include <atomic>
 #include <chrono>
@@ -356,14 +357,24 @@ TEST(Vocabulary, NamesAndNumbersAreRead) {
         EXPECT_EQ(parsed ? std::optional(static_cast<std::uint32_t>(*parsed)) : std::nullopt, row.category)
             << row.text;
     }
-    EXPECT_EQ(parseType("Listeningenhancement"), EventType::listeningEnhancement);
+    for (const std::uint32_t subsystem : {0x0U, 1U << 26, 1U << 27, 1U << 28, 1U << 29, 1U << 30, 1U << 31}) {
+        for (std::uint32_t value = subsystem + 1; value <= subsystem + 17; ++value) {
+            EXPECT_EQ(parseCategory(ZRReportingUtilityCategoryString(value)), EventCategory{value});
+        }
+    }
+    for (std::uint16_t number = 0; number <= 19; ++number) {
+        EXPECT_EQ(parseType(ZRReportingUtilityTypeString(number)), EventType{number});
+        const std::string_view service = ZRReportingUtilityGenerateServiceNameFromServiceType(number);
+        EXPECT_EQ(serviceTypeName(ServiceType{number}), service);
+        EXPECT_EQ(parseServiceType(service), number <= 13 ? ServiceType{number} : ServiceType::unknown);
+    }
+    EXPECT_EQ(category(Subsystem::toolbox, EventKind::wirrels), EventCategory{0x80000011});
+    EXPECT_EQ(parseType("MemoryLog"), EventType::memoryLog);
+    EXPECT_EQ(parseType("Unknown"), EventType::unknown);
     EXPECT_EQ(parseType("65535"), EventType::unknown);
     EXPECT_FALSE(parseType("65536"));
-    EXPECT_EQ(parseServiceType("longformaudio"), ServiceType::longFormAudio);
-    EXPECT_EQ(parseServiceType("unknown"), ServiceType::unknown);
+    EXPECT_EQ(parseServiceType("systemsounds"), ServiceType::systemSounds);
     EXPECT_FALSE(parseServiceType("LongFormAudio"));
-    EXPECT_EQ(serviceTypeName(static_cast<ServiceType>(13)), "systemsounds");
-    EXPECT_EQ(serviceTypeName(static_cast<ServiceType>(14)), "unknown");
 }
 
 } // namespace

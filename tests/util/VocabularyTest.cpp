@@ -100,6 +100,18 @@ void appendText(std::string& out, const Costly& costly) {
     out += "costly";
 }
 
+TEST(LogTest, TheTwelveCategories) {
+    std::string codes;
+    for (const auto accessor :
+         {ZRReportingClientCategory, ZRReportingServiceDelegateCategory, ZRReportingSessionCategory,
+          ZRReportingSessionLinkmeterCategory, ZRReportingDriverUtilityCategory, ZRReportingTraceCategory,
+          ZRReportingJouleryCategory, ZRReportingQMXLogCategory, ZRReportingZephLogCategory,
+          ZRReportingSummaryLogCategory, ZRReportingDPLogCategory, ZRReportingAudioRegistrationCategory}) {
+        codes += accessor().code();
+    }
+    EXPECT_EQ(codes, "zrrczrrszrrrzrrizrrdzrrtzrrpzrrazrrbzrruzrrlzrrz");
+}
+
 TEST(LogTest, LinesHaveAPrefixAndTextOnlyWhenOn) {
     FakePlatform device(LogLevel::info);
     int written = 0;
