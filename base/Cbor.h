@@ -132,6 +132,7 @@ private:
     bool readFloatingPoint(const Head& head, Value& value) noexcept;
     bool readSimple(const Head& head, Value& value) noexcept;
     bool readString(const Head& head, Value& value);
+    bool readRecentText(std::string_view text, Value& value);
     bool readKey(std::string_view& key);
     bool takeBytes(const Head& head, std::string_view& bytes) noexcept;
     bool assembleChunks(Type major, std::string& bytes);

@@ -346,6 +346,9 @@ bool CborReader::readString(const Head& head, Value& value) {
         if (!takeBytes(head, bytes)) {
             return false;
         }
+        if (head.major == Type::text && keySets_ != nullptr && RecentTexts::covers(bytes)) {
+            return readRecentText(bytes, value);
+        }
         if (head.major == Type::text && !isUtf8(bytes)) {
             return fail(CborError::notUtf8);
         }
@@ -355,6 +358,18 @@ bool CborReader::readString(const Head& head, Value& value) {
     } else {
         value = Value::data({reinterpret_cast<const std::uint8_t*>(bytes.data()), bytes.size()});
     }
+    return true;
+}
+
+bool CborReader::readRecentText(std::string_view text, Value& value) {
+    Value& recent = keySets_->recentTexts().place(text);
+    if (recent.stringValue() != text) {
+        if (!isUtf8(text)) {
+            return fail(CborError::notUtf8);
+        }
+        recent = Value(text);
+    }
+    value = recent;
     return true;
 }
 

@@ -1,12 +1,13 @@
 #pragma once
 
 #include "base/Dictionary.h"
+#include "base/RecentTexts.h"
 #include "base/Value.h"
 
 #include <array>
 #include <cstddef>
 #include <cstdint>
-#include <deque>
+#include <list>
 #include <memory>
 #include <span>
 #include <string>
@@ -19,7 +20,7 @@ namespace tamblo {
 struct MapEntries {
     std::vector<std::string_view> keys;
     std::vector<Value> values;
-    std::deque<std::string> assembledKeys; ///< the texts of keys that came in chunks
+    std::list<std::string> assembledKeys; ///< the texts of keys that came in chunks
 };
 
 /// Makes dictionaries of keys and values as they arrive, and remembers the key sets, by the order in which
@@ -46,6 +47,7 @@ public:
 
     /// Memory for whoever reads with this cache.
     [[nodiscard]] MapEntries& entries() noexcept { return entries_; }
+    [[nodiscard]] RecentTexts& recentTexts() noexcept { return recentTexts_; }
 
 private:
     struct Shape;
@@ -53,6 +55,7 @@ private:
 
     std::array<std::unique_ptr<Shape>, kSlots> slots_;
     MapEntries entries_;
+    RecentTexts recentTexts_;
 };
 
 } // namespace tamblo

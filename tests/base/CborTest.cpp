@@ -330,5 +330,29 @@ TEST(KeySetCache, ReadsRightWhenItIsFull) {
     }
 }
 
+TEST(RecentTexts, AreSharedAndNeverTakenForOthers) {
+    KeySetCache cache;
+    const auto read = [&cache](const Bytes& bytes) { return CborReader(bytes, &cache).readValue(); };
+    // Some take each other's places, some differ in the middle only, some are too short or too long.
+    for (int round = 0; round < 3; ++round) {
+        for (int i = 0; i < 2000; ++i) {
+            const std::string number = std::to_string(i);
+            for (const std::string& text : {"a text with " + number, "equal ends " + number + " equal ends",
+                                            std::string(i % 120, 'x')}) {
+                const Bytes bytes = written(Value(text));
+                ASSERT_EQ(read(bytes), Value(text));
+                std::optional<Value> again;
+                EXPECT_EQ(test::allocationsOf([&] { again = read(bytes); }).blocks,
+                          text.size() > 96 ? 1U : 0U);
+                ASSERT_EQ(again, Value(text));
+            }
+        }
+    }
+    Bytes broken = written(Value("a text that is not UTF-8"));
+    EXPECT_TRUE(read(broken));
+    broken[12] = 0xFF;
+    EXPECT_FALSE(read(broken));
+}
+
 } // namespace
 } // namespace tamblo
