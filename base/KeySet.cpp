@@ -113,9 +113,9 @@ std::size_t KeySet::find(std::string_view key) const noexcept {
         ++entry;
     }
     for (; entry != end && entry->prefix == prefix; ++entry) {
-        if (entry->length == key.size() &&
-            std::memcmp(text_.get() + entry->offset, key.data(), key.size()) == 0) {
-            return static_cast<std::size_t>(entry - entries_.get());
+        const auto index = static_cast<std::size_t>(entry - entries_.get());
+        if (is(index, key)) {
+            return index;
         }
     }
     return kNotFound;

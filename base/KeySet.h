@@ -3,6 +3,7 @@
 #include <atomic>
 #include <cstddef>
 #include <cstdint>
+#include <cstring>
 #include <memory>
 #include <span>
 #include <string_view>
@@ -49,6 +50,8 @@ public:
     /// The key as it stands in JSON, quotes and colon included: `"key":`.
     [[nodiscard]] std::string_view jsonKey(std::size_t index) const noexcept;
     [[nodiscard]] std::size_t find(std::string_view key) const noexcept;
+    /// Whether the key at an index is this one.
+    [[nodiscard]] bool is(std::size_t index, std::string_view key) const noexcept;
     /// The first index from `start` on whose key is not below the other set's key; the count when there is
     /// none.
     [[nodiscard]] std::size_t findFrom(std::size_t start, const KeySet& other,
@@ -117,6 +120,26 @@ inline KeySetRef::~KeySetRef() {
 }
 inline std::string_view KeySet::key(std::size_t index) const noexcept {
     return {text_.get() + entries_[index].offset, entries_[index].length};
+}
+inline bool KeySet::is(std::size_t index, std::string_view key) const noexcept {
+    const Entry& entry = entries_[index];
+    if (entry.length != key.size()) {
+        return false;
+    }
+    const char* const mine = text_.get() + entry.offset;
+    if (key.size() < 8 || key.size() > 24) {
+        return std::memcmp(mine, key.data(), key.size()) == 0;
+    }
+    // Most keys are of this length: three words, which may overlap, cover them without a call.
+    const auto differ = [mine, &key](std::size_t at) {
+        std::uint64_t word = 0;
+        std::uint64_t other = 0;
+        std::memcpy(&word, mine + at, sizeof word);
+        std::memcpy(&other, key.data() + at, sizeof other);
+        return word ^ other;
+    };
+    const std::size_t last = key.size() - 8;
+    return (differ(0) | differ(last / 2) | differ(last)) == 0;
 }
 inline std::string_view KeySet::jsonKey(std::size_t index) const noexcept {
     return {text_.get() + entries_[index].jsonOffset, entries_[index].jsonLength};

@@ -86,7 +86,7 @@ struct KeySetCache::Shape {
             return false;
         }
         for (std::size_t i = 0; i < arrived.size(); ++i) {
-            if (keys->key(places[i]) != arrived[i]) {
+            if (!keys->is(places[i], arrived[i])) {
                 return false;
             }
         }

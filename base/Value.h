@@ -179,6 +179,10 @@ inline Value& Value::operator=(Value&& other) noexcept {
 }
 
 inline Value& Value::operator=(const Value& other) noexcept {
+    // The same bytes are the same value and hold the same block, if any: what a client repeats costs nothing.
+    if (std::memcmp(bytes_, other.bytes_, sizeof bytes_) == 0) {
+        return *this;
+    }
     // By way of a copy: the other may lie in a block that only this one holds.
     return *this = Value(other);
 }
