@@ -70,7 +70,7 @@ struct Error {
     std::string message; ///< empty: absent
 };
 
-/// The longest socket path that fits a local socket's address.
+/// Where the service's socket lies.
 [[nodiscard]] std::string socketPath(std::string_view runtimeDirectory);
 
 } // namespace tamblo::wire

@@ -17,13 +17,13 @@ public:
     ParameterReader(CborReader& reader, CborReader::ArrayHead& array) noexcept
         : reader_(reader), array_(array) {}
 
-    [[nodiscard]] bool next() noexcept {
-        isShort_ = !reader_.moreElements(array_);
-        return !isShort_;
+    [[nodiscard]] bool next(std::string_view name) noexcept {
+        missing_ = reader_.moreElements(array_) ? std::string_view() : name;
+        return missing_.empty();
     }
 
     bool signedInteger(std::string_view name, std::int64_t& number) noexcept {
-        if (!next()) {
+        if (!next(name)) {
             return false;
         }
         const auto read = reader_.readInteger();
@@ -33,7 +33,7 @@ public:
 
     template <typename Unsigned>
     bool unsignedInteger(std::string_view name, std::string_view wanted, Unsigned& number) noexcept {
-        if (!next()) {
+        if (!next(name)) {
             return false;
         }
         const auto read = reader_.readUnsigned();
@@ -45,7 +45,7 @@ public:
     }
 
     bool dictionary(std::string_view name, std::string_view wanted, Dictionary& dictionary) {
-        if (!next()) {
+        if (!next(name)) {
             return false;
         }
         auto read = reader_.readDictionary(kKeysYetToCome);
@@ -57,7 +57,7 @@ public:
     }
 
     bool payload(Dictionary& dictionary) {
-        if (reader_.nextIsNull() && next()) {
+        if (reader_.nextIsNull() && next("payload")) {
             dictionary = Dictionary();
             return reader_.readNull();
         }
@@ -66,7 +66,7 @@ public:
 
     bool reporterIDs(std::vector<std::int64_t>& numbers) {
         numbers.clear();
-        if (!next()) {
+        if (!next("reporter IDs")) {
             return false;
         }
         if (reader_.readNull()) {
@@ -89,7 +89,7 @@ public:
 
     /// Whether all were read and none is left.
     [[nodiscard]] bool finish() noexcept {
-        if (isWrong() || isShort_) {
+        if (isWrong() || !missing_.empty()) {
             return false;
         }
         isLong_ = reader_.moreElements(array_);
@@ -105,7 +105,10 @@ public:
             }
             return text;
         }
-        return text.append(isLong_ ? ": too many parameters" : ": too few parameters");
+        if (isLong_) {
+            return text.append(": too many parameters");
+        }
+        return text.append(": too few parameters: ").append(missing_).append(" is missing");
     }
 
 private:
@@ -120,7 +123,7 @@ private:
     CborReader::ArrayHead& array_;
     std::string_view wrong_; ///< the parameter that was not read, and what it should have been
     std::string_view wanted_;
-    bool isShort_ = false;
+    std::string_view missing_; ///< the parameter at whose place the array ended
     bool isLong_ = false;
 };
 

@@ -1,5 +1,7 @@
 #include "platform/linux/EventsInUse.h"
 
+#include "base/Format.h"
+
 #include <algorithm>
 #include <cstring>
 #include <optional>
@@ -116,10 +118,14 @@ void EventsInUse::readPatterns(std::uint64_t generation) {
         }
         std::sort(names_.begin(), names_.end());
     }
-    if (isMalformed) {
+    // Told once, however often other preferences change.
+    if (!isMalformed) {
+        reported_.reset();
+    } else if (std::exchange(reported_, value) != value) {
         log_.report(LogLevel::error, "zrrs",
-                    allInUse_ ? "preference events_in_use is no array; all analytics events are in use"
-                              : "preference events_in_use holds what is no name; that is ignored");
+                    formatted("{}: {} {}", preferences_.path(kDomain), kKey,
+                              allInUse_ ? "is no array; all analytics events are in use"
+                                        : "holds what is no name; that is ignored"));
     }
 }
 

@@ -9,6 +9,7 @@
 #include <cstdint>
 #include <memory>
 #include <mutex>
+#include <optional>
 #include <string>
 #include <string_view>
 #include <vector>
@@ -51,6 +52,7 @@ private:
     bool allInUse_ = true;
     std::vector<std::string> names_; ///< sorted
     std::vector<std::string> prefixes_;
+    std::optional<Value> reported_; ///< the malformed value that the log knows of
 };
 
 } // namespace tamblo

@@ -58,11 +58,16 @@ std::string LinuxConnection::description() const {
 }
 
 void LinuxConnection::ready(std::uint32_t events) {
-    if ((events & EPOLLOUT) != 0) {
+    bool mayRead = false;
+    {
         const std::lock_guard lock(mutex_);
-        sendLocked();
+        if ((events & EPOLLOUT) != 0) {
+            sendLocked();
+        }
+        // Another source of this wake-up, a signal, may have ended the reading.
+        mayRead = wantsInput_;
     }
-    if ((events & ~static_cast<std::uint32_t>(EPOLLOUT)) != 0 && ending_ == Ending::none) {
+    if ((events & ~static_cast<std::uint32_t>(EPOLLOUT)) != 0 && mayRead) {
         read();
     }
 }
@@ -169,6 +174,9 @@ void LinuxConnection::replied() {
     if (!std::exchange(hasHeldReplies_, true)) {
         service_.hasReplies(shared_from_this());
     }
+    if (held_.size() > kMaximumWaitingReplies) {
+        giveUpLocked();
+    }
 }
 
 void LinuxConnection::workedOff(std::size_t requests, std::size_t bytes) {
@@ -216,13 +224,19 @@ void LinuxConnection::sendLocked() {
         giveBackIfLarge(outgoing_);
         sent_ = 0;
     } else if (outgoing_.size() - sent_ > kMaximumWaitingReplies) {
-        isUnwritable_ = true;
-        service_.loop_.post([self = shared_from_this()] { self->beginEnd(Ending::interrupted); });
+        giveUpLocked();
     } else if (sent_ > kKeptCapacity) {
         outgoing_.dropFront(sent_);
         sent_ = 0;
     }
     watchLocked();
+}
+
+/// Keeps nothing more for a client that does not read, and ends the connection.
+void LinuxConnection::giveUpLocked() {
+    isUnwritable_ = true;
+    held_.reset();
+    service_.loop_.post([self = shared_from_this()] { self->beginEnd(Ending::interrupted); });
 }
 
 void LinuxConnection::watchLocked() {
@@ -259,10 +273,11 @@ void LinuxConnection::beginEnd(Ending ending) {
     }
     ending_ = ending;
     stopReading();
-    // What was read before is carried out, and answered, first.
+    // What was read before is carried out, and answered, first. Replies go at the end of a batch, so the end
+    // of the connection waits for the batch after the one that carries out the last request.
     auto endLater = [self = shared_from_this()] { self->service_.loop_.post([self] { self->end(); }); };
     if (service_.requests_ != nullptr) {
-        service_.requests_->post(std::move(endLater));
+        service_.requests_->post([&requests = *service_.requests_, endLater] { requests.post(endLater); });
     } else {
         endLater();
     }

@@ -70,6 +70,7 @@ private:
     // With the lock held.
     void replied();
     void sendLocked();
+    void giveUpLocked();
     void watchLocked();
 
     LinuxConnectionService& service_;

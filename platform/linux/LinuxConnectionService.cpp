@@ -46,6 +46,12 @@ bool environmentSays(const char* name, long wanted) {
     return result.ec == std::errc{} && result.ptr == end && number == wanted;
 }
 
+bool activatedSocketHas(int option, int wanted) {
+    int value = 0;
+    socklen_t length = sizeof value;
+    return ::getsockopt(kActivatedSocket, SOL_SOCKET, option, &value, &length) == 0 && value == wanted;
+}
+
 /// Whether somebody answers on the socket at this address.
 bool isAnswered(const sockaddr_un& address) {
     const FileDescriptor probe(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0));
@@ -63,22 +69,23 @@ LinuxConnectionService::~LinuxConnectionService() {
 }
 
 std::optional<std::string> LinuxConnectionService::open(const std::string& runtimeDirectory) {
-    if (adoptActivatedSocket()) {
-        return std::nullopt;
-    }
-    return bindSocket(wire::socketPath(runtimeDirectory));
+    const bool isActivated = environmentSays("LISTEN_PID", ::getpid()) && environmentSays("LISTEN_FDS", 1);
+    return isActivated ? adoptActivatedSocket() : bindSocket(wire::socketPath(runtimeDirectory));
 }
 
-bool LinuxConnectionService::adoptActivatedSocket() {
-    if (!environmentSays("LISTEN_PID", ::getpid()) || !environmentSays("LISTEN_FDS", 1)) {
-        return false;
+std::optional<std::string> LinuxConnectionService::adoptActivatedSocket() {
+    // Whatever else has that number may be a descriptor of our own by now.
+    if (!activatedSocketHas(SO_DOMAIN, AF_UNIX) || !activatedSocketHas(SO_TYPE, SOCK_STREAM) ||
+        !activatedSocketHas(SO_ACCEPTCONN, 1)) {
+        return "LISTEN_FDS is set, but file descriptor 3 is no listening local stream socket: pass one, or "
+               "unset LISTEN_FDS";
     }
     ::unsetenv("LISTEN_PID");
     ::unsetenv("LISTEN_FDS");
     socket_ = FileDescriptor(kActivatedSocket);
     ::fcntl(socket_.get(), F_SETFD, FD_CLOEXEC);
     ::fcntl(socket_.get(), F_SETFL, ::fcntl(socket_.get(), F_GETFL) | O_NONBLOCK);
-    return true;
+    return std::nullopt;
 }
 
 std::optional<std::string> LinuxConnectionService::bindSocket(const std::string& path) {
@@ -100,6 +107,10 @@ std::optional<std::string> LinuxConnectionService::bindSocket(const std::string&
     if (::bind(socket.get(), generic, sizeof address) != 0) {
         if (errno != EADDRINUSE) {
             return because("cannot make the socket " + path, errno);
+        }
+        struct stat there {};
+        if (::lstat(path.c_str(), &there) == 0 && !S_ISSOCK(there.st_mode)) {
+            return path + " is in the way and no socket: remove it, or set RUNTIME_DIRECTORY";
         }
         if (isAnswered(address)) {
             return "another tamblod already answers at " + path + ": stop it first, or set RUNTIME_DIRECTORY";

@@ -63,7 +63,7 @@ public:
 private:
     friend class LinuxConnection;
 
-    bool adoptActivatedSocket();
+    [[nodiscard]] std::optional<std::string> adoptActivatedSocket();
     [[nodiscard]] std::optional<std::string> bindSocket(const std::string& path);
     void accept(FileDescriptor socket);
     void pauseAccepting(int error);

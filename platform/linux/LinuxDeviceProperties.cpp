@@ -1,5 +1,8 @@
 #include "platform/linux/LinuxDeviceProperties.h"
 
+#include "base/Format.h"
+
+#include <algorithm>
 #include <ctime>
 #include <utility>
 
@@ -35,14 +38,29 @@ std::optional<bool> LinuxDeviceProperties::booleanProperty(std::string_view name
     const bool exists = ::stat(file_.path().c_str(), &status) == 0;
     if (!exists || !isCurrent_ || !isSameState(status, status_)) {
         properties_ = file_.read(log_);
+        if (!isSameState(status, status_)) {
+            reported_.clear();
+        }
         isCurrent_ = exists && isSettled(status);
         status_ = status;
     }
     const Value* value = properties_ ? properties_->find(name) : nullptr;
-    if (value == nullptr || value->kind() != Value::Kind::boolean) {
+    if (value == nullptr) {
+        return std::nullopt;
+    }
+    if (value->kind() != Value::Kind::boolean) {
+        report(name);
         return std::nullopt;
     }
     return value->boolValue();
+}
+
+void LinuxDeviceProperties::report(std::string_view name) const {
+    if (std::find(reported_.begin(), reported_.end(), name) == reported_.end()) {
+        reported_.emplace_back(name);
+        log_.report(LogLevel::error, "zrrs",
+                    formatted("{}: {} is no boolean; it is not used", file_.path(), name));
+    }
 }
 
 } // namespace tamblo

@@ -8,6 +8,7 @@
 #include <optional>
 #include <string>
 #include <string_view>
+#include <vector>
 
 #include <sys/stat.h>
 
@@ -25,12 +26,15 @@ public:
     [[nodiscard]] std::optional<bool> booleanProperty(std::string_view name) const override;
 
 private:
+    void report(std::string_view name) const;
+
     StructuredLog& log_;
     mutable std::mutex mutex_; ///< guards what follows
     mutable JsonFile file_;
     mutable bool isCurrent_ = false;
     mutable struct stat status_ {};
     mutable std::optional<Dictionary> properties_;
+    mutable std::vector<std::string> reported_; ///< properties of this state of the file that are no booleans
 };
 
 } // namespace tamblo

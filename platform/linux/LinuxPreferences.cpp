@@ -34,6 +34,10 @@ void LinuxPreferences::reportUnwatched() {
     }
 }
 
+std::string LinuxPreferences::path(std::string_view domain) const {
+    return formatted("{}/{}{}", watcher_.directory(), domain, kSuffix);
+}
+
 std::optional<Value> LinuxPreferences::copyPreferenceValue(std::string_view key,
                                                            std::string_view domain) const {
     if (!isDomainName(domain)) {
@@ -42,8 +46,7 @@ std::optional<Value> LinuxPreferences::copyPreferenceValue(std::string_view key,
     const std::lock_guard lock(mutex_);
     auto found = domains_.find(domain);
     if (found == domains_.end()) {
-        JsonFile file(formatted("{}/{}{}", watcher_.directory(), domain, kSuffix));
-        found = domains_.emplace(domain, Domain{std::move(file)}).first;
+        found = domains_.emplace(domain, Domain{JsonFile(path(domain))}).first;
     }
     Domain& entry = found->second;
     if (!entry.isCurrent) {

@@ -30,6 +30,9 @@ public:
     [[nodiscard]] std::optional<Value> copyPreferenceValue(std::string_view key,
                                                            std::string_view domain) const override;
 
+    /// The file of a domain, whether it is there or not.
+    [[nodiscard]] std::string path(std::string_view domain) const;
+
     /// For the event loop; -1 when changes cannot be noticed (said in the log; files are then read at every
     /// request).
     [[nodiscard]] int fileDescriptor() const noexcept { return watcher_.fileDescriptor(); }

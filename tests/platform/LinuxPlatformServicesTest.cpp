@@ -213,7 +213,8 @@ TEST(LinuxDevicePropertiesTest, AreReadAgainWhenTheFileChanges) {
         EXPECT_EQ(properties.booleanProperty("InternalBuild"), expected) << text;
         EXPECT_EQ(properties.booleanProperty("InternalBuild"), expected) << text;
     }
-    EXPECT_THAT(log.take(), ElementsAre(HasSubstr("line 1, column")));
+    EXPECT_THAT(log.take(), ElementsAre(HasSubstr("p.json: InternalBuild is no boolean"),
+                                        HasSubstr("p.json: line 1, column")));
     std::filesystem::remove(directory.path("p.json"));
     EXPECT_EQ(properties.booleanProperty("InternalBuild"), std::nullopt);
 }
@@ -263,7 +264,11 @@ TEST_F(LinuxAnalyticsEventServiceTest, AnswersWhichEventsAreInUse) {
             }
         }
     }
-    EXPECT_THAT(log_.take(), ElementsAre(HasSubstr("no array"), HasSubstr("no name")));
+    directory_.write("preferences/d.json", R"({"k": 1})"); // no news of this file
+    EXPECT_EQ(valueAfterChange(), 1);
+    EXPECT_TRUE(events_.isEventInUse("1x"));
+    EXPECT_THAT(log_.take(), ElementsAre(HasSubstr("analytics.json: events_in_use is no array"),
+                                         HasSubstr("analytics.json: events_in_use holds what is no name")));
     for (int number = 0; number < 10'000; ++number) { // more than are remembered
         ASSERT_FALSE(events_.isEventInUse("com.vandra.tamblo.event." + std::to_string(number)));
     }

@@ -4,6 +4,7 @@
 #include <gtest/gtest.h>
 #include <nlohmann/json.hpp>
 
+#include <algorithm>
 #include <csignal>
 #include <memory>
 #include <random>
@@ -47,6 +48,30 @@ TEST(Fault, BytesThatAreNoCborEndOnlyTheirConnection) {
     EXPECT_TRUE(client.isClosedByService());
     EXPECT_TRUE(service.awaitErrorOutput("interruptionHandler: connection exited"));
     EXPECT_TRUE(service.awaitErrorOutput("invalidationHandler: connection exited"));
+}
+
+TEST(Fault, RequestsBeforeTheFaultAreAnswered) {
+    ServiceProcess service;
+    for (int round = 0; round < 20; ++round) {
+        RawClient client(service.socketPath());
+        TextBuffer frames;
+        std::uint64_t id = 0;
+        // The start hands what follows it to another thread, which has the message's events to write.
+        for (wire::Request next :
+             {request(Method::createReportingSession, 7), request(Method::startReportingSessionForID, 7),
+              message({{"n", round}}, {7}), request(Method::stopReportingSessionForID, 7)}) {
+            next.id = ++id;
+            ASSERT_TRUE(wire::appendRequestFrame(frames, next));
+        }
+        frames.append(std::string_view("\x01\x00\x00\x00\x1C", 5));
+        client.sendBytes(frames.view());
+        std::vector<std::uint64_t> answered;
+        for (auto reply = client.receive(); reply; reply = client.receive()) {
+            answered.push_back(reply->id);
+        }
+        std::sort(answered.begin(), answered.end());
+        ASSERT_EQ(answered, (std::vector<std::uint64_t>{0, 1, 2, 3, 4}));
+    }
 }
 
 TEST(Fault, FrameBeyondTheLimitEndsItsConnection) {
@@ -145,6 +170,29 @@ TEST(Fault, ClientThatNeverReadsIsClosed) {
     EXPECT_GT(sent, 2'000);
     EXPECT_LT(sent, 10'000);
     EXPECT_TRUE(client.isClosedByService());
+}
+
+TEST(Fault, RepliesOfOneBatchTakeBoundedMemory) {
+    ServiceProcess service;
+    const Bystander bystander(service);
+    RawClient client(service.socketPath());
+    for (int i = 0; i < 20'000; ++i) {
+        client.send(request(Method::createReportingSession, 1'000'000'000'000 + i));
+    }
+    ASSERT_TRUE(client.call(request(Method::reporterID, 7)));
+    // Some thousand requests that arrive with one read, whose answers take most of a gigabyte.
+    wire::Request reporters = request(Method::getAllReporters);
+    reporters.id = 1;
+    TextBuffer frames;
+    for (int i = 0; i < 4'000; ++i) {
+        ASSERT_TRUE(wire::appendRequestFrame(frames, reporters));
+    }
+    service.signal(SIGSTOP);
+    client.sendBytes(frames.view());
+    service.signal(SIGCONT);
+    EXPECT_TRUE(client.isClosedByService());
+    const std::string status = readFile("/proc/" + std::to_string(service.pid()) + "/status");
+    EXPECT_LT(std::stoul(status.substr(status.find("VmHWM:") + 6)), 500'000U) << "kilobytes";
 }
 
 TEST(Fault, AcceptingGoesOnAfterTheDescriptorsWereGone) {

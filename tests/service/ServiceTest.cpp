@@ -133,6 +133,40 @@ TEST(Service, EndsAsAskedTo) {
     // The socket that the killed service left behind is replaced.
     service.start();
     EXPECT_TRUE(RawClient(service.socketPath()).call(request(Method::getAllReporters)));
+
+    // A second signal ends it at once, without a word about its clients.
+    service.signal(SIGSTOP);
+    service.signal(SIGTERM);
+    service.signal(SIGINT);
+    service.signal(SIGCONT);
+    EXPECT_EQ(service.awaitEnd(), 0);
+    EXPECT_EQ(service.countEvents("zrreportingclientuptime"), 1U);
+}
+
+TEST(Service, WhatIsAnsweredAtItsEndIsInTheFile) {
+    ServiceProcess service;
+    RawClient before(service.socketPath()), after(service.socketPath());
+    startSession(before, 7);
+    startSession(after, 8);
+    wire::Request last = message({{"last", true}}, {7});
+    ASSERT_TRUE(before.call(last));
+    last.id = 5;
+    last.dictionary.set("n", 2);
+    // Two more messages and the signal between them wait for the same wake-up.
+    service.signal(SIGSTOP);
+    before.send(last);
+    service.signal(SIGTERM);
+    last.reporterIDs = {8};
+    after.send(last);
+    service.signal(SIGCONT);
+    EXPECT_EQ(service.awaitEnd(), 0);
+    std::size_t answered = 1;
+    for (RawClient* client : {&before, &after}) {
+        for (auto reply = client->receive(); reply; reply = client->receive()) {
+            answered += reply->id == 5 ? 1U : 0U;
+        }
+    }
+    EXPECT_EQ(service.countEvents("\"last\":true"), 2 * answered);
 }
 
 TEST(Service, ClientThatLeavesIsReportedOnce) {
@@ -141,6 +175,13 @@ TEST(Service, ClientThatLeavesIsReportedOnce) {
         RawClient client(service.socketPath());
         startSession(client, 7);
         client.send(message({{"n", 1}}, {7}));
+        // What was sent before the end is answered to who still listens.
+        wire::Request reporters = request(Method::getAllReporters);
+        reporters.id = 5;
+        client.send(reporters);
+        ::shutdown(client.descriptor(), SHUT_WR);
+        EXPECT_EQ(client.receive()->result, Value(Array{7}));
+        EXPECT_FALSE(client.receive());
     }
     EXPECT_TRUE(eventually([&] { return service.countEvents("zrreportingclientuptime") == 1; }));
     RawClient other(service.socketPath());
@@ -160,10 +201,37 @@ TEST(Service, SecondInstanceSaysWhyItCannotStart) {
     EXPECT_TRUE(RawClient(service.socketPath()).call(request(Method::getAllReporters)));
 }
 
-TEST(Service, UnusableDirectoryIsOneClearLine) {
-    ServiceProcess service({.environment = {{"RUNTIME_DIRECTORY", "/proc/tamblo"}}, .awaitsReady = false});
-    EXPECT_EQ(service.awaitEnd(), 1);
-    EXPECT_NE(service.errorOutput().find("/proc/tamblo"), std::string::npos);
+TEST(Service, WhatKeepsItFromStartingIsOneClearLine) {
+    struct Case {
+        std::string runtimeDirectory;
+        std::string mentions;
+        std::function<void()> beforeExec;
+    };
+    const std::string longPath = (std::filesystem::temp_directory_path() / std::string(90, 'x')).string();
+    const std::string taken = (std::filesystem::temp_directory_path() / "tamblo-taken").string();
+    writeFile(taken + "/com.vandra.tamblo.reporting", "somebody's");
+    const auto activateWithoutSocket = [] {
+        ::setenv("LISTEN_PID", std::to_string(::getpid()).c_str(), 1);
+        ::setenv("LISTEN_FDS", "1", 1);
+    };
+    const std::vector<Case> cases = {
+        {"/proc/tamblo", "/proc/tamblo", {}},
+        {longPath, "too long", {}},
+        {taken, "no socket: remove it", {}},
+        {taken, "file descriptor 3", activateWithoutSocket},
+    };
+    for (const Case& hindrance : cases) {
+        ServiceProcess service({.environment = {{"RUNTIME_DIRECTORY", hindrance.runtimeDirectory}},
+                                .beforeExec = hindrance.beforeExec,
+                                .awaitsReady = false});
+        EXPECT_EQ(service.awaitEnd(), 1) << hindrance.mentions;
+        const std::string said = service.errorOutput();
+        EXPECT_NE(said.find(hindrance.mentions), std::string::npos) << said;
+        EXPECT_EQ(std::count(said.begin(), said.end(), '\n'), 1) << said;
+    }
+    EXPECT_EQ(readFile(taken + "/com.vandra.tamblo.reporting"), "somebody's");
+    std::filesystem::remove_all(taken);
+    std::filesystem::remove_all(longPath);
 }
 
 TEST(Service, TakesOverAnActivatedSocketAndTellsItsManager) {
