@@ -188,10 +188,15 @@ void ZRReportingClientServerInstance::performSend(Dictionary message, std::uint3
         return;
     }
     delegate->findReportingSessionsForIDs(reporterIDs, recipients_);
-    for (std::size_t i = 0; i < recipients_.size(); ++i) {
-        const bool isLast = i + 1 == recipients_.size();
-        recipients_[i]->sendMessage(std::make_shared<ZRReportingSessionMessage>(
-            isLast ? std::move(message) : message, category, type));
+    const auto sendTo = [category, type](const SessionRef& session, Dictionary payload) {
+        session->sendMessage(std::make_shared<ZRReportingSessionMessage>(std::move(payload), category, type));
+    };
+    // The last one is given the payload itself, which spares it a copy when it is normalised.
+    for (std::size_t i = 1; i < recipients_.size(); ++i) {
+        sendTo(recipients_[i - 1], message);
+    }
+    if (!recipients_.empty()) {
+        sendTo(recipients_.back(), std::move(message));
     }
     recipients_.clear();
     answer(reply);

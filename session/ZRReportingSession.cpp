@@ -113,7 +113,7 @@ void ZRReportingSession::record(MessageRef message) {
     messages_.push_back(std::move(message));
 }
 
-void ZRReportingSession::sendMessage(MessageRef message, ErrorReply reply) {
+void ZRReportingSession::sendMessage(const MessageRef& message, ErrorReply reply) {
     const auto held = monitor();
     ++totalMessageCount_;
     normalise(*message);

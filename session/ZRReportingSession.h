@@ -56,7 +56,7 @@ public:
     void start();
     /// Normalises the message, records it unless it is redundant, and offers it to the consumer workers,
     /// whether or not the session is started. May be called by a worker in its `stop`.
-    void sendMessage(MessageRef message, ErrorReply reply = {});
+    void sendMessage(const MessageRef& message, ErrorReply reply = {});
     void stop();
 
     /// The start reply that waits for the stop; empty when none does.

@@ -9,9 +9,6 @@ namespace tamblo::tools {
 
 namespace {
 
-using client::EventCategory;
-using client::EventType;
-
 constexpr Option kOptions[] = {
     {"--category", "CATEGORY", "by name (Volume, Session_Playback) or number; needed"},
     {"--type", "TYPE", "by name (Start, Summary) or number (Generic)"},

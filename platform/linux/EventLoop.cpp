@@ -2,8 +2,6 @@
 
 #include <algorithm>
 #include <array>
-#include <cstdio>
-#include <cstdlib>
 #include <span>
 #include <utility>
 
@@ -21,10 +19,6 @@ constexpr int kEventsPerWakeUp = 64;
 
 EventLoop::EventLoop()
     : epoll_(::epoll_create1(EPOLL_CLOEXEC)), wakeUp_(::eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK)) {
-    if (!epoll_.isOpen() || !wakeUp_.isOpen()) {
-        std::perror("tamblod: no event loop can be made");
-        std::exit(1);
-    }
     epoll_event event{};
     event.events = EPOLLIN;
     event.data.ptr = nullptr;

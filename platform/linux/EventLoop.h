@@ -31,6 +31,8 @@ public:
     EventLoop();
     ~EventLoop();
     EventLoop(const EventLoop&) = delete;
+    /// False when the kernel refused the descriptors that it needs; nothing else may be called then.
+    [[nodiscard]] bool isOpen() const noexcept { return epoll_.isOpen() && wakeUp_.isOpen(); }
     EventLoop& operator=(const EventLoop&) = delete;
 
     /// From any thread, for a descriptor that stays open meanwhile. Level-triggered.

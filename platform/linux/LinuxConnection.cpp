@@ -17,9 +17,6 @@ namespace tamblo {
 
 namespace {
 
-/// An unfinished frame up to this size is put in front of the next read; a longer one is collected where it
-/// is.
-constexpr std::size_t kSmallRest = 16 * 1024;
 /// Buffers above this are given back once they are empty.
 constexpr std::size_t kKeptCapacity = 64 * 1024;
 
@@ -73,16 +70,16 @@ void LinuxConnection::ready(std::uint32_t events) {
 }
 
 void LinuxConnection::read() {
-    bool isOpen = true;
-    const std::span<const std::uint8_t> received = receive(isOpen);
-    if (!isOpen) {
-        beginEnd(received.empty() && errno == ECONNRESET ? Ending::interrupted : Ending::orderly);
+    std::span<const std::uint8_t> received;
+    const Ending ending = receive(received);
+    if (ending != Ending::none) {
+        beginEnd(ending);
         return;
     }
     takeFrames(received);
 }
 
-std::span<const std::uint8_t> LinuxConnection::receive(bool& isOpen) {
+LinuxConnection::Ending LinuxConnection::receive(std::span<const std::uint8_t>& received) {
     // A long frame grows in its own buffer; otherwise what is left of the last read goes before the new
     // bytes.
     const bool collects = unfinished_.size() > kSmallRest;
@@ -95,19 +92,22 @@ std::span<const std::uint8_t> LinuxConnection::receive(bool& isOpen) {
     const std::size_t kept = unfinished_.size();
     const std::size_t room = collects ? std::min(unfinishedWants_ - kept, kBytesPerRead) : kBytesPerRead;
     const ssize_t count = ::recv(socket_.get(), start + kept, room, MSG_DONTWAIT);
-    if (count <= 0) {
-        const bool isQuiet = count < 0 && (errno == EAGAIN || errno == EINTR);
-        isOpen = isQuiet;
-        if (count == 0) {
-            errno = 0;
-        }
-        return {};
+    if (count == 0) {
+        return Ending::orderly;
     }
-    if (collects) {
-        unfinished_.commit(static_cast<std::size_t>(count));
-        return unfinished_.size() < unfinishedWants_ ? std::span<const std::uint8_t>() : unfinished_.bytes();
+    if (count < 0) {
+        const bool isQuiet = errno == EAGAIN || errno == EINTR;
+        return isQuiet ? Ending::none : Ending::interrupted;
     }
-    return {start, kept + static_cast<std::size_t>(count)};
+    if (!collects) {
+        received = {start, kept + static_cast<std::size_t>(count)};
+        return Ending::none;
+    }
+    unfinished_.commit(static_cast<std::size_t>(count));
+    if (unfinished_.size() == unfinishedWants_) {
+        received = unfinished_.bytes();
+    }
+    return Ending::none;
 }
 
 void LinuxConnection::takeFrames(std::span<const std::uint8_t> received) {

@@ -61,7 +61,8 @@ private:
     enum class Ending : std::uint8_t { none, orderly, interrupted };
 
     void read();
-    [[nodiscard]] std::span<const std::uint8_t> receive(bool& isOpen);
+    /// What has arrived, beginning with a frame; empty when there is none to begin with yet.
+    [[nodiscard]] Ending receive(std::span<const std::uint8_t>& received);
     void takeFrames(std::span<const std::uint8_t> received);
     void keepRest(std::span<const std::uint8_t> rest, std::size_t wanted);
     void carryOut(std::span<const std::uint8_t> item);

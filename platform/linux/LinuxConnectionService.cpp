@@ -62,7 +62,7 @@ bool isAnswered(const sockaddr_un& address) {
 } // namespace
 
 LinuxConnectionService::LinuxConnectionService(EventLoop& loop, StructuredLog& log)
-    : loop_(loop), log_(log), readBuffer_(new std::uint8_t[kBytesPerRead + 2 * 16 * 1024]) {}
+    : loop_(loop), log_(log), readBuffer_(new std::uint8_t[kBytesPerRead + kSmallRest]) {}
 
 LinuxConnectionService::~LinuxConnectionService() {
     removeSocketFile();
@@ -158,6 +158,7 @@ void LinuxConnectionService::ready(std::uint32_t) {
         }
         if (errno == EMFILE || errno == ENFILE || errno == ENOBUFS || errno == ENOMEM) {
             pauseAccepting(errno);
+            return;
         }
         if (errno != ECONNABORTED && errno != EINTR) {
             return;
@@ -175,7 +176,6 @@ void LinuxConnectionService::pauseAccepting(int error) {
             resume();
         }
     });
-    errno = EAGAIN;
 }
 
 void LinuxConnectionService::accept(FileDescriptor socket) {
@@ -206,10 +206,9 @@ void LinuxConnectionService::releaseReplies() {
 }
 
 void LinuxConnectionService::posted(std::size_t requests) {
-    requestsPosted_ += requests;
-    if (requestsPosted_ >= kRequestsPerBatch && InlineDrain::current() != nullptr) {
-        InlineDrain::current()->drain();
-        requestsPosted_ = 0;
+    InlineDrain* const drain = InlineDrain::current();
+    if (drain != nullptr && drain->add(requests) >= kRequestsPerBatch) {
+        drain->drain();
     }
 }
 

@@ -34,6 +34,9 @@ inline constexpr std::size_t kMaximumWaitingReplies = 4 * 1024 * 1024;
 /// What one read takes at most: some hundred messages, so that a batch costs few system calls and no
 /// connection holds up the others for long.
 inline constexpr std::size_t kBytesPerRead = 128 * 1024;
+/// An unfinished frame up to this size is put in front of the next read; a longer one is collected where it
+/// is.
+inline constexpr std::size_t kSmallRest = 16 * 1024;
 /// Requests read in one wake-up are carried out in batches of about this many.
 inline constexpr std::size_t kRequestsPerBatch = 256;
 
@@ -86,7 +89,6 @@ private:
     std::unique_ptr<std::uint8_t[]> readBuffer_;
     KeySetCache keySets_;
     wire::Request request_;
-    std::size_t requestsPosted_ = 0;
 
     std::mutex mutex_; ///< guards what follows
     std::vector<std::shared_ptr<LinuxConnection>> replied_;

@@ -45,6 +45,8 @@ public:
         sigemptyset(&signals);
         sigaddset(&signals, SIGTERM);
         sigaddset(&signals, SIGINT);
+        // A sink that reaches the process's file size limit is a full disk, not the end.
+        std::signal(SIGXFSZ, SIG_IGN);
         ::sigprocmask(SIG_BLOCK, &signals, nullptr);
         descriptor_ = FileDescriptor(::signalfd(-1, &signals, SFD_CLOEXEC | SFD_NONBLOCK));
     }
@@ -112,6 +114,9 @@ std::variant<std::unique_ptr<LinuxPlatform>, std::string> LinuxPlatform::open() 
     }
     const auto& places = std::get<Directories>(directories);
     std::unique_ptr<LinuxPlatform> platform(new LinuxPlatform(places));
+    if (!platform->services_->loop.isOpen()) {
+        return "the kernel gives out no more file descriptors: raise the limit on open files";
+    }
     if (auto problem = platform->services_->connections.open(places.runtime)) {
         return std::move(*problem);
     }

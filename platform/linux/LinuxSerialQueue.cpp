@@ -36,6 +36,7 @@ void InlineDrain::drain() {
         queues_[i]->drainInline();
     }
     queues_.clear();
+    posted_ = 0;
 }
 
 LinuxSerialQueue::~LinuxSerialQueue() {

@@ -26,6 +26,8 @@ public:
     InlineDrain(const InlineDrain&) = delete;
     InlineDrain& operator=(const InlineDrain&) = delete;
 
+    /// Counts posted work towards a batch; answers how much there is since the last drain.
+    std::size_t add(std::size_t posted) noexcept { return posted_ += posted; }
     void drain();
     /// The calling thread's, or null.
     [[nodiscard]] static InlineDrain* current() noexcept;
@@ -33,6 +35,7 @@ public:
 private:
     friend class LinuxSerialQueue;
     std::vector<LinuxSerialQueue*> queues_;
+    std::size_t posted_ = 0;
 };
 
 /// A serial queue as a strand: no thread of its own; whoever drains it, the pool or an `InlineDrain`, is the
