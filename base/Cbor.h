@@ -135,6 +135,8 @@ private:
     bool readRecentText(std::string_view text, Value& value);
     bool readKey(std::string_view& key);
     bool takeBytes(const Head& head, std::string_view& bytes) noexcept;
+    /// One definite piece of a text or byte string of indefinite length.
+    bool takeChunk(Type major, std::string_view& chunk) noexcept;
     bool assembleChunks(Type major, std::string& bytes);
     bool readDate(const Head& head, Value& value);
     bool readArray(const Head& head, Value& value, int depth);

@@ -312,17 +312,21 @@ bool CborReader::takeBytes(const Head& head, std::string_view& bytes) noexcept {
     return true;
 }
 
+bool CborReader::takeChunk(Type major, std::string_view& chunk) noexcept {
+    Head head{};
+    if (!readHead(head)) {
+        return false;
+    }
+    if (head.major != major || head.info == kIndefinite) {
+        return fail(CborError::malformed);
+    }
+    return takeBytes(head, chunk);
+}
+
 bool CborReader::assembleChunks(Type major, std::string& bytes) {
     while (!atBreak()) {
-        Head head{};
         std::string_view chunk;
-        if (!readHead(head)) {
-            return false;
-        }
-        if (head.major != major || head.info == kIndefinite) {
-            return fail(CborError::malformed);
-        }
-        if (!takeBytes(head, chunk)) {
+        if (!takeChunk(major, chunk)) {
             return false;
         }
         // Each chunk of a text is a text of its own (RFC 8949, section 3.2.3).

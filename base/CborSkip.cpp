@@ -65,15 +65,8 @@ bool CborReader::skip() {
 
 bool CborReader::skipChunks(Type major) noexcept {
     while (!atBreak()) {
-        Head head{};
         std::string_view chunk;
-        if (!readHead(head)) {
-            return false;
-        }
-        if (head.major != major || head.info == kIndefinite) {
-            return fail(CborError::malformed);
-        }
-        if (!takeBytes(head, chunk)) {
+        if (!takeChunk(major, chunk)) {
             return false;
         }
     }
