@@ -29,9 +29,6 @@ enum class CborError : std::uint8_t {
     integerOutOfRange,
 };
 
-[[nodiscard]] constexpr bool isNotWellFormed(CborError error) noexcept {
-    return error == CborError::truncated || error == CborError::malformed;
-}
 /// For people: "a map holds a key twice".
 [[nodiscard]] std::string_view describe(CborError error) noexcept;
 
@@ -93,7 +90,6 @@ public:
     /// error.
     [[nodiscard]] std::optional<std::uint64_t> readUnsigned() noexcept;
     [[nodiscard]] std::optional<std::int64_t> readInteger() noexcept;
-    [[nodiscard]] std::optional<bool> readBoolean() noexcept;
     /// A text that stands in the bytes themselves (definite length), UTF-8.
     [[nodiscard]] std::optional<std::string_view> readText() noexcept;
     [[nodiscard]] bool readNull() noexcept;

@@ -164,13 +164,6 @@ std::optional<std::int64_t> CborReader::readInteger() noexcept {
     return type == Type::negativeInteger ? -1 - magnitude : magnitude;
 }
 
-std::optional<bool> CborReader::readBoolean() noexcept {
-    if (peek() != Type::simple || (*position_ != 0xF4 && *position_ != 0xF5)) {
-        return std::nullopt;
-    }
-    return *position_++ == 0xF5;
-}
-
 std::optional<std::string_view> CborReader::readText() noexcept {
     if (peek() != Type::text || (*position_ & 0x1F) == kIndefinite) {
         return std::nullopt;

@@ -131,10 +131,6 @@ void Dictionary::detach(std::size_t capacity) {
     block_ = mine;
 }
 
-void Dictionary::reserve(std::size_t capacity) {
-    detach(std::max(capacity, size()));
-}
-
 void Dictionary::setValueAt(std::size_t index, Value value) {
     detach(block_->count());
     block_->values()[index] = std::move(value);
@@ -294,28 +290,6 @@ bool Dictionary::equalsIgnoring(const Dictionary& other,
         ++i;
         ++j;
     }
-}
-
-Dictionary Dictionary::deepCopy() const {
-    Dictionary copy(*this);
-    if (block_ != nullptr) {
-        copy.detach(size());
-        for (Value& value : std::span(copy.block_->values(), copy.size())) {
-            value = value.deepCopy();
-        }
-    }
-    return copy;
-}
-
-std::size_t Dictionary::heapBytes() const noexcept {
-    if (block_ == nullptr) {
-        return 0;
-    }
-    std::size_t total = sizeof(Block) + block_->capacity * sizeof(Value);
-    for (const Value& value : values()) {
-        total += value.heapBytes();
-    }
-    return total;
 }
 
 } // namespace tamblo

@@ -49,7 +49,6 @@ public:
     bool remove(std::string_view key);
     /// Adds every entry of the other dictionary; its values win.
     void merge(const Dictionary& other);
-    void reserve(std::size_t capacity);
 
     /// Builds a dictionary from one value for each key; `places[i]` is the index of the key that `values[i]`
     /// belongs to, each index once. `spare` is room for keys to come. The values are moved from.
@@ -65,9 +64,6 @@ public:
     [[nodiscard]] bool sharesStorageWith(const Dictionary& other) const noexcept {
         return block_ == other.block_;
     }
-    /// A dictionary that shares nothing with this one but immutable keys.
-    [[nodiscard]] Dictionary deepCopy() const;
-    [[nodiscard]] std::size_t heapBytes() const noexcept;
 
 private:
     friend class Value;

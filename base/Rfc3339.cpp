@@ -1,6 +1,5 @@
 #include "base/Rfc3339.h"
 
-#include <charconv>
 #include <chrono>
 #include <cmath>
 #include <cstdint>
@@ -28,58 +27,6 @@ void writeDigits(char* at, std::size_t count, unsigned number) noexcept {
         at[--count] = static_cast<char>('0' + number % 10);
     }
 }
-
-/// A cursor over the text; whatever is missing leaves it failed.
-class Cursor {
-public:
-    explicit Cursor(std::string_view text) noexcept : rest_(text) {}
-
-    [[nodiscard]] bool completed() const noexcept { return good_ && rest_.empty(); }
-
-    int digits(std::size_t count, int least, int most) noexcept {
-        int number = 0;
-        for (std::size_t i = 0; i < count; ++i) {
-            const char digit = next();
-            good_ = good_ && digit >= '0' && digit <= '9';
-            number = good_ ? number * 10 + (digit - '0') : 0;
-        }
-        good_ = good_ && number >= least && number <= most;
-        return number;
-    }
-    char oneOf(std::string_view characters) noexcept {
-        const char character = next();
-        good_ = good_ && characters.find(character) != std::string_view::npos;
-        return character;
-    }
-    double fraction() noexcept {
-        if (!rest_.starts_with('.')) {
-            return 0;
-        }
-        std::size_t length = 1;
-        while (length < rest_.size() && rest_[length] >= '0' && rest_[length] <= '9') {
-            ++length;
-        }
-        double fraction = 0;
-        const auto result = std::from_chars(rest_.data(), rest_.data() + length, fraction);
-        good_ = good_ && length > 1 && result.ptr == rest_.data() + length;
-        rest_.remove_prefix(length);
-        return fraction;
-    }
-
-private:
-    char next() noexcept {
-        if (rest_.empty()) {
-            good_ = false;
-            return '\0';
-        }
-        const char character = rest_.front();
-        rest_.remove_prefix(1);
-        return character;
-    }
-
-    std::string_view rest_;
-    bool good_ = true;
-};
 
 } // namespace
 
@@ -111,41 +58,6 @@ std::optional<std::string> formatRfc3339(double secondsSince1970) {
     writeDigits(&text[17], 2, ofDay % 60);
     writeDigits(&text[20], 3, milliseconds);
     return text;
-}
-
-std::optional<double> parseRfc3339(std::string_view text) {
-    Cursor cursor(text);
-    const int year = cursor.digits(4, 0, 9999);
-    cursor.oneOf("-");
-    const int month = cursor.digits(2, 1, 12);
-    cursor.oneOf("-");
-    const int day = cursor.digits(2, 1, 31);
-    cursor.oneOf("Tt");
-    const int hour = cursor.digits(2, 0, 23);
-    cursor.oneOf(":");
-    const int minute = cursor.digits(2, 0, 59);
-    cursor.oneOf(":");
-    const int second = cursor.digits(2, 0, 60);
-    const double fraction = cursor.fraction();
-    const char zone = cursor.oneOf("Zz+-");
-    std::int64_t offset = 0;
-    if (zone == '+' || zone == '-') {
-        offset = cursor.digits(2, 0, 23) * 60;
-        cursor.oneOf(":");
-        offset = (offset + cursor.digits(2, 0, 59)) * (zone == '-' ? -60 : 60);
-    }
-    const year_month_day date{std::chrono::year(year), std::chrono::month(static_cast<unsigned>(month)),
-                              std::chrono::day(static_cast<unsigned>(day))};
-    if (!cursor.completed() || !date.ok()) {
-        return std::nullopt;
-    }
-    const std::int64_t seconds = sys_days(date).time_since_epoch().count() * kSecondsPerDay + hour * 3600 +
-                                 minute * 60 + second - offset;
-    // A leap second stands at the end of a day of UTC and is read as the second behind it.
-    if (second == 60 && seconds % kSecondsPerDay != 0) {
-        return std::nullopt;
-    }
-    return static_cast<double>(seconds) + fraction;
 }
 
 } // namespace tamblo

@@ -376,43 +376,4 @@ bool Value::operator==(const Value& other) const noexcept {
     }
 }
 
-Value Value::deepCopy() const {
-    switch (kind()) {
-    case Kind::string:
-        return {textBytes()};
-    case Kind::data:
-        return data(dataValue());
-    case Kind::array: {
-        Array copies;
-        for (const Value& element : arrayValue()) {
-            copies.push_back(element.deepCopy());
-        }
-        return {std::move(copies)};
-    }
-    case Kind::dictionary:
-        return {dictionaryValue().deepCopy()};
-    default:
-        return *this;
-    }
-}
-
-std::size_t Value::heapBytes() const noexcept {
-    if (!ownsBlock()) {
-        return 0;
-    }
-    switch (kind()) {
-    case Kind::array: {
-        std::size_t total = sizeof(ArrayBlock);
-        for (const Value& element : arrayValue()) {
-            total += sizeof(Value) + element.heapBytes();
-        }
-        return total;
-    }
-    case Kind::dictionary:
-        return dictionaryValue().heapBytes();
-    default:
-        return sizeof(TextBlock) + textBytes().size();
-    }
-}
-
 } // namespace tamblo

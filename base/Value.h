@@ -96,12 +96,6 @@ public:
 
     [[nodiscard]] bool operator==(const Value& other) const noexcept;
 
-    /// A value that shares no block with this one, nested ones included.
-    [[nodiscard]] Value deepCopy() const;
-
-    /// Bytes of heap that this value alone refers to, blocks counted in full.
-    [[nodiscard]] std::size_t heapBytes() const noexcept;
-
 private:
     friend class Dictionary;
 

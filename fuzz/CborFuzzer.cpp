@@ -65,6 +65,10 @@ bool isWellFormed(Bytes bytes, std::size_t& at, int depth, std::uint8_t chunksOf
     return true;
 }
 
+bool saysNotWellFormed(CborError error) {
+    return error == CborError::truncated || error == CborError::malformed;
+}
+
 std::optional<Value> readAll(CborReader& reader) {
     auto value = reader.readValue();
     require(value.has_value() == (reader.error() == CborError::none));
@@ -88,8 +92,8 @@ void checkCbor(Bytes bytes) {
     const bool skipped = whole.skip();
     require(!wellFormed || skipped);
     require(wellFormed || !skipped || bytes.size() > depth);
-    require(skipped || isNotWellFormed(whole.error()));
-    require(!skipped || !isNotWellFormed(plain.error()));
+    require(skipped || saysNotWellFormed(whole.error()));
+    require(!skipped || !saysNotWellFormed(plain.error()));
     if (wellFormed) {
         require(CborReader(bytes.first(length)).skip());
         require(length == 0 || !CborReader(bytes.first(length - 1)).skip());

@@ -141,52 +141,8 @@ TEST(Rfc3339, WritesTimes) {
         {std::numeric_limits<double>::quiet_NaN(), nullptr},
         {1e300, nullptr}};
     for (const auto& [seconds, text] : rows) {
-        const auto written = formatRfc3339(seconds);
-        EXPECT_EQ(written, text == nullptr ? std::nullopt : std::optional<std::string>(text)) << seconds;
-        if (written) {
-            EXPECT_NEAR(parseRfc3339(*written).value_or(infinity), seconds, 0.0006) << *written;
-        }
-    }
-}
-
-TEST(Rfc3339, ReadsTimes) {
-    const std::vector<std::pair<const char*, double>> rows{
-        {"1970-01-01T00:00:00Z", 0},
-        {"1970-01-01t00:00:00z", 0},
-        {"1970-01-01T01:30:00+01:30", 0},
-        {"1969-12-31T16:00:00-08:00", 0},
-        {"1970-01-01T00:00:00-00:00", 0},
-        {"1985-04-12T23:20:50.52Z", 482196050.52},
-        {"1996-12-19T16:39:57-08:00", 851042397},
-        {"1990-12-31T23:59:60Z", 662688000},
-        {"1990-12-31T15:59:60-08:00", 662688000},
-        {"1970-01-01T00:00:00.123456789012345678901Z", 0.123456789012345678901},
-        {"1969-12-31T23:59:59.5Z", -0.5}};
-    for (const auto& [text, expected] : rows) {
-        EXPECT_EQ(parseRfc3339(text), expected) << text;
-    }
-    for (const char* text : {"",
-                             "1970-01-01",
-                             "1970-01-01T00:00:00",
-                             "1970-01-01T00:00Z",
-                             "1970-01-01 00:00:00Z",
-                             "1970-01-01T00:00:00.Z",
-                             "1970-01-01T00:00:00,5Z",
-                             "1970-01-01T00:00:00+0100",
-                             "1970-01-01T00:00:00+24:00",
-                             "1970-01-01T24:00:00Z",
-                             "1970-01-01T00:60:00Z",
-                             "1970-01-01T00:00:61Z",
-                             "1970-01-01T12:00:60Z",
-                             "1970-02-29T00:00:00Z",
-                             "1970-13-01T00:00:00Z",
-                             "1970-00-01T00:00:00Z",
-                             "1970-01-00T00:00:00Z",
-                             "1970-1-01T00:00:00Z",
-                             "-970-01-01T00:00:00Z",
-                             "1970-01-01T00:00:00Z ",
-                             "1970-01-01T00:00:00ZZ"}) {
-        EXPECT_EQ(parseRfc3339(text), std::nullopt) << text;
+        EXPECT_EQ(formatRfc3339(seconds), text == nullptr ? std::nullopt : std::optional<std::string>(text))
+            << seconds;
     }
 }
 

@@ -23,10 +23,9 @@ public:
     void setInvalidationHandler(UniqueFunction<void()> handler) override {
         invalidation_ = std::move(handler);
     }
-    void resume() override { isResumed_ = true; }
+    void resume() override {}
     [[nodiscard]] std::string description() const override { return "connection of " + std::to_string(pid_); }
 
-    [[nodiscard]] bool isResumed() const noexcept { return isResumed_; }
     [[nodiscard]] ZRReportingServiceProtocol& object() const noexcept { return *object_; }
     void interrupt() { interruption_(); }
     /// Ends the connection for good; it lets go of the exported object afterwards.
@@ -38,7 +37,6 @@ public:
 
 private:
     const pid_t pid_;
-    bool isResumed_ = false;
     std::shared_ptr<ZRReportingServiceProtocol> object_;
     UniqueFunction<void()> interruption_;
     UniqueFunction<void()> invalidation_;
