@@ -1,6 +1,6 @@
 #include "client/Engine.h"
 
-#include "client/ReplyParser.h"
+#include "client/PlainReply.h"
 #include "client/RequestFrame.h"
 #include "wire/FrameSplitter.h"
 #include "wire/Reply.h"

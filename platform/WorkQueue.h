@@ -3,13 +3,16 @@
 #include "base/UniqueFunction.h"
 
 #include <chrono>
+#include <cstddef>
 #include <memory>
 #include <string_view>
 
 namespace tamblo {
 
-/// One piece of queued work. What a request's work captures fits without an allocation.
-using Work = UniqueFunction<void(), 144>;
+/// What a request's work captures fits into this many bytes, so that queueing it allocates nothing.
+inline constexpr std::size_t kWorkInlineBytes = 144;
+/// One piece of queued work.
+using Work = UniqueFunction<void(), kWorkInlineBytes>;
 
 /// What a piece of work may do to the thread that runs it.
 enum class Pace {

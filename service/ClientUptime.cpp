@@ -5,7 +5,6 @@
 #include "util/Log.h"
 
 #include <chrono>
-#include <cstdint>
 #include <optional>
 #include <string>
 

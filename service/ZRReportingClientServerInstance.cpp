@@ -168,7 +168,8 @@ void ZRReportingClientServerInstance::sendMessage(Dictionary message, std::uint3
                   reply = std::move(reply)](auto& client) mutable {
         client.performSend(std::move(message), category, type, reporterIDs, std::move(reply));
     };
-    static_assert(sizeof(piece) + sizeof(ClientRef) <= 144, "a queued message allocates nothing");
+    static_assert(sizeof(piece) + sizeof(ClientRef) <= kWorkInlineBytes,
+                  "a queued message allocates nothing");
     onServerQueue(Pace::quick, std::move(piece));
 }
 

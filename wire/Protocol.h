@@ -57,13 +57,14 @@ inline constexpr std::array<std::string_view, 11> kMethodNames{
 }
 [[nodiscard]] std::optional<Method> methodNamed(std::string_view name) noexcept;
 
-/// An error as it travels: the service's own domain, or this one with the codes of JSON-RPC 2.0.
+/// The domain of the protocol's own errors; their codes are those of JSON-RPC 2.0.
 inline constexpr std::string_view kProtocolErrorDomain = "com.vandra.tamblo.protocol";
 inline constexpr std::int64_t kNotWellFormed = -32700;
 inline constexpr std::int64_t kNotARequest = -32600;
 inline constexpr std::int64_t kUnknownMethod = -32601;
 inline constexpr std::int64_t kWrongParameters = -32602;
 
+/// An error as it travels: of the service's own domain or of the protocol's.
 struct Error {
     std::string domain;
     std::int64_t code = 0;

@@ -7,7 +7,6 @@
 #include "util/BoundedCache.h"
 
 #include <cstdint>
-#include <functional>
 #include <string>
 
 namespace tamblo {
