@@ -12,8 +12,8 @@ ExitStatus run(const Arguments& arguments) {
         return complain(ExitStatus::usage, "kill takes no arguments");
     }
     ServiceConnection service(arguments);
-    if (!service.connect()) {
-        return ExitStatus::unreachable;
+    if (const auto failure = service.connect()) {
+        return *failure;
     }
     auto future = service.client().killService();
     if (!service.client().wait(future, service.timeout())) {

@@ -1,8 +1,8 @@
 #include "base/Format.h"
 #include "client/Directories.h"
 #include "client/NumberText.h"
-#include "tools/AtomicFile.h"
 #include "tools/Command.h"
+#include "tools/Files.h"
 
 #include <string>
 

@@ -1,8 +1,8 @@
 #include "base/Format.h"
 #include "base/Json.h"
 #include "client/Directories.h"
-#include "tools/AtomicFile.h"
 #include "tools/Command.h"
+#include "tools/Files.h"
 #include "tools/Payload.h"
 
 #include <cerrno>

@@ -14,8 +14,8 @@ ExitStatus run(const Arguments& arguments) {
         return complain(ExitStatus::usage, "reporters takes no arguments");
     }
     ServiceConnection service(arguments);
-    if (!service.connect()) {
-        return ExitStatus::unreachable;
+    if (const auto failure = service.connect()) {
+        return *failure;
     }
     auto future = service.client().getAllReporters();
     std::vector<std::int64_t> reporters;

@@ -41,8 +41,8 @@ ExitStatus run(const Arguments& arguments) {
         return complain(ExitStatus::usage, *wrong);
     }
     ServiceConnection service(arguments);
-    if (!service.connect()) {
-        return ExitStatus::unreachable;
+    if (const auto failure = service.connect()) {
+        return *failure;
     }
     auto future = service.client().sendMessage(std::get<Dictionary>(payload), *category, *type, reporters);
     client::Nothing nothing;

@@ -57,7 +57,7 @@ std::variant<Plan, std::string> makePlan(const Arguments& arguments) {
     }
     plan.serviceType = *serviceType;
     if (const auto text = arguments.last("--configuration")) {
-        auto configuration = parseJsonObject(*text);
+        auto configuration = parseJsonObject(*text, kForService);
         if (const auto* wrong = std::get_if<std::string>(&configuration)) {
             return "--configuration is " + *wrong;
         }
@@ -163,8 +163,8 @@ ExitStatus run(const Arguments& arguments) {
         lines = &file;
     }
     ServiceConnection service(arguments);
-    if (!service.connect()) {
-        return ExitStatus::unreachable;
+    if (const auto failure = service.connect()) {
+        return *failure;
     }
     plan.player.timeout = service.timeout();
     return playAndStop(service, arguments, plan, lines);

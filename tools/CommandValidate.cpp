@@ -18,8 +18,8 @@ ExitStatus run(const Arguments& arguments) {
         return ExitStatus::usage;
     }
     ServiceConnection service(arguments);
-    if (!service.connect()) {
-        return ExitStatus::unreachable;
+    if (const auto failure = service.connect()) {
+        return *failure;
     }
     auto future = service.client().reporterID(*reporter);
     Dictionary answer;

@@ -1,14 +1,14 @@
 #include "tools/Payload.h"
 
 #include "base/Format.h"
-#include "base/Json.h"
 
 namespace tamblo::tools {
 
-std::variant<Dictionary, std::string> parseJsonObject(std::string_view text) {
-    auto read = readJson(text);
+std::variant<Dictionary, std::string> parseJsonObject(std::string_view text, JsonReadOptions options) {
+    auto read = readJson(text, options);
     if (const auto* error = std::get_if<JsonError>(&read)) {
-        return formatted("not JSON: line {}, column {}: {}", error->line, error->column, error->message);
+        return formatted("not usable JSON: line {}, column {}: {}", error->line, error->column,
+                         error->message);
     }
     const Value& value = std::get<Value>(read);
     if (!value.isDictionary()) {
@@ -28,7 +28,7 @@ Value parseScalar(std::string_view text) {
 
 std::variant<Dictionary, std::string> parsePayload(std::span<const std::string_view> words) {
     if (words.size() == 1 && words[0].starts_with('{')) {
-        auto payload = parseJsonObject(words[0]);
+        auto payload = parseJsonObject(words[0], kForService);
         if (const auto* wrong = std::get_if<std::string>(&payload)) {
             return "the payload is " + *wrong;
         }

@@ -4,17 +4,23 @@
 #include "client/NumberText.h"
 
 #include <algorithm>
+#include <charconv>
 
 namespace tamblo::tools {
 
 namespace {
 
-std::chrono::milliseconds timeoutFrom(const Arguments& arguments) {
-    constexpr double usual = 10;
+std::optional<std::chrono::milliseconds> timeoutFrom(const Arguments& arguments) {
     constexpr double longest = 86400;
-    const double seconds =
-        arguments.has("--timeout") ? Value(*arguments.last("--timeout")).doubleValue() : usual;
-    return std::chrono::milliseconds(static_cast<std::int64_t>(std::clamp(seconds, 0.0, longest) * 1000));
+    double seconds = 10;
+    if (const auto text = arguments.last("--timeout")) {
+        const char* const behind = text->data() + text->size();
+        const auto [end, error] = std::from_chars(text->data(), behind, seconds);
+        if (error != std::errc() || end != behind || !(seconds >= 0)) {
+            return std::nullopt;
+        }
+    }
+    return std::chrono::milliseconds(static_cast<std::int64_t>(std::min(seconds, longest) * 1000));
 }
 
 } // namespace
@@ -25,19 +31,20 @@ ServiceConnection::ServiceConnection(const Arguments& arguments)
                .threading = client::Client::Threading::caller,
                .reconnect = false}) {}
 
-bool ServiceConnection::connect() {
+std::optional<ExitStatus> ServiceConnection::connect() {
+    if (!timeout_) {
+        return complain(ExitStatus::usage, "--timeout needs a number of seconds");
+    }
     if (client_.connect()) {
-        return true;
+        return std::nullopt;
     }
     if (client_.socketPath().empty()) {
-        complain(ExitStatus::unreachable,
-                 "the service's directory is not known: set RUNTIME_DIRECTORY or XDG_RUNTIME_DIR");
-    } else {
-        complain(ExitStatus::unreachable,
-                 formatted("no service answers at {}: start tamblod, or set RUNTIME_DIRECTORY",
-                           client_.socketPath()));
+        return complain(ExitStatus::unreachable,
+                        "the service's directory is not known: set RUNTIME_DIRECTORY or XDG_RUNTIME_DIR");
     }
-    return false;
+    return complain(
+        ExitStatus::unreachable,
+        formatted("no service answers at {}: start tamblod, or set RUNTIME_DIRECTORY", client_.socketPath()));
 }
 
 ExitStatus ServiceConnection::complainAbout(const client::Error& error) {

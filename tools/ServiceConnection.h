@@ -21,14 +21,15 @@ class ServiceConnection {
 public:
     explicit ServiceConnection(const Arguments& arguments);
 
-    /// Connects; else says so, and what to do about it.
-    [[nodiscard]] bool connect();
+    /// Connects; else complains, of a wrong option too, and answers the status to exit with.
+    [[nodiscard]] std::optional<ExitStatus> connect();
     [[nodiscard]] client::Client& client() noexcept { return client_; }
-    [[nodiscard]] std::chrono::milliseconds timeout() const noexcept { return timeout_; }
+    /// How long to wait for an answer; asked for only when the option is right, as `connect` finds.
+    [[nodiscard]] std::chrono::milliseconds timeout() const noexcept { return *timeout_; }
 
     /// Waits for the answer; without a good one, complains and answers the status to exit with.
     template <typename T> std::optional<ExitStatus> await(std::future<client::Result<T>>& future, T& value) {
-        if (!client_.wait(future, timeout_)) {
+        if (!client_.wait(future, timeout())) {
             return complain(ExitStatus::failed, "the service did not answer in time");
         }
         client::Result<T> result = future.get();
@@ -41,7 +42,7 @@ public:
     [[nodiscard]] static ExitStatus complainAbout(const client::Error& error);
 
 private:
-    std::chrono::milliseconds timeout_;
+    const std::optional<std::chrono::milliseconds> timeout_; ///< nothing: the option is wrong
     client::Client client_;
 };
 

@@ -21,7 +21,7 @@ std::string wordOf(const Value* value, std::string_view usual) {
 } // namespace
 
 std::variant<SessionLine, std::string> parseSessionLine(std::string_view text) {
-    auto object = parseJsonObject(text);
+    auto object = parseJsonObject(text, kForService);
     if (auto* wrong = std::get_if<std::string>(&object)) {
         return std::move(*wrong);
     }

@@ -1,8 +1,9 @@
 #include "base/Json.h"
 #include "tools/Arguments.h"
-#include "tools/AtomicFile.h"
+#include "tools/Files.h"
 #include "tools/Payload.h"
 #include "tools/RecordFilter.h"
+#include "tools/ServiceConnection.h"
 #include "tools/SessionFile.h"
 #include "tools/SessionPlayer.h"
 #include "tools/SinkFile.h"
@@ -21,6 +22,7 @@ namespace tamblo::tools {
 namespace {
 
 namespace fs = std::filesystem;
+using namespace std::chrono_literals;
 
 class TemporaryDirectory {
 public:
@@ -59,6 +61,7 @@ TEST(Payload, WordsAndObjectsAreRead) {
         {{"word"}, ""},
         {{"{}", "a=1"}, ""},
         {{R"({"a":1,"a":2})"}, ""},
+        {{R"({"a":{"b":[null]}})"}, ""},
     };
     for (const auto& row : cases) {
         const auto payload = parsePayload(row.words);
@@ -81,6 +84,30 @@ TEST(Arguments, OptionsAreTakenApart) {
     }
 }
 
+TEST(ServiceConnection, TheTimeoutIsANumberOfSeconds) {
+    const TemporaryDirectory directory;
+    const std::string socket = directory.file("nobody");
+    const struct {
+        std::string_view text;
+        ExitStatus status;
+        std::chrono::milliseconds timeout;
+    } cases[] = {
+        {"0", ExitStatus::unreachable, 0ms},   {".25", ExitStatus::unreachable, 250ms},
+        {"1e9", ExitStatus::unreachable, 24h}, {"abc", ExitStatus::usage, {}},
+        {"5s", ExitStatus::usage, {}},         {"-1", ExitStatus::usage, {}},
+        {"nan", ExitStatus::usage, {}},        {"", ExitStatus::usage, {}},
+    };
+    const Option options[] = {kSocketOption, kTimeoutOption};
+    for (const auto& row : cases) {
+        const std::string_view words[] = {"--socket", socket, "--timeout", row.text};
+        ServiceConnection service(std::get<Arguments>(Arguments::parse(options, words)));
+        EXPECT_EQ(service.connect(), row.status) << row.text;
+        if (row.status == ExitStatus::unreachable) {
+            EXPECT_EQ(service.timeout(), row.timeout) << row.text;
+        }
+    }
+}
+
 TEST(SessionFile, LinesAreReadAndWrongOnesRefused) {
     const auto parsed = parseSessionLine(
         R"({"offset_s": 0.5, "category": "Session_Playback", "type": 2, "payload": {"a": 1}, "note": "x"})");
@@ -96,7 +123,7 @@ TEST(SessionFile, LinesAreReadAndWrongOnesRefused) {
          {"", "[]", "{", R"({"type": "Start"})", R"({"category": "Nope"})", R"({"category": 14.5})",
           R"({"category": 14, "type": "Nope"})", R"({"category": 14, "type": 65536})",
           R"({"category": 14, "offset_s": -1})", R"({"category": 14, "offset_s": "1"})",
-          R"({"category": 14, "payload": [1]})"}) {
+          R"({"category": 14, "payload": [1]})", R"({"category": 14, "payload": {"a": null}})"}) {
         EXPECT_TRUE(std::holds_alternative<std::string>(parseSessionLine(wrong))) << wrong;
     }
 }
@@ -206,7 +233,7 @@ TEST(SinkFollower, ReadsWholeLinesThroughRotationsAndTornEnds) {
     EXPECT_EQ(sinkPath(directory.file(""), path), path);
 }
 
-TEST(AtomicFile, ReplacesOrLeavesAlone) {
+TEST(Files, ReplacesOrLeavesAlone) {
     const TemporaryDirectory directory;
     const std::string path = directory.file("a/b/file");
     EXPECT_TRUE(replaceFile(path, path + ".new", "x"));

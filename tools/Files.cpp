@@ -1,4 +1,4 @@
-#include "tools/AtomicFile.h"
+#include "tools/Files.h"
 
 #include "base/Format.h"
 
