@@ -6,19 +6,36 @@
 
 namespace tamblo::bench {
 
+namespace {
+
+int clientProcessorOf(Placement placement) {
+    return placement == Placement::free ? kAnyProcessor : clientProcessor();
+}
+
+} // namespace
+
 std::string_view describe(Placement placement) noexcept {
-    return placement == Placement::oneCore ? "one core" : "two cores";
+    switch (placement) {
+    case Placement::oneCore:
+        return "one core";
+    case Placement::twoCores:
+        return "two cores";
+    case Placement::free:
+        break;
+    }
+    return "free";
 }
 
 ServiceProcess::Settings Bench::place(Placement placement) const {
-    pinThisThread(clientProcessor());
-    return {tamblod_, placement == Placement::oneCore ? clientProcessor() : serviceProcessor(), {}};
+    pinThisThread(clientProcessorOf(placement));
+    return {
+        tamblod_, placement == Placement::twoCores ? serviceProcessor() : clientProcessorOf(placement), {}};
 }
 
 const SocketFloor& Bench::socketFloor(Placement placement) {
-    std::optional<SocketFloor>& floor = socketFloors_[placement == Placement::oneCore ? 0 : 1];
+    std::optional<SocketFloor>& floor = socketFloors_[static_cast<std::size_t>(placement)];
     if (!floor) {
-        floor = measureSocketFloor(clientProcessor(), place(placement).processor, quick_);
+        floor = measureSocketFloor(clientProcessorOf(placement), place(placement).processor, quick_);
     }
     return *floor;
 }

@@ -11,7 +11,8 @@
 
 namespace tamblo::bench {
 
-enum class Placement { oneCore, twoCores };
+/// Both ends on one processor, each on its own, or where the scheduler puts them.
+enum class Placement { oneCore, twoCores, free };
 [[nodiscard]] std::string_view describe(Placement placement) noexcept;
 
 /// One run of the benchmark: what was asked for on the command line, and the floors, which are measured once
@@ -36,12 +37,13 @@ private:
     std::string tamblod_;
     bool quick_;
     bool allMet_ = true;
-    std::optional<SocketFloor> socketFloors_[2];
+    std::optional<SocketFloor> socketFloors_[3];
 };
 
 // The scenarios. Each starts services of its own and prints its rows.
 void floorSocket(Bench& bench);
 void floorEcho(Bench& bench);
+void floorPaced(Bench& bench);
 void ingestPipelined(Bench& bench);
 void ingestOneEvent(Bench& bench);
 void ingestUnwanted(Bench& bench);

@@ -10,6 +10,7 @@
 #include <cerrno>
 #include <chrono>
 #include <system_error>
+#include <thread>
 
 #include <sys/socket.h>
 #include <unistd.h>
@@ -127,6 +128,10 @@ Echo::Echo(int callerProcessor, int echoProcessor) {
 
 Echo::~Echo() = default;
 
+pid_t Echo::pid() const noexcept {
+    return ends_->child.pid();
+}
+
 std::vector<double> Echo::roundTrips(std::size_t count) {
     const TextBuffer frame = framesOf(1);
     std::vector<char> answer(frame.size());
@@ -165,6 +170,28 @@ void floorEcho(Bench& bench) {
         ResultRow row("floor_echo");
         row.set("p50_us", quantile(times, 0.50));
         row.set("p99_us", quantile(times, 0.99));
+        row.set("placement", describe(placement));
+        bench.print(row);
+    }
+}
+
+void floorPaced(Bench& bench) {
+    constexpr std::size_t kFrames = 1000;
+    for (const Placement placement : {Placement::twoCores, Placement::oneCore}) {
+        const int echoProcessor = bench.place(placement).processor;
+        Echo echo(clientProcessor(), echoProcessor);
+        std::vector<double> cpu;
+        for (std::size_t repetition = 0; repetition < bench.repetitions(5); ++repetition) {
+            const Meter meter(echo.pid());
+            auto next = std::chrono::steady_clock::now();
+            for (std::size_t i = 0; i < kFrames; ++i) {
+                (void)echo.roundTrips(1);
+                std::this_thread::sleep_until(next += std::chrono::milliseconds(1));
+            }
+            cpu.push_back(microseconds(meter.service()) / kFrames);
+        }
+        ResultRow row("floor_paced");
+        row.set("service_cpu_us_per_message", median(cpu));
         row.set("placement", describe(placement));
         bench.print(row);
     }

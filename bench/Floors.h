@@ -4,6 +4,8 @@
 #include <memory>
 #include <vector>
 
+#include <sys/types.h>
+
 namespace tamblo::bench {
 
 /// What no service can do better than on this machine: the frames of the ingest scenarios through a bare
@@ -24,6 +26,7 @@ public:
     Echo(const Echo&) = delete;
     Echo& operator=(const Echo&) = delete;
 
+    [[nodiscard]] pid_t pid() const noexcept;
     /// The time of each of so many round trips, in microseconds.
     [[nodiscard]] std::vector<double> roundTrips(std::size_t count);
 

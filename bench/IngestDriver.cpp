@@ -52,11 +52,8 @@ void IngestDriver::send(std::size_t count) {
                                      answer<client::Nothing>())) {
                 throw std::runtime_error("the client library refuses a message");
             }
-            if (outstanding_ == inFlight_ / 2) {
-                client_.run(std::chrono::milliseconds(0));
-            }
         }
-        waitUntilOutstanding(inFlight_ / 2);
+        waitUntilOutstanding(inFlight_ - 1);
     }
     waitUntilOutstanding(0);
 }

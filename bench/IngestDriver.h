@@ -13,8 +13,8 @@
 namespace tamblo::bench {
 
 /// A client that reports as fast as it is let: the client library in caller mode, one session, so many
-/// messages in flight, an answer asked for each. It sends when half of its window is free again, so that both
-/// sides have work at the same time. An answer that is an error, or none for ten seconds, throws.
+/// messages in flight, an answer asked for each. It sends as
+/// many as were answered, at once. An answer that is an error, or none for ten seconds, throws.
 class IngestDriver {
 public:
     IngestDriver(const std::string& socketPath, const std::vector<Message>& messages, std::size_t inFlight);

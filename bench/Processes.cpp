@@ -73,11 +73,19 @@ int serviceProcessor() {
     return processors().size() > 1 ? processors()[1] : processors().front();
 }
 
-void pinThisThread(int processor) {
-    (void)processors(); // while they can still be seen
+cpu_set_t processorSet(int processor) {
     cpu_set_t set;
     CPU_ZERO(&set);
-    CPU_SET(static_cast<std::size_t>(processor), &set);
+    for (const int candidate : processors()) {
+        if (processor == kAnyProcessor || processor == candidate) {
+            CPU_SET(static_cast<std::size_t>(candidate), &set);
+        }
+    }
+    return set;
+}
+
+void pinThisThread(int processor) {
+    const cpu_set_t set = processorSet(processor);
     if (sched_setaffinity(0, sizeof set, &set) != 0) {
         fail("sched_setaffinity");
     }

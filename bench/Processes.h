@@ -4,6 +4,7 @@
 #include <cstddef>
 #include <cstdint>
 
+#include <sched.h>
 #include <sys/types.h>
 
 /// What the kernel knows of a process or a thread, and where it runs. Each throws `std::system_error` when
@@ -12,8 +13,12 @@ namespace tamblo::bench {
 
 /// The processor that the driving side runs on, and the one for the service when each has its own. The same
 /// one on a machine that has only one.
+/// In place of a processor: wherever the scheduler likes.
+inline constexpr int kAnyProcessor = -1;
 [[nodiscard]] int clientProcessor();
 [[nodiscard]] int serviceProcessor();
+/// The set of that one processor, or of all that this process was given.
+[[nodiscard]] cpu_set_t processorSet(int processor);
 void pinThisThread(int processor);
 
 [[nodiscard]] std::chrono::nanoseconds cpuTimeOfThisThread();

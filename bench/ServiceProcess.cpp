@@ -106,9 +106,7 @@ void ServiceProcess::start(const Settings& settings, const std::string& notifySo
     }
     std::string program = settings.program;
     std::array<char*, 2> arguments{program.data(), nullptr};
-    cpu_set_t processors;
-    CPU_ZERO(&processors);
-    CPU_SET(static_cast<std::size_t>(settings.processor), &processors);
+    const cpu_set_t processors = processorSet(settings.processor);
     const pid_t parent = ::getpid();
 
     startedAt_ = std::chrono::steady_clock::now();

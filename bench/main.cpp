@@ -21,6 +21,7 @@ struct Scenario {
 constexpr std::array kScenarios{
     Scenario{"floor_socket", "the frames through a bare socket, read and dropped", floorSocket},
     Scenario{"floor_echo", "one frame to another process and back", floorEcho},
+    Scenario{"floor_paced", "the same a thousand times a second, evenly", floorPaced},
     Scenario{"ingest_pipelined", "64 messages in flight, both events of each written", ingestPipelined},
     Scenario{"ingest_one_event", "the same with only the general event in use", ingestOneEvent},
     Scenario{"ingest_unwanted", "the same with no event in use", ingestUnwanted},
