@@ -1,8 +1,8 @@
 #pragma once
 
-#include <functional>
+#include "wire/Directories.h"
+
 #include <string>
-#include <string_view>
 #include <variant>
 
 namespace tamblo {
@@ -21,16 +21,7 @@ struct Directories {
     [[nodiscard]] std::string preferences() const { return configuration + "/preferences"; }
     [[nodiscard]] std::string deviceProperties() const { return configuration + "/device-properties.json"; }
 
-    /// What the places are worked out from.
-    struct Environment {
-        /// The value of a variable, empty when it is unset.
-        std::function<std::string(std::string_view name)> variable;
-        bool isRoot = false;
-        /// The user's home directory, empty when there is none.
-        std::string home;
-
-        static Environment ofThisProcess();
-    };
+    using Environment = wire::Environment;
 
     /// The three roots, without touching the file system, or a line that says what is missing and what to do.
     [[nodiscard]] static std::variant<Directories, std::string> find(const Environment& environment);

@@ -8,6 +8,7 @@
 #include "tools/SessionPlayer.h"
 #include "tools/SinkFile.h"
 
+#include <chrono>
 #include <cstdlib>
 #include <filesystem>
 #include <fstream>
