@@ -47,7 +47,7 @@ std::optional<std::string> placeOf(const Root& root, const Environment& environm
     if (environment.isRoot) {
         return std::string(root.forRoot);
     }
-    // A relative path in one of these variables counts as none (XDG Base Directory Specification).
+    // A relative path in one of these variables counts as none (the XDG rule for base directories).
     const std::string base = environment.variable(root.userVariable);
     if (base.starts_with('/')) {
         return withoutTrailingSlashes(base) + "/tamblo";
