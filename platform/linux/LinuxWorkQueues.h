@@ -8,7 +8,7 @@
 
 namespace tamblo {
 
-/// Serial queues as strands over one pool, and timers. Outlives the queues that it made.
+/// Serial queues as strands over one pool, and timers. Its queues are at rest, or gone, before it goes.
 class LinuxWorkQueues final : public WorkQueues {
 public:
     LinuxWorkQueues();
