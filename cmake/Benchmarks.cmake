@@ -19,7 +19,7 @@ if(benchmark_FOUND)
     endif()
     tamblo_program(tamblo_microbench
         GLOB bench/micro/*.cpp SOURCES bench/Payloads.cpp bench/TemporaryDirectory.cpp
-        LIBRARIES tests/fakes service workers platform/linux client wire)
+        LIBRARIES tests/fakes service workers system platform/linux client wire)
     if(TARGET tamblo_microbench)
         target_link_libraries(tamblo_microbench PRIVATE benchmark::benchmark benchmark::benchmark_main)
         target_compile_definitions(tamblo_microbench PRIVATE "BENCH_DIRECTORY=\"${CMAKE_BINARY_DIR}\"")

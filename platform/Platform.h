@@ -3,7 +3,9 @@
 #include "platform/AnalyticsEventService.h"
 #include "platform/Clock.h"
 #include "platform/ConnectionService.h"
+#include "platform/DeviceConditions.h"
 #include "platform/DeviceProperties.h"
+#include "platform/NamedNotifications.h"
 #include "platform/Preferences.h"
 #include "platform/ProcessInformation.h"
 #include "platform/StructuredLog.h"
@@ -21,7 +23,9 @@ struct Platform {
     TracePoints& tracePoints;
     DeviceProperties& deviceProperties;
     Preferences& preferences;
+    NamedNotifications& namedNotifications;
     ProcessInformation& processInformation;
+    DeviceConditions& deviceConditions;
     AnalyticsEventService& analyticsEvents;
     ConnectionService& connections;
 };

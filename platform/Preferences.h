@@ -3,7 +3,9 @@
 #include "base/Value.h"
 
 #include <optional>
+#include <string>
 #include <string_view>
+#include <utility>
 
 namespace tamblo {
 
@@ -14,6 +16,29 @@ public:
     /// The value that is stored now, or nothing.
     [[nodiscard]] virtual std::optional<Value> copyPreferenceValue(std::string_view key,
                                                                    std::string_view domain) const = 0;
+};
+
+/// The values of one domain, read as what the caller takes them for. Every call asks the store.
+class PreferencesSuite {
+public:
+    /// The store must outlive the suite.
+    PreferencesSuite(const Preferences& store, std::string domain)
+        : store_(store), domain_(std::move(domain)) {}
+
+    [[nodiscard]] bool hasValue(std::string_view key) const {
+        return store_.copyPreferenceValue(key, domain_).has_value();
+    }
+    /// A text as it stands and a number as a text; empty for anything else, and without a value.
+    [[nodiscard]] std::string stringValue(std::string_view key) const;
+    /// False without a value.
+    [[nodiscard]] bool boolValue(std::string_view key) const {
+        const std::optional<Value> value = store_.copyPreferenceValue(key, domain_);
+        return value && value->boolValue();
+    }
+
+private:
+    const Preferences& store_;
+    const std::string domain_;
 };
 
 } // namespace tamblo

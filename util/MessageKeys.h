@@ -12,6 +12,13 @@ inline constexpr std::string_view ZRReportingApplicationName = "HostApplicationD
 inline constexpr std::string_view kInvalidTimestampKey = "invalid_timestamp";
 inline constexpr std::string_view kAudioTagKey = "audiotag";
 
+/// What clients report and the derived summaries read.
+inline constexpr std::string_view ZRReportingMessageKeySessionDuration = "session_duration";
+inline constexpr std::string_view ZRReportingMessageKeySpatialAudioAccessoryFeature =
+    "spatial-audio-accessory-feature";
+inline constexpr std::string_view kSpatializationEnabledKey = "spatializationEnabled";
+inline constexpr std::string_view kRingerStateKey = "ringerstate";
+
 /// Published with the others; a payload that carries them is treated like any other.
 inline constexpr std::string_view ZRReportingSessionBlacklistFieldsKey = "_comparison_field_blacklist";
 inline constexpr std::string_view ZRReportingSessionThrottleSecondsKey = "_throttle_seconds";

@@ -34,7 +34,8 @@ void sessionSend(benchmark::State& state, Variety variety) {
     NoTracePoints noTracePoints;
     const Platform& fakes = platform();
     installPlatform({fakes.clock, fakes.workQueues, fakes.log, noTracePoints, fakes.deviceProperties,
-                     fakes.preferences, fakes.processInformation, noEvents, fakes.connections});
+                     fakes.preferences, fakes.namedNotifications, fakes.processInformation,
+                     fakes.deviceConditions, noEvents, fakes.connections});
     device.clock.set(std::chrono::time_point_cast<WallTime::duration>(std::chrono::system_clock::now()));
     const std::vector<Message> messages = makeMessages(kMessages, variety);
     const std::shared_ptr<ZRReportingSession> session = ZRReportingSession::initWithID(7, {1});

@@ -4,7 +4,9 @@
 #include "platform/linux/LinuxAnalyticsEventService.h"
 #include "platform/linux/LinuxClock.h"
 #include "platform/linux/LinuxConnectionService.h"
+#include "platform/linux/LinuxDeviceConditions.h"
 #include "platform/linux/LinuxDeviceProperties.h"
+#include "platform/linux/LinuxNamedNotifications.h"
 #include "platform/linux/LinuxPreferences.h"
 #include "platform/linux/LinuxProcessInformation.h"
 #include "platform/linux/LinuxSerialQueue.h"
@@ -96,6 +98,8 @@ struct LinuxPlatform::Services {
     LinuxClock clock;
     LinuxTracePoints tracePoints;
     LinuxProcessInformation processInformation;
+    LinuxDeviceConditions deviceConditions;
+    LinuxNamedNotifications namedNotifications;
     LinuxDeviceProperties deviceProperties;
     LinuxPreferences preferences;
     PreferenceChanges preferenceChanges;
@@ -135,7 +139,9 @@ Platform LinuxPlatform::services() {
             .tracePoints = services_->tracePoints,
             .deviceProperties = services_->deviceProperties,
             .preferences = services_->preferences,
+            .namedNotifications = services_->namedNotifications,
             .processInformation = services_->processInformation,
+            .deviceConditions = services_->deviceConditions,
             .analyticsEvents = services_->analyticsEvents,
             .connections = services_->connections};
 }

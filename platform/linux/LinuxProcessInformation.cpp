@@ -5,6 +5,8 @@
 #include "platform/linux/FileDescriptor.h"
 
 #include <array>
+#include <cerrno>
+#include <cstdlib>
 #include <ctime>
 
 #include <fcntl.h>
@@ -70,6 +72,17 @@ std::chrono::duration<double> LinuxProcessInformation::systemUptime() const noex
 
 std::chrono::microseconds LinuxProcessInformation::processorTime() const noexcept {
     return std::chrono::duration_cast<std::chrono::microseconds>(readClock(CLOCK_PROCESS_CPUTIME_ID));
+}
+
+std::variant<std::uint64_t, ProcessInformation::QueryError>
+LinuxProcessInformation::physicalFootprint() const {
+    return QueryError{ENOSYS, "not implemented"};
+}
+
+std::array<double, 3> LinuxProcessInformation::loadAverages() const {
+    std::array<double, 3> loads{};
+    (void)::getloadavg(loads.data(), 3);
+    return loads;
 }
 
 } // namespace tamblo

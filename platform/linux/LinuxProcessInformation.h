@@ -12,6 +12,8 @@ public:
     [[nodiscard]] std::optional<std::string> ProcessNameForPid(pid_t pid) const override;
     [[nodiscard]] std::chrono::duration<double> systemUptime() const noexcept override;
     [[nodiscard]] std::chrono::microseconds processorTime() const noexcept override;
+    [[nodiscard]] std::variant<std::uint64_t, QueryError> physicalFootprint() const override;
+    [[nodiscard]] std::array<double, 3> loadAverages() const override;
 };
 
 } // namespace tamblo

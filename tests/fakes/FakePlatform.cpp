@@ -9,8 +9,8 @@ namespace tamblo {
 FakePlatform::FakePlatform(LogLevel threshold, bool isInternalBuild) {
     log.setThreshold(threshold);
     deviceProperties.set("InternalBuild", isInternalBuild);
-    installPlatform({clock, workQueues, log, tracePoints, deviceProperties, preferences, processInformation,
-                     analyticsEvents, connections});
+    installPlatform({clock, workQueues, log, tracePoints, deviceProperties, preferences, namedNotifications,
+                     processInformation, deviceConditions, analyticsEvents, connections});
     forgetLogThresholds();
     forgetInternalBuild();
     resetReportingServerQueue();

@@ -4,8 +4,10 @@
 #include "tests/fakes/FakeAnalyticsEventService.h"
 #include "tests/fakes/FakeClock.h"
 #include "tests/fakes/FakeConnectionService.h"
+#include "tests/fakes/FakeDeviceConditions.h"
 #include "tests/fakes/FakeDeviceProperties.h"
 #include "tests/fakes/FakeLog.h"
+#include "tests/fakes/FakeNamedNotifications.h"
 #include "tests/fakes/FakePreferences.h"
 #include "tests/fakes/FakeProcessInformation.h"
 #include "tests/fakes/FakeTracePoints.h"
@@ -32,7 +34,9 @@ public:
     FakeTracePoints tracePoints;
     FakeDeviceProperties deviceProperties;
     FakePreferences preferences;
+    FakeNamedNotifications namedNotifications;
     FakeProcessInformation processInformation;
+    FakeDeviceConditions deviceConditions;
     FakeAnalyticsEventService analyticsEvents;
     FakeConnectionService connections;
 };
