@@ -31,6 +31,13 @@ struct WorkerClass {
     Factory initWithSession = nullptr;
 };
 
+/// The factory of a class whose workers need nothing but their session.
+template <typename Worker>
+[[nodiscard]] std::shared_ptr<ZRReportingSessionWorkerProtocol>
+initWithSession(const std::shared_ptr<ZRReportingSession>& session) {
+    return std::make_shared<Worker>(session);
+}
+
 /// All worker classes, in the order in which sessions make them. Defined outside this folder, which knows no
 /// worker.
 [[nodiscard]] std::span<const WorkerClass> workerClassList();

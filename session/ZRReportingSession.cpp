@@ -89,6 +89,7 @@ void ZRReportingSession::stop() {
     lastMessages_.clear();
     std::vector<MessageRef>().swap(messages_);
     totalMessageCount_ = 0;
+    ownRecordCount_ = 0;
     started_ = false;
 }
 
@@ -106,6 +107,7 @@ void ZRReportingSession::recordOwnMessage(AudioEventType type, std::string_view 
     addMissingDates(*message, platform().clock.now());
     addAudioMessageTag(*message);
     record(std::move(message));
+    ++ownRecordCount_;
 }
 
 void ZRReportingSession::record(MessageRef message) {

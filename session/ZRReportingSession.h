@@ -81,6 +81,10 @@ public:
     [[nodiscard]] const std::vector<MessageRef>& messages() const noexcept { return messages_; }
     [[nodiscard]] const Dictionary& previousValues() const noexcept { return previousValues_; }
     [[nodiscard]] std::int64_t totalMessageCount() const noexcept { return totalMessageCount_; }
+    /// How many of `messages` were sent to the session, its own records of start and stop aside.
+    [[nodiscard]] std::size_t acceptedMessageCount() const noexcept {
+        return messages_.size() - ownRecordCount_;
+    }
     [[nodiscard]] std::size_t workerInstanceCount() const noexcept { return messageWorkers_.size(); }
     [[nodiscard]] std::string description() const;
 
@@ -132,6 +136,7 @@ private:
     LastMessageIndex lastMessages_;
     Dictionary previousValues_;
     std::int64_t totalMessageCount_ = 0;
+    std::size_t ownRecordCount_ = 0; ///< among the messages
 
     Workers messageWorkers_;
     Workers consumingMessageWorkers_;

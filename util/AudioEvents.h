@@ -3,6 +3,7 @@
 #include "base/Dictionary.h"
 #include "base/Value.h"
 
+#include <chrono>
 #include <cstdint>
 #include <string>
 #include <string_view>
@@ -105,10 +106,11 @@ ZRReportingUtilityGenerateServiceTypeFromServiceName(std::string_view name) noex
 /// The value of "HostApplicationDisplayID", or the text "Unknown".
 [[nodiscard]] Value ZRReportingUtilityRetrieveAppName(const Dictionary& configuration);
 
-/// The playing time in seconds below which the volume summary leaves a playback out; the same for every
+/// A stretch of playing or recording has to be longer than this for a summary of its own; the same for every
 /// service.
-[[nodiscard]] constexpr double ZRReportingUtilityVolumeMinimumPlayingTime(AudioServiceType) noexcept {
-    return 0.5;
+[[nodiscard]] constexpr std::chrono::duration<double>
+ZRReportingUtilityVolumeMinimumPlayingTime(AudioServiceType) noexcept {
+    return std::chrono::duration<double>(0.5);
 }
 
 } // namespace tamblo

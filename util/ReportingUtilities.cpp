@@ -22,12 +22,8 @@ int roundedTo32Bits(double number) noexcept {
 
 bool ZRReportingUtilityKeyIsPresentAndHasChanged(std::string_view key, const Dictionary* first,
                                                  const Dictionary* second) noexcept {
-    if (first == nullptr || second == nullptr) {
-        return false;
-    }
-    const Value* before = first->find(key);
-    const Value* after = second->find(key);
-    return before != nullptr && after != nullptr && !(*before == *after);
+    return first != nullptr && second != nullptr &&
+           isPresentAndHasChanged(first->find(key), second->find(key));
 }
 
 double ZRReportingUtilityRoundWithPlaces(double value, int places) noexcept {

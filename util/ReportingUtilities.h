@@ -8,6 +8,10 @@
 
 namespace tamblo {
 
+/// Whether both values are there and differ.
+[[nodiscard]] inline bool isPresentAndHasChanged(const Value* before, const Value* after) noexcept {
+    return before != nullptr && after != nullptr && !(*before == *after);
+}
 /// Whether both dictionaries are there, both hold the key, and the values differ.
 [[nodiscard]] bool ZRReportingUtilityKeyIsPresentAndHasChanged(std::string_view key, const Dictionary* first,
                                                                const Dictionary* second) noexcept;

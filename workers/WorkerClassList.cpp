@@ -1,4 +1,8 @@
 #include "session/WorkerClass.h"
+#include "workers/producers/ZRReportingSessionInputMessagesWorker.h"
+#include "workers/producers/ZRReportingSessionKaleenMessagesWorker.h"
+#include "workers/producers/ZRReportingSessionSummaryWorker.h"
+#include "workers/producers/ZRReportingSessionVolumeMessagesWorker.h"
 #include "workers/sinks/ZRReportingSessionEventryWorker.h"
 
 #include <array>
@@ -14,15 +18,23 @@ constexpr WorkerRole kWorkerOnly{};
 
 constexpr std::array<WorkerClass, 17> kWorkerClasses{{
     {.name = "ZRReportingSessionTraceWorker", .role = kWorkerOnly},
-    {.name = "ZRReportingSessionVolumeMessagesWorker", .role = kProducer},
-    {.name = "ZRReportingSessionKaleenMessagesWorker", .role = kProducer},
-    {.name = "ZRReportingSessionSummaryWorker", .role = kProducerAndConsumer},
-    {.name = "ZRReportingSessionInputMessagesWorker", .role = kProducer},
+    {.name = "ZRReportingSessionVolumeMessagesWorker",
+     .role = kProducer,
+     .initWithSession = initWithSession<ZRReportingSessionVolumeMessagesWorker>},
+    {.name = "ZRReportingSessionKaleenMessagesWorker",
+     .role = kProducer,
+     .initWithSession = initWithSession<ZRReportingSessionKaleenMessagesWorker>},
+    {.name = "ZRReportingSessionSummaryWorker",
+     .role = kProducerAndConsumer,
+     .initWithSession = initWithSession<ZRReportingSessionSummaryWorker>},
+    {.name = "ZRReportingSessionInputMessagesWorker",
+     .role = kProducer,
+     .initWithSession = initWithSession<ZRReportingSessionInputMessagesWorker>},
     {.name = "ZRReportingSessionEventryWorker",
      .role = kConsumer,
      .startOnInit = true,
      .handleSingleMessageSession = true,
-     .initWithSession = ZRReportingSessionEventryWorker::initWithSession},
+     .initWithSession = initWithSession<ZRReportingSessionEventryWorker>},
     {.name = "ZRReportingSessionJouleryWorker",
      .role = kConsumer,
      .startOnInit = true,

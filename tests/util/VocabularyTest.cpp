@@ -78,7 +78,7 @@ TEST(VocabularyTest, ServiceNames) {
     for (const char* name : {"unknown", "Telephony", ""}) {
         EXPECT_EQ(ZRReportingUtilityGenerateServiceTypeFromServiceName(name), 65535) << name;
     }
-    EXPECT_EQ(ZRReportingUtilityVolumeMinimumPlayingTime(AudioServiceTypeHaptics), 0.5);
+    EXPECT_EQ(ZRReportingUtilityVolumeMinimumPlayingTime(AudioServiceTypeHaptics).count(), 0.5);
     EXPECT_EQ(ZRReportingUtilityRetrieveAppName({}).stringValue(), "Unknown");
     EXPECT_EQ(ZRReportingUtilityRetrieveAppName({{"HostApplicationDisplayID", 7}}).integerValue(), 7);
 }

@@ -45,11 +45,6 @@ void offer(const std::string& eventName, const ZRReportingSessionMessage& messag
 
 } // namespace
 
-std::shared_ptr<ZRReportingSessionWorkerProtocol>
-ZRReportingSessionEventryWorker::initWithSession(const std::shared_ptr<ZRReportingSession>& session) {
-    return std::make_shared<ZRReportingSessionEventryWorker>(session);
-}
-
 void ZRReportingSessionEventryWorker::handleMessage(const MessageRef& message) {
     const std::shared_ptr<ZRReportingSession> owner = session();
     if (owner == nullptr) {

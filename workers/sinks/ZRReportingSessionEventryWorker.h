@@ -2,8 +2,6 @@
 
 #include "session/ZRReportingSessionWorkerProtocol.h"
 
-#include <memory>
-
 namespace tamblo {
 
 /// Offers every message that is not redundant to the analytics-event service, under two names: one of the
@@ -12,8 +10,6 @@ namespace tamblo {
 class ZRReportingSessionEventryWorker final : public ZRReportingSessionWorkerConsumerProtocol {
 public:
     using ZRReportingSessionWorkerConsumerProtocol::ZRReportingSessionWorkerConsumerProtocol;
-    [[nodiscard]] static std::shared_ptr<ZRReportingSessionWorkerProtocol>
-    initWithSession(const std::shared_ptr<ZRReportingSession>& session);
 
     void handleMessage(const MessageRef& message) override;
 };

@@ -1,0 +1,13 @@
+#include "workers/PayloadFields.h"
+
+namespace tamblo {
+
+void FieldPlaces::find(const KeySet& keySet, Known& known) const {
+    known.keySet = KeySetRef(&keySet);
+    for (std::size_t i = 0; i < keys_.size(); ++i) {
+        const std::size_t place = keySet.find(keys_[i]);
+        known.places[i] = place != KeySet::kNotFound ? static_cast<std::uint32_t>(place) : kAbsent;
+    }
+}
+
+} // namespace tamblo

@@ -1,0 +1,109 @@
+#include "workers/producers/SegmentWalk.h"
+
+#include "base/Format.h"
+#include "util/LogText.h"
+#include "util/MessageKeys.h"
+#include "util/NumberBuckets.h"
+#include "util/SummaryBuckets.h"
+#include "workers/ZRReportingSessionWorkerUtility.h"
+
+#include <algorithm>
+#include <array>
+#include <limits>
+#include <memory>
+#include <utility>
+
+namespace tamblo {
+
+namespace {
+
+double secondsOf(const Value* timestamp) noexcept {
+    return timestamp != nullptr ? timestamp->doubleValue() : 0.0;
+}
+
+void appendTimestamp(std::string& out, std::string_view name, const Value* timestamp) {
+    appendFormatted(out, "{}={}, {}_double={}", name, OptionalValue{timestamp}, name, secondsOf(timestamp));
+}
+
+} // namespace
+
+Seconds SegmentStart::until(const Value* timestamp) const noexcept {
+    return Seconds(secondsOf(timestamp) - secondsOf(timestamp_));
+}
+
+bool differAsTexts(const Value* left, const Value* right) noexcept {
+    return left != nullptr && right != nullptr && left->stringValue() != right->stringValue();
+}
+
+bool differAsNumbers(const Value* left, const Value* right) noexcept {
+    if (left == nullptr || right == nullptr) {
+        return false;
+    }
+    // Numbers are compared exactly, beyond what a double holds; anything else by the number that it reads as.
+    return left->isNumber() && right->isNumber() ? !(*left == *right)
+                                                 : left->doubleValue() != right->doubleValue();
+}
+
+bool differAsIntegers(const Value* left, const Value* right) noexcept {
+    return left != nullptr && right != nullptr && left->integerValue() != right->integerValue();
+}
+
+bool differAsBooleans(const Value* left, const Value* right) noexcept {
+    return left != nullptr && right != nullptr && left->boolValue() != right->boolValue();
+}
+
+Value singleSeconds(Seconds length) noexcept {
+    constexpr double kMost = std::numeric_limits<float>::max();
+    // A far-fetched timestamp must not make a number that a float cannot hold: the language leaves open what
+    // becomes of it.
+    if (length.count() > kMost) {
+        return std::numeric_limits<float>::infinity();
+    }
+    return static_cast<float>(std::max(length.count(), -kMost));
+}
+
+Value bucketText(double number, std::span<const double> buckets, unsigned fractionDigits) {
+    return ZRReportingUtilityBucketNumberToString(number, buckets, fractionDigits).value_or("");
+}
+
+Value timeBucketText(Seconds length) {
+    return bucketText(length.count(), kTimeBuckets, 0);
+}
+
+ZRReportingSessionMessage& DerivedMessages::add(Dictionary payload, AudioEventCategory category) {
+    return *messages_.emplace_back(
+        std::make_shared<ZRReportingSessionMessage>(std::move(payload), category, AudioEventTypeSummary));
+}
+
+std::vector<MessageRef> DerivedMessages::take() {
+    for (const MessageRef& message : messages_) {
+        message->editPayload([this](Dictionary& payload) { payload.set("msgcnt", messages_.size()); });
+    }
+    return std::exchange(messages_, {});
+}
+
+std::vector<MessageRef> combineSpatialAudioSettings(const std::vector<MessageRef>& messages,
+                                                    Seconds longestPause) {
+    static constexpr std::array<std::string_view, 2> kSettings{
+        ZRReportingMessageKeySpatialAudioAccessoryFeature, kSpatializationEnabledKey};
+    return ZRReportingSessionWorkerUtility::combineRapidMessages(messages, kSettings, longestPause);
+}
+
+void appendText(std::string& out, const OptionalValue& optional) {
+    if (optional.value != nullptr) {
+        appendText(out, *optional.value);
+    } else {
+        out += "(null)";
+    }
+}
+
+void appendText(std::string& out, const SegmentTimes& times) {
+    appendFormatted(out, "{} { func={}, {}={}, ", times.name, times.function, times.name,
+                    times.start.until(times.timestamp).count());
+    appendTimestamp(out, "zrTimestamp", times.timestamp);
+    out += ", ";
+    appendTimestamp(out, "startZrTimestamp", times.start.timestamp());
+    out += " }";
+}
+
+} // namespace tamblo

@@ -1,0 +1,178 @@
+#include "workers/producers/ZRReportingSessionKaleenMessagesWorker.h"
+
+#include "session/WorkerClass.h"
+#include "session/ZRReportingSession.h"
+#include "util/InternalBuild.h"
+#include "util/Log.h"
+#include "util/MessageKeys.h"
+#include "workers/PayloadFields.h"
+#include "workers/producers/SegmentWalk.h"
+
+#include <memory>
+#include <string_view>
+#include <utility>
+
+namespace tamblo {
+
+namespace {
+
+/// What "kaleen_session" says of playback that belongs to a group session.
+constexpr std::int64_t kInGroupSession = 1;
+
+enum class Field { timestamp, running, duration, group, channels, formatID, devices, format, count };
+using Fields = PayloadFields<Field>;
+
+constexpr Fields::Keys kKeys{ZRReportingInternalEventEpochTime,
+                             kOutputRunningKey,
+                             ZRReportingMessageKeySessionDuration,
+                             kGroupSessionKey,
+                             kChannelsPerFrameKey,
+                             kFormatIDKey,
+                             kActiveDevicesKey,
+                             kSelectedFormatKey};
+
+constexpr std::string_view kFunction = "createKaleenMessages";
+
+const Dictionary& defaults() {
+    static const Dictionary values{{kSelectedFormatKey, kUnknownSetting},
+                                   {kActiveDevicesKey, kUnknownSetting},
+                                   {kFormatIDKey, kUnknownSetting},
+                                   {kChannelsPerFrameKey, -1}};
+    return values;
+}
+
+/// The only workers that get the summaries.
+DestinationWorkers destinations() {
+    DestinationWorkers workers;
+    for (const std::string_view name :
+         {"ZRReportingSessionEventryWorker", "ZRReportingSessionSummaryJsonFileWorker"}) {
+        if (const WorkerClass* workerClass = workerClassNamed(name)) {
+            workers.push_back(workerClass);
+        }
+    }
+    return workers;
+}
+
+bool isInGroup(const Fields& fields) noexcept {
+    return fields.holds(Field::group) && fields[Field::group]->integerValue() == kInGroupSession;
+}
+
+/// Whether a setting that both hold differs.
+bool watchedFieldChangeInMessage(const Fields& message, const Fields& previous) noexcept {
+    return differAsBooleans(message[Field::running], previous[Field::running]) ||
+           differAsIntegers(message[Field::group], previous[Field::group]) ||
+           differAsIntegers(message[Field::channels], previous[Field::channels]) ||
+           differAsTexts(message[Field::formatID], previous[Field::formatID]) ||
+           differAsTexts(message[Field::devices], previous[Field::devices]);
+}
+
+/// One walk over a session's messages.
+class KaleenWalk {
+public:
+    KaleenWalk(Dictionary previousValues, Seconds minimum)
+        : previousValues_(std::move(previousValues)), minimum_(minimum), state_(previousValues_, places_) {
+        isPlaying_ = state_.isTrue(Field::running);
+        isInGroup_ = isInGroup(state_);
+        if (isPlaying_ && isInGroup_) {
+            start_.begin(state_[Field::timestamp]);
+        }
+    }
+
+    void take(const Dictionary& payload) {
+        const Fields message(payload, places_);
+        const bool wasInGroupPlayback = state_.isTrue(Field::running) && isInGroup(state_);
+        takePlayingState(message);
+        const bool isStopped = message.holds(Field::duration);
+        if (start_.isKnown() &&
+            (isStopped || (wasInGroupPlayback && watchedFieldChangeInMessage(message, state_)))) {
+            endSegment(message[Field::timestamp]);
+        }
+        state_.merge(message);
+    }
+
+    [[nodiscard]] std::vector<MessageRef> finish() { return derived_.take(); }
+
+private:
+    void takePlayingState(const Fields& message) {
+        if (message.holds(Field::running)) {
+            isPlaying_ = message.isTrue(Field::running);
+        }
+        if (message.holds(Field::group)) {
+            isInGroup_ = isInGroup(message);
+        }
+        if (!start_.isKnown() && isPlaying_ && isInGroup_) {
+            start_.begin(message[Field::timestamp]);
+        }
+        if (message.holds(Field::duration)) {
+            isPlaying_ = false;
+            isInGroup_ = false;
+        }
+    }
+
+    void endSegment(const Value* timestamp) {
+        const Seconds playingTime = start_.until(timestamp);
+        log::debug(ZRReportingSessionCategory(), "{}",
+                   SegmentTimes{"playingTime", kFunction, start_, timestamp});
+        if (playingTime > minimum_ && isInGroup(state_)) {
+            ZRReportingSessionMessage& message = derived_.add(summary(playingTime), AudioEventKindKaleen);
+            if (!ZRReportingUtilityIsInternalBuild()) {
+                message.setDestinationWorkers(destinations());
+            }
+            log::debug(ZRReportingSessionCategory(), "added kaleen message { func={}, action=add, count={} }",
+                       kFunction, derived_.count());
+        } else {
+            log::debug(ZRReportingSessionCategory(),
+                       "skipped kaleen message, too short or not actually an kaleen session { func={}, "
+                       "action=skip, count={} }",
+                       kFunction, derived_.count());
+        }
+        start_.begin(isPlaying_ && isInGroup_ ? timestamp : nullptr);
+    }
+
+    /// What was in force in the segment, else the default.
+    [[nodiscard]] const Value& coalesceKey(Field field, std::string_view key) const {
+        return state_.holds(field) ? *state_[field] : *defaults().find(key);
+    }
+
+    [[nodiscard]] Dictionary summary(Seconds playingTime) const {
+        return {{kSelectedFormatKey, coalesceKey(Field::format, kSelectedFormatKey)},
+                {kActiveDevicesKey, coalesceKey(Field::devices, kActiveDevicesKey)},
+                {kFormatIDKey, coalesceKey(Field::formatID, kFormatIDKey)},
+                {kChannelsPerFrameKey, coalesceKey(Field::channels, kChannelsPerFrameKey)},
+                {"play_seconds", singleSeconds(playingTime)},
+                {"play_secondsBucketed", timeBucketText(playingTime)},
+                {kMessageIndexKey, derived_.nextIndex()}};
+    }
+
+    const Dictionary previousValues_;
+    const Seconds minimum_;
+    FieldPlaces places_{kKeys};
+    /// The latest value of each key, up to the message before the one at hand.
+    Fields state_;
+    bool isPlaying_ = false;
+    bool isInGroup_ = false;
+    SegmentStart start_;
+    DerivedMessages derived_;
+};
+
+} // namespace
+
+void ZRReportingSessionKaleenMessagesWorker::stop() {
+    deriveAtStop(session(), "kaleen event", [this](const ZRReportingSession& owner, Seconds minimum) {
+        return createKaleenMessages(owner.messages(), minimum);
+    });
+}
+
+std::vector<MessageRef>
+ZRReportingSessionKaleenMessagesWorker::createKaleenMessages(const std::vector<MessageRef>& messages,
+                                                             Seconds minimumPlaytime) const {
+    log::debug(ZRReportingSessionCategory(), "entering createKaleenMessages {}", kFunction);
+    const std::shared_ptr<ZRReportingSession> owner = session();
+    KaleenWalk walk(owner != nullptr ? owner->previousValues() : Dictionary(), minimumPlaytime);
+    for (const MessageRef& message : messages) {
+        walk.take(message->payload());
+    }
+    return walk.finish();
+}
+
+} // namespace tamblo

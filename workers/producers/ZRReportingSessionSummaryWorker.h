@@ -1,0 +1,38 @@
+#pragma once
+
+#include "session/ZRReportingSessionWorkerProtocol.h"
+
+#include <cstdint>
+#include <memory>
+#include <optional>
+
+namespace tamblo {
+
+/// Counts, while its session runs, how long the session's audio was active and how many overloads were
+/// reported, and sends the session one summary of itself when it stops: activity, messages, who reported,
+/// and the state of the device.
+///
+/// The counts go on over all runs of the session. A producer that is offered messages as well; its own
+/// summary comes back to it and counts nothing.
+class ZRReportingSessionSummaryWorker final : public ZRReportingSessionWorkerConsumerProtocol {
+public:
+    using ZRReportingSessionWorkerConsumerProtocol::ZRReportingSessionWorkerConsumerProtocol;
+
+    std::optional<bool> start() override { return true; }
+    void handleMessage(const MessageRef& message) override;
+    void stop() override;
+
+    /// Messages with a length of activity, and the sum of those lengths in seconds.
+    [[nodiscard]] std::uint32_t activeCount() const noexcept { return activeCount_; }
+    [[nodiscard]] double totalActiveTime() const noexcept { return totalActiveTime_; }
+    [[nodiscard]] std::uint32_t overloadCount() const noexcept { return overloadCount_; }
+
+private:
+    [[nodiscard]] Dictionary summaryOf(const ZRReportingSession& session) const;
+
+    std::uint32_t activeCount_ = 0;
+    std::uint32_t overloadCount_ = 0;
+    double totalActiveTime_ = 0.0;
+};
+
+} // namespace tamblo
