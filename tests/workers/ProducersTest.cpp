@@ -1,0 +1,421 @@
+#include "base/Json.h"
+#include "session/ZRReportingSession.h"
+#include "tests/fakes/FakePlatform.h"
+#include "util/InternalBuild.h"
+#include "workers/producers/ZRReportingSessionInputMessagesWorker.h"
+#include "workers/producers/ZRReportingSessionKaleenMessagesWorker.h"
+#include "workers/producers/ZRReportingSessionVolumeMessagesWorker.h"
+
+#include <gmock/gmock.h>
+
+#include <cmath>
+#include <limits>
+#include <string>
+#include <utility>
+#include <vector>
+
+namespace tamblo {
+namespace {
+
+using testing::ElementsAre;
+using testing::IsEmpty;
+using Payloads = std::vector<Dictionary>;
+using Lines = std::vector<std::string>;
+
+constexpr double kMinimum = 5;
+
+Dictionary at(const Value& time, Dictionary payload) {
+    payload.set("zrreporting_timestamp", time);
+    return payload;
+}
+Dictionary at(double time, Dictionary payload) {
+    return at(Value(time), std::move(payload));
+}
+
+std::vector<MessageRef> records(const Payloads& payloads) {
+    std::vector<MessageRef> messages;
+    for (const Dictionary& payload : payloads) {
+        messages.push_back(std::make_shared<ZRReportingSessionMessage>(payload, 5, 0));
+    }
+    return messages;
+}
+
+/// The values of some keys of each message as JSON, with blanks between; a key that is absent is left out.
+Lines shown(const std::vector<MessageRef>& messages, std::initializer_list<std::string_view> keys) {
+    Lines lines;
+    for (const MessageRef& message : messages) {
+        std::string line;
+        for (const std::string_view key : keys) {
+            if (const Value* value = message->payload().find(key)) {
+                line += (line.empty() ? "" : " ") + jsonText(*value);
+            }
+        }
+        lines.push_back(line);
+    }
+    return lines;
+}
+
+struct Case {
+    const char* what;
+    Payloads messages;
+    Lines expected;
+    Dictionary previous = {};
+};
+
+class ProducersTest : public testing::Test {
+protected:
+    std::shared_ptr<ZRReportingSession> sessionWith(const Dictionary& previous) {
+        auto session = ZRReportingSession::initWithID(5, {1});
+        session->addPreviousValues(previous);
+        return session;
+    }
+
+    FakePlatform device{LogLevel::standard};
+    const Value process = "com.example.player";
+    const Dictionary playing{{"session_output_running", true}, {"QVSessionVolume", 0.5}};
+};
+
+TEST_F(ProducersTest, VolumeSegments) {
+    const Case cases[] = {
+        {"a volume change and the end; exactly the minimum is too short",
+         {at(10, playing), at(20, {{"QVSessionVolume", 0.8}}), at(25, {{"session_output_running", false}})},
+         {"10.0 0.5 \"unknown\" false 1 1"}},
+        {"just above the minimum",
+         {at(10, playing), at(20, {{"QVSessionVolume", 0.8}}), at(25.5, {{"session_output_running", false}})},
+         {"10.0 0.5 \"unknown\" false 1 2", "5.5 0.8 \"unknown\" false 2 2"}},
+        {"the session's length ends a segment, and playing with it",
+         {at(0, playing), at(6, {{"session_duration", 6.0}}), at(20, {{"QVSessionVolume", 1}}),
+          at(30, {{"session_output_running", false}})},
+         {"6.0 0.5 \"unknown\" false 1 1"}},
+        {"a format change while nothing plays",
+         {at(0, {{"session_selected_format", "A"}, {"QVSessionVolume", 1}}),
+          at(9, {{"session_selected_format", "B"}}), at(20, {{"session_duration", 20}})},
+         {}},
+        {"each watched setting ends one; carried settings alone do not",
+         {at(0, playing), at(10, {{"mFormatID", "x"}, {"mChannelsPerFrame", 2}}),
+          at(20, {{"ringerstate", true}}), at(30, {{"spatializationEnabled", true}}),
+          at(40, {{"active_devices", "D"}}), at(50, {{"active_devices", "E"}}),
+          at(60, {{"spatial-audio-accessory-feature", true}}), at(70, {{"session_output_running", false}})},
+         {"20.0 0.5 \"unknown\" false 1 5", "10.0 0.5 \"unknown\" true 2 5", "10.0 0.5 \"unknown\" true 3 5",
+          "10.0 0.5 \"D\" true 4 5", "20.0 0.5 \"E\" true 5 5"}},
+        {"two spatial settings three seconds apart are one change",
+         {at(0, playing), at(10, {{"spatial-audio-accessory-feature", true}}),
+          at(13, {{"spatializationEnabled", true}}), at(30, {{"session_output_running", false}})},
+         {"13.0 0.5 \"unknown\" false 1 2", "17.0 0.5 \"unknown\" false 2 2"}},
+        {"no volume is known",
+         {at(0, {{"session_output_running", true}}), at(10, {{"session_output_running", false}})},
+         {}},
+        {"a session that begins already playing ends nothing until output is said to run anew",
+         {at(10, {{"QVSessionVolume", 0.9}}), at(20, {{"session_duration", 20}})},
+         {},
+         at(1, playing)},
+        {"then the segment begins where it was said",
+         {at(10, {{"QVSessionVolume", 0.9}}), at(20, {{"session_output_running", true}}),
+          at(30, {{"session_duration", 20}})},
+         {"10.0 0.9 \"Speaker\" false 1 1"},
+         at(1, {{"session_output_running", true}, {"QVSessionVolume", 0.5}, {"active_devices", "Speaker"}})},
+        {"output that is said twice to run goes on; timestamps that run backwards make nothing",
+         {at(50, playing), at(60, {{"session_output_running", true}}),
+          at(40, {{"session_output_running", false}})},
+         {}},
+    };
+    for (const Case& row : cases) {
+        SCOPED_TRACE(row.what);
+        const auto session = sessionWith(row.previous);
+        const ZRReportingSessionVolumeMessagesWorker worker(session);
+        const auto derived = worker.createVolumeMessages(records(row.messages), &process,
+                                                         std::chrono::duration<double>(kMinimum));
+        EXPECT_EQ(shown(derived, {"play_seconds", "QVSessionVolume", "active_devices", "ringerstate",
+                                  "msgidx", "msgcnt"}),
+                  row.expected);
+        EXPECT_THAT(worker.createVolumeMessages(records(row.messages), nullptr, {}), IsEmpty());
+    }
+}
+
+TEST_F(ProducersTest, AVolumeSummaryHasExactlyTheseKeys) {
+    const auto session = sessionWith({});
+    const ZRReportingSessionVolumeMessagesWorker worker(session);
+    Dictionary start = playing;
+    start.merge({{"session_selected_format", "AAC"},
+                 {"active_devices", "D"},
+                 {"mFormatID", "aac"},
+                 {"mChannelsPerFrame", 2},
+                 {"other", 1}});
+    const auto derived = worker.createVolumeMessages(
+        records({at(0, start), at(75.25, {{"session_duration", 75}})}), &process, {});
+    ASSERT_EQ(derived.size(), 1U);
+    EXPECT_EQ(derived[0]->category(), AudioEventKindVolume);
+    EXPECT_EQ(derived[0]->type(), AudioEventTypeSummary);
+    EXPECT_EQ(derived[0]->payload(), (Dictionary{{"session_selected_format", "AAC"},
+                                                 {"mFormatID", "aac"},
+                                                 {"active_devices", "D"},
+                                                 {"HostApplicationDisplayID", "com.example.player"},
+                                                 {"QVSessionVolume", 0.5},
+                                                 {"QVSessionVolumeBucketed", "0.5"},
+                                                 {"play_seconds", 75.25F},
+                                                 {"spatial-audio-accessory-feature", false},
+                                                 {"spatializationEnabled", false},
+                                                 {"ringerstate", false},
+                                                 {"mChannelsPerFrame", 2},
+                                                 {"play_secondsBucketed", "60"},
+                                                 {"msgidx", 1},
+                                                 {"msgcnt", 1}}));
+    EXPECT_EQ(derived[0]->payload().find("play_seconds")->kind(), Value::Kind::singleFloat);
+}
+
+TEST_F(ProducersTest, InputSegments) {
+    const Dictionary running{{"session_input_running", true}, {"active_devices", "A"}};
+    const Case cases[] = {
+        {"a device change and the end, the last stretch too short",
+         {at(0, running), at(10, {{"active_devices", "B"}}), at(12, {{"session_duration", 12}})},
+         {"10.0 \"A\" 1 1"}},
+        {"vocoders: sorted, one that does not run left out, each segment its own",
+         {at(0, running), at(1, {{"vp_config_primary_vocoder", "b"}, {"vp_config_primary_vocoderFs", "1"}}),
+          at(2, {{"vp_config_primary_vocoder", "a"}, {"vp_config_primary_vocoderFs", "2"}}),
+          at(3, {{"vp_config_primary_vocoder", "none"}, {"vp_config_primary_vocoderFs", "0.0"}}),
+          at(4, {{"vp_config_primary_vocoder", "n"}, {"vp_config_primary_vocoderFs", 16000}}),
+          at(10, {{"active_devices", "B"}}), at(20, {{"session_input_running", false}})},
+         {"10.0 \"A\" \"a:2,b:1,n:16000\" 1 2", "10.0 \"B\" 2 2"}},
+        {"the vocoders of a stretch that is too short go to the next",
+         {at(0, running), at(1, {{"vp_config_primary_vocoder", "v"}}), at(2, {{"active_devices", "B"}}),
+          at(20, {{"session_input_running", false}})},
+         {"18.0 \"B\" \"v:(null)\" 1 1"}},
+        {"input that was running before opens no segment",
+         {at(10, {{"active_devices", "B"}}), at(20, {{"session_duration", 12}})},
+         {},
+         at(0, running)},
+        {"a length with input still said to run ends one segment and begins another",
+         {at(0, running), at(10, {{"session_duration", 10}, {"session_input_running", true}}),
+          at(30, {{"session_input_running", false}})},
+         {"10.0 \"A\" 1 2", "20.0 \"A\" 2 2"}},
+        {"without timestamps", {running, {{"session_input_running", false}}}, {}},
+    };
+    for (const Case& row : cases) {
+        SCOPED_TRACE(row.what);
+        const auto session = sessionWith(row.previous);
+        const ZRReportingSessionInputMessagesWorker worker(session);
+        const auto derived = worker.createInputMessages(records(row.messages), &process,
+                                                        std::chrono::duration<double>(kMinimum));
+        EXPECT_EQ(shown(derived, {"inputrunning_seconds", "active_devices", "vocoders", "msgidx", "msgcnt"}),
+                  row.expected);
+        EXPECT_THAT(worker.createInputMessages(records(row.messages), nullptr, {}), IsEmpty());
+    }
+    const auto session = sessionWith({{"vp_config_input_port", "Mic"}});
+    const ZRReportingSessionInputMessagesWorker worker(session);
+    const auto derived = worker.createInputMessages(
+        records({at(0, running), at(7, {{"session_input_running", false}})}), &process, {});
+    ASSERT_EQ(derived.size(), 1U);
+    EXPECT_EQ(derived[0]->category(), AudioEventKindInput);
+    EXPECT_EQ(derived[0]->payload(), (Dictionary{{"HostApplicationDisplayID", process},
+                                                 {"inputrunning_seconds", 7.0F},
+                                                 {"inputrunning_secondsBucketed", "5"},
+                                                 {"msgidx", 1},
+                                                 {"vp_config_operation_mode", "unknown"},
+                                                 {"vp_config_input_port", "Mic"},
+                                                 {"active_devices", "A"},
+                                                 {"msgcnt", 1}}));
+}
+
+TEST_F(ProducersTest, GroupSessionSegments) {
+    const Dictionary inGroup{{"session_output_running", true}, {"kaleen_session", 1}, {"mFormatID", "F1"}};
+    const Case cases[] = {
+        {"a format change and the end",
+         {at(0, inGroup), at(30, {{"mFormatID", "F2"}}), at(40, {{"session_duration", 40}})},
+         {"30.0 \"F1\" -1 \"unknown\" 1 2", "10.0 \"F2\" -1 \"unknown\" 2 2"}},
+        {"never in a group, or in none that counts",
+         {at(0, {{"session_output_running", true}, {"kaleen_session", 0}}), at(10, {{"kaleen_session", 2}}),
+          at(40, {{"session_duration", 40}})},
+         {}},
+        {"the selected format is reported and not watched; a key that only one has is no change",
+         {at(0, inGroup), at(10, {{"session_selected_format", "S"}}), at(20, {{"mChannelsPerFrame", 2}}),
+          at(30, {{"mChannelsPerFrame", 6}}), at(40, {{"session_output_running", false}})},
+         {"30.0 \"F1\" 2 \"S\" 1 2", "10.0 \"F1\" 6 \"S\" 2 2"}},
+        {"joining and leaving while output runs",
+         {at(0, {{"session_output_running", true}}), at(10, {{"kaleen_session", 1}}),
+          at(20, {{"kaleen_session", 0}}), at(60, {{"session_duration", 1}})},
+         {"10.0 \"unknown\" -1 \"unknown\" 1 1"}},
+        {"what was before counts from its own time",
+         {at(10, {{"mFormatID", "F2"}}), at(17, {{"session_duration", 1}})},
+         {"8.0 \"F1\" -1 \"unknown\" 1 2", "7.0 \"F2\" -1 \"unknown\" 2 2"},
+         at(2, inGroup)},
+    };
+    for (const Case& row : cases) {
+        SCOPED_TRACE(row.what);
+        const auto session = sessionWith(row.previous);
+        const ZRReportingSessionKaleenMessagesWorker worker(session);
+        const auto derived =
+            worker.createKaleenMessages(records(row.messages), std::chrono::duration<double>(kMinimum));
+        EXPECT_EQ(shown(derived, {"play_seconds", "mFormatID", "mChannelsPerFrame", "session_selected_format",
+                                  "msgidx", "msgcnt"}),
+                  row.expected);
+    }
+}
+
+TEST_F(ProducersTest, SummariesGoThroughTheSessionInOrderAndAreCounted) {
+    for (const bool isInternalBuild : {false, true}) {
+        SCOPED_TRACE(isInternalBuild);
+        device.deviceProperties.set("InternalBuild", isInternalBuild);
+        forgetInternalBuild();
+        device.analyticsEvents.clear();
+        device.log.clear();
+        const auto session = ZRReportingSession::initWithID(7, {1});
+        session->updateConfigurationWithContentsOfConfiguration({{"HostApplicationDisplayID", "player"}});
+        session->start();
+        const double now = secondsSince1970(device.clock.now());
+        const auto send = [&](double time, Dictionary payload) {
+            session->sendMessage(std::make_shared<ZRReportingSessionMessage>(
+                at(now + time, std::move(payload)), AudioEventKindGeneric, AudioEventTypeGeneric));
+        };
+        send(0, {{"session_output_running", true},
+                 {"session_input_running", true},
+                 {"kaleen_session", 1},
+                 {"QVSessionVolume", 1},
+                 {"active_devices", "A"}});
+        send(3, {{"active_devices", "B"}});
+        send(9, {{"session_duration", 9.0}});
+        session->stop();
+
+        Lines names;
+        for (const auto& event : device.analyticsEvents.events()) {
+            if (event.name.starts_with("com.vandra.tamblo.") && event.name.ends_with(".Summary")) {
+                names.push_back(
+                    event.name.substr(18) + " " +
+                    jsonText(event.payload.contains("msgidx") ? *event.payload.find("msgidx") : Value("-")));
+            }
+        }
+        EXPECT_THAT(names, ElementsAre("Volume.Summary 1", "Volume.Summary 2", "Kaleen.Summary 1",
+                                       "Kaleen.Summary 2", "Session_Generic.Summary \"-\"", "Input.Summary 1",
+                                       "Input.Summary 2"));
+        EXPECT_THAT(device.log.texts("sending"),
+                    ElementsAre("sending volume event for reporter 7", "sending kaleen event for reporter 7",
+                                "sending input summary event for reporter 7"));
+        const auto summary = device.analyticsEvents.payloads("com.vandra.tamblo.Session_Generic.Summary");
+        ASSERT_EQ(summary.size(), 1U);
+        EXPECT_EQ(*summary[0].find("num_messages"), Value(7)) << "three of the client's, four summaries";
+
+        const auto fresh = sessionWith({});
+        const auto derived = ZRReportingSessionKaleenMessagesWorker(fresh).createKaleenMessages(
+            records({at(0, {{"session_output_running", true}, {"kaleen_session", 1}}),
+                     at(9, {{"session_duration", 9}})}),
+            {});
+        ASSERT_EQ(derived.size(), 1U);
+        Lines destinations;
+        for (const WorkerClass* workerClass : derived[0]->destinationWorkers()) {
+            destinations.emplace_back(workerClass->name);
+        }
+        EXPECT_EQ(destinations, isInternalBuild ? Lines{}
+                                                : (Lines{"ZRReportingSessionEventryWorker",
+                                                         "ZRReportingSessionSummaryJsonFileWorker"}));
+    }
+}
+
+TEST_F(ProducersTest, ASessionWithoutMessagesSendsNothing) {
+    const auto session = sessionWith({});
+    ZRReportingSessionVolumeMessagesWorker(session).stop();
+    ZRReportingSessionKaleenMessagesWorker(session).stop();
+    ZRReportingSessionInputMessagesWorker(session).stop();
+    ZRReportingSessionVolumeMessagesWorker(std::weak_ptr<ZRReportingSession>()).stop();
+    EXPECT_THAT(device.analyticsEvents.events(), IsEmpty());
+    EXPECT_THAT(device.log.texts("sending"), IsEmpty());
+}
+
+/// Every key that a producer reads, with every value that does not belong there, in a stretch that is open:
+/// the values are read by the rules for values of other kinds, and nothing breaks.
+TEST_F(ProducersTest, ValuesOfTheWrongKind) {
+    constexpr double kInfinity = std::numeric_limits<double>::infinity();
+    const Value wrongValues[] = {"text",
+                                 "12.5 apples",
+                                 "",
+                                 Dictionary{{"a", 1}},
+                                 Array{1, "b"},
+                                 1e300,
+                                 -1e300,
+                                 NAN,
+                                 kInfinity,
+                                 -kInfinity,
+                                 INT64_MIN,
+                                 UINT64_MAX,
+                                 true,
+                                 Value::date(1e9),
+                                 Value::data({})};
+    const char* keys[] = {"zrreporting_timestamp",
+                          "session_output_running",
+                          "session_input_running",
+                          "session_duration",
+                          "session_selected_format",
+                          "active_devices",
+                          "spatializationEnabled",
+                          "ringerstate",
+                          "QVSessionVolume",
+                          "mChannelsPerFrame",
+                          "mFormatID",
+                          "kaleen_session",
+                          "vp_config_primary_vocoder",
+                          "vp_config_primary_vocoderFs",
+                          "spatial-audio-accessory-feature"};
+    const Dictionary start{{"session_output_running", true}, {"session_input_running", true},
+                           {"QVSessionVolume", 0.5},         {"kaleen_session", 1},
+                           {"mChannelsPerFrame", 2},         {"mFormatID", "f"},
+                           {"active_devices", "d"},          {"session_selected_format", "s"}};
+    const auto session = sessionWith({});
+    const ZRReportingSessionVolumeMessagesWorker volume(session);
+    const ZRReportingSessionInputMessagesWorker input(session);
+    const ZRReportingSessionKaleenMessagesWorker group(session);
+    for (const char* key : keys) {
+        for (const Value& wrong : wrongValues) {
+            SCOPED_TRACE(std::string(key) + " " + jsonText(wrong));
+            Dictionary odd = at(10, {});
+            odd.set(key, wrong);
+            const Payloads payloads{at(0, start), odd, at(20, odd), at(30, {{"session_duration", wrong}})};
+            std::vector<MessageRef> sorted = records(payloads);
+            ZRReportingSessionMessage::sortMessages(sorted);
+            for (const auto& messages : {records(payloads), sorted}) {
+                for (const auto& derived : {volume.createVolumeMessages(messages, &wrong, {}),
+                                            input.createInputMessages(messages, &process, {}),
+                                            group.createKaleenMessages(messages, {})}) {
+                    EXPECT_LE(derived.size(), 3U);
+                    for (const MessageRef& message : derived) {
+                        EXPECT_EQ(*message->payload().find("msgcnt"), Value(derived.size()));
+                        EXPECT_FALSE(jsonText(message->payload()).empty());
+                    }
+                }
+            }
+        }
+    }
+}
+
+TEST_F(ProducersTest, WrongKindsFollowTheReadingRules) {
+    const Case cases[] = {
+        {"texts that read as numbers and booleans",
+         {at(0, {{"session_output_running", "YES"}, {"QVSessionVolume", "0.5"}}),
+          at(10, {{"QVSessionVolume", 0.5}}), at(20, {{"QVSessionVolume", "0.75 loud"}}),
+          at(30, {{"session_output_running", "no"}})},
+         {"20.0 0.5 \"0.5\" \"15\"", "10.0 \"0.75 loud\" \"0.75\" \"10\""}},
+        {"a volume that is no number repeats as itself, and beyond the table falls into the nearest class",
+         {at(0, {{"session_output_running", 1}, {"QVSessionVolume", NAN}}),
+          at(10, {{"QVSessionVolume", NAN}}), at(20, {{"QVSessionVolume", 7}}),
+          at(30, {{"session_output_running", Dictionary{}}})},
+         {"20.0 null \"1.0\" \"15\"", "10.0 7 \"1.0\" \"10\""}},
+        {"a timestamp that is no number ends a segment of no length; the next begins there, at 0",
+         {at(0, playing), at("soon", {{"ringerstate", true}}), at(3, {{"session_output_running", false}})},
+         {"3.0 0.5 \"0.5\" \"2\""}},
+        {"a day that never ends, and a length beyond single precision",
+         {at(0, playing), at(1e300, {{"session_output_running", false}})},
+         {"null 0.5 \"0.5\" \"86400\""}},
+        {"one that is not a number makes no summary",
+         {at(0, playing), at(NAN, {{"session_output_running", false}})},
+         {}},
+    };
+    for (const Case& row : cases) {
+        SCOPED_TRACE(row.what);
+        const auto session = sessionWith({});
+        const auto derived = ZRReportingSessionVolumeMessagesWorker(session).createVolumeMessages(
+            records(row.messages), &process, std::chrono::duration<double>(1));
+        EXPECT_EQ(shown(derived, {"play_seconds", "QVSessionVolume", "QVSessionVolumeBucketed",
+                                  "play_secondsBucketed"}),
+                  row.expected);
+    }
+}
+
+} // namespace
+} // namespace tamblo
