@@ -299,20 +299,9 @@ void ZRReportingClientServerInstance::handleConnectionError() {
 }
 
 void ZRReportingClientServerInstance::endConnection() {
-    const Delegate delegate = delegate_.lock();
-    if (delegate == nullptr || acceptanceOrder_ == 0) {
-        return;
+    if (const Delegate delegate = delegate_.lock()) {
+        delegate->removeClient(*this);
     }
-    for (const auto& [reporterID, session] : clientReportingSessionMap_) {
-        if (session->started()) {
-            session->stop();
-        }
-        sessionChanged(reporterID, nullptr);
-    }
-    clientReportingSessionMap_.clear();
-    delegate->removeClient(*this);
-    log::standard(ZRReportingServiceDelegateCategory(), "removing {} from the server client list",
-                  processIdentifier_);
 }
 
 SessionRef ZRReportingClientServerInstance::findReportingSessionForID(ReporterID reporterID,

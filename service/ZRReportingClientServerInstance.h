@@ -50,9 +50,11 @@ public:
 
     /// The connection is lost: queues the end of this client. Any thread.
     void handleConnectionError();
-    /// Stops the started sessions, lets all go and leaves the service; nothing when that was done before. No
-    /// held start reply is answered.
+    /// Leaves the service, which stops the started sessions; nothing when that was done before. No held start
+    /// reply is answered.
     void endConnection();
+    /// The sessions, which are the client's no more.
+    [[nodiscard]] SessionMap takeSessions() noexcept { return std::exchange(clientReportingSessionMap_, {}); }
 
     [[nodiscard]] SessionRef findReportingSessionForID(ReporterID reporterID, bool acrossAllClients) const;
 

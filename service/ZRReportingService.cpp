@@ -73,11 +73,33 @@ void ZRReportingService::removeClient(ZRReportingClientServerInstance& client) {
     const auto place = std::lower_bound(
         clients_.begin(), clients_.end(), client.acceptanceOrder(),
         [](const ClientRef& other, std::uint64_t order) { return other->acceptanceOrder() < order; });
-    if (place != clients_.end() && place->get() == &client) {
-        const ClientRef removed = std::move(*place);
-        clients_.erase(place);
-        removed->setAcceptanceOrder(0);
+    if (place == clients_.end() || place->get() != &client) {
+        return;
     }
+    ClientRef removed = std::move(*place);
+    clients_.erase(place);
+    auto sessions = removed->takeSessions();
+    for (const auto& [reporterID, session] : sessions) {
+        sessionChanged(client, reporterID, nullptr);
+    }
+    removed->setAcceptanceOrder(0);
+    leaving_.add(std::move(removed), std::move(sessions));
+    queueFurtherStops();
+}
+
+void ZRReportingService::queueFurtherStops() {
+    if (leaving_.isEmpty() || std::exchange(areStopsQueued_, true)) {
+        return;
+    }
+    ZRReportingUtilityGetReportingServerQueue().post(
+        [service = std::weak_ptr(self_)] {
+            if (const auto held = service.lock()) {
+                held->leaving_.stopSome();
+                held->areStopsQueued_ = false;
+                held->queueFurtherStops();
+            }
+        },
+        Pace::mayBlock);
 }
 
 void ZRReportingService::sessionChanged(const ZRReportingClientServerInstance& client, ReporterID reporterID,
@@ -167,11 +189,13 @@ void ZRReportingService::shutDown(UniqueFunction<void()> completed) {
 }
 
 void ZRReportingService::endAllClients() {
+    leaving_.stopAll();
     // Each leaves the list as it ends.
-    const std::vector<ClientRef> leaving = clients_;
-    for (const ClientRef& client : leaving) {
+    const std::vector<ClientRef> remaining = clients_;
+    for (const ClientRef& client : remaining) {
         const WallTime end = platform().clock.now();
         client->endConnection();
+        leaving_.stopAll();
         reportClientUptime(client, client->processIdentifier(), end);
     }
 }

@@ -2,6 +2,7 @@
 
 #include "base/UniqueFunction.h"
 #include "platform/ConnectionService.h"
+#include "service/LeavingClients.h"
 #include "service/SessionRegistry.h"
 #include "service/SingleMessageSessionKeeper.h"
 #include "service/ZRReportingServiceDelegateProtocol.h"
@@ -33,8 +34,9 @@ public:
 
     bool shouldAcceptNewConnection(ClientConnection& connection) override;
 
-    /// Behind what is queued already: ends every client as if its connection had been lost and stops the
-    /// single-message session, then calls `completed`, all on the reporting server queue. Any thread, once.
+    /// Behind what is queued already: ends every client as if its connection had been lost, stops what those
+    /// that have left before have yet to stop, and the single-message session, then calls `completed`, all on
+    /// the reporting server queue. Any thread, once.
     void shutDown(UniqueFunction<void()> completed);
 
     /// While it is off, lookups find nothing and messages are refused. No request changes it. Any thread.
@@ -57,6 +59,8 @@ public:
 private:
     void addClient(const ClientRef& client);
     void endAllClients();
+    /// For what clients that have left have yet to stop; one piece of work at a time.
+    void queueFurtherStops();
     void logSessionsOfClients() const;
     static void setHandlers(ClientConnection& connection, const ClientRef& client);
 
@@ -65,6 +69,8 @@ private:
     std::vector<ClientRef> clients_;
     std::uint64_t lastAcceptanceOrder_ = 0;
     SessionRegistry sessions_;
+    LeavingClients leaving_;
+    bool areStopsQueued_ = false;
     SingleMessageSessionKeeper singleMessages_;
     /// Clients and queued work hold the service weakly, through this; it owns nothing.
     std::shared_ptr<ZRReportingService> self_;

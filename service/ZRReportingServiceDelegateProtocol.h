@@ -32,6 +32,8 @@ public:
     /// single-message session.
     virtual void findReportingSessionsForIDs(std::span<const ReporterID> reporterIDs,
                                              std::vector<SessionRef>& found) = 0;
+    /// From here on nobody finds the client or a session of its. The sessions are stopped a few at a
+    /// time, the first few before this returns. Nothing when the client is not among the accepted ones.
     virtual void removeClient(ZRReportingClientServerInstance& client) = 0;
     virtual void logReportingSessions() = 0;
 

@@ -1,0 +1,190 @@
+#include "tests/service_core/ServiceTestBase.h"
+
+#include <numeric>
+
+namespace tamblo {
+namespace {
+
+using testing::ElementsAre;
+using testing::IsEmpty;
+
+class LeavingClientsTest : public ServiceTestBase {
+protected:
+    LeavingClientsTest() {
+        script.atStop["Producer"] = [this](ZRReportingSession& owner) {
+            stopped.push_back(owner.reporterID());
+            owner.sendMessage(std::make_shared<ZRReportingSessionMessage>(Dictionary{{"summary", 1}}, 1, 11));
+        };
+    }
+    /// Started sessions of these IDs.
+    void openFrom(const Connection& client, ReporterID first, ReporterID last) {
+        for (ReporterID id = first; id <= last; ++id) {
+            open(client, id);
+        }
+    }
+    bool runOne() { return device.serverQueue().runOne(); }
+    std::size_t removals(pid_t pid) {
+        return device.log.count("removing " + std::to_string(pid) + " from the server client list");
+    }
+    static std::vector<ReporterID> fromTo(ReporterID first, ReporterID last) {
+        std::vector<ReporterID> ids(static_cast<std::size_t>(last - first + 1));
+        std::iota(ids.begin(), ids.end(), first);
+        return ids;
+    }
+
+    std::vector<ReporterID> stopped;
+};
+
+TEST_F(LeavingClientsTest, OthersAreServedBetweenTheStops) {
+    const Connection leaving = connect(10);
+    const Connection other = connect(11);
+    openFrom(leaving, 1, 70);
+    open(other, 1);
+    leaving->object().createReportingSession(71, {});
+    (void)run();
+    const std::weak_ptr<ZRReportingSession> theFirst = find(1);
+    const std::weak_ptr<ZRReportingSession> theLast = find(70);
+
+    (void)device.serverQueue().takePaces();
+    leaving->interrupt();
+    std::vector<ReporterID> all;
+    other->object().sendMessage({{"to", "all"}}, 14, 11, {}, note("send"));
+    other->object().getAllReporters(
+        [&](const ReplyError*, const std::vector<ReporterID>& result) { all = result; });
+    ASSERT_TRUE(runOne());
+    EXPECT_EQ(stopped, fromTo(1, 32));
+    EXPECT_TRUE(theFirst.expired()) << "nothing stopped is kept";
+    EXPECT_FALSE(theLast.expired());
+    EXPECT_EQ(service->getAllClients().size(), 1U);
+    EXPECT_EQ(service->getAllActiveReportingSessions(), std::vector{find(1)});
+    EXPECT_EQ(find(1)->processIdentifiers().front(), 11);
+    EXPECT_EQ(find(70), nullptr);
+
+    (void)script.take();
+    ASSERT_TRUE(runOne());
+    EXPECT_THAT(takeReplies(), ElementsAre("send"));
+    EXPECT_EQ(script.count("message Init 14/11"), 1U) << "no session of the leaving client";
+    ASSERT_TRUE(runOne());
+    EXPECT_THAT(all, ElementsAre(1));
+    EXPECT_EQ(stopped.size(), 32U);
+
+    leaving->invalidate(); // ends it a second time
+    ASSERT_TRUE(runOne());
+    EXPECT_EQ(stopped, fromTo(1, 64));
+    EXPECT_EQ(removals(10), 0U);
+    (void)run();
+    EXPECT_EQ(stopped, fromTo(1, 70));
+    EXPECT_TRUE(theLast.expired());
+    EXPECT_EQ(script.count("message Init 1/11"), 70U - 32U) << "summaries reach the sinks to the last";
+    EXPECT_EQ(removals(10), 1U);
+    EXPECT_EQ(device.log.count("invalidationHandler: connection exited process=app10"), 1U);
+    EXPECT_TRUE(find(1)->started());
+    const std::vector<Pace> paces = device.serverQueue().takePaces();
+    EXPECT_EQ(std::count(paces.begin(), paces.end(), Pace::mayBlock), 4) << "two ends and two further pieces";
+}
+
+TEST_F(LeavingClientsTest, APieceStopsSoManyMessages) {
+    const Connection leaving = connect(10);
+    const Connection other = connect(11);
+    // One message of each session is its own record of its start.
+    const std::vector<int> counts{2'499, 2'499, 0, 20'000, 0, 2'499, 2'500, 1};
+    for (std::size_t i = 0; i < counts.size(); ++i) {
+        const auto id = static_cast<ReporterID>(i + 1);
+        open(leaving, id);
+        for (int message = 0; message < counts[i]; ++message) {
+            find(id)->sendMessage(
+                std::make_shared<ZRReportingSessionMessage>(Dictionary{{"n", message}}, 14, 11));
+        }
+        device.log.clear();
+    }
+    leaving->interrupt();
+    std::vector<std::vector<ReporterID>> pieces;
+    while (runOne()) {
+        pieces.push_back(std::exchange(stopped, {}));
+        device.log.clear();
+    }
+    EXPECT_THAT(pieces, ElementsAre(ElementsAre(1, 2), ElementsAre(3), ElementsAre(4), ElementsAre(5, 6),
+                                    ElementsAre(7, 8)));
+}
+
+TEST_F(LeavingClientsTest, ClientsThatLeaveTogetherShareOnePieceAtATime) {
+    const Connection first = connect(10);
+    const Connection second = connect(11);
+    const Connection third = connect(12);
+    openFrom(first, 1, 70);
+    openFrom(second, 101, 140);
+    open(third, 200);
+    (void)device.serverQueue().takePaces();
+    first->interrupt();
+    second->interrupt();
+    third->interrupt();
+    std::vector<std::size_t> pieces;
+    while (runOne()) {
+        pieces.push_back(std::exchange(stopped, {}).size());
+    }
+    EXPECT_THAT(pieces, ElementsAre(32, 32, 1, 32, 6, 8)) << "a client with few sessions ends at once";
+    EXPECT_THAT(serviceLines(), testing::IsSupersetOf({"s: removing 10 from the server client list",
+                                                       "s: removing 11 from the server client list",
+                                                       "s: removing 12 from the server client list"}));
+}
+
+TEST_F(LeavingClientsTest, ShuttingDownFinishesWhatIsUnderWay) {
+    const Connection leaving = connect(10);
+    const Connection other = connect(11);
+    openFrom(leaving, 1, 100);
+    openFrom(other, 101, 150);
+    leaving->interrupt();
+    leaving->invalidate();
+    bool isCompleted = false;
+    service->shutDown([&] {
+        isCompleted = true;
+        EXPECT_EQ(stopped, fromTo(1, 150));
+        EXPECT_EQ(removals(10) + removals(11), 2U);
+        EXPECT_THAT(service->getAllClients(), IsEmpty());
+    });
+    ASSERT_TRUE(runOne());
+    EXPECT_EQ(stopped.size(), 32U);
+    (void)run();
+    EXPECT_TRUE(isCompleted);
+    EXPECT_EQ(stopped.size(), 150U);
+    EXPECT_EQ(script.count("message Init 1/11"), 150U);
+    EXPECT_EQ(removals(10) + removals(11), 2U);
+    EXPECT_EQ(device.analyticsEvents.payloads("com.vandra.tamblo.zrreportingclientuptime").size(), 2U);
+}
+
+TEST_F(LeavingClientsTest, WhatAClientAskedForBehindItsEndReachesNobody) {
+    Connection leaving = connect(10);
+    const Connection other = connect(11);
+    openFrom(leaving, 1, 40);
+    leaving->interrupt();
+    ZRReportingServiceProtocol& requests = leaving->object();
+    requests.createReportingSession(41, noteBoolean("create"));
+    requests.startReportingSessionForID(41, noteBoolean("start"));
+    requests.startReportingSessionForID(40, noteBoolean("earlier"));
+    requests.destroyReportingSession(40, noteBoolean("destroy"));
+    for (int i = 0; i < 5; ++i) {
+        ASSERT_TRUE(runOne());
+    }
+    EXPECT_THAT(takeReplies(), ElementsAre("create 1", "earlier 1", "destroy 1"));
+    EXPECT_THAT(found({40, 41}), IsEmpty());
+    EXPECT_THAT(service->getAllActiveReportingSessions(), IsEmpty());
+    leaving.reset();
+    (void)run();
+    EXPECT_EQ(stopped, fromTo(1, 40)) << "each once, and nothing that came behind the end";
+    EXPECT_EQ(device.log.count("deallocing this session 41"), 1U);
+    EXPECT_EQ(device.log.count("dealloc 10 from the server client list"), 1U);
+}
+
+TEST_F(LeavingClientsTest, TheServiceMayGoInTheMiddle) {
+    const Connection leaving = connect(10);
+    openFrom(leaving, 1, 40);
+    leaving->interrupt();
+    ASSERT_TRUE(runOne());
+    service.reset();
+    (void)run();
+    EXPECT_EQ(stopped, fromTo(1, 32));
+    EXPECT_EQ(device.log.count("deallocing this session 40"), 1U);
+}
+
+} // namespace
+} // namespace tamblo
