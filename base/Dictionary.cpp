@@ -46,6 +46,9 @@ void relocate(Value* to, const Value* from, std::size_t count) noexcept {
 } // namespace
 
 Dictionary::Dictionary(std::initializer_list<Entry> entries) {
+    if (entries.size() != 0) {
+        detach(entries.size());
+    }
     for (const Entry& entry : entries) {
         set(entry.first, entry.second);
     }

@@ -1,11 +1,14 @@
 #include "session/ZRReportingSessionMessage.h"
 
-#include "session/MessageIntake.h"
+#include "base/KeyPlaces.h"
 #include "util/Log.h"
+#include "util/MessageKeys.h"
 
 #include <algorithm>
+#include <array>
 #include <cmath>
 #include <cstddef>
+#include <string_view>
 
 namespace tamblo {
 
@@ -16,18 +19,19 @@ struct TimedMessage {
     MessageRef message;
 };
 
-double sortTime(const ZRReportingSessionMessage& message) noexcept {
-    const double time = intake::epochTime(message.payload());
-    return std::isnan(time) ? 0.0 : time;
-}
-
-bool isSorted(const std::vector<MessageRef>& messages) noexcept {
-    for (std::size_t i = 1; i < messages.size(); ++i) {
-        if (sortTime(*messages[i]) < sortTime(*messages[i - 1])) {
-            return false;
-        }
+/// The time that each message sorts by.
+std::vector<double> sortTimes(const std::vector<MessageRef>& messages) {
+    static constexpr std::array<std::string_view, 1> kKeys{ZRReportingInternalEventEpochTime};
+    KeyPlaces places(kKeys);
+    std::vector<double> times;
+    times.reserve(messages.size());
+    for (const MessageRef& message : messages) {
+        const Dictionary& payload = message->payload();
+        const std::uint32_t place = places.in(payload.keys())[0];
+        const double time = place != KeyPlaces::kAbsent ? payload.valueAt(place).doubleValue() : 0.0;
+        times.push_back(std::isnan(time) ? 0.0 : time);
     }
-    return true;
+    return times;
 }
 
 } // namespace
@@ -77,14 +81,14 @@ std::string ZRReportingSessionMessage::description() const {
 }
 
 bool ZRReportingSessionMessage::sortMessages(std::vector<MessageRef>& messages) {
-    if (isSorted(messages)) {
+    const std::vector<double> times = sortTimes(messages);
+    if (std::is_sorted(times.begin(), times.end())) {
         return false;
     }
     std::vector<TimedMessage> timed;
     timed.reserve(messages.size());
-    for (MessageRef& message : messages) {
-        const double time = sortTime(*message);
-        timed.push_back({time, std::move(message)});
+    for (std::size_t i = 0; i < messages.size(); ++i) {
+        timed.push_back({times[i], std::move(messages[i])});
     }
     std::stable_sort(timed.begin(), timed.end(),
                      [](const TimedMessage& a, const TimedMessage& b) { return a.time < b.time; });

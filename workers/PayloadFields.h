@@ -1,71 +1,29 @@
 #pragma once
 
 #include "base/Dictionary.h"
-#include "base/KeySet.h"
+#include "base/KeyPlaces.h"
 
 #include <array>
 #include <cstddef>
-#include <cstdint>
 #include <span>
 #include <string_view>
 
 namespace tamblo {
-
-/// The places of a few fixed keys in one payload after another.
-///
-/// A session's messages are of a few kinds, and all of one kind share their key set: where the keys stand in
-/// it is found once and remembered, so that reading a payload searches nothing. Made for one walk over a
-/// session's messages.
-class FieldPlaces {
-public:
-    static constexpr std::size_t kMostFields = 16;
-    static constexpr std::uint32_t kAbsent = UINT32_MAX;
-    using Places = std::array<std::uint32_t, kMostFields>;
-
-    /// At most `kMostFields` keys, which must outlive the places.
-    explicit FieldPlaces(std::span<const std::string_view> keys) noexcept : keys_(keys) {}
-
-    /// The index of each key in the key set, `kAbsent` for those that it does not hold. Lives until the next
-    /// call.
-    [[nodiscard]] const Places& in(const KeySet& keySet) {
-        Known& known = known_[slotOf(keySet)];
-        if (known.keySet.get() != &keySet) [[unlikely]] {
-            find(keySet, known);
-        }
-        return known.places;
-    }
-
-private:
-    static constexpr std::size_t kSlots = 32;
-
-    struct Known {
-        KeySetRef keySet; ///< held, so that no other can come to stand at its address
-        Places places;
-    };
-
-    static std::size_t slotOf(const KeySet& keySet) noexcept {
-        return (reinterpret_cast<std::uintptr_t>(&keySet) >> 6U) % kSlots;
-    }
-    void find(const KeySet& keySet, Known& known) const;
-
-    const std::span<const std::string_view> keys_;
-    std::array<Known, kSlots> known_;
-};
 
 /// What one payload holds under the keys of a walk: one value for each `Field`, an enumeration from 0 that
 /// ends with `count`, and null for an absent one. The values are the payload's own.
 template <typename Field> class PayloadFields {
 public:
     static constexpr std::size_t kCount = static_cast<std::size_t>(Field::count);
-    static_assert(kCount <= FieldPlaces::kMostFields);
+    static_assert(kCount <= KeyPlaces::kMostKeys);
     using Keys = std::array<std::string_view, kCount>;
 
     PayloadFields() = default;
-    PayloadFields(const Dictionary& payload, FieldPlaces& places) {
-        const FieldPlaces::Places& found = places.in(payload.keys());
+    PayloadFields(const Dictionary& payload, KeyPlaces& places) {
+        const KeyPlaces::Places& found = places.in(payload.keys());
         const std::span<const Value> values = payload.values();
         for (std::size_t i = 0; i < kCount; ++i) {
-            values_[i] = found[i] != FieldPlaces::kAbsent ? &values[found[i]] : nullptr;
+            values_[i] = found[i] != KeyPlaces::kAbsent ? &values[found[i]] : nullptr;
         }
     }
 

@@ -1,7 +1,7 @@
 #include "workers/ZRReportingSessionWorkerUtility.h"
 
+#include "base/KeyPlaces.h"
 #include "session/MessageIntake.h"
-#include "workers/PayloadFields.h"
 
 #include <cstddef>
 #include <cstdint>
@@ -12,10 +12,10 @@ namespace tamblo {
 namespace {
 
 /// The first of the keys that the payload holds.
-std::optional<std::size_t> firstKeyOf(const Dictionary& payload, FieldPlaces& places, std::size_t keyCount) {
-    const FieldPlaces::Places& found = places.in(payload.keys());
+std::optional<std::size_t> firstKeyOf(const Dictionary& payload, KeyPlaces& places, std::size_t keyCount) {
+    const KeyPlaces::Places& found = places.in(payload.keys());
     for (std::size_t key = 0; key < keyCount; ++key) {
-        if (found[key] != FieldPlaces::kAbsent) {
+        if (found[key] != KeyPlaces::kAbsent) {
             return key;
         }
     }
@@ -28,7 +28,7 @@ public:
     explicit Burst(std::chrono::duration<double> maximumPause) noexcept : maximumPause_(maximumPause) {}
 
     /// Whether the message was taken into the burst's first one.
-    bool takeIn(const MessageRef& message, std::size_t key) {
+    bool takeIn(ZRReportingSessionMessage& message, std::size_t key) {
         const std::uint32_t bit = std::uint32_t{1} << key;
         if ((seenKeys_ & bit) != 0) {
             seenKeys_ = 0;
@@ -36,16 +36,16 @@ public:
         }
         seenKeys_ |= bit;
         if (anchor_ == nullptr) {
-            anchor_ = message.get();
+            anchor_ = &message;
             return false;
         }
-        const std::chrono::duration<double> pause(intake::epochTime(message->payload()) -
+        const std::chrono::duration<double> pause(intake::epochTime(message.payload()) -
                                                   intake::epochTime(anchor_->payload()));
         if (!(pause < maximumPause_)) {
             // The anchor is meant to stay: what comes later than that stands alone until a key repeats.
             return false;
         }
-        anchor_->editPayload([&message](Dictionary& payload) { payload.merge(message->payload()); });
+        anchor_->editPayload([&message](Dictionary& payload) { payload.merge(message.payload()); });
         return true;
     }
 
@@ -57,18 +57,18 @@ private:
 
 } // namespace
 
-std::vector<MessageRef>
+std::vector<ZRReportingSessionMessage*>
 ZRReportingSessionWorkerUtility::combineRapidMessages(std::span<const MessageRef> messages,
                                                       std::span<const std::string_view> keysToCombine,
                                                       std::chrono::duration<double> maximumPausetime) {
-    FieldPlaces places(keysToCombine);
+    KeyPlaces places(keysToCombine);
     Burst burst(maximumPausetime);
-    std::vector<MessageRef> result;
+    std::vector<ZRReportingSessionMessage*> result;
     result.reserve(messages.size());
     for (const MessageRef& message : messages) {
         const auto key = firstKeyOf(message->payload(), places, keysToCombine.size());
-        if (!key || !burst.takeIn(message, *key)) {
-            result.push_back(message);
+        if (!key || !burst.takeIn(*message, *key)) {
+            result.push_back(message.get());
         }
     }
     return result;

@@ -20,8 +20,8 @@ public:
     /// of those that follow it, each less than the pause after the one before, timestamps included; it
     /// changes in place, in the session's list as well. Messages without any of the keys pass through.
     ///
-    /// At most 16 keys. For a session that takes no messages any longer.
-    [[nodiscard]] static std::vector<MessageRef>
+    /// The messages stay their owner's. At most 16 keys. For a session that takes no messages any longer.
+    [[nodiscard]] static std::vector<ZRReportingSessionMessage*>
     combineRapidMessages(std::span<const MessageRef> messages,
                          std::span<const std::string_view> keysToCombine,
                          std::chrono::duration<double> maximumPausetime);

@@ -27,27 +27,46 @@ public:
     void EmitTracePoint(std::uint32_t) noexcept override {}
 };
 
+/// A device on which nothing but the session costs anything.
+class QuietDevice {
+public:
+    QuietDevice() {
+        const Platform& fakes = platform();
+        installPlatform({fakes.clock, fakes.workQueues, fakes.log, noTracePoints_, fakes.deviceProperties,
+                         fakes.preferences, fakes.namedNotifications, fakes.processInformation,
+                         fakes.deviceConditions, noEvents_, fakes.connections});
+        device_.clock.set(std::chrono::time_point_cast<WallTime::duration>(std::chrono::system_clock::now()));
+    }
+
+    void advance(std::chrono::milliseconds time) { device_.clock.advance(time); }
+
+    [[nodiscard]] static std::shared_ptr<ZRReportingSession> startedSession() {
+        auto session = ZRReportingSession::initWithID(7, {1});
+        session->updateConfigurationWithContentsOfConfiguration(sessionConfiguration());
+        session->start();
+        return session;
+    }
+
+private:
+    FakePlatform device_{LogLevel::standard};
+    NoEvents noEvents_;
+    NoTracePoints noTracePoints_;
+};
+
+void send(ZRReportingSession& session, const Message& message) {
+    session.sendMessage(std::make_shared<ZRReportingSessionMessage>(
+        message.payload, static_cast<AudioEventCategory>(message.category),
+        static_cast<AudioEventType>(message.type)));
+}
+
 /// One message through the intake, the redundancy test and the workers; a thousand to a session.
 void sessionSend(benchmark::State& state, Variety variety) {
-    FakePlatform device(LogLevel::standard);
-    NoEvents noEvents;
-    NoTracePoints noTracePoints;
-    const Platform& fakes = platform();
-    installPlatform({fakes.clock, fakes.workQueues, fakes.log, noTracePoints, fakes.deviceProperties,
-                     fakes.preferences, fakes.namedNotifications, fakes.processInformation,
-                     fakes.deviceConditions, noEvents, fakes.connections});
-    device.clock.set(std::chrono::time_point_cast<WallTime::duration>(std::chrono::system_clock::now()));
+    const QuietDevice device;
     const std::vector<Message> messages = makeMessages(kMessages, variety);
-    const std::shared_ptr<ZRReportingSession> session = ZRReportingSession::initWithID(7, {1});
-    session->updateConfigurationWithContentsOfConfiguration(sessionConfiguration());
-
-    session->start();
+    const auto session = QuietDevice::startedSession();
     std::size_t i = 0;
     for (auto _ : state) {
-        const Message& message = messages[i++ % kMessages];
-        session->sendMessage(std::make_shared<ZRReportingSessionMessage>(
-            message.payload, static_cast<AudioEventCategory>(message.category),
-            static_cast<AudioEventType>(message.type)));
+        send(*session, messages[i++ % kMessages]);
         if (i % kMessages == 0) {
             session->stop();
             session->start();
@@ -65,6 +84,36 @@ void sessionSendRepeated(benchmark::State& state) {
     sessionSend(state, Variety::repeated);
 }
 BENCHMARK(sessionSendRepeated);
+
+/// The stop of a session with messages retained: sorting, the producers' walks, and letting the messages go.
+/// One message in a hundred changes what is played on, so that it ends a stretch of each kind.
+void sessionStop(benchmark::State& state) {
+    constexpr std::chrono::milliseconds kBetweenMessages{20};
+    QuietDevice device;
+    const auto session = QuietDevice::startedSession();
+    const auto count = static_cast<std::uint64_t>(state.range(0));
+    for (auto _ : state) {
+        state.PauseTiming();
+        for (std::uint64_t i = 0; i < count; ++i) {
+            Message message = makeMessage(i, Variety::distinct);
+            device.advance(kBetweenMessages);
+            message.payload.set("zrreporting_timestamp", secondsSince1970(platform().clock.now()));
+            if (i % 100 == 0) {
+                message.payload.merge({{"session_output_running", true},
+                                       {"session_input_running", true},
+                                       {"kaleen_session", 1},
+                                       {"QVSessionVolume", 0.5},
+                                       {"active_devices", i % 200 == 0 ? "Speaker" : "Headphones"}});
+            }
+            send(*session, message);
+        }
+        state.ResumeTiming();
+        session->stop();
+        session->start();
+    }
+    state.SetItemsProcessed(state.iterations() * state.range(0));
+}
+BENCHMARK(sessionStop)->Arg(10'000)->Arg(100'000)->Unit(benchmark::kMillisecond);
 
 } // namespace
 

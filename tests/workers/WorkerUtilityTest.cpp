@@ -84,7 +84,7 @@ TEST(WorkerUtilityTest, CombinesBurstsInPlace) {
             messages, kKeys, std::chrono::duration<double>(row.pause));
         ASSERT_EQ(combined.size(), row.left.size());
         for (std::size_t i = 0; i < combined.size(); ++i) {
-            EXPECT_EQ(combined[i], messages[static_cast<std::size_t>(row.left[i].first) - 1]);
+            EXPECT_EQ(combined[i], messages[static_cast<std::size_t>(row.left[i].first) - 1].get());
             EXPECT_EQ(jsonText(combined[i]->payload()), row.left[i].second);
         }
     }

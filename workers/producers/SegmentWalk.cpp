@@ -82,8 +82,8 @@ std::vector<MessageRef> DerivedMessages::take() {
     return std::exchange(messages_, {});
 }
 
-std::vector<MessageRef> combineSpatialAudioSettings(const std::vector<MessageRef>& messages,
-                                                    Seconds longestPause) {
+std::vector<ZRReportingSessionMessage*> combineSpatialAudioSettings(const std::vector<MessageRef>& messages,
+                                                                    Seconds longestPause) {
     static constexpr std::array<std::string_view, 2> kSettings{
         ZRReportingMessageKeySpatialAudioAccessoryFeature, kSpatializationEnabledKey};
     return ZRReportingSessionWorkerUtility::combineRapidMessages(messages, kSettings, longestPause);

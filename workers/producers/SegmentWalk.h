@@ -69,8 +69,8 @@ private:
 };
 
 /// The messages with each burst of the two spatial-audio settings folded into one.
-[[nodiscard]] std::vector<MessageRef> combineSpatialAudioSettings(const std::vector<MessageRef>& messages,
-                                                                  Seconds longestPause);
+[[nodiscard]] std::vector<ZRReportingSessionMessage*>
+combineSpatialAudioSettings(const std::vector<MessageRef>& messages, Seconds longestPause);
 /// What a producer does when its session stops: has `derive` make messages of what the session recorded,
 /// given the session and the least length of a stretch, and sends them into it as a client would.
 template <typename Derive>

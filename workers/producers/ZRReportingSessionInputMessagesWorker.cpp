@@ -173,7 +173,7 @@ private:
     const Dictionary previousValues_;
     const Value* const process_;
     const Seconds minimum_;
-    FieldPlaces places_{kKeys};
+    KeyPlaces places_{kKeys};
     /// The latest value of each key, up to the message before the one at hand.
     Fields state_;
     bool isRunning_ = false;
@@ -196,7 +196,8 @@ std::vector<MessageRef> ZRReportingSessionInputMessagesWorker::createInputMessag
     log::debug(ZRReportingSessionCategory(), "entering createInputMessages {}", kFunction);
     const std::shared_ptr<ZRReportingSession> owner = session();
     InputWalk walk(owner != nullptr ? owner->previousValues() : Dictionary(), process, minimumRunningtime);
-    for (const MessageRef& message : combineSpatialAudioSettings(messages, kLongestPauseInBurst)) {
+    for (const ZRReportingSessionMessage* message :
+         combineSpatialAudioSettings(messages, kLongestPauseInBurst)) {
         walk.take(message->payload());
     }
     return walk.finish();

@@ -146,7 +146,7 @@ private:
 
     const Dictionary previousValues_;
     const Seconds minimum_;
-    FieldPlaces places_{kKeys};
+    KeyPlaces places_{kKeys};
     /// The latest value of each key, up to the message before the one at hand.
     Fields state_;
     bool isPlaying_ = false;

@@ -150,7 +150,7 @@ private:
     const Dictionary previousValues_;
     const Value* const process_;
     const Seconds minimum_;
-    FieldPlaces places_{kKeys};
+    KeyPlaces places_{kKeys};
     /// The latest value of each key, up to the message before the one at hand.
     Fields state_;
     bool isPlaying_ = false;
@@ -172,7 +172,8 @@ std::vector<MessageRef> ZRReportingSessionVolumeMessagesWorker::createVolumeMess
     log::debug(ZRReportingSessionCategory(), "entering createVolumeMessages {}", kFunction);
     const std::shared_ptr<ZRReportingSession> owner = session();
     VolumeWalk walk(owner != nullptr ? owner->previousValues() : Dictionary(), process, minimumPlaytime);
-    for (const MessageRef& message : combineSpatialAudioSettings(messages, kLongestPauseInBurst)) {
+    for (const ZRReportingSessionMessage* message :
+         combineSpatialAudioSettings(messages, kLongestPauseInBurst)) {
         walk.take(message->payload());
     }
     return walk.finish();

@@ -1,8 +1,8 @@
-#include "workers/PayloadFields.h"
+#include "base/KeyPlaces.h"
 
 namespace tamblo {
 
-void FieldPlaces::find(const KeySet& keySet, Known& known) const {
+void KeyPlaces::find(const KeySet& keySet, Known& known) const {
     known.keySet = KeySetRef(&keySet);
     for (std::size_t i = 0; i < keys_.size(); ++i) {
         const std::size_t place = keySet.find(keys_[i]);
