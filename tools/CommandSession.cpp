@@ -1,10 +1,12 @@
 #include "base/Format.h"
 #include "base/Json.h"
+#include "client/Directories.h"
 #include "client/NumberText.h"
 #include "tools/Command.h"
 #include "tools/Payload.h"
 #include "tools/ServiceConnection.h"
 #include "tools/SessionPlayer.h"
+#include "tools/SessionSummaries.h"
 
 #include <cmath>
 #include <fstream>
@@ -25,8 +27,9 @@ constexpr Option kOptions[] = {
     {"--speed", "N", "play N times as fast as recorded"},
     {"--fast", "", "play as fast as the service takes the messages"},
     {"--restamp", "", "give every message a fresh timestamp, not just those without one"},
+    {"--recorded-spacing", "", "give timestamps as far apart as recorded, however fast it is played"},
     {"--progress", "", "show progress though standard error is no terminal"},
-    {"--quiet", "", "no progress and no report"},
+    {"--quiet", "", "no progress, no report and no summaries"},
     kJsonOption,
     kSocketOption,
     kTimeoutOption,
@@ -73,6 +76,7 @@ std::variant<Plan, std::string> makePlan(const Arguments& arguments) {
         plan.player.speed = speed.doubleValue();
     }
     plan.player.restamp = arguments.has("--restamp");
+    plan.player.stampsAsRecorded = arguments.has("--recorded-spacing");
     plan.player.showsProgress =
         !arguments.has("--quiet") && (arguments.has("--progress") || ::isatty(STDERR_FILENO) != 0);
     plan.file = arguments.last("--play").value_or("");
@@ -105,17 +109,45 @@ std::optional<ExitStatus> begin(ServiceConnection& service, const Plan& plan,
     return std::nullopt;
 }
 
-void printReport(const Arguments& arguments, const SessionPlayer::Report& report, bool isStartAnswered) {
+/// What is asked of the service when the session stops, and what was found.
+using Summaries = std::variant<std::vector<SessionSummary>, std::string>;
+
+/// How the session's own summary will name it.
+StoppedSession describe(const Plan& plan, const SessionPlayer::Report& report) {
+    Value application("Unknown");
+    for (const std::string_view key : {"QVHostApplicationDisplayID", "HostApplicationDisplayID"}) {
+        if (const Value* name = plan.configuration ? plan.configuration->find(key) : nullptr) {
+            application = *name;
+        }
+    }
+    return {application, std::string(client::serviceTypeName(plan.serviceType)),
+            report.sent - report.refused};
+}
+
+void printReport(const Arguments& arguments, const SessionPlayer::Report& report, bool isStartAnswered,
+                 const Summaries& found) {
+    const auto* summaries = std::get_if<std::vector<SessionSummary>>(&found);
     if (arguments.has("--json")) {
-        printLine(jsonText(Dictionary{{"messages_sent", report.sent},
-                                      {"messages_refused", report.refused},
-                                      {"replies", report.answered},
-                                      {"seconds", report.seconds},
-                                      {"start_reply", isStartAnswered}}));
+        Dictionary text{{"messages_sent", report.sent},
+                        {"messages_refused", report.refused},
+                        {"replies", report.answered},
+                        {"seconds", report.seconds},
+                        {"start_reply", isStartAnswered}};
+        Array array;
+        if (summaries != nullptr) {
+            for (const SessionSummary& summary : *summaries) {
+                array.emplace_back(Dictionary{{"event", summary.event}, {"payload", summary.payload}});
+            }
+        } else {
+            text.set("summaries_missing", std::get<std::string>(found));
+        }
+        text.set("summaries", std::move(array));
+        printLine(jsonText(text));
     } else if (!arguments.has("--quiet")) {
         printLine(formatted("{} messages sent, {} refused, {} replies, {} s; the held start reply {}",
                             report.sent, report.refused, report.answered, fixed(report.seconds, 3),
                             isStartAnswered ? "arrived" : "did not arrive"));
+        printLine(summaries != nullptr ? summaryTables(*summaries) : std::get<std::string>(found));
     }
 }
 
@@ -130,10 +162,13 @@ ExitStatus playAndStop(ServiceConnection& service, const Arguments& arguments, c
     if (lines != nullptr) {
         wrong = player.play(*lines, plan.file);
     }
+    SummaryReader reader(client::Directories::ofThisProcess().logs);
     auto stopped = service.client().stopReportingSessionForID(plan.player.reporterID);
     bool answer = false;
     const auto failure = service.await(stopped, answer);
-    printReport(arguments, player.report(), *isStartAnswered);
+    const Summaries summaries = failure ? Summaries("no summaries: the session was not stopped")
+                                        : reader.read(describe(plan, player.report()));
+    printReport(arguments, player.report(), *isStartAnswered, summaries);
     if (wrong) {
         return complain(ExitStatus::usage, *wrong);
     }
@@ -180,9 +215,13 @@ constexpr Command kCommandSession{
     "\"payload\": {...}}.\n"
     "Messages are sent at their offsets, in seconds since the session's start, or, without those, spaced "
     "like their\n"
-    "payloads' zrreporting_timestamp. Exits with 1 when a message was refused or the held reply to the start "
-    "did\n"
-    "not come, with 2 at a line that cannot be read (the session is stopped first).",
+    "payloads' zrreporting_timestamp. In the end it prints what the service derived from the session, as it "
+    "stands in\n"
+    "LOGS_DIRECTORY/analytics-events.jsonl: of sessions of one application and service type that stop at "
+    "the same moment,\n"
+    "it may be another one's. Exits with 1 when a message was refused or the held reply to the start did not "
+    "come, with\n"
+    "2 at a line that cannot be read (the session is stopped first).",
     kOptions,
     run,
 };

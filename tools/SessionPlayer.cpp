@@ -26,6 +26,7 @@ double secondsSince1970() {
 
 std::optional<std::string> SessionPlayer::play(std::istream& lines, const std::string& name) {
     start_ = Clock::now();
+    startTimestamp_ = secondsSince1970();
     SessionSpacing spacing;
     std::optional<std::string> wrong;
     std::string text;
@@ -39,12 +40,12 @@ std::optional<std::string> SessionPlayer::play(std::istream& lines, const std::s
             break;
         }
         auto& line = std::get<SessionLine>(parsed);
+        const double due = std::min(spacing.due(line), kLongestOffset);
         if (options_.speed) {
-            const std::chrono::duration<double> due(std::min(spacing.due(line), kLongestOffset) /
-                                                    *options_.speed);
-            waitUntil(start_ + std::chrono::duration_cast<Clock::duration>(due));
+            const std::chrono::duration<double> delay(due / *options_.speed);
+            waitUntil(start_ + std::chrono::duration_cast<Clock::duration>(delay));
         }
-        send(line);
+        send(line, due);
         showProgress(false);
     }
     waitForReplies();
@@ -64,9 +65,10 @@ void SessionPlayer::waitUntil(Clock::time_point time) {
     }
 }
 
-void SessionPlayer::send(SessionLine& line) {
+void SessionPlayer::send(SessionLine& line, double due) {
     if (options_.restamp || !line.payload.contains(kTimestampKey)) {
-        line.payload.set(kTimestampKey, secondsSince1970());
+        line.payload.set(kTimestampKey,
+                         options_.stampsAsRecorded ? startTimestamp_ + due : secondsSince1970());
     }
     while (report_->sent - report_->answered >= kMostUnderWay && !isLost()) {
         client_.run(kProgressInterval);

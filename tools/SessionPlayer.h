@@ -23,6 +23,9 @@ public:
         std::optional<double> speed = 1;
         /// Gives every message a fresh timestamp, not just those that have none.
         bool restamp = false;
+        /// Timestamps that it gives are as far apart as the messages were recorded, whatever the speed: those
+        /// of a session that is played faster run ahead of the clock.
+        bool stampsAsRecorded = false;
         bool showsProgress = false;
         std::chrono::milliseconds timeout{};
     };
@@ -52,7 +55,7 @@ private:
     using Clock = std::chrono::steady_clock;
 
     void waitUntil(Clock::time_point time);
-    void send(SessionLine& line);
+    void send(SessionLine& line, double due);
     [[nodiscard]] bool isLost() const noexcept { return !client_.isConnected(); }
     void waitForReplies();
     void showProgress(bool isLast);
@@ -62,6 +65,7 @@ private:
     /// Shared with the replies, which may come when the player is gone.
     const std::shared_ptr<Report> report_;
     Clock::time_point start_;
+    double startTimestamp_ = 0; ///< the start in seconds since 1970
     Clock::time_point lastShown_{};
 };
 

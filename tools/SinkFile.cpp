@@ -96,6 +96,14 @@ void SinkFollower::openFile(const std::string& path) {
     offset_ = 0;
 }
 
+void SinkFollower::skipToEnd() {
+    struct stat status {};
+    openFile(path_);
+    if (descriptor_ >= 0 && ::fstat(descriptor_, &status) == 0) {
+        offset_ = status.st_size;
+    }
+}
+
 void SinkFollower::readNew(LineFunction& line) {
     if (descriptor_ < 0) {
         openFile(path_);

@@ -29,6 +29,9 @@ public:
     SinkFollower(const SinkFollower&) = delete;
     SinkFollower& operator=(const SinkFollower&) = delete;
 
+    /// Passes over what stands in the file now, without reading it. The next line handed over may be the rest
+    /// of one that was just being written.
+    void skipToEnd();
     /// Hands over every line that has come since the last call, in the file that stands there now at the
     /// first, and follows renames.
     void readNew(LineFunction& line);
