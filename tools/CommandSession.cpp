@@ -27,7 +27,8 @@ constexpr Option kOptions[] = {
     {"--speed", "N", "play N times as fast as recorded"},
     {"--fast", "", "play as fast as the service takes the messages"},
     {"--restamp", "", "give every message a fresh timestamp, not just those without one"},
-    {"--recorded-spacing", "", "give timestamps as far apart as recorded, however fast it is played"},
+    {"--recorded-spacing", "",
+     "give timestamps as far apart as recorded, at any speed; the last is the present"},
     {"--progress", "", "show progress though standard error is no terminal"},
     {"--quiet", "", "no progress, no report and no summaries"},
     kJsonOption,
@@ -76,7 +77,6 @@ std::variant<Plan, std::string> makePlan(const Arguments& arguments) {
         plan.player.speed = speed.doubleValue();
     }
     plan.player.restamp = arguments.has("--restamp");
-    plan.player.stampsAsRecorded = arguments.has("--recorded-spacing");
     plan.player.showsProgress =
         !arguments.has("--quiet") && (arguments.has("--progress") || ::isatty(STDERR_FILENO) != 0);
     plan.file = arguments.last("--play").value_or("");
@@ -196,6 +196,12 @@ ExitStatus run(const Arguments& arguments) {
             return complain(ExitStatus::usage, formatted("cannot read {}", plan.file));
         }
         lines = &file;
+    }
+    if (arguments.has("--recorded-spacing") && lines != nullptr) {
+        plan.player.recordedLength = recordedLength(*lines);
+        if (!plan.player.recordedLength) {
+            return complain(ExitStatus::usage, "--recorded-spacing needs a file that can be read twice");
+        }
     }
     ServiceConnection service(arguments);
     if (const auto failure = service.connect()) {

@@ -40,9 +40,9 @@ std::optional<std::string> SessionPlayer::play(std::istream& lines, const std::s
             break;
         }
         auto& line = std::get<SessionLine>(parsed);
-        const double due = std::min(spacing.due(line), kLongestOffset);
+        const double due = spacing.due(line);
         if (options_.speed) {
-            const std::chrono::duration<double> delay(due / *options_.speed);
+            const std::chrono::duration<double> delay(std::min(due, kLongestOffset) / *options_.speed);
             waitUntil(start_ + std::chrono::duration_cast<Clock::duration>(delay));
         }
         send(line, due);
@@ -65,10 +65,17 @@ void SessionPlayer::waitUntil(Clock::time_point time) {
     }
 }
 
+double SessionPlayer::timestampFor(double due) const {
+    if (!options_.recordedLength) {
+        return secondsSince1970();
+    }
+    const double playingTime = options_.speed ? *options_.recordedLength / *options_.speed : 0;
+    return startTimestamp_ + playingTime - (*options_.recordedLength - due);
+}
+
 void SessionPlayer::send(SessionLine& line, double due) {
     if (options_.restamp || !line.payload.contains(kTimestampKey)) {
-        line.payload.set(kTimestampKey,
-                         options_.stampsAsRecorded ? startTimestamp_ + due : secondsSince1970());
+        line.payload.set(kTimestampKey, timestampFor(due));
     }
     while (report_->sent - report_->answered >= kMostUnderWay && !isLost()) {
         client_.run(kProgressInterval);
@@ -109,6 +116,19 @@ void SessionPlayer::showProgress(bool isLast) {
                  static_cast<unsigned long long>(report_->sent),
                  static_cast<unsigned long long>(report_->answered), seconds, isLast ? "\n" : "");
     std::fflush(stderr);
+}
+
+std::optional<double> recordedLength(std::istream& lines) {
+    double length = 0;
+    SessionSpacing spacing;
+    for (std::string text; std::getline(lines, text);) {
+        const auto parsed = parseSessionLine(text);
+        if (const auto* line = std::get_if<SessionLine>(&parsed)) {
+            length = std::max(length, spacing.due(*line));
+        }
+    }
+    lines.clear();
+    return lines.seekg(0) ? std::optional(length) : std::nullopt;
 }
 
 } // namespace tamblo::tools

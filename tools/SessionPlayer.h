@@ -23,9 +23,10 @@ public:
         std::optional<double> speed = 1;
         /// Gives every message a fresh timestamp, not just those that have none.
         bool restamp = false;
-        /// Timestamps that it gives are as far apart as the messages were recorded, whatever the speed: those
-        /// of a session that is played faster run ahead of the clock.
-        bool stampsAsRecorded = false;
+        /// The recording's length in seconds, when the timestamps that it gives are to be as far apart as
+        /// recorded, whatever the speed. The last message's is the time at which that is sent, so that a
+        /// session that is played faster seems to have begun earlier.
+        std::optional<double> recordedLength{};
         bool showsProgress = false;
         std::chrono::milliseconds timeout{};
     };
@@ -56,6 +57,7 @@ private:
 
     void waitUntil(Clock::time_point time);
     void send(SessionLine& line, double due);
+    [[nodiscard]] double timestampFor(double due) const;
     [[nodiscard]] bool isLost() const noexcept { return !client_.isConnected(); }
     void waitForReplies();
     void showProgress(bool isLast);
@@ -68,5 +70,9 @@ private:
     double startTimestamp_ = 0; ///< the start in seconds since 1970
     Clock::time_point lastShown_{};
 };
+
+/// When the last line is due, found by reading the stream, which is then at its beginning again; nothing when
+/// it cannot be read twice. Lines that are wrong count nothing.
+[[nodiscard]] std::optional<double> recordedLength(std::istream& lines);
 
 } // namespace tamblo::tools
