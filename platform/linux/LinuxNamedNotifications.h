@@ -1,17 +1,62 @@
 #pragma once
 
 #include "platform/NamedNotifications.h"
+#include "platform/StructuredLog.h"
+#include "platform/linux/DirectoryWatcher.h"
+
+#include <map>
+#include <memory>
+#include <mutex>
+#include <string>
+#include <string_view>
+#include <unordered_map>
 
 namespace tamblo {
 
-/// Named notifications as files.
+/// Named notifications as files: `<directory>/<name>` holds the name's state word in decimal, and each
+/// finished write of it is a post. Removing the file is a post too, after which the state cannot be read.
+///
+/// The kernel tells of the writes: the event loop calls `deliverPosts` when the descriptor is readable. Each
+/// registration has at most one call waiting on its queue, however many posts come meanwhile: a call reads
+/// the state when it runs, so that the last one is always seen. A post just before a registration may be told
+/// to it. When the directory comes or goes, any word may have changed, and every handler is called.
+///
+/// Statuses are `errno` values. Any thread may register, ask and cancel.
 class LinuxNamedNotifications final : public NamedNotifications {
 public:
-    [[nodiscard]] Registration RegisterNamedNotification(std::string_view, SerialQueue&, Handler) override {
-        return {1, 0};
-    }
-    [[nodiscard]] State GetNamedNotificationState(int) override { return {1, 0}; }
-    void CancelNamedNotification(int) override {}
+    /// The log must outlive the notifications.
+    LinuxNamedNotifications(std::string directory, StructuredLog& log);
+
+    /// Fails for a name that is no plain file name: `EINVAL`, or `ENAMETOOLONG`. Succeeds when the directory
+    /// cannot be watched (said in the log): the state can be read all the same.
+    [[nodiscard]] Registration RegisterNamedNotification(std::string_view name, SerialQueue& queue,
+                                                         Handler handler) override;
+    /// The word in the file at this moment. `EBADF` for an unknown token, `ENOENT` for a name that was never
+    /// posted, `EBADMSG` for a file that does not hold one decimal number and nothing else but white space
+    /// around it, `ERANGE` for one beyond 64 bits, and whatever keeps the file from being read. A symbolic
+    /// link is `ELOOP`: writes through it would not be noticed.
+    [[nodiscard]] State GetNamedNotificationState(int token) override;
+    void CancelNamedNotification(int token) override;
+
+    /// For the event loop; -1 when posts cannot be noticed (said in the log).
+    [[nodiscard]] int fileDescriptor() const noexcept { return watcher_.fileDescriptor(); }
+    void deliverPosts();
+
+private:
+    struct Registered;
+    using ByName = std::multimap<std::string, std::shared_ptr<Registered>, std::less<>>;
+
+    static void post(const std::shared_ptr<Registered>& registered);
+    void reportUnwatched();
+
+    StructuredLog& log_;
+    /// Used by `deliverPosts` alone.
+    DirectoryWatcher watcher_;
+    int reportedError_ = 0;
+    std::mutex mutex_; ///< guards what follows
+    ByName byName_;
+    std::unordered_map<int, ByName::iterator> byToken_;
+    int lastToken_ = 0;
 };
 
 } // namespace tamblo

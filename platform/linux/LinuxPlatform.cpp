@@ -73,22 +73,32 @@ private:
     UniqueFunction<void()> endWanted_;
 };
 
-class LinuxPlatform::PreferenceChanges final : public EventSource {
+/// What steers the service and is told by the kernel: preferences and notifications.
+class LinuxPlatform::Changes final : public EventSource {
 public:
-    explicit PreferenceChanges(LinuxPreferences& preferences) : preferences_(preferences) {}
-    void ready(std::uint32_t) override { preferences_.readChanges(); }
+    explicit Changes(UniqueFunction<void()> read) : read_(std::move(read)) {}
+
+    /// Nothing is watched where the kernel gave no descriptor for it.
+    void watch(EventLoop& loop, int descriptor) {
+        if (descriptor >= 0) {
+            loop.add(descriptor, EPOLLIN, *this);
+        }
+    }
+    void ready(std::uint32_t) override { read_(); }
     [[nodiscard]] bool comesFirst() const noexcept override { return true; }
 
 private:
-    LinuxPreferences& preferences_;
+    UniqueFunction<void()> read_;
 };
 
 /// In the order in which they depend on each other.
 struct LinuxPlatform::Services {
     explicit Services(const Directories& directories)
-        : deviceProperties(directories.deviceProperties(), log),
+        : namedNotifications(directories.notifications(), log),
+          notificationChanges([this] { namedNotifications.deliverPosts(); }),
+          deviceProperties(directories.deviceProperties(), log),
           preferences(directories.preferences(), log),
-          preferenceChanges(preferences),
+          preferenceChanges([this] { preferences.readChanges(); }),
           analyticsEvents(directories.logs, clock, preferences, log),
           connections(loop, log) {}
 
@@ -100,9 +110,10 @@ struct LinuxPlatform::Services {
     LinuxProcessInformation processInformation;
     LinuxDeviceConditions deviceConditions;
     LinuxNamedNotifications namedNotifications;
+    Changes notificationChanges;
     LinuxDeviceProperties deviceProperties;
     LinuxPreferences preferences;
-    PreferenceChanges preferenceChanges;
+    Changes preferenceChanges;
     LinuxAnalyticsEventService analyticsEvents;
     EventLoop loop;
     LinuxConnectionService connections;
@@ -160,9 +171,8 @@ void LinuxPlatform::run(SerialQueue& requestQueue,
     all.workQueues.setTickEnd([this] { flushSinks(); });
     all.connections.setRequestQueue(requestQueue);
     all.loop.setBrackets([&all] { all.drain.emplace(); }, [&all] { all.drain.reset(); });
-    if (all.preferences.fileDescriptor() >= 0) {
-        all.loop.add(all.preferences.fileDescriptor(), EPOLLIN, all.preferenceChanges);
-    }
+    all.preferenceChanges.watch(all.loop, all.preferences.fileDescriptor());
+    all.notificationChanges.watch(all.loop, all.namedNotifications.fileDescriptor());
     all.signals.watch(all.loop, [&all, &shutDown] {
         notifyServiceManager("STOPPING=1");
         all.connections.stop();

@@ -32,7 +32,7 @@ public:
 
 private:
     class Signals;
-    class PreferenceChanges;
+    class Changes;
     struct Services;
 
     explicit LinuxPlatform(const Directories& directories);

@@ -2,14 +2,18 @@
 
 #include "base/Format.h"
 #include "base/Utf8.h"
-#include "platform/linux/FileDescriptor.h"
+#include "platform/linux/SmallFile.h"
 
-#include <array>
+#include <algorithm>
 #include <cerrno>
+#include <charconv>
 #include <cstdlib>
 #include <ctime>
+#include <string_view>
+#include <system_error>
+#include <utility>
 
-#include <fcntl.h>
+#include <unistd.h>
 
 namespace tamblo {
 
@@ -43,7 +47,41 @@ std::string asUtf8(std::string name) {
     return name;
 }
 
+/// The bytes of a line such as "RssAnon:      1234 kB"; nothing without that line.
+std::optional<std::uint64_t> bytesOfField(std::string_view status, std::string_view name) {
+    const std::size_t at = status.find(formatted("\n{}:", name));
+    if (at == std::string_view::npos) {
+        return std::nullopt;
+    }
+    status.remove_prefix(at + name.size() + 2);
+    status.remove_prefix(std::min(status.find_first_not_of(" \t"), status.size()));
+    std::uint64_t kibibytes = 0;
+    const auto result = std::from_chars(status.data(), status.data() + status.size(), kibibytes);
+    return result.ec == std::errc() ? std::optional(kibibytes * 1024) : std::nullopt;
+}
+
+ProcessInformation::QueryError queryError(int code) {
+    return {code, std::generic_category().message(code)};
+}
+
+std::variant<std::uint64_t, ProcessInformation::QueryError> readFootprint(const std::string& path) {
+    constexpr std::size_t kMaximumStatus = 64UL * 1024;
+    const SmallFile file = SmallFile::read(path, kMaximumStatus);
+    if (file.error != 0) {
+        return queryError(file.error);
+    }
+    const auto anonymous = bytesOfField(file.text, "RssAnon");
+    if (!anonymous) {
+        return queryError(ENODATA);
+    }
+    return *anonymous + bytesOfField(file.text, "RssShmem").value_or(0) +
+           bytesOfField(file.text, "VmSwap").value_or(0);
+}
+
 } // namespace
+
+LinuxProcessInformation::LinuxProcessInformation(std::string root, SteadyNow now)
+    : root_(std::move(root)), footprint_(kValidity, std::move(now)) {}
 
 pid_t LinuxProcessInformation::ownProcessIdentifier() const noexcept {
     return ::getpid();
@@ -53,13 +91,11 @@ std::optional<std::string> LinuxProcessInformation::ProcessNameForPid(pid_t pid)
     if (pid <= 0) {
         return std::nullopt;
     }
-    const FileDescriptor file(::open(formatted("/proc/{}/comm", pid).c_str(), O_RDONLY | O_CLOEXEC));
-    std::array<char, 64> bytes;
-    const ssize_t count = file.isOpen() ? ::read(file.get(), bytes.data(), bytes.size()) : 0;
-    if (count <= 0) {
+    constexpr std::size_t kMaximumName = 64;
+    std::string name = SmallFile::read(formatted("{}/{}/comm", root_, pid), kMaximumName).text;
+    if (name.empty()) {
         return std::nullopt;
     }
-    std::string name(bytes.data(), static_cast<std::size_t>(count));
     if (name.back() == '\n') {
         name.pop_back();
     }
@@ -76,13 +112,12 @@ std::chrono::microseconds LinuxProcessInformation::processorTime() const noexcep
 
 std::variant<std::uint64_t, ProcessInformation::QueryError>
 LinuxProcessInformation::physicalFootprint() const {
-    return QueryError{ENOSYS, "not implemented"};
+    return footprint_.get([this] { return readFootprint(root_ + "/self/status"); });
 }
 
 std::array<double, 3> LinuxProcessInformation::loadAverages() const {
     std::array<double, 3> loads{};
-    (void)::getloadavg(loads.data(), 3);
-    return loads;
+    return ::getloadavg(loads.data(), 3) == 3 ? loads : std::array<double, 3>{};
 }
 
 } // namespace tamblo
