@@ -53,6 +53,8 @@ void roundTrip(Bench& bench);
 void retained(Bench& bench);
 void manyClients(Bench& bench);
 void manySessions(Bench& bench);
+void stop100k(Bench& bench);
+void stopMany(Bench& bench);
 void idle(Bench& bench);
 void startUp(Bench& bench);
 

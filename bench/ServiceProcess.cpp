@@ -88,10 +88,9 @@ std::chrono::nanoseconds ServiceProcess::age() const noexcept {
 }
 
 void ServiceProcess::start(const Settings& settings, const std::string& notifySocket) {
-    const std::string logPath = directory_.path() + "/log";
-    const FileDescriptor log(::open(logPath.c_str(), O_WRONLY | O_CREAT | O_APPEND | O_CLOEXEC, 0600));
+    const FileDescriptor log(::open(logPath().c_str(), O_WRONLY | O_CREAT | O_APPEND | O_CLOEXEC, 0600));
     if (!log.isOpen()) {
-        fail(logPath);
+        fail(logPath());
     }
     std::array<std::string, 5> variables{
         "RUNTIME_DIRECTORY=" + directory_.path() + "/runtime",
@@ -165,9 +164,19 @@ void ServiceProcess::stop() {
     }
 }
 
+std::size_t ServiceProcess::countEvents(std::string_view name) const {
+    std::ifstream file(directory_.path() + "/logs/analytics-events.jsonl", std::ios::binary);
+    const std::string field = "\"event\":\"" + std::string(name) + "\"";
+    std::size_t count = 0;
+    for (std::string line; std::getline(file, line);) {
+        count += line.find(field) != std::string::npos ? 1 : 0;
+    }
+    return count;
+}
+
 std::string ServiceProcess::logTail() const {
     constexpr std::size_t kCharacters = 400;
-    std::ifstream file(directory_.path() + "/log", std::ios::binary);
+    std::ifstream file(logPath(), std::ios::binary);
     std::ostringstream text;
     text << file.rdbuf();
     const std::string all = text.str();

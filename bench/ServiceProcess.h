@@ -3,8 +3,10 @@
 #include "TemporaryDirectory.h"
 
 #include <chrono>
+#include <cstddef>
 #include <optional>
 #include <string>
+#include <string_view>
 
 #include <sys/types.h>
 
@@ -29,6 +31,10 @@ public:
 
     [[nodiscard]] pid_t pid() const noexcept { return pid_; }
     [[nodiscard]] const std::string& socketPath() const noexcept { return socketPath_; }
+    /// What it writes to standard error.
+    [[nodiscard]] std::string logPath() const { return directory_.path() + "/log"; }
+    /// How many analytics events of this name it has written, as far as the file at hand goes back.
+    [[nodiscard]] std::size_t countEvents(std::string_view name) const;
     /// From just before the fork until the service had said that it is ready.
     [[nodiscard]] std::chrono::nanoseconds timeUntilReady() const noexcept { return timeUntilReady_; }
     /// From just before the fork until now.

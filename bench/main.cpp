@@ -31,6 +31,8 @@ constexpr std::array kScenarios{
     Scenario{"retained", "the cost of a message with 1,000,000 retained", retained},
     Scenario{"many_clients", "the cost of a message with 5,000 clients connected", manyClients},
     Scenario{"many_sessions", "10,000 started sessions", manySessions},
+    Scenario{"stop_100k", "the stop of a session with 100,000 messages retained", stop100k},
+    Scenario{"stop_many", "another client's round trips while 10,000 sessions are stopped", stopMany},
     Scenario{"idle", "nothing connected", idle},
     Scenario{"start_up", "from exec to the first accepted connection", startUp},
 };
