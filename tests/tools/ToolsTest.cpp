@@ -171,6 +171,30 @@ TEST(SessionPlayer, PlaysInTimeAndStampsWhatHasNoTimestamp) {
     EXPECT_EQ(requests[1].reporterIDs, std::vector<std::int64_t>{7});
 }
 
+TEST(SessionPlayer, KeepsTheRecordedTimesAtAnySpeed) {
+    test::FakeService service;
+    client::Client client({.socketPath = service.path(), .threading = client::Client::Threading::caller});
+    ASSERT_TRUE(client.connect());
+    std::istringstream lines(
+        "{\"category\": 14, \"offset_s\": 2}\nodd\n{\"category\": 14, \"offset_s\": 62}\n");
+    EXPECT_EQ(recordedLength(lines), 62.0);
+    std::istringstream played("{\"category\": 14, \"offset_s\": 2}\n{\"category\": 14, \"offset_s\": 62}\n");
+    SessionPlayer player(client, {.reporterID = 7,
+                                  .speed = {},
+                                  .recordedLength = recordedLength(lines),
+                                  .timeout = std::chrono::seconds(5)});
+    const double before =
+        std::chrono::duration<double>(std::chrono::system_clock::now().time_since_epoch()).count();
+    EXPECT_FALSE(player.play(played, "file"));
+    const auto requests = service.requests();
+    ASSERT_EQ(requests.size(), 2U);
+    const auto timestamp = [&requests](std::size_t i) {
+        return requests[i].dictionary.find(kTimestampKey)->doubleValue();
+    };
+    EXPECT_NEAR(timestamp(1) - timestamp(0), 60, 1e-3);
+    EXPECT_NEAR(timestamp(1), before, 5);
+}
+
 TEST(RecordFilter, WantsOneOfTheEventsAndAllOfTheKeys) {
     const Dictionary record{
         {"time", 1}, {"event", "com.vandra.a"}, {"payload", Dictionary{{"n", 5}, {"t", "5"}}}};
