@@ -11,6 +11,7 @@
 #include <chrono>
 #include <cstdint>
 #include <filesystem>
+#include <fstream>
 #include <future>
 #include <memory>
 #include <thread>
@@ -40,9 +41,14 @@ protected:
         deliver();
     }
 
-    int add(std::string_view name) {
-        const auto [status, token] = notifications_.RegisterNamedNotification(
-            name, queue_, [this](int called) { calls_.push_back(called); });
+    /// A registration, whose handler notes its call and then does what is given.
+    int add(
+        std::string_view name, const NamedNotifications::Handler& then = [](int) {}) {
+        const auto noted = [this, then](int called) {
+            calls_.push_back(called);
+            then(called);
+        };
+        const auto [status, token] = notifications_.RegisterNamedNotification(name, queue_, noted);
         EXPECT_EQ(status, 0);
         EXPECT_GT(token, 0);
         return token;
@@ -157,20 +163,16 @@ TEST_F(NamedNotificationsTest, EveryKindOfPostCallsEachRegistrationOfItsName) {
 
 TEST_F(NamedNotificationsTest, ABurstIsOneWaitingCallThatSeesTheLastState) {
     std::vector<std::uint64_t> seen;
-    int token = 0;
-    bool postsAgain = true;
-    token = notifications_
-                .RegisterNamedNotification("n", queue_,
-                                           [&](int called) {
-                                               seen.push_back(state(called).second);
-                                               if (std::exchange(postsAgain, false)) {
-                                                   post("n", "2001");
-                                                   deliver();
-                                               }
-                                           })
-                .token;
-    for (int word = 1; word <= 2000; ++word) {
-        post("n", std::to_string(word));
+    const int token = add("n", [&](int called) {
+        seen.push_back(state(called).second);
+        if (seen.size() == 1) {
+            post("n", "8");
+            deliver();
+        }
+    });
+    post("n", "1000");
+    for (int word = 1000; word <= 5000; ++word) {
+        std::fstream(path_ + "/n") << word; // in place: emptying a file first makes a disk work
         if (word % 7 == 0) {
             deliver();
         }
@@ -178,31 +180,27 @@ TEST_F(NamedNotificationsTest, ABurstIsOneWaitingCallThatSeesTheLastState) {
     deliver();
     EXPECT_EQ(queue_.takePaces().size(), 1U);
     queue_.runAll();
-    EXPECT_THAT(seen, ElementsAre(2000, 2001)) << "what comes while the handler runs is another call";
-    EXPECT_EQ(state(token), std::pair(0, 2001UL));
+    EXPECT_THAT(seen, ElementsAre(5000, 8)) << "what comes while the handler runs is another call";
+    EXPECT_EQ(state(token), std::pair(0, 8UL));
 }
 
 TEST_F(NamedNotificationsTest, ThreadsPostReadAndRegisterAtOnce) {
     LinuxWorkQueues queues;
     const auto queue = queues.makeSerialQueue("notifications");
-    constexpr std::uint64_t kLast = 1500;
+    constexpr std::uint64_t kLast = 300;
     std::promise<void> lastSeen;
     // Unguarded: the queue is the guard.
     std::vector<std::uint64_t> seen;
     bool isLastSeen = false;
-    const int token =
-        notifications_
-            .RegisterNamedNotification("n", *queue,
-                                       [&](int called) {
-                                           const auto [status, word] = state(called);
-                                           if (status == 0) {
-                                               seen.push_back(word);
-                                           }
-                                           if (word == kLast && !std::exchange(isLastSeen, true)) {
-                                               lastSeen.set_value();
-                                           }
-                                       })
-            .token;
+    const auto handler = [&](int called) {
+        const auto [status, word] = state(called);
+        EXPECT_EQ(status, 0);
+        seen.push_back(word);
+        if (word == kLast && !std::exchange(isLastSeen, true)) {
+            lastSeen.set_value();
+        }
+    };
+    const int token = notifications_.RegisterNamedNotification("n", *queue, handler).token;
     std::atomic<bool> isDone{false};
     std::thread loop([&] {
         while (!isDone) {
@@ -237,21 +235,11 @@ TEST_F(NamedNotificationsTest, ThreadsPostReadAndRegisterAtOnce) {
 
 TEST_F(NamedNotificationsTest, NoCallFollowsACancellation) {
     const auto held = std::make_shared<int>();
-    const int first = notifications_
-                          .RegisterNamedNotification("n", queue_,
-                                                     [this, held](int called) { //
-                                                         calls_.push_back(called);
-                                                     })
-                          .token;
-    int itself = 0;
-    itself = notifications_
-                 .RegisterNamedNotification("n", queue_,
-                                            [&, held](int called) {
-                                                calls_.push_back(called);
-                                                notifications_.CancelNamedNotification(called);
-                                                calls_.push_back(static_cast<int>(held.use_count()));
-                                            })
-                 .token;
+    const int first = add("n", [held](int) {});
+    const int itself = add("n", [this, held](int called) {
+        notifications_.CancelNamedNotification(called);
+        calls_.push_back(held != nullptr ? -1 : 0); // what it holds is still there
+    });
     const int remaining = add("n");
     post("n", "1");
     deliver();
@@ -259,7 +247,7 @@ TEST_F(NamedNotificationsTest, NoCallFollowsACancellation) {
     notifications_.CancelNamedNotification(first);
     notifications_.CancelNamedNotification(4711);
     queue_.runAll();
-    EXPECT_THAT(std::exchange(calls_, {}), ElementsAre(itself, 2, remaining));
+    EXPECT_THAT(std::exchange(calls_, {}), ElementsAre(itself, -1, remaining));
     EXPECT_EQ(held.use_count(), 1) << "the handlers are gone";
     EXPECT_EQ(state(itself), std::pair(EBADF, 0UL));
     post("n", "2");
