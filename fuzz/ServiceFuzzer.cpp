@@ -4,6 +4,7 @@
 
 #include "platform/linux/RequestDispatch.h"
 #include "service/ZRReportingService.h"
+#include "system/ZRReportingSystemMonitor.h"
 #include "tests/fakes/FakePlatform.h"
 #include "wire/FrameSplitter.h"
 
@@ -87,5 +88,6 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* bytes, std::size_t siz
     connection->invalidate();
     device.serverQueue().runAll();
     demand(service.getAllClients().empty());
+    ZRReportingSystemMonitor::reset(); // made with the service, on this device
     return 0;
 }

@@ -4,6 +4,7 @@
 #include "service/ClientUptime.h"
 #include "service/ZRReportingClientServerInstance.h"
 #include "session/ZRReportingSession.h"
+#include "system/ZRReportingSystemMonitor.h"
 #include "util/Log.h"
 #include "util/ReportingServerQueue.h"
 
@@ -13,7 +14,9 @@
 namespace tamblo {
 
 ZRReportingService::ZRReportingService(ExitProcess exit)
-    : exitProcess_(exit), self_(this, [](ZRReportingService*) {}) {}
+    : exitProcess_(exit), self_(this, [](ZRReportingService*) {}) {
+    ZRReportingSystemMonitor::initializeWithQueue(ZRReportingUtilityGetReportingServerQueue());
+}
 
 ZRReportingService::~ZRReportingService() {
     log::standard(ZRReportingClientCategory(), "destroying service");

@@ -9,16 +9,11 @@
 
 namespace tamblo {
 
-namespace {
-
-/// Payloads carry these figures as 32-bit integers.
 int roundedTo32Bits(double number) noexcept {
     constexpr double kLeast = std::numeric_limits<int>::min();
     constexpr double kMost = std::numeric_limits<int>::max();
     return static_cast<int>(std::clamp(std::round(number), kLeast, kMost));
 }
-
-} // namespace
 
 bool ZRReportingUtilityKeyIsPresentAndHasChanged(std::string_view key, const Dictionary* first,
                                                  const Dictionary* second) noexcept {

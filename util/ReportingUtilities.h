@@ -17,6 +17,8 @@ namespace tamblo {
                                                                const Dictionary* second) noexcept;
 /// Rounds half away from zero to decimal places; negative places are tens, hundreds and so on.
 [[nodiscard]] double ZRReportingUtilityRoundWithPlaces(double value, int places) noexcept;
+/// To the nearest whole number, as payloads carry uptimes; kept within the range.
+[[nodiscard]] int roundedTo32Bits(double number) noexcept;
 /// The dictionary with the time of day, the system's uptime and the process's processor time set to now. What
 /// is stored as "processuptime_ms" is consumed processor time, whatever the name says.
 [[nodiscard]] Dictionary ZRReportingUtilityAddDates(const Dictionary& message);

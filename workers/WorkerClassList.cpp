@@ -1,4 +1,5 @@
 #include "session/WorkerClass.h"
+#include "system/ZRReportingSessionSystemMonitorWorker.h"
 #include "workers/producers/ZRReportingSessionInputMessagesWorker.h"
 #include "workers/producers/ZRReportingSessionKaleenMessagesWorker.h"
 #include "workers/producers/ZRReportingSessionSummaryWorker.h"
@@ -45,7 +46,9 @@ constexpr std::array<WorkerClass, 17> kWorkerClasses{{
      .startOnInit = true,
      .handleSingleMessageSession = true},
     {.name = "ZRReportingSessionDriverSnapshotWorker", .role = kProducer},
-    {.name = "ZRReportingSessionSystemMonitorWorker", .role = kProducer},
+    {.name = "ZRReportingSessionSystemMonitorWorker",
+     .role = kProducer,
+     .initWithSession = initWithSession<ZRReportingSessionSystemMonitorWorker>},
     {.name = "ZRReportingSessionZephWorker", .role = kConsumer, .handleSingleMessageSession = true},
     {.name = "ZRReportingSessionDPWorker", .role = kConsumer},
     {.name = "ZRReportingSessionSummaryJsonFileWorker", .role = kWorkerOnly},

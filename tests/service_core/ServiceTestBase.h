@@ -3,6 +3,7 @@
 #include "service/ZRReportingClientServerInstance.h"
 #include "service/ZRReportingService.h"
 #include "session/ZRReportingSession.h"
+#include "system/ZRReportingSystemMonitor.h"
 #include "tests/fakes/FakePlatform.h"
 #include "tests/session/ScriptedWorkers.h"
 
@@ -29,6 +30,7 @@ protected:
     }
     ~ServiceTestBase() override {
         (void)run();
+        ZRReportingSystemMonitor::reset();
         script.reset();
     }
 
