@@ -80,7 +80,7 @@ int stateOfZone(const std::string& zone) {
 } // namespace
 
 LinuxDeviceConditions::LinuxDeviceConditions(std::string root, SteadyNow now)
-    : root_(std::move(root)), thermalState_(kValidity, now), lowPower_(kValidity, now) {}
+    : root_(std::move(root)), thermalState_(kValidity, now), lowPower_(kValidity, std::move(now)) {}
 
 int LinuxDeviceConditions::thermalState() const {
     return thermalState_.get([this] {
