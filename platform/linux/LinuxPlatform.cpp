@@ -95,7 +95,11 @@ private:
 struct LinuxPlatform::Services {
     explicit Services(const Directories& directories)
         : namedNotifications(directories.notifications(), log),
-          notificationChanges([this] { namedNotifications.deliverPosts(); }),
+          notificationChanges([this] {
+              // A post may tell of a preference that was written just before it.
+              preferences.readChanges();
+              namedNotifications.deliverPosts();
+          }),
           deviceProperties(directories.deviceProperties(), log),
           preferences(directories.preferences(), log),
           preferenceChanges([this] { preferences.readChanges(); }),
