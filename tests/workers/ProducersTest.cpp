@@ -2,6 +2,7 @@
 #include "session/ZRReportingSession.h"
 #include "tests/fakes/FakePlatform.h"
 #include "util/InternalBuild.h"
+#include "util/LogCategories.h"
 #include "workers/producers/ZRReportingSessionInputMessagesWorker.h"
 #include "workers/producers/ZRReportingSessionKaleenMessagesWorker.h"
 #include "workers/producers/ZRReportingSessionVolumeMessagesWorker.h"
@@ -80,30 +81,46 @@ TEST_F(ProducersTest, VolumeSegments) {
         {"a volume change and the end; exactly the minimum is too short",
          {at(10, playing), at(20, {{"QVSessionVolume", 0.8}}), at(25, {{"session_output_running", false}})},
          {"10.0 0.5 \"unknown\" false 1 1"}},
-        {"just above the minimum",
-         {at(10, playing), at(20, {{"QVSessionVolume", 0.8}}), at(25.5, {{"session_output_running", false}})},
-         {"10.0 0.5 \"unknown\" false 1 2", "5.5 0.8 \"unknown\" false 2 2"}},
+        {"just above the minimum, after a stretch that is too short",
+         {at(10, playing), at(13, {{"QVSessionVolume", 0.8}}), at(18.5, {{"session_output_running", false}})},
+         {"5.5 0.8 \"unknown\" false 1 1"}},
         {"the session's length ends a segment, and playing with it",
          {at(0, playing), at(6, {{"session_duration", 6.0}}), at(20, {{"QVSessionVolume", 1}}),
           at(30, {{"session_output_running", false}})},
          {"6.0 0.5 \"unknown\" false 1 1"}},
+        {"a length with output still said to run ends one segment and begins another",
+         {at(0, playing), at(10, {{"session_duration", 10}, {"session_output_running", true}}),
+          at(30, {{"session_output_running", false}})},
+         {"10.0 0.5 \"unknown\" false 1 2", "20.0 0.5 \"unknown\" false 2 2"}},
         {"a format change while nothing plays",
          {at(0, {{"session_selected_format", "A"}, {"QVSessionVolume", 1}}),
           at(9, {{"session_selected_format", "B"}}), at(20, {{"session_duration", 20}})},
          {}},
-        {"each watched setting ends one; carried settings alone do not",
+        {"each watched setting ends one; carried settings alone do not, nor what is said again",
          {at(0, playing), at(10, {{"mFormatID", "x"}, {"mChannelsPerFrame", 2}}),
+          at(15, {{"ringerstate", 0}, {"spatializationEnabled", 0}, {"session_selected_format", "unknown"}}),
           at(20, {{"ringerstate", true}}), at(30, {{"spatializationEnabled", true}}),
           at(40, {{"active_devices", "D"}}), at(50, {{"active_devices", "E"}}),
-          at(60, {{"spatial-audio-accessory-feature", true}}), at(70, {{"session_output_running", false}})},
-         {"20.0 0.5 \"unknown\" false 1 5", "10.0 0.5 \"unknown\" true 2 5", "10.0 0.5 \"unknown\" true 3 5",
-          "10.0 0.5 \"D\" true 4 5", "20.0 0.5 \"E\" true 5 5"}},
-        {"two spatial settings three seconds apart are one change",
-         {at(0, playing), at(10, {{"spatial-audio-accessory-feature", true}}),
-          at(13, {{"spatializationEnabled", true}}), at(30, {{"session_output_running", false}})},
-         {"13.0 0.5 \"unknown\" false 1 2", "17.0 0.5 \"unknown\" false 2 2"}},
-        {"no volume is known",
-         {at(0, {{"session_output_running", true}}), at(10, {{"session_output_running", false}})},
+          at(60, {{"spatial-audio-accessory-feature", true}}), at(70, {{"session_selected_format", "S"}}),
+          at(76, {{"session_output_running", false}})},
+         {"20.0 0.5 \"unknown\" 0 1 6", "10.0 0.5 \"unknown\" true 2 6", "10.0 0.5 \"unknown\" true 3 6",
+          "10.0 0.5 \"D\" true 4 6", "20.0 0.5 \"E\" true 5 6", "6.0 0.5 \"E\" true 6 6"}},
+        {"two spatial settings less than five seconds apart are one change, at the time of the second",
+         {at(0, playing), at(10, {{"spatializationEnabled", true}}),
+          at(14.5, {{"spatial-audio-accessory-feature", true}}), at(30, {{"spatializationEnabled", false}}),
+          at(35, {{"spatial-audio-accessory-feature", false}}), at(50, {{"session_output_running", false}})},
+         {"14.5 0.5 \"unknown\" false 1 3", "15.5 0.5 \"unknown\" false 2 3",
+          "20.0 0.5 \"unknown\" false 3 3"}},
+        {"no volume is known; the first one that is ends nothing",
+         {at(0, {{"session_output_running", true}}), at(10, {{"session_output_running", false}}),
+          at(20, {{"session_output_running", true}}), at(30, {{"QVSessionVolume", 1}}),
+          at(40, {{"session_output_running", false}})},
+         {"20.0 1 \"unknown\" false 1 1"}},
+        {"an end or a start without a timestamp",
+         {playing,
+          at(20, {{"session_output_running", false}}),
+          at(-20, {{"session_output_running", true}}),
+          {{"session_output_running", false}}},
          {}},
         {"a session that begins already playing ends nothing until output is said to run anew",
          {at(10, {{"QVSessionVolume", 0.9}}), at(20, {{"session_duration", 20}})},
@@ -116,8 +133,9 @@ TEST_F(ProducersTest, VolumeSegments) {
          at(1, {{"session_output_running", true}, {"QVSessionVolume", 0.5}, {"active_devices", "Speaker"}})},
         {"output that is said twice to run goes on; timestamps that run backwards make nothing",
          {at(50, playing), at(60, {{"session_output_running", true}}),
+          at(70, {{"session_output_running", false}}), at(80, {{"session_output_running", true}}),
           at(40, {{"session_output_running", false}})},
-         {}},
+         {"20.0 0.5 \"unknown\" false 1 1"}},
     };
     for (const Case& row : cases) {
         SCOPED_TRACE(row.what);
@@ -135,32 +153,62 @@ TEST_F(ProducersTest, VolumeSegments) {
 TEST_F(ProducersTest, AVolumeSummaryHasExactlyTheseKeys) {
     const auto session = sessionWith({});
     const ZRReportingSessionVolumeMessagesWorker worker(session);
-    Dictionary start = playing;
-    start.merge({{"session_selected_format", "AAC"},
-                 {"active_devices", "D"},
-                 {"mFormatID", "aac"},
-                 {"mChannelsPerFrame", 2},
-                 {"other", 1}});
+    const Dictionary settings{{"session_selected_format", "AAC"},
+                              {"active_devices", "D"},
+                              {"mFormatID", "aac"},
+                              {"QVSessionVolume", 0.0625},
+                              {"ringerstate", true},
+                              {"spatial-audio-accessory-feature", true},
+                              {"mChannelsPerFrame", 2},
+                              {"spatializationEnabled", true}};
     const auto derived = worker.createVolumeMessages(
-        records({at(0, start), at(75.25, {{"session_duration", 75}})}), &process, {});
-    ASSERT_EQ(derived.size(), 1U);
-    EXPECT_EQ(derived[0]->category(), AudioEventKindVolume);
-    EXPECT_EQ(derived[0]->type(), AudioEventTypeSummary);
-    EXPECT_EQ(derived[0]->payload(), (Dictionary{{"session_selected_format", "AAC"},
-                                                 {"mFormatID", "aac"},
-                                                 {"active_devices", "D"},
-                                                 {"HostApplicationDisplayID", "com.example.player"},
-                                                 {"QVSessionVolume", 0.5},
-                                                 {"QVSessionVolumeBucketed", "0.5"},
-                                                 {"play_seconds", 75.25F},
-                                                 {"spatial-audio-accessory-feature", false},
-                                                 {"spatializationEnabled", false},
-                                                 {"ringerstate", false},
-                                                 {"mChannelsPerFrame", 2},
-                                                 {"play_secondsBucketed", "60"},
-                                                 {"msgidx", 1},
-                                                 {"msgcnt", 1}}));
-    EXPECT_EQ(derived[0]->payload().find("play_seconds")->kind(), Value::Kind::singleFloat);
+        records({at(0, playing), at(10, settings), at(85.25, {{"session_duration", 75}, {"other", 1}})}),
+        &process, {});
+    ASSERT_EQ(derived.size(), 2U);
+    Dictionary expected{{"session_selected_format", "unknown"},
+                        {"mFormatID", "unknown"},
+                        {"active_devices", "unknown"},
+                        {"HostApplicationDisplayID", "com.example.player"},
+                        {"QVSessionVolume", 0.5},
+                        {"QVSessionVolumeBucketed", "0.5"},
+                        {"play_seconds", 10.0F},
+                        {"spatial-audio-accessory-feature", false},
+                        {"spatializationEnabled", false},
+                        {"ringerstate", false},
+                        {"mChannelsPerFrame", -1},
+                        {"play_secondsBucketed", "10"},
+                        {"msgidx", 1},
+                        {"msgcnt", 2}};
+    EXPECT_EQ(derived[0]->payload(), expected);
+    expected.merge(settings);
+    expected.merge({{"QVSessionVolumeBucketed", "0.0625"},
+                    {"play_seconds", 75.25F},
+                    {"play_secondsBucketed", "60"},
+                    {"msgidx", 2}});
+    EXPECT_EQ(derived[1]->payload(), expected);
+    EXPECT_EQ(derived[1]->payload().find("play_seconds")->kind(), Value::Kind::singleFloat);
+    EXPECT_EQ(derived[1]->category(), AudioEventKindVolume);
+    EXPECT_EQ(derived[1]->type(), AudioEventTypeSummary);
+}
+
+TEST_F(ProducersTest, LogsHowItCutsTheTime) {
+    const auto session = sessionWith({});
+    device.log.setThreshold(LogLevel::debug);
+    forgetLogThresholds();
+    const auto derived = ZRReportingSessionVolumeMessagesWorker(session).createVolumeMessages(
+        records({at(10, playing), at(20.5, {{"ringerstate", true}}), {{"session_output_running", false}}}),
+        &process, {});
+    EXPECT_THAT(device.log.texts(),
+                ElementsAre("entering createVolumeMessages createVolumeMessages",
+                            "playingTime { func=createVolumeMessages, playingTime=10.500000, "
+                            "zrTimestamp=20.5, zrTimestamp_double=20.500000, startZrTimestamp=10.0, "
+                            "startZrTimestamp_double=10.000000 }",
+                            "added volume message { func=createVolumeMessages, action=add, count=1 }",
+                            "playingTime { func=createVolumeMessages, playingTime=-20.500000, "
+                            "zrTimestamp=(null), zrTimestamp_double=0.000000, startZrTimestamp=20.5, "
+                            "startZrTimestamp_double=20.500000 }",
+                            "skipped volume message, too short { func=createVolumeMessages, action=skip, "
+                            "count=1 }"));
 }
 
 TEST_F(ProducersTest, InputSegments) {
@@ -188,7 +236,7 @@ TEST_F(ProducersTest, InputSegments) {
          {at(0, running), at(10, {{"session_duration", 10}, {"session_input_running", true}}),
           at(30, {{"session_input_running", false}})},
          {"10.0 \"A\" 1 2", "20.0 \"A\" 2 2"}},
-        {"without timestamps", {running, {{"session_input_running", false}}}, {}},
+        {"a start without a timestamp", {running, at(20, {{"session_input_running", false}})}, {}},
     };
     for (const Case& row : cases) {
         SCOPED_TRACE(row.what);

@@ -11,13 +11,18 @@
 namespace tamblo {
 namespace {
 
-constexpr std::array<std::string_view, 2> kKeys{"spatial-audio-accessory-feature", "spatializationEnabled"};
+constexpr std::array<std::string_view, 3> kKeys{"spatial-audio-accessory-feature", "spatializationEnabled",
+                                                "ringerstate"};
 
-/// A message of the burst keys it names: 's' for the first, 'e' for the second; anything else is another key.
+/// A message of the burst keys it names: 's', 'e' and 'r' for theirs; anything else is another key.
 MessageRef message(const char* keys, const Value& time, int value) {
     Dictionary payload;
     for (const char* key = keys; *key != 0; ++key) {
-        payload.set(*key == 's' ? kKeys[0] : *key == 'e' ? kKeys[1] : "other", value);
+        payload.set(*key == 's'   ? kKeys[0]
+                    : *key == 'e' ? kKeys[1]
+                    : *key == 'r' ? kKeys[2]
+                                  : "other",
+                    value);
     }
     if (time.isNumber()) {
         payload.set("zrreporting_timestamp", time);
@@ -59,13 +64,24 @@ TEST(WorkerUtilityTest, CombinesBurstsInPlace) {
          2,
          {{1,
            R"({"spatial-audio-accessory-feature":2,"spatializationEnabled":1,"zrreporting_timestamp":1.999})"}}},
-        {"at the pause; the old anchor stays, so that a repeat of the late one's key begins anew",
-         {{"e", 0.0}, {"s", 2.0}, {"s", 2.5}, {"e", 3.0}},
+        {"the pause is that since the message before",
+         {{"e", 0.0}, {"r", 1.5}, {"s", 3.0}},
+         2,
+         {{1,
+           R"({"ringerstate":2,"spatial-audio-accessory-feature":3,"spatializationEnabled":1,"zrreporting_timestamp":3.0})"}}},
+        {"at the pause; the old anchor stays, and a repeat of the late one's key begins anew",
+         {{"e", 0.0}, {"s", 2.0}, {"r", 3.0}, {"s", 3.5}, {"e", 4.0}},
          2,
          {{1, R"({"spatializationEnabled":1,"zrreporting_timestamp":0.0})"},
           {2, R"({"spatial-audio-accessory-feature":2,"zrreporting_timestamp":2.0})"},
-          {3,
-           R"({"spatial-audio-accessory-feature":3,"spatializationEnabled":4,"zrreporting_timestamp":3.0})"}}},
+          {3, R"({"ringerstate":3,"zrreporting_timestamp":3.0})"},
+          {4,
+           R"({"spatial-audio-accessory-feature":4,"spatializationEnabled":5,"zrreporting_timestamp":4.0})"}}},
+        {"the old anchor takes in one that is earlier than itself",
+         {{"e", 0.0}, {"s", 2.0}, {"r", -3.0}},
+         2,
+         {{1, R"({"ringerstate":3,"spatializationEnabled":1,"zrreporting_timestamp":-3.0})"},
+          {2, R"({"spatial-audio-accessory-feature":2,"zrreporting_timestamp":2.0})"}}},
         {"no time is 0, and a pause that is no number is long",
          {{"e", "none"}, {"s", NAN}, {"s", 1.0}, {"e", "none"}},
          2,

@@ -54,7 +54,7 @@ private:
 /// The messages of one walk, numbered as they are added.
 class DerivedMessages {
 public:
-    /// The number of the next one, from 1; also what logs call the count so far, once it is added.
+    /// The number of the next one, from 1.
     [[nodiscard]] std::int64_t nextIndex() const noexcept {
         return static_cast<std::int64_t>(messages_.size()) + 1;
     }
@@ -71,6 +71,7 @@ private:
 /// The messages with each burst of the two spatial-audio settings folded into one.
 [[nodiscard]] std::vector<ZRReportingSessionMessage*>
 combineSpatialAudioSettings(const std::vector<MessageRef>& messages, Seconds longestPause);
+
 /// What a producer does when its session stops: has `derive` make messages of what the session recorded,
 /// given the session and the least length of a stretch, and sends them into it as a client would.
 template <typename Derive>
