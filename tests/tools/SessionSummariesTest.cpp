@@ -92,7 +92,7 @@ TEST(SessionSummaries, TablesHoldWhatFits) {
               "  messages  all -  unique -  redundant -\n"
               "  activity  seconds 18.76  periods 1  average -  overloads -\n"
               "  device    thermal state -  low power yes\n"
-              "  service   MiB -\n"
+              "  service   memory MiB -\n"
               "  load      1 min -  5 min -  15 min -\n"
               "\ninput  (com.vandra.tamblo.Input.Summary)\n"
               "    #  seconds  class  devices                        mode  port  vocoders\n"
