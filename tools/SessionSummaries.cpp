@@ -40,9 +40,9 @@ constexpr Column kOutputColumns[] = {
     {"id", "mFormatID", Style::text, 7},
     {"ch", "mChannelsPerFrame", Style::number},
     {"devices", "active_devices", Style::text, 29},
-    {"spatial", "spatializationEnabled", Style::yesOrNo},
+    {"spat.", "spatializationEnabled", Style::yesOrNo},
     {"acc.", "spatial-audio-accessory-feature", Style::yesOrNo},
-    {"ringer", "ringerstate", Style::yesOrNo},
+    {"ring", "ringerstate", Style::yesOrNo},
 };
 
 constexpr Column kGroupColumns[] = {
