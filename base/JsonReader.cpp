@@ -36,7 +36,7 @@ JsonError errorAt(std::string_view text, std::size_t offset, std::string message
         if (character == '\n') {
             ++error.line;
             error.column = 1;
-        } else if ((static_cast<unsigned char>(character) & 0xC0U) != 0x80U) {
+        } else if (!isUtf8Continuation(character)) {
             ++error.column;
         }
     }

@@ -9,10 +9,6 @@ namespace {
 
 using Byte = unsigned char;
 
-bool isContinuation(Byte byte) noexcept {
-    return (byte & 0xC0U) == 0x80U;
-}
-
 /// The length of the well-formed sequence at `at`, which begins with a byte above ASCII; 0 when there is
 /// none.
 std::size_t sequenceLength(const Byte* at, std::size_t available) noexcept {
@@ -32,7 +28,7 @@ std::size_t sequenceLength(const Byte* at, std::size_t available) noexcept {
         return 0;
     }
     for (std::size_t i = 2; i < length; ++i) {
-        if (!isContinuation(at[i])) {
+        if (!isUtf8Continuation(static_cast<char>(at[i]))) {
             return 0;
         }
     }

@@ -2,6 +2,7 @@
 
 #include "base/Format.h"
 #include "base/Json.h"
+#include "base/Utf8.h"
 #include "tools/Payload.h"
 
 #include <algorithm>
@@ -122,12 +123,8 @@ std::string plainText(const Value& value) {
     return value.isString() ? text.substr(1, text.size() - 2) : text;
 }
 
-bool isFollowUpOfCharacter(char c) noexcept {
-    return (static_cast<unsigned char>(c) & 0xC0U) == 0x80U;
-}
-
 std::size_t widthOf(std::string_view text) noexcept {
-    return text.size() - static_cast<std::size_t>(std::ranges::count_if(text, isFollowUpOfCharacter));
+    return text.size() - static_cast<std::size_t>(std::ranges::count_if(text, isUtf8Continuation));
 }
 
 /// Cut off so that it takes no more than so many characters.
@@ -135,7 +132,7 @@ std::string shortened(std::string text, std::size_t widest) {
     if (widthOf(text) <= widest) {
         return text;
     }
-    while (widthOf(text) >= widest || isFollowUpOfCharacter(text.back())) {
+    while (widthOf(text) >= widest) {
         text.pop_back();
     }
     return text + "…";

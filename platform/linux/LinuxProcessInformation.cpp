@@ -32,7 +32,7 @@ std::string asUtf8(std::string name) {
         return name;
     }
     std::size_t last = name.size() - 1;
-    while (last > 0 && (static_cast<unsigned char>(name[last]) & 0xC0U) == 0x80U) {
+    while (last > 0 && isUtf8Continuation(name[last])) {
         --last;
     }
     if (static_cast<unsigned char>(name[last]) >= 0xC0 && isUtf8(std::string_view(name).substr(0, last))) {

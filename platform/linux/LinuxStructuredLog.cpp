@@ -1,6 +1,7 @@
 #include "platform/linux/LinuxStructuredLog.h"
 
 #include "base/Format.h"
+#include "base/Utf8.h"
 
 #include <algorithm>
 #include <array>
@@ -41,10 +42,6 @@ char priorityOf(LogLevel level) noexcept {
     return '7';
 }
 
-constexpr bool isContinuation(char byte) noexcept {
-    return (static_cast<unsigned char>(byte) & 0xC0U) == 0x80U;
-}
-
 /// How many bytes of the text, from an index on, are a control character: of ASCII, or of the second set that
 /// terminals obey, U+0080 to U+009F.
 std::size_t controlLength(std::string_view text, std::size_t at) noexcept {
@@ -66,7 +63,7 @@ public:
         if (isCut_ || count > kCapacity - size_) {
             count = isCut_ ? 0 : kCapacity - size_;
             isCut_ = true;
-            while (count > 0 && isContinuation(text[count])) {
+            while (count > 0 && isUtf8Continuation(text[count])) {
                 --count;
             }
         }

@@ -79,7 +79,7 @@ TEST(SessionSummaries, TablesHoldWhatFits) {
           {"msgcnt", 2},
           {"inputrunning_seconds", 7.9599},
           {"inputrunning_secondsBucketed", "10"},
-          {"active_devices", "Übertrager \x1b[31m und noch mehr davon"},
+          {"active_devices", "Übertrager \x1b[31m und nöch mehr davon"},
           {"vocoders", "EVS:32000"}}},
         {"com.vandra.tamblo.Input.Summary",
          {{"msgidx", 2}, {"msgcnt", 2}, {"inputrunning_seconds", "odd"}, {"active_devices", 5}}},
@@ -96,7 +96,7 @@ TEST(SessionSummaries, TablesHoldWhatFits) {
               "  load      1 min -  5 min -  15 min -\n"
               "\ninput  (com.vandra.tamblo.Input.Summary)\n"
               "    #  seconds  class  devices                        mode  port  vocoders\n"
-              "  1/2     7.96     10  Übertrager \\u001b[31m und no…  -     -     EVS:32000\n"
+              "  1/2     7.96     10  Übertrager \\u001b[31m und nö…  -     -     EVS:32000\n"
               "  2/2      odd      -  5                              -     -     -");
 }
 
