@@ -13,9 +13,10 @@
 #include <string_view>
 #include <vector>
 
-/// What the producers have in common. Each walks a session's messages at its stop, keeps the latest value of
-/// every key it knows (the running state), cuts the time into segments wherever something that it watches
-/// changes, and derives one message from each segment that is long enough.
+/// What the producers of volume, group-session and input summaries have in common. Each walks a session's
+/// messages at its stop, keeps the latest value of every key it knows (the running state), cuts the time into
+/// segments wherever something that it watches changes, and derives one message from each segment that is
+/// long enough.
 namespace tamblo {
 
 using Seconds = std::chrono::duration<double>;
@@ -73,7 +74,7 @@ private:
 combineSpatialAudioSettings(const std::vector<MessageRef>& messages, Seconds longestPause);
 
 /// What a producer does when its session stops: has `derive` make messages of what the session recorded,
-/// given the session and the least length of a stretch, and sends them into it as a client would.
+/// given the session and the least length of a segment, and sends them into it as a client would.
 template <typename Derive>
 void deriveAtStop(const std::shared_ptr<ZRReportingSession>& session, std::string_view what, Derive derive) {
     if (session == nullptr || session->messages().empty()) {

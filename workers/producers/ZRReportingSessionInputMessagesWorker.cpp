@@ -5,7 +5,7 @@
 #include "util/LogText.h"
 #include "util/MessageKeys.h"
 #include "util/ReportingUtilities.h"
-#include "workers/PayloadFields.h"
+#include "workers/producers/PayloadFields.h"
 #include "workers/producers/SegmentWalk.h"
 
 #include <memory>
@@ -60,7 +60,7 @@ public:
     void add(const Value& name, const Value* rate) {
         std::string rateText;
         appendText(rateText, OptionalValue{rate});
-        // A rate below 1 stands for a vocoder that is not running.
+        // A rate that begins so stands for a vocoder that does not run.
         if (!rateText.starts_with("0.")) {
             std::string entry;
             appendText(entry, name);

@@ -5,7 +5,7 @@
 #include "util/InternalBuild.h"
 #include "util/Log.h"
 #include "util/MessageKeys.h"
-#include "workers/PayloadFields.h"
+#include "workers/producers/PayloadFields.h"
 #include "workers/producers/SegmentWalk.h"
 
 #include <memory>

@@ -4,7 +4,7 @@
 #include "util/Log.h"
 #include "util/MessageKeys.h"
 #include "util/SummaryBuckets.h"
-#include "workers/PayloadFields.h"
+#include "workers/producers/PayloadFields.h"
 #include "workers/producers/SegmentWalk.h"
 
 #include <memory>
