@@ -109,7 +109,7 @@ std::optional<ExitStatus> begin(ServiceConnection& service, const Plan& plan,
     return std::nullopt;
 }
 
-/// What is asked of the service when the session stops, and what was found.
+/// What the service derived when the session stopped, or a line that says why there is nothing.
 using Summaries = std::variant<std::vector<SessionSummary>, std::string>;
 
 /// How the session's own summary will name it.

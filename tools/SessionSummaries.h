@@ -35,7 +35,7 @@ struct StoppedSession {
 /// Tables for people, one for each kind of summary, each behind an empty line.
 [[nodiscard]] std::string summaryTables(std::span<const SessionSummary> summaries);
 
-/// Watches the analytics sink while a session stops. Made just before the request to stop; whose reply comes
+/// Watches the analytics sink while a session stops. Made just before the request to stop, whose reply comes
 /// when the sink has the summaries.
 class SummaryReader {
 public:
