@@ -9,6 +9,7 @@
 
 #include <gmock/gmock.h>
 
+#include <algorithm>
 #include <cmath>
 #include <limits>
 #include <string>
@@ -74,6 +75,12 @@ protected:
     FakePlatform device{LogLevel::standard};
     const Value process = "com.example.player";
     const Dictionary playing{{"session_output_running", true}, {"QVSessionVolume", 0.5}};
+    /// What opens a segment in every walk.
+    const Dictionary allRunning{{"session_output_running", true},
+                                {"session_input_running", true},
+                                {"kaleen_session", 1},
+                                {"QVSessionVolume", 0.5},
+                                {"active_devices", "A"}};
 };
 
 TEST_F(ProducersTest, VolumeSegments) {
@@ -192,12 +199,13 @@ TEST_F(ProducersTest, AVolumeSummaryHasExactlyTheseKeys) {
 }
 
 TEST_F(ProducersTest, LogsHowItCutsTheTime) {
+    const Payloads payloads{
+        at(10, allRunning), at(20.5, {{"active_devices", "B"}}), {{"session_duration", 1}}};
     const auto session = sessionWith({});
     device.log.setThreshold(LogLevel::debug);
     forgetLogThresholds();
-    const auto derived = ZRReportingSessionVolumeMessagesWorker(session).createVolumeMessages(
-        records({at(10, playing), at(20.5, {{"ringerstate", true}}), {{"session_output_running", false}}}),
-        &process, {});
+    (void)ZRReportingSessionVolumeMessagesWorker(session).createVolumeMessages(records(payloads), &process,
+                                                                               {});
     EXPECT_THAT(device.log.texts(),
                 ElementsAre("entering createVolumeMessages createVolumeMessages",
                             "playingTime { func=createVolumeMessages, playingTime=10.500000, "
@@ -209,33 +217,67 @@ TEST_F(ProducersTest, LogsHowItCutsTheTime) {
                             "startZrTimestamp_double=20.500000 }",
                             "skipped volume message, too short { func=createVolumeMessages, action=skip, "
                             "count=1 }"));
+    device.log.clear();
+    (void)ZRReportingSessionInputMessagesWorker(session).createInputMessages(records(payloads), &process, {});
+    (void)ZRReportingSessionKaleenMessagesWorker(session).createKaleenMessages(records(payloads), {});
+    Lines texts = device.log.texts();
+    for (std::string& text : texts) {
+        text.resize(std::min(text.size(), text.find(", zrTimestamp=")));
+    }
+    EXPECT_THAT(
+        texts,
+        ElementsAre("entering createInputMessages createInputMessages",
+                    "runningTime { func=createInputMessages, runningTime=10.500000",
+                    "added input message { func=createInputMessages, action=add, count=1 }",
+                    "runningTime { func=createInputMessages, runningTime=-20.500000",
+                    "skipped input message, too short { func=createInputMessages, action=skip, count=1 }",
+                    "returning input messages { func=createInputMessages, action=return, count=1 }",
+                    "entering createKaleenMessages createKaleenMessages",
+                    "playingTime { func=createKaleenMessages, playingTime=10.500000",
+                    "added kaleen message { func=createKaleenMessages, action=add, count=1 }",
+                    "playingTime { func=createKaleenMessages, playingTime=-20.500000",
+                    "skipped kaleen message, too short or not actually an kaleen session { "
+                    "func=createKaleenMessages, action=skip, count=1 }"));
 }
 
 TEST_F(ProducersTest, InputSegments) {
     const Dictionary running{{"session_input_running", true}, {"active_devices", "A"}};
     const Case cases[] = {
-        {"a device change and the end, the last stretch too short",
-         {at(0, running), at(10, {{"active_devices", "B"}}), at(12, {{"session_duration", 12}})},
+        {"a device change and the end; exactly the minimum is too short",
+         {at(0, running), at(10, {{"active_devices", "B"}}), at(15, {{"session_duration", 15}})},
          {"10.0 \"A\" 1 1"}},
-        {"vocoders: sorted, one that does not run left out, each segment its own",
-         {at(0, running), at(1, {{"vp_config_primary_vocoder", "b"}, {"vp_config_primary_vocoderFs", "1"}}),
+        {"vocoders: sorted, of those that run while input does, each segment its own, its last too",
+         {at(-5, {{"vp_config_primary_vocoder", "x"}, {"vp_config_primary_vocoderFs", "1"}}), at(0, running),
+          at(1, {{"vp_config_primary_vocoder", "b"}, {"vp_config_primary_vocoderFs", "1"}}),
           at(2, {{"vp_config_primary_vocoder", "a"}, {"vp_config_primary_vocoderFs", "2"}}),
           at(3, {{"vp_config_primary_vocoder", "none"}, {"vp_config_primary_vocoderFs", "0.0"}}),
           at(4, {{"vp_config_primary_vocoder", "n"}, {"vp_config_primary_vocoderFs", 16000}}),
-          at(10, {{"active_devices", "B"}}), at(20, {{"session_input_running", false}})},
-         {"10.0 \"A\" \"a:2,b:1,n:16000\" 1 2", "10.0 \"B\" 2 2"}},
+          at(10, {{"active_devices", "B"},
+                  {"vp_config_primary_vocoder", "e"},
+                  {"vp_config_primary_vocoderFs", "0"}}),
+          at(20, {{"session_input_running", false}, {"vp_config_primary_vocoder", "y"}})},
+         {"10.0 \"A\" \"a:2,b:1,e:0,n:16000\" 1 2", "10.0 \"B\" 2 2"}},
         {"the vocoders of a stretch that is too short go to the next",
          {at(0, running), at(1, {{"vp_config_primary_vocoder", "v"}}), at(2, {{"active_devices", "B"}}),
           at(20, {{"session_input_running", false}})},
          {"18.0 \"B\" \"v:(null)\" 1 1"}},
-        {"input that was running before opens no segment",
-         {at(10, {{"active_devices", "B"}}), at(20, {{"session_duration", 12}})},
-         {},
+        {"input that was running before opens no segment, nor when it is said again; the next change does",
+         {at(10, {{"active_devices", "B"}}), at(16, {{"session_input_running", true}}),
+          at(30, {{"active_devices", "C"}}), at(40, {{"session_duration", 12}})},
+         {"10.0 \"C\" 1 1"},
          at(0, running)},
-        {"a length with input still said to run ends one segment and begins another",
+        {"a length with input still said to run ends one segment and begins another; alone it ends input",
          {at(0, running), at(10, {{"session_duration", 10}, {"session_input_running", true}}),
-          at(30, {{"session_input_running", false}})},
-         {"10.0 \"A\" 1 2", "20.0 \"A\" 2 2"}},
+          at(30, {{"session_input_running", false}}), at(50, {{"session_input_running", true}}),
+          at(60, {{"session_duration", 10}}), at(70, {{"active_devices", "B"}}),
+          at(80, {{"session_input_running", false}})},
+         {"10.0 \"A\" 1 3", "20.0 \"A\" 2 3", "10.0 \"A\" 3 3"}},
+        {"spatial settings less than two seconds apart are one message, at the time of the second",
+         {at(0, running), at(10, {{"spatializationEnabled", true}, {"active_devices", "B"}}),
+          at(11.5, {{"spatial-audio-accessory-feature", true}}),
+          at(20, {{"spatializationEnabled", false}, {"active_devices", "C"}}),
+          at(22, {{"spatial-audio-accessory-feature", false}}), at(40, {{"session_input_running", false}})},
+         {"11.5 \"A\" 1 3", "8.5 \"B\" 2 3", "20.0 \"C\" 3 3"}},
         {"a start without a timestamp", {running, at(20, {{"session_input_running", false}})}, {}},
     };
     for (const Case& row : cases) {
@@ -278,10 +320,20 @@ TEST_F(ProducersTest, GroupSessionSegments) {
          {at(0, inGroup), at(10, {{"session_selected_format", "S"}}), at(20, {{"mChannelsPerFrame", 2}}),
           at(30, {{"mChannelsPerFrame", 6}}), at(40, {{"session_output_running", false}})},
          {"30.0 \"F1\" 2 \"S\" 1 2", "10.0 \"F1\" 6 \"S\" 2 2"}},
-        {"joining and leaving while output runs",
+        {"joining and leaving while output runs, as it did before; exactly the minimum is too short",
          {at(0, {{"session_output_running", true}}), at(10, {{"kaleen_session", 1}}),
-          at(20, {{"kaleen_session", 0}}), at(60, {{"session_duration", 1}})},
-         {"10.0 \"unknown\" -1 \"unknown\" 1 1"}},
+          at(20, {{"kaleen_session", 0}}), at(30, {{"kaleen_session", 1}}), at(35, {{"kaleen_session", 0}}),
+          at(60, {{"session_duration", 1}})},
+         {"10.0 \"unknown\" -1 \"unknown\" 1 1"},
+         at(-50, {{"session_output_running", true}})},
+        {"a pause is left out; after the session's length both playing and the group are to be said anew",
+         {at(0, inGroup), at(10, {{"session_output_running", false}}),
+          at(100, {{"session_output_running", true}}),
+          at(110, {{"session_duration", 1}, {"session_output_running", true}}),
+          at(120, {{"session_output_running", true}}), at(130, {{"mFormatID", "F2"}}),
+          at(140, {{"kaleen_session", 1}}), at(150, {{"session_duration", 1}})},
+         {"10.0 \"F1\" -1 \"unknown\" 1 3", "10.0 \"F1\" -1 \"unknown\" 2 3",
+          "10.0 \"F2\" -1 \"unknown\" 3 3"}},
         {"what was before counts from its own time",
          {at(10, {{"mFormatID", "F2"}}), at(17, {{"session_duration", 1}})},
          {"8.0 \"F1\" -1 \"unknown\" 1 2", "7.0 \"F2\" -1 \"unknown\" 2 2"},
@@ -314,12 +366,9 @@ TEST_F(ProducersTest, SummariesGoThroughTheSessionInOrderAndAreCounted) {
             session->sendMessage(std::make_shared<ZRReportingSessionMessage>(
                 at(now + time, std::move(payload)), AudioEventKindGeneric, AudioEventTypeGeneric));
         };
-        send(0, {{"session_output_running", true},
-                 {"session_input_running", true},
-                 {"kaleen_session", 1},
-                 {"QVSessionVolume", 1},
-                 {"active_devices", "A"}});
+        send(0, allRunning);
         send(3, {{"active_devices", "B"}});
+        send(3.5, {{"active_devices", "exactly the minimum of every service type"}});
         send(9, {{"session_duration", 9.0}});
         session->stop();
 
@@ -339,7 +388,7 @@ TEST_F(ProducersTest, SummariesGoThroughTheSessionInOrderAndAreCounted) {
                                 "sending input summary event for reporter 7"));
         const auto summary = device.analyticsEvents.payloads("com.vandra.tamblo.Session_Generic.Summary");
         ASSERT_EQ(summary.size(), 1U);
-        EXPECT_EQ(*summary[0].find("num_messages"), Value(7)) << "three of the client's, four summaries";
+        EXPECT_EQ(*summary[0].find("num_messages"), Value(8)) << "four of the client's, four summaries";
 
         const auto fresh = sessionWith({});
         const auto derived = ZRReportingSessionKaleenMessagesWorker(fresh).createKaleenMessages(
@@ -347,13 +396,15 @@ TEST_F(ProducersTest, SummariesGoThroughTheSessionInOrderAndAreCounted) {
                      at(9, {{"session_duration", 9}})}),
             {});
         ASSERT_EQ(derived.size(), 1U);
-        Lines destinations;
-        for (const WorkerClass* workerClass : derived[0]->destinationWorkers()) {
-            destinations.emplace_back(workerClass->name);
-        }
-        EXPECT_EQ(destinations, isInternalBuild ? Lines{}
-                                                : (Lines{"ZRReportingSessionEventryWorker",
-                                                         "ZRReportingSessionSummaryJsonFileWorker"}));
+        EXPECT_EQ(jsonText(derived[0]->payload()),
+                  R"({"active_devices":"unknown","mChannelsPerFrame":-1,"mFormatID":"unknown","msgcnt":1,)"
+                  R"("msgidx":1,"play_seconds":9.0,"play_secondsBucketed":"10",)"
+                  R"("session_selected_format":"unknown"})");
+        EXPECT_EQ(derived[0]->destinationWorkers(),
+                  isInternalBuild
+                      ? DestinationWorkers{}
+                      : (DestinationWorkers{workerClassNamed("ZRReportingSessionEventryWorker"),
+                                            workerClassNamed("ZRReportingSessionSummaryJsonFileWorker")}));
     }
 }
 
@@ -371,49 +422,28 @@ TEST_F(ProducersTest, ASessionWithoutMessagesSendsNothing) {
 /// the values are read by the rules for values of other kinds, and nothing breaks.
 TEST_F(ProducersTest, ValuesOfTheWrongKind) {
     constexpr double kInfinity = std::numeric_limits<double>::infinity();
-    const Value wrongValues[] = {"text",
-                                 "12.5 apples",
-                                 "",
-                                 Dictionary{{"a", 1}},
-                                 Array{1, "b"},
-                                 1e300,
-                                 -1e300,
-                                 NAN,
-                                 kInfinity,
-                                 -kInfinity,
-                                 INT64_MIN,
-                                 UINT64_MAX,
-                                 true,
-                                 Value::date(1e9),
-                                 Value::data({})};
-    const char* keys[] = {"zrreporting_timestamp",
-                          "session_output_running",
-                          "session_input_running",
-                          "session_duration",
-                          "session_selected_format",
-                          "active_devices",
-                          "spatializationEnabled",
-                          "ringerstate",
-                          "QVSessionVolume",
-                          "mChannelsPerFrame",
-                          "mFormatID",
-                          "kaleen_session",
-                          "vp_config_primary_vocoder",
-                          "vp_config_primary_vocoderFs",
-                          "spatial-audio-accessory-feature"};
-    const Dictionary start{{"session_output_running", true}, {"session_input_running", true},
-                           {"QVSessionVolume", 0.5},         {"kaleen_session", 1},
-                           {"mChannelsPerFrame", 2},         {"mFormatID", "f"},
-                           {"active_devices", "d"},          {"session_selected_format", "s"}};
+    const Value dictionary = Dictionary{{"a", 1}};
+    const Value array = Array{1, "b"};
+    const Value wrongValues[] = {"text",    "12.5 apples", "",   dictionary,       array,
+                                 1e300,     -1e300,        NAN,  kInfinity,        -kInfinity,
+                                 INT64_MIN, UINT64_MAX,    true, Value::date(1e9), Value::data({})};
+    Dictionary start = allRunning;
+    for (const std::string_view key :
+         {"mChannelsPerFrame", "mFormatID", "session_selected_format", "spatializationEnabled", "ringerstate",
+          "spatial-audio-accessory-feature", "vp_config_primary_vocoder", "vp_config_primary_vocoderFs"}) {
+        start.set(key, "1");
+    }
+    Dictionary keys = at(0, start);
+    keys.set("session_duration", 1);
     const auto session = sessionWith({});
     const ZRReportingSessionVolumeMessagesWorker volume(session);
     const ZRReportingSessionInputMessagesWorker input(session);
     const ZRReportingSessionKaleenMessagesWorker group(session);
-    for (const char* key : keys) {
+    for (std::size_t i = 0; i < keys.size(); ++i) {
         for (const Value& wrong : wrongValues) {
-            SCOPED_TRACE(std::string(key) + " " + jsonText(wrong));
+            SCOPED_TRACE(std::string(keys.keyAt(i)) + " " + jsonText(wrong));
             Dictionary odd = at(10, {});
-            odd.set(key, wrong);
+            odd.set(keys.keyAt(i), wrong);
             const Payloads payloads{at(0, start), odd, at(20, odd), at(30, {{"session_duration", wrong}})};
             std::vector<MessageRef> sorted = records(payloads);
             ZRReportingSessionMessage::sortMessages(sorted);

@@ -10,7 +10,9 @@
 namespace tamblo {
 namespace {
 
-using testing::ElementsAre;
+using testing::AllOf;
+using testing::Contains;
+using testing::Field;
 
 class SummaryWorkerTest : public testing::Test {
 protected:
@@ -104,7 +106,10 @@ TEST_F(SummaryWorkerTest, TellsWhoReportedAndHowTheDeviceIs) {
     device.log.clear();
     session->start();
     EXPECT_FALSE(stopAndTakeSummary().contains("vmInfo_phys_footprint_MiB"));
-    EXPECT_THAT(device.log.texts("Error"), ElementsAre("Error with task_info(): no such file"));
+    EXPECT_THAT(
+        device.log.lines(),
+        Contains(AllOf(Field(&FakeLog::Line::level, LogLevel::error), Field(&FakeLog::Line::category, "zrru"),
+                       Field(&FakeLog::Line::text, "Error with task_info(): no such file"))));
 }
 
 } // namespace
