@@ -2,7 +2,9 @@
 
 #include "base/KeySet.h"
 
+#include <algorithm>
 #include <array>
+#include <cassert>
 #include <cstddef>
 #include <cstdint>
 #include <span>
@@ -21,7 +23,10 @@ public:
     using Places = std::array<std::uint32_t, kMostKeys>;
 
     /// At most `kMostKeys` keys, which must outlive the places.
-    explicit KeyPlaces(std::span<const std::string_view> keys) noexcept : keys_(keys) {}
+    explicit KeyPlaces(std::span<const std::string_view> keys) noexcept
+        : keys_(keys.first(std::min(keys.size(), kMostKeys))) {
+        assert(keys.size() <= kMostKeys);
+    }
 
     /// The index of each key in the key set, `kAbsent` for those that it does not hold. Lives until the next
     /// call.

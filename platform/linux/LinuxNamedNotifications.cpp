@@ -37,6 +37,18 @@ NamedNotifications::State parseState(std::string_view text) noexcept {
     return error == std::errc() ? NamedNotifications::State{0, word} : NamedNotifications::State{ERANGE, 0};
 }
 
+/// What is wrong with a file, and where; empty for one that can be read, that is missing, or that is empty,
+/// since its next writer may just have opened it.
+std::string faultOf(const SmallFile& file, int status) {
+    const std::string_view word = file.trimmed();
+    if (status == 0 || status == ENOENT || status == ENOTDIR || (file.error == 0 && word.empty())) {
+        return {};
+    }
+    return file.error != 0
+               ? std::generic_category().message(file.error)
+               : formatted("byte {}: not a 64-bit number in decimal", word.data() - file.text.data() + 1);
+}
+
 } // namespace
 
 /// Shared with the calls that wait on the queue, which may outlast the registration.
@@ -78,17 +90,39 @@ NamedNotifications::Registration LinuxNamedNotifications::RegisterNamedNotificat
 }
 
 NamedNotifications::State LinuxNamedNotifications::GetNamedNotificationState(int token) {
-    std::string path;
+    std::string name;
     {
         const std::lock_guard lock(mutex_);
         const auto found = byToken_.find(token);
         if (found == byToken_.end()) {
             return {EBADF, 0};
         }
-        path = formatted("{}/{}", watcher_.directory(), found->second->first);
+        name = found->second->first;
     }
-    const SmallFile file = SmallFile::read(path, kMaximumFile, SmallFile::Links::refused);
-    return file.error != 0 ? State{file.error, 0} : parseState(file.trimmed());
+    const SmallFile file = SmallFile::read(formatted("{}/{}", watcher_.directory(), name), kMaximumFile,
+                                           SmallFile::Links::refused);
+    const State state = file.error != 0 ? State{file.error, 0} : parseState(file.trimmed());
+    reportUnreadable(name, file.text, faultOf(file, state.status));
+    return state;
+}
+
+void LinuxNamedNotifications::reportUnreadable(const std::string& name, const std::string& content,
+                                               std::string_view fault) {
+    {
+        const std::lock_guard lock(mutex_);
+        if (fault.empty()) {
+            reported_.erase(name);
+            return;
+        }
+        std::string state = formatted("{}: {}", fault, content);
+        if (std::string& reported = reported_[name]; reported != state) {
+            reported = std::move(state);
+        } else {
+            return;
+        }
+    }
+    log_.report(LogLevel::error, "zrrs",
+                formatted("{}/{}: {}; it is not used", watcher_.directory(), name, fault));
 }
 
 void LinuxNamedNotifications::CancelNamedNotification(int token) {
@@ -121,8 +155,9 @@ void LinuxNamedNotifications::post(const std::shared_ptr<Registered>& registered
         Pace::mayBlock);
 }
 
-void LinuxNamedNotifications::deliverPosts() {
-    watcher_.read([this](std::optional<std::string_view> name) {
+void LinuxNamedNotifications::deliverPosts(const std::function<void()>& beforeDelivery) {
+    watcher_.read([this, &beforeDelivery](std::optional<std::string_view> name) {
+        beforeDelivery();
         const std::lock_guard lock(mutex_);
         auto [first, last] = name ? byName_.equal_range(*name) : std::pair(byName_.begin(), byName_.end());
         for (; first != last; ++first) {

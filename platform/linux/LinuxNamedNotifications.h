@@ -4,6 +4,7 @@
 #include "platform/StructuredLog.h"
 #include "platform/linux/DirectoryWatcher.h"
 
+#include <functional>
 #include <map>
 #include <memory>
 #include <mutex>
@@ -34,13 +35,16 @@ public:
     /// The word in the file at this moment. `EBADF` for an unknown token, `ENOENT` for a name that was never
     /// posted, `EBADMSG` for a file that does not hold one decimal number and nothing else but white space
     /// around it, `ERANGE` for one beyond 64 bits, and whatever keeps the file from being read. A symbolic
-    /// link is `ELOOP`: writes through it would not be noticed.
+    /// link is `ELOOP`: writes through it would not be noticed. What stands there and cannot be read is one
+    /// error line for each state of the file that is met.
     [[nodiscard]] State GetNamedNotificationState(int token) override;
     void CancelNamedNotification(int token) override;
 
     /// For the event loop; -1 when posts cannot be noticed (said in the log).
     [[nodiscard]] int fileDescriptor() const noexcept { return watcher_.fileDescriptor(); }
-    void deliverPosts();
+    /// After a post has been taken in and before it is delivered, `beforeDelivery` takes in what its poster
+    /// may have done before.
+    void deliverPosts(const std::function<void()>& beforeDelivery = [] {});
 
 private:
     struct Registered;
@@ -48,6 +52,8 @@ private:
 
     static void post(const std::shared_ptr<Registered>& registered);
     void reportUnwatched();
+    /// An empty fault is none.
+    void reportUnreadable(const std::string& name, const std::string& content, std::string_view fault);
 
     StructuredLog& log_;
     /// Used by `deliverPosts` alone.
@@ -57,6 +63,8 @@ private:
     ByName byName_;
     std::unordered_map<int, ByName::iterator> byToken_;
     int lastToken_ = 0;
+    /// By name: the content and its fault as reported last.
+    std::map<std::string, std::string> reported_;
 };
 
 } // namespace tamblo

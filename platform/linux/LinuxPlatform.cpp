@@ -97,8 +97,7 @@ struct LinuxPlatform::Services {
         : namedNotifications(directories.notifications(), log),
           notificationChanges([this] {
               // A post may tell of a preference that was written just before it.
-              preferences.readChanges();
-              namedNotifications.deliverPosts();
+              namedNotifications.deliverPosts([this] { preferences.readChanges(); });
           }),
           deviceProperties(directories.deviceProperties(), log),
           preferences(directories.preferences(), log),

@@ -9,6 +9,7 @@
 #include <chrono>
 #include <cstdint>
 #include <cstring>
+#include <ctime>
 #include <filesystem>
 #include <fstream>
 #include <sstream>
@@ -47,23 +48,24 @@ void makeZones(const TemporaryDirectory& root, const std::string& description) {
 
 TEST(LinuxDeviceConditionsTest, TheWorstTripPointReachedIsTheThermalState) {
     const std::pair<const char*, int> cases[] = {
-        {"", 0},
-        {"/thermal_zone0 temp=60000", 0},
+        {"", -1},
+        {"/thermal_zone0 temp=60000", -1},
         {"/thermal_zone0 temp=59999 0:active@60000", 0},
         {"/thermal_zone0 temp=60000 0:active@60000", 1},
         {"/thermal_zone0 temp=60000 0:passive@60000", 2},
         {"/thermal_zone0 temp=60000 0:hot@60000", 3},
         {"/thermal_zone0 temp=60000 0:critical@60000", 3},
-        {"/thermal_zone0 temp=60000 0:other@50000", 0},
+        {"/thermal_zone0 temp=60000 0:other@50000", -1},
         {"/thermal_zone0 temp=80000 0:critical@105000 1:passive@80000 2:active@50000", 2},
         {"/thermal_zone0 temp=80000 0:active@50000 13:hot@80000", 3},
         {"/thermal_zone0 temp=50 0:active@50 /thermal_zone1 temp=60 0:passive@60 /thermal_zone2 temp=1", 2},
-        {"/thermal_zone0 mode=disabled temp=60000 0:hot@60000", 0},
+        {"/thermal_zone0 mode=disabled temp=60000 0:hot@60000", -1},
         {"/thermal_zone0 mode=enabled temp=60000 0:hot@60000", 3},
         {"/thermal_zone0 temp=60000 0:hot@0 1:critical@-274000 2:passive@ 3:hot@5x 4:active@1", 1},
-        {"/thermal_zone0 0:hot@1 /thermal_zone1 temp= 0:hot@1 /thermal_zone2 temp=9x 0:hot@1", 0},
+        {"/thermal_zone0 0:hot@1 /thermal_zone1 temp= 0:hot@1 /thermal_zone2 temp=9x 0:hot@1", -1},
+        {"/thermal_zone0 0:hot@1 /thermal_zone1 temp=1 0:hot@5 /thermal_zone2 temp=9", 0},
         {"/thermal_zone0 temp=-5000 0:hot@60000", 0},
-        {"/cooling_device0 temp=60000 0:hot@60000", 0},
+        {"/cooling_device0 temp=60000 0:hot@60000", -1},
     };
     for (const auto& [zones, expected] : cases) {
         const TemporaryDirectory root;
@@ -163,6 +165,21 @@ TEST(LinuxProcessInformationTest, TheFootprintFollowsWhatThisProcessUses) {
         ::munmap(memory, kSize);
         EXPECT_NEAR(static_cast<double>(now() - before), 0, kTolerance);
     }
+}
+
+TEST(LinuxProcessInformationTest, TimesAreTheKernels) {
+    const LinuxProcessInformation information;
+    double before = 0, after = 0;
+    std::ifstream("/proc/uptime") >> before;
+    const double uptime = information.systemUptime().count();
+    std::ifstream("/proc/uptime") >> after;
+    EXPECT_GE(uptime, before);
+    EXPECT_LE(uptime, after + 0.01) << "the kernel shows hundredths";
+
+    const std::chrono::microseconds usedBefore(std::clock());
+    const std::chrono::microseconds used = information.processorTime();
+    EXPECT_GE(used, usedBefore);
+    EXPECT_LE(used, std::chrono::microseconds(std::clock()));
 }
 
 TEST(LinuxProcessInformationTest, LoadAveragesAreTheKernels) {

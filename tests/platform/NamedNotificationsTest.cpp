@@ -103,14 +103,21 @@ TEST_F(NamedNotificationsTest, ReadsTheWordThatStandsInTheFile) {
         {"1 2", EBADMSG, 0},
         {"1.0", EBADMSG, 0},
         {std::string("1\0", 2), EBADMSG, 0},
-        {std::string(255, ' ') + "1", 0, 1},
         {std::string(256, ' ') + "1", EFBIG, 0},
+        {std::string(255, ' ') + "1", 0, 1},
         {std::string(3UL << 20, '1'), EFBIG, 0},
     };
     for (const auto& [text, status, word] : cases) {
         post("n", text);
         EXPECT_EQ(state(token), std::pair(status, word)) << text.substr(0, 40);
+        EXPECT_EQ(state(token).first, status);
+        const bool isRubbish = status != 0 && text.find_first_not_of(" \n") != std::string::npos;
+        EXPECT_EQ(log_.take().size(), isRubbish ? 1U : 0U) << text.substr(0, 40);
     }
+    post("n", " 1 2");
+    (void)state(token);
+    EXPECT_THAT(log_.take(), ElementsAre("3 zrrs " + path_ +
+                                         "/n: byte 2: not a 64-bit number in decimal; it is not used"));
     EXPECT_EQ(state(token + 1), std::pair(EBADF, 0UL));
     EXPECT_EQ(state(0), std::pair(EBADF, 0UL));
 
@@ -159,6 +166,15 @@ TEST_F(NamedNotificationsTest, EveryKindOfPostCallsEachRegistrationOfItsName) {
     EXPECT_THAT(callsAfterChange(), ElementsAre(other));
     EXPECT_THAT(queue_.takePaces(), testing::Each(Pace::mayBlock));
     EXPECT_FALSE(isReadable(notifications_.fileDescriptor(), 0)) << "at rest";
+    post("other", "4");
+    int preparations = 0;
+    notifications_.deliverPosts([&] {
+        ++preparations;
+        EXPECT_FALSE(isReadable(notifications_.fileDescriptor(), 0)) << "taken in";
+        EXPECT_THAT(queue_.takePaces(), IsEmpty()) << "and not yet delivered";
+    });
+    EXPECT_EQ(preparations, 1);
+    EXPECT_EQ(queue_.takePaces().size(), 1U);
 }
 
 TEST_F(NamedNotificationsTest, ABurstIsOneWaitingCallThatSeesTheLastState) {
@@ -182,6 +198,23 @@ TEST_F(NamedNotificationsTest, ABurstIsOneWaitingCallThatSeesTheLastState) {
     queue_.runAll();
     EXPECT_THAT(seen, ElementsAre(5000, 8)) << "what comes while the handler runs is another call";
     EXPECT_EQ(state(token), std::pair(0, 8UL));
+}
+
+TEST_F(NamedNotificationsTest, APostThatTheKernelCouldNotRememberIsSeen) {
+    const int token = add("n");
+    int limit = 0;
+    std::ifstream("/proc/sys/fs/inotify/max_queued_events") >> limit;
+    if (limit <= 0 || limit > 100'000) {
+        GTEST_SKIP() << "the kernel remembers " << limit;
+    }
+    post("a", "");
+    post("b", "");
+    for (int i = 0; i <= limit; ++i) { // taking turns, since a repetition of the last event is left out
+        std::fstream(path_ + (i % 2 == 0 ? "/a" : "/b"));
+    }
+    post("n", "7");
+    EXPECT_THAT(callsAfterChange(), ElementsAre(token));
+    EXPECT_EQ(state(token), std::pair(0, 7UL));
 }
 
 TEST_F(NamedNotificationsTest, ThreadsPostReadAndRegisterAtOnce) {

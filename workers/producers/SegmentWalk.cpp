@@ -77,7 +77,8 @@ ZRReportingSessionMessage& DerivedMessages::add(Dictionary payload, AudioEventCa
 
 std::vector<MessageRef> DerivedMessages::take() {
     for (const MessageRef& message : messages_) {
-        message->editPayload([this](Dictionary& payload) { payload.set("msgcnt", messages_.size()); });
+        message->editPayload(
+            [this](Dictionary& payload) { payload.set(kMessageCountKey, messages_.size()); });
     }
     return std::exchange(messages_, {});
 }

@@ -3,6 +3,7 @@
 #include "base/Dictionary.h"
 #include "session/ZRReportingSession.h"
 #include "session/ZRReportingSessionMessage.h"
+#include "util/AudioEvents.h"
 #include "util/Log.h"
 
 #include <chrono>
@@ -23,8 +24,9 @@ using Seconds = std::chrono::duration<double>;
 
 /// What a summary says of a text setting that nobody has reported.
 inline constexpr std::string_view kUnknownSetting = "unknown";
-/// The place of a summary among those of the same walk, from 1.
+/// The place of a summary among those of the same walk, from 1, and how many of them there are.
 inline constexpr std::string_view kMessageIndexKey = "msgidx";
+inline constexpr std::string_view kMessageCountKey = "msgcnt";
 
 /// Where a segment began: the timestamp of the message that opened it, null while there is none.
 class SegmentStart {
