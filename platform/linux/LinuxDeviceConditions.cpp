@@ -54,15 +54,14 @@ int stateOfTripPoint(const std::string& type) {
 
 int stateOfZone(const std::string& zone) {
     constexpr std::string_view kTypeSuffix = "_type";
-    constexpr int kUnknown = DeviceConditions::kUnknownThermalState;
     if (holds(zone + "/mode", "disabled")) {
-        return kUnknown;
+        return 0;
     }
     const auto temperature = readNumber(zone + "/temp");
     if (!temperature) {
-        return kUnknown;
+        return 0;
     }
-    int state = kUnknown;
+    int state = 0;
     forEachEntry(zone, [&](std::string name) {
         if (!name.starts_with("trip_point_") || !name.ends_with(kTypeSuffix)) {
             return;
@@ -70,10 +69,9 @@ int stateOfZone(const std::string& zone) {
         const int reachedState = stateOfTripPoint(zone + '/' + name);
         name.replace(name.size() - kTypeSuffix.size(), kTypeSuffix.size(), "_temp");
         // Drivers give 0 or less for a trip point that is not in use.
-        const auto threshold =
-            reachedState > std::max(state, 0) ? readNumber(zone + '/' + name) : std::nullopt;
-        if (threshold && *threshold > 0) {
-            state = std::max(state, *temperature >= *threshold ? reachedState : 0);
+        const auto threshold = reachedState > state ? readNumber(zone + '/' + name) : std::nullopt;
+        if (threshold && *threshold > 0 && *temperature >= *threshold) {
+            state = reachedState;
         }
     });
     return state;
@@ -87,7 +85,7 @@ LinuxDeviceConditions::LinuxDeviceConditions(std::string root, SteadyNow now)
 int LinuxDeviceConditions::thermalState() const {
     return thermalState_.get([this] {
         const std::string zones = root_ + "/class/thermal";
-        int state = kUnknownThermalState;
+        int state = 0;
         forEachEntry(zones, [&](const std::string& name) {
             if (name.starts_with("thermal_zone")) {
                 state = std::max(state, stateOfZone(zones + '/' + name));

@@ -12,9 +12,8 @@ namespace tamblo {
 ///
 /// The thermal state is the worst that any thermal zone says of itself by the highest of its trip points that
 /// its temperature has reached: an active one (a fan starts) is 1, a passive one (the device is slowed down)
-/// 2, a hot or critical one 3. What cannot be read or makes no sense is left out; without any temperature
-/// that a trip point can be held against, the state is unknown. A reading is kept for a second, since a
-/// sensor may take milliseconds to answer.
+/// 2, a hot or critical one 3. What cannot be read or makes no sense is left out. A reading is kept for a
+/// second, since a sensor may take milliseconds to answer.
 class LinuxDeviceConditions final : public DeviceConditions {
 public:
     static constexpr std::chrono::seconds kValidity{1};

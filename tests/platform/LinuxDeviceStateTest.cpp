@@ -48,24 +48,24 @@ void makeZones(const TemporaryDirectory& root, const std::string& description) {
 
 TEST(LinuxDeviceConditionsTest, TheWorstTripPointReachedIsTheThermalState) {
     const std::pair<const char*, int> cases[] = {
-        {"", -1},
-        {"/thermal_zone0 temp=60000", -1},
+        {"", 0},
+        {"/thermal_zone0 temp=60000", 0},
         {"/thermal_zone0 temp=59999 0:active@60000", 0},
         {"/thermal_zone0 temp=60000 0:active@60000", 1},
         {"/thermal_zone0 temp=60000 0:passive@60000", 2},
         {"/thermal_zone0 temp=60000 0:hot@60000", 3},
         {"/thermal_zone0 temp=60000 0:critical@60000", 3},
-        {"/thermal_zone0 temp=60000 0:other@50000", -1},
+        {"/thermal_zone0 temp=60000 0:other@50000", 0},
         {"/thermal_zone0 temp=80000 0:critical@105000 1:passive@80000 2:active@50000", 2},
         {"/thermal_zone0 temp=80000 0:active@50000 13:hot@80000", 3},
         {"/thermal_zone0 temp=50 0:active@50 /thermal_zone1 temp=60 0:passive@60 /thermal_zone2 temp=1", 2},
-        {"/thermal_zone0 mode=disabled temp=60000 0:hot@60000", -1},
+        {"/thermal_zone0 mode=disabled temp=60000 0:hot@60000", 0},
         {"/thermal_zone0 mode=enabled temp=60000 0:hot@60000", 3},
         {"/thermal_zone0 temp=60000 0:hot@0 1:critical@-274000 2:passive@ 3:hot@5x 4:active@1", 1},
-        {"/thermal_zone0 0:hot@1 /thermal_zone1 temp= 0:hot@1 /thermal_zone2 temp=9x 0:hot@1", -1},
+        {"/thermal_zone0 0:hot@1 /thermal_zone1 temp= 0:hot@1 /thermal_zone2 temp=9x 0:hot@1", 0},
         {"/thermal_zone0 0:hot@1 /thermal_zone1 temp=1 0:hot@5 /thermal_zone2 temp=9", 0},
         {"/thermal_zone0 temp=-5000 0:hot@60000", 0},
-        {"/cooling_device0 temp=60000 0:hot@60000", -1},
+        {"/cooling_device0 temp=60000 0:hot@60000", 0},
     };
     for (const auto& [zones, expected] : cases) {
         const TemporaryDirectory root;
