@@ -4,6 +4,7 @@
 #include "session/ZRReportingSession.h"
 #include "util/Log.h"
 #include "util/MessageKeys.h"
+#include "workers/producers/PayloadFields.h"
 
 #include <array>
 #include <string_view>
@@ -13,6 +14,10 @@
 namespace tamblo {
 
 namespace {
+
+enum class Field { duration, issue, count };
+using Fields = PayloadFields<Field>;
+constexpr Fields::Keys kKeys{ZRReportingMessageKeySessionDuration, kIssueTypeKey};
 
 std::string_view thermalStateName(int state) noexcept {
     constexpr std::array<std::string_view, 4> kNames{"Nominal", "Fair", "Serious", "Critical"};
@@ -45,14 +50,15 @@ void addDeviceState(Dictionary& payload) {
 } // namespace
 
 void ZRReportingSessionSummaryWorker::handleMessage(const MessageRef& message) {
-    const Dictionary& payload = message->payload();
-    if (const Value* duration = payload.find(ZRReportingMessageKeySessionDuration)) {
-        totalActiveTime_ += duration->doubleValue();
+    // One for each thread that does session work: messages are of few kinds, and most have neither key.
+    static thread_local KeyPlaces places(kKeys);
+    const Fields fields(message->payload(), places);
+    if (fields.holds(Field::duration)) {
+        totalActiveTime_ += fields[Field::duration]->doubleValue();
         ++activeCount_;
         return;
     }
-    const Value* issue = payload.find(kIssueTypeKey);
-    if (issue != nullptr && issue->stringValue() == "overload") {
+    if (fields.holds(Field::issue) && fields[Field::issue]->stringValue() == "overload") {
         ++overloadCount_;
     }
 }
