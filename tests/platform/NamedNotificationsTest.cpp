@@ -76,9 +76,10 @@ protected:
     TemporaryDirectory directory_;
     const std::string path_ = directory_.path("notifications");
     RecordingLog log_;
+    // Before the queue, which runs what waits when it goes.
+    std::vector<int> calls_;
     LinuxNamedNotifications notifications_{path_, log_};
     FakeSerialQueue queue_{"test"};
-    std::vector<int> calls_;
 };
 
 TEST_F(NamedNotificationsTest, ReadsTheWordThatStandsInTheFile) {
