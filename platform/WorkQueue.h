@@ -20,8 +20,8 @@ enum class Pace {
     mayBlock, ///< may wait for a disk, a lock or another process, or takes milliseconds
 };
 
-/// Runs work one piece at a time, in the order posted, on whatever thread suits. Destroying a queue first
-/// finishes what was posted.
+/// Runs work one piece at a time, in the order posted, on whatever thread suits. What was posted still runs
+/// after the queue is destroyed, which waits for nothing and may happen in the queue's own work.
 class SerialQueue {
 public:
     virtual ~SerialQueue() = default;
@@ -43,6 +43,12 @@ public:
     virtual void invalidate() = 0;
 };
 
+/// One call that is to come. Destroying it calls it off; a call that has begun is not waited for.
+class DelayedCall {
+public:
+    virtual ~DelayedCall() = default;
+};
+
 /// Makes queues and timers, which their users own and let go before the process ends. Any thread.
 class WorkQueues {
 public:
@@ -50,6 +56,9 @@ public:
     [[nodiscard]] virtual std::unique_ptr<SerialQueue> makeSerialQueue(std::string_view label) = 0;
     [[nodiscard]] virtual std::unique_ptr<RepeatingTimer>
     makeRepeatingTimer(std::chrono::milliseconds interval, UniqueFunction<void()> tick) = 0;
+    /// Makes the call once, after the delay, on some thread; it must not block.
+    [[nodiscard]] virtual std::unique_ptr<DelayedCall> callAfter(std::chrono::milliseconds delay,
+                                                                 UniqueFunction<void()> call) = 0;
 };
 
 } // namespace tamblo

@@ -32,19 +32,15 @@ InlineDrain* InlineDrain::current() noexcept {
 
 void InlineDrain::drain() {
     // Draining one queue may post to others, which then join the list.
-    for (std::size_t i = 0; i < queues_.size(); ++i) {
-        queues_[i]->drainInline();
+    for (std::size_t i = 0; i < strands_.size(); ++i) {
+        const std::shared_ptr<Strand> strand = std::move(strands_[i]);
+        strand->drainInline();
     }
-    queues_.clear();
+    strands_.clear();
     posted_ = 0;
 }
 
-LinuxSerialQueue::~LinuxSerialQueue() {
-    std::unique_lock lock(mutex_);
-    isIdle_.wait(lock, [this] { return !isScheduled_; });
-}
-
-void LinuxSerialQueue::post(Work work, Pace pace) {
+void Strand::post(Work work, Pace pace) {
     {
         const std::lock_guard lock(mutex_);
         pending_.push_back({std::move(work), pace});
@@ -53,30 +49,29 @@ void LinuxSerialQueue::post(Work work, Pace pace) {
         }
     }
     if (currentDrain != nullptr) {
-        currentDrain->queues_.push_back(this);
+        currentDrain->strands_.push_back(shared_from_this());
     } else {
         handToPool();
     }
 }
 
-void LinuxSerialQueue::handToPool() {
-    pool_.post([this] { drainOnPool(); });
+void Strand::handToPool() {
+    pool_.post([strand = shared_from_this()] { strand->drainOnPool(); });
 }
 
-bool LinuxSerialQueue::takeBatch() {
+bool Strand::takeBatch() {
     batch_.clear();
     next_ = 0;
     const std::lock_guard lock(mutex_);
     if (pending_.empty()) {
         isScheduled_ = false;
-        isIdle_.notify_all();
         return false;
     }
     batch_.swap(pending_);
     return true;
 }
 
-void LinuxSerialQueue::runBatch(bool stopAtBlocking) {
+void Strand::runBatch(bool stopAtBlocking) {
     while (next_ != batch_.size()) {
         Item& item = batch_[next_];
         if (stopAtBlocking && item.pace == Pace::mayBlock) {
@@ -92,13 +87,13 @@ void LinuxSerialQueue::runBatch(bool stopAtBlocking) {
     }
 }
 
-void LinuxSerialQueue::drainOnPool() {
+void Strand::drainOnPool() {
     while (next_ != batch_.size() || takeBatch()) {
         runBatch(false);
     }
 }
 
-void LinuxSerialQueue::drainInline() {
+void Strand::drainInline() {
     Time started = std::chrono::steady_clock::now();
     if (started < inlineAllowedFrom_) {
         handToPool();

@@ -4,16 +4,17 @@
 #include "platform/linux/ThreadPool.h"
 
 #include <chrono>
-#include <condition_variable>
 #include <cstddef>
+#include <memory>
 #include <mutex>
 #include <string>
 #include <string_view>
+#include <utility>
 #include <vector>
 
 namespace tamblo {
 
-class LinuxSerialQueue;
+class Strand;
 
 /// Lets the thread that holds it run, itself, the quick work that it posts: waking another thread costs more
 /// than a message does. Work is posted as ever, collected, and run in one batch at `drain`, so that a batch
@@ -33,21 +34,19 @@ public:
     [[nodiscard]] static InlineDrain* current() noexcept;
 
 private:
-    friend class LinuxSerialQueue;
-    std::vector<LinuxSerialQueue*> queues_;
+    friend class Strand;
+    std::vector<std::shared_ptr<Strand>> strands_;
     std::size_t posted_ = 0;
 };
 
-/// A serial queue as a strand: no thread of its own; whoever drains it, the pool or an `InlineDrain`, is the
-/// only one to do so at that time.
-class LinuxSerialQueue final : public SerialQueue {
+/// What a serial queue is made of: no thread of its own; whoever drains it, the pool or an `InlineDrain`, is
+/// the only one to do so at that time, and keeps it until it is empty.
+class Strand final : public std::enable_shared_from_this<Strand> {
 public:
-    LinuxSerialQueue(ThreadPool& pool, std::string_view label) : pool_(pool), label_(label) {}
-    ~LinuxSerialQueue() override;
+    explicit Strand(ThreadPool& pool) : pool_(pool) {}
 
-    void post(Work work, Pace pace) override;
-    void setBatchEnd(Work batchEnd) override { batchEnd_ = std::move(batchEnd); }
-    [[nodiscard]] std::string_view label() const noexcept override { return label_; }
+    void post(Work work, Pace pace);
+    void setBatchEnd(Work batchEnd) { batchEnd_ = std::move(batchEnd); }
 
 private:
     friend class InlineDrain;
@@ -65,7 +64,6 @@ private:
     void handToPool();
 
     ThreadPool& pool_;
-    const std::string label_;
     Work batchEnd_;
 
     // Touched only by whoever drains.
@@ -74,9 +72,23 @@ private:
     Time inlineAllowedFrom_{};
 
     std::mutex mutex_; ///< guards what follows
-    std::condition_variable isIdle_;
     std::vector<Item> pending_;
     bool isScheduled_ = false;
+};
+
+/// A serial queue: its user's hold on a strand, which lives on until it has run what was posted.
+class LinuxSerialQueue final : public SerialQueue {
+public:
+    LinuxSerialQueue(ThreadPool& pool, std::string_view label)
+        : label_(label), strand_(std::make_shared<Strand>(pool)) {}
+
+    void post(Work work, Pace pace) override { strand_->post(std::move(work), pace); }
+    void setBatchEnd(Work batchEnd) override { strand_->setBatchEnd(std::move(batchEnd)); }
+    [[nodiscard]] std::string_view label() const noexcept override { return label_; }
+
+private:
+    const std::string label_;
+    const std::shared_ptr<Strand> strand_;
 };
 
 } // namespace tamblo

@@ -11,6 +11,23 @@ struct LinuxWorkQueues::TickEnd {
     UniqueFunction<void()> call;
 };
 
+namespace {
+
+class PooledCall final : public DelayedCall {
+public:
+    PooledCall(ThreadPool& pool, std::chrono::milliseconds delay, UniqueFunction<void()> call)
+        : pool_(pool), key_(pool.postAfter(delay, std::move(call))) {}
+    ~PooledCall() override { pool_.cancel(key_); }
+    PooledCall(const PooledCall&) = delete;
+    PooledCall& operator=(const PooledCall&) = delete;
+
+private:
+    ThreadPool& pool_;
+    const ThreadPool::DelayedKey key_;
+};
+
+} // namespace
+
 LinuxWorkQueues::LinuxWorkQueues()
     : tickEnd_(std::make_shared<TickEnd>()), retired_(std::make_shared<LinuxRepeatingTimer::Retired>()) {}
 
@@ -36,6 +53,11 @@ std::unique_ptr<RepeatingTimer> LinuxWorkQueues::makeRepeatingTimer(std::chrono:
             }
         },
         retired_);
+}
+
+std::unique_ptr<DelayedCall> LinuxWorkQueues::callAfter(std::chrono::milliseconds delay,
+                                                        UniqueFunction<void()> call) {
+    return std::make_unique<PooledCall>(pool_, delay, std::move(call));
 }
 
 } // namespace tamblo

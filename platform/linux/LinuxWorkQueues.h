@@ -8,7 +8,7 @@
 
 namespace tamblo {
 
-/// Serial queues as strands over one pool, and timers. Its queues are at rest, or gone, before it goes.
+/// Serial queues as strands over one pool, and timers. Outlives its queues' users; works off what was posted.
 class LinuxWorkQueues final : public WorkQueues {
 public:
     LinuxWorkQueues();
@@ -17,6 +17,8 @@ public:
     [[nodiscard]] std::unique_ptr<SerialQueue> makeSerialQueue(std::string_view label) override;
     [[nodiscard]] std::unique_ptr<RepeatingTimer> makeRepeatingTimer(std::chrono::milliseconds interval,
                                                                      UniqueFunction<void()> tick) override;
+    [[nodiscard]] std::unique_ptr<DelayedCall> callAfter(std::chrono::milliseconds delay,
+                                                         UniqueFunction<void()> call) override;
     /// Called after each tick of any timer, on its thread: what a tick recorded is written out.
     void setTickEnd(UniqueFunction<void()> tickEnd);
 

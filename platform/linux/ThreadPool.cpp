@@ -26,9 +26,38 @@ ThreadPool::~ThreadPool() {
 }
 
 void ThreadPool::post(UniqueFunction<void()> work) {
-    std::unique_lock lock(mutex_);
+    const std::lock_guard lock(mutex_);
     work_.push_back(std::move(work));
-    if (idle_ >= work_.size()) {
+    callThread();
+}
+
+ThreadPool::DelayedKey ThreadPool::postAfter(std::chrono::milliseconds delay, UniqueFunction<void()> work) {
+    const std::lock_guard lock(mutex_);
+    const DelayedKey key{std::chrono::steady_clock::now() + delay, ++lastDelayed_};
+    delayed_.emplace(key, std::move(work));
+    if (delayed_.begin()->first == key) {
+        // Whoever waits for the call that was next has to wait for this one instead.
+        callThread();
+    }
+    return key;
+}
+
+void ThreadPool::cancel(const DelayedKey& key) {
+    UniqueFunction<void()> dropped;
+    const std::lock_guard lock(mutex_);
+    const auto found = delayed_.find(key);
+    if (found != delayed_.end()) {
+        dropped = std::move(found->second);
+        delayed_.erase(found);
+    }
+}
+
+void ThreadPool::callThread() {
+    if (isEnding_) {
+        // Whoever posts at the end is one of the pool's threads, and takes it next.
+        return;
+    }
+    if (idle_ >= std::max<std::size_t>(work_.size(), 1)) {
         hasWork_.notify_one();
         return;
     }
@@ -49,16 +78,44 @@ void ThreadPool::joinFinished() {
     }
 }
 
+void ThreadPool::takeDueCalls() {
+    const Time now = std::chrono::steady_clock::now();
+    while (!delayed_.empty() && delayed_.begin()->first.first <= now) {
+        work_.push_back(std::move(delayed_.begin()->second));
+        delayed_.erase(delayed_.begin());
+        if (work_.size() > 1) {
+            // The caller takes one itself.
+            callThread();
+        }
+    }
+}
+
+bool ThreadPool::waitForWork(std::unique_lock<std::mutex>& lock) {
+    const Time idleSince = std::chrono::steady_clock::now();
+    for (;;) {
+        takeDueCalls();
+        if (!work_.empty()) {
+            return true;
+        }
+        const Time now = std::chrono::steady_clock::now();
+        // One thread stays for as long as a call is to come.
+        const bool isNeeded = !delayed_.empty() && idle_ == 0;
+        if (isEnding_ || (now >= idleSince + kIdleLife && !isNeeded)) {
+            return false;
+        }
+        Time until = isNeeded ? Time::max() : idleSince + kIdleLife;
+        if (!delayed_.empty()) {
+            until = std::min(until, delayed_.begin()->first.first);
+        }
+        ++idle_;
+        hasWork_.wait_until(lock, until);
+        --idle_;
+    }
+}
+
 void ThreadPool::run() {
     std::unique_lock lock(mutex_);
-    for (;;) {
-        ++idle_;
-        const bool isAwake =
-            hasWork_.wait_for(lock, kIdleLife, [this] { return !work_.empty() || isEnding_; });
-        --idle_;
-        if (!isAwake || work_.empty()) {
-            break;
-        }
+    while (waitForWork(lock)) {
         UniqueFunction<void()> work = std::move(work_.front());
         work_.pop_front();
         lock.unlock();

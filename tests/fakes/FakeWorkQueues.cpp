@@ -15,6 +15,37 @@ std::unique_ptr<RepeatingTimer> FakeWorkQueues::makeRepeatingTimer(std::chrono::
     return std::make_unique<FakeRepeatingTimer>(std::move(state));
 }
 
+std::unique_ptr<DelayedCall> FakeWorkQueues::callAfter(std::chrono::milliseconds delay,
+                                                       UniqueFunction<void()> call) {
+    const std::lock_guard held(mutex_);
+    auto entry = std::make_shared<Delayed>(elapsed_ + delay, std::move(call));
+    delayed_.push_back(entry);
+    return std::make_unique<FakeDelayedCall>(std::move(entry));
+}
+
+void FakeWorkQueues::elapse(std::chrono::milliseconds time) {
+    std::vector<std::shared_ptr<Delayed>> due;
+    {
+        const std::lock_guard held(mutex_);
+        elapsed_ += time;
+        const auto later = std::stable_partition(
+            delayed_.begin(), delayed_.end(), [this](const auto& entry) { return entry->due <= elapsed_; });
+        due.assign(delayed_.begin(), later);
+        delayed_.erase(delayed_.begin(), later);
+    }
+    for (const auto& entry : due) {
+        if (auto call = std::exchange(entry->call, {})) {
+            call();
+        }
+    }
+}
+
+std::size_t FakeWorkQueues::delayedCalls() const {
+    const std::lock_guard held(mutex_);
+    return static_cast<std::size_t>(
+        std::count_if(delayed_.begin(), delayed_.end(), [](const auto& entry) { return bool(entry->call); }));
+}
+
 std::vector<std::shared_ptr<FakeRepeatingTimer::State>> FakeWorkQueues::timers() const {
     const std::lock_guard held(mutex_);
     return timers_;

@@ -3,9 +3,12 @@
 #include "tests/fakes/FakeRepeatingTimer.h"
 #include "tests/fakes/FakeSerialQueue.h"
 
+#include <chrono>
+#include <cstddef>
 #include <memory>
 #include <mutex>
 #include <string_view>
+#include <utility>
 #include <vector>
 
 namespace tamblo {
@@ -18,6 +21,12 @@ public:
     }
     [[nodiscard]] std::unique_ptr<RepeatingTimer> makeRepeatingTimer(std::chrono::milliseconds interval,
                                                                      UniqueFunction<void()> tick) override;
+    [[nodiscard]] std::unique_ptr<DelayedCall> callAfter(std::chrono::milliseconds delay,
+                                                         UniqueFunction<void()> call) override;
+
+    /// Turns the time of the delayed calls, and makes those that are due.
+    void elapse(std::chrono::milliseconds time);
+    [[nodiscard]] std::size_t delayedCalls() const;
 
     /// Every timer that was made, the latest last; they outlive their timers.
     [[nodiscard]] std::vector<std::shared_ptr<FakeRepeatingTimer::State>> timers() const;
@@ -26,8 +35,23 @@ public:
     void tick();
 
 private:
+    struct Delayed {
+        std::chrono::milliseconds due;
+        UniqueFunction<void()> call; ///< empty once it is made or called off
+    };
+    class FakeDelayedCall final : public DelayedCall {
+    public:
+        explicit FakeDelayedCall(std::shared_ptr<Delayed> call) : call_(std::move(call)) {}
+        ~FakeDelayedCall() override { call_->call = {}; }
+
+    private:
+        const std::shared_ptr<Delayed> call_;
+    };
+
     mutable std::mutex mutex_;
     std::vector<std::shared_ptr<FakeRepeatingTimer::State>> timers_;
+    std::chrono::milliseconds elapsed_{0};
+    std::vector<std::shared_ptr<Delayed>> delayed_;
 };
 
 } // namespace tamblo

@@ -138,15 +138,59 @@ TEST(SerialQueue, ManyQueuesShareFewThreadsThatGrowWhileWorkBlocks) {
     mayGoOn.count_down();
 }
 
-TEST(SerialQueue, DestroyingItFinishesWhatWasPosted) {
-    LinuxWorkQueues queues;
-    auto queue = queues.makeSerialQueue("last words");
+TEST(SerialQueue, WhatWasPostedRunsAfterItIsDestroyed) {
     std::atomic<int> ran{0};
-    for (int i = 0; i < 1000; ++i) {
+    {
+        LinuxWorkQueues queues;
+        auto queue = queues.makeSerialQueue("last words");
+        for (int i = 0; i < 1000; ++i) {
+            queue->post([&ran] { ++ran; }, i % 2 == 0 ? Pace::quick : Pace::mayBlock);
+        }
+        queue.reset();
+
+        // In its own work, and on the thread that is to drain it.
+        queue = queues.makeSerialQueue("suicide");
+        InlineDrain drain;
+        queue->post([&] { queue.reset(); });
         queue->post([&ran] { ++ran; });
+        auto other = queues.makeSerialQueue("abandoned");
+        other->post([&ran] { ++ran; });
+        other.reset();
+        drain.drain();
+        EXPECT_EQ(queue, nullptr);
     }
-    queue.reset();
-    EXPECT_EQ(ran, 1000);
+    EXPECT_EQ(ran, 1002);
+}
+
+TEST(DelayedCall, IsMadeOnceItsTimeHasComeUnlessItIsCalledOff) {
+    LinuxWorkQueues queues;
+    using std::chrono::milliseconds;
+    const auto start = std::chrono::steady_clock::now();
+    std::promise<void> late;
+    std::promise<void> soon;
+    std::atomic<bool> isCalledOffMade{false};
+    const auto lateCall = queues.callAfter(milliseconds(60), [&late] { late.set_value(); });
+    auto calledOff = queues.callAfter(milliseconds(30), [&] { isCalledOffMade = true; });
+    const auto soonCall = queues.callAfter(milliseconds(10), [&soon] { soon.set_value(); });
+    const auto never = queues.callAfter(std::chrono::hours(24), [] { FAIL(); });
+    calledOff.reset();
+    ASSERT_EQ(soon.get_future().wait_for(kPatience), std::future_status::ready);
+    EXPECT_GE(std::chrono::steady_clock::now() - start, milliseconds(10));
+    ASSERT_EQ(late.get_future().wait_for(kPatience), std::future_status::ready);
+    EXPECT_GE(std::chrono::steady_clock::now() - start, milliseconds(60));
+    EXPECT_FALSE(isCalledOffMade);
+
+    // Many at once, each made once.
+    std::atomic<int> made{0};
+    std::vector<std::unique_ptr<DelayedCall>> calls;
+    for (int i = 0; i < 2000; ++i) {
+        calls.push_back(queues.callAfter(milliseconds(i % 20), [&made] { ++made; }));
+    }
+    const auto deadline = std::chrono::steady_clock::now() + kPatience;
+    while (made < 2000 && std::chrono::steady_clock::now() < deadline) {
+        std::this_thread::yield();
+    }
+    EXPECT_EQ(made, 2000);
 }
 
 TEST(RepeatingTimer, TicksUntilItIsInvalidatedEvenByItsOwnTick) {
