@@ -17,6 +17,8 @@ class Clock {
 public:
     virtual ~Clock() = default;
     [[nodiscard]] virtual WallTime now() const noexcept = 0;
+    /// How far the device's local time is ahead of UTC at that time.
+    [[nodiscard]] virtual std::chrono::seconds utcOffset(WallTime time) const = 0;
 };
 
 } // namespace tamblo

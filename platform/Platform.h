@@ -1,13 +1,17 @@
 #pragma once
 
 #include "platform/AnalyticsEventService.h"
+#include "platform/CallQualityService.h"
 #include "platform/Clock.h"
 #include "platform/ConnectionService.h"
 #include "platform/DeviceConditions.h"
 #include "platform/DeviceProperties.h"
+#include "platform/DiagnosticsMetricsService.h"
 #include "platform/NamedNotifications.h"
+#include "platform/PowerEventLog.h"
 #include "platform/Preferences.h"
 #include "platform/ProcessInformation.h"
+#include "platform/ReportFiles.h"
 #include "platform/StructuredLog.h"
 #include "platform/TracePoints.h"
 #include "platform/WorkQueue.h"
@@ -27,6 +31,10 @@ struct Platform {
     ProcessInformation& processInformation;
     DeviceConditions& deviceConditions;
     AnalyticsEventService& analyticsEvents;
+    PowerEventLog& powerEvents;
+    DiagnosticsMetricsService& diagnosticsMetrics;
+    CallQualityService& callQuality;
+    ReportFiles& reportFiles;
     ConnectionService& connections;
 };
 

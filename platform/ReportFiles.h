@@ -29,8 +29,6 @@ public:
     /// A new empty file in place of any that has the name, or what went wrong.
     [[nodiscard]] virtual std::variant<std::unique_ptr<ReportFile>, std::string>
     createFile(const std::string& path) = 0;
-    /// The time by the device's own clock and zone, "20260314-092653+0100".
-    [[nodiscard]] virtual std::string localTimestamp() const = 0;
 };
 
 } // namespace tamblo

@@ -1,9 +1,17 @@
 #include "platform/linux/LinuxClock.h"
 
+#include <ctime>
+
 namespace tamblo {
 
 WallTime LinuxClock::now() const noexcept {
     return std::chrono::system_clock::now();
+}
+
+std::chrono::seconds LinuxClock::utcOffset(WallTime time) const {
+    const std::time_t seconds = std::chrono::floor<std::chrono::seconds>(time.time_since_epoch()).count();
+    std::tm local{};
+    return std::chrono::seconds(::localtime_r(&seconds, &local) != nullptr ? local.tm_gmtoff : 0);
 }
 
 } // namespace tamblo

@@ -8,6 +8,7 @@ namespace tamblo {
 class LinuxClock final : public Clock {
 public:
     [[nodiscard]] WallTime now() const noexcept override;
+    [[nodiscard]] std::chrono::seconds utcOffset(WallTime time) const override;
 };
 
 } // namespace tamblo

@@ -2,13 +2,17 @@
 
 #include "platform/linux/EventLoop.h"
 #include "platform/linux/LinuxAnalyticsEventService.h"
+#include "platform/linux/LinuxCallQualityService.h"
 #include "platform/linux/LinuxClock.h"
 #include "platform/linux/LinuxConnectionService.h"
 #include "platform/linux/LinuxDeviceConditions.h"
 #include "platform/linux/LinuxDeviceProperties.h"
+#include "platform/linux/LinuxDiagnosticsMetrics.h"
 #include "platform/linux/LinuxNamedNotifications.h"
+#include "platform/linux/LinuxPowerEventLog.h"
 #include "platform/linux/LinuxPreferences.h"
 #include "platform/linux/LinuxProcessInformation.h"
+#include "platform/linux/LinuxReportFiles.h"
 #include "platform/linux/LinuxSerialQueue.h"
 #include "platform/linux/LinuxStructuredLog.h"
 #include "platform/linux/LinuxTracePoints.h"
@@ -103,6 +107,10 @@ struct LinuxPlatform::Services {
           preferences(directories.preferences(), log),
           preferenceChanges([this] { preferences.readChanges(); }),
           analyticsEvents(directories.logs, clock, preferences, log),
+          powerEvents(directories.logs, clock, log),
+          diagnosticsMetrics(directories.logs, clock, log),
+          callQuality(directories.logs, clock, preferences, workQueues, log),
+          reportFiles(directories.logs),
           connections(loop, log) {}
 
     // First, as it makes sure that standard error is open before anything else can take its number.
@@ -118,8 +126,13 @@ struct LinuxPlatform::Services {
     LinuxPreferences preferences;
     Changes preferenceChanges;
     LinuxAnalyticsEventService analyticsEvents;
+    LinuxPowerEventLog powerEvents;
+    LinuxDiagnosticsMetrics diagnosticsMetrics;
+    LinuxCallQualityService callQuality;
+    LinuxReportFiles reportFiles;
     EventLoop loop;
     LinuxConnectionService connections;
+    // Behind what its work uses: it works off what was posted before it goes.
     LinuxWorkQueues workQueues;
     std::optional<InlineDrain> drain;
 };
@@ -157,11 +170,17 @@ Platform LinuxPlatform::services() {
             .processInformation = services_->processInformation,
             .deviceConditions = services_->deviceConditions,
             .analyticsEvents = services_->analyticsEvents,
+            .powerEvents = services_->powerEvents,
+            .diagnosticsMetrics = services_->diagnosticsMetrics,
+            .callQuality = services_->callQuality,
+            .reportFiles = services_->reportFiles,
             .connections = services_->connections};
 }
 
 void LinuxPlatform::flushSinks() {
     services_->analyticsEvents.flush();
+    services_->powerEvents.flush();
+    services_->diagnosticsMetrics.flush();
 }
 
 void LinuxPlatform::run(SerialQueue& requestQueue,

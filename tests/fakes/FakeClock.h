@@ -14,8 +14,11 @@ public:
         return WallTime(std::chrono::nanoseconds(nanoseconds_.load(std::memory_order_relaxed)));
     }
     [[nodiscard]] double seconds() const noexcept { return secondsSince1970(now()); }
+    [[nodiscard]] std::chrono::seconds utcOffset(WallTime) const override { return offset; }
     void advance(std::chrono::nanoseconds step) noexcept { nanoseconds_ += step.count(); }
     void set(WallTime time) noexcept { nanoseconds_ = time.time_since_epoch().count(); }
+
+    std::chrono::seconds offset{0};
 
 private:
     std::atomic<std::int64_t> nanoseconds_{1'772'366'400'000'000'000};

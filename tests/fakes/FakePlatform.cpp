@@ -10,7 +10,8 @@ FakePlatform::FakePlatform(LogLevel threshold, bool isInternalBuild) {
     log.setThreshold(threshold);
     deviceProperties.set("InternalBuild", isInternalBuild);
     installPlatform({clock, workQueues, log, tracePoints, deviceProperties, preferences, namedNotifications,
-                     processInformation, deviceConditions, analyticsEvents, connections});
+                     processInformation, deviceConditions, analyticsEvents, powerEvents, diagnosticsMetrics,
+                     callQuality, reportFiles, connections});
     forgetLogThresholds();
     forgetInternalBuild();
     resetReportingServerQueue();

@@ -2,14 +2,18 @@
 
 #include "platform/Platform.h"
 #include "tests/fakes/FakeAnalyticsEventService.h"
+#include "tests/fakes/FakeCallQualityService.h"
 #include "tests/fakes/FakeClock.h"
 #include "tests/fakes/FakeConnectionService.h"
 #include "tests/fakes/FakeDeviceConditions.h"
 #include "tests/fakes/FakeDeviceProperties.h"
+#include "tests/fakes/FakeDiagnosticsMetricsService.h"
 #include "tests/fakes/FakeLog.h"
 #include "tests/fakes/FakeNamedNotifications.h"
+#include "tests/fakes/FakePowerEventLog.h"
 #include "tests/fakes/FakePreferences.h"
 #include "tests/fakes/FakeProcessInformation.h"
+#include "tests/fakes/FakeReportFiles.h"
 #include "tests/fakes/FakeTracePoints.h"
 #include "tests/fakes/FakeWorkQueues.h"
 
@@ -38,6 +42,10 @@ public:
     FakeProcessInformation processInformation;
     FakeDeviceConditions deviceConditions;
     FakeAnalyticsEventService analyticsEvents;
+    FakePowerEventLog powerEvents;
+    FakeDiagnosticsMetricsService diagnosticsMetrics;
+    FakeCallQualityService callQuality;
+    FakeReportFiles reportFiles;
     FakeConnectionService connections;
 };
 
