@@ -5,6 +5,7 @@
 #include "workers/producers/ZRReportingSessionSummaryWorker.h"
 #include "workers/producers/ZRReportingSessionVolumeMessagesWorker.h"
 #include "workers/sinks/ZRReportingSessionEventryWorker.h"
+#include "workers/sinks/ZRReportingSessionSummaryJsonFileWorker.h"
 
 #include <array>
 
@@ -51,7 +52,9 @@ constexpr std::array<WorkerClass, 17> kWorkerClasses{{
      .initWithSession = initWithSession<ZRReportingSessionSystemMonitorWorker>},
     {.name = "ZRReportingSessionZephWorker", .role = kConsumer, .handleSingleMessageSession = true},
     {.name = "ZRReportingSessionDPWorker", .role = kConsumer},
-    {.name = "ZRReportingSessionSummaryJsonFileWorker", .role = kWorkerOnly},
+    {.name = "ZRReportingSessionSummaryJsonFileWorker",
+     .role = kWorkerOnly,
+     .initWithSession = ZRReportingSessionSummaryJsonFileWorker::initWithSession},
     {.name = "ZRReportingSessionAudioRegistrationWorker", .role = kConsumer},
     {.name = "ZRReportingSessionRtcWorker", .role = kConsumer, .handleSingleMessageSession = true},
     {.name = "ZRReportingSessionQuilletWorker", .role = kConsumer, .handleSingleMessageSession = true},

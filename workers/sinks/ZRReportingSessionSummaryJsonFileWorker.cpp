@@ -1,0 +1,231 @@
+#include "workers/sinks/ZRReportingSessionSummaryJsonFileWorker.h"
+
+#include "base/Format.h"
+#include "base/JsonPretty.h"
+#include "base/Utf8.h"
+#include "platform/Platform.h"
+#include "session/ZRReportingSession.h"
+#include "util/AudioEvents.h"
+#include "util/InternalBuild.h"
+#include "util/Log.h"
+
+#include <algorithm>
+#include <chrono>
+#include <map>
+#include <unordered_map>
+#include <utility>
+#include <variant>
+
+namespace tamblo {
+
+namespace {
+
+constexpr std::string_view kIsSessionStarted = "isSessionStarted";
+/// Lines are written once this many bytes of them wait.
+constexpr std::size_t kBytesPerWrite = 256U << 10U;
+/// What a file system takes as a name, in bytes.
+constexpr std::size_t kLongestFileName = 255;
+
+void appendDigits(std::string& out, std::int64_t number, std::size_t width) {
+    const std::string digits = std::to_string(number);
+    out.append(width - std::min(width, digits.size()), '0');
+    out += digits;
+}
+
+/// "yyyyMMdd-HHmmss" and the offset as hours and minutes.
+std::string timeInFileName(WallTime time, std::chrono::seconds utcOffset) {
+    const auto local = std::chrono::floor<std::chrono::seconds>(time + utcOffset);
+    const auto day = std::chrono::floor<std::chrono::days>(local);
+    const std::chrono::year_month_day date(day);
+    const std::chrono::hh_mm_ss ofDay(local - day);
+    std::string text;
+    appendDigits(text, static_cast<int>(date.year()), 4);
+    appendDigits(text, static_cast<unsigned>(date.month()), 2);
+    appendDigits(text, static_cast<unsigned>(date.day()), 2);
+    text += '-';
+    appendDigits(text, ofDay.hours().count(), 2);
+    appendDigits(text, ofDay.minutes().count(), 2);
+    appendDigits(text, ofDay.seconds().count(), 2);
+    const std::int64_t minutes =
+        std::chrono::floor<std::chrono::minutes>(std::chrono::abs(utcOffset)).count();
+    text += utcOffset < std::chrono::seconds(0) ? '-' : '+';
+    appendDigits(text, minutes / 60 * 100 + minutes % 60, 4);
+    return text;
+}
+
+/// What a client names so stays one part of one file name.
+std::string asPartOfFileName(std::string name, std::size_t longest) {
+    if (name.size() > longest) {
+        while (longest > 0 && isUtf8Continuation(name[longest])) {
+            --longest;
+        }
+        name.resize(longest);
+    }
+    std::replace_if(
+        name.begin(), name.end(),
+        [](char character) {
+            return character == '/' || static_cast<unsigned char>(character) < 0x20 || character == 0x7F;
+        },
+        '_');
+    return name;
+}
+
+} // namespace
+
+std::string summaryFileName(WallTime time, std::chrono::seconds utcOffset, std::int64_t reporterID,
+                            const Value& applicationName, std::string_view serviceName) {
+    const std::string before = formatted("{}-{}-", timeInFileName(time, utcOffset), reporterID);
+    const std::string behind = formatted("-{}.json", serviceName);
+    return before +
+           asPartOfFileName(formatted("{}", applicationName),
+                            kLongestFileName - before.size() - behind.size()) +
+           behind;
+}
+
+/// The names of one file's messages: the category's and the type's, and the number among those of that name.
+class ZRReportingSessionSummaryJsonFileWorker::MessageNames {
+public:
+    /// Holds until the next call.
+    [[nodiscard]] std::string_view next(const ZRReportingSessionMessage& message) {
+        Count& count = countOf(message.category(), message.type());
+        name_.assign(count.prefix);
+        appendText(name_, ++count.messages);
+        return name_;
+    }
+
+private:
+    struct Count {
+        std::string prefix; ///< both names and a "_"
+        std::uint64_t messages = 0;
+    };
+
+    /// Several values may have one name, and are then counted together.
+    Count& countOf(AudioEventCategory category, AudioEventType type) {
+        Count*& known = byNumber_[std::uint64_t{category} << 16U | type];
+        if (known == nullptr) {
+            std::string prefix = formatted("{}_{}_", ZRReportingUtilityCategoryString(category),
+                                           ZRReportingUtilityTypeString(type));
+            known = &byName_[prefix];
+            known->prefix = std::move(prefix);
+        }
+        return *known;
+    }
+
+    std::map<std::string, Count> byName_;
+    std::unordered_map<std::uint64_t, Count*> byNumber_;
+    std::string name_;
+};
+
+std::shared_ptr<ZRReportingSessionWorkerProtocol>
+ZRReportingSessionSummaryJsonFileWorker::initWithSession(const std::shared_ptr<ZRReportingSession>& session) {
+    if (session->serviceType() != AudioServiceTypeTest && !ZRReportingUtilityIsInternalBuild()) {
+        return nullptr;
+    }
+    auto worker = std::make_shared<ZRReportingSessionSummaryJsonFileWorker>(session);
+    worker->setStarted(true);
+    return worker;
+}
+
+void ZRReportingSessionSummaryJsonFileWorker::stop() {
+    const std::shared_ptr<ZRReportingSession> owner = session();
+    if (owner == nullptr || owner->messages().empty()) {
+        return;
+    }
+    MessageNames names;
+    for (const MessageRef& message : owner->messages()) {
+        if (message->isRedundant) {
+            continue;
+        }
+        if (reportPath_) {
+            writeLine(",");
+        } else {
+            openFile(*owner);
+        }
+        writeMessage(*message, names.next(*message));
+    }
+    closeFile();
+    lines_.reset();
+    reportPath_.reset();
+}
+
+void ZRReportingSessionSummaryJsonFileWorker::writeMessage(ZRReportingSessionMessage& message,
+                                                           std::string_view name) {
+    message.editPayload([&message](Dictionary& payload) {
+        payload.set(kIsSessionStarted, yesOrNo(message.isSessionStarted));
+    });
+    const std::optional<std::string> failure = appendPrettyJson(lines_, name, message.payload());
+    if (failure) {
+        // The separator before it stays, and the file is then no valid JSON.
+        log::error(ZRReportingSessionCategory(), "dataWithJSONObject: {}", *failure);
+        return;
+    }
+    writeLine("");
+}
+
+void ZRReportingSessionSummaryJsonFileWorker::openFile(const ZRReportingSession& session) {
+    const Platform& device = platform();
+    const std::string directory = device.reportFiles.reportingLogsDirectory();
+    if (const auto failure = device.reportFiles.createDirectory(directory)) {
+        log::error(ZRReportingSessionCategory(), "can't create logging directory at {}: {}", directory,
+                   *failure);
+    }
+    const WallTime now = device.clock.now();
+    reportPath_ =
+        directory + "/" +
+        summaryFileName(now, device.clock.utcOffset(now), session.reporterID(),
+                        ZRReportingUtilityRetrieveAppName(session.configuration()), session.serviceName());
+    auto file = device.reportFiles.createFile(*reportPath_);
+    if (const auto* failure = std::get_if<std::string>(&file)) {
+        log::error(ZRReportingSessionCategory(),
+                   "SummaryJsonFileWorker failed to open file. action=open file={} error=\"{}\"",
+                   *reportPath_, *failure);
+        setStarted(false);
+        return;
+    }
+    reportFileHandle_ = std::get<std::unique_ptr<ReportFile>>(std::move(file));
+    log::info(ZRReportingSessionCategory(), "SummaryJsonFileWorker opened file. action=open file={}",
+              *reportPath_);
+    setStarted(true);
+    isOut_ = false;
+    writeLine("[");
+}
+
+void ZRReportingSessionSummaryJsonFileWorker::writeLine(std::string_view line) {
+    lines_.append(line);
+    lines_.append('\n');
+    if (reportFileHandle_ == nullptr) {
+        lines_.clear();
+    } else if (lines_.size() >= kBytesPerWrite) {
+        writeOut();
+    }
+}
+
+void ZRReportingSessionSummaryJsonFileWorker::writeOut() {
+    const std::optional<std::string> failure = reportFileHandle_->write(lines_.view());
+    lines_.clear();
+    if (failure && !isOut_) {
+        log::error(ZRReportingSessionCategory(),
+                   "SummaryJsonFileWorker failed to write line. action=writeline file={} error=\"{}\"",
+                   *reportPath_, *failure);
+    }
+    isOut_ = failure.has_value();
+}
+
+void ZRReportingSessionSummaryJsonFileWorker::closeFile() {
+    writeLine("]");
+    if (reportFileHandle_ == nullptr) {
+        return;
+    }
+    writeOut();
+    if (const auto failure = reportFileHandle_->close()) {
+        log::error(ZRReportingSessionCategory(),
+                   "SummaryJsonFileWorker failed to closed file. action=close file={} error=\"{}\"",
+                   *reportPath_, *failure);
+    } else {
+        log::info(ZRReportingSessionCategory(), "SummaryJsonFileWorker closed file. action=close file={}",
+                  *reportPath_);
+    }
+    reportFileHandle_.reset();
+}
+
+} // namespace tamblo

@@ -1,0 +1,58 @@
+#pragma once
+
+#include "base/Dictionary.h"
+#include "base/TextBuffer.h"
+#include "platform/Clock.h"
+#include "platform/ReportFiles.h"
+#include "session/ZRReportingSessionWorkerProtocol.h"
+
+#include <cstdint>
+#include <memory>
+#include <optional>
+#include <string>
+#include <string_view>
+
+namespace tamblo {
+
+/// The name of a session's summary file: when it is written, in local time, and whose session it is. The
+/// application's name comes from a client: a slash or an ASCII control character in it becomes `_`, and one
+/// that is too long for a file name is cut at the end of a character. Any other name stands as it is.
+[[nodiscard]] std::string summaryFileName(WallTime time, std::chrono::seconds utcOffset,
+                                          std::int64_t reporterID, const Value& applicationName,
+                                          std::string_view serviceName);
+
+/// Writes every message of a session that is not redundant into a JSON file of the session's own when it
+/// stops: for sessions of the service type "test", and on internal builds for all.
+///
+/// Neither consumer nor producer, it stops behind all workers that are, so that the file holds what they have
+/// derived. The lines are gathered and written some hundred kibibytes at a time. What cannot be written is
+/// lost: one error line tells of it until something can be written again, and the session goes on.
+class ZRReportingSessionSummaryJsonFileWorker final : public ZRReportingSessionWorkerProtocol {
+public:
+    using ZRReportingSessionWorkerProtocol::ZRReportingSessionWorkerProtocol;
+
+    /// Null for a session that gets no file. The worker is started.
+    [[nodiscard]] static std::shared_ptr<ZRReportingSessionWorkerProtocol>
+    initWithSession(const std::shared_ptr<ZRReportingSession>& session);
+
+    /// Leaves its mark in the session's records: each payload gets the key that says whether the message was
+    /// sent while the session was started.
+    void stop() override;
+
+private:
+    class MessageNames;
+
+    void writeMessage(ZRReportingSessionMessage& message, std::string_view name);
+    void openFile(const ZRReportingSession& session);
+    /// Without an open file, nothing.
+    void writeLine(std::string_view line);
+    void writeOut();
+    void closeFile();
+
+    std::optional<std::string> reportPath_; ///< once the file was tried to be opened
+    std::unique_ptr<ReportFile> reportFileHandle_;
+    TextBuffer lines_; ///< not written yet
+    bool isOut_ = false;
+};
+
+} // namespace tamblo
