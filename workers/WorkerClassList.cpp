@@ -5,6 +5,8 @@
 #include "workers/producers/ZRReportingSessionSummaryWorker.h"
 #include "workers/producers/ZRReportingSessionVolumeMessagesWorker.h"
 #include "workers/sinks/ZRReportingSessionEventryWorker.h"
+#include "workers/sinks/ZRReportingSessionJouleryWorker.h"
+#include "workers/sinks/ZRReportingSessionQMXWorker.h"
 #include "workers/sinks/ZRReportingSessionSummaryJsonFileWorker.h"
 
 #include <array>
@@ -40,12 +42,14 @@ constexpr std::array<WorkerClass, 17> kWorkerClasses{{
     {.name = "ZRReportingSessionJouleryWorker",
      .role = kConsumer,
      .startOnInit = true,
-     .handleSingleMessageSession = true},
+     .handleSingleMessageSession = true,
+     .initWithSession = initWithSession<ZRReportingSessionJouleryWorker>},
     {.name = "ZRReportingSessionMemoryLogWorker", .role = kConsumer, .startOnInit = true},
     {.name = "ZRReportingSessionQMXWorker",
      .role = kConsumer,
      .startOnInit = true,
-     .handleSingleMessageSession = true},
+     .handleSingleMessageSession = true,
+     .initWithSession = initWithSession<ZRReportingSessionQMXWorker>},
     {.name = "ZRReportingSessionDriverSnapshotWorker", .role = kProducer},
     {.name = "ZRReportingSessionSystemMonitorWorker",
      .role = kProducer,

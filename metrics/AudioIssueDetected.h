@@ -1,0 +1,39 @@
+#pragma once
+
+#include "metrics/ProtoMessageBase.h"
+
+#include <cstddef>
+#include <cstdint>
+#include <optional>
+#include <string>
+
+namespace tamblo::qmxmetrics {
+
+/// The metric record of one detected audio issue. `packaging/audio_issue_detected.proto` describes it for
+/// other programs.
+///
+/// Only the timestamp may be absent, which is something else than 0: the other fields are always written,
+/// also when they are empty or 0.
+class AudioIssueDetected final : public ProtoMessageBase {
+public:
+    [[nodiscard]] bool readFrom(ProtoReader& reader) override;
+    void writeTo(ProtoWriter& writer) const override;
+    void formatText(ProtoTextFormatter& formatter, std::string_view name) const override;
+
+    [[nodiscard]] bool operator==(const AudioIssueDetected& other) const noexcept;
+
+    std::string issuetype;
+    std::string node;
+    std::string rtaidclient;
+    std::optional<std::uint64_t> timestamp;
+    std::int32_t duration = 0;
+
+private:
+    void readField(ProtoReader& reader, std::uint64_t field);
+};
+
+void swap(AudioIssueDetected& first, AudioIssueDetected& second) noexcept;
+/// Equal records have equal values.
+[[nodiscard]] std::size_t hash_value(const AudioIssueDetected& record) noexcept;
+
+} // namespace tamblo::qmxmetrics

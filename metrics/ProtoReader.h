@@ -1,0 +1,63 @@
+#pragma once
+
+#include <cstddef>
+#include <cstdint>
+#include <span>
+#include <string_view>
+
+namespace tamblo {
+
+/// Reads the Protocol Buffers wire format from bytes that nobody vouches for: a cursor that never leaves
+/// them, and that stays at its first error.
+///
+///   field    key value
+///   key      varint: field number << 3 | wire type
+///   value    by wire type: 0 varint, 1 eight bytes, 2 varint length and that many bytes,
+///            3 fields up to the key of the same number with wire type 4, 5 four bytes
+///   varint   groups of seven bits, the lowest first; the top bit says that another follows
+class ProtoReader {
+public:
+    explicit ProtoReader(std::span<const std::uint8_t> bytes) noexcept : bytes_(bytes) {}
+    ProtoReader(const ProtoReader&) = delete;
+    ProtoReader& operator=(const ProtoReader&) = delete;
+
+    [[nodiscard]] std::size_t position() const noexcept { return position_; }
+    [[nodiscard]] bool atEnd() const noexcept { return position_ == bytes_.size(); }
+    /// Set for good when the bytes end before what is read does.
+    [[nodiscard]] bool hasError() const noexcept { return hasError_; }
+
+    /// 0 after an error. A varint of more than ten bytes reads as 0, too, which is no error: its first ten
+    /// bytes are then behind the cursor.
+    [[nodiscard]] std::uint64_t readVarint() noexcept;
+    /// A length and that many bytes, in place; none after an error.
+    [[nodiscard]] std::string_view readString() noexcept;
+
+    struct Key {
+        std::uint64_t field = 0;
+        std::uint8_t wireType = 0;
+    };
+    [[nodiscard]] Key readKey() noexcept;
+    /// Steps over the value of the key that was just read. False for one that is cut short, of a wire type
+    /// that does not exist, or a group that is not closed by its own number or holds others too deeply.
+    [[nodiscard]] bool skipValue(const Key& key) noexcept { return skipValue(key, kMaximumDepth); }
+
+    static constexpr std::uint8_t kVarint = 0;
+    static constexpr std::uint8_t kEightBytes = 1;
+    static constexpr std::uint8_t kLengthDelimited = 2;
+    static constexpr std::uint8_t kStartGroup = 3;
+    static constexpr std::uint8_t kEndGroup = 4;
+    static constexpr std::uint8_t kFourBytes = 5;
+    /// Groups within groups; the usual limit of readers of this format.
+    static constexpr int kMaximumDepth = 100;
+
+private:
+    [[nodiscard]] bool skipValue(const Key& key, int depth) noexcept;
+    [[nodiscard]] bool skipGroup(std::uint64_t field, int depth) noexcept;
+    bool skipBytes(std::uint64_t count) noexcept;
+
+    const std::span<const std::uint8_t> bytes_;
+    std::size_t position_ = 0;
+    bool hasError_ = false;
+};
+
+} // namespace tamblo
