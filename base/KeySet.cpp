@@ -9,11 +9,12 @@
 
 namespace tamblo {
 
-/// A key set that was made from another by adding a key. Kept in a list that only grows, so that it is read
-/// without a lock; the key is the added one's.
+/// A key set that was made from another by adding a key, or by removing one. Kept in a list that only grows,
+/// so that it is read without a lock; the index is the key's in the larger of the two.
 struct KeySet::Transition {
     KeySetRef target;
     std::size_t index;
+    bool isRemoval;
     Transition* next;
 };
 
@@ -149,7 +150,7 @@ bool KeySet::operator==(const KeySet& other) const noexcept {
 KeySet::Extension KeySet::adding(std::string_view key) const {
     for (const Transition* transition = transitions_.load(std::memory_order_acquire); transition != nullptr;
          transition = transition->next) {
-        if (transition->target->key(transition->index) == key) {
+        if (!transition->isRemoval && transition->target->key(transition->index) == key) {
             return {transition->target, transition->index};
         }
     }
@@ -162,19 +163,28 @@ KeySet::Extension KeySet::adding(std::string_view key) const {
     const auto index = static_cast<std::size_t>(place - keys.begin());
     keys.insert(place, key);
     Extension extension{make(keys), index};
-
-    if (count_ < kMaximumKeysToRemember && countUpTo(kMaximumTransitionsOfOne, transitionCount_) &&
-        countUpTo(kMaximumTransitionsOfAll, transitionsOfAll())) {
-        auto* transition =
-            new Transition{extension.keys, index, transitions_.load(std::memory_order_relaxed)};
-        while (!transitions_.compare_exchange_weak(transition->next, transition, std::memory_order_release,
-                                                   std::memory_order_relaxed)) {
-        }
-    }
+    remember(extension.keys, index, false);
     return extension;
 }
 
+void KeySet::remember(const KeySetRef& target, std::size_t index, bool isRemoval) const {
+    if (count_ >= kMaximumKeysToRemember || !countUpTo(kMaximumTransitionsOfOne, transitionCount_) ||
+        !countUpTo(kMaximumTransitionsOfAll, transitionsOfAll())) {
+        return;
+    }
+    auto* transition = new Transition{target, index, isRemoval, transitions_.load(std::memory_order_relaxed)};
+    while (!transitions_.compare_exchange_weak(transition->next, transition, std::memory_order_release,
+                                               std::memory_order_relaxed)) {
+    }
+}
+
 KeySetRef KeySet::removing(std::size_t index) const {
+    for (const Transition* transition = transitions_.load(std::memory_order_acquire); transition != nullptr;
+         transition = transition->next) {
+        if (transition->isRemoval && transition->index == index) {
+            return transition->target;
+        }
+    }
     std::vector<std::string_view> keys;
     keys.reserve(count_);
     for (std::size_t i = 0; i < count_; ++i) {
@@ -182,7 +192,9 @@ KeySetRef KeySet::removing(std::size_t index) const {
             keys.push_back(key(i));
         }
     }
-    return make(keys);
+    KeySetRef target = make(keys);
+    remember(target, index, true);
+    return target;
 }
 
 } // namespace tamblo

@@ -68,6 +68,7 @@ public:
     /// The key set with one more key, which it must not hold. The few keys that are added again and again are
     /// remembered, so that this is a look-up.
     [[nodiscard]] Extension adding(std::string_view key) const;
+    /// The key set without the key at an index; remembered likewise.
     [[nodiscard]] KeySetRef removing(std::size_t index) const;
 
 private:
@@ -88,6 +89,7 @@ private:
     KeySet(const KeySet&) = delete;
     KeySet& operator=(const KeySet&) = delete;
 
+    void remember(const KeySetRef& target, std::size_t index, bool isRemoval) const;
     void retain() const noexcept { references_.fetch_add(1, std::memory_order_relaxed); }
     void release() const noexcept;
 

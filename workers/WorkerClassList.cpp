@@ -7,6 +7,7 @@
 #include "workers/sinks/ZRReportingSessionEventryWorker.h"
 #include "workers/sinks/ZRReportingSessionJouleryWorker.h"
 #include "workers/sinks/ZRReportingSessionQMXWorker.h"
+#include "workers/sinks/ZRReportingSessionRtcWorker.h"
 #include "workers/sinks/ZRReportingSessionSummaryJsonFileWorker.h"
 
 #include <array>
@@ -60,7 +61,10 @@ constexpr std::array<WorkerClass, 17> kWorkerClasses{{
      .role = kWorkerOnly,
      .initWithSession = ZRReportingSessionSummaryJsonFileWorker::initWithSession},
     {.name = "ZRReportingSessionAudioRegistrationWorker", .role = kConsumer},
-    {.name = "ZRReportingSessionRtcWorker", .role = kConsumer, .handleSingleMessageSession = true},
+    {.name = "ZRReportingSessionRtcWorker",
+     .role = kConsumer,
+     .handleSingleMessageSession = true,
+     .initWithSession = ZRReportingSessionRtcWorker::initWithSession},
     {.name = "ZRReportingSessionQuilletWorker", .role = kConsumer, .handleSingleMessageSession = true},
 }};
 

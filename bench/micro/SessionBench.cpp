@@ -43,6 +43,8 @@ public:
 
     [[nodiscard]] static std::shared_ptr<ZRReportingSession> startedSession() {
         auto session = ZRReportingSession::initWithID(7, {1});
+        // The service type that the call-quality worker refuses: nobody runs the queue that it would fill.
+        session->setServiceType(AudioServiceTypeTest);
         session->updateConfigurationWithContentsOfConfiguration(sessionConfiguration());
         session->start();
         return session;

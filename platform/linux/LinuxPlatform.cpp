@@ -192,7 +192,11 @@ void LinuxPlatform::run(SerialQueue& requestQueue,
     });
     all.workQueues.setTickEnd([this] { flushSinks(); });
     all.connections.setRequestQueue(requestQueue);
-    all.loop.setBrackets([&all] { all.drain.emplace(); }, [&all] { all.drain.reset(); });
+    all.loop.setBrackets([&all] { all.drain.emplace(); },
+                         [&all] {
+                             all.drain.reset();
+                             all.callQuality.flush();
+                         });
     all.preferenceChanges.watch(all.loop, all.preferences.fileDescriptor());
     all.notificationChanges.watch(all.loop, all.namedNotifications.fileDescriptor());
     all.signals.watch(all.loop, [&all, &shutDown] {

@@ -19,6 +19,7 @@ FakePlatform::FakePlatform(LogLevel threshold, bool isInternalBuild) {
 
 FakePlatform::~FakePlatform() {
     resetReportingServerQueue();
+    workQueues.workOff();
 }
 
 FakeSerialQueue& FakePlatform::serverQueue() {

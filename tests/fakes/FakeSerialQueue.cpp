@@ -1,16 +1,14 @@
 #include "tests/fakes/FakeSerialQueue.h"
 
-#include <utility>
-
 namespace tamblo {
 
-void FakeSerialQueue::post(Work work, Pace pace) {
+void FakeStrand::post(Work work, Pace pace) {
     const std::lock_guard held(mutex_);
     pieces_.push_back(std::move(work));
     paces_.push_back(pace);
 }
 
-bool FakeSerialQueue::runOne() {
+bool FakeStrand::runOne() {
     Work piece;
     {
         const std::lock_guard held(mutex_);
@@ -20,11 +18,17 @@ bool FakeSerialQueue::runOne() {
         piece = std::move(pieces_.front());
         pieces_.pop_front();
     }
+    const bool wasRunning = std::exchange(isRunning_, true);
     piece();
+    piece.reset();
+    isRunning_ = wasRunning;
     return true;
 }
 
-std::size_t FakeSerialQueue::runAll() {
+std::size_t FakeStrand::runAll() {
+    if (isRunning_) {
+        return 0;
+    }
     std::size_t count = 0;
     while (runOne()) {
         ++count;
@@ -35,7 +39,7 @@ std::size_t FakeSerialQueue::runAll() {
     return count;
 }
 
-std::vector<Pace> FakeSerialQueue::takePaces() {
+std::vector<Pace> FakeStrand::takePaces() {
     const std::lock_guard held(mutex_);
     return std::exchange(paces_, {});
 }

@@ -2,37 +2,58 @@
 
 #include "platform/WorkQueue.h"
 
+#include <cstddef>
 #include <deque>
+#include <memory>
 #include <mutex>
 #include <string>
 #include <string_view>
+#include <utility>
 #include <vector>
 
 namespace tamblo {
 
-/// Keeps what is posted until a test runs it, on the test's thread.
-class FakeSerialQueue final : public SerialQueue {
+/// What is posted to a fake queue, until a test runs it on the test's thread. Outlives the queue for as long
+/// as somebody runs it.
+class FakeStrand {
 public:
-    explicit FakeSerialQueue(std::string_view label) : label_(label) {}
-    ~FakeSerialQueue() override { runAll(); }
-
-    void post(Work work, Pace pace) override;
-    void setBatchEnd(Work batchEnd) override { batchEnd_ = std::move(batchEnd); }
-    [[nodiscard]] std::string_view label() const noexcept override { return label_; }
-
-    /// Runs what is posted, and what that posts, then the batch's end; the number of pieces.
+    void post(Work work, Pace pace);
+    void setBatchEnd(Work batchEnd) { batchEnd_ = std::move(batchEnd); }
+    /// Runs what is posted, and what that posts, then the batch's end; the number of pieces. Does nothing
+    /// inside a piece of its own.
     std::size_t runAll();
     /// Runs one piece, without the batch's end; false when there is none.
     bool runOne();
-    /// The pace of each piece that was posted since the last call.
     [[nodiscard]] std::vector<Pace> takePaces();
 
 private:
-    const std::string label_;
     Work batchEnd_;
+    bool isRunning_ = false;
     std::mutex mutex_;
     std::deque<Work> pieces_;
     std::vector<Pace> paces_;
+};
+
+/// Keeps what is posted until a test runs it, or it is destroyed.
+class FakeSerialQueue final : public SerialQueue {
+public:
+    explicit FakeSerialQueue(std::string_view label,
+                             std::shared_ptr<FakeStrand> strand = std::make_shared<FakeStrand>())
+        : label_(label), strand_(std::move(strand)) {}
+    ~FakeSerialQueue() override { strand_->runAll(); }
+
+    void post(Work work, Pace pace) override { strand_->post(std::move(work), pace); }
+    void setBatchEnd(Work batchEnd) override { strand_->setBatchEnd(std::move(batchEnd)); }
+    [[nodiscard]] std::string_view label() const noexcept override { return label_; }
+
+    std::size_t runAll() { return strand_->runAll(); }
+    bool runOne() { return strand_->runOne(); }
+    /// The pace of each piece that was posted since the last call.
+    [[nodiscard]] std::vector<Pace> takePaces() { return strand_->takePaces(); }
+
+private:
+    const std::string label_;
+    const std::shared_ptr<FakeStrand> strand_;
 };
 
 } // namespace tamblo

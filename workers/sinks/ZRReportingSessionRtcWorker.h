@@ -1,0 +1,47 @@
+#pragma once
+
+#include "session/ZRReportingSessionWorkerProtocol.h"
+#include "util/AudioEvents.h"
+#include "workers/sinks/LinkmeterAgent.h"
+
+#include <cstdint>
+#include <memory>
+#include <optional>
+
+namespace tamblo {
+
+/// Hands the messages of a started session to the call-quality service, in a session of that service's own,
+/// and at the stop one summary of every key that they held.
+///
+/// Here is only taken what the work needs; it is done on a queue of the worker's own, which its agent keeps
+/// and on which setting up may take seconds. A session started again sets up anew.
+class ZRReportingSessionRtcWorker final : public ZRReportingSessionWorkerConsumerProtocol {
+public:
+    /// None for a session of the service type "test".
+    [[nodiscard]] static std::shared_ptr<ZRReportingSessionWorkerProtocol>
+    initWithSession(const std::shared_ptr<ZRReportingSession>& session);
+    using ZRReportingSessionWorkerConsumerProtocol::ZRReportingSessionWorkerConsumerProtocol;
+
+    /// The category's kind.
+    [[nodiscard]] static constexpr std::uint16_t
+    retrieveLinkmeterCategoryFromCategory(AudioEventCategory category) noexcept {
+        return static_cast<std::uint16_t>(category);
+    }
+    [[nodiscard]] static constexpr bool
+    shouldBatchLinkmeterEventsForServiceType(AudioServiceType serviceType) noexcept {
+        return serviceType != AudioServiceTypeAPIUsage;
+    }
+    /// Whether the service has a session with back ends. Any thread.
+    [[nodiscard]] bool getLinkmeterStartedState() const noexcept {
+        return agent_->getLinkmeterStartedState();
+    }
+
+    std::optional<bool> start() override;
+    void handleMessage(const MessageRef& message) override;
+    void stop() override;
+
+private:
+    const std::shared_ptr<LinkmeterAgent> agent_ = std::make_shared<LinkmeterAgent>();
+};
+
+} // namespace tamblo
