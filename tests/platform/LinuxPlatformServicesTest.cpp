@@ -224,6 +224,7 @@ public:
     [[nodiscard]] WallTime now() const noexcept override {
         return WallTime(std::chrono::milliseconds(250 * ++reads_));
     }
+    [[nodiscard]] std::chrono::seconds utcOffset(WallTime) const override { return {}; }
 
 private:
     mutable int reads_ = 0;
