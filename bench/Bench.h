@@ -48,6 +48,7 @@ void ingestPipelined(Bench& bench);
 void ingestOneEvent(Bench& bench);
 void ingestUnwanted(Bench& bench);
 void ingestRepeated(Bench& bench);
+void ingestAllSinks(Bench& bench);
 void paced(Bench& bench);
 void roundTrip(Bench& bench);
 void retained(Bench& bench);
@@ -55,6 +56,7 @@ void manyClients(Bench& bench);
 void manySessions(Bench& bench);
 void stop100k(Bench& bench);
 void stopMany(Bench& bench);
+void summaryJson100k(Bench& bench);
 void idle(Bench& bench);
 void startUp(Bench& bench);
 

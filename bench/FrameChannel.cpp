@@ -100,11 +100,11 @@ wire::Request reporterRequest(wire::Method method, std::int64_t reporterID) {
     return request;
 }
 
-void FrameChannel::createSession(std::int64_t reporterID) {
+void FrameChannel::createSession(std::int64_t reporterID, client::ServiceType serviceType) {
     wire::Request create = reporterRequest(wire::Method::createReportingSession, reporterID);
     queue(create);
     wire::Request type = reporterRequest(wire::Method::setServiceType, reporterID);
-    type.serviceType = static_cast<std::uint16_t>(client::ServiceType::nonLongFormAudio);
+    type.serviceType = static_cast<std::uint16_t>(serviceType);
     queue(type);
     wire::Request configuration = reporterRequest(wire::Method::setConfiguration, reporterID);
     configuration.dictionary = sessionConfiguration();

@@ -1,6 +1,7 @@
 #pragma once
 
 #include "base/TextBuffer.h"
+#include "client/Vocabulary.h"
 #include "platform/linux/FileDescriptor.h"
 #include "wire/Reply.h"
 #include "wire/Request.h"
@@ -33,7 +34,8 @@ public:
     [[nodiscard]] std::size_t outstanding() const noexcept { return outstanding_; }
 
     /// Makes sessions with a service type and a configuration.
-    void createSession(std::int64_t reporterID);
+    void createSession(std::int64_t reporterID,
+                       client::ServiceType serviceType = client::ServiceType::nonLongFormAudio);
     /// Without asking for the reply, which is held until the stop.
     void startSession(std::int64_t reporterID);
     void stopSession(std::int64_t reporterID);

@@ -26,6 +26,40 @@ double epoch() {
     return seconds;
 }
 
+/// By turns the engine's start, and its end with how long it was on.
+Message makeHapticsMessage(std::uint64_t number) {
+    const bool isStart = number / kHapticsEvery % 2 == 0;
+    Message message{
+        Dictionary{
+            {"EngineState", isStart ? "EngineOn" : "EngineOff"},
+            {"engine_identifier", "actuator-main"},
+            {"message_counter", static_cast<std::int64_t>(number)},
+            {"zrreporting_timestamp", epoch() + static_cast<double>(number) * 0.000731},
+        },
+        client::category(EventKind::output),
+        EventType::joulery,
+    };
+    if (!isStart) {
+        message.payload.set("EngineOnTime", 0.25 + static_cast<double>(number % 1009) * 0.001);
+    }
+    return message;
+}
+
+Message makeIssueMessage(std::uint64_t number) {
+    return {
+        Dictionary{
+            {"issue_type", "silence"},
+            {"node", "spatial-mixer-output-1"},
+            {"rtaid_client", "com.vandra.melody.player"},
+            {"any_channel_silence_seconds", static_cast<std::int64_t>(number % 90)},
+            {"message_counter", static_cast<std::int64_t>(number)},
+            {"zrreporting_timestamp", epoch() + static_cast<double>(number) * 0.000731},
+        },
+        client::category(Subsystem::dsp, EventKind::error),
+        EventType::issueDetector,
+    };
+}
+
 } // namespace
 
 Message makeMessage(std::uint64_t number, Variety variety) {
@@ -57,6 +91,18 @@ std::vector<Message> makeMessages(std::size_t count, Variety variety) {
     messages.reserve(count);
     for (std::size_t i = 0; i < count; ++i) {
         messages.push_back(makeMessage(i, variety));
+    }
+    return messages;
+}
+
+std::vector<Message> makeMixedMessages(std::size_t count) {
+    std::vector<Message> messages = makeMessages(count, Variety::distinct);
+    for (std::size_t i = 0; i < count; ++i) {
+        if (i % kIssueEvery == 7) {
+            messages[i] = makeIssueMessage(i);
+        } else if (i % kHapticsEvery == 3) {
+            messages[i] = makeHapticsMessage(i);
+        }
     }
     return messages;
 }

@@ -30,6 +30,12 @@ enum class Variety {
 /// message is compared with the one before it only, they stay as distinct as they are.
 [[nodiscard]] std::vector<Message> makeMessages(std::size_t count, Variety variety);
 
+/// One message in ten is of the haptic engine's use and one in fifty of an issue that was detected, so that
+/// every sink has its part; the others are those of `makeMessages`.
+inline constexpr std::size_t kHapticsEvery = 10;
+inline constexpr std::size_t kIssueEvery = 50;
+[[nodiscard]] std::vector<Message> makeMixedMessages(std::size_t count);
+
 /// What a player configures its session with.
 [[nodiscard]] Dictionary sessionConfiguration();
 

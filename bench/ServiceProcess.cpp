@@ -164,14 +164,17 @@ void ServiceProcess::stop() {
     }
 }
 
-std::size_t ServiceProcess::countEvents(std::string_view name) const {
-    std::ifstream file(directory_.path() + "/logs/analytics-events.jsonl", std::ios::binary);
-    const std::string field = "\"event\":\"" + std::string(name) + "\"";
+std::size_t ServiceProcess::countLines(std::string_view file, std::string_view text) const {
+    std::ifstream lines(logsDirectory() + "/" + std::string(file), std::ios::binary);
     std::size_t count = 0;
-    for (std::string line; std::getline(file, line);) {
-        count += line.find(field) != std::string::npos ? 1 : 0;
+    for (std::string line; std::getline(lines, line);) {
+        count += line.find(text) != std::string::npos ? 1 : 0;
     }
     return count;
+}
+
+std::size_t ServiceProcess::countEvents(std::string_view name) const {
+    return countLines("analytics-events.jsonl", "\"event\":\"" + std::string(name) + "\"");
 }
 
 std::string ServiceProcess::logTail() const {

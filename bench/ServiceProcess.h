@@ -33,6 +33,10 @@ public:
     [[nodiscard]] const std::string& socketPath() const noexcept { return socketPath_; }
     /// What it writes to standard error.
     [[nodiscard]] std::string logPath() const { return directory_.path() + "/log"; }
+    /// Where its sinks' files are.
+    [[nodiscard]] std::string logsDirectory() const { return directory_.path() + "/logs"; }
+    /// How many lines of a sink's file hold the text, as far as the file at hand goes back.
+    [[nodiscard]] std::size_t countLines(std::string_view file, std::string_view text) const;
     /// How many analytics events of this name it has written, as far as the file at hand goes back.
     [[nodiscard]] std::size_t countEvents(std::string_view name) const;
     /// From just before the fork until the service had said that it is ready.

@@ -26,6 +26,8 @@ constexpr std::array kScenarios{
     Scenario{"ingest_one_event", "the same with only the general event in use", ingestOneEvent},
     Scenario{"ingest_unwanted", "the same with no event in use", ingestUnwanted},
     Scenario{"ingest_repeated", "nine of ten messages redundant", ingestRepeated},
+    Scenario{"ingest_all_sinks", "haptics use and issues among the messages, call quality on",
+             ingestAllSinks},
     Scenario{"paced", "1,000 messages a second, evenly", paced},
     Scenario{"round_trip", "one message outstanding", roundTrip},
     Scenario{"retained", "the cost of a message with 1,000,000 retained", retained},
@@ -33,6 +35,7 @@ constexpr std::array kScenarios{
     Scenario{"many_sessions", "10,000 started sessions", manySessions},
     Scenario{"stop_100k", "the stop of a session with 100,000 messages retained", stop100k},
     Scenario{"stop_many", "another client's round trips while 10,000 sessions are stopped", stopMany},
+    Scenario{"summary_json_100k", "the summary file of a session with 100,000 messages", summaryJson100k},
     Scenario{"idle", "nothing connected", idle},
     Scenario{"start_up", "from exec to the first accepted connection", startUp},
 };
@@ -49,7 +52,7 @@ int usage() {
                "targets; 1 when one could not run; 2 for a wrong command line.\n\n",
                stderr);
     for (const Scenario& scenario : kScenarios) {
-        std::fprintf(stderr, "  %-18s%s\n", scenario.name.data(), scenario.what.data());
+        std::fprintf(stderr, "  %-19s%s\n", scenario.name.data(), scenario.what.data());
     }
     return 2;
 }

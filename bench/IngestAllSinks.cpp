@@ -1,0 +1,125 @@
+#include "Bench.h"
+#include "IngestDriver.h"
+#include "Meter.h"
+
+#include <stdexcept>
+#include <string>
+#include <thread>
+#include <vector>
+
+namespace tamblo::bench {
+
+namespace {
+
+constexpr std::size_t kInFlight = 64;
+/// As many as leave the sinks' files unrotated when they are counted; divides into rounds of the messages.
+constexpr std::size_t kCounted = 20'000;
+constexpr std::size_t kPerSession = 50'000;
+constexpr std::size_t kSessionsPerRepetition = 4;
+constexpr std::size_t kDistinct = 1000;
+
+/// What a service has written, in lines.
+struct Lines {
+    std::size_t events = 0;
+    std::size_t power = 0;
+    std::size_t metrics = 0;
+    std::size_t callQuality = 0; ///< messages, the session's summary among them
+
+    [[nodiscard]] static Lines of(const ServiceProcess& service) {
+        return {.events = service.countLines("analytics-events.jsonl", "\"payload\""),
+                .power = service.countLines("power-events.jsonl", "Korvell_Haptics_"),
+                .metrics = service.countLines("diagnostics-metrics.jsonl", "\"metric\":5963779,"),
+                .callQuality = service.countLines("call-quality.jsonl", "\"op\":\"message\"")};
+    }
+    /// At least; what the session derives comes on top, under two names for events.
+    [[nodiscard]] static Lines expectedOf(std::size_t messages) {
+        const std::size_t haptics = messages / kHapticsEvery;
+        return {.events = 2 * messages,
+                .power = haptics + haptics / 2,
+                .metrics = messages / kIssueEvery,
+                .callQuality = messages + 1};
+    }
+};
+
+/// Until the service has worked off what its queues hold: an idle one uses no processor time at all.
+void awaitIdle(const ServiceProcess& service) {
+    constexpr std::chrono::milliseconds kStillness{100};
+    constexpr int kMost = 600;
+    std::chrono::nanoseconds before{-1};
+    for (int i = 0; i < kMost; ++i) {
+        const std::chrono::nanoseconds now = cpuTimeOf(service.pid());
+        if (now == before) {
+            return;
+        }
+        before = now;
+        std::this_thread::sleep_for(kStillness);
+    }
+    throw std::runtime_error("the service does not come to rest");
+}
+
+struct Figures {
+    std::vector<double> rate, service, client;
+    std::size_t resident = 0;
+};
+
+Figures drive(const ServiceProcess& service, IngestDriver& driver, std::size_t repetitions) {
+    constexpr auto kMessages = static_cast<double>(kPerSession * kSessionsPerRepetition);
+    Figures figures;
+    for (std::size_t repetition = 0; repetition < repetitions; ++repetition) {
+        const Meter meter(service.pid());
+        for (std::size_t i = 0; i < kSessionsPerRepetition; ++i) {
+            driver.start();
+            driver.send(kPerSession);
+            driver.stop();
+        }
+        figures.rate.push_back(kMessages / secondsOf(meter.wall()));
+        figures.client.push_back(microseconds(meter.client()) / kMessages);
+        awaitIdle(service);
+        figures.service.push_back(microseconds(meter.service()) / kMessages);
+    }
+    figures.resident = peakResidentBytesOf(service.pid());
+    return figures;
+}
+
+void measure(Bench& bench, Placement placement) {
+    const ServiceProcess service(bench.place(placement));
+    const std::vector<Message> messages = makeMixedMessages(kDistinct);
+    IngestDriver driver(service.socketPath(), messages, kInFlight);
+    driver.start();
+    driver.send(kCounted);
+    driver.stop();
+    awaitIdle(service);
+    const Lines written = Lines::of(service);
+    const Lines expected = Lines::expectedOf(kCounted);
+    const Figures figures = drive(service, driver, bench.repetitions(5));
+
+    ResultRow row("ingest_all_sinks");
+    row.set("messages_per_s", median(figures.rate));
+    row.set("service_cpu_us_per_message", median(figures.service));
+    row.set("client_cpu_us_per_message", median(figures.client));
+    row.set("service_cpu_us_least", quantile(figures.service, 0));
+    row.set("peak_rss_mib", mebibytes(figures.resident));
+    row.set("lines_of_messages", std::uint64_t{kCounted});
+    row.set("event_lines", std::uint64_t{written.events});
+    row.set("power_lines", std::uint64_t{written.power});
+    row.set("metric_lines", std::uint64_t{written.metrics});
+    row.set("call_quality_lines", std::uint64_t{written.callQuality});
+    row.set("counted", "all, until every queue is worked off; a stop and a start every 50000 messages");
+    row.set("placement", describe(placement));
+    row.atMost("service_cpu_us_per_message", 4.0);
+    row.require("the lines of every message in every sink",
+                written.events >= expected.events && written.power == expected.power &&
+                    written.metrics == expected.metrics && written.callQuality >= expected.callQuality);
+    bench.print(row);
+}
+
+} // namespace
+
+/// What a message costs when all of its sinks want it, the call-quality service's queue included.
+void ingestAllSinks(Bench& bench) {
+    for (const Placement placement : {Placement::free, Placement::twoCores, Placement::oneCore}) {
+        measure(bench, placement);
+    }
+}
+
+} // namespace tamblo::bench
