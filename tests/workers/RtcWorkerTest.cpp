@@ -1,0 +1,518 @@
+#include "base/Format.h"
+#include "base/Json.h"
+#include "platform/linux/LinuxCallQualityService.h"
+#include "platform/linux/LinuxWorkQueues.h"
+#include "session/ZRReportingSession.h"
+#include "tests/fakes/FakePlatform.h"
+#include "tests/platform/LinuxServiceSupport.h"
+#include "util/LogText.h"
+#include "workers/sinks/LinkmeterSummary.h"
+#include "workers/sinks/ZRReportingSessionRtcWorker.h"
+
+#include <gmock/gmock.h>
+#include <nlohmann/json.hpp>
+
+#include <atomic>
+#include <chrono>
+#include <cmath>
+#include <filesystem>
+#include <functional>
+#include <iterator>
+#include <map>
+#include <optional>
+#include <sstream>
+#include <string>
+#include <thread>
+#include <vector>
+
+namespace tamblo {
+namespace {
+
+using testing::ElementsAre;
+using testing::IsEmpty;
+using namespace std::chrono_literals;
+
+constexpr const char* kQueue = "com.vandra.tamblo.session.linkmeter";
+const std::optional<std::vector<std::string>> kFound{{"one", "two"}};
+
+/// Sessions of a device whose call-quality service answers, and whose worker's queue runs, when a test says
+/// so.
+class RtcWorkerTest : public testing::Test {
+protected:
+    explicit RtcWorkerTest(bool isInternalBuild = false) : device(LogLevel::debug, isInternalBuild) {}
+
+    std::shared_ptr<ZRReportingSession> makeSession(AudioServiceType type, Dictionary configuration = {}) {
+        auto made = ZRReportingSession::initWithID(77, {1});
+        made->setServiceType(type);
+        made->updateConfigurationWithContentsOfConfiguration(configuration);
+        return made;
+    }
+    void send(Dictionary payload, std::vector<const WorkerClass*> destinations = {}) {
+        auto message = std::make_shared<ZRReportingSessionMessage>(std::move(payload), 0x08000004, 1);
+        message->setDestinationWorkers(std::move(destinations));
+        session->sendMessage(message);
+    }
+    void run() { device.workQueues.run(kQueue); }
+    /// The values of the key in the messages that a Linkmeter session was given: the summary's in brackets,
+    /// an "s" for the session's own summary, which its stop sends.
+    std::string sent(std::size_t number = 0, std::string_view key = "n") {
+        std::string text;
+        for (const auto& message : device.callQuality.sessions.at(number)->messages) {
+            std::string value;
+            const Value* found = message.payload.find(key);
+            appendText(value, found != nullptr ? *found : Value("-"));
+            const bool isSummary = message.category == 0xFFFF && message.type == 0xFFFF;
+            text += message.type == AudioEventTypeSummary ? "s" : isSummary ? "[" + value + "]" : value;
+        }
+        return text;
+    }
+    /// What the worker has logged since the last call, debug lines aside.
+    std::vector<std::string> logged() {
+        std::vector<std::string> texts;
+        for (const FakeLog::Line& line : device.log.lines()) {
+            if (line.category == "zrri" && line.level != LogLevel::debug) {
+                texts.push_back(line.text);
+            }
+        }
+        device.log.clear();
+        return texts;
+    }
+    /// Linkmeter sessions that somebody besides the fake holds.
+    [[nodiscard]] long held() const {
+        long count = 0;
+        for (const auto& made : device.callQuality.sessions) {
+            count += made.use_count() - 1;
+        }
+        return count;
+    }
+
+    FakePlatform device;
+    std::shared_ptr<ZRReportingSession> session = makeSession(AudioServiceTypeTelephony);
+};
+
+class RtcWorkerOnInternalBuildTest : public RtcWorkerTest {
+protected:
+    RtcWorkerOnInternalBuildTest() : RtcWorkerTest(true) {}
+};
+
+TEST_F(RtcWorkerTest, DescribesTheSessionToTheService) {
+    const struct {
+        AudioServiceType type;
+        bool isSingle;
+        Dictionary configuration;
+        std::string serviceName;
+        bool batches;
+    } cases[] = {
+        {AudioServiceTypeTelephony, false, {}, "telephony_session", true},
+        {AudioServiceTypeStandalone, true, {{"HostApplicationDisplayID", "Unknown"}}, "standalone", true},
+        {AudioServiceTypeAPIUsage, false, {{"QVHostApplicationDisplayID", "app"}}, "apiusage_session", false},
+        {AudioServiceTypeUnknown, false, {{"ClientName", "other"}, {"x", 1}}, "unknown_session", true},
+    };
+    for (const auto& c : cases) {
+        const auto described = makeSession(c.type, c.configuration);
+        described->setIsSingleMessageSession(c.isSingle);
+        described->start();
+        run();
+        const auto& made = *device.callQuality.sessions.back();
+        Dictionary info{{"ClientType", 19},          {"ClientVersion", 2.1F},
+                        {"SessionID", 77},           {"BatchEvent", c.batches},
+                        {"HierarchyToken", "token"}, {"ContainsRealtimeEvents", !c.batches}};
+        if (const Value* name = described->configuration().find("HostApplicationDisplayID")) {
+            info.set("ClientBundleID", *name);
+        }
+        EXPECT_EQ(jsonText(made.sessionInfo), jsonText(info));
+        Dictionary user{{"ClientName", "com.vandra.tamblo"},
+                        {"ZRReportingSessionID", 77},
+                        {"ServiceName", c.serviceName}};
+        user.merge(described->configuration());
+        EXPECT_EQ(jsonText(made.userInfo), jsonText(user));
+    }
+    const std::size_t queues = device.workQueues.made(kQueue);
+    makeSession(AudioServiceTypeTest)->start();
+    EXPECT_EQ(device.workQueues.made(kQueue), queues) << "the service type \"test\" has no worker";
+    EXPECT_EQ(ZRReportingSessionRtcWorker::initWithSession(makeSession(AudioServiceTypeTest)), nullptr);
+    session->setServiceType(AudioServiceTypeTest);
+    EXPECT_EQ(ZRReportingSessionRtcWorker(session).start(), false);
+}
+
+TEST_F(RtcWorkerTest, WhatIsHandedInWhileItSetsUpFollowsInOrderWhateverComesOfIt) {
+    const std::string never = "Session never started. handleMessage";
+    const std::string neverStopped = "Session never started. stop";
+    const struct {
+        const char* what;
+        std::function<void()> outcome;
+        std::vector<std::string> log;
+        bool isStarted;
+        std::string sent;
+        int flushes;
+    } cases[] = {
+        {"found",
+         [this] { device.callQuality.findBackends(kFound); },
+         {R"(list of backends ["one","two"])", "continuing with backends!",
+          "sending rtc summary event. reporterID=77"},
+         true,
+         "12s[1,2]",
+         1},
+        {"found within nine seconds",
+         [this] {
+             device.workQueues.elapse(8'999ms);
+             EXPECT_EQ(device.workQueues.run(kQueue), 0U);
+             device.callQuality.findBackends(kFound);
+             device.workQueues.elapse(1ms);
+         },
+         {R"(list of backends ["one","two"])", "continuing with backends!",
+          "sending rtc summary event. reporterID=77"},
+         true,
+         "12s[1,2]",
+         1},
+        {"not found",
+         [this] { device.callQuality.findBackends(std::nullopt); },
+         {"no backends found, this session won't get sent to the server", "failed to find backend", never,
+          never, never, neverStopped},
+         false,
+         "",
+         0},
+        {"timed out",
+         [this] { device.workQueues.elapse(9s); },
+         {"timed out waiting for backends", never, never, never, neverStopped},
+         false,
+         "",
+         0},
+        {"found too late, before what waited runs",
+         [this] {
+             device.workQueues.elapse(9s);
+             device.callQuality.findBackends(kFound);
+         },
+         {R"(list of backends ["one","two"])", "timed out waiting for backends",
+          "sending rtc summary event. reporterID=77"},
+         true,
+         "",
+         0},
+    };
+    for (const auto& c : cases) {
+        SCOPED_TRACE(c.what);
+        session = makeSession(AudioServiceTypeTelephony);
+        session->start();
+        EXPECT_EQ(logged(), std::vector<std::string>());
+        send({{"n", 1}});
+        run();
+        send({{"n", 2}});
+        run();
+        EXPECT_THAT(logged(), ElementsAre("waiting to find backends"));
+        EXPECT_EQ(sent(device.callQuality.sessions.size() - 1), "");
+        session->stop();
+        run();
+        c.outcome();
+        run();
+        EXPECT_EQ(logged(), c.log);
+        EXPECT_EQ(sent(device.callQuality.sessions.size() - 1), c.sent);
+        EXPECT_EQ(device.callQuality.sessions.back()->flushes, c.flushes);
+        EXPECT_EQ(device.workQueues.delayedCalls(), 0U);
+        device.callQuality.completions.clear();
+    }
+}
+
+TEST_F(RtcWorkerTest, SendsAtOnceOnceStartedAndSetsUpAnewForTheNextRun) {
+    session->start();
+    run();
+    device.callQuality.findBackends(kFound);
+    run();
+    (void)logged();
+    const int commits = device.callQuality.commits;
+    send({{"n", 1}});
+    EXPECT_EQ(sent(), "");
+    run();
+    EXPECT_EQ(sent(), "1");
+    EXPECT_EQ(device.callQuality.commits, commits + 1);
+    EXPECT_THAT(device.log.texts("LinkmeterAgent"),
+                ElementsAre(R"(LinkmeterAgent fake session : message {"HostApplicationDisplayID":"Unknown",)"
+                            R"("audiotag":"Session_PlaybackStart","invalid_timestamp":"nil","n":1} : )"
+                            R"(category 134217732 : type 1)"));
+    EXPECT_EQ(device.callQuality.sessions[0]->messages[0].category, 4) << "the kind";
+    device.callQuality.sendFailure = "no room";
+    send({{"n", 2}});
+    run();
+    EXPECT_THAT(logged(), ElementsAre("error sending message no room"));
+    device.callQuality.sendFailure.reset();
+
+    // Stop, and all of the next run, before the queue gets to any of it.
+    session->stop();
+    send({{"n", 3}});
+    session->start();
+    send({{"n", 4}});
+    session->stop();
+    run();
+    EXPECT_EQ(sent(), "1s[1,2]");
+    EXPECT_EQ(sent(1), "");
+    device.callQuality.findBackends(kFound);
+    run();
+    EXPECT_EQ(sent(1), "4s[4]");
+    EXPECT_EQ(device.callQuality.sessions[0]->flushes + device.callQuality.sessions[1]->flushes, 2);
+    EXPECT_EQ(held(), 0);
+    EXPECT_EQ(device.workQueues.made(kQueue), 1U);
+}
+
+TEST_F(RtcWorkerTest, WithoutATokenNothingIsOpened) {
+    device.callQuality.token.reset();
+    session->start();
+    send({{"n", 1}});
+    session->stop();
+    run();
+    EXPECT_THAT(
+        logged(),
+        ElementsAre("newHierarchyTokenFromParentToken returned nil. Will skip rtc for this session. start",
+                    "Session never started. handleMessage", "Session never started. handleMessage",
+                    "Session never started. stop"));
+    EXPECT_THAT(device.callQuality.sessions, IsEmpty());
+}
+
+TEST_F(RtcWorkerTest, BackendsFoundTooLateTurnTheWorkerOnAndEndTheNextRunsWait) {
+    session->start();
+    run();
+    device.workQueues.elapse(9s);
+    run();
+    EXPECT_EQ(held(), 0) << "the session is let go";
+    device.callQuality.findBackends(kFound);
+    send({{"n", 1}});
+    run();
+    EXPECT_EQ(sent(), "");
+    EXPECT_THAT(logged(), ElementsAre("waiting to find backends", "timed out waiting for backends",
+                                      R"(list of backends ["one","two"])"));
+    session->stop();
+    session->start();
+    send({{"n", 2}});
+    run();
+    EXPECT_THAT(logged(), ElementsAre("sending rtc summary event. reporterID=77", "waiting to find backends",
+                                      "failed to find backend", "Session never started. handleMessage"));
+    EXPECT_EQ(device.workQueues.delayedCalls(), 0U);
+    device.callQuality.findBackends(kFound);
+    send({{"n", 3}});
+    run();
+    EXPECT_EQ(sent(1), "3") << "the second run's own back ends";
+}
+
+TEST_F(RtcWorkerTest, ADroppedSessionLeavesNothingBehindWhileItsWorkerWaits) {
+    session->start();
+    run();
+    send({{"n", 1}});
+    EXPECT_EQ(device.workQueues.delayedCalls(), 1U);
+    (void)logged();
+    session.reset();
+    run();
+    EXPECT_EQ(device.workQueues.delayedCalls(), 0U);
+    EXPECT_EQ(held(), 0);
+    device.callQuality.findBackends(kFound);
+    run();
+    EXPECT_EQ(sent(), "");
+    EXPECT_THAT(logged(), IsEmpty());
+}
+
+TEST_F(RtcWorkerTest, AStoppedSessionIsReportedInFullAfterItWasDropped) {
+    const struct {
+        bool waitsBefore;
+        bool isFound;
+    } cases[] = {{true, true}, {false, true}, {true, false}, {false, false}};
+    for (const auto& c : cases) {
+        session = makeSession(AudioServiceTypeTelephony);
+        session->start();
+        if (c.waitsBefore) {
+            run();
+        }
+        send({{"n", 1}});
+        session->stop();
+        session.reset();
+        run();
+        const std::size_t number = device.callQuality.sessions.size() - 1;
+        EXPECT_EQ(sent(number), "");
+        if (c.isFound) {
+            device.callQuality.findBackends(kFound);
+        } else {
+            device.workQueues.elapse(9s);
+            device.callQuality.findBackends(kFound);
+        }
+        run();
+        EXPECT_EQ(sent(number), c.isFound ? "1s[1]" : "");
+        EXPECT_EQ(held(), 0);
+        EXPECT_EQ(device.workQueues.delayedCalls(), 0U);
+    }
+}
+
+TEST_F(RtcWorkerTest, TheSummaryJoinsWhatWasSentOnceWhileStarted) {
+    send({{"early", true}, {"n", 0}});
+    session->start();
+    run();
+    device.callQuality.findBackends(kFound);
+    send({{"volume", 3}, {"n", 1}});
+    send({{"volume", 3}, {"n", 1}});
+    send({{"volume", 5}, {"n", 2}}, {workerClassNamed("ZRReportingSessionEventryWorker")});
+    session->stop();
+    run();
+    EXPECT_EQ(sent(), "1s[1,2]") << "the destinations count for the sending alone";
+    const auto& summary = device.callQuality.sessions[0]->messages.back();
+    Dictionary own;
+    for (const char* key :
+         {"HostApplicationDisplayID", "ZR_Session_Summary_Event", "audiotag", "n", "volume"}) {
+        own.set(key, *summary.payload.find(key));
+    }
+    EXPECT_EQ(jsonText(own),
+              R"({"HostApplicationDisplayID":"Unknown,Unknown,Unknown","ZR_Session_Summary_Event":"2",)"
+              R"("audiotag":"Session_PlaybackStart,Session_PlaybackStart,Session_GenericSummary",)"
+              R"("n":"1,2","volume":"3,5"})");
+    EXPECT_FALSE(summary.payload.contains("early"));
+    EXPECT_THAT(device.log.texts("sending rtc summary event. reporterID=77 volume"),
+                ElementsAre(R"(sending rtc summary event. reporterID=77 volume="3,5")"));
+    session.reset();
+    EXPECT_EQ(held(), 0);
+}
+
+TEST_F(RtcWorkerOnInternalBuildTest, TimestampsAreKept) {
+    session->start();
+    run();
+    device.callQuality.findBackends(kFound);
+    send({{"zrreporting_timestamp", 4e9}});
+    session->stop();
+    run();
+    EXPECT_EQ(sent(0, "zrreporting_timestamp"), "4000000000.0s[4000000000.0,1772366400.0]");
+}
+
+MessageRef record(Dictionary payload) {
+    auto made = std::make_shared<ZRReportingSessionMessage>(std::move(payload), 4, 1);
+    made->isSessionStarted = true;
+    return made;
+}
+
+TEST(LinkmeterSummaryTest, ValuesAreTextsInTheOrderOfTheMessages) {
+    const std::vector<MessageRef> messages{
+        record({{"a", ""}, {"b", true}, {"c", Array{1, "x"}}}),
+        record({}),
+        record({{"a", "x"}, {"b", 0.5F}, {"ZR_Session_Summary_Event", "mine"}}),
+        record({{"a", "y,z"}, {"b", std::nan("")}, {"d", Value::date(0)}}),
+        record({{"a", Dictionary{{"k", 1}}}, {"b", ~0ULL}, {"c", Value::data({})}}),
+    };
+    EXPECT_EQ(linkmeterSummary(messages, AudioServiceTypeUnknown),
+              (Dictionary{{"a", R"(,x,y,z,{"k":1})"},
+                          {"b", "true,0.5,null,18446744073709551615"},
+                          {"c", R"([1,"x"],"")"},
+                          {"d", R"("1970-01-01T00:00:00.000Z")"},
+                          {"ZR_Session_Summary_Event", "65535,mine"}}));
+}
+
+TEST(LinkmeterSummaryTest, OfManyMessagesAndKeysTakesNoLongerThanItsValues) {
+    std::vector<MessageRef> messages;
+    for (int i = 0; i < 100'000; ++i) {
+        messages.push_back(record({{"n", i}, {"text", "some text that does not fit"}}));
+    }
+    for (int i = 0; i < 20'000; ++i) {
+        messages.push_back(record({{formatted("key{}", i), i}}));
+    }
+    const auto start = std::chrono::steady_clock::now();
+    const Dictionary summary = linkmeterSummary(messages, 2);
+    EXPECT_LT(std::chrono::steady_clock::now() - start, 10s) << "quadratic growth would take minutes";
+    EXPECT_EQ(summary.size(), 20'003U);
+    EXPECT_EQ(summary.find("text")->stringValue().size(), 100'000U * 28 - 1);
+    EXPECT_TRUE(summary.find("n")->stringValue().ends_with(",99998,99999"));
+}
+
+/// A service whose back ends nobody finds, or which answers from its own threads.
+class RtcWorkerOnThreadsTest : public testing::Test {
+protected:
+    void use(CallQualityService& service) {
+        const Platform& fakes = platform();
+        installPlatform({fakes.clock, *queues, fakes.log, fakes.tracePoints, fakes.deviceProperties,
+                         fakes.preferences, fakes.namedNotifications, fakes.processInformation,
+                         fakes.deviceConditions, fakes.analyticsEvents, fakes.powerEvents,
+                         fakes.diagnosticsMetrics, service, fakes.reportFiles, fakes.connections});
+    }
+    static std::shared_ptr<ZRReportingSessionRtcWorker>
+    startedWorker(const std::shared_ptr<ZRReportingSession>& session) {
+        auto worker = std::make_shared<ZRReportingSessionRtcWorker>(session);
+        EXPECT_EQ(worker->start(), true);
+        return worker;
+    }
+    static MessageRef message(int n) {
+        return std::make_shared<ZRReportingSessionMessage>(Dictionary{{"n", n}}, 4, 1);
+    }
+
+    FakePlatform device{LogLevel::fault};
+    std::unique_ptr<LinuxWorkQueues> queues = std::make_unique<LinuxWorkQueues>();
+    std::shared_ptr<ZRReportingSession> session = ZRReportingSession::initWithID(9, {1});
+};
+
+class SilentService final : public CallQualityService {
+public:
+    [[nodiscard]] std::optional<std::string> NewHierarchyToken(std::string_view) override { return "t"; }
+    [[nodiscard]] SessionRef CreateLinkmeterSession(const Dictionary&, const Dictionary&) override {
+        return nullptr;
+    }
+    void StartConfiguration(const SessionRef&, Completion) override { ++waiting; }
+    [[nodiscard]] std::optional<std::string> SendLinkmeterMessage(const SessionRef&, std::uint16_t,
+                                                                  std::uint16_t, const Dictionary&) override {
+        return "not reached";
+    }
+    void FlushMessages(const SessionRef&) override {}
+    void commit() override {}
+
+    std::atomic<int> waiting{0};
+};
+
+TEST_F(RtcWorkerOnThreadsTest, ThousandsMayWaitWithoutHoldingAThreadOrEachOther) {
+    SilentService service;
+    use(service);
+    std::vector<std::shared_ptr<ZRReportingSessionRtcWorker>> workers;
+    for (int i = 0; i < 2000; ++i) {
+        workers.push_back(startedWorker(session));
+        workers.back()->handleMessage(message(i));
+    }
+    const auto deadline = std::chrono::steady_clock::now() + 8s;
+    while (service.waiting < 2000 && std::chrono::steady_clock::now() < deadline) {
+        std::this_thread::yield();
+    }
+    EXPECT_EQ(service.waiting, 2000) << "none waits for another's nine seconds";
+    const auto threads = std::distance(std::filesystem::directory_iterator("/proc/self/task"),
+                                       std::filesystem::directory_iterator());
+    EXPECT_LE(threads, static_cast<std::ptrdiff_t>(ThreadPool::kMaximumThreads) + 4);
+    workers.clear();
+    queues.reset();
+}
+
+TEST_F(RtcWorkerOnThreadsTest, SpoolsWholeSessionsOfManyWorkersInOrder) {
+    const TemporaryDirectory directory;
+    RecordingLog log;
+    const LinuxPreferences preferences(directory.path(), log);
+    constexpr int kWorkers = 40;
+    constexpr int kMessages = 50;
+    {
+        LinuxCallQualityService service(directory.path(), device.clock, preferences, *queues, log);
+        use(service);
+        for (int i = 0; i < kWorkers; ++i) {
+            const auto worker = startedWorker(session);
+            for (int n = 0; n < kMessages; ++n) {
+                worker->handleMessage(message(n));
+            }
+            if (i % 4 != 0) {
+                worker->stop();
+            }
+        }
+        queues.reset();
+    }
+    std::istringstream lines(directory.read("call-quality.jsonl"));
+    std::map<std::string, std::vector<nlohmann::json>> sessions;
+    for (std::string line; std::getline(lines, line);) {
+        auto parsed = nlohmann::json::parse(line);
+        sessions[parsed["session"]].push_back(parsed);
+    }
+    EXPECT_EQ(sessions.size(), static_cast<std::size_t>(kWorkers));
+    int whole = 0;
+    for (const auto& [name, operations] : sessions) {
+        EXPECT_EQ(operations[0]["op"], "open");
+        for (std::size_t n = 1; n < operations.size() && operations[n]["op"] == "message"; ++n) {
+            EXPECT_EQ(operations[n]["payload"]["n"], n - 1);
+        }
+        whole += operations.back()["op"] == "flush" && operations.size() == kMessages + 2U ? 1 : 0;
+    }
+    EXPECT_EQ(whole, kWorkers * 3 / 4) << "all that were stopped, though dropped at once";
+    EXPECT_THAT(log.take(), IsEmpty());
+}
+
+} // namespace
+} // namespace tamblo
