@@ -2,9 +2,11 @@
 
 #include "platform/ReportFiles.h"
 
+#include <cstddef>
 #include <map>
 #include <memory>
 #include <optional>
+#include <set>
 #include <string>
 #include <string_view>
 #include <vector>
@@ -31,21 +33,27 @@ public:
     std::map<std::string, std::string> files; ///< the contents by path
     std::vector<std::string> createdDirectories;
     std::optional<std::string> directoryFailure, openFailure, writeFailure, closeFailure;
+    std::set<std::size_t> failingWrites; ///< those that the write failure is for, from 1; without any, all
+    std::vector<std::size_t> writes;     ///< the length of each
 
 private:
     class File final : public ReportFile {
     public:
-        File(const FakeReportFiles& owner, std::string& content) : owner_(owner), content_(content) {}
+        File(FakeReportFiles& owner, std::string& content) : owner_(owner), content_(content) {}
         [[nodiscard]] std::optional<std::string> write(std::string_view text) override {
-            if (!owner_.writeFailure) {
-                content_ += text;
+            owner_.writes.push_back(text.size());
+            const bool isMeant =
+                owner_.failingWrites.empty() || owner_.failingWrites.contains(owner_.writes.size());
+            if (owner_.writeFailure && isMeant) {
+                return owner_.writeFailure;
             }
-            return owner_.writeFailure;
+            content_ += text;
+            return std::nullopt;
         }
         [[nodiscard]] std::optional<std::string> close() override { return owner_.closeFailure; }
 
     private:
-        const FakeReportFiles& owner_;
+        FakeReportFiles& owner_;
         std::string& content_;
     };
 };
