@@ -78,6 +78,12 @@ std::optional<std::uint32_t> valueNamed(const auto& names, std::string_view text
     return found == names.end() ? std::nullopt : std::optional(found->value);
 }
 
+std::string_view nameOf(const auto& names, std::uint32_t value) noexcept {
+    const auto found =
+        std::find_if(names.begin(), names.end(), [value](const Name& name) { return name.value == value; });
+    return found == names.end() ? std::string_view() : found->text;
+}
+
 template <typename T> std::optional<T> parse(const auto& names, std::string_view text) {
     std::optional<std::uint64_t> value = valueNamed(names, text);
     if (!value) {
@@ -113,6 +119,24 @@ std::optional<EventType> parseType(std::string_view text) {
 
 std::optional<ServiceType> parseServiceType(std::string_view text) {
     return parse<ServiceType>(kServiceTypes, text);
+}
+
+std::string categoryName(EventCategory category) {
+    if (category == EventCategory::unknown) {
+        return "Unknown";
+    }
+    constexpr std::uint32_t kindBits = 0xFFFF;
+    const auto value = static_cast<std::uint32_t>(category);
+    const std::string kind(nameOf(kKinds, value & kindBits));
+    if ((value & ~kindBits) == 0 || kind.empty()) {
+        return kind;
+    }
+    const std::string_view subsystem = nameOf(kSubsystems, value & ~kindBits);
+    return subsystem.empty() ? std::string() : std::string(subsystem) + "_" + kind;
+}
+
+std::string_view typeName(EventType type) noexcept {
+    return nameOf(kTypes, static_cast<std::uint32_t>(type));
 }
 
 std::string_view serviceTypeName(ServiceType type) noexcept {

@@ -2,6 +2,7 @@
 
 #include <cstdint>
 #include <optional>
+#include <string>
 #include <string_view>
 
 /// The categories, types and service types that messages and reporters carry, for clients. A value that has
@@ -98,6 +99,9 @@ enum class ServiceType : std::uint16_t {
 [[nodiscard]] std::optional<EventType> parseType(std::string_view text);
 [[nodiscard]] std::optional<ServiceType> parseServiceType(std::string_view text);
 
+/// As above; empty for a number without a name.
+[[nodiscard]] std::string categoryName(EventCategory category);
+[[nodiscard]] std::string_view typeName(EventType type) noexcept;
 /// "unknown" for a number without a name.
 [[nodiscard]] std::string_view serviceTypeName(ServiceType type) noexcept;
 

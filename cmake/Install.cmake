@@ -39,4 +39,5 @@ install(FILES "${CMAKE_BINARY_DIR}/tamblod.service" packaging/tamblod.socket
     DESTINATION "${CMAKE_INSTALL_PREFIX}/lib/systemd/system")
 install(DIRECTORY examples/ DESTINATION "${CMAKE_INSTALL_DOCDIR}/examples" FILES_MATCHING PATTERN "*.jsonl")
 install(DIRECTORY docs/ DESTINATION "${CMAKE_INSTALL_DOCDIR}" FILES_MATCHING PATTERN "*.md")
+install(FILES packaging/audio_issue_detected.proto DESTINATION "${CMAKE_INSTALL_DATADIR}/tamblo")
 install(FILES README.md DESTINATION "${CMAKE_INSTALL_DOCDIR}" OPTIONAL)

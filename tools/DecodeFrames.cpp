@@ -1,0 +1,201 @@
+#include "tools/DecodeFrames.h"
+
+#include "base/Cbor.h"
+#include "base/Format.h"
+#include "base/Json.h"
+#include "client/Vocabulary.h"
+#include "wire/FrameSplitter.h"
+#include "wire/Reply.h"
+#include "wire/Request.h"
+
+#include <cstdint>
+#include <span>
+
+namespace tamblo::tools {
+
+namespace {
+
+using Bytes = std::span<const std::uint8_t>;
+
+std::optional<unsigned> digitOf(char character) noexcept {
+    if (character >= '0' && character <= '9') {
+        return static_cast<unsigned>(character - '0');
+    }
+    const char lower = static_cast<char>(character | 0x20);
+    return lower >= 'a' && lower <= 'f' ? std::optional(static_cast<unsigned>(lower - 'a') + 10)
+                                        : std::nullopt;
+}
+
+/// Nothing when it is another text, or the number of digits is odd.
+std::optional<std::vector<std::uint8_t>> bytesOfHex(std::string_view text) {
+    std::vector<std::uint8_t> bytes;
+    bytes.reserve(text.size() / 2);
+    bool isHalf = false; // the last byte has its high digit only
+    for (const char character : text) {
+        if (std::string_view(" \t\r\n").find(character) != std::string_view::npos) {
+            continue;
+        }
+        const auto digit = digitOf(character);
+        if (!digit) {
+            return std::nullopt;
+        }
+        if (isHalf) {
+            bytes.back() = static_cast<std::uint8_t>(bytes.back() | *digit);
+        } else {
+            bytes.push_back(static_cast<std::uint8_t>(*digit << 4U));
+        }
+        isHalf = !isHalf;
+    }
+    return isHalf ? std::nullopt : std::optional(std::move(bytes));
+}
+
+/// A JSON object whose members stay in the order in which they are added.
+class JsonObject {
+public:
+    template <typename T> JsonObject& add(std::string_view name, const T& value) {
+        begin(name);
+        appendJson(out_, Value(value));
+        return *this;
+    }
+    JsonObject& addNull(std::string_view name) {
+        begin(name);
+        out_.append("null");
+        return *this;
+    }
+    [[nodiscard]] std::string line() const { return std::string(out_.view()) + "}\n"; }
+
+private:
+    void begin(std::string_view name) {
+        out_.append(out_.empty() ? '{' : ',');
+        appendJsonString(out_, name);
+        out_.append(':');
+    }
+
+    TextBuffer out_;
+};
+
+void addParameters(JsonObject& object, const wire::Request& request) {
+    switch (request.method) {
+    case wire::Method::sendMessage: {
+        object.add("payload", request.dictionary).add("category", request.category);
+        if (const auto name = client::categoryName(client::EventCategory{request.category}); !name.empty()) {
+            object.add("categoryName", name);
+        }
+        object.add("type", unsigned{request.type});
+        if (const auto name = client::typeName(client::EventType{request.type}); !name.empty()) {
+            object.add("typeName", name);
+        }
+        Array reporters(request.reporterIDs.begin(), request.reporterIDs.end());
+        object.add("reporterIDs", reporters);
+        return;
+    }
+    case wire::Method::setServiceType:
+        object.add("type", unsigned{request.serviceType})
+            .add("typeName", client::serviceTypeName(client::ServiceType{request.serviceType}));
+        break;
+    case wire::Method::setConfiguration:
+        object.add("configuration", request.dictionary);
+        break;
+    case wire::Method::getAllReporters:
+    case wire::Method::killService:
+        return;
+    default:
+        break;
+    }
+    object.add("reporterID", request.reporterID);
+}
+
+std::string lineOf(const wire::Request& request) {
+    JsonObject object;
+    object.add("frame", request.id ? "request" : "request without reply");
+    if (request.id) {
+        object.add("id", *request.id);
+    }
+    object.add("method", wire::methodName(request.method));
+    addParameters(object, request);
+    return object.line();
+}
+
+std::string lineOf(const wire::Reply& reply) {
+    JsonObject object;
+    object.add("frame", "reply").add("id", reply.id);
+    if (reply.error) {
+        Dictionary error{{"domain", reply.error->domain}, {"code", reply.error->code}};
+        if (!reply.error->message.empty()) {
+            error.set("message", reply.error->message);
+        }
+        object.add("error", error);
+    } else {
+        object.addNull("error");
+    }
+    if (reply.result) {
+        object.add("result", *reply.result);
+    } else {
+        object.addNull("result");
+    }
+    return object.line();
+}
+
+bool beginsLikeAReply(Bytes item) {
+    CborReader reader(item);
+    auto elements = reader.readArrayHead();
+    return elements && reader.moreElements(*elements) &&
+           reader.readUnsigned() == static_cast<std::uint64_t>(wire::FrameKind::reply);
+}
+
+/// What is wrong with the item, if anything.
+std::optional<std::string> appendItem(std::string& out, Bytes item) {
+    if (const auto reply = wire::decodeReply(item)) {
+        out += lineOf(*reply);
+        return std::nullopt;
+    }
+    KeySetCache keySets;
+    wire::Request request;
+    const auto refusal = wire::decodeRequest(item, keySets, request);
+    if (!refusal) {
+        out += lineOf(request);
+        return std::nullopt;
+    }
+    if (refusal->error.code == wire::kNotWellFormed) {
+        return "not CBOR: " + refusal->error.message;
+    }
+    if (beginsLikeAReply(item)) {
+        return std::string("not a reply as the protocol has them");
+    }
+    return formatted("not a request that the service would accept ({}): {}", refusal->error.code,
+                     refusal->error.message);
+}
+
+std::string describeRest(const wire::FrameSplitter& frames) {
+    if (frames.tooLong()) {
+        return formatted("its length, {}, is beyond the longest, {}", frames.wanted() - wire::kLengthBytes,
+                         wire::kMaximumFrameBytes);
+    }
+    return formatted("cut short: {} of {} bytes are there", frames.rest().size(), frames.wanted());
+}
+
+} // namespace
+
+bool isHex(std::string_view text) {
+    return bytesOfHex(text).has_value();
+}
+
+Decoded decodeFrames(std::string_view input) {
+    const auto fromHex = bytesOfHex(input);
+    const Bytes bytes =
+        fromHex ? Bytes(*fromHex) : Bytes(reinterpret_cast<const std::uint8_t*>(input.data()), input.size());
+    Decoded decoded;
+    wire::FrameSplitter frames(bytes);
+    std::size_t number = 1;
+    for (auto item = frames.next(); item; item = frames.next(), ++number) {
+        if (auto wrong = appendItem(decoded.text, *item)) {
+            decoded.problems.push_back(formatted("frame {}: {}", number, *wrong));
+        }
+    }
+    if (!frames.rest().empty()) {
+        decoded.problems.push_back(formatted("frame {}: {}", number, describeRest(frames)));
+    }
+    return decoded;
+}
+
+} // namespace tamblo::tools
