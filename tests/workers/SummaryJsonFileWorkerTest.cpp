@@ -5,6 +5,8 @@
 #include <gmock/gmock.h>
 #include <nlohmann/json.hpp>
 
+#include <algorithm>
+#include <initializer_list>
 #include <limits>
 #include <string>
 #include <vector>
