@@ -127,7 +127,7 @@ std::string categoryName(EventCategory category) {
     }
     constexpr std::uint32_t kindBits = 0xFFFF;
     const auto value = static_cast<std::uint32_t>(category);
-    const std::string kind(nameOf(kKinds, value & kindBits));
+    std::string kind(nameOf(kKinds, value & kindBits));
     if ((value & ~kindBits) == 0 || kind.empty()) {
         return kind;
     }
