@@ -65,7 +65,7 @@ protected:
 
 TEST_F(LinuxReportFilesTest, DirectoriesAreForEverybodyWhateverTheMask) {
     EXPECT_EQ(files.reportingLogsDirectory(), directory.path("DiagnosticLogs/Audio/Reporting"));
-    for (const mode_t mask : {0022, 0077}) {
+    for (const mode_t mask : {mode_t{0022}, mode_t{0077}}) {
         fs::remove_all(directory.path("DiagnosticLogs"));
         const mode_t before = ::umask(mask);
         EXPECT_EQ(files.createDirectory(files.reportingLogsDirectory()), std::nullopt);
