@@ -1,5 +1,6 @@
 #include "platform/linux/Directories.h"
 #include "platform/linux/LinuxAnalyticsEventService.h"
+#include "platform/linux/LinuxClock.h"
 #include "platform/linux/LinuxDeviceProperties.h"
 #include "platform/linux/LinuxPreferences.h"
 #include "platform/linux/LinuxProcessInformation.h"
@@ -10,7 +11,10 @@
 #include <gmock/gmock.h>
 
 #include <array>
+#include <cstdlib>
+#include <ctime>
 #include <map>
+#include <utility>
 
 #include <fcntl.h>
 #include <poll.h>
@@ -29,6 +33,18 @@ using testing::IsEmpty;
 bool isReadable(int descriptor, int milliseconds = 2000) {
     pollfd question{descriptor, POLLIN, 0};
     return ::poll(&question, 1, milliseconds) == 1;
+}
+
+TEST(LinuxClockTest, TheOffsetIsThatOfTheZoneOfTheMoment) {
+    const char* before = ::getenv("TZ");
+    const std::string zone = before != nullptr ? before : "";
+    constexpr std::pair<const char*, int> cases[] = {{"ABC-5:45", 20'700}, {"ABC3:30", -12'600}};
+    for (const auto& [name, offset] : cases) {
+        ::setenv("TZ", name, 1);
+        EXPECT_EQ(LinuxClock().utcOffset(WallTime()).count(), offset) << name;
+    }
+    before != nullptr ? ::setenv("TZ", zone.c_str(), 1) : ::unsetenv("TZ");
+    ::tzset();
 }
 
 TEST(DirectoriesTest, ComeFromTheUnitOrFromTheirUsualPlaces) {

@@ -116,6 +116,13 @@ TEST(Decode, LinesOfEverySinkAreLaidOut) {
          "  record: \"EAI\"\n"
          "  time: 0\n",
          {"line 1: the record is not Base64"}},
+        {R"({"time":0,"metric":5963779,"op":"\u001b[2J","record":5})",
+         "1970-01-01T00:00:00.000Z \\u001b[2J\n"
+         "  metric: 5963779\n"
+         "  op: \"\\u001b[2J\"\n"
+         "  record: 5\n"
+         "  time: 0\n",
+         {"line 1: there is no record"}},
         {R"({"time":0,"metric":1,"record":"EAI"})",
          "1970-01-01T00:00:00.000Z 1\n"
          "  metric: 1\n"

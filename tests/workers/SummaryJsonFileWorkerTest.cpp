@@ -184,6 +184,8 @@ TEST_F(SummaryJsonFileWorkerTest, EachFailedStepIsTold) {
         {&FakeReportFiles::directoryFailure, {directory, opened, closed}, true, true},
         {&FakeReportFiles::openFailure, {failed("open file", "open")}, false, false},
         {&FakeReportFiles::writeFailure, {opened, failed("write line", "writeline"), closed}, true, false},
+        // The next file's outage is its own.
+        {&FakeReportFiles::writeFailure, {opened, failed("write line", "writeline"), closed}, true, false},
         {&FakeReportFiles::closeFailure, {opened, failed("closed file", "close")}, true, true},
     };
     send({{"n", 1}});
@@ -191,7 +193,7 @@ TEST_F(SummaryJsonFileWorkerTest, EachFailedStepIsTold) {
     for (const auto& c : cases) {
         files.files.clear();
         files.*c.failure = "no way";
-        worker->setStarted(true);
+        worker->setStarted(!c.started);
         worker->stop();
         files.*c.failure = std::nullopt;
         EXPECT_EQ(said(), c.told);
