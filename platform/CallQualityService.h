@@ -37,7 +37,7 @@ public:
     };
     using SessionRef = std::shared_ptr<Session>;
     /// The back ends that were found, nothing when there are none.
-    using Completion = UniqueFunction<void(std::optional<std::vector<std::string>>)>;
+    using Completion = UniqueFunction<void(const std::optional<std::vector<std::string>>&)>;
 
     virtual ~CallQualityService() = default;
     /// What tells a session's place among others, under a parent token or, with an empty one, under none.

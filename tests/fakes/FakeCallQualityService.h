@@ -53,10 +53,10 @@ public:
     void commit() override { ++commits; }
 
     /// Answers the oldest configuration that waits.
-    void findBackends(std::optional<std::vector<std::string>> backends) {
+    void findBackends(const std::optional<std::vector<std::string>>& backends) {
         Completion completion = std::move(completions.front());
         completions.erase(completions.begin());
-        completion(std::move(backends));
+        completion(backends);
     }
 
     std::optional<std::string> token = "token";
