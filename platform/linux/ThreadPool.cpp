@@ -35,8 +35,13 @@ ThreadPool::DelayedKey ThreadPool::postAfter(std::chrono::milliseconds delay, Un
     const std::lock_guard lock(mutex_);
     const DelayedKey key{std::chrono::steady_clock::now() + delay, ++lastDelayed_};
     delayed_.emplace(key, std::move(work));
-    if (delayed_.begin()->first == key) {
-        // Whoever waits for the call that was next has to wait for this one instead.
+    if (delayed_.begin()->first != key) {
+        return key;
+    }
+    if (idle_ != 0) {
+        // The one that waits for the call that was next has to wait for this one instead.
+        hasWork_.notify_all();
+    } else {
         callThread();
     }
     return key;
