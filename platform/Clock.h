@@ -11,13 +11,13 @@ using WallTime = std::chrono::time_point<std::chrono::system_clock, std::chrono:
     return std::chrono::duration<double>(time.time_since_epoch()).count();
 }
 
-/// The time of day, on any thread, without blocking. It may step backwards. Read once per message and passed
-/// down.
+/// The time of day, on any thread. It may step backwards.
 class Clock {
 public:
     virtual ~Clock() = default;
+    /// Without blocking. Read once per message and passed down.
     [[nodiscard]] virtual WallTime now() const noexcept = 0;
-    /// How far the device's local time is ahead of UTC at that time.
+    /// How far the device's local time is ahead of UTC at that time. May read the zone from the disk.
     [[nodiscard]] virtual std::chrono::seconds utcOffset(WallTime time) const = 0;
 };
 

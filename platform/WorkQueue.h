@@ -49,7 +49,8 @@ public:
     virtual ~DelayedCall() = default;
 };
 
-/// Makes queues and timers, which their users own and let go before the process ends. Any thread.
+/// Makes queues, timers and delayed calls, which their users own and let go before the process ends. Any
+/// thread.
 class WorkQueues {
 public:
     virtual ~WorkQueues() = default;

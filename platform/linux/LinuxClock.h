@@ -4,7 +4,8 @@
 
 namespace tamblo {
 
-/// The system's real-time clock, read without entering the kernel.
+/// The system's real-time clock, read without entering the kernel, and the time zone that the device has
+/// when asked.
 class LinuxClock final : public Clock {
 public:
     [[nodiscard]] WallTime now() const noexcept override;

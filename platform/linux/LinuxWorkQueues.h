@@ -8,7 +8,8 @@
 
 namespace tamblo {
 
-/// Serial queues as strands over one pool, and timers. Outlives its queues' users; works off what was posted.
+/// Serial queues as strands over one pool, which also makes the delayed calls, and timers. Works off what was
+/// posted before it goes. A queue may be let go after that, but not posted to; a delayed call may not.
 class LinuxWorkQueues final : public WorkQueues {
 public:
     LinuxWorkQueues();

@@ -39,7 +39,7 @@ ThreadPool::DelayedKey ThreadPool::postAfter(std::chrono::milliseconds delay, Un
         return key;
     }
     if (idle_ != 0) {
-        // The one that waits for the call that was next has to wait for this one instead.
+        // Those that wait for the call that was next have to wake up for this one instead.
         hasWork_.notify_all();
     } else {
         callThread();

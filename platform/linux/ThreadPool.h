@@ -16,8 +16,9 @@
 namespace tamblo {
 
 /// Threads for work that may block, and for calls at a later time. The pool starts empty, grows while every
-/// thread is busy, up to a limit, and a thread that finds nothing to do for some seconds ends: an idle
-/// process has none. The destructor works off what was posted; calls whose time has not come are dropped.
+/// thread is busy, up to a limit, and a thread that finds nothing to do for some seconds ends, but for
+/// one while a call is to come: an idle process has none. The destructor works off what was posted; calls
+/// whose time has not come are dropped.
 class ThreadPool {
 public:
     static constexpr std::size_t kMaximumThreads = 16;

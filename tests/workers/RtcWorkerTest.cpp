@@ -353,7 +353,7 @@ TEST(LinkmeterSummaryTest, OfManyMessagesAndKeysTakesNoLongerThanItsValues) {
     EXPECT_EQ(summary.find("text")->stringValue().size(), 100'000U * 28 - 1);
 }
 
-/// A service whose back ends nobody finds, or which answers from its own threads.
+/// Workers whose queues run on the threads of a real pool, with a service that a test brings along.
 class RtcWorkerOnThreadsTest : public testing::Test {
 protected:
     void use(CallQualityService& service) {
@@ -378,6 +378,7 @@ protected:
     std::shared_ptr<ZRReportingSession> session = ZRReportingSession::initWithID(9, {1});
 };
 
+/// Never finds a back end, nor that there is none.
 class SilentService final : public CallQualityService {
 public:
     [[nodiscard]] std::optional<std::string> NewHierarchyToken(std::string_view) override { return "t"; }
