@@ -9,6 +9,9 @@
 
 namespace tamblo::qmxmetrics {
 
+/// The number of the metric whose records these are.
+inline constexpr std::uint32_t kAudioIssueMetric = 0x005B0003;
+
 /// The metric record of one detected audio issue. `packaging/audio_issue_detected.proto` describes it for
 /// other programs.
 ///

@@ -18,7 +18,6 @@ namespace {
 
 constexpr std::string_view kWhiteSpace = " \t\r\n";
 constexpr std::array<std::string_view, 3> kKindNames{"record", "line", "frame"};
-constexpr std::uint64_t kAudioIssueMetric = 0x005B0003;
 
 std::string_view trimmed(std::string_view text) {
     const std::size_t first = text.find_first_not_of(kWhiteSpace);
@@ -90,7 +89,7 @@ std::optional<std::string> appendLine(std::string& out, std::string_view line) {
     }
     const Value* metric = fields.find("metric");
     const Value* record = fields.find("record");
-    if (metric == nullptr || !(*metric == Value(kAudioIssueMetric))) {
+    if (metric == nullptr || !(*metric == Value(qmxmetrics::kAudioIssueMetric))) {
         return std::nullopt;
     }
     if (record == nullptr || !record->isString()) {

@@ -123,6 +123,10 @@ void ThreadPool::run() {
     while (waitForWork(lock)) {
         UniqueFunction<void()> work = std::move(work_.front());
         work_.pop_front();
+        if (idle_ == 0 && !delayed_.empty()) {
+            // While this work blocks, another thread has to wait for the calls to come.
+            callThread();
+        }
         lock.unlock();
         work();
         work.reset();

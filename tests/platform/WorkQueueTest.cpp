@@ -180,6 +180,16 @@ TEST(DelayedCall, IsMadeOnceItsTimeHasComeUnlessItIsCalledOff) {
     EXPECT_GE(std::chrono::steady_clock::now() - start, milliseconds(60));
     EXPECT_FALSE(isCalledOffMade);
 
+    // Also while the thread that waited for its time is blocked by other work.
+    LinuxWorkQueues others;
+    std::promise<void> isMade;
+    std::latch mayGoOn(1);
+    const auto waiting = others.callAfter(milliseconds(50), [&isMade] { isMade.set_value(); });
+    const auto blocked = others.makeSerialQueue("blocked");
+    blocked->post([&mayGoOn] { mayGoOn.wait(); }, Pace::mayBlock);
+    EXPECT_EQ(isMade.get_future().wait_for(kPatience), std::future_status::ready);
+    mayGoOn.count_down();
+
     // Many at once, each made once.
     std::atomic<int> made{0};
     std::vector<std::unique_ptr<DelayedCall>> calls;

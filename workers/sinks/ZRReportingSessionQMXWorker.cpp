@@ -11,8 +11,6 @@ namespace tamblo {
 
 namespace {
 
-constexpr std::uint32_t kAudioIssueMetric = 0x005B0003;
-
 /// The value of the key, or nothing, which is logged.
 const Value* wanted(const Dictionary& payload, std::string_view key) {
     const Value* value = payload.find(key);
@@ -49,7 +47,7 @@ void ZRReportingSessionQMXWorker::handleMessage(const MessageRef& message) {
     TextBuffer bytes;
     ProtoWriter writer(bytes);
     recordOf(message->payload()).writeTo(writer);
-    platform().diagnosticsMetrics.SubmitMetricRecord(kAudioIssueMetric, bytes.bytes());
+    platform().diagnosticsMetrics.SubmitMetricRecord(qmxmetrics::kAudioIssueMetric, bytes.bytes());
 }
 
 } // namespace tamblo
