@@ -19,6 +19,8 @@ public:
     [[nodiscard]] virtual WallTime now() const noexcept = 0;
     /// How far the device's local time is ahead of UTC at that time. May read the zone from the disk.
     [[nodiscard]] virtual std::chrono::seconds utcOffset(WallTime time) const = 0;
+    /// Holds up the calling thread for that long.
+    virtual void sleepFor(std::chrono::microseconds time) = 0;
 };
 
 } // namespace tamblo

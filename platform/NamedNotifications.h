@@ -32,6 +32,9 @@ public:
                                                                  Handler handler) = 0;
     /// The word that was posted last, for the registration's name.
     [[nodiscard]] virtual State GetNamedNotificationState(int token) = 0;
+    /// Posts the name to everybody who is registered for it, with the state word that it has, 0 for a new
+    /// one. Answers 0, or the number of the failure.
+    [[nodiscard]] virtual int PostNamedNotification(std::string_view name) = 0;
     /// Ends a registration; called on its queue, or when that is at rest, no call of the handler follows. A
     /// token that is not registered is ignored.
     virtual void CancelNamedNotification(int token) = 0;

@@ -1,16 +1,23 @@
 #pragma once
 
+#include "platform/Accessories.h"
 #include "platform/AnalyticsEventService.h"
+#include "platform/BugCaptureService.h"
+#include "platform/BugReportDraftingService.h"
 #include "platform/CallQualityService.h"
+#include "platform/ChanlogFacility.h"
 #include "platform/Clock.h"
 #include "platform/ConnectionService.h"
 #include "platform/DeviceConditions.h"
 #include "platform/DeviceProperties.h"
+#include "platform/DiagnosticCaptureService.h"
 #include "platform/DiagnosticsMetricsService.h"
+#include "platform/MemoryLog.h"
 #include "platform/NamedNotifications.h"
 #include "platform/PowerEventLog.h"
 #include "platform/Preferences.h"
 #include "platform/ProcessInformation.h"
+#include "platform/ProcessSampling.h"
 #include "platform/ReportFiles.h"
 #include "platform/StructuredLog.h"
 #include "platform/TracePoints.h"
@@ -35,6 +42,13 @@ struct Platform {
     DiagnosticsMetricsService& diagnosticsMetrics;
     CallQualityService& callQuality;
     ReportFiles& reportFiles;
+    BugCaptureService& bugCapture;
+    BugReportDraftingService& bugReportDrafting;
+    DiagnosticCaptureService& diagnosticCapture;
+    MemoryLog& memoryLog;
+    ChanlogFacility& chanlog;
+    ProcessSampling& processSampling;
+    Accessories& accessories;
     ConnectionService& connections;
 };
 

@@ -16,15 +16,22 @@ public:
     /// The value that is stored now, or nothing.
     [[nodiscard]] virtual std::optional<Value> copyPreferenceValue(std::string_view key,
                                                                    std::string_view domain) const = 0;
+    /// Stores a value at once and for good, beside the others of the domain; answers what went wrong, or
+    /// nothing. This process reads the new value in either case.
+    [[nodiscard]] virtual std::optional<std::string>
+    setPreferenceValue(std::string_view key, std::string_view domain, const Value& value) = 0;
 };
 
 /// The values of one domain, read as what the caller takes them for. Every call asks the store.
 class PreferencesSuite {
 public:
     /// The store must outlive the suite.
-    PreferencesSuite(const Preferences& store, std::string domain)
-        : store_(store), domain_(std::move(domain)) {}
+    PreferencesSuite(Preferences& store, std::string domain) : store_(store), domain_(std::move(domain)) {}
 
+    /// The value as it is, or nothing.
+    [[nodiscard]] std::optional<Value> value(std::string_view key) const {
+        return store_.copyPreferenceValue(key, domain_);
+    }
     [[nodiscard]] bool hasValue(std::string_view key) const {
         return store_.copyPreferenceValue(key, domain_).has_value();
     }
@@ -35,9 +42,12 @@ public:
         const std::optional<Value> value = store_.copyPreferenceValue(key, domain_);
         return value && value->boolValue();
     }
+    [[nodiscard]] std::optional<std::string> setValue(std::string_view key, const Value& value) {
+        return store_.setPreferenceValue(key, domain_, value);
+    }
 
 private:
-    const Preferences& store_;
+    Preferences& store_;
     const std::string domain_;
 };
 

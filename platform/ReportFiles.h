@@ -24,6 +24,8 @@ public:
     virtual ~ReportFiles() = default;
     /// The directory of the reporting service's reports, an absolute path.
     [[nodiscard]] virtual std::string reportingLogsDirectory() const = 0;
+    /// The directory of performance data, an absolute path.
+    [[nodiscard]] virtual std::string performanceLogsDirectory() const = 0;
     /// Creates the directory with its parents, for everybody to use; answers what went wrong, or nothing.
     [[nodiscard]] virtual std::optional<std::string> createDirectory(const std::string& path) = 0;
     /// A new empty file in place of any that has the name, or what went wrong.

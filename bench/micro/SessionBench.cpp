@@ -31,11 +31,7 @@ public:
 class QuietDevice {
 public:
     QuietDevice() {
-        const Platform& fakes = platform();
-        installPlatform({fakes.clock, fakes.workQueues, fakes.log, noTracePoints_, fakes.deviceProperties,
-                         fakes.preferences, fakes.namedNotifications, fakes.processInformation,
-                         fakes.deviceConditions, noEvents_, fakes.powerEvents, fakes.diagnosticsMetrics,
-                         fakes.callQuality, fakes.reportFiles, fakes.connections});
+        device_.installWith({.tracePoints = &noTracePoints_, .analyticsEvents = &noEvents_});
         device_.clock.set(std::chrono::time_point_cast<WallTime::duration>(std::chrono::system_clock::now()));
     }
 

@@ -1,6 +1,7 @@
 #include "platform/linux/LinuxClock.h"
 
 #include <ctime>
+#include <thread>
 
 namespace tamblo {
 
@@ -13,6 +14,10 @@ std::chrono::seconds LinuxClock::utcOffset(WallTime time) const {
     ::tzset(); // `localtime_r` alone stays in the zone that the process began in
     std::tm local{};
     return std::chrono::seconds(::localtime_r(&seconds, &local) != nullptr ? local.tm_gmtoff : 0);
+}
+
+void LinuxClock::sleepFor(std::chrono::microseconds time) {
+    std::this_thread::sleep_for(time);
 }
 
 } // namespace tamblo

@@ -10,6 +10,7 @@ class LinuxClock final : public Clock {
 public:
     [[nodiscard]] WallTime now() const noexcept override;
     [[nodiscard]] std::chrono::seconds utcOffset(WallTime time) const override;
+    void sleepFor(std::chrono::microseconds time) override;
 };
 
 } // namespace tamblo

@@ -186,7 +186,19 @@ void LinuxConnectionService::accept(FileDescriptor socket) {
     connections_.emplace(connection.get(), connection);
     if (!delegate_->shouldAcceptNewConnection(*connection)) {
         connections_.erase(connection.get());
+        return;
     }
+    const std::lock_guard lock(mutex_);
+    ++connectionsByProcess_[credentials.pid];
+}
+
+std::vector<pid_t> LinuxConnectionService::clientProcesses() {
+    const std::lock_guard lock(mutex_);
+    std::vector<pid_t> processes;
+    for (const auto& [process, connections] : connectionsByProcess_) {
+        processes.push_back(process);
+    }
+    return processes;
 }
 
 void LinuxConnectionService::hasReplies(std::shared_ptr<LinuxConnection> connection) {
@@ -218,6 +230,11 @@ void LinuxConnectionService::ended(LinuxConnection& connection) {
     if (found != connections_.end()) {
         loop_.post([kept = std::move(found->second)] {});
         connections_.erase(found);
+        const std::lock_guard lock(mutex_);
+        const auto process = connectionsByProcess_.find(connection.peerProcessIdentifier());
+        if (process != connectionsByProcess_.end() && --process->second == 0) {
+            connectionsByProcess_.erase(process);
+        }
     }
 }
 

@@ -10,6 +10,7 @@
 
 #include <cstddef>
 #include <functional>
+#include <map>
 #include <memory>
 #include <mutex>
 #include <optional>
@@ -58,6 +59,8 @@ public:
     void resume() override;
     void ready(std::uint32_t events) override;
 
+    /// The processes of the clients that are connected, each once. From any thread.
+    [[nodiscard]] std::vector<pid_t> clientProcesses();
     /// Sends what was replied since the last call. From any thread.
     void releaseReplies();
     /// Takes no further connections and reads no more from those there are; the socket file goes.
@@ -92,6 +95,7 @@ private:
 
     std::mutex mutex_; ///< guards what follows
     std::vector<std::shared_ptr<LinuxConnection>> replied_;
+    std::map<pid_t, std::size_t> connectionsByProcess_;
 };
 
 } // namespace tamblo

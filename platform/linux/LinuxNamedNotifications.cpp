@@ -125,6 +125,10 @@ void LinuxNamedNotifications::reportUnreadable(const std::string& name, const st
                 formatted("{}/{}: {}; it is not used", watcher_.directory(), name, fault));
 }
 
+int LinuxNamedNotifications::PostNamedNotification(std::string_view name) {
+    return checkName(name);
+}
+
 void LinuxNamedNotifications::CancelNamedNotification(int token) {
     // Let go after the lock: what the handler holds may cancel another registration when it ends.
     std::shared_ptr<Registered> registered;

@@ -38,6 +38,8 @@ public:
     /// link is `ELOOP`: writes through it would not be noticed. What stands there and cannot be read is one
     /// error line for each state of the file that is met.
     [[nodiscard]] State GetNamedNotificationState(int token) override;
+    /// Writes the file anew with the word that stands there.
+    [[nodiscard]] int PostNamedNotification(std::string_view name) override;
     void CancelNamedNotification(int token) override;
 
     /// For the event loop; -1 when posts cannot be noticed (said in the log).

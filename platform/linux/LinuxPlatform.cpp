@@ -1,17 +1,24 @@
 #include "platform/linux/LinuxPlatform.h"
 
 #include "platform/linux/EventLoop.h"
+#include "platform/linux/LinuxAccessories.h"
 #include "platform/linux/LinuxAnalyticsEventService.h"
+#include "platform/linux/LinuxBugCaptureService.h"
+#include "platform/linux/LinuxBugReportDrafting.h"
 #include "platform/linux/LinuxCallQualityService.h"
+#include "platform/linux/LinuxChanlogFacility.h"
 #include "platform/linux/LinuxClock.h"
 #include "platform/linux/LinuxConnectionService.h"
 #include "platform/linux/LinuxDeviceConditions.h"
 #include "platform/linux/LinuxDeviceProperties.h"
+#include "platform/linux/LinuxDiagnosticCapture.h"
 #include "platform/linux/LinuxDiagnosticsMetrics.h"
+#include "platform/linux/LinuxMemoryLog.h"
 #include "platform/linux/LinuxNamedNotifications.h"
 #include "platform/linux/LinuxPowerEventLog.h"
 #include "platform/linux/LinuxPreferences.h"
 #include "platform/linux/LinuxProcessInformation.h"
+#include "platform/linux/LinuxProcessSampling.h"
 #include "platform/linux/LinuxReportFiles.h"
 #include "platform/linux/LinuxSerialQueue.h"
 #include "platform/linux/LinuxStructuredLog.h"
@@ -111,7 +118,14 @@ struct LinuxPlatform::Services {
           diagnosticsMetrics(directories.logs, clock, log),
           callQuality(directories.logs, clock, preferences, workQueues, log),
           reportFiles(directories.logs),
-          connections(loop, log) {}
+          bugCapture(directories.logs, clock, workQueues, log),
+          bugReportDrafting(directories.logs, clock, log),
+          memoryLog(directories.logs, clock, workQueues, log),
+          chanlog(directories.driverChannels(), log),
+          accessories(log),
+          connections(loop, log),
+          diagnosticCapture(
+              directories.logs, clock, workQueues, [this] { return connections.clientProcesses(); }, log) {}
 
     // First, as it makes sure that standard error is open before anything else can take its number.
     LinuxStructuredLog log;
@@ -130,8 +144,15 @@ struct LinuxPlatform::Services {
     LinuxDiagnosticsMetrics diagnosticsMetrics;
     LinuxCallQualityService callQuality;
     LinuxReportFiles reportFiles;
+    LinuxBugCaptureService bugCapture;
+    LinuxBugReportDrafting bugReportDrafting;
+    LinuxMemoryLog memoryLog;
+    LinuxChanlogFacility chanlog;
+    LinuxProcessSampling processSampling;
+    LinuxAccessories accessories;
     EventLoop loop;
     LinuxConnectionService connections;
+    LinuxDiagnosticCapture diagnosticCapture;
     // Behind what its work uses: it works off what was posted before it goes.
     LinuxWorkQueues workQueues;
     std::optional<InlineDrain> drain;
@@ -174,6 +195,13 @@ Platform LinuxPlatform::services() {
             .diagnosticsMetrics = services_->diagnosticsMetrics,
             .callQuality = services_->callQuality,
             .reportFiles = services_->reportFiles,
+            .bugCapture = services_->bugCapture,
+            .bugReportDrafting = services_->bugReportDrafting,
+            .diagnosticCapture = services_->diagnosticCapture,
+            .memoryLog = services_->memoryLog,
+            .chanlog = services_->chanlog,
+            .processSampling = services_->processSampling,
+            .accessories = services_->accessories,
             .connections = services_->connections};
 }
 
@@ -181,6 +209,8 @@ void LinuxPlatform::flushSinks() {
     services_->analyticsEvents.flush();
     services_->powerEvents.flush();
     services_->diagnosticsMetrics.flush();
+    services_->bugCapture.flush();
+    services_->bugReportDrafting.flush();
 }
 
 void LinuxPlatform::run(SerialQueue& requestQueue,

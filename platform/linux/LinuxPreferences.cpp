@@ -57,6 +57,11 @@ std::optional<Value> LinuxPreferences::copyPreferenceValue(std::string_view key,
     return value != nullptr ? std::optional<Value>(*value) : std::nullopt;
 }
 
+std::optional<std::string> LinuxPreferences::setPreferenceValue(std::string_view, std::string_view,
+                                                                const Value&) {
+    return "preferences cannot be stored";
+}
+
 void LinuxPreferences::readChanges() {
     bool changed = false;
     watcher_.read([this, &changed](std::optional<std::string_view> fileName) {

@@ -29,6 +29,8 @@ public:
 
     [[nodiscard]] std::optional<Value> copyPreferenceValue(std::string_view key,
                                                            std::string_view domain) const override;
+    [[nodiscard]] std::optional<std::string> setPreferenceValue(std::string_view key, std::string_view domain,
+                                                                const Value& value) override;
 
     /// The file of a domain, whether it is there or not.
     [[nodiscard]] std::string path(std::string_view domain) const;

@@ -23,9 +23,11 @@ public:
                               FileOperations& operations = FileOperations::system())
         : logsDirectory_(logsDirectory),
           directory_(logsDirectory + "/DiagnosticLogs/Audio/Reporting"),
+          performanceDirectory_(logsDirectory + "/DiagnosticLogs/Audio/Performance"),
           operations_(operations) {}
 
     [[nodiscard]] std::string reportingLogsDirectory() const override { return directory_; }
+    [[nodiscard]] std::string performanceLogsDirectory() const override { return performanceDirectory_; }
     [[nodiscard]] std::optional<std::string> createDirectory(const std::string& path) override;
     [[nodiscard]] std::variant<std::unique_ptr<ReportFile>, std::string>
     createFile(const std::string& path) override;
@@ -33,6 +35,7 @@ public:
 private:
     const std::string logsDirectory_;
     const std::string directory_;
+    const std::string performanceDirectory_;
     FileOperations& operations_;
 };
 

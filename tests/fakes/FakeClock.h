@@ -15,6 +15,7 @@ public:
     }
     [[nodiscard]] double seconds() const noexcept { return secondsSince1970(now()); }
     [[nodiscard]] std::chrono::seconds utcOffset(WallTime) const override { return offset; }
+    void sleepFor(std::chrono::microseconds time) override { advance(time); }
     void advance(std::chrono::nanoseconds step) noexcept { nanoseconds_ += step.count(); }
     void set(WallTime time) noexcept { nanoseconds_ = time.time_since_epoch().count(); }
 

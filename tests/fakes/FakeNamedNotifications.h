@@ -9,6 +9,7 @@
 #include <string>
 #include <string_view>
 #include <utility>
+#include <vector>
 
 namespace tamblo {
 
@@ -29,6 +30,11 @@ public:
         const auto word = found != registered_.end() ? words_.find(found->second.name) : words_.end();
         return word != words_.end() ? State{0, word->second} : State{kNoState, 0};
     }
+    [[nodiscard]] int PostNamedNotification(std::string_view name) override {
+        posted.emplace_back(name);
+        post(posted.back(), words_[posted.back()]);
+        return 0;
+    }
     void CancelNamedNotification(int token) override { registered_.erase(token); }
 
     void post(const std::string& name, std::uint64_t word) {
@@ -41,6 +47,8 @@ public:
     }
     [[nodiscard]] std::size_t registrationCount() const noexcept { return registered_.size(); }
 
+    /// The names that the service itself has posted.
+    std::vector<std::string> posted;
     /// What registering answers; other than 0, it fails.
     int registrationStatus = 0;
 

@@ -9,12 +9,38 @@ namespace tamblo {
 FakePlatform::FakePlatform(LogLevel threshold, bool isInternalBuild) {
     log.setThreshold(threshold);
     deviceProperties.set("InternalBuild", isInternalBuild);
-    installPlatform({clock, workQueues, log, tracePoints, deviceProperties, preferences, namedNotifications,
-                     processInformation, deviceConditions, analyticsEvents, powerEvents, diagnosticsMetrics,
-                     callQuality, reportFiles, connections});
+    installWith({});
     forgetLogThresholds();
     forgetInternalBuild();
     resetReportingServerQueue();
+}
+
+void FakePlatform::installWith(const Others& others) {
+    const auto choose = [](auto* other, auto& fake) -> auto& {
+        return other != nullptr ? *other : fake;
+    };
+    installPlatform({.clock = clock,
+                     .workQueues = choose(others.workQueues, workQueues),
+                     .log = log,
+                     .tracePoints = choose(others.tracePoints, tracePoints),
+                     .deviceProperties = deviceProperties,
+                     .preferences = preferences,
+                     .namedNotifications = namedNotifications,
+                     .processInformation = processInformation,
+                     .deviceConditions = deviceConditions,
+                     .analyticsEvents = choose(others.analyticsEvents, analyticsEvents),
+                     .powerEvents = powerEvents,
+                     .diagnosticsMetrics = diagnosticsMetrics,
+                     .callQuality = choose(others.callQuality, callQuality),
+                     .reportFiles = reportFiles,
+                     .bugCapture = bugCapture,
+                     .bugReportDrafting = bugReportDrafting,
+                     .diagnosticCapture = diagnosticCapture,
+                     .memoryLog = memoryLog,
+                     .chanlog = chanlog,
+                     .processSampling = processSampling,
+                     .accessories = accessories,
+                     .connections = connections});
 }
 
 FakePlatform::~FakePlatform() {

@@ -2,10 +2,15 @@
 
 #include "platform/Platform.h"
 #include "tests/fakes/FakeAnalyticsEventService.h"
+#include "tests/fakes/FakeBugCaptureService.h"
+#include "tests/fakes/FakeBugReportDraftingService.h"
 #include "tests/fakes/FakeCallQualityService.h"
+#include "tests/fakes/FakeCaptures.h"
+#include "tests/fakes/FakeChanlogFacility.h"
 #include "tests/fakes/FakeClock.h"
 #include "tests/fakes/FakeConnectionService.h"
 #include "tests/fakes/FakeDeviceConditions.h"
+#include "tests/fakes/FakeDeviceFigures.h"
 #include "tests/fakes/FakeDeviceProperties.h"
 #include "tests/fakes/FakeDiagnosticsMetricsService.h"
 #include "tests/fakes/FakeLog.h"
@@ -29,6 +34,15 @@ public:
     FakePlatform(const FakePlatform&) = delete;
     FakePlatform& operator=(const FakePlatform&) = delete;
 
+    /// Services that a test brings along in place of the fakes; null for those that it does not.
+    struct Others {
+        WorkQueues* workQueues = nullptr;
+        TracePoints* tracePoints = nullptr;
+        AnalyticsEventService* analyticsEvents = nullptr;
+        CallQualityService* callQuality = nullptr;
+    };
+    void installWith(const Others& others);
+
     /// The process's reporting server queue, which runs when told.
     [[nodiscard]] FakeSerialQueue& serverQueue();
 
@@ -46,6 +60,13 @@ public:
     FakeDiagnosticsMetricsService diagnosticsMetrics;
     FakeCallQualityService callQuality;
     FakeReportFiles reportFiles;
+    FakeBugCaptureService bugCapture;
+    FakeBugReportDraftingService bugReportDrafting;
+    FakeDiagnosticCaptureService diagnosticCapture;
+    FakeMemoryLog memoryLog;
+    FakeChanlogFacility chanlog;
+    FakeProcessSampling processSampling;
+    FakeAccessories accessories;
     FakeConnectionService connections;
 };
 

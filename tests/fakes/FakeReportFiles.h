@@ -17,6 +17,7 @@ namespace tamblo {
 class FakeReportFiles final : public ReportFiles {
 public:
     [[nodiscard]] std::string reportingLogsDirectory() const override { return "/reports"; }
+    [[nodiscard]] std::string performanceLogsDirectory() const override { return "/performance"; }
     [[nodiscard]] std::optional<std::string> createDirectory(const std::string& path) override {
         createdDirectories.push_back(path);
         return directoryFailure;

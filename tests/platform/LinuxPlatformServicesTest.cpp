@@ -242,6 +242,8 @@ public:
     }
     [[nodiscard]] std::chrono::seconds utcOffset(WallTime) const override { return {}; }
 
+    void sleepFor(std::chrono::microseconds) override {}
+
 private:
     mutable int reads_ = 0;
 };

@@ -357,11 +357,7 @@ TEST(LinkmeterSummaryTest, OfManyMessagesAndKeysTakesNoLongerThanItsValues) {
 class RtcWorkerOnThreadsTest : public testing::Test {
 protected:
     void use(CallQualityService& service) {
-        const Platform& fakes = platform();
-        installPlatform({fakes.clock, *queues, fakes.log, fakes.tracePoints, fakes.deviceProperties,
-                         fakes.preferences, fakes.namedNotifications, fakes.processInformation,
-                         fakes.deviceConditions, fakes.analyticsEvents, fakes.powerEvents,
-                         fakes.diagnosticsMetrics, service, fakes.reportFiles, fakes.connections});
+        device.installWith({.workQueues = queues.get(), .callQuality = &service});
     }
     static std::shared_ptr<ZRReportingSessionRtcWorker>
     startedWorker(const std::shared_ptr<ZRReportingSession>& session) {

@@ -1,0 +1,7 @@
+#include "platform/linux/LinuxDiagnosticCapture.h"
+
+namespace tamblo {
+
+void LinuxDiagnosticCapture::captureStacks(StackCaptureRequest) {}
+
+} // namespace tamblo
