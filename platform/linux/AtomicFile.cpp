@@ -1,0 +1,92 @@
+#include "platform/linux/AtomicFile.h"
+
+#include "base/Format.h"
+#include "platform/linux/FileDescriptor.h"
+
+#include <atomic>
+#include <cerrno>
+#include <cstdint>
+#include <cstdio>
+
+#include <fcntl.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+namespace tamblo {
+
+namespace {
+
+constexpr mode_t kNewFileMode = S_IRUSR | S_IWUSR;
+constexpr mode_t kPermissions = 07777;
+
+/// Another name with every call of this process.
+std::string temporaryName() {
+    static std::atomic<std::uint64_t> count{0};
+    return formatted(".tamblo-{}-{}", ::getpid(), count.fetch_add(1, std::memory_order_relaxed));
+}
+
+/// What stands at the path is a process's that had this one's number and is gone.
+FileDescriptor createAnew(const std::string& path) {
+    const int flags = O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC;
+    int descriptor = ::open(path.c_str(), flags, kNewFileMode);
+    if (descriptor < 0 && errno == EEXIST && ::unlink(path.c_str()) == 0) {
+        descriptor = ::open(path.c_str(), flags, kNewFileMode);
+    }
+    return FileDescriptor(descriptor);
+}
+
+/// False with the reason in `errno`, as below.
+bool writeFully(int descriptor, std::string_view content) {
+    while (!content.empty()) {
+        const ssize_t count = ::write(descriptor, content.data(), content.size());
+        if (count < 0 && errno == EINTR) {
+            continue;
+        }
+        if (count <= 0) {
+            errno = count == 0 ? ENOSPC : errno;
+            return false;
+        }
+        content.remove_prefix(static_cast<std::size_t>(count));
+    }
+    return true;
+}
+
+bool fill(int descriptor, std::string_view content, const std::string& replaced, Durability durability) {
+    struct stat status {};
+    const bool modeIsRight = ::lstat(replaced.c_str(), &status) != 0 || !S_ISREG(status.st_mode) ||
+                             ::fchmod(descriptor, status.st_mode & kPermissions) == 0;
+    return modeIsRight && writeFully(descriptor, content) &&
+           (durability != Durability::onDisk || ::fsync(descriptor) == 0);
+}
+
+bool syncDirectory(const std::string& path) {
+    const FileDescriptor directory(::open(path.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+    return directory.isOpen() && ::fsync(directory.get()) == 0;
+}
+
+} // namespace
+
+int replaceFileAtomically(const std::string& path, std::string_view content, Durability durability) {
+    const std::size_t slash = path.find_last_of('/');
+    const std::string directory = slash == std::string::npos ? "." : path.substr(0, slash + 1);
+    const std::string temporary = formatted("{}/{}", directory, temporaryName());
+    {
+        const FileDescriptor file = createAnew(temporary);
+        if (!file.isOpen()) {
+            return errno;
+        }
+        if (!fill(file.get(), content, path, durability)) {
+            const int failure = errno;
+            ::unlink(temporary.c_str());
+            return failure;
+        }
+    }
+    if (std::rename(temporary.c_str(), path.c_str()) != 0) {
+        const int failure = errno;
+        ::unlink(temporary.c_str());
+        return failure;
+    }
+    return durability != Durability::onDisk || syncDirectory(directory) ? 0 : errno;
+}
+
+} // namespace tamblo
