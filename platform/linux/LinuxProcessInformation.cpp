@@ -1,15 +1,10 @@
 #include "platform/linux/LinuxProcessInformation.h"
 
-#include "base/Format.h"
-#include "base/Utf8.h"
 #include "platform/linux/SmallFile.h"
 
-#include <algorithm>
 #include <cerrno>
-#include <charconv>
 #include <cstdlib>
 #include <ctime>
-#include <string_view>
 #include <system_error>
 #include <utility>
 
@@ -25,41 +20,6 @@ std::chrono::nanoseconds readClock(clockid_t clock) noexcept {
     return std::chrono::seconds(time.tv_sec) + std::chrono::nanoseconds(time.tv_nsec);
 }
 
-/// The kernel cuts names at 15 bytes, through the middle of a character if need be, and takes any bytes for a
-/// name.
-std::string asUtf8(std::string name) {
-    if (isUtf8(name)) {
-        return name;
-    }
-    std::size_t last = name.size() - 1;
-    while (last > 0 && isUtf8Continuation(name[last])) {
-        --last;
-    }
-    if (static_cast<unsigned char>(name[last]) >= 0xC0 && isUtf8(std::string_view(name).substr(0, last))) {
-        name.resize(last);
-        return name;
-    }
-    for (char& character : name) {
-        if (static_cast<unsigned char>(character) >= 0x80) {
-            character = '?';
-        }
-    }
-    return name;
-}
-
-/// The bytes of a line such as "RssAnon:      1234 kB"; nothing without that line.
-std::optional<std::uint64_t> bytesOfField(std::string_view status, std::string_view name) {
-    const std::size_t at = status.find(formatted("\n{}:", name));
-    if (at == std::string_view::npos) {
-        return std::nullopt;
-    }
-    status.remove_prefix(at + name.size() + 2);
-    status.remove_prefix(std::min(status.find_first_not_of(" \t"), status.size()));
-    std::uint64_t kibibytes = 0;
-    const auto result = std::from_chars(status.data(), status.data() + status.size(), kibibytes);
-    return result.ec == std::errc() ? std::optional(kibibytes * 1024) : std::nullopt;
-}
-
 ProcessInformation::QueryError queryError(int code) {
     return {code, std::generic_category().message(code)};
 }
@@ -70,36 +30,25 @@ std::variant<std::uint64_t, ProcessInformation::QueryError> readFootprint(const 
     if (file.error != 0) {
         return queryError(file.error);
     }
-    const auto anonymous = bytesOfField(file.text, "RssAnon");
+    const auto anonymous = ProcessFiles::bytesOfField(file.text, "RssAnon");
     if (!anonymous) {
         return queryError(ENODATA);
     }
-    return *anonymous + bytesOfField(file.text, "RssShmem").value_or(0) +
-           bytesOfField(file.text, "VmSwap").value_or(0);
+    return *anonymous + ProcessFiles::bytesOfField(file.text, "RssShmem").value_or(0) +
+           ProcessFiles::bytesOfField(file.text, "VmSwap").value_or(0);
 }
 
 } // namespace
 
 LinuxProcessInformation::LinuxProcessInformation(std::string root, SteadyNow now)
-    : root_(std::move(root)), footprint_(kValidity, std::move(now)) {}
+    : root_(std::move(root)), files_(root_), footprint_(kValidity, std::move(now)) {}
 
 pid_t LinuxProcessInformation::ownProcessIdentifier() const noexcept {
     return ::getpid();
 }
 
 std::optional<std::string> LinuxProcessInformation::ProcessNameForPid(pid_t pid) const {
-    if (pid <= 0) {
-        return std::nullopt;
-    }
-    constexpr std::size_t kMaximumName = 64;
-    std::string name = SmallFile::read(formatted("{}/{}/comm", root_, pid), kMaximumName).text;
-    if (name.empty()) {
-        return std::nullopt;
-    }
-    if (name.back() == '\n') {
-        name.pop_back();
-    }
-    return asUtf8(std::move(name));
+    return files_.name(pid);
 }
 
 std::chrono::duration<double> LinuxProcessInformation::systemUptime() const noexcept {

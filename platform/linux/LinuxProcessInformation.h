@@ -1,6 +1,7 @@
 #pragma once
 
 #include "platform/ProcessInformation.h"
+#include "platform/linux/ProcessFiles.h"
 #include "platform/linux/RecentReading.h"
 
 #include <chrono>
@@ -29,6 +30,7 @@ public:
 
 private:
     const std::string root_;
+    const ProcessFiles files_;
     mutable RecentReading<std::variant<std::uint64_t, QueryError>> footprint_;
 };
 

@@ -1,20 +1,22 @@
 #pragma once
 
 #include "platform/ProcessSampling.h"
+#include "platform/linux/ProcessFiles.h"
 
 #include <string>
+#include <utility>
 
 namespace tamblo {
 
 /// Process figures from `/proc`.
 class LinuxProcessSampling final : public ProcessSampling {
 public:
-    explicit LinuxProcessSampling(std::string root = "/proc") : root_(std::move(root)) {}
+    explicit LinuxProcessSampling(std::string root = "/proc") : files_(std::move(root)) {}
 
-    [[nodiscard]] std::optional<ProcessSample> sample(pid_t pid) const override;
+    [[nodiscard]] std::optional<ProcessSample> sample(pid_t pid) const override { return files_.sample(pid); }
 
 private:
-    const std::string root_;
+    const ProcessFiles files_;
 };
 
 } // namespace tamblo

@@ -1,9 +1,0 @@
-#include "platform/linux/LinuxProcessSampling.h"
-
-namespace tamblo {
-
-std::optional<ProcessSample> LinuxProcessSampling::sample(pid_t) const {
-    return std::nullopt;
-}
-
-} // namespace tamblo
