@@ -3,48 +3,91 @@
 #include "base/Json.h"
 #include "platform/Clock.h"
 
+#include <concepts>
 #include <cstdint>
+#include <span>
+#include <string>
 #include <string_view>
 
 namespace tamblo {
 
-/// One line of a sink as it is appended to the file's buffer: an object that begins with "time", the seconds
-/// since 1970, and goes on with the fields in the order in which they are added. It ends with this object.
-class SinkLine {
+/// One object of a sink's line as it is appended to the file's buffer, with the fields in the order in which
+/// they are added. It ends with this object. Names need no escaping.
+class SinkObject {
 public:
-    SinkLine(TextBuffer& line, WallTime time) : line_(line) {
-        line_.append("{\"time\":");
-        appendJsonNumber(line_, secondsSince1970(time));
-    }
-    ~SinkLine() { line_.append('}'); }
-    SinkLine(const SinkLine&) = delete;
-    SinkLine& operator=(const SinkLine&) = delete;
+    explicit SinkObject(TextBuffer& line) : line_(line) { line_.append('{'); }
+    ~SinkObject() { line_.append('}'); }
+    SinkObject(const SinkObject&) = delete;
+    SinkObject& operator=(const SinkObject&) = delete;
 
-    SinkLine& text(std::string_view name, std::string_view value) {
+    SinkObject& text(std::string_view name, std::string_view value) {
         begin(name);
         appendJsonString(line_, value);
         return *this;
     }
-    SinkLine& number(std::string_view name, std::uint64_t value) {
+    template <std::integral Number> SinkObject& number(std::string_view name, Number value) {
         begin(name);
         appendJson(line_, Value(value));
         return *this;
     }
-    SinkLine& dictionary(std::string_view name, const Dictionary& value) {
+    SinkObject& number(std::string_view name, double value) {
+        begin(name);
+        appendJsonNumber(line_, value);
+        return *this;
+    }
+    SinkObject& dictionary(std::string_view name, const Dictionary& value) {
         begin(name);
         appendJson(line_, value);
         return *this;
     }
+    SinkObject& texts(std::string_view name, std::span<const std::string> values) {
+        return array(name, values,
+                     [](TextBuffer& line, std::string_view value) { appendJsonString(line, value); });
+    }
+    /// An object within this one; `fill` is given it as a `SinkObject&` and adds its fields.
+    template <typename Fill> SinkObject& object(std::string_view name, Fill&& fill) {
+        begin(name);
+        SinkObject inner(line_);
+        fill(inner);
+        return *this;
+    }
+    /// An array; `append` is given the line and each of the elements, and appends it as JSON: with a
+    /// `SinkObject` of its own, or by the functions of `base/Json.h`.
+    template <typename Elements, typename Append>
+    SinkObject& array(std::string_view name, const Elements& elements, Append&& append) {
+        begin(name);
+        line_.append('[');
+        bool isFirst = true;
+        for (const auto& element : elements) {
+            if (!isFirst) {
+                line_.append(',');
+            }
+            isFirst = false;
+            append(line_, element);
+        }
+        line_.append(']');
+        return *this;
+    }
 
 private:
-    /// Names need no escaping.
     void begin(std::string_view name) {
-        line_.append(",\"");
+        if (!isEmpty_) {
+            line_.append(',');
+        }
+        isEmpty_ = false;
+        line_.append('"');
         line_.append(name);
         line_.append("\":");
     }
 
     TextBuffer& line_;
+    bool isEmpty_ = true;
+};
+
+/// One line of a sink: an object that begins with "time", the seconds since 1970.
+class SinkLine : public SinkObject {
+public:
+    SinkLine(TextBuffer& line, WallTime time) : SinkObject(line) { number("time", secondsSince1970(time)); }
 };
 
 } // namespace tamblo
