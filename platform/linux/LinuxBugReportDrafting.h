@@ -8,7 +8,9 @@
 
 namespace tamblo {
 
-/// The bug-report drafting service as a sink file, `bug-report-drafts.jsonl`.
+/// The bug-report drafting service as a sink file, `bug-report-drafts.jsonl`: each draft is a line, for the
+/// program that shows drafts to the user. The request is done once its line is appended; what becomes of the
+/// file is told by the file itself.
 class LinuxBugReportDrafting final : public BugReportDraftingService {
 public:
     /// Clock and log must outlive it.
