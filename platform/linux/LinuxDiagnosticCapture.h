@@ -4,7 +4,11 @@
 #include "platform/DiagnosticCaptureService.h"
 #include "platform/WorkQueue.h"
 #include "platform/linux/AppendOnlyFile.h"
+#include "platform/linux/LimitedQueue.h"
+#include "platform/linux/ProcessFiles.h"
 
+#include <chrono>
+#include <cstddef>
 #include <functional>
 #include <string>
 #include <vector>
@@ -13,28 +17,45 @@
 
 namespace tamblo {
 
-/// The diagnostic capture service as a sink file, `stack-captures.jsonl`.
+/// The diagnostic capture service as a sink file, `stack-captures.jsonl`. Under `stacks` there is one object
+/// for each process that is looked at:
+///
+///     {"process":812,"name":"player","threads":[{"thread":815,"name":"io","samples":[
+///         {"count":5,"state":"S (sleeping)","waitChannel":"pipe_read","kernelStack":["pipe_read+0x…",…]}]}]}
+///
+/// Looked at are the processes that the payload names and those of the clients that are connected when the
+/// capture is asked for, as many as a `ProcessList` takes. All their threads are sampled five times within a
+/// tenth of a second, on a queue of the service's own; samples in a row that are equal are one, with their
+/// count. A thread that ends keeps the samples that it had, one that begins in that time is not seen.
 class LinuxDiagnosticCapture final : public DiagnosticCaptureService {
 public:
     using ClientProcesses = std::function<std::vector<pid_t>()>;
 
+    static constexpr int kSamples = 5;
+    static constexpr std::chrono::milliseconds kSampleInterval{25};
+    /// Of all processes together: a sample takes some thirty microseconds, so that these take about an
+    /// interval. Those that are looked at last go without.
+    static constexpr std::size_t kMaximumThreads = 1024;
+    /// Each takes a tenth of a second, by which it can hold up the service's end.
+    static constexpr std::size_t kMaximumWaiting = 4;
+
     /// What is referred to must outlive the service, except the queues. The client processes are asked for on
     /// any thread.
-    LinuxDiagnosticCapture(const std::string& logsDirectory, const Clock& clock, WorkQueues& workQueues,
+    LinuxDiagnosticCapture(const std::string& logsDirectory, Clock& clock, WorkQueues& workQueues,
                            ClientProcesses clientProcesses, StructuredLog& log,
-                           FileOperations& operations = FileOperations::system())
-        : clock_(clock),
-          workQueues_(workQueues),
-          clientProcesses_(std::move(clientProcesses)),
-          file_(logsDirectory + "/stack-captures.jsonl", "zrrp", log, operations) {}
+                           ProcessFiles files = ProcessFiles(),
+                           FileOperations& operations = FileOperations::system());
 
     void captureStacks(StackCaptureRequest request) override;
 
 private:
-    const Clock& clock_;
-    WorkQueues& workQueues_;
+    void capture(const StackCaptureRequest& request, const std::vector<pid_t>& processes);
+
+    Clock& clock_;
     const ClientProcesses clientProcesses_;
+    const ProcessFiles files_;
     AppendOnlyFile file_;
+    LimitedQueue queue_;
 };
 
 } // namespace tamblo

@@ -1,0 +1,50 @@
+#pragma once
+
+#include "platform/StructuredLog.h"
+#include "platform/WorkQueue.h"
+
+#include <cstddef>
+#include <cstdint>
+#include <memory>
+#include <mutex>
+#include <string>
+#include <string_view>
+
+namespace tamblo {
+
+/// A serial queue for work that takes its time, made with the first piece, on which only so many pieces may
+/// wait: those beyond are dropped and counted. That is one error line when it begins and one, with the count,
+/// once no piece waits any more. Member of a platform service, which outlives the queues; any thread.
+class LimitedQueue {
+public:
+    struct Limit {
+        std::size_t waiting;   ///< besides the piece that runs
+        std::string_view what; ///< the pieces' name in the log: "stack captures"
+        std::string_view categoryCode;
+    };
+
+    /// The limit's texts must be constants.
+    LimitedQueue(WorkQueues& workQueues, std::string label, Limit limit, StructuredLog& log)
+        : limit_(limit), label_(std::move(label)), workQueues_(workQueues), log_(log) {}
+
+    void post(Work work);
+
+private:
+    /// Whether the piece may wait.
+    [[nodiscard]] bool admit();
+    void begin();
+
+    const Limit limit_;
+    const std::string label_;
+    WorkQueues& workQueues_;
+    StructuredLog& log_;
+
+    std::mutex mutex_; ///< guards the two that follow
+    std::size_t waiting_ = 0;
+    std::uint64_t dropped_ = 0; ///< since none waited
+
+    std::once_flag isQueueMade_;
+    std::unique_ptr<SerialQueue> queue_;
+};
+
+} // namespace tamblo
