@@ -6,6 +6,7 @@
 #include "workers/producers/ZRReportingSessionVolumeMessagesWorker.h"
 #include "workers/sinks/ZRReportingSessionEventryWorker.h"
 #include "workers/sinks/ZRReportingSessionJouleryWorker.h"
+#include "workers/sinks/ZRReportingSessionMemoryLogWorker.h"
 #include "workers/sinks/ZRReportingSessionQMXWorker.h"
 #include "workers/sinks/ZRReportingSessionRtcWorker.h"
 #include "workers/sinks/ZRReportingSessionSummaryJsonFileWorker.h"
@@ -45,7 +46,10 @@ constexpr std::array<WorkerClass, 17> kWorkerClasses{{
      .startOnInit = true,
      .handleSingleMessageSession = true,
      .initWithSession = initWithSession<ZRReportingSessionJouleryWorker>},
-    {.name = "ZRReportingSessionMemoryLogWorker", .role = kConsumer, .startOnInit = true},
+    {.name = "ZRReportingSessionMemoryLogWorker",
+     .role = kConsumer,
+     .startOnInit = true,
+     .initWithSession = initWithSession<ZRReportingSessionMemoryLogWorker>},
     {.name = "ZRReportingSessionQMXWorker",
      .role = kConsumer,
      .startOnInit = true,
