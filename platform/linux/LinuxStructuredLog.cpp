@@ -186,7 +186,9 @@ void LinuxStructuredLog::write(LogLevel level, std::string_view categoryCode,
     buffer.appendHarmless(categoryCode);
     buffer.append(" ");
     buffer.appendHarmless(line);
-    if (!reportDropped() || !put(buffer.finish())) {
+    const std::string_view bytes = buffer.finish();
+    lastLines_.add(bytes);
+    if (!reportDropped() || !put(bytes)) {
         dropped_.fetch_add(1, std::memory_order_relaxed);
     }
 }

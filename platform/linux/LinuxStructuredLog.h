@@ -3,10 +3,12 @@
 #include "platform/StructuredLog.h"
 #include "platform/linux/FileDescriptor.h"
 #include "platform/linux/LogFilter.h"
+#include "platform/linux/LogRing.h"
 
 #include <atomic>
 #include <cstddef>
 #include <cstdint>
+#include <string>
 #include <string_view>
 
 #include <sys/types.h>
@@ -18,7 +20,8 @@ namespace tamblo {
 /// A record is one write, of at most `kMaximumLine` bytes. What a client can put into a text cannot make a
 /// line of its own or reach a terminal: control characters are written as escapes. A reader that is slow or
 /// gone neither holds up the service nor ends it: what cannot be written at once is dropped, and the next
-/// line that can be is preceded by one that says how many were. Any thread; nothing is locked or allocated.
+/// line that can be is preceded by one that says how many were. The last lines are remembered, those that
+/// were dropped among them. Any thread; the only lock is the one in which a line is remembered.
 class LinuxStructuredLog final : public StructuredLog {
 public:
     static constexpr std::size_t kMaximumLine = 8192;
@@ -32,6 +35,8 @@ public:
 
     [[nodiscard]] LogLevel threshold(std::string_view categoryCode) const noexcept override;
     void write(LogLevel level, std::string_view categoryCode, std::string_view line) noexcept override;
+    /// The last lines, as they are written to standard error.
+    [[nodiscard]] std::string lastLines() const { return lastLines_.text(); }
 
 private:
     /// How to write without waiting.
@@ -47,6 +52,7 @@ private:
     [[nodiscard]] bool reportDropped() noexcept;
 
     LogFilter filter_;
+    LogRing lastLines_;
     int descriptor_;
     FileDescriptor own_;
     Channel channel_ = Channel::plain;
