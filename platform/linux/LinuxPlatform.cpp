@@ -126,6 +126,9 @@ struct LinuxPlatform::Services {
           connections(loop, log),
           diagnosticCapture(
               directories.logs, clock, workQueues, [this] { return connections.clientProcesses(); }, log) {}
+    ~Services() { bugCapture.endSessions(); }
+    Services(const Services&) = delete;
+    Services& operator=(const Services&) = delete;
 
     // First, as it makes sure that standard error is open before anything else can take its number.
     LinuxStructuredLog log;

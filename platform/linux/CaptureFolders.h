@@ -1,0 +1,68 @@
+#pragma once
+
+#include "platform/Clock.h"
+#include "platform/StructuredLog.h"
+
+#include <chrono>
+#include <cstdint>
+#include <span>
+#include <string>
+#include <string_view>
+
+namespace tamblo {
+
+/// A file of a capture, as it is to stand in the capture's folder.
+struct CaptureFile {
+    std::string name;
+    std::string text;
+};
+
+/// The directory with a folder for each capture, named by its identifier.
+///
+/// A folder is written under another name, which begins with a dot, and renamed when it is complete: what has
+/// a capture's name is whole, whenever the service was killed. What such a one left is removed with the next
+/// capture, as are folders that are old or more than there is room for, the oldest first. Only what the
+/// service has named itself is removed, and no symbolic link is followed.
+///
+/// Directory and files are the owner's alone. A directory that cannot be written is one error line in the log
+/// until it can be again. Used by one thread at a time, which waits for the disk.
+class CaptureFolders {
+public:
+    static constexpr std::chrono::days kMaximumAge{30};
+    struct Limits {
+        /// Of all folders, by the lengths of their files. A capture of a busy session takes about 1 MiB.
+        std::uint64_t totalSize = 200U << 20U;
+    };
+
+    /// The directory is made with the first folder; its parent has to be there. The log must outlive this
+    /// object.
+    CaptureFolders(std::string directory, StructuredLog& log)
+        : CaptureFolders(std::move(directory), log, {}) {}
+    CaptureFolders(std::string directory, StructuredLog& log, Limits limits)
+        : directory_(std::move(directory)), log_(log), limits_(limits) {}
+
+    /// An identifier, `20260301T120000.250Z-9f86d081`: sorts by time, is a file name everywhere, and is
+    /// unique as the number, of which the last 32 bits are taken, is.
+    [[nodiscard]] static std::string identifier(WallTime time, std::uint64_t number);
+
+    /// Writes a capture's folder, or none.
+    void store(std::string_view identifier, std::span<const CaptureFile> files, WallTime now);
+    /// Replaces a file beside the folders.
+    void keep(std::string_view name, std::string_view text);
+
+private:
+    [[nodiscard]] std::string makeDirectory() const;
+    [[nodiscard]] std::string write(std::string_view identifier, std::span<const CaptureFile> files) const;
+    void removeOld(WallTime now);
+    [[nodiscard]] std::string remove(const std::string& name) const;
+    void tell(bool& isOut, std::string_view problem, std::string_view consequence);
+
+    const std::string directory_;
+    StructuredLog& log_;
+    const Limits limits_;
+    /// Whether the log knows that nothing can be written, or removed.
+    bool isWritingOut_ = false;
+    bool isRemovingOut_ = false;
+};
+
+} // namespace tamblo
