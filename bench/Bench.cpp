@@ -28,8 +28,9 @@ std::string_view describe(Placement placement) noexcept {
 
 ServiceProcess::Settings Bench::place(Placement placement) const {
     pinThisThread(clientProcessorOf(placement));
-    return {
-        tamblod_, placement == Placement::twoCores ? serviceProcessor() : clientProcessorOf(placement), {}};
+    return {.program = tamblod_,
+            .processor =
+                placement == Placement::twoCores ? serviceProcessor() : clientProcessorOf(placement)};
 }
 
 const SocketFloor& Bench::socketFloor(Placement placement) {

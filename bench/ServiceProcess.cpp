@@ -52,6 +52,36 @@ FileDescriptor bindNotifySocket(const std::string& path) {
     return socket;
 }
 
+/// One driver's channels, twenty of them.
+std::string driverChannels(int driver) {
+    std::string channels = "[";
+    for (int i = 0; i < 20; ++i) {
+        const std::string name = "\"driver\": \"driver" + std::to_string(driver) +
+                                 "\", \"group\": \"Haptics\", \"subgroup\": \"Stats\", \"name\": \"channel " +
+                                 std::to_string(i) + "\", \"unit\": \"ms\", ";
+        constexpr const char* kFigures[] = {
+            R"("format": "simple", "value": 12345)",
+            R"("format": "state", "states": [{"name": "idle", "transitions": 12, "residency": 99000},)"
+            R"( {"name": "running", "transitions": 12, "residency": 1234}])",
+            R"("format": "histogram", "buckets": [{"lower": 0, "upper": 100, "hits": 5},)"
+            R"( {"lower": 100, "upper": 200, "hits": 17}], "min": 3, "max": 177)",
+        };
+        channels += (i == 0 ? "{" : ",\n{") + name + kFigures[i % 3] + "}";
+    }
+    return channels + "]\n";
+}
+
+void makeInternalBuild(const TemporaryDirectory& directory) {
+    directory.write("configuration/device-properties.json",
+                    R"({"InternalBuild": true, "HapticLeakCapture": true})");
+    directory.write("configuration/preferences/com.vandra.tamblo.zrreporting.json",
+                    R"({"enable_stackburst": true, "TalvixInvalidXyBackOffSeconds": 3600})");
+    directory.makeDirectory("runtime/chanlog");
+    for (int driver = 0; driver < 10; ++driver) {
+        directory.write("runtime/chanlog/driver" + std::to_string(driver) + ".json", driverChannels(driver));
+    }
+}
+
 } // namespace
 
 ServiceProcess::ServiceProcess(const Settings& settings) {
@@ -62,6 +92,9 @@ ServiceProcess::ServiceProcess(const Settings& settings) {
     if (settings.eventsInUse) {
         directory_.write("configuration/preferences/com.vandra.tamblo.analytics.json",
                          "{\"events_in_use\": " + *settings.eventsInUse + "}\n");
+    }
+    if (settings.isInternalBuild) {
+        makeInternalBuild(directory_);
     }
     const std::string notifyPath = directory_.path() + "/notify";
     const FileDescriptor notify = bindNotifySocket(notifyPath);

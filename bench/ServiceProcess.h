@@ -22,6 +22,8 @@ public:
         int processor = 0;
         /// The names of the analytics events in use, as a JSON array; all of them without it.
         std::optional<std::string> eventsInUse;
+        /// With everything on that an internal build can have, and some two hundred driver channels.
+        bool isInternalBuild = false;
     };
 
     explicit ServiceProcess(const Settings& settings);
