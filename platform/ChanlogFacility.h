@@ -1,6 +1,5 @@
 #pragma once
 
-#include <cstddef>
 #include <cstdint>
 #include <memory>
 #include <optional>
@@ -48,8 +47,10 @@ struct ChanlogChannel {
     std::int64_t maximum = 0;           ///< histogram: the greatest
 };
 
-/// Channels that belong together, immutable and cheap to copy.
-using ChanlogChannels = std::shared_ptr<const std::vector<ChanlogChannel>>;
+/// Immutable: samples between which a channel has not moved share it.
+using ChanlogChannelRef = std::shared_ptr<const ChanlogChannel>;
+/// Channels that belong together, immutable and cheap to copy. Null stands for a sample that was not taken.
+using ChanlogChannels = std::shared_ptr<const std::vector<ChanlogChannelRef>>;
 
 /// Which channels are meant: those of the group and subgroup; a name that is absent leaves any.
 struct ChanlogSelection {
@@ -57,7 +58,8 @@ struct ChanlogSelection {
     std::optional<std::string> subGroupName;
 };
 
-/// The channels of one selection, subscribed to. Owned by the subscriber; ends with this object.
+/// The channels of one selection, subscribed to. Owned by the subscriber, used by one thread at a time; ends
+/// with this object, which may outlive its facility as long as it is not sampled.
 class ChanlogSubscription {
 public:
     virtual ~ChanlogSubscription() = default;
@@ -65,27 +67,28 @@ public:
     [[nodiscard]] virtual const ChanlogChannels& subscribedChannels() const = 0;
 };
 
-/// A moment at which subscriptions are sampled: what they have in common is read once, with the first of
-/// them. Short-lived, used on one thread.
+/// A moment at which the channels are looked at: what the calls have in common is read once, with the first
+/// of them. Short-lived, used on one thread; its facility must outlive it.
+///
+/// What comes in place of channels is an error code, 0 when there is none to tell.
 class ChanlogSampling {
 public:
     virtual ~ChanlogSampling() = default;
-    /// The figures of the subscription's channels, or an error code; 0 when there is none to tell.
+    /// The channels that there are, none perhaps.
     [[nodiscard]] virtual std::variant<ChanlogChannels, int>
-    sample(const ChanlogSubscription& subscription) = 0;
+    channelsOf(const ChanlogSelection& selection) = 0;
+    /// The figures of the subscription's channels.
+    [[nodiscard]] virtual std::variant<ChanlogChannels, int> sample(ChanlogSubscription& subscription) = 0;
 };
 
 /// The driver-statistics channel facility. Any thread; may read files.
 class ChanlogFacility {
 public:
     virtual ~ChanlogFacility() = default;
-    /// The channels that there are now, none perhaps, or an error code.
-    [[nodiscard]] virtual std::variant<ChanlogChannels, int>
-    channelsOf(const ChanlogSelection& selection) = 0;
-    /// Or an error code.
+    [[nodiscard]] virtual std::unique_ptr<ChanlogSampling> beginSampling() = 0;
+    /// To channels that were found with this selection. Or an error code.
     [[nodiscard]] virtual std::variant<std::unique_ptr<ChanlogSubscription>, int>
     subscribe(const ChanlogSelection& selection, const ChanlogChannels& channels) = 0;
-    [[nodiscard]] virtual std::unique_ptr<ChanlogSampling> beginSampling() = 0;
     /// What the later sample has gained over the earlier one, channel by channel; or an error code, as
     /// without an earlier one.
     [[nodiscard]] virtual std::variant<ChanlogChannels, int> difference(const ChanlogChannels& earlier,

@@ -37,11 +37,6 @@ int readUpTo(int descriptor, std::size_t maximum, std::string& content) {
     return 0;
 }
 
-std::string stateOf(const struct stat& status) {
-    return formatted("{} {} {} {} {}", status.st_dev, status.st_ino, status.st_size, status.st_mtim.tv_sec,
-                     status.st_mtim.tv_nsec);
-}
-
 std::string systemError(int number) {
     return std::generic_category().message(number);
 }
@@ -49,49 +44,64 @@ std::string systemError(int number) {
 } // namespace
 
 std::optional<Dictionary> JsonFile::read(StructuredLog& log) {
+    const std::optional<Value> value = readOfKind(Value::Kind::dictionary, "an object", log);
+    return value ? std::optional(value->dictionaryValue()) : std::nullopt;
+}
+
+std::optional<Value> JsonFile::readArray(StructuredLog& log) {
+    return readOfKind(Value::Kind::array, "an array", log);
+}
+
+std::optional<Value> JsonFile::readOfKind(Value::Kind kind, std::string_view name, StructuredLog& log) {
+    std::optional<Value> value = readValue(log);
+    if (value && value->kind() != kind) {
+        report(log, formatted("line 1, column 1: not {}", name));
+        value.reset();
+    } else if (value) {
+        reportedFault_.clear();
+    }
+    return value;
+}
+
+std::optional<Value> JsonFile::readValue(StructuredLog& log) {
+    state_ = {};
     // Not blocking, or a pipe of that name would hold up the service until somebody writes into it.
     const FileDescriptor file(::open(path_.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY));
     if (!file.isOpen()) {
         if (errno == ENOENT || errno == ENOTDIR) {
-            reported_.clear();
+            reportedFault_.clear();
         } else {
-            report(log, {}, systemError(errno));
+            report(log, systemError(errno));
         }
         return std::nullopt;
     }
     struct stat status {};
     if (::fstat(file.get(), &status) != 0 || !S_ISREG(status.st_mode)) {
-        report(log, {}, "not a regular file");
+        report(log, "not a regular file");
         return std::nullopt;
     }
+    state_ = FileState::of(status);
     std::string content;
     const std::size_t size = static_cast<std::size_t>(status.st_size);
-    const int failure = size > kMaximumSize ? EFBIG : readUpTo(file.get(), size, content);
+    const int failure = size > maximumSize_ ? EFBIG : readUpTo(file.get(), size, content);
     if (failure != 0) {
-        report(log, stateOf(status), systemError(failure));
+        report(log, systemError(failure));
         return std::nullopt;
     }
-    const std::variant<Value, JsonError> read = readJson(content);
+    std::variant<Value, JsonError> read = readJson(content);
     if (const JsonError* error = std::get_if<JsonError>(&read)) {
-        report(log, stateOf(status),
-               formatted("line {}, column {}: {}", error->line, error->column, error->message));
+        report(log, formatted("line {}, column {}: {}", error->line, error->column, error->message));
         return std::nullopt;
     }
-    const Value& value = std::get<Value>(read);
-    if (!value.isDictionary()) {
-        report(log, stateOf(status), "line 1, column 1: not an object");
-        return std::nullopt;
-    }
-    reported_.clear();
-    return value.dictionaryValue();
+    return std::get<Value>(std::move(read));
 }
 
-void JsonFile::report(StructuredLog& log, std::string state, std::string_view fault) {
-    appendFormatted(state, " {}", fault);
-    if (state == reported_) {
+void JsonFile::report(StructuredLog& log, std::string_view fault) {
+    if (state_ == reportedState_ && fault == reportedFault_) {
         return;
     }
-    reported_ = std::move(state);
+    reportedState_ = state_;
+    reportedFault_ = fault;
     log.report(LogLevel::error, "zrrs", formatted("{}: {}; nothing of it is used", path_, fault));
 }
 

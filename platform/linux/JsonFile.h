@@ -2,33 +2,48 @@
 
 #include "base/Dictionary.h"
 #include "platform/StructuredLog.h"
+#include "platform/linux/FileState.h"
 
+#include <cstddef>
 #include <optional>
 #include <string>
+#include <string_view>
 
 namespace tamblo {
 
-/// A file that holds one JSON object, written by somebody else: an operator, a test, another program.
+/// A file that holds one JSON object or array, written by somebody else: an operator, a test, another
+/// program.
 ///
-/// A missing file is no object and no error. One that cannot be read, is not JSON or no object is one error
-/// line for each state of the file that is met, naming the file and the place. Not thread-safe; reading may
-/// block on the disk.
+/// A missing file is no value and no error. One that cannot be read, is not JSON or holds another kind of
+/// value is one error line for each state of the file that is met, naming the file and the place. Not
+/// thread-safe; reading may block on the disk.
 class JsonFile {
 public:
     /// Larger files are refused, unread.
     static constexpr std::size_t kMaximumSize = 4U << 20U;
 
-    explicit JsonFile(std::string path) : path_(std::move(path)) {}
+    explicit JsonFile(std::string path, std::size_t maximumSize = kMaximumSize)
+        : path_(std::move(path)), maximumSize_(maximumSize) {}
 
     [[nodiscard]] std::optional<Dictionary> read(StructuredLog& log);
+    /// Of a file that holds an array.
+    [[nodiscard]] std::optional<Value> readArray(StructuredLog& log);
+    /// The file's state as it was just before it was read last; that of no file when there was none.
+    [[nodiscard]] const FileState& state() const noexcept { return state_; }
     [[nodiscard]] const std::string& path() const noexcept { return path_; }
 
 private:
-    void report(StructuredLog& log, std::string state, std::string_view fault);
+    [[nodiscard]] std::optional<Value> readOfKind(Value::Kind kind, std::string_view name,
+                                                  StructuredLog& log);
+    [[nodiscard]] std::optional<Value> readValue(StructuredLog& log);
+    void report(StructuredLog& log, std::string_view fault);
 
     std::string path_;
-    /// The state of the file and its fault as reported last.
-    std::string reported_;
+    std::size_t maximumSize_;
+    FileState state_;
+    /// The state of the file and its fault as reported last; no fault when it was well.
+    FileState reportedState_;
+    std::string reportedFault_;
 };
 
 } // namespace tamblo

@@ -1,0 +1,39 @@
+#pragma once
+
+#include "platform/ChanlogFacility.h"
+#include "platform/StructuredLog.h"
+
+#include <cstddef>
+#include <optional>
+#include <set>
+#include <string>
+
+namespace tamblo {
+
+/// Works out what the channels of one sample have gained over those of an earlier one.
+///
+/// Values, transitions, residencies and hits subtract; a state's duty cycle is its share of the residency
+/// gained; minimum and maximum are the later sample's. Channels are the same by driver, group, subgroup, name
+/// and format, states by name, buckets by bounds; what only one sample has is left out. A counter that has
+/// run backwards or a value whose gain is no 64-bit number means that its channel is left out, with one error
+/// line until it can be told again; a simple value may fall. Not thread-safe.
+class ChanlogDifference {
+public:
+    /// Channels whose trouble is remembered; beyond these all are forgotten and may be told anew.
+    static constexpr std::size_t kMaximumTroubled = 4096;
+
+    /// The log must outlive this.
+    explicit ChanlogDifference(StructuredLog& log) : log_(log) {}
+
+    /// In the later sample's order. Takes time proportional to the number of channels where the samples have
+    /// them in the same order, a logarithm more where not.
+    [[nodiscard]] ChanlogChannels between(const ChanlogChannels& earlier, const ChanlogChannels& later);
+
+private:
+    void report(const ChanlogChannel& channel, const char* trouble);
+
+    StructuredLog& log_;
+    std::set<std::string> troubled_;
+};
+
+} // namespace tamblo

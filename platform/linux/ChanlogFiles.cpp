@@ -1,0 +1,160 @@
+#include "platform/linux/ChanlogFiles.h"
+
+#include "base/Format.h"
+#include "platform/linux/ChanlogChannelJson.h"
+#include "platform/linux/FileDescriptor.h"
+
+#include <algorithm>
+#include <cerrno>
+#include <cstdint>
+#include <ctime>
+#include <memory>
+#include <optional>
+#include <system_error>
+#include <utility>
+#include <variant>
+
+#include <dirent.h>
+#include <fcntl.h>
+#include <sys/stat.h>
+
+namespace tamblo {
+
+namespace {
+
+constexpr std::string_view kLogCategory = "zrrd";
+
+/// Publishers that replace a file write the new one under a name of another kind, or a hidden one.
+bool isChannelFile(std::string_view name) noexcept {
+    return name.ends_with(".json") && !name.starts_with('.');
+}
+
+std::vector<std::string> channelFilesIn(DIR* directory) {
+    std::vector<std::string> names;
+    for (std::size_t count = 0; count < ChanlogFiles::kMaximumEntries; ++count) {
+        const dirent* entry = ::readdir(directory);
+        if (entry == nullptr) {
+            break;
+        }
+        if (isChannelFile(entry->d_name)) {
+            names.emplace_back(entry->d_name);
+        }
+    }
+    std::sort(names.begin(), names.end());
+    return names;
+}
+
+/// Whether no later change of the file can bear the same times.
+bool isOld(const FileState& state) noexcept {
+    timespec now{};
+    ::clock_gettime(CLOCK_REALTIME_COARSE, &now);
+    const std::int64_t seconds = now.tv_sec - state.changedSeconds;
+    if (seconds < 0 || seconds > 1) {
+        return seconds > 0;
+    }
+    const std::chrono::nanoseconds age =
+        std::chrono::seconds(seconds) + std::chrono::nanoseconds(now.tv_nsec - state.changedNanoseconds);
+    return age >= ChanlogFiles::kCertainAge;
+}
+
+} // namespace
+
+bool ChanlogFiles::read(StructuredLog& log) {
+    const std::unique_ptr<DIR, int (*)(DIR*)> directory(::opendir(directory_.c_str()), ::closedir);
+    if (directory == nullptr) {
+        const bool isMissing = errno == ENOENT || errno == ENOTDIR;
+        report(log, isMissing ? std::string()
+                              : formatted("{}: {}; no driver statistics are had from there", directory_,
+                                          std::generic_category().message(errno)));
+        return !std::exchange(files_, {}).empty();
+    }
+    return readFiles(::dirfd(directory.get()), channelFilesIn(directory.get()), log);
+}
+
+bool ChanlogFiles::readFiles(int directory, const std::vector<std::string>& names, StructuredLog& log) {
+    bool isChanged = false;
+    Files earlier = std::exchange(files_, {});
+    std::string fault;
+    std::size_t room = kMaximumTotalSize;
+    for (const std::string& name : names) {
+        struct stat status {};
+        if (::fstatat(directory, name.c_str(), &status, 0) != 0) {
+            continue; // it went meanwhile
+        }
+        const auto size = std::min(static_cast<std::size_t>(status.st_size), kMaximumFileSize);
+        if (files_.size() == kMaximumFiles || size > room) {
+            fault = formatted("{}/{}: more than {} files or {} bytes in all; it and those behind it in the "
+                              "order of names are left out",
+                              directory_, name, kMaximumFiles, kMaximumTotalSize);
+            break;
+        }
+        room -= size;
+        auto known = earlier.extract(name);
+        if (known.empty()) {
+            const auto made =
+                files_.emplace(name, File{JsonFile(directory_ + "/" + name, kMaximumFileSize)}).first;
+            isChanged = readFile(made->second, FileState::of(status), log) || isChanged;
+        } else {
+            isChanged = readFile(known.mapped(), FileState::of(status), log) || isChanged;
+            files_.insert(std::move(known));
+        }
+    }
+    report(log, std::move(fault));
+    return isChanged || !earlier.empty();
+}
+
+bool ChanlogFiles::readFile(File& file, const FileState& state, StructuredLog& log) {
+    if (file.isCertain && state == file.json.state()) {
+        return false;
+    }
+    const bool hadChannels = !file.channels.empty();
+    file.channels.clear();
+    const std::optional<Value> array = file.json.readArray(log);
+    file.isCertain = isOld(file.json.state());
+    if (array) {
+        takeChannels(file, *array, log);
+    }
+    return hadChannels || !file.channels.empty();
+}
+
+void ChanlogFiles::takeChannels(File& file, const Value& array, StructuredLog& log) {
+    const auto elements = array.arrayValue();
+    std::vector<std::string> faults;
+    std::size_t untold = 0;
+    file.channels.reserve(elements.size());
+    for (std::size_t i = 0; i < elements.size(); ++i) {
+        auto read = readChanlogChannel(elements[i]);
+        if (auto* channel = std::get_if<ChanlogChannel>(&read)) {
+            file.channels.push_back(std::make_shared<const ChanlogChannel>(std::move(*channel)));
+        } else if (faults.size() < kMaximumFaultsTold) {
+            faults.push_back(formatted("{}: channel {}: {}; it is left out", file.json.path(), i,
+                                       std::get<std::string>(read)));
+        } else {
+            ++untold;
+        }
+    }
+    if (untold > 0) {
+        faults.push_back(formatted("{}: {} more channels are left out", file.json.path(), untold));
+    }
+    if (faults != file.reportedFaults) {
+        for (const std::string& fault : faults) {
+            log.report(LogLevel::error, kLogCategory, fault);
+        }
+        file.reportedFaults = std::move(faults);
+    }
+}
+
+void ChanlogFiles::appendTo(std::vector<ChanlogChannelRef>& channels) const {
+    for (const auto& [name, file] : files_) {
+        channels.insert(channels.end(), file.channels.begin(), file.channels.end());
+    }
+}
+
+void ChanlogFiles::report(StructuredLog& log, std::string fault) {
+    if (!fault.empty() && fault != reported_) {
+        log.report(LogLevel::error, kLogCategory, fault);
+    }
+    reported_ = std::move(fault);
+}
+
+} // namespace tamblo

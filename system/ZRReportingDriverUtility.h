@@ -1,0 +1,71 @@
+#pragma once
+
+#include "base/Value.h"
+#include "platform/ChanlogFacility.h"
+#include "system/ZRReportingIOChannelSubscription.h"
+
+#include <functional>
+#include <map>
+#include <memory>
+#include <string>
+#include <string_view>
+#include <vector>
+
+namespace tamblo {
+
+class ZRReportingSession;
+
+/// Samples the statistics channels of a fixed set of audio drivers, and turns what a session's time has added
+/// to them into messages of that session.
+///
+/// One for the process, made with the first start of a session. It then subscribes to the drivers' channels,
+/// once: a driver without channels at that moment is not asked again. Used on the reporting server queue,
+/// where a pass over the channels may read files; without any subscription it reads nothing.
+///
+/// What fails is logged as an error and costs its driver alone. Subscriptions are logged at the default level
+/// and drivers without channels, of which an ordinary device has many, as information.
+class ZRReportingDriverUtility {
+public:
+    /// A sample of each driver's channels, by the driver's description.
+    using DriverSnapShot = std::map<std::string, ChanlogChannels, std::less<>>;
+    /// What is reported of channels of one kind, by the statistics key. A key that comes twice has the value
+    /// that came last.
+    using DriverStats = std::map<std::string, Value, std::less<>>;
+
+    /// The process's utility, made by the first call. Any thread.
+    [[nodiscard]] static ZRReportingDriverUtility& shared();
+    /// Drops the process's utility: after another platform was installed. Only while nobody uses it.
+    static void reset();
+
+    ZRReportingDriverUtility();
+    ZRReportingDriverUtility(const ZRReportingDriverUtility&) = delete;
+    ZRReportingDriverUtility& operator=(const ZRReportingDriverUtility&) = delete;
+
+    [[nodiscard]] const std::vector<ZRReportingIOChannelSubscription>&
+    ioChannelSubscriptions() const noexcept {
+        return ioChannelSubscriptions_;
+    }
+
+    [[nodiscard]] DriverSnapShot getSnapShot() const;
+    /// Samples once more and sends up to three messages: of simple values, of histograms and of states that
+    /// have gained something since the snapshot. Without a snapshot there is nothing to compare with, and
+    /// nothing to send.
+    void sendDriverLogsForSession(const std::shared_ptr<ZRReportingSession>& session,
+                                  const DriverSnapShot* driverSnapShot) const;
+
+    /// What a channel is called in messages: driver, group, subgroup, type and channel name, with "_" between
+    /// them and no "_" or space in them. What stands in "<>" behind a driver's name tells instances apart and
+    /// is left out.
+    [[nodiscard]] static std::string getDriverStatsKey(const ChanlogChannel& channel, std::string_view type);
+
+    /// Each adds an entry for a channel of its kind that has gained something. A simple value below 1 is no
+    /// gain: that is meant, as differences of levels and of counters that were set back are below 1.
+    static void processSimpleData(const ChanlogChannel& channel, DriverStats& driverStats);
+    static void processHistogramData(const ChanlogChannel& channel, DriverStats& driverStats);
+    static void processStateData(const ChanlogChannel& channel, DriverStats& driverStats);
+
+private:
+    std::vector<ZRReportingIOChannelSubscription> ioChannelSubscriptions_;
+};
+
+} // namespace tamblo
