@@ -1,4 +1,5 @@
 #include "session/WorkerClass.h"
+#include "system/ZRReportingSessionDriverSnapshotWorker.h"
 #include "system/ZRReportingSessionSystemMonitorWorker.h"
 #include "workers/producers/ZRReportingSessionInputMessagesWorker.h"
 #include "workers/producers/ZRReportingSessionKaleenMessagesWorker.h"
@@ -55,7 +56,9 @@ constexpr std::array<WorkerClass, 17> kWorkerClasses{{
      .startOnInit = true,
      .handleSingleMessageSession = true,
      .initWithSession = initWithSession<ZRReportingSessionQMXWorker>},
-    {.name = "ZRReportingSessionDriverSnapshotWorker", .role = kProducer},
+    {.name = "ZRReportingSessionDriverSnapshotWorker",
+     .role = kProducer,
+     .initWithSession = initWithSession<ZRReportingSessionDriverSnapshotWorker>},
     {.name = "ZRReportingSessionSystemMonitorWorker",
      .role = kProducer,
      .initWithSession = initWithSession<ZRReportingSessionSystemMonitorWorker>},
