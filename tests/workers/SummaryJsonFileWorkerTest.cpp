@@ -1,5 +1,6 @@
 #include "session/ZRReportingSession.h"
 #include "tests/fakes/FakePlatform.h"
+#include "workers/ReportFileName.h"
 #include "workers/sinks/ZRReportingSessionSummaryJsonFileWorker.h"
 
 #include <gmock/gmock.h>
@@ -19,7 +20,7 @@ using testing::IsEmpty;
 
 constexpr const char* kPath = "/reports/20260301-120000+0000-5-Unknown-test.json";
 
-TEST(SummaryFileNameTest, TellsLocalTimeAndSession) {
+TEST(ReportFileNameTest, TellsLocalTimeAndSession) {
     using std::chrono::seconds;
     const auto at = [](std::int64_t time) { return WallTime(seconds(time)); };
     const std::string longest(206, 'x');
@@ -48,8 +49,7 @@ TEST(SummaryFileNameTest, TellsLocalTimeAndSession) {
          "19700101-000000+0000-1-" + longest + "0123456789ABCDE-test.json"},
     };
     for (const auto& c : cases) {
-        const std::string name =
-            summaryFileName(c.time, seconds(c.offset), c.reporter, c.application, "test");
+        const std::string name = reportFileName(c.time, seconds(c.offset), c.reporter, c.application, "test");
         EXPECT_EQ(name, c.name);
         EXPECT_LE(name.size(), 255U);
     }

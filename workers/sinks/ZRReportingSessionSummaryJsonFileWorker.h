@@ -1,25 +1,15 @@
 #pragma once
 
-#include "base/Dictionary.h"
 #include "base/TextBuffer.h"
-#include "platform/Clock.h"
 #include "platform/ReportFiles.h"
 #include "session/ZRReportingSessionWorkerProtocol.h"
 
-#include <cstdint>
 #include <memory>
 #include <optional>
 #include <string>
 #include <string_view>
 
 namespace tamblo {
-
-/// The name of a session's summary file: when it is written, in local time, and whose session it is. The
-/// application's name comes from a client: a slash or an ASCII control character in it becomes `_`, and one
-/// that is too long for a file name is cut at the end of a character. Any other name stands as it is.
-[[nodiscard]] std::string summaryFileName(WallTime time, std::chrono::seconds utcOffset,
-                                          std::int64_t reporterID, const Value& applicationName,
-                                          std::string_view serviceName);
 
 /// Writes every message of a session that is not redundant into a JSON file of the session's own when it
 /// stops: for sessions of the service type "test", and on internal builds for all.
