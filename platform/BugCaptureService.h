@@ -56,8 +56,8 @@ public:
     using Reply = std::function<void(const Dictionary&)>;
 
     virtual ~GlarnReporter() = default;
-    /// Asks for a capture of what the device is doing now, to go on for the duration. Whether the parameters
-    /// were accepted.
+    /// Asks for a capture of what the device is doing: now, or, with a duration, when that is over. Whether
+    /// the parameters were accepted.
     [[nodiscard]] virtual bool snapshot(const BugCaptureSignature& signature,
                                         std::chrono::duration<double> duration, const Dictionary& payload,
                                         Reply reply) = 0;

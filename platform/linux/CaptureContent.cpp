@@ -28,6 +28,18 @@ void appendFile(std::string& text, std::string_view heading, const std::string& 
     text += file.text.ends_with('\n') ? "\n" : "\n\n";
 }
 
+/// What a process calls itself must neither make lines of its own here nor reach a terminal.
+std::string withoutControls(std::string text, std::string_view kept = {}) {
+    std::ranges::replace_if(
+        text,
+        [kept](char character) {
+            const bool isControl = static_cast<unsigned char>(character) < 0x20 || character == 0x7F;
+            return isControl && kept.find(character) == kept.npos;
+        },
+        '?');
+    return text;
+}
+
 std::string requestText(const CaptureRequest& request, WallTime now) {
     TextBuffer text;
     {
@@ -59,11 +71,7 @@ void addRequest(SinkObject& line, const CaptureRequest& request) {
 std::vector<CaptureFile> CaptureContent::gather(const CaptureRequest& request, WallTime now) const {
     std::vector<CaptureFile> files;
     // First what changes fastest.
-    std::vector<pid_t> processes = request.processes;
-    std::ranges::sort(processes);
-    processes.erase(std::ranges::unique(processes).begin(), processes.end());
-    processes.resize(std::min(processes.size(), kMaximumProcesses));
-    for (const pid_t process : processes) {
+    for (const pid_t process : request.processes) {
         files.push_back({formatted("process-{}.txt", process), processText(process)});
     }
     files.push_back({"system.txt", systemText()});
@@ -76,8 +84,9 @@ std::string CaptureContent::processText(pid_t process) const {
     if (!name) {
         return formatted("process {}: gone\n", process);
     }
-    std::string text = formatted("process {}: {}\n\n== threads\n", process, *name);
-    const std::vector<pid_t> threads = files_.threads(process, kMaximumThreads);
+    std::string text = formatted("process {}: {}\n\n== threads\n", process, withoutControls(*name));
+    std::vector<pid_t> threads = files_.threads(process, kMaximumThreads);
+    std::ranges::sort(threads);
     for (const pid_t thread : threads) {
         appendThread(text, process, thread);
     }
@@ -88,7 +97,7 @@ std::string CaptureContent::processText(pid_t process) const {
     const std::string folder = formatted("{}/{}", processRoot_, process);
     appendFile(text, "status", folder + "/status");
     appendFile(text, "memory", folder + "/smaps_rollup");
-    return text;
+    return withoutControls(std::move(text), "\n\t");
 }
 
 /// One line, and one for each call in the kernel.
@@ -98,8 +107,9 @@ void CaptureContent::appendThread(std::string& text, pid_t process, pid_t thread
         appendFormatted(text, "{}  gone\n", thread);
         return;
     }
-    appendFormatted(text, "{}  {}  {}  {}\n", thread, files_.threadName(process, thread).value_or("-"),
-                    sample->state, sample->waitChannel.value_or("-"));
+    appendFormatted(text, "{}  {}  {}  {}\n", thread,
+                    withoutControls(files_.threadName(process, thread).value_or("-")), sample->state,
+                    sample->waitChannel.value_or("-"));
     for (const std::string& call : sample->kernelStack.value_or(std::vector<std::string>())) {
         appendFormatted(text, "        {}\n", call);
     }

@@ -39,9 +39,7 @@ struct CaptureRequest {
 /// takes milliseconds for each large process.
 class CaptureContent {
 public:
-    /// How many processes are looked at: a session has a handful, and each is a file in the folder.
-    static constexpr std::size_t kMaximumProcesses = 64;
-    /// How many threads of each: a process with more has them in pools, where one is like the other.
+    /// How many threads of a process are looked at: one with more has them in pools, each like the other.
     static constexpr std::size_t kMaximumThreads = 256;
 
     explicit CaptureContent(std::string processes = "/proc", std::string system = "/sys")

@@ -26,6 +26,8 @@ constexpr std::string_view kUnfinished = ".new-";
 constexpr std::string_view kPattern = "00000000T000000.000Z-00000000";
 constexpr std::size_t kTimeLength = kPattern.find('-');
 
+constexpr std::string_view kNoFolders = "captures have no folders until it can be written again";
+
 /// How many entries are looked at, of the directory and of a folder. Thirty days bring 600 folders of less
 /// than 100 files.
 constexpr std::size_t kMaximumEntries = 4096;
@@ -90,7 +92,7 @@ void CaptureFolders::store(std::string_view identifier, std::span<const CaptureF
     if (problem.empty()) {
         problem = write(identifier, files);
     }
-    tell(isWritingOut_, problem, "captures have no folders until it can be written again");
+    tell(isWritingOut_, problem, kNoFolders);
     removeOld(now);
 }
 
@@ -101,7 +103,10 @@ void CaptureFolders::keep(std::string_view name, std::string_view text) {
             replaceFileAtomically(formatted("{}/{}", directory_, name), text, Durability::untilPowerLoss);
         problem = error != 0 ? failure("write", name, error) : "";
     }
-    tell(isWritingOut_, problem, "captures have no folders until it can be written again");
+    // A small file may still have room where a folder has none: only that ends an outage.
+    if (!problem.empty()) {
+        tell(isWritingOut_, problem, kNoFolders);
+    }
 }
 
 std::string CaptureFolders::makeDirectory() const {

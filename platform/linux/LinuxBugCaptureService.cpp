@@ -1,6 +1,7 @@
 #include "platform/linux/LinuxBugCaptureService.h"
 
 #include "base/Format.h"
+#include "platform/ProcessList.h"
 #include "platform/linux/SinkLine.h"
 
 #include <span>
@@ -23,12 +24,18 @@ std::uint64_t firstNumber(const Clock& clock) {
     return ::getrandom(&random, sizeof random, GRND_NONBLOCK) == sizeof random ? random : number;
 }
 
+std::vector<pid_t> withoutRepeats(std::span<const pid_t> processes) {
+    ProcessList list;
+    list.add(processes);
+    return std::move(list).take();
+}
+
 } // namespace
 
 class LinuxBugCaptureService::Reporter final : public GlarnReporter {
 public:
     Reporter(LinuxBugCaptureService& service, std::span<const pid_t> processes)
-        : service_(service), processes_(processes.begin(), processes.end()) {}
+        : service_(service), processes_(withoutRepeats(processes)) {}
 
     [[nodiscard]] bool snapshot(const BugCaptureSignature& signature, std::chrono::duration<double> duration,
                                 const Dictionary& payload, Reply reply) override {
