@@ -1,6 +1,7 @@
 #include "platform/linux/LinuxNamedNotifications.h"
 
 #include "base/Format.h"
+#include "platform/linux/AtomicFile.h"
 #include "platform/linux/SmallFile.h"
 
 #include <atomic>
@@ -126,7 +127,38 @@ void LinuxNamedNotifications::reportUnreadable(const std::string& name, const st
 }
 
 int LinuxNamedNotifications::PostNamedNotification(std::string_view name) {
-    return checkName(name);
+    int status = checkName(name);
+    if (status == 0) {
+        const std::string path = formatted("{}/{}", watcher_.directory(), name);
+        const SmallFile file = SmallFile::read(path, kMaximumFile, SmallFile::Links::refused);
+        // Content that is no word cannot be lost.
+        const bool mayWrite = file.error == 0 || file.error == ENOENT || file.error == EFBIG;
+        status = mayWrite ? replaceFileAtomically(path, formatted("{}\n", parseState(file.trimmed()).word),
+                                                  Durability::untilPowerLoss)
+                          : file.error;
+    }
+    reportNotPosted(name, status);
+    return status;
+}
+
+void LinuxNamedNotifications::reportNotPosted(std::string_view name, int status) {
+    {
+        const std::lock_guard lock(mutex_);
+        const auto known = notPosted_.find(name);
+        if (status == 0) {
+            if (known != notPosted_.end()) {
+                notPosted_.erase(known);
+            }
+            return;
+        }
+        if (known != notPosted_.end()) {
+            return;
+        }
+        notPosted_.emplace(name);
+    }
+    log_.report(LogLevel::error, "zrrs",
+                formatted("{}/{}: {}; the notification is not posted", watcher_.directory(), name,
+                          std::generic_category().message(status)));
 }
 
 void LinuxNamedNotifications::CancelNamedNotification(int token) {

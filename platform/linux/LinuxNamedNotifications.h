@@ -8,6 +8,7 @@
 #include <map>
 #include <memory>
 #include <mutex>
+#include <set>
 #include <string>
 #include <string_view>
 #include <unordered_map>
@@ -38,7 +39,9 @@ public:
     /// link is `ELOOP`: writes through it would not be noticed. What stands there and cannot be read is one
     /// error line for each state of the file that is met.
     [[nodiscard]] State GetNamedNotificationState(int token) override;
-    /// Writes the file anew with the word that stands there.
+    /// Replaces the file with one that holds the same word, or 0 for content that is no word. Fails for a
+    /// name that cannot be registered, for what is no regular file, and for what cannot be written: one error
+    /// line for each name until it can be posted again.
     [[nodiscard]] int PostNamedNotification(std::string_view name) override;
     void CancelNamedNotification(int token) override;
 
@@ -56,6 +59,8 @@ private:
     void reportUnwatched();
     /// An empty fault is none.
     void reportUnreadable(const std::string& name, const std::string& content, std::string_view fault);
+    /// 0 is no failure.
+    void reportNotPosted(std::string_view name, int status);
 
     StructuredLog& log_;
     /// Used by `deliverPosts` alone.
@@ -67,6 +72,8 @@ private:
     int lastToken_ = 0;
     /// By name: the content and its fault as reported last.
     std::map<std::string, std::string> reported_;
+    /// The names whose last post failed.
+    std::set<std::string, std::less<>> notPosted_;
 };
 
 } // namespace tamblo

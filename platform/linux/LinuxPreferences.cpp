@@ -1,9 +1,14 @@
 #include "platform/linux/LinuxPreferences.h"
 
 #include "base/Format.h"
+#include "base/Json.h"
+#include "platform/linux/AtomicFile.h"
+#include "platform/linux/SmallFile.h"
 
+#include <cerrno>
 #include <system_error>
 #include <utility>
+#include <variant>
 
 namespace tamblo {
 
@@ -15,6 +20,38 @@ constexpr std::string_view kSuffix = ".json";
 bool isDomainName(std::string_view domain) noexcept {
     return !domain.empty() && domain.size() <= 200 && domain.front() != '.' &&
            domain.find_first_of(std::string_view("/\0", 2)) == std::string_view::npos;
+}
+
+/// What a file holds now, nothing if it is missing; or why that cannot be known.
+std::variant<Dictionary, std::string> contentOf(const std::string& path) {
+    const SmallFile file = SmallFile::read(path, JsonFile::kMaximumSize);
+    if (file.error != 0) {
+        return file.error == ENOENT ? std::variant<Dictionary, std::string>(Dictionary())
+                                    : std::generic_category().message(file.error);
+    }
+    const auto read = readJson(file.text);
+    if (const auto* error = std::get_if<JsonError>(&read)) {
+        return formatted("line {}, column {}: {}; it is left as it is", error->line, error->column,
+                         error->message);
+    }
+    const Value& value = std::get<Value>(read);
+    if (!value.isDictionary()) {
+        return std::string("not an object; it is left as it is");
+    }
+    return value.dictionaryValue();
+}
+
+/// Nothing, or what went wrong.
+std::optional<std::string> store(const std::string& path, std::string_view key, const Value& value) {
+    auto content = contentOf(path);
+    if (auto* fault = std::get_if<std::string>(&content)) {
+        return formatted("{}: {}", path, *fault);
+    }
+    Dictionary& values = std::get<Dictionary>(content);
+    values.set(key, value);
+    const int failure = replaceFileAtomically(path, jsonText(values) + "\n", Durability::onDisk);
+    return failure != 0 ? std::optional(formatted("{}: {}", path, std::generic_category().message(failure)))
+                        : std::nullopt;
 }
 
 } // namespace
@@ -44,11 +81,10 @@ std::optional<Value> LinuxPreferences::copyPreferenceValue(std::string_view key,
         return std::nullopt;
     }
     const std::lock_guard lock(mutex_);
-    auto found = domains_.find(domain);
-    if (found == domains_.end()) {
-        found = domains_.emplace(domain, Domain{JsonFile(path(domain))}).first;
+    Domain& entry = domainNamed(domain);
+    if (const Value* value = entry.unstored.find(key)) {
+        return *value;
     }
-    Domain& entry = found->second;
     if (!entry.isCurrent) {
         entry.values = entry.file.read(log_);
         entry.isCurrent = isWatched_.load(std::memory_order_relaxed);
@@ -57,9 +93,32 @@ std::optional<Value> LinuxPreferences::copyPreferenceValue(std::string_view key,
     return value != nullptr ? std::optional<Value>(*value) : std::nullopt;
 }
 
-std::optional<std::string> LinuxPreferences::setPreferenceValue(std::string_view, std::string_view,
-                                                                const Value&) {
-    return "preferences cannot be stored";
+/// With the lock held.
+LinuxPreferences::Domain& LinuxPreferences::domainNamed(std::string_view name) const {
+    const auto found = domains_.find(name);
+    return found != domains_.end() ? found->second
+                                   : domains_.emplace(name, Domain{JsonFile(path(name))}).first->second;
+}
+
+std::optional<std::string> LinuxPreferences::setPreferenceValue(std::string_view key, std::string_view domain,
+                                                                const Value& value) {
+    if (!isDomainName(domain)) {
+        return formatted("\"{}\" is no preferences domain", domain);
+    }
+    const std::lock_guard storing(storing_);
+    // Without the other lock, which nobody holds for as long as a disk may take.
+    const std::optional<std::string> failure = store(path(domain), key, value);
+    {
+        const std::lock_guard lock(mutex_);
+        Domain& entry = domainNamed(domain);
+        if (failure) {
+            entry.unstored.set(key, value);
+        } else {
+            entry.forgetFile();
+        }
+    }
+    generation_.fetch_add(1, std::memory_order_release);
+    return failure;
 }
 
 void LinuxPreferences::readChanges() {
@@ -72,14 +131,14 @@ void LinuxPreferences::readChanges() {
         const std::lock_guard lock(mutex_);
         if (!fileName) {
             for (auto& [name, domain] : domains_) {
-                domain.isCurrent = false;
+                domain.forgetFile();
             }
             return;
         }
         fileName->remove_suffix(kSuffix.size());
         const auto found = domains_.find(*fileName);
         if (found != domains_.end()) {
-            found->second.isCurrent = false;
+            found->second.forgetFile();
         }
     });
     reportUnwatched();

@@ -18,6 +18,10 @@ namespace tamblo {
 
 /// Preferences as files: `<directory>/<domain>.json` holds one object, the domain's values by key.
 ///
+/// A value is stored by reading the file anew, replacing it with one that differs in that value and waiting
+/// for the disk. A file that is there and cannot be read as an object is somebody's mistake and is left as it
+/// is. What could not be stored is read back by this process all the same, until the file changes.
+///
 /// A file is read when its domain is first asked for and kept until it changes. Changes are told by the
 /// kernel: the event loop calls `readChanges` when the descriptor is readable, before it handles the sockets
 /// of the same wake-up, so that a preference is in force for every message sent after it was written. Any
@@ -50,9 +54,17 @@ private:
         JsonFile file;
         bool isCurrent = false;
         std::optional<Dictionary> values = std::nullopt;
+        /// Set here and not in the file.
+        Dictionary unstored = {};
+
+        void forgetFile() {
+            isCurrent = false;
+            unstored = {};
+        }
     };
 
     void reportUnwatched();
+    [[nodiscard]] Domain& domainNamed(std::string_view name) const;
 
     StructuredLog& log_;
     std::atomic<std::uint64_t> generation_{1};
@@ -60,6 +72,8 @@ private:
     /// Used by `readChanges` alone.
     DirectoryWatcher watcher_;
     int reportedError_ = 0;
+    /// Held while a value is stored, so that no other one is lost; taken before `mutex_`.
+    std::mutex storing_;
     mutable std::mutex mutex_;
     mutable std::map<std::string, Domain, std::less<>> domains_; ///< guarded by `mutex_`
 };
