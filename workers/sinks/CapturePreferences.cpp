@@ -1,0 +1,105 @@
+#include "workers/sinks/CapturePreferences.h"
+
+#include "base/Format.h"
+#include "platform/Platform.h"
+#include "util/Log.h"
+
+#include <map>
+#include <mutex>
+#include <string>
+#include <utility>
+
+namespace tamblo {
+
+namespace {
+
+/// The values that the log knows of, by key.
+struct Reported {
+    std::mutex mutex;
+    std::map<std::string, Value, std::less<>> values;
+};
+
+/// Never destroyed: it lives as long as the process.
+Reported& reported() {
+    static Reported& only = *new Reported;
+    return only;
+}
+
+bool beginsWithNumber(std::string_view text) noexcept {
+    text.remove_prefix(std::min(text.find_first_not_of(" \t\n\v\f\r"), text.size()));
+    if (text.starts_with('-') || text.starts_with('+')) {
+        text.remove_prefix(1);
+    }
+    if (text.starts_with('.')) {
+        text.remove_prefix(1);
+    }
+    return !text.empty() && text.front() >= '0' && text.front() <= '9';
+}
+
+bool isNumberOrItsText(const Value& value) noexcept {
+    return value.isNumber() || (value.isString() && beginsWithNumber(value.stringValue()));
+}
+
+bool isFlagOrItsText(const Value& value) noexcept {
+    const std::string_view text = value.stringValue();
+    return isNumberOrItsText(value) || value.boolValue() || text == "NO" || text == "no" || text == "FALSE" ||
+           text == "false";
+}
+
+std::string_view kindOf(const Value& value) noexcept {
+    switch (value.kind()) {
+    case Value::Kind::string:
+        return "a text";
+    case Value::Kind::array:
+        return "an array";
+    case Value::Kind::dictionary:
+        return "a dictionary";
+    default:
+        return "another value";
+    }
+}
+
+/// Whether the value is another one than was reported last for its key; it then is the one.
+bool isNews(std::string_view key, const Value& value) {
+    const std::lock_guard held(reported().mutex);
+    const auto [place, isNew] = reported().values.emplace(key, value);
+    return isNew || !(std::exchange(place->second, value) == value);
+}
+
+void forget(std::string_view key) {
+    const std::lock_guard held(reported().mutex);
+    const auto found = reported().values.find(key);
+    if (found != reported().values.end()) {
+        reported().values.erase(found);
+    }
+}
+
+std::optional<Value> checked(const PreferencesSuite& suite, std::string_view key, const LogCategory& category,
+                             bool (&isRight)(const Value&) noexcept, std::string_view wanted) {
+    std::optional<Value> value = suite.value(key);
+    if (!value || isRight(*value)) {
+        forget(key);
+    } else if (isNews(key, *value)) {
+        log::error(category, "preference {} {}: {} in place of {}; it is read as 0",
+                   kCapturePreferencesDomain, key, kindOf(*value), wanted);
+    }
+    return value;
+}
+
+} // namespace
+
+PreferencesSuite capturePreferences() {
+    return PreferencesSuite(platform().preferences, std::string(kCapturePreferencesDomain));
+}
+
+std::optional<Value> numberPreference(const PreferencesSuite& suite, std::string_view key,
+                                      const LogCategory& category) {
+    return checked(suite, key, category, isNumberOrItsText, "a number");
+}
+
+std::optional<Value> flagPreference(const PreferencesSuite& suite, std::string_view key,
+                                    const LogCategory& category) {
+    return checked(suite, key, category, isFlagOrItsText, "true or false");
+}
+
+} // namespace tamblo

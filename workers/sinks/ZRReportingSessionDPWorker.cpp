@@ -1,0 +1,165 @@
+#include "workers/sinks/ZRReportingSessionDPWorker.h"
+
+#include "base/Format.h"
+#include "platform/Platform.h"
+#include "session/ZRReportingSession.h"
+#include "util/AudioEvents.h"
+#include "util/InternalBuild.h"
+#include "util/Log.h"
+#include "util/MessageKeys.h"
+#include "util/ReportingServerQueue.h"
+#include "workers/sinks/CapturePreferences.h"
+
+#include <algorithm>
+#include <chrono>
+#include <limits>
+#include <optional>
+#include <string>
+
+namespace tamblo {
+
+namespace {
+
+constexpr std::string_view kBufferSizeKey = "smallest_buffer_frame_size";
+constexpr std::string_view kCycleKey = "io_cycle";
+
+constexpr std::int32_t kUsualBufferSize = 512; ///< frames
+constexpr double kLeastSecondsBetweenCaptures = 10.0;
+/// The range of the 32 bits, unsigned, that a wait may have: about 71 minutes.
+constexpr double kLongestWaitMicroseconds = std::numeric_limits<std::uint32_t>::max();
+
+/// What the preferences ask for, as the worker that was made last read them. Used on the reporting server
+/// queue alone.
+struct RunTimeValues {
+    std::int32_t minimumBufferSize = kUsualBufferSize; ///< frames
+    std::int32_t minimumCycle = 0;
+    std::chrono::microseconds waitTime{0};
+};
+constinit RunTimeValues runTime;
+
+/// The nearest number of 32 bits; 0 when absent.
+std::int32_t integerOf(const Value* value) noexcept {
+    using Limits = std::numeric_limits<std::int32_t>;
+    const std::int64_t number = value != nullptr ? value->integerValue() : 0;
+    return static_cast<std::int32_t>(
+        std::clamp(number, std::int64_t{Limits::min()}, std::int64_t{Limits::max()}));
+}
+
+/// Fractions are cut off. What is no time to wait, below zero or not a number, is none.
+std::chrono::microseconds waitTimeOf(double microseconds) noexcept {
+    const double within = microseconds > 0.0 ? std::min(microseconds, kLongestWaitMicroseconds) : 0.0;
+    return std::chrono::microseconds(static_cast<std::uint32_t>(within));
+}
+
+void logNotDropped(const Dictionary& payload, double timeDifference) {
+    log::debug(ZRReportingDPLogCategory(),
+               "Did not drop stackburst, right conditions not met: buffer size : {}, time diff : {}, io "
+               "cycle: {}",
+               integerOf(payload.find(kBufferSizeKey)), timeDifference, integerOf(payload.find(kCycleKey)));
+}
+
+/// The value of a preference that is there, which the log tells.
+std::optional<Value> told(std::string_view key, std::optional<Value> value) {
+    if (value) {
+        log::debug(ZRReportingDPLogCategory(), "Value of {} is {}", key, *value);
+    }
+    return value;
+}
+
+} // namespace
+
+std::shared_ptr<ZRReportingSessionWorkerProtocol>
+ZRReportingSessionDPWorker::initWithSession(const std::shared_ptr<ZRReportingSession>& session) {
+    const bool isEnabled = getEnableFlag("enable_stackburst");
+    if (!ZRReportingUtilityIsInternalBuild() || !isEnabled) {
+        return nullptr;
+    }
+    const std::int32_t bufferSize = getRunTimeDefaults("io_buffer_size");
+    runTime.minimumBufferSize = bufferSize != 0 ? bufferSize : kUsualBufferSize;
+    runTime.minimumCycle = getRunTimeDefaults("io_cycle");
+    runTime.waitTime = waitTimeOf(getDoubleRunTimeDefaults("wait_time"));
+    setMessagesMayBlock(runTime.waitTime.count() != 0);
+    return std::make_shared<ZRReportingSessionDPWorker>(session);
+}
+
+std::optional<bool> ZRReportingSessionDPWorker::start() {
+    setStarted(true);
+    return true;
+}
+
+void ZRReportingSessionDPWorker::handleMessage(const MessageRef& message) {
+    if (message == nullptr) {
+        return;
+    }
+    const bool isInteresting = interestedInMessage(*message);
+    if (!isInteresting && !ZRReportingDPLogCategory().isOn(LogLevel::debug)) {
+        return;
+    }
+    const double now = secondsSince1970(platform().clock.now());
+    if (isInteresting && isToBeCaptured(message->payload(), now)) {
+        capture(*message, now);
+    } else if (ZRReportingDPLogCategory().isOn(LogLevel::debug)) {
+        // For messages of every other kind, too: the line is how a developer sees the worker at work.
+        logNotDropped(message->payload(), now - lastMessageTime_);
+    }
+}
+
+bool ZRReportingSessionDPWorker::interestedInMessage(const ZRReportingSessionMessage& message) {
+    if (message.type() != AudioEventTypeError || message.category() != AudioEventKindIO) {
+        return false;
+    }
+    log::info(ZRReportingDPLogCategory(), "Interested in overload");
+    return true;
+}
+
+bool ZRReportingSessionDPWorker::isToBeCaptured(const Dictionary& payload, double now) const {
+    if (integerOf(payload.find(kBufferSizeKey)) < runTime.minimumBufferSize) {
+        return false;
+    }
+    // A clock that was set back holds captures off until it has caught up.
+    if (lastMessageTime_ != 0.0 && now - lastMessageTime_ <= kLeastSecondsBetweenCaptures) {
+        return false;
+    }
+    return integerOf(payload.find(kCycleKey)) >= runTime.minimumCycle;
+}
+
+void ZRReportingSessionDPWorker::capture(ZRReportingSessionMessage& message, double now) {
+    if (runTime.waitTime.count() != 0) {
+        platform().clock.sleepFor(runTime.waitTime);
+    }
+    Dictionary payload = message.message();
+    log::info(ZRReportingDPLogCategory(), "Dropping stackburst {}", message);
+    const Value* application = payload.find(ZRReportingApplicationName);
+    std::string reason = application != nullptr ? formatted("{}", *application) : "(null)";
+    platform().diagnosticCapture.captureStacks({.requester = "com.vandra.tamblo",
+                                                .captureType = "AudioOverloads",
+                                                .reason = std::move(reason),
+                                                .payload = std::move(payload),
+                                                .options = {1, 1, 0, 0, 0}});
+    // Whether somebody could be told changes nothing here.
+    static_cast<void>(
+        platform().namedNotifications.PostNamedNotification("com.vandra.tamblo.dropped-stackburst"));
+    log::info(ZRReportingDPLogCategory(), "Dropped stackburst");
+    lastMessageTime_ = now;
+}
+
+bool ZRReportingSessionDPWorker::getEnableFlag(std::string_view key) {
+    const auto value = told(key, flagPreference(getUserDefaults(), key, ZRReportingDPLogCategory()));
+    return value && value->boolValue();
+}
+
+std::int32_t ZRReportingSessionDPWorker::getRunTimeDefaults(std::string_view key) {
+    const auto value = told(key, numberPreference(getUserDefaults(), key, ZRReportingDPLogCategory()));
+    return integerOf(value ? &*value : nullptr);
+}
+
+double ZRReportingSessionDPWorker::getDoubleRunTimeDefaults(std::string_view key) {
+    const auto value = told(key, numberPreference(getUserDefaults(), key, ZRReportingDPLogCategory()));
+    return value ? value->doubleValue() : 0.0;
+}
+
+PreferencesSuite ZRReportingSessionDPWorker::getUserDefaults() {
+    return capturePreferences();
+}
+
+} // namespace tamblo

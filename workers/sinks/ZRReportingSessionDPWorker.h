@@ -1,0 +1,44 @@
+#pragma once
+
+#include "platform/Preferences.h"
+#include "session/ZRReportingSessionWorkerProtocol.h"
+
+#include <cstdint>
+#include <memory>
+#include <string_view>
+
+namespace tamblo {
+
+/// Has the whole system's stacks sampled (a stackburst) when an application's audio overloads: on internal
+/// builds, where a preference asks for it. The overload has to be of a buffer and an I/O cycle that are large
+/// enough, and more than ten seconds after the last one that this worker had captured.
+///
+/// What is large enough, and how long to wait before the capture, are preferences, which the making of each
+/// worker reads for all of them. The wait holds up the reporting server queue; where there is one, messages
+/// are posted as work that may block.
+class ZRReportingSessionDPWorker final : public ZRReportingSessionWorkerConsumerProtocol {
+public:
+    using ZRReportingSessionWorkerConsumerProtocol::ZRReportingSessionWorkerConsumerProtocol;
+    /// Null where no captures are wanted.
+    [[nodiscard]] static std::shared_ptr<ZRReportingSessionWorkerProtocol>
+    initWithSession(const std::shared_ptr<ZRReportingSession>& session);
+
+    std::optional<bool> start() override;
+    void handleMessage(const MessageRef& message) override;
+
+    /// Whether it is an overload of the audio I/O itself: an error of that kind, without a subsystem.
+    [[nodiscard]] static bool interestedInMessage(const ZRReportingSessionMessage& message);
+    /// Preferences; false, 0 or 0.0 without a value.
+    [[nodiscard]] static bool getEnableFlag(std::string_view key);
+    [[nodiscard]] static std::int32_t getRunTimeDefaults(std::string_view key);
+    [[nodiscard]] static double getDoubleRunTimeDefaults(std::string_view key);
+    [[nodiscard]] static PreferencesSuite getUserDefaults();
+
+private:
+    [[nodiscard]] bool isToBeCaptured(const Dictionary& payload, double now) const;
+    void capture(ZRReportingSessionMessage& message, double now);
+
+    double lastMessageTime_ = 0.0; ///< seconds since 1970, of the last capture; 0.0 before the first
+};
+
+} // namespace tamblo

@@ -1,0 +1,139 @@
+#include "workers/sinks/ZRReportingSessionQuilletWorker.h"
+
+#include "platform/Platform.h"
+#include "session/ZRReportingSession.h"
+#include "util/InternalBuild.h"
+#include "util/Log.h"
+#include "workers/ZRReportingSessionWorkerUtility.h"
+#include "workers/sinks/CapturePreferences.h"
+
+#include <optional>
+#include <string>
+#include <utility>
+
+namespace tamblo {
+
+namespace {
+
+constexpr std::string_view kBackOffKey = "TalvixInvalidXyBackOffSeconds";
+constexpr std::string_view kLastRunKey = "TalvixInvalidXyQLTlastRun";
+constexpr double kGraceSeconds = 5.0;
+
+constexpr const char* kDisplayReason = "a Talvix spatial positioning error occurred";
+
+// The tracker's own values. A maker whose tracker knows the product's core by another name or number, or the
+// audio diagnostics by another identifier, sets them here.
+constexpr const char* kComponentName = "Talvix Core";
+constexpr const char* kComponentVersion = "All";
+constexpr std::int64_t kComponentIdentifier = 520'117;
+constexpr std::int32_t kReproducibility = 6;
+constexpr std::int32_t kClassification = 7;
+constexpr const char* kAudioDiagnosticExtension = "com.vandra.tamblo.diagnostics.audio";
+
+void draftCreated(const std::optional<std::string>& error) {
+    if (error) {
+        log::error(ZRReportingSessionCategory(), "Error creating draft - {}", *error);
+    } else {
+        log::info(ZRReportingSessionCategory(), "Successfully created draft");
+    }
+}
+
+} // namespace
+
+std::shared_ptr<ZRReportingSessionWorkerProtocol>
+ZRReportingSessionQuilletWorker::initWithSession(const std::shared_ptr<ZRReportingSession>& session) {
+    if (!ZRReportingUtilityIsInternalBuild()) {
+        return nullptr;
+    }
+    PreferencesSuite defaults = capturePreferences();
+    const auto backOff = numberPreference(defaults, kBackOffKey, ZRReportingSessionCategory());
+    if (!backOff) {
+        log::debug(ZRReportingSessionCategory(), "{} default not set. Skipping worker. reporterID={}",
+                   kBackOffKey, session->reporterID());
+        return nullptr;
+    }
+    return std::make_shared<ZRReportingSessionQuilletWorker>(
+        session, std::move(defaults), std::chrono::duration<double>(backOff->doubleValue()));
+}
+
+ZRReportingSessionQuilletWorker::ZRReportingSessionQuilletWorker(std::weak_ptr<ZRReportingSession> session,
+                                                                 PreferencesSuite defaults,
+                                                                 std::chrono::duration<double> backOffTime)
+    : ZRReportingSessionWorkerConsumerProtocol(std::move(session)),
+      defaults_(std::move(defaults)),
+      backOffTime_(backOffTime) {}
+
+void ZRReportingSessionQuilletWorker::handleMessage(const MessageRef& message) {
+    if (message == nullptr || !interestedInMessage(*message)) {
+        return;
+    }
+    const std::shared_ptr<ZRReportingSession> owner = session();
+    const ReporterID reporterID = owner != nullptr ? owner->reporterID() : 0;
+    if (hasRun_) {
+        log::debug(ZRReportingSessionCategory(),
+                   "Quillet has already run for TalvixXYerrorMessage reporterID={}", reporterID);
+        return;
+    }
+    hasRun_ = true;
+    log::standard(ZRReportingSessionCategory(), "Starting quillet for TalvixXYerrorMessage reporterID={}",
+                  reporterID);
+    // Empty for a process that had exited before its name could be had.
+    const std::string processName =
+        owner != nullptr ? owner->clientProcessName().value_or(std::string()) : std::string();
+    platform().bugReportDrafting.createDraft(tikletDraftForTalvixXYerror(), processName, kDisplayReason,
+                                             draftCreated);
+}
+
+void ZRReportingSessionQuilletWorker::stop() {
+    const std::shared_ptr<ZRReportingSession> owner = session();
+    log::debug(ZRReportingSessionCategory(), "Resetting hasRun to false. reporterID={}",
+               owner != nullptr ? owner->reporterID() : ReporterID{0});
+    hasRun_ = false;
+}
+
+bool ZRReportingSessionQuilletWorker::interestedInMessage(const ZRReportingSessionMessage& message) {
+    const double time = ZRReportingSession::getEpochTimeFromZRReportingStateMessage(message);
+    if (minimumMessageTime_ <= 0.0) {
+        minimumMessageTime_ = time + kGraceSeconds;
+        return false;
+    }
+    // The preferences are asked last: of nearly all messages, the payload says enough.
+    return time > minimumMessageTime_ && ZRReportingSessionWorkerUtility::isTalvixXYerrorMessage(message) &&
+           !hasRunInTimeframe(backOffTime_, kLastRunKey);
+}
+
+bool ZRReportingSessionQuilletWorker::hasRunInTimeframe(std::chrono::duration<double> backOff,
+                                                        std::string_view defaultsKey) {
+    const double now = secondsSince1970(platform().clock.now());
+    const auto lastRun = numberPreference(defaults_, defaultsKey, ZRReportingSessionCategory());
+    if (lastRun && lastRun->doubleValue() > now - backOff.count()) {
+        log::debug(ZRReportingSessionCategory(), "Quillet has run. key={} lastRun={}", defaultsKey, *lastRun);
+        return true;
+    }
+    log::debug(ZRReportingSessionCategory(), "Quillet has not run. key={} backoffSeconds={}", defaultsKey,
+               backOff.count());
+    const std::optional<std::string> failure = defaults_.setValue(defaultsKey, now);
+    if (failure && !cannotStore_) {
+        log::error(ZRReportingSessionCategory(),
+                   "preference {} {}: {}; the time of the draft is forgotten when the service ends",
+                   kCapturePreferencesDomain, defaultsKey, *failure);
+    }
+    cannotStore_ = failure.has_value();
+    return false;
+}
+
+BugReportDraft ZRReportingSessionQuilletWorker::tikletDraftForTalvixXYerror() {
+    return {.title = "Invalid x/y coordinates during a Talvix call (QLT)",
+            .problemDescription =
+                "Invalid coordinates were provided to the audio layer during a Talvix call, making it "
+                "impossible to render spatial audio correctly. Filing this tiklet will help determine what "
+                "went wrong.",
+            .component = {.name = kComponentName,
+                          .version = kComponentVersion,
+                          .identifier = kComponentIdentifier},
+            .reproducibility = kReproducibility,
+            .classification = kClassification,
+            .diagnosticExtensions = {kAudioDiagnosticExtension}};
+}
+
+} // namespace tamblo

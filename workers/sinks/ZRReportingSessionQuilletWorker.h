@@ -1,0 +1,46 @@
+#pragma once
+
+#include "platform/BugReportDraftingService.h"
+#include "platform/Preferences.h"
+#include "session/ZRReportingSessionWorkerProtocol.h"
+
+#include <chrono>
+#include <memory>
+#include <string_view>
+
+namespace tamblo {
+
+/// Offers the user a prepared bug report when a video call has handed the audio layer invalid coordinates: at
+/// most once in a run of the session, and at most once in a back-off period on the whole device, which the
+/// preferences remember. On internal builds, where a preference names the period.
+///
+/// A session's first message arms the worker: it looks at messages from five seconds after that one on. The
+/// period begins when a message is of interest, before the draft is asked for, so that one that fails is not
+/// asked for again. Beginning it waits for the disk, once a period.
+class ZRReportingSessionQuilletWorker final : public ZRReportingSessionWorkerConsumerProtocol {
+public:
+    ZRReportingSessionQuilletWorker(std::weak_ptr<ZRReportingSession> session, PreferencesSuite defaults,
+                                    std::chrono::duration<double> backOffTime);
+    /// Null where no drafts are wanted.
+    [[nodiscard]] static std::shared_ptr<ZRReportingSessionWorkerProtocol>
+    initWithSession(const std::shared_ptr<ZRReportingSession>& session);
+
+    void handleMessage(const MessageRef& message) override;
+    /// The next run of the session may have a draft again.
+    void stop() override;
+
+    /// Whether the message is worth a draft. Arms the worker, or begins the back-off period.
+    [[nodiscard]] bool interestedInMessage(const ZRReportingSessionMessage& message);
+    /// Whether the time under the key is less than the back-off ago; if not, it is set to now.
+    [[nodiscard]] bool hasRunInTimeframe(std::chrono::duration<double> backOff, std::string_view defaultsKey);
+    [[nodiscard]] static BugReportDraft tikletDraftForTalvixXYerror();
+
+private:
+    PreferencesSuite defaults_;
+    const std::chrono::duration<double> backOffTime_;
+    double minimumMessageTime_ = -1.0; ///< seconds since 1970; armed when above 0
+    bool hasRun_ = false;
+    bool cannotStore_ = false; ///< and the log says so
+};
+
+} // namespace tamblo
