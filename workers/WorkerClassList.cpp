@@ -5,10 +5,12 @@
 #include "workers/producers/ZRReportingSessionKaleenMessagesWorker.h"
 #include "workers/producers/ZRReportingSessionSummaryWorker.h"
 #include "workers/producers/ZRReportingSessionVolumeMessagesWorker.h"
+#include "workers/sinks/ZRReportingSessionDPWorker.h"
 #include "workers/sinks/ZRReportingSessionEventryWorker.h"
 #include "workers/sinks/ZRReportingSessionJouleryWorker.h"
 #include "workers/sinks/ZRReportingSessionMemoryLogWorker.h"
 #include "workers/sinks/ZRReportingSessionQMXWorker.h"
+#include "workers/sinks/ZRReportingSessionQuilletWorker.h"
 #include "workers/sinks/ZRReportingSessionRtcWorker.h"
 #include "workers/sinks/ZRReportingSessionSummaryJsonFileWorker.h"
 
@@ -63,7 +65,9 @@ constexpr std::array<WorkerClass, 17> kWorkerClasses{{
      .role = kProducer,
      .initWithSession = initWithSession<ZRReportingSessionSystemMonitorWorker>},
     {.name = "ZRReportingSessionZephWorker", .role = kConsumer, .handleSingleMessageSession = true},
-    {.name = "ZRReportingSessionDPWorker", .role = kConsumer},
+    {.name = "ZRReportingSessionDPWorker",
+     .role = kConsumer,
+     .initWithSession = ZRReportingSessionDPWorker::initWithSession},
     {.name = "ZRReportingSessionSummaryJsonFileWorker",
      .role = kWorkerOnly,
      .initWithSession = ZRReportingSessionSummaryJsonFileWorker::initWithSession},
@@ -72,7 +76,10 @@ constexpr std::array<WorkerClass, 17> kWorkerClasses{{
      .role = kConsumer,
      .handleSingleMessageSession = true,
      .initWithSession = ZRReportingSessionRtcWorker::initWithSession},
-    {.name = "ZRReportingSessionQuilletWorker", .role = kConsumer, .handleSingleMessageSession = true},
+    {.name = "ZRReportingSessionQuilletWorker",
+     .role = kConsumer,
+     .handleSingleMessageSession = true,
+     .initWithSession = ZRReportingSessionQuilletWorker::initWithSession},
 }};
 
 } // namespace
