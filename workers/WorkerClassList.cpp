@@ -1,6 +1,7 @@
 #include "session/WorkerClass.h"
 #include "system/ZRReportingSessionDriverSnapshotWorker.h"
 #include "system/ZRReportingSessionSystemMonitorWorker.h"
+#include "workers/accessories/ZRReportingSessionAudioRegistrationWorker.h"
 #include "workers/producers/ZRReportingSessionInputMessagesWorker.h"
 #include "workers/producers/ZRReportingSessionKaleenMessagesWorker.h"
 #include "workers/producers/ZRReportingSessionSummaryWorker.h"
@@ -13,6 +14,7 @@
 #include "workers/sinks/ZRReportingSessionQuilletWorker.h"
 #include "workers/sinks/ZRReportingSessionRtcWorker.h"
 #include "workers/sinks/ZRReportingSessionSummaryJsonFileWorker.h"
+#include "workers/trace/ZRReportingSessionTraceWorker.h"
 
 #include <array>
 
@@ -26,7 +28,9 @@ constexpr WorkerRole kProducerAndConsumer{.producer = true, .consumer = true};
 constexpr WorkerRole kWorkerOnly{};
 
 constexpr std::array<WorkerClass, 17> kWorkerClasses{{
-    {.name = "ZRReportingSessionTraceWorker", .role = kWorkerOnly},
+    {.name = "ZRReportingSessionTraceWorker",
+     .role = kWorkerOnly,
+     .initWithSession = ZRReportingSessionTraceWorker::initWithSession},
     {.name = "ZRReportingSessionVolumeMessagesWorker",
      .role = kProducer,
      .initWithSession = initWithSession<ZRReportingSessionVolumeMessagesWorker>},
@@ -71,7 +75,9 @@ constexpr std::array<WorkerClass, 17> kWorkerClasses{{
     {.name = "ZRReportingSessionSummaryJsonFileWorker",
      .role = kWorkerOnly,
      .initWithSession = ZRReportingSessionSummaryJsonFileWorker::initWithSession},
-    {.name = "ZRReportingSessionAudioRegistrationWorker", .role = kConsumer},
+    {.name = "ZRReportingSessionAudioRegistrationWorker",
+     .role = kConsumer,
+     .initWithSession = initWithSession<ZRReportingSessionAudioRegistrationWorker>},
     {.name = "ZRReportingSessionRtcWorker",
      .role = kConsumer,
      .handleSingleMessageSession = true,

@@ -1,9 +1,107 @@
 #include "platform/linux/LinuxAccessories.h"
 
+#include "base/Format.h"
+#include "platform/linux/BluetoothRecord.h"
+#include "platform/linux/KeyedHash.h"
+#include "platform/linux/SmallFile.h"
+
+#include <algorithm>
+#include <array>
+#include <charconv>
+#include <cstdio>
+#include <filesystem>
+#include <set>
+#include <system_error>
+
 namespace tamblo {
 
+namespace {
+
+/// Machines have one adapter or two, and people some ten devices: what is beyond is rubbish.
+constexpr std::size_t kMostAdapters = 8;
+constexpr std::size_t kMostDevices = 256;
+/// Entries of one directory that are looked at, whatever they are.
+constexpr std::size_t kMostEntries = 4096;
+/// A record of a device with many services has some ten kibibytes.
+constexpr std::size_t kLongestRecord = 256U << 10U;
+/// The file has 33 bytes.
+constexpr std::size_t kLongestMachineIdentifier = 64;
+
+/// Whether it is an address as the daemon names directories: "00:1B:66:AA:BB:CC".
+bool isAddress(std::string_view name) noexcept {
+    constexpr std::size_t kLength = 17;
+    if (name.size() != kLength) {
+        return false;
+    }
+    for (std::size_t i = 0; i < kLength; ++i) {
+        const char c = name[i];
+        const bool isDigit = (c >= '0' && c <= '9') || (c >= 'A' && c <= 'F');
+        if (i % 3 == 2 ? c != ':' : !isDigit) {
+            return false;
+        }
+    }
+    return true;
+}
+
+/// The machine's identifier, 32 hexadecimal digits; zero without one.
+HashKey machineKey(const std::string& path) {
+    const SmallFile file = SmallFile::read(path, kLongestMachineIdentifier);
+    const std::string_view digits = file.trimmed();
+    HashKey key{};
+    for (std::size_t i = 0; i < key.size() && digits.size() == 32; ++i) {
+        const char* begin = digits.data() + 16 * i;
+        std::from_chars(begin, begin + 16, key[i], 16);
+    }
+    return key;
+}
+
+std::string identifierOf(const HashKey& key, std::string_view address) {
+    std::array<char, 17> text{};
+    std::snprintf(text.data(), text.size(), "%016llx",
+                  static_cast<unsigned long long>(keyedHash(key, address)));
+    return text.data();
+}
+
+} // namespace
+
 std::vector<Accessory> LinuxAccessories::connectedEarbuds() {
-    return {};
+    std::vector<Accessory> earbuds;
+    std::set<std::string> seen;
+    std::size_t devices = 0;
+    const HashKey key = machineKey(machineIdentifierFile_);
+    for (const std::string& adapter : addressesIn(storage_, kMostAdapters)) {
+        const std::string directory = storage_ + "/" + adapter;
+        for (const std::string& device : addressesIn(directory, kMostDevices - devices)) {
+            ++devices;
+            const SmallFile file = SmallFile::read(directory + "/" + device + "/info", kLongestRecord);
+            const BluetoothRecord record = BluetoothRecord::parse(file.text);
+            // A device that is paired with two adapters is still one.
+            if (record.isPaired && record.isEarbud() && seen.insert(device).second) {
+                earbuds.push_back({identifierOf(key, device), record.model()});
+            }
+        }
+    }
+    return earbuds;
+}
+
+std::vector<std::string> LinuxAccessories::addressesIn(const std::string& directory, std::size_t most) {
+    std::vector<std::string> addresses;
+    std::error_code error;
+    std::size_t entries = 0;
+    for (std::filesystem::directory_iterator entry(directory, error), end;
+         !error && entry != end && entries < kMostEntries; entry.increment(error), ++entries) {
+        std::string name = entry->path().filename().string();
+        if (isAddress(name)) {
+            addresses.push_back(std::move(name));
+        }
+    }
+    if (error == std::errc::permission_denied && !isRefusalTold_.exchange(true)) {
+        log_.report(LogLevel::info, "zrrz",
+                    formatted("{}: {}; accessories are not known", directory, error.message()));
+    }
+    std::sort(addresses.begin(), addresses.end());
+    addresses.resize(std::min(addresses.size(), most));
+    return addresses;
 }
 
 } // namespace tamblo

@@ -1,0 +1,148 @@
+#include "platform/linux/LinuxAccessories.h"
+#include "platform/linux/BluetoothRecord.h"
+#include "platform/linux/KeyedHash.h"
+#include "tests/platform/LinuxServiceSupport.h"
+
+#include <gmock/gmock.h>
+
+#include <filesystem>
+#include <set>
+#include <string>
+#include <vector>
+
+#include <sys/fsuid.h>
+#include <sys/stat.h>
+
+namespace tamblo {
+namespace {
+
+using testing::ElementsAre;
+using testing::IsEmpty;
+using testing::SizeIs;
+
+const std::string kKey = "\n[LinkKey]\nKey=00112233445566778899AABBCCDDEEFF\nType=4\n";
+const std::string kIdentity = "[DeviceID]\nSource=1\nVendor=76\nProduct=8212\nVersion=2832\n";
+const std::string kEarbud = "[General]\nName=Class=1\nAppearance=0x0941\n" + kIdentity + kKey;
+
+TEST(KeyedHashTest, IsSipHash) {
+    // The authors' vectors: the key 00 01 … 0f, the texts of 0, 8 and 15 such bytes.
+    const HashKey key{0x0706050403020100U, 0x0F0E0D0C0B0A0908U};
+    const std::string text("\x00\x01\x02\x03\x04\x05\x06\x07\x08\x09\x0A\x0B\x0C\x0D\x0E", 15);
+    EXPECT_EQ(keyedHash(key, ""), 0x726FDB47DD0E0E31U);
+    EXPECT_EQ(keyedHash(key, text.substr(0, 8)), 0x93F5F5799A932462U);
+    EXPECT_EQ(keyedHash(key, text), 0xA129CA6149BE45E5U);
+}
+
+TEST(BluetoothRecordTest, TellsEarbudsAndTheirModel) {
+    const struct {
+        std::string general;
+        bool isEarbud;
+    } kinds[] = {
+        {"Class=0x240404", true},
+        {"Class=0x240418", true},
+        {"Class=0x24041c\r", false},
+        {"Class=0x240408", false},
+        {"Class=0x240518", false},
+        {"Class=2360344", true}, // decimal
+        {"Class=0x1240418", false},
+        {"Class=0x24041g", false},
+        {"Class=", false},
+        {"Appearance=0x0941", true},
+        {"Appearance=0x0942\nClass=0x240418", false},
+        {"Appearance=0x0941\nClass=0x000100", true},
+        {"Appearance=0x0000\nClass=0x240418", true},
+        {"Appearance=-1\nClass=0x240418", true},
+        {"[Other]\nClass=0x240418", false},
+    };
+    for (const auto& c : kinds) {
+        const std::string text = "[General]\n" + c.general;
+        EXPECT_EQ(BluetoothRecord::parse(text).isEarbud(), c.isEarbud) << text;
+    }
+    const std::pair<std::string, std::string> models[] = {
+        {kIdentity, "bluetooth:004c:2014:0b10"},
+        {"[DeviceID]\nVersion=x\nProduct=0xFFFF\nVendor=1\nSource=2", "usb:0001:ffff:0000"},
+        {"[DeviceID]\nSource=9\nVendor=65536\nProduct=1", "unknown:0000:0001:0000"},
+        {"[DeviceID]\nSource=1\nVendor=0\nProduct=0", ""},
+        {"Vendor=76\n[DeviceID\nVendor=76\n=\n[]\n[", ""},
+    };
+    for (const auto& [text, model] : models) {
+        EXPECT_EQ(BluetoothRecord::parse(text).model(), model) << text;
+    }
+    for (const std::string section : {"LinkKey", "LongTermKey", "PeripheralLongTermKey", "Other"}) {
+        EXPECT_EQ(BluetoothRecord::parse("[" + section + "]\nKey=1").isPaired, section != "Other");
+    }
+}
+
+class LinuxAccessoriesTest : public testing::Test {
+protected:
+    LinuxAccessoriesTest() { directory.write("machine-id", "0123456789abcdef0123456789abcdef\n"); }
+    void addDevice(const std::string& adapter, const std::string& device, const std::string& record) {
+        std::filesystem::create_directories(directory.path("bt/" + adapter + "/" + device));
+        directory.write("bt/" + adapter + "/" + device + "/info", record);
+    }
+    static std::string address(int number) {
+        char text[18];
+        std::snprintf(text, sizeof text, "00:1B:66:AA:%02X:%02X", number / 256, number % 256);
+        return text;
+    }
+    [[nodiscard]] LinuxAccessories accessories(const std::string& machine = "machine-id") {
+        return LinuxAccessories(log, directory.path("bt"), directory.path(machine));
+    }
+
+    TemporaryDirectory directory;
+    RecordingLog log;
+};
+
+TEST_F(LinuxAccessoriesTest, FindsPairedEarbudsEachOnce) {
+    EXPECT_THAT(accessories().connectedEarbuds(), IsEmpty());
+    addDevice(address(1), address(2), kEarbud);
+    addDevice(address(1), address(3), "[General]\nClass=0x240418\n" + kKey);
+    addDevice(address(1), address(4), "[General]\nAppearance=0x0941\n"); // was seen, never paired
+    addDevice(address(1), address(5), kEarbud + std::string(300'000, '\n'));
+    addDevice(address(9), address(2), kEarbud);
+    addDevice("cache", address(6), kEarbud);
+    addDevice(address(9), "cache", kEarbud);
+    directory.write("bt/" + address(8), "no directory");
+    const std::vector<Accessory> found = accessories().connectedEarbuds();
+    ASSERT_THAT(found, SizeIs(2));
+    EXPECT_EQ(found[0].model, "bluetooth:004c:2014:0b10");
+    EXPECT_EQ(found[1].model, "");
+    EXPECT_THAT(found[0].identifier, testing::MatchesRegex("[0-9a-f]{16}"));
+    // The same at the next start; another on another machine, and on none.
+    EXPECT_EQ(accessories().connectedEarbuds()[0].identifier, found[0].identifier);
+    directory.write("other", "1123456789abcdef0123456789abcdef");
+    const std::set<std::string> different{found[0].identifier, found[1].identifier,
+                                          accessories("other").connectedEarbuds()[0].identifier,
+                                          accessories("none").connectedEarbuds()[0].identifier};
+    EXPECT_THAT(different, SizeIs(4));
+    EXPECT_THAT(log.take(), IsEmpty());
+}
+
+TEST_F(LinuxAccessoriesTest, LooksAtSoManyAdaptersAndDevices) {
+    for (int i = 0; i < 260; ++i) {
+        addDevice(address(1), address(i), kEarbud);
+    }
+    EXPECT_THAT(accessories().connectedEarbuds(), SizeIs(256));
+    std::filesystem::remove_all(directory.path("bt"));
+    for (int i = 0; i < 10; ++i) {
+        addDevice(address(i), address(100 + i), kEarbud);
+    }
+    EXPECT_THAT(accessories().connectedEarbuds(), SizeIs(8));
+}
+
+TEST_F(LinuxAccessoriesTest, AClosedDirectoryIsToldOnce) {
+    addDevice(address(1), address(2), kEarbud);
+    ::chmod(directory.path("bt").c_str(), 0);
+    LinuxAccessories closed = accessories();
+    // The superuser, who may look everywhere, looks as nobody.
+    const int user = ::setfsuid(65534);
+    EXPECT_THAT(closed.connectedEarbuds(), IsEmpty());
+    EXPECT_THAT(closed.connectedEarbuds(), IsEmpty());
+    ::setfsuid(static_cast<uid_t>(user));
+    EXPECT_THAT(log.take(), ElementsAre("1 zrrz " + directory.path("bt") +
+                                        ": Permission denied; accessories are not known"));
+    ::chmod(directory.path("bt").c_str(), 0700);
+}
+
+} // namespace
+} // namespace tamblo

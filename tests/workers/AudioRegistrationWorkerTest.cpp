@@ -1,0 +1,181 @@
+#include "base/Json.h"
+#include "session/ZRReportingSession.h"
+#include "tests/fakes/FakePlatform.h"
+#include "workers/accessories/AccessoryLookup.h"
+#include "workers/accessories/AccessoryRegistry.h"
+
+#include <gmock/gmock.h>
+
+#include <optional>
+#include <string>
+#include <vector>
+
+namespace tamblo {
+namespace {
+
+using namespace std::chrono_literals;
+using testing::ElementsAre;
+using testing::IsEmpty;
+using testing::SizeIs;
+
+const WallTime kNow{1'772'366'400s}; ///< of the fake clock: 2026-03-01, 12:00
+const std::string kEntry = R"("first_seen":"2025-12-31","last_seen":"2026-02-28","last_reported":)";
+
+Value valueFrom(const std::string& json) {
+    const auto value = readJson(json);
+    EXPECT_TRUE(std::holds_alternative<Value>(value)) << json;
+    return std::get<Value>(value);
+}
+
+TEST(AccessoryRegistryTest, ReportsEachAccessoryOnceInADay) {
+    const std::string day = R"("last_seen_day":"2026-03-01","model":"m"})";
+    const std::string known = R"({"first_seen_day":"2025-12-31",)" + day;
+    const std::string isNew = R"({"first_seen_day":"2026-03-01",)" + day;
+    const auto reportedAgo = [](std::chrono::seconds time) {
+        return "{" + kEntry + std::to_string((kNow - time).time_since_epoch() / 1s) + "}";
+    };
+    const struct {
+        std::string kept; ///< of the accessory that is seen
+        std::string report;
+        bool hadRubbish = false;
+    } cases[] = {
+        {reportedAgo(24h - 1s), ""},
+        {reportedAgo(24h), known},
+        {reportedAgo(24h + 1s), known},
+        // A clock that was set back, a little or by years.
+        {reportedAgo(-24h + 1s), ""},
+        {reportedAgo(-24h), known},
+        {reportedAgo(-9000h), known},
+        {R"({"first_seen":"2031-01-01","last_seen":"2031-01-01","last_reported":1.5})", isNew},
+        // What is no entry.
+        {"7", isNew, true},
+        {"{}", isNew, true},
+        {R"({"first_seen":"2026-02-28","last_seen":"yesterday","last_reported":1})", isNew, true},
+        {R"({"first_seen":5,"last_seen":"2026-02-28","last_reported":1})", isNew, true},
+        {R"({"first_seen":"2026-02-28","last_seen":"2026-02-28","last_reported":"1"})", isNew, true},
+        {R"({"first_seen":"2026-02-28","last_seen":"2026-02-28"})", isNew, true},
+    };
+    const Accessory seen[] = {{"a", "m"}};
+    for (const auto& c : cases) {
+        const Value kept = valueFrom("{\"a\":" + c.kept + ",\"b\":{" + kEntry + "1.0}}");
+        const AccessoryRegistry::Update update = AccessoryRegistry::update(kept, seen, kNow);
+        std::string reports;
+        for (const Dictionary& report : update.reports) {
+            reports += jsonText(report);
+        }
+        EXPECT_EQ(reports, c.report) << c.kept;
+        EXPECT_EQ(update.hadRubbish, c.hadRubbish) << c.kept;
+        const Dictionary& entry = update.registered.find("a")->dictionaryValue();
+        EXPECT_EQ(*entry.find("last_seen"), Value("2026-03-01"));
+        EXPECT_EQ(entry.find("last_reported")->doubleValue() == secondsSince1970(kNow), !c.report.empty());
+        EXPECT_EQ(*update.registered.find("b"), *kept.dictionaryValue().find("b")) << "of another one";
+    }
+    EXPECT_TRUE(AccessoryRegistry::update(Value("text"), {}, kNow).hadRubbish);
+}
+
+TEST(AccessoryRegistryTest, ForgetsThoseUnseenForTheLongestTime) {
+    Dictionary kept;
+    for (int i = 0; i < 64; ++i) {
+        const std::string day = i == 40 ? "2019-01-01" : "2026-02-28";
+        kept.set("k" + std::to_string(i),
+                 Dictionary{{"first_seen", day}, {"last_seen", day}, {"last_reported", 1}});
+    }
+    const Accessory seen[] = {{"new", ""}};
+    AccessoryRegistry::Update update = AccessoryRegistry::update(Value(kept), {}, kNow);
+    EXPECT_EQ(update.registered.size(), 64U);
+    update = AccessoryRegistry::update(Value(kept), seen, kNow);
+    EXPECT_EQ(update.registered.size(), 64U);
+    EXPECT_FALSE(update.registered.contains("k40"));
+    EXPECT_TRUE(update.registered.contains("new"));
+    EXPECT_EQ(*update.reports.at(0).find("model"), Value("unknown"));
+
+    std::vector<Accessory> many;
+    for (int i = 0; i < 70; ++i) {
+        many.push_back({std::to_string(i), "m"});
+    }
+    update = AccessoryRegistry::update(std::nullopt, many, kNow);
+    EXPECT_THAT(update.reports, SizeIs(64));
+    EXPECT_THAT(AccessoryRegistry::update(Value(update.registered), many, kNow).reports, IsEmpty());
+}
+
+class AudioRegistrationWorkerTest : public testing::Test {
+protected:
+    AudioRegistrationWorkerTest() { forgetAccessoryLookup(); }
+    void startSession() {
+        const auto session = ZRReportingSession::initWithID(5, {1});
+        session->start();
+        device.workQueues.run("com.vandra.tamblo.accessories");
+    }
+    [[nodiscard]] std::vector<Dictionary> reported() {
+        (void)device.serverQueue().runAll();
+        return device.analyticsEvents.payloads(kAccessoryEvent);
+    }
+    [[nodiscard]] std::string kept() const {
+        const auto value = device.preferences.copyPreferenceValue("registered", kDomain);
+        return value ? jsonText(*value) : "";
+    }
+    [[nodiscard]] std::size_t errors() const {
+        const auto lines = device.log.lines();
+        return static_cast<std::size_t>(std::count_if(lines.begin(), lines.end(), [](const auto& line) {
+            return line.category == "zrrz" && line.level == LogLevel::error;
+        }));
+    }
+
+    static constexpr const char* kDomain = "com.vandra.tamblo.accessories";
+    FakePlatform device{LogLevel::info};
+};
+
+TEST_F(AudioRegistrationWorkerTest, LooksAtMostOnceAMinuteAndKeepsWhatItSaw) {
+    device.accessories.earbuds = {{"a", "bluetooth:004c:2014:0b10"}};
+    startSession();
+    EXPECT_THAT(device.analyticsEvents.payloads(kAccessoryEvent), IsEmpty()) << "sent on the server queue";
+    ASSERT_THAT(reported(), SizeIs(1));
+    EXPECT_EQ(
+        jsonText(reported()[0]),
+        R"({"first_seen_day":"2026-03-01","last_seen_day":"2026-03-01","model":"bluetooth:004c:2014:0b10"})");
+    EXPECT_EQ(kept(),
+              R"({"a":{"first_seen":"2026-03-01","last_reported":1772366400.0,"last_seen":"2026-03-01"}})");
+    const struct {
+        std::chrono::seconds step;
+        int lookups;
+        std::size_t events;
+    } cases[] = {{59s, 1, 1}, {1s, 2, 1}, {-3600s, 3, 1}, {59s, 3, 1}, {90'000s, 4, 2}, {-600'000s, 5, 3}};
+    for (const auto& c : cases) {
+        device.clock.advance(c.step);
+        startSession();
+        EXPECT_EQ(device.accessories.lookups, c.lookups);
+        EXPECT_EQ(reported().size(), c.events);
+    }
+    EXPECT_EQ(errors(), 0U);
+}
+
+TEST_F(AudioRegistrationWorkerTest, LooksNothingUpForAnEventThatNobodyWants) {
+    device.analyticsEvents.setEventsInUse({{"other"}});
+    device.accessories.earbuds = {{"a", "m"}};
+    startSession();
+    EXPECT_EQ(device.accessories.lookups, 0);
+    device.analyticsEvents.setEventsInUse(std::nullopt);
+    startSession();
+    EXPECT_THAT(reported(), SizeIs(1)) << "at the next session's start";
+}
+
+TEST_F(AudioRegistrationWorkerTest, RubbishAndAStoreThatFailsAreOneLineEach) {
+    startSession();
+    EXPECT_EQ(kept(), "") << "nothing to keep";
+    device.preferences.set("registered", kDomain, Array{1});
+    device.clock.advance(1min);
+    startSession();
+    EXPECT_EQ(errors(), 1U);
+    EXPECT_EQ(kept(), "{}");
+    device.accessories.earbuds = {{"a", "m"}};
+    device.preferences.writeFailure = "disk full";
+    for (int i = 0; i < 2; ++i) {
+        device.clock.advance(1min);
+        startSession();
+    }
+    EXPECT_EQ(errors(), 2U);
+    EXPECT_THAT(reported(), SizeIs(1)) << "known in this process all the same";
+}
+
+} // namespace
+} // namespace tamblo

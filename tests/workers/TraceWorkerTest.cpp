@@ -1,0 +1,313 @@
+#include "session/ZRReportingSession.h"
+#include "tests/fakes/FakePlatform.h"
+#include "util/InternalBuild.h"
+#include "workers/trace/ChromeTrace.h"
+#include "workers/trace/ProcessSampler.h"
+#include "workers/trace/SessionTrace.h"
+#include "workers/trace/ZRReportingSessionTraceWorker.h"
+
+#include <gmock/gmock.h>
+#include <nlohmann/json.hpp>
+
+#include <limits>
+#include <map>
+#include <string>
+#include <utility>
+#include <vector>
+
+namespace tamblo {
+namespace {
+
+using namespace std::chrono_literals;
+using Json = nlohmann::json;
+using testing::ElementsAre;
+using testing::IsEmpty;
+using testing::SizeIs;
+
+constexpr const char* kPath = "/performance/20260301-120000+0000-5-Unknown-velka.json";
+constexpr pid_t kClient = 77;
+constexpr pid_t kService = 4321;
+constexpr std::int64_t kStart = 1'772'366'400'000'000; ///< of the fake clock, in microseconds
+const WallTime kStartTime{std::chrono::microseconds(kStart)};
+
+ProcessSample sampleOf(std::int64_t userMicroseconds, std::uint64_t faults = 0) {
+    ProcessSample sample;
+    sample.userTime = std::chrono::microseconds(userMicroseconds);
+    sample.voluntarySwitches = 3;
+    sample.minorFaults = faults;
+    sample.residentBytes = 1U << 20U;
+    sample.threads = 2;
+    return sample;
+}
+
+class TraceWorkerTest : public testing::Test {
+protected:
+    static std::shared_ptr<ZRReportingSession> makeSession() {
+        auto session = ZRReportingSession::initWithID(5, {kClient});
+        session->setServiceType(AudioServiceTypeVelka);
+        session->setClientProcessName("player");
+        return session;
+    }
+    void tick(std::chrono::milliseconds step = 100ms) {
+        device.clock.advance(step);
+        device.workQueues.tick();
+    }
+    /// The performance files, whose names have the time of the stop; an internal build writes others, too.
+    [[nodiscard]] std::map<std::string, std::string> take() {
+        std::map<std::string, std::string> files = std::exchange(device.reportFiles.files, {});
+        std::erase_if(files, [](const auto& file) { return !file.first.starts_with("/performance/"); });
+        return files;
+    }
+    [[nodiscard]] std::map<std::string, std::string> written() {
+        device.workQueues.run("com.vandra.tamblo.trace");
+        return take();
+    }
+    /// "TIME:VALUE" of one counter's member, times in milliseconds from the start.
+    static std::string counter(const Json& file, pid_t pid, const std::string& name, const char* member) {
+        std::string found;
+        for (const Json& event : file.at("traceEvents")) {
+            if (event.at("ph") == "C" && event.at("pid") == pid && event.at("name") == name) {
+                found += std::to_string((event.at("ts").get<std::int64_t>() - kStart) / 1000) + ":" +
+                         event.at("args").at(member).dump() + " ";
+            }
+        }
+        return found;
+    }
+    [[nodiscard]] std::vector<std::string> said() const {
+        std::vector<std::string> said;
+        for (const FakeLog::Line& line : device.log.lines()) {
+            if (line.category == "zrrt") {
+                said.push_back(std::to_string(static_cast<int>(line.level)) + " " + line.text);
+            }
+        }
+        return said;
+    }
+
+    FakePlatform device{LogLevel::info, true};
+};
+
+TEST_F(TraceWorkerTest, WritesWhatASessionsProcessesDid) {
+    device.processInformation.names[kService] = "tamblod";
+    const auto session = makeSession();
+    session->start();
+    // Another session of the same client changes nothing.
+    const auto other = makeSession();
+    other->start();
+    ASSERT_EQ(device.workQueues.runningTimers(), 1U);
+    device.processSampling.set(kClient, sampleOf(1000));
+    device.processSampling.set(kService, sampleOf(0, 10));
+    tick();
+    device.processSampling.set(kClient, sampleOf(6000));
+    device.processSampling.set(kService, sampleOf(0, 9)); // runs backwards
+    tick();
+    device.clock.set(kStartTime - 1h); // steps back
+    device.processSampling.set(kClient, sampleOf(std::numeric_limits<std::int64_t>::max()));
+    device.processSampling.set(kService, sampleOf(0, std::numeric_limits<std::uint64_t>::max()));
+    tick(0ms);
+    device.processSampling.end(kClient);
+    device.processSampling.set(kService, sampleOf(0, 19));
+    tick();
+    device.processSampling.set(kService, sampleOf(0, 29));
+    device.processSampling.set(kClient, sampleOf(1)); // the number of another process now
+    tick();
+    device.clock.set(kStartTime);
+    session->stop();
+    EXPECT_THAT(take(), IsEmpty()) << "written on the server queue";
+
+    const auto files = written();
+    ASSERT_THAT(files, SizeIs(1));
+    ASSERT_EQ(files.begin()->first, kPath);
+    const Json file = Json::parse(files.begin()->second);
+    EXPECT_EQ(file.at("displayTimeUnit"), "ms");
+    EXPECT_EQ(file.at("otherData").dump(),
+              R"({"applicationName":"Unknown","droppedMarks":0,"reporterID":5,"serviceName":"velka"})");
+    EXPECT_EQ(counter(file, kClient, "processor time (% of a core)", "user"), "200:5.0 ");
+    EXPECT_EQ(counter(file, kClient, "memory (bytes)", "resident"), "100:1048576 200:1048576 200:1048576 ");
+    EXPECT_EQ(counter(file, kClient, "threads", "threads"), "100:2 200:2 200:2 ");
+    EXPECT_EQ(counter(file, kService, "context switches (per second)", "voluntary"),
+              "200:0.0 300:0.0 400:0.0 ");
+    EXPECT_EQ(counter(file, kService, "page faults (per second)", "minor"), "200:0.0 300:0.0 400:100.0 ");
+    std::string named;
+    std::int64_t end = 0;
+    for (const Json& event : file.at("traceEvents")) {
+        if (event.at("ph") == "M") {
+            named += event.at("args").at("name").get<std::string>() + " ";
+        } else if (event.at("name") == "session") {
+            EXPECT_EQ(event.at("ts"), kStart);
+            EXPECT_EQ(event.at("tid"), kClient);
+            end = event.at("dur");
+        }
+    }
+    EXPECT_EQ(named, "player tamblod session output input ");
+    EXPECT_EQ(end, 3'600'200'000) << "the clock goes on from where it was";
+}
+
+TEST_F(TraceWorkerTest, NothingSampledStillMakesAFile) {
+    const auto session = makeSession();
+    session->start();
+    session->stop();
+    const Json file = Json::parse(written().at(kPath));
+    EXPECT_EQ(file.at("traceEvents").back().at("name"), "session");
+    EXPECT_EQ(device.workQueues.runningTimers(), 0U);
+    session->start();
+    session->stop();
+    EXPECT_THAT(written(), SizeIs(1)) << "of its next run";
+}
+
+TEST_F(TraceWorkerTest, OnOtherBuildsNothingIsTraced) {
+    device.deviceProperties.set("InternalBuild", false);
+    forgetInternalBuild();
+    const auto session = makeSession();
+    EXPECT_EQ(ZRReportingSessionTraceWorker::initWithSession(session), nullptr);
+    session->start();
+    session->stop();
+    EXPECT_THAT(device.workQueues.timers(), IsEmpty());
+    EXPECT_THAT(written(), IsEmpty());
+}
+
+TEST_F(TraceWorkerTest, TracesSoManySessionsAtATimeAndForgetsDroppedOnes) {
+    std::vector<std::shared_ptr<ZRReportingSession>> sessions;
+    for (std::size_t i = 0; i < ProcessSampler::kMostRecordings + 3; ++i) {
+        sessions.push_back(ZRReportingSession::initWithID(static_cast<ReporterID>(i), {kClient}));
+        sessions.back()->start();
+    }
+    const std::string full = "1 32 sessions are traced already; further ones are not until one of them stops";
+    EXPECT_THAT(said(), ElementsAre(full));
+    sessions.erase(sessions.begin()); // without a stop
+    sessions.back()->stop();
+    sessions.back()->start();
+    EXPECT_THAT(said(), ElementsAre(full)) << "there was room for it";
+    tick();
+    for (const auto& session : sessions) {
+        session->stop();
+    }
+    EXPECT_EQ(device.workQueues.runningTimers(), 0U);
+    EXPECT_THAT(written(), SizeIs(ProcessSampler::kMostRecordings));
+}
+
+TEST_F(TraceWorkerTest, EachFailureIsOneLine) {
+    std::optional<std::string> FakeReportFiles::*steps[] = {
+        &FakeReportFiles::directoryFailure, &FakeReportFiles::openFailure, &FakeReportFiles::writeFailure,
+        &FakeReportFiles::closeFailure};
+    const auto session = makeSession();
+    for (const auto step : steps) {
+        device.log.clear();
+        device.reportFiles.*step = "no way";
+        session->start();
+        session->stop();
+        (void)written();
+        device.reportFiles.*step = std::nullopt;
+        EXPECT_THAT(said(), ElementsAre(std::string("3 TraceWorker failed to write file. file=") + kPath +
+                                        " error=\"no way\""));
+    }
+}
+
+TEST(SampleRecordingTest, KeepsEveryOtherSampleWhenItIsFull) {
+    constexpr std::size_t kMost = SampleRecording::kMostSamples;
+    const pid_t processes[] = {1, 2};
+    SampleRecording recording(processes, WallTime());
+    std::size_t looked = 0;
+    for (std::size_t tick = 0; tick < 2 * kMost + 2; ++tick) {
+        for (const pid_t pid : recording.nextTick()) {
+            recording.add(pid, WallTime(std::chrono::seconds(tick)), sampleOf(0));
+            ++looked;
+        }
+    }
+    EXPECT_EQ(looked, 2 * (kMost + kMost / 2 + 1));
+    const RecordedSamples taken = recording.take(WallTime());
+    for (const RecordedSamples::Process& process : taken.processes) {
+        ASSERT_EQ(process.samples.size(), kMost / 2 + 1);
+        for (std::size_t i = 0; i < process.samples.size(); ++i) {
+            ASSERT_EQ(process.samples[i].time, WallTime(std::chrono::seconds(4 * i)));
+        }
+    }
+    EXPECT_THAT(recording.nextTick(), IsEmpty());
+}
+
+/// Messages in tenths of a second from the start, of a session of one second.
+SessionTrace marksOf(const std::vector<std::pair<int, Dictionary>>& payloads,
+                     AudioEventType type = AudioEventTypeGeneric) {
+    std::vector<MessageRef> messages;
+    for (auto [tenths, payload] : payloads) {
+        payload.set("zrreporting_timestamp", secondsSince1970(kStartTime) + tenths / 10.0);
+        messages.push_back(std::make_shared<ZRReportingSessionMessage>(payload, 0x08000001U, type));
+    }
+    SessionTrace trace;
+    trace.recorded.begin = kStartTime;
+    trace.recorded.end = kStartTime + 1s;
+    addMarks(trace, messages);
+    return trace;
+}
+
+TEST(SessionTraceTest, StretchesAreWhereOutputAndInputRan) {
+    const Dictionary on{{"session_output_running", true}};
+    const Dictionary off{{"session_output_running", "NO"}};
+    const Dictionary duration{{"session_duration", 1.0}};
+    const Dictionary other{{"QVSessionVolume", 0.5}};
+    const struct {
+        std::vector<std::pair<int, Dictionary>> messages;
+        std::string output; ///< begin and end of each, in tenths
+    } cases[] = {
+        {{}, ""},
+        {{{2, on}, {3, other}, {4, on}, {5, off}, {6, off}, {7, on}}, "2-5 7-10 "},
+        {{{2, on}, {4, duration}, {5, other}, {6, {{"session_output_running", 1.5}}}}, "2-4 6-10 "},
+        {{{2, {{"session_output_running", true}, {"session_duration", 1.0}}}, {3, off}}, "2-3 "},
+        {{{1, {{"session_input_running", true}}}, {2, off}, {3, duration}}, ""},
+        // Times beyond the session, in no order, and such as are none.
+        {{{-50, on}, {-20, off}, {-10, on}, {3, off}}, "0-3 "},
+        {{{5, on}, {4, off}, {8, on}, {2'000'000'000, off}}, "8-10 "},
+        {{{2, on}, {30, off}, {31, on}}, "2-10 "},
+    };
+    for (const auto& c : cases) {
+        std::string found;
+        for (const SessionTrace::Stretch& stretch : marksOf(c.messages).output) {
+            found +=
+                std::to_string(
+                    std::chrono::round<std::chrono::milliseconds>(stretch.begin - kStartTime).count() / 100) +
+                "-" +
+                std::to_string(
+                    std::chrono::round<std::chrono::milliseconds>(stretch.end - kStartTime).count() / 100) +
+                " ";
+        }
+        EXPECT_EQ(found, c.output);
+    }
+    SessionTrace trace = marksOf({{1, {{"session_input_running", true}}}, {2, on}, {4, duration}});
+    ASSERT_THAT(trace.input, SizeIs(1));
+    const Json events = Json::parse(chromeTraceText(trace).view()).at("traceEvents");
+    EXPECT_NE(events.at(4).at("tid"), events.at(5).at("tid")) << "slices that overlap need tracks";
+}
+
+TEST(SessionTraceTest, IssuesAreInstants) {
+    for (const AudioEventType type : {AudioEventTypeError, AudioEventTypeIssueDetector}) {
+        const std::string longest(127, 'x');
+        const SessionTrace trace = marksOf({{3, {{"issue_type", "over\"load"}}},
+                                            {4, {{"n", 1}}},
+                                            {5, {{"issue_type", longest + "\xC3\xA9"}}}},
+                                           type);
+        const Json events = Json::parse(chromeTraceText(trace).view()).at("traceEvents");
+        ASSERT_EQ(events.size(), 7U);
+        const std::string typeName(ZRReportingUtilityTypeString(type));
+        EXPECT_EQ(events.at(4).at("name"), "over\"load");
+        EXPECT_EQ(events.at(4).at("s"), "p");
+        EXPECT_EQ(events.at(4).at("args").at("type"), typeName);
+        EXPECT_EQ(events.at(5).at("name"), "Session_Generic_" + typeName);
+        EXPECT_EQ(events.at(5).at("ts"), kStart + 400'000);
+        EXPECT_EQ(events.at(6).at("name"), longest);
+    }
+    EXPECT_THAT(marksOf({{3, {{"issue_type", "x"}}}}, AudioEventTypeGeneric).issues, IsEmpty());
+}
+
+TEST(SessionTraceTest, MarksAreLimited) {
+    const SessionTrace trace =
+        marksOf(std::vector<std::pair<int, Dictionary>>(SessionTrace::kMostMarks - 1, {3, {{"n", 1}}}), 6);
+    EXPECT_EQ(trace.droppedMarks, 0U);
+    std::vector<std::pair<int, Dictionary>> more(SessionTrace::kMostMarks, {3, {{"n", 1}}});
+    more.front().second.set("session_output_running", true);
+    const SessionTrace full = marksOf(more, 6);
+    EXPECT_THAT(full.issues, SizeIs(SessionTrace::kMostMarks));
+    EXPECT_THAT(full.output, IsEmpty());
+    EXPECT_EQ(full.droppedMarks, 1U);
+}
+
+} // namespace
+} // namespace tamblo

@@ -1,0 +1,108 @@
+#include "workers/accessories/AccessoryRegistry.h"
+
+#include "base/Rfc3339.h"
+
+#include <algorithm>
+#include <cmath>
+#include <map>
+#include <string>
+#include <string_view>
+#include <utility>
+
+namespace tamblo {
+
+namespace {
+
+constexpr std::string_view kFirstSeen = "first_seen";
+constexpr std::string_view kLastSeen = "last_seen";
+constexpr std::string_view kLastReported = "last_reported";
+
+constexpr std::string_view kDayPattern = "0000-00-00";
+
+struct Entry {
+    std::string firstSeen;
+    std::string lastSeen;
+    std::optional<double> lastReported; ///< seconds since 1970
+};
+using Entries = std::map<std::string, Entry, std::less<>>;
+
+/// "2026-11-21": such texts are in the order of the days.
+std::string dayOf(WallTime time) {
+    std::string text = formatRfc3339(secondsSince1970(time)).value_or(std::string(kDayPattern));
+    text.resize(kDayPattern.size());
+    return text;
+}
+
+bool isDay(const Value* value) noexcept {
+    const std::string_view text = value != nullptr ? value->stringValue() : std::string_view();
+    return std::equal(
+        text.begin(), text.end(), kDayPattern.begin(), kDayPattern.end(),
+        [](char c, char expected) { return expected == '0' ? c >= '0' && c <= '9' : c == expected; });
+}
+
+Entries entriesOf(const std::optional<Value>& kept, bool& hadRubbish) {
+    Entries entries;
+    if (!kept) {
+        return entries;
+    }
+    hadRubbish = !kept->isDictionary();
+    const Dictionary& registered = kept->dictionaryValue();
+    for (std::size_t i = 0; i < registered.size(); ++i) {
+        const Dictionary& fields = registered.valueAt(i).dictionaryValue();
+        const Value* firstSeen = fields.find(kFirstSeen);
+        const Value* lastSeen = fields.find(kLastSeen);
+        const Value* lastReported = fields.find(kLastReported);
+        if (!isDay(firstSeen) || !isDay(lastSeen) || lastReported == nullptr || !lastReported->isNumber()) {
+            hadRubbish = true;
+            continue;
+        }
+        entries[std::string(registered.keyAt(i))] = {std::string(firstSeen->stringValue()),
+                                                     std::string(lastSeen->stringValue()),
+                                                     lastReported->doubleValue()};
+    }
+    return entries;
+}
+
+/// A time far ahead was written while the clock was wrong, and must not silence the accessory until then; one
+/// a little ahead may be of a clock that was just set.
+bool isDue(const Entry& entry, double now) noexcept {
+    constexpr double kInterval = std::chrono::duration<double>(AccessoryRegistry::kReportInterval).count();
+    return !entry.lastReported || !(std::abs(now - *entry.lastReported) < kInterval);
+}
+
+void forgetLongestUnseen(Entries& entries) {
+    while (entries.size() > AccessoryRegistry::kMostAccessories) {
+        entries.erase(std::min_element(entries.begin(), entries.end(), [](const auto& a, const auto& b) {
+            return a.second.lastSeen < b.second.lastSeen;
+        }));
+    }
+}
+
+} // namespace
+
+AccessoryRegistry::Update AccessoryRegistry::update(const std::optional<Value>& kept,
+                                                    std::span<const Accessory> seen, WallTime now) {
+    Update update;
+    Entries entries = entriesOf(kept, update.hadRubbish);
+    const std::string today = dayOf(now);
+    for (const Accessory& accessory : seen.first(std::min(seen.size(), kMostAccessories))) {
+        Entry& entry = entries[accessory.identifier];
+        entry.firstSeen = entry.firstSeen.empty() ? today : std::min(entry.firstSeen, today);
+        entry.lastSeen = today;
+        if (isDue(entry, secondsSince1970(now))) {
+            entry.lastReported = secondsSince1970(now);
+            update.reports.push_back({{"model", accessory.model.empty() ? "unknown" : accessory.model},
+                                      {"first_seen_day", entry.firstSeen},
+                                      {"last_seen_day", entry.lastSeen}});
+        }
+    }
+    forgetLongestUnseen(entries);
+    for (const auto& [identifier, entry] : entries) {
+        update.registered.set(identifier, Dictionary{{kFirstSeen, entry.firstSeen},
+                                                     {kLastSeen, entry.lastSeen},
+                                                     {kLastReported, entry.lastReported.value_or(0.0)}});
+    }
+    return update;
+}
+
+} // namespace tamblo

@@ -1,0 +1,188 @@
+#include "workers/trace/ChromeTrace.h"
+
+#include "base/Format.h"
+#include "base/Json.h"
+#include "base/Utf8.h"
+#include "util/LogText.h"
+
+#include <chrono>
+#include <cmath>
+
+namespace tamblo {
+
+namespace {
+
+/// Tracks that are no thread of the process have numbers above all that the kernel gives out (2^22).
+constexpr std::int64_t kFirstOwnTrack = (std::int64_t{1} << 22U) + 1;
+constexpr std::int64_t kOutputTrack = kFirstOwnTrack;
+constexpr std::int64_t kInputTrack = kFirstOwnTrack + 1;
+/// Bytes of an issue's name: it comes from a client, and nobody reads more of it in a viewer.
+constexpr std::size_t kLongestName = 128;
+
+std::int64_t microseconds(WallTime time) noexcept {
+    return std::chrono::floor<std::chrono::microseconds>(time.time_since_epoch()).count();
+}
+
+/// How much a counter has grown.
+double growth(std::uint64_t from, std::uint64_t to) noexcept {
+    return to > from ? static_cast<double>(to - from) : 0.0;
+}
+
+double growth(std::chrono::microseconds from, std::chrono::microseconds to) noexcept {
+    return to > from ? static_cast<double>(to.count()) - static_cast<double>(from.count()) : 0.0;
+}
+
+std::string issueName(const SessionTrace::Issue& issue) {
+    std::string name;
+    if (issue.issueType) {
+        name = formatted("{}", *issue.issueType);
+    }
+    if (name.empty()) {
+        name = formatted("{}_{}", ZRReportingUtilityCategoryString(issue.category),
+                         ZRReportingUtilityTypeString(issue.type));
+    }
+    if (name.size() > kLongestName) {
+        std::size_t end = kLongestName;
+        while (end > 0 && isUtf8Continuation(name[end])) {
+            --end;
+        }
+        name.resize(end);
+    }
+    return name;
+}
+
+/// Writes one file.
+class TraceText {
+public:
+    explicit TraceText(const SessionTrace& trace) : trace_(trace) {}
+
+    [[nodiscard]] TextBuffer take() {
+        text_.append("{\"traceEvents\":[");
+        names();
+        marks();
+        for (const RecordedSamples::Process& process : trace_.recorded.processes) {
+            for (std::size_t i = 0; i < process.samples.size(); ++i) {
+                counters(process.pid, i != 0 ? &process.samples[i - 1] : nullptr, process.samples[i]);
+            }
+        }
+        text_.append("\n],\"displayTimeUnit\":\"ms\",\"otherData\":");
+        appendJson(text_, Dictionary{{"reporterID", trace_.reporterID},
+                                     {"serviceName", trace_.serviceName},
+                                     {"applicationName", trace_.applicationName},
+                                     {"droppedMarks", trace_.droppedMarks}});
+        text_.append("}\n");
+        return std::move(text_);
+    }
+
+private:
+    [[nodiscard]] pid_t clientPid() const noexcept {
+        return trace_.recorded.processes.empty() ? 0 : trace_.recorded.processes.front().pid;
+    }
+
+    /// Begins an event with what all of them have; it goes on with its own members and `}`.
+    void event(char phase, std::string_view name, std::int64_t pid, std::int64_t track) {
+        text_.append(isFirst_ ? "\n{\"ph\":\"" : ",\n{\"ph\":\"");
+        isFirst_ = false;
+        text_.append(phase);
+        text_.append("\",\"name\":");
+        appendJsonString(text_, name);
+        number("pid", pid);
+        number("tid", track);
+    }
+    void number(std::string_view name, std::int64_t value) {
+        text_.append(",\"");
+        text_.append(name);
+        text_.append("\":");
+        text_.append(std::to_string(value));
+    }
+    void arguments(const Dictionary& values) {
+        text_.append(",\"args\":");
+        appendJson(text_, values);
+    }
+
+    void name(std::string_view what, std::int64_t pid, std::int64_t track, std::string_view name) {
+        event('M', what, pid, track);
+        arguments({{"name", name}});
+        text_.append('}');
+    }
+    void names() {
+        const auto& processes = trace_.recorded.processes;
+        for (std::size_t i = 0; i < processes.size() && i < trace_.processNames.size(); ++i) {
+            if (!trace_.processNames[i].empty()) {
+                name("process_name", processes[i].pid, processes[i].pid, trace_.processNames[i]);
+            }
+        }
+        name("thread_name", clientPid(), clientPid(), "session");
+        name("thread_name", clientPid(), kOutputTrack, "output");
+        name("thread_name", clientPid(), kInputTrack, "input");
+    }
+
+    void slice(std::string_view name, std::int64_t track, WallTime begin, WallTime end) {
+        event('X', name, clientPid(), track);
+        number("ts", microseconds(begin));
+        number("dur", microseconds(end) - microseconds(begin));
+    }
+    void marks() {
+        slice("session", clientPid(), trace_.recorded.begin, trace_.recorded.end);
+        arguments({{"reporterID", trace_.reporterID}, {"serviceName", trace_.serviceName}});
+        text_.append('}');
+        for (const SessionTrace::Stretch& stretch : trace_.output) {
+            slice("output", kOutputTrack, stretch.begin, stretch.end);
+            text_.append('}');
+        }
+        for (const SessionTrace::Stretch& stretch : trace_.input) {
+            slice("input", kInputTrack, stretch.begin, stretch.end);
+            text_.append('}');
+        }
+        for (const SessionTrace::Issue& issue : trace_.issues) {
+            event('i', issueName(issue), clientPid(), clientPid());
+            number("ts", microseconds(issue.time));
+            text_.append(",\"s\":\"p\"");
+            arguments({{"category", ZRReportingUtilityCategoryString(issue.category)},
+                       {"type", ZRReportingUtilityTypeString(issue.type)}});
+            text_.append('}');
+        }
+    }
+
+    void counter(std::string_view name, pid_t pid, const TimedSample& sample, const Dictionary& values) {
+        event('C', name, pid, pid);
+        number("ts", microseconds(sample.time));
+        arguments(values);
+        text_.append('}');
+    }
+    /// Totals become rates, for which there has to be a sample before.
+    void counters(pid_t pid, const TimedSample* before, const TimedSample& sample) {
+        const ProcessSample& now = sample.figures;
+        counter("memory (bytes)", pid, sample, {{"resident", now.residentBytes}});
+        counter("threads", pid, sample, {{"threads", now.threads}});
+        if (before == nullptr || before->time >= sample.time) {
+            return;
+        }
+        const ProcessSample& then = before->figures;
+        const double seconds = std::chrono::duration<double>(sample.time - before->time).count();
+        // A viewer shows three digits; more would be half of the file.
+        const auto rate = [seconds](double gained) { return std::round(gained / seconds * 1e3) / 1e3; };
+        const auto percent = [rate](double micros) { return rate(micros / 1e6 * 100); };
+        counter("processor time (% of a core)", pid, sample,
+                {{"user", percent(growth(then.userTime, now.userTime))},
+                 {"system", percent(growth(then.systemTime, now.systemTime))}});
+        counter("context switches (per second)", pid, sample,
+                {{"voluntary", rate(growth(then.voluntarySwitches, now.voluntarySwitches))},
+                 {"involuntary", rate(growth(then.involuntarySwitches, now.involuntarySwitches))}});
+        counter("page faults (per second)", pid, sample,
+                {{"minor", rate(growth(then.minorFaults, now.minorFaults))},
+                 {"major", rate(growth(then.majorFaults, now.majorFaults))}});
+    }
+
+    const SessionTrace& trace_;
+    TextBuffer text_;
+    bool isFirst_ = true;
+};
+
+} // namespace
+
+TextBuffer chromeTraceText(const SessionTrace& trace) {
+    return TraceText(trace).take();
+}
+
+} // namespace tamblo

@@ -1,0 +1,74 @@
+#pragma once
+
+#include "platform/WorkQueue.h"
+#include "workers/trace/SampleRecording.h"
+
+#include <chrono>
+#include <cstddef>
+#include <memory>
+#include <mutex>
+#include <span>
+#include <vector>
+
+#include <sys/types.h>
+
+namespace tamblo {
+
+/// Samples the processes of all traced sessions, ten times a second, on one thread of its own, each process
+/// once in a tick however many sessions it has.
+///
+/// There is one while a session is traced, and none otherwise: a service that traces nothing makes no
+/// wake-up for it. The recordings own it together, and it goes with the last of them.
+class ProcessSampler : public std::enable_shared_from_this<ProcessSampler> {
+    struct Shared {
+        explicit Shared() = default;
+    };
+
+public:
+    static constexpr std::chrono::milliseconds kInterval{100};
+    /// Sessions traced at a time, which bounds the work of a tick (a process costs some ten microseconds) and
+    /// the memory that the samples take.
+    static constexpr std::size_t kMostRecordings = 32;
+
+    /// A recording that goes on until this is destroyed. Used by one thread at a time.
+    class Recording {
+    public:
+        Recording(std::shared_ptr<ProcessSampler> sampler, std::shared_ptr<SampleRecording> samples)
+            : sampler_(std::move(sampler)), samples_(std::move(samples)) {}
+        ~Recording() { sampler_->forget(*samples_); }
+        Recording(const Recording&) = delete;
+        Recording& operator=(const Recording&) = delete;
+
+        /// What there is so far; nothing comes after it.
+        [[nodiscard]] RecordedSamples take(WallTime now) { return samples_->take(now); }
+        /// Does work that may wait for a disk, one piece after the other with that of other recordings.
+        void runLater(Work work) { sampler_->queue_->post(std::move(work), Pace::mayBlock); }
+
+    private:
+        const std::shared_ptr<ProcessSampler> sampler_;
+        const std::shared_ptr<SampleRecording> samples_;
+    };
+
+    /// Begins to record these processes; null when as many sessions as may be are recorded already. Any
+    /// thread, without waiting.
+    [[nodiscard]] static std::unique_ptr<Recording> record(std::span<const pid_t> processes);
+
+    explicit ProcessSampler(Shared);
+    ~ProcessSampler();
+    ProcessSampler(const ProcessSampler&) = delete;
+    ProcessSampler& operator=(const ProcessSampler&) = delete;
+
+private:
+    [[nodiscard]] static std::shared_ptr<ProcessSampler> shared();
+    [[nodiscard]] bool add(std::shared_ptr<SampleRecording> recording);
+    void forget(const SampleRecording& recording);
+    void tick();
+
+    const std::unique_ptr<SerialQueue> queue_;
+    std::mutex mutex_; ///< guards what follows
+    std::unique_ptr<RepeatingTimer> timer_;
+    std::vector<std::shared_ptr<SampleRecording>> recordings_;
+    bool isFullTold_ = false;
+};
+
+} // namespace tamblo

@@ -1,0 +1,33 @@
+#pragma once
+
+#include "session/ZRReportingSessionWorkerProtocol.h"
+#include "workers/trace/ProcessSampler.h"
+
+#include <memory>
+#include <optional>
+
+namespace tamblo {
+
+/// Traces a session's performance on internal builds: samples of the client's process and of the service's
+/// from start to stop, and at the stop a file of them with the session's stretches and issues, which trace
+/// viewers open.
+///
+/// Neither consumer nor producer, it stops behind all workers that are. The file is made and written later,
+/// on another thread, and the session's stop does not wait for it; what cannot be written is lost, which one
+/// error line tells. A session beyond the most that are traced at a time is not; its next start tries again.
+class ZRReportingSessionTraceWorker final : public ZRReportingSessionWorkerProtocol {
+public:
+    using ZRReportingSessionWorkerProtocol::ZRReportingSessionWorkerProtocol;
+
+    /// Null on any other build.
+    [[nodiscard]] static std::shared_ptr<ZRReportingSessionWorkerProtocol>
+    initWithSession(const std::shared_ptr<ZRReportingSession>& session);
+
+    std::optional<bool> start() override;
+    void stop() override;
+
+private:
+    std::unique_ptr<ProcessSampler::Recording> recording_;
+};
+
+} // namespace tamblo
