@@ -57,18 +57,10 @@ void sample(const ProcessFiles& files, pid_t process, ThreadStacks& thread) {
     }
 }
 
-/// Samples that a busy device comes too late for are left out, so that all ends in time.
 void sampleAll(const ProcessFiles& files, Clock& clock, std::vector<ProcessStacks>& processes) {
-    using Steady = std::chrono::steady_clock;
-    const Steady::time_point start = Steady::now();
     for (int i = 0; i < LinuxDiagnosticCapture::kSamples; ++i) {
-        const auto due = start + i * LinuxDiagnosticCapture::kSampleInterval;
-        const auto early = due - Steady::now();
-        if (i > 0 && early <= -LinuxDiagnosticCapture::kSampleInterval) {
-            continue;
-        }
-        if (early > Steady::duration::zero()) {
-            clock.sleepFor(std::chrono::duration_cast<std::chrono::microseconds>(early));
+        if (i > 0) {
+            clock.sleepFor(LinuxDiagnosticCapture::kSampleInterval);
         }
         for (ProcessStacks& process : processes) {
             for (ThreadStacks& thread : process.threads) {

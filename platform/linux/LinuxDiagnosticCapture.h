@@ -33,9 +33,9 @@ public:
 
     static constexpr int kSamples = 5;
     static constexpr std::chrono::milliseconds kSampleInterval{25};
-    /// Of all processes together: a sample takes some thirty microseconds, so that these take about an
-    /// interval. Those that are looked at last go without.
-    static constexpr std::size_t kMaximumThreads = 1024;
+    /// Of all processes together: a sample takes some thirty microseconds, so that those of all threads take
+    /// less than the interval. Threads of the processes that come last go without.
+    static constexpr std::size_t kMaximumThreads = 512;
     /// Each takes a tenth of a second, by which it can hold up the service's end.
     static constexpr std::size_t kMaximumWaiting = 4;
 
