@@ -14,6 +14,7 @@
 #include "workers/sinks/ZRReportingSessionQuilletWorker.h"
 #include "workers/sinks/ZRReportingSessionRtcWorker.h"
 #include "workers/sinks/ZRReportingSessionSummaryJsonFileWorker.h"
+#include "workers/sinks/ZRReportingSessionZephWorker.h"
 #include "workers/trace/ZRReportingSessionTraceWorker.h"
 
 #include <array>
@@ -68,7 +69,10 @@ constexpr std::array<WorkerClass, 17> kWorkerClasses{{
     {.name = "ZRReportingSessionSystemMonitorWorker",
      .role = kProducer,
      .initWithSession = initWithSession<ZRReportingSessionSystemMonitorWorker>},
-    {.name = "ZRReportingSessionZephWorker", .role = kConsumer, .handleSingleMessageSession = true},
+    {.name = "ZRReportingSessionZephWorker",
+     .role = kConsumer,
+     .handleSingleMessageSession = true,
+     .initWithSession = ZRReportingSessionZephWorker::initWithSession},
     {.name = "ZRReportingSessionDPWorker",
      .role = kConsumer,
      .initWithSession = ZRReportingSessionDPWorker::initWithSession},

@@ -1,0 +1,60 @@
+#pragma once
+
+#include "base/Dictionary.h"
+#include "platform/BugCaptureService.h"
+#include "platform/Clock.h"
+
+#include <chrono>
+#include <cstdint>
+#include <limits>
+#include <memory>
+#include <mutex>
+#include <optional>
+#include <string>
+#include <string_view>
+
+namespace tamblo {
+
+/// What the bug-capture worker counts for one detector, and the thresholds at which the detector fires.
+///
+/// A detector's own, or shared by the detectors of a class in all sessions, for the life of the process.
+/// Used on the thread that does the sessions' work, but for the identifier of the capture session: the
+/// capture service answers on any thread.
+class WorkerInstanceState {
+public:
+    /// Whether a detector that has seen an interesting message now is to fire.
+    [[nodiscard]] bool isDue(WallTime now) const noexcept;
+    /// Begins to count anew. What was fired stays.
+    void resetInterest() noexcept;
+
+    // Any thread.
+    [[nodiscard]] std::optional<std::string> currentZephSessionIdentifier() const;
+    void setCurrentZephSessionIdentifier(std::string identifier);
+
+    /// At most once in the life of the state.
+    bool oncePerSession = false;
+    std::uint64_t interestThresholdCount = std::numeric_limits<std::uint64_t>::max();
+    /// To be exceeded; only without a threshold of the count.
+    std::chrono::duration<double> interestThresholdDurationSeconds{std::numeric_limits<double>::max()};
+
+    // Since the last firing.
+    std::uint64_t interestedCount = 0;
+    std::optional<WallTime> interestFirstSeen;
+    std::optional<Dictionary> lastMessage;
+
+    std::uint64_t firedCount = 0;
+    std::unique_ptr<GlarnReporter> symptomReporter; ///< of the latest firing
+
+private:
+    mutable std::mutex mutex_; ///< guards what follows
+    std::optional<std::string> currentZephSessionIdentifier_;
+};
+
+/// The state that all detectors of a class share. The first of them has it made.
+[[nodiscard]] std::shared_ptr<WorkerInstanceState>
+sharedWorkerInstanceState(std::string_view detectorClassName,
+                          std::shared_ptr<WorkerInstanceState> (*makeState)());
+/// Makes the next detectors begin with new states: after another platform was installed.
+void forgetSharedWorkerInstanceStates();
+
+} // namespace tamblo

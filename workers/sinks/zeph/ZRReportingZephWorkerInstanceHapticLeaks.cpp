@@ -1,0 +1,34 @@
+#include "workers/sinks/zeph/ZRReportingZephWorkerInstanceHapticLeaks.h"
+
+#include "workers/sinks/zeph/LeakSnapshot.h"
+
+namespace tamblo {
+
+namespace {
+
+std::shared_ptr<WorkerInstanceState> makeState() {
+    auto state = std::make_shared<WorkerInstanceState>();
+    state->interestThresholdCount = 2;
+    state->interestThresholdDurationSeconds = std::chrono::seconds(60);
+    return state;
+}
+
+} // namespace
+
+ZRReportingZephWorkerInstanceHapticLeaks::ZRReportingZephWorkerInstanceHapticLeaks(
+    std::weak_ptr<ZRReportingSession> session)
+    : ZRReportingSessionZephWorkerInstance(std::move(session)) {
+    setWorkerState(sharedWorkerInstanceState(kClassName, makeState));
+}
+
+bool ZRReportingZephWorkerInstanceHapticLeaks::interestedInMessage(
+    const ZRReportingSessionMessage& message) const {
+    return message.type() == AudioEventTypeJoulery &&
+           message.payload().contains("Haptic_Active_Hardware_Time_Seconds");
+}
+
+void ZRReportingZephWorkerInstanceHapticLeaks::fire(const ZRReportingSessionMessage& message) {
+    requestLeakSnapshot(*this, message, AudioServiceTypeHaptics, "haptics");
+}
+
+} // namespace tamblo
