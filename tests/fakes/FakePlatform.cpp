@@ -37,7 +37,7 @@ void FakePlatform::installWith(const Others& others) {
                      .bugReportDrafting = bugReportDrafting,
                      .diagnosticCapture = diagnosticCapture,
                      .memoryLog = memoryLog,
-                     .chanlog = chanlog,
+                     .chanlog = choose(others.chanlog, chanlog),
                      .processSampling = processSampling,
                      .accessories = accessories,
                      .connections = connections});

@@ -40,6 +40,7 @@ public:
         TracePoints* tracePoints = nullptr;
         AnalyticsEventService* analyticsEvents = nullptr;
         CallQualityService* callQuality = nullptr;
+        ChanlogFacility* chanlog = nullptr;
     };
     void installWith(const Others& others);
 
