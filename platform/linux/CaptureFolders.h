@@ -30,7 +30,8 @@ class CaptureFolders {
 public:
     static constexpr std::chrono::days kMaximumAge{30};
     struct Limits {
-        /// Of all folders, by the lengths of their files. A capture of a busy session takes about 1 MiB.
+        /// Of all folders, by the lengths of their files. One has 1 MiB of log at most, and some kilobytes
+        /// for each process.
         std::uint64_t totalSize = 200U << 20U;
     };
 
