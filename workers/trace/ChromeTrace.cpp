@@ -12,10 +12,11 @@ namespace tamblo {
 
 namespace {
 
-/// Tracks that are no thread of the process have numbers above all that the kernel gives out (2^22).
-constexpr std::int64_t kFirstOwnTrack = (std::int64_t{1} << 22U) + 1;
-constexpr std::int64_t kOutputTrack = kFirstOwnTrack;
-constexpr std::int64_t kInputTrack = kFirstOwnTrack + 1;
+/// Slices are on tracks of their own, whose numbers are above all that the kernel gives to threads (2^22),
+/// and differ between sessions: the files of several may be laid over each other.
+enum class Track { session, output, input, count };
+constexpr std::int64_t kFirstTrack = (std::int64_t{1} << 22U) + 1;
+constexpr std::uint64_t kSessionsApart = 1U << 20U;
 /// Bytes of an issue's name: it comes from a client, and nobody reads more of it in a viewer.
 constexpr std::size_t kLongestName = 128;
 
@@ -112,26 +113,36 @@ private:
                 name("process_name", processes[i].pid, processes[i].pid, trace_.processNames[i]);
             }
         }
-        name("thread_name", clientPid(), clientPid(), "session");
-        name("thread_name", clientPid(), kOutputTrack, "output");
-        name("thread_name", clientPid(), kInputTrack, "input");
+        for (const Track track : {Track::session, Track::output, Track::input}) {
+            name("thread_name", clientPid(), numberOf(track),
+                 formatted("{} {}", nameOf(track), trace_.reporterID));
+        }
     }
 
-    void slice(std::string_view name, std::int64_t track, WallTime begin, WallTime end) {
-        event('X', name, clientPid(), track);
+    [[nodiscard]] std::int64_t numberOf(Track track) const noexcept {
+        const auto session =
+            static_cast<std::int64_t>(static_cast<std::uint64_t>(trace_.reporterID) % kSessionsApart);
+        return kFirstTrack + session * static_cast<std::int64_t>(Track::count) +
+               static_cast<std::int64_t>(track);
+    }
+    static std::string_view nameOf(Track track) noexcept {
+        return track == Track::session ? "session" : track == Track::output ? "output" : "input";
+    }
+    void slice(Track track, WallTime begin, WallTime end) {
+        event('X', nameOf(track), clientPid(), numberOf(track));
         number("ts", microseconds(begin));
         number("dur", microseconds(end) - microseconds(begin));
     }
     void marks() {
-        slice("session", clientPid(), trace_.recorded.begin, trace_.recorded.end);
+        slice(Track::session, trace_.recorded.begin, trace_.recorded.end);
         arguments({{"reporterID", trace_.reporterID}, {"serviceName", trace_.serviceName}});
         text_.append('}');
         for (const SessionTrace::Stretch& stretch : trace_.output) {
-            slice("output", kOutputTrack, stretch.begin, stretch.end);
+            slice(Track::output, stretch.begin, stretch.end);
             text_.append('}');
         }
         for (const SessionTrace::Stretch& stretch : trace_.input) {
-            slice("input", kInputTrack, stretch.begin, stretch.end);
+            slice(Track::input, stretch.begin, stretch.end);
             text_.append('}');
         }
         for (const SessionTrace::Issue& issue : trace_.issues) {

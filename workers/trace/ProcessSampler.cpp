@@ -44,23 +44,14 @@ std::shared_ptr<ProcessSampler> ProcessSampler::shared() {
 
 std::unique_ptr<ProcessSampler::Recording> ProcessSampler::record(std::span<const pid_t> processes) {
     const std::shared_ptr<ProcessSampler> sampler = shared();
-    auto samples = std::make_shared<SampleRecording>(processes, platform().clock.now());
-    return sampler->add(samples) ? std::make_unique<Recording>(sampler, std::move(samples)) : nullptr;
+    std::shared_ptr<SampleRecording> samples = sampler->begin(processes);
+    return samples != nullptr ? std::make_unique<Recording>(sampler, std::move(samples)) : nullptr;
 }
 
 ProcessSampler::ProcessSampler(Shared)
     : queue_(platform().workQueues.makeSerialQueue("com.vandra.tamblo.trace")) {}
 
-ProcessSampler::~ProcessSampler() {
-    if (timer_ == nullptr) {
-        return;
-    }
-    // Its end waits for a tick that runs, and a tick reads files: not here, on the session's thread.
-    timer_->invalidate();
-    queue_->post([timer = std::move(timer_)]() mutable { timer.reset(); }, Pace::mayBlock);
-}
-
-bool ProcessSampler::add(std::shared_ptr<SampleRecording> recording) {
+std::shared_ptr<SampleRecording> ProcessSampler::begin(std::span<const pid_t> processes) {
     const std::lock_guard lock(mutex_);
     if (recordings_.size() >= kMostRecordings) {
         if (!std::exchange(isFullTold_, true)) {
@@ -68,9 +59,10 @@ bool ProcessSampler::add(std::shared_ptr<SampleRecording> recording) {
                       "{} sessions are traced already; further ones are not until one of them stops",
                       recordings_.size());
         }
-        return false;
+        return nullptr;
     }
-    recordings_.push_back(std::move(recording));
+    auto recording = std::make_shared<SampleRecording>(processes, platform().clock.now());
+    recordings_.push_back(recording);
     if (timer_ == nullptr) {
         timer_ = platform().workQueues.makeRepeatingTimer(kInterval, [sampler = weak_from_this()] {
             if (const std::shared_ptr<ProcessSampler> alive = sampler.lock()) {
@@ -79,13 +71,24 @@ bool ProcessSampler::add(std::shared_ptr<SampleRecording> recording) {
         });
         timer_->start();
     }
-    return true;
+    return recording;
 }
 
 void ProcessSampler::forget(const SampleRecording& recording) {
-    const std::lock_guard lock(mutex_);
-    std::erase_if(recordings_, [&recording](const auto& known) { return known.get() == &recording; });
-    isFullTold_ = false;
+    std::unique_ptr<RepeatingTimer> ended;
+    {
+        const std::lock_guard lock(mutex_);
+        std::erase_if(recordings_, [&recording](const auto& known) { return known.get() == &recording; });
+        isFullTold_ = false;
+        if (recordings_.empty()) {
+            ended = std::move(timer_);
+        }
+    }
+    if (ended != nullptr) {
+        // Its destructor waits for a tick that runs, and a tick reads files: not on the session's thread.
+        ended->invalidate();
+        queue_->post([timer = std::move(ended)]() mutable { timer.reset(); }, Pace::mayBlock);
+    }
 }
 
 void ProcessSampler::tick() {

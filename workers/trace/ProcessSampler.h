@@ -26,8 +26,8 @@ class ProcessSampler : public std::enable_shared_from_this<ProcessSampler> {
 
 public:
     static constexpr std::chrono::milliseconds kInterval{100};
-    /// Sessions traced at a time, which bounds the work of a tick (a process costs some ten microseconds) and
-    /// the memory that the samples take.
+    /// Sessions traced at a time: bounds the work of a tick, which reads a few of the kernel's files for each
+    /// process, and the memory of the samples, some 20 MiB at the very most.
     static constexpr std::size_t kMostRecordings = 32;
 
     /// A recording that goes on until this is destroyed. Used by one thread at a time.
@@ -54,13 +54,12 @@ public:
     [[nodiscard]] static std::unique_ptr<Recording> record(std::span<const pid_t> processes);
 
     explicit ProcessSampler(Shared);
-    ~ProcessSampler();
     ProcessSampler(const ProcessSampler&) = delete;
     ProcessSampler& operator=(const ProcessSampler&) = delete;
 
 private:
     [[nodiscard]] static std::shared_ptr<ProcessSampler> shared();
-    [[nodiscard]] bool add(std::shared_ptr<SampleRecording> recording);
+    [[nodiscard]] std::shared_ptr<SampleRecording> begin(std::span<const pid_t> processes);
     void forget(const SampleRecording& recording);
     void tick();
 
