@@ -70,6 +70,7 @@ void addRequest(SinkObject& line, const CaptureRequest& request) {
 
 std::vector<CaptureFile> CaptureContent::gather(const CaptureRequest& request, WallTime now) const {
     std::vector<CaptureFile> files;
+    files.reserve(request.processes.size() + 2);
     // First what changes fastest.
     for (const pid_t process : request.processes) {
         files.push_back({formatted("process-{}.txt", process), processText(process)});
