@@ -3,11 +3,7 @@
 
 #include <gmock/gmock.h>
 
-#include <array>
-#include <cstdio>
 #include <string>
-
-#include <sys/wait.h>
 
 // Haptics usage and detected issues, from the socket to the files of their sinks.
 
@@ -17,23 +13,6 @@ namespace {
 using testing::HasSubstr;
 using testing::MatchesRegex;
 using wire::Method;
-
-struct Outcome {
-    int status = -1;
-    std::string output;
-};
-
-Outcome run(const std::string& command) {
-    Outcome done;
-    std::FILE* pipe = ::popen(command.c_str(), "r");
-    std::array<char, 4096> piece{};
-    for (std::size_t count = 1; count > 0;) {
-        count = std::fread(piece.data(), 1, piece.size(), pipe);
-        done.output.append(piece.data(), count);
-    }
-    done.status = WEXITSTATUS(::pclose(pipe));
-    return done;
-}
 
 TEST(PowerAndMetrics, LinesStandInTheFilesWhenTheReplyIsThere) {
     ServiceProcess service;
@@ -84,7 +63,7 @@ TEST(PowerAndMetrics, LinesStandInTheFilesWhenTheReplyIsThere) {
     EXPECT_THAT(service.errorOutput(), HasSubstr("Failed to get issue_type for AudioIssueDetected"));
     EXPECT_THAT(service.errorOutput(), HasSubstr("failed to get app name for joulery"));
 
-    const Outcome shown = run(TAMBLOCTL_PATH " decode --file " + metrics.string());
+    const CommandResult shown = run(TAMBLOCTL_PATH " decode --file " + metrics.string());
     EXPECT_EQ(shown.status, 0);
     EXPECT_THAT(shown.output, HasSubstr("Z 5963779\n  metric: 5963779\n"));
     EXPECT_THAT(shown.output, HasSubstr("AudioIssueDetected {\n  duration: 2\n  issuetype: \"3\"\n"));
@@ -111,7 +90,7 @@ TEST(PowerAndMetrics, TambloctlDecodesWhatItIsGivenOrExitsWithTwo) {
     };
     for (const auto& row : cases) {
         const std::string command = std::string(row.input) + " | " TAMBLOCTL_PATH " decode " + row.arguments;
-        const Outcome done = run(command + " 2>&1");
+        const CommandResult done = run(command + " 2>&1");
         EXPECT_EQ(done.status, row.status) << command;
         EXPECT_THAT(done.output, HasSubstr(row.output)) << command;
     }

@@ -1,12 +1,12 @@
 #include "tests/service/RawClient.h"
 
+#include "tests/service/ServiceProcess.h"
 #include "wire/FrameSplitter.h"
 
 #include <array>
 
 #include <poll.h>
 #include <sys/socket.h>
-#include <sys/un.h>
 #include <unistd.h>
 
 namespace tamblo::test {
@@ -20,9 +20,7 @@ constexpr int kSilenceMilliseconds = 50;
 
 RawClient::RawClient(const std::string& socketPath)
     : socket_(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0)) {
-    sockaddr_un address{};
-    address.sun_family = AF_UNIX;
-    socketPath.copy(address.sun_path, sizeof address.sun_path - 1);
+    const sockaddr_un address = addressOf(socketPath);
     if (::connect(socket_, reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0) {
         close();
     }

@@ -20,7 +20,6 @@ public:
     RawClient(const RawClient&) = delete;
     RawClient& operator=(const RawClient&) = delete;
 
-    [[nodiscard]] bool isConnected() const noexcept { return socket_ >= 0; }
     [[nodiscard]] int descriptor() const noexcept { return socket_; }
     /// False when the service has gone.
     bool sendBytes(std::string_view bytes) const;

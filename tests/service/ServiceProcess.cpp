@@ -2,6 +2,7 @@
 
 #include <chrono>
 #include <csignal>
+#include <cstdio>
 #include <cstdlib>
 #include <fstream>
 #include <sstream>
@@ -11,7 +12,6 @@
 #include <fcntl.h>
 #include <poll.h>
 #include <sys/socket.h>
-#include <sys/un.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -25,13 +25,9 @@ constexpr std::chrono::milliseconds kPause{2};
 /// A socket on which the service says that it is ready, as it would to a service manager.
 class ReadySocket {
 public:
-    explicit ReadySocket(const std::filesystem::path& path)
-        : socket_(::socket(AF_UNIX, SOCK_DGRAM | SOCK_CLOEXEC, 0)) {
+    explicit ReadySocket(const std::filesystem::path& path) {
         std::filesystem::remove(path);
-        sockaddr_un address{};
-        address.sun_family = AF_UNIX;
-        path.string().copy(address.sun_path, sizeof address.sun_path - 1);
-        ::bind(socket_, reinterpret_cast<const sockaddr*>(&address), sizeof address);
+        socket_ = boundSocket(SOCK_DGRAM, path);
     }
     ~ReadySocket() { ::close(socket_); }
     ReadySocket(const ReadySocket&) = delete;
@@ -43,10 +39,36 @@ public:
     }
 
 private:
-    int socket_;
+    int socket_ = -1;
 };
 
 } // namespace
+
+CommandResult run(const std::string& command) {
+    CommandResult done{};
+    std::FILE* pipe = ::popen(command.c_str(), "r");
+    for (int byte = std::fgetc(pipe); byte != EOF; byte = std::fgetc(pipe)) {
+        done.output += static_cast<char>(byte);
+    }
+    done.status = WEXITSTATUS(::pclose(pipe));
+    return done;
+}
+
+sockaddr_un addressOf(const std::string& socketPath) {
+    sockaddr_un address{};
+    address.sun_family = AF_UNIX;
+    socketPath.copy(address.sun_path, sizeof address.sun_path - 1);
+    return address;
+}
+
+int boundSocket(int type, const std::string& path) {
+    const sockaddr_un address = addressOf(path);
+    const int socket = ::socket(AF_UNIX, type | SOCK_CLOEXEC, 0);
+    if (::bind(socket, reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0) {
+        throw std::runtime_error("cannot bind " + path);
+    }
+    return socket;
+}
 
 std::string readFile(const std::filesystem::path& path) {
     std::ifstream file(path, std::ios::binary);

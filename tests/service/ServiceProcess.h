@@ -9,6 +9,7 @@
 #include <vector>
 
 #include <sys/types.h>
+#include <sys/un.h>
 
 namespace tamblo::test {
 
@@ -59,6 +60,16 @@ private:
     pid_t pid_ = -1;
 };
 
+/// What a command of the shell wrote to its standard output, and its exit status.
+struct CommandResult {
+    std::string output;
+    int status;
+};
+[[nodiscard]] CommandResult run(const std::string& command);
+
+[[nodiscard]] sockaddr_un addressOf(const std::string& socketPath);
+/// A socket of this type that is bound to the path.
+[[nodiscard]] int boundSocket(int type, const std::string& path);
 [[nodiscard]] std::string readFile(const std::filesystem::path& path);
 void writeFile(const std::filesystem::path& path, std::string_view text);
 /// Until the condition holds, at most some seconds.

@@ -2,22 +2,18 @@
 #include "tests/service/ServiceProcess.h"
 
 #include <gtest/gtest.h>
-#include <nlohmann/json.hpp>
 
 #include <csignal>
 #include <string>
 
 #include <fcntl.h>
 #include <sys/socket.h>
-#include <sys/stat.h>
-#include <sys/un.h>
 
 // What one client sees of a running service, and what lies on the disk afterwards.
 
 namespace tamblo::test {
 namespace {
 
-using Json = nlohmann::json;
 using wire::Method;
 
 TEST(Service, MessageOfAStartedSessionBecomesTwoEvents) {
@@ -66,28 +62,6 @@ TEST(Service, MessageOfAStartedSessionBecomesTwoEvents) {
     EXPECT_EQ(client.call(request(Method::getServiceNameForReporterID, 7))->result, Value(65535));
 }
 
-TEST(Service, ReporterZeroIsAnsweredTwice) {
-    ServiceProcess service;
-    RawClient client(service.socketPath());
-    EXPECT_EQ(client.call(request(Method::getServiceNameForReporterID, 0))->result, Value(65535));
-    EXPECT_EQ(client.receive()->result, Value(65535));
-    EXPECT_TRUE(client.staysSilent());
-}
-
-TEST(Service, MessageWithoutReportersReachesAllStartedSessionsOrTheSingleMessageSession) {
-    ServiceProcess service;
-    RawClient first(service.socketPath());
-    first.call(message({{"n", 1}}, {}));
-    EXPECT_EQ(service.countEvents("com.vandra.standalone."), 1U);
-    RawClient second(service.socketPath());
-    startSession(first, 7, 2);
-    startSession(second, 8, 3);
-    first.call(message({{"n", 2}}, {}));
-    EXPECT_EQ(service.countEvents("com.vandra.standalone."), 1U);
-    EXPECT_EQ(service.countEvents("com.vandra.telephony."), 1U);
-    EXPECT_EQ(service.countEvents("com.vandra.haptics."), 1U);
-}
-
 TEST(Service, WhatIsAnsweredSurvivesAKill) {
     ServiceProcess service;
     RawClient client(service.socketPath());
@@ -98,18 +72,6 @@ TEST(Service, WhatIsAnsweredSurvivesAKill) {
     service.signal(SIGKILL);
     EXPECT_EQ(service.awaitEnd(), -SIGKILL);
     EXPECT_EQ(service.events().size(), 200U);
-    // A line torn by a crash is cut off; what stands before it stays.
-    const auto file = service.logs() / "analytics-events.jsonl";
-    writeFile(file, readFile(file) + R"({"time":1.0,"eve)");
-    service.start();
-    RawClient again(service.socketPath());
-    again.call(request(Method::createReportingSession, 7));
-    again.call(message({{"n", 100}}, {7}));
-    const std::vector<std::string> lines = service.events();
-    EXPECT_EQ(lines.size(), 202U);
-    for (const std::string& line : lines) {
-        EXPECT_TRUE(Json::accept(line)) << line;
-    }
 }
 
 TEST(Service, EndsAsAskedTo) {
@@ -175,10 +137,11 @@ TEST(Service, ClientThatLeavesIsReportedOnce) {
         RawClient client(service.socketPath());
         startSession(client, 7);
         client.send(message({{"n", 1}}, {7}));
-        // What was sent before the end is answered to who still listens.
+        // What was sent before the end, within a frame, is answered to who still listens.
         wire::Request reporters = request(Method::getAllReporters);
         reporters.id = 5;
         client.send(reporters);
+        client.sendBytes(std::string("\x40\x00\x00\x00\x84\x00\x05", 7));
         ::shutdown(client.descriptor(), SHUT_WR);
         EXPECT_EQ(client.receive()->result, Value(Array{7}));
         EXPECT_FALSE(client.receive());
@@ -190,23 +153,8 @@ TEST(Service, ClientThatLeavesIsReportedOnce) {
     EXPECT_EQ(service.countEvents("zrreportingclientuptime"), 1U);
 }
 
-TEST(Service, SecondInstanceSaysWhyItCannotStart) {
-    ServiceProcess service;
-    ServiceProcess second({.environment = {{"RUNTIME_DIRECTORY", (service.directory() / "run").string()}},
-                           .awaitsReady = false});
-    EXPECT_EQ(second.awaitEnd(), 1);
-    const std::string said = second.errorOutput();
-    EXPECT_NE(said.find("already answers at " + service.socketPath()), std::string::npos) << said;
-    EXPECT_EQ(std::count(said.begin(), said.end(), '\n'), 1);
-    EXPECT_TRUE(RawClient(service.socketPath()).call(request(Method::getAllReporters)));
-}
-
 TEST(Service, WhatKeepsItFromStartingIsOneClearLine) {
-    struct Case {
-        std::string runtimeDirectory;
-        std::string mentions;
-        std::function<void()> beforeExec;
-    };
+    ServiceProcess first;
     const std::string longPath = (std::filesystem::temp_directory_path() / std::string(90, 'x')).string();
     const std::string taken = (std::filesystem::temp_directory_path() / "tamblo-taken").string();
     writeFile(taken + "/com.vandra.tamblo.reporting", "somebody's");
@@ -214,13 +162,18 @@ TEST(Service, WhatKeepsItFromStartingIsOneClearLine) {
         ::setenv("LISTEN_PID", std::to_string(::getpid()).c_str(), 1);
         ::setenv("LISTEN_FDS", "1", 1);
     };
-    const std::vector<Case> cases = {
+    const struct {
+        std::string runtimeDirectory;
+        std::string mentions;
+        std::function<void()> beforeExec;
+    } cases[] = {
         {"/proc/tamblo", "/proc/tamblo", {}},
         {longPath, "too long", {}},
         {taken, "no socket: remove it", {}},
         {taken, "file descriptor 3", activateWithoutSocket},
+        {first.directory() / "run", "already answers at " + first.socketPath(), {}},
     };
-    for (const Case& hindrance : cases) {
+    for (const auto& hindrance : cases) {
         ServiceProcess service({.environment = {{"RUNTIME_DIRECTORY", hindrance.runtimeDirectory}},
                                 .beforeExec = hindrance.beforeExec,
                                 .awaitsReady = false});
@@ -229,26 +182,19 @@ TEST(Service, WhatKeepsItFromStartingIsOneClearLine) {
         EXPECT_NE(said.find(hindrance.mentions), std::string::npos) << said;
         EXPECT_EQ(std::count(said.begin(), said.end(), '\n'), 1) << said;
     }
+    EXPECT_TRUE(RawClient(first.socketPath()).call(request(Method::getAllReporters)));
     EXPECT_EQ(readFile(taken + "/com.vandra.tamblo.reporting"), "somebody's");
     std::filesystem::remove_all(taken);
     std::filesystem::remove_all(longPath);
 }
 
 TEST(Service, TakesOverAnActivatedSocketAndTellsItsManager) {
-    const auto bound = [](int type, const std::string& path) {
-        sockaddr_un address{};
-        address.sun_family = AF_UNIX;
-        path.copy(address.sun_path, sizeof address.sun_path - 1);
-        const int socket = ::socket(AF_UNIX, type | SOCK_CLOEXEC, 0);
-        EXPECT_EQ(::bind(socket, reinterpret_cast<const sockaddr*>(&address), sizeof address), 0);
-        return socket;
-    };
     std::string directory = (std::filesystem::temp_directory_path() / "tamblo-act-XXXXXX").string();
     ASSERT_NE(::mkdtemp(directory.data()), nullptr);
     const std::string path = directory + "/activated";
-    const int listening = bound(SOCK_STREAM, path);
+    const int listening = boundSocket(SOCK_STREAM, path);
     ASSERT_EQ(::listen(listening, 8), 0);
-    const int manager = bound(SOCK_DGRAM, directory + "/notify");
+    const int manager = boundSocket(SOCK_DGRAM, directory + "/notify");
     // A client may connect before the service runs.
     RawClient early(path);
 
@@ -284,17 +230,9 @@ TEST(Service, PreferenceIsInForceForTheNextMessage) {
     writeFile(preferences, R"({"events_in_use": ["com.vandra.telephony.*"]})");
     client.call(message({{"n", 1}}, {7}));
     EXPECT_EQ(service.events().size(), 1U);
-    writeFile(preferences, R"({"events_in_use": [)");
-    client.call(message({{"n", 2}}, {7}));
-    client.call(message({{"n", 3}}, {7}));
-    EXPECT_EQ(service.events().size(), 5U);
-    const std::string said = service.errorOutput();
-    const auto first = said.find(preferences.string());
-    EXPECT_NE(first, std::string::npos) << said;
-    EXPECT_EQ(said.find(preferences.string(), first + 1), std::string::npos) << said;
     std::filesystem::remove(preferences);
-    client.call(message({{"n", 4}}, {7}));
-    EXPECT_EQ(service.events().size(), 7U);
+    client.call(message({{"n", 2}}, {7}));
+    EXPECT_EQ(service.events().size(), 3U);
 }
 
 TEST(Service, SleepsWhenThereIsNothingToDo) {
@@ -305,21 +243,15 @@ TEST(Service, SleepsWhenThereIsNothingToDo) {
         client.call(message({{"n", 1}}, {7}));
         client.call(request(Method::stopReportingSessionForID, 7));
     }
-    const auto wakeUps = [&service] {
-        std::size_t count = 0;
-        for (const auto& task :
-             std::filesystem::directory_iterator("/proc/" + std::to_string(service.pid()) + "/task")) {
-            const std::string status = readFile(task.path() / "status");
-            const auto at = status.find("\nvoluntary_ctxt_switches:");
-            count += std::stoul(status.substr(at + 26));
-        }
-        return count;
+    const std::filesystem::path process = "/proc/" + std::to_string(service.pid());
+    const auto wakeUps = [&process] {
+        const std::string status = readFile(process / "status");
+        return std::stoul(status.substr(status.find("\nvoluntary_ctxt_switches:") + 26));
     };
     // The pool's threads end after some idle seconds; then nothing moves any more.
-    EXPECT_TRUE(eventually([&] {
-        return std::distance(
-                   std::filesystem::directory_iterator("/proc/" + std::to_string(service.pid()) + "/task"),
-                   std::filesystem::directory_iterator()) == 1;
+    EXPECT_TRUE(eventually([&process] {
+        using Tasks = std::filesystem::directory_iterator;
+        return std::distance(Tasks(process / "task"), Tasks()) == 1;
     }));
     const std::size_t before = wakeUps();
     ::usleep(1'000'000);
