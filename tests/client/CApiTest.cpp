@@ -11,8 +11,8 @@ namespace {
 
 TEST(CApi, ACProgramRunsASessionAndItsPayloadArrivesAsItWasBuilt) {
     test::FakeService service;
-    EXPECT_EQ(runCProgram(service.path().c_str()), 0);
-    EXPECT_EQ(runCProgramInBackground(service.path().c_str()), 0);
+    EXPECT_EQ(runCProgram(service.path().c_str(), 0), 0);
+    EXPECT_EQ(runCProgram(service.path().c_str(), 1), 0);
     ASSERT_TRUE(service.waitForRequests(18));
     const std::uint8_t bytes[] = {0, 1, 255};
     const Dictionary expected{

@@ -43,68 +43,43 @@ static tamblo_payload* make_payload(void) {
     return payload;
 }
 
-static int run_session(tamblo_client* client, const tamblo_payload* payload, Seen* seen) {
+static bool run_session(tamblo_client* client, const tamblo_payload* payload, Seen* seen) {
     const int64_t reporters[] = {7};
-    if (!tamblo_client_create_session(client, 7, on_reply, seen))
-        return __LINE__;
-    if (!tamblo_client_set_service_type(client, 7, 7, on_reply, seen))
-        return __LINE__;
-    if (!tamblo_client_set_configuration(client, payload, 7, on_reply, seen))
-        return __LINE__;
-    if (!tamblo_client_start_session(client, 7, on_reply, seen))
-        return __LINE__;
-    if (!tamblo_client_send(client, payload, 0x08000004, 1, reporters, 1, on_reply, seen))
-        return __LINE__;
-    if (!tamblo_client_send(client, payload, 14, 0, NULL, 0, NULL, NULL))
-        return __LINE__;
-    if (!tamblo_client_stop_session(client, 7, on_reply, seen))
-        return __LINE__;
-    if (!tamblo_client_destroy_session(client, 7, NULL, NULL))
-        return __LINE__;
-    if (!tamblo_client_get_service_type(client, 7, on_reply, seen))
-        return __LINE__;
-    return 0;
+    return tamblo_client_create_session(client, 7, on_reply, seen) &&
+           tamblo_client_set_service_type(client, 7, 7, on_reply, seen) &&
+           tamblo_client_set_configuration(client, payload, 7, on_reply, seen) &&
+           tamblo_client_start_session(client, 7, on_reply, seen) &&
+           tamblo_client_send(client, payload, 0x08000004, 1, reporters, 1, on_reply, seen) &&
+           tamblo_client_send(client, payload, 14, 0, NULL, 0, NULL, NULL) &&
+           tamblo_client_stop_session(client, 7, on_reply, seen) &&
+           tamblo_client_destroy_session(client, 7, NULL, NULL) &&
+           tamblo_client_get_service_type(client, 7, on_reply, seen);
 }
 
-int runCProgram(const char* socket_path) {
+int runCProgram(const char* socket_path, int has_own_thread) {
     Seen seen = {0};
     tamblo_options options = {0};
     options.socket_path = socket_path;
-    options.threading = TAMBLO_CALLER;
-    options.state_changed = on_state;
+    options.threading = has_own_thread ? TAMBLO_BACKGROUND : TAMBLO_CALLER;
+    options.state_changed = has_own_thread ? NULL : on_state;
     options.context = &seen;
-    tamblo_client* client = tamblo_client_create(&options);
-    tamblo_payload* payload = make_payload();
-    if (client == NULL || !tamblo_client_connect(client) || !tamblo_client_is_connected(client))
-        return __LINE__;
-    const int failed = run_session(client, payload, &seen);
-    if (failed != 0)
-        return failed;
-    for (int i = 0; i < 1000 && seen.replies < 6; ++i) {
-        tamblo_client_run(client, 5);
-    }
-    if (seen.replies != 6 || seen.errors != 0 || seen.last_result != 7 || seen.connected != 1)
-        return __LINE__;
-    if (tamblo_client_refused_messages(client) != 0 || !tamblo_client_flush(client, 1000))
-        return __LINE__;
-    tamblo_payload_destroy(payload);
-    tamblo_client_destroy(client);
-    return seen.replies == 7 && seen.errors == 1 ? 0 : __LINE__; /* the start was never answered */
-}
-
-int runCProgramInBackground(const char* socket_path) {
-    tamblo_options options = {0};
-    options.socket_path = socket_path;
     tamblo_client* client = tamblo_client_create(&options);
     tamblo_payload* payload = make_payload();
     if (client == NULL || payload == NULL)
         return __LINE__;
-    Seen seen = {0};
-    const int failed = run_session(client, payload, &seen);
-    if (failed != 0)
-        return failed;
+    if (!has_own_thread && (!tamblo_client_connect(client) || !tamblo_client_is_connected(client)))
+        return __LINE__;
+    if (!run_session(client, payload, &seen))
+        return __LINE__;
     tamblo_payload_destroy(payload);
-    tamblo_client_flush(client, 5000);
+    for (int i = 0; !has_own_thread && i < 1000 && seen.replies < 6; ++i) {
+        tamblo_client_run(client, 5);
+    }
+    if (!has_own_thread &&
+        (seen.replies != 6 || seen.errors != 0 || seen.last_result != 7 || seen.connected != 1))
+        return __LINE__;
+    if (!tamblo_client_flush(client, 5000) || tamblo_client_refused_messages(client) != 0)
+        return __LINE__;
     tamblo_client_destroy(client);
-    return seen.replies == 7 ? 0 : __LINE__;
+    return seen.replies == 7 && seen.errors >= 1 ? 0 : __LINE__; /* the start was never answered */
 }

@@ -2,7 +2,6 @@
 
 #include "base/Base64.h"
 #include "base/Cbor.h"
-#include "client/Vocabulary.h"
 #include "metrics/AudioIssueDetected.h"
 #include "wire/FrameScope.h"
 #include "wire/Reply.h"
@@ -10,8 +9,6 @@
 
 #include <gmock/gmock.h>
 
-#include <fstream>
-#include <random>
 #include <string>
 #include <vector>
 
@@ -123,12 +120,6 @@ TEST(Decode, LinesOfEverySinkAreLaidOut) {
          "  record: 5\n"
          "  time: 0\n",
          {"line 1: there is no record"}},
-        {R"({"time":0,"metric":1,"record":"EAI"})",
-         "1970-01-01T00:00:00.000Z 1\n"
-         "  metric: 1\n"
-         "  record: \"EAI\"\n"
-         "  time: 0\n",
-         {}},
         {R"({"event":"a"})", "", {"line 1: not a line of a report sink: those have a \"time\""}},
         {R"({"time":)",
          "",
@@ -225,65 +216,6 @@ TEST(Decode, FramesThatAreNoneAreNamed) {
     }
     EXPECT_THAT(decode("0", EncodedKind::frame).problems,
                 ElementsAre("frame 1: cut short: 1 of 4 bytes are there"));
-}
-
-/// The bytes of the protocol page's examples are what one may paste.
-TEST(Decode, ExamplesOfTheProtocolPage) {
-    std::ifstream page(EXAMPLES_DIR "/../docs/protocol.md");
-    ASSERT_TRUE(page);
-    std::string bytes;
-    std::size_t frames = 0;
-    for (std::string line; std::getline(page, line);) {
-        const bool isHexLine =
-            line.starts_with("   ") && line.find_first_not_of("0123456789abcdef ") == line.npos;
-        if (isHexLine) {
-            bytes += line + "\n";
-            frames += line.size() > 11 && line[11] == ' ' ? 1U : 0U; // behind the four bytes of a length
-        }
-    }
-    const Decoded decoded = guessed(bytes);
-    EXPECT_GT(frames, 30U);
-    const auto shown = static_cast<std::size_t>(std::count(decoded.text.begin(), decoded.text.end(), '\n'));
-    EXPECT_EQ(shown + decoded.problems.size(), frames);
-    EXPECT_THAT(decoded.problems,
-                testing::Each(testing::AnyOf(HasSubstr("(-32601)"), HasSubstr("(-32602)"),
-                                             HasSubstr("(-32600)"), HasSubstr("not CBOR"))));
-}
-
-TEST(Decode, AnyBytesAreTaken) {
-    std::mt19937 random(3); // NOLINT: the same bytes at every run
-    const std::string seeds[] = {std::string(kRecord), framesOf({"\x84\x01\x03\xF6\xF5"}),
-                                 R"({"time":0,"metric":5963779,"record":")" + std::string(kRecord) + "\"}"};
-    for (int round = 0; round < 3000; ++round) {
-        std::string input = seeds[random() % 3];
-        for (auto changes = random() % 4; changes > 0; --changes) {
-            input[random() % input.size()] = static_cast<char>(random());
-        }
-        input.resize(random() % (input.size() + 1));
-        for (const auto kind : {EncodedKind::record, EncodedKind::line, EncodedKind::frame}) {
-            const Decoded decoded = decode(input, kind);
-            EXPECT_FALSE(decoded.text.empty() && decoded.problems.empty());
-        }
-    }
-}
-
-TEST(ClientVocabulary, NamesReadBack) {
-    for (const std::uint32_t subsystem :
-         {0U, 0x04000000U, 0x08000000U, 0x10000000U, 0x20000000U, 0x80000000U}) {
-        for (std::uint32_t kind = 1; kind <= 17; ++kind) {
-            const auto category = static_cast<client::EventCategory>(subsystem | kind);
-            EXPECT_EQ(client::parseCategory(client::categoryName(category)), category);
-        }
-    }
-    for (const std::uint32_t unnamed : {0U, 18U, 0x08000000U, 0x08000012U, 0x0C000001U, 0xFFFFFFFEU}) {
-        EXPECT_EQ(client::categoryName(static_cast<client::EventCategory>(unnamed)), "") << unnamed;
-    }
-    EXPECT_EQ(client::categoryName(client::EventCategory::unknown), "Unknown");
-    for (std::uint16_t type = 0; type < 20; ++type) {
-        const auto value = static_cast<client::EventType>(type);
-        EXPECT_EQ(client::parseType(client::typeName(value)), value);
-    }
-    EXPECT_EQ(client::typeName(static_cast<client::EventType>(20)), "");
 }
 
 } // namespace

@@ -1,20 +1,13 @@
 #include "tools/SessionSummaries.h"
 
-#include "base/Json.h"
-
 #include <gtest/gtest.h>
 
-#include <cstdlib>
-#include <filesystem>
-#include <fstream>
 #include <sstream>
 #include <string>
 #include <vector>
 
 namespace tamblo::tools {
 namespace {
-
-namespace fs = std::filesystem;
 
 constexpr std::pair<char, std::string_view> kEvents[] = {{'V', "com.vandra.tamblo.Volume.Summary"},
                                                          {'K', "com.vandra.tamblo.Kaleen.Summary"},
@@ -98,36 +91,6 @@ TEST(SessionSummaries, TablesHoldWhatFits) {
               "    #  seconds  class  devices                        mode  port  vocoders\n"
               "  1/2     7.96     10  Übertrager \\u001b[31m und nö…  -     -     EVS:32000\n"
               "  2/2      odd      -  5                              -     -     -");
-}
-
-TEST(SessionSummaries, WhatCameBetweenIsReadThroughARotation) {
-    char name[] = "/tmp/tamblo-summaries-XXXXXX";
-    const std::string directory = ::mkdtemp(name);
-    const std::string path = directory + "/analytics-events.jsonl";
-    const auto append = [&path](const std::string& service, int messages) {
-        std::ofstream(path, std::ios::app)
-            << R"({"time":1.0,"event":"com.vandra.)" << service << R"(.Session_Generic.Summary","payload":)"
-            << jsonText(summaryFrom("Sa:" + std::to_string(messages)).payload) << "}\n";
-    };
-    const auto textOf = [](const auto& found) {
-        const auto* none = std::get_if<std::string>(&found);
-        return none != nullptr ? *none : jsonText(std::get<0>(found).at(0).payload);
-    };
-    const StoppedSession session{"a", "haptics", 5};
-    EXPECT_EQ(textOf(SummaryReader(directory).read(session)).substr(0, 27),
-              "no summaries: cannot read " + directory.substr(0, 1));
-    append("tamblo", 9);
-    EXPECT_EQ(textOf(SummaryReader(directory).read(session)).substr(0, 27), "no summaries: none came to ");
-
-    std::ofstream(path, std::ios::app) << R"({"time":1.0,"event":"torn.Summ)";
-    SummaryReader reader(directory);
-    std::ofstream(path, std::ios::app) << "ary\",\"payload\":{}}\n";
-    append("tamblo", 10);
-    fs::rename(path, path + ".1");
-    append("tamblo", 7);
-    append("haptics", 8);
-    EXPECT_EQ(textOf(reader.read(session)), jsonText(summaryFrom("Sa:7").payload));
-    fs::remove_all(directory);
 }
 
 } // namespace

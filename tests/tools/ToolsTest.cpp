@@ -1,4 +1,6 @@
 #include "base/Json.h"
+#include "tests/client/FakeService.h"
+#include "tests/platform/LinuxServiceSupport.h"
 #include "tools/Arguments.h"
 #include "tools/Files.h"
 #include "tools/Payload.h"
@@ -8,38 +10,11 @@
 #include "tools/SessionPlayer.h"
 #include "tools/SinkFile.h"
 
-#include <chrono>
-#include <cstdlib>
-#include <filesystem>
-#include <fstream>
-#include <sstream>
-#include <string>
-#include <vector>
-
-#include "tests/client/FakeService.h"
-#include <gtest/gtest.h>
-
 namespace tamblo::tools {
 namespace {
 
 namespace fs = std::filesystem;
 using namespace std::chrono_literals;
-
-class TemporaryDirectory {
-public:
-    TemporaryDirectory() {
-        char name[] = "/tmp/tamblo-tools-XXXXXX";
-        path_ = ::mkdtemp(name);
-    }
-    ~TemporaryDirectory() { fs::remove_all(path_); }
-    TemporaryDirectory(const TemporaryDirectory&) = delete;
-    TemporaryDirectory& operator=(const TemporaryDirectory&) = delete;
-
-    [[nodiscard]] std::string file(const std::string& name) const { return path_ + "/" + name; }
-
-private:
-    std::string path_;
-};
 
 void append(const std::string& path, std::string_view text) {
     std::ofstream(path, std::ios::app) << text;
@@ -87,7 +62,7 @@ TEST(Arguments, OptionsAreTakenApart) {
 
 TEST(ServiceConnection, TheTimeoutIsANumberOfSeconds) {
     const TemporaryDirectory directory;
-    const std::string socket = directory.file("nobody");
+    const std::string socket = directory.path("nobody");
     const struct {
         std::string_view text;
         ExitStatus status;
@@ -148,10 +123,19 @@ TEST(SessionSpacing, OffsetsWinOverTimestampsAndNeitherKeepsTheTime) {
     EXPECT_EQ(due({}, 1005.0), 5);
 }
 
-TEST(SessionPlayer, PlaysInTimeAndStampsWhatHasNoTimestamp) {
+class SessionPlayerTest : public testing::Test {
+protected:
+    void SetUp() override { ASSERT_TRUE(client.connect()); }
+    /// The timestamp of a message that the service was sent.
+    double timestamp(std::size_t number) {
+        return service.requests().at(number).dictionary.find(kTimestampKey)->doubleValue();
+    }
+
     test::FakeService service;
-    client::Client client({.socketPath = service.path(), .threading = client::Client::Threading::caller});
-    ASSERT_TRUE(client.connect());
+    client::Client client{{.socketPath = service.path(), .threading = client::Client::Threading::caller}};
+};
+
+TEST_F(SessionPlayerTest, PlaysInTimeAndStampsWhatHasNoTimestamp) {
     std::istringstream lines("{\"category\": 14, \"payload\": {\"zrreporting_timestamp\": 5}}\n\n"
                              "{\"category\": 14, \"offset_s\": 0.4}\n"
                              "{\"category\": }\n"
@@ -164,17 +148,13 @@ TEST(SessionPlayer, PlaysInTimeAndStampsWhatHasNoTimestamp) {
     EXPECT_EQ(player.report().answered, 2U);
     EXPECT_EQ(player.report().refused, 0U);
     EXPECT_GE(player.report().seconds, 0.04);
-    const auto requests = service.requests();
-    ASSERT_EQ(requests.size(), 2U);
-    EXPECT_EQ(requests[0].dictionary.find(kTimestampKey)->doubleValue(), 5);
-    EXPECT_GT(requests[1].dictionary.find(kTimestampKey)->doubleValue(), 1.7e9);
-    EXPECT_EQ(requests[1].reporterIDs, std::vector<std::int64_t>{7});
+    ASSERT_EQ(service.requests().size(), 2U);
+    EXPECT_EQ(timestamp(0), 5);
+    EXPECT_GT(timestamp(1), 1.7e9);
+    EXPECT_EQ(service.requests()[1].reporterIDs, std::vector<std::int64_t>{7});
 }
 
-TEST(SessionPlayer, KeepsTheRecordedTimesAtAnySpeed) {
-    test::FakeService service;
-    client::Client client({.socketPath = service.path(), .threading = client::Client::Threading::caller});
-    ASSERT_TRUE(client.connect());
+TEST_F(SessionPlayerTest, KeepsTheRecordedTimesAtAnySpeed) {
     std::istringstream lines(
         "{\"category\": 14, \"offset_s\": 2}\nodd\n{\"category\": 14, \"offset_s\": 62}\n");
     EXPECT_EQ(recordedLength(lines), 62.0);
@@ -186,11 +166,7 @@ TEST(SessionPlayer, KeepsTheRecordedTimesAtAnySpeed) {
     const double before =
         std::chrono::duration<double>(std::chrono::system_clock::now().time_since_epoch()).count();
     EXPECT_FALSE(player.play(played, "file"));
-    const auto requests = service.requests();
-    ASSERT_EQ(requests.size(), 2U);
-    const auto timestamp = [&requests](std::size_t i) {
-        return requests[i].dictionary.find(kTimestampKey)->doubleValue();
-    };
+    ASSERT_EQ(service.requests().size(), 2U);
     EXPECT_NEAR(timestamp(1) - timestamp(0), 60, 1e-3);
     EXPECT_NEAR(timestamp(1), before, 5);
 }
@@ -228,7 +204,7 @@ TEST(RecordFilter, WantsOneOfTheEventsAndAllOfTheKeys) {
 
 TEST(SinkFollower, ReadsWholeLinesThroughRotationsAndTornEnds) {
     const TemporaryDirectory directory;
-    const std::string path = directory.file("events.jsonl");
+    const std::string path = directory.path("events.jsonl");
     SinkFollower follower(path);
     std::string seen;
     LineFunction collect = [&seen](std::string_view line) { seen.append(line).append(" "); };
@@ -255,22 +231,22 @@ TEST(SinkFollower, ReadsWholeLinesThroughRotationsAndTornEnds) {
     EXPECT_EQ(read(), "");
     append(path, "7\n");
     EXPECT_EQ(read(), "7 ");
-    EXPECT_EQ(sinkPath(directory.file(""), path), path);
+    EXPECT_EQ(sinkPath(directory.path(""), path), path);
 }
 
 TEST(Files, ReplacesOrLeavesAlone) {
     const TemporaryDirectory directory;
-    const std::string path = directory.file("a/b/file");
+    const std::string path = directory.path("a/b/file");
     EXPECT_TRUE(replaceFile(path, path + ".new", "x"));
-    EXPECT_FALSE(createDirectories(directory.file("a/b")));
+    EXPECT_FALSE(createDirectories(directory.path("a/b")));
     EXPECT_FALSE(replaceFile(path, path + ".new", "one"));
     EXPECT_FALSE(replaceFile(path, path + ".new", "two"));
     EXPECT_EQ(readFile(path), "two");
     EXPECT_FALSE(fs::exists(path + ".new"));
-    fs::create_directory(directory.file("a/b/directory"));
-    EXPECT_TRUE(replaceFile(directory.file("a/b/directory"), path + ".new", "x"));
+    fs::create_directory(directory.path("a/b/directory"));
+    EXPECT_TRUE(replaceFile(directory.path("a/b/directory"), path + ".new", "x"));
     EXPECT_FALSE(fs::exists(path + ".new"));
-    EXPECT_FALSE(readFile(directory.file("none")));
+    EXPECT_FALSE(readFile(directory.path("none")));
 }
 
 } // namespace
