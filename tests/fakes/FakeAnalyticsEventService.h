@@ -8,6 +8,7 @@
 #include <set>
 #include <string>
 #include <string_view>
+#include <utility>
 #include <vector>
 
 namespace tamblo {
@@ -21,21 +22,55 @@ public:
         Dictionary payload;
     };
 
-    [[nodiscard]] bool isEventInUse(std::string_view eventName) override;
-    void sendEventLazy(std::string_view eventName, const std::function<Dictionary()>& payload) override;
+    [[nodiscard]] bool isEventInUse(std::string_view eventName) override {
+        const std::lock_guard held(mutex_);
+        asked_.emplace_back(eventName);
+        return isWanted(eventName);
+    }
+    void sendEventLazy(std::string_view eventName, const std::function<Dictionary()>& payload) override {
+        const std::lock_guard held(mutex_);
+        if (!failing_ && isWanted(eventName)) {
+            ++payloadsTaken_;
+            events_.push_back({std::string(eventName), payload()});
+        }
+    }
 
-    void setEventsInUse(std::optional<std::set<std::string, std::less<>>> names);
+    void setEventsInUse(std::optional<std::set<std::string, std::less<>>> names) {
+        const std::lock_guard held(mutex_);
+        inUse_ = std::move(names);
+    }
     void setFailing(bool failing) noexcept { failing_ = failing; }
-    [[nodiscard]] std::vector<Event> events() const;
+    [[nodiscard]] std::vector<Event> events() const {
+        const std::lock_guard held(mutex_);
+        return events_;
+    }
     /// The payloads of the events of this name.
-    [[nodiscard]] std::vector<Dictionary> payloads(std::string_view eventName) const;
+    [[nodiscard]] std::vector<Dictionary> payloads(std::string_view eventName) const {
+        std::vector<Dictionary> found;
+        for (const Event& event : events()) {
+            if (event.name == eventName) {
+                found.push_back(event.payload);
+            }
+        }
+        return found;
+    }
     /// Every name that was asked about, in order.
-    [[nodiscard]] std::vector<std::string> asked() const;
+    [[nodiscard]] std::vector<std::string> asked() const {
+        const std::lock_guard held(mutex_);
+        return asked_;
+    }
     [[nodiscard]] int payloadsTaken() const noexcept { return payloadsTaken_; }
-    void clear();
+    void clear() {
+        const std::lock_guard held(mutex_);
+        events_.clear();
+        asked_.clear();
+        payloadsTaken_ = 0;
+    }
 
 private:
-    [[nodiscard]] bool isWanted(std::string_view eventName) const;
+    [[nodiscard]] bool isWanted(std::string_view eventName) const {
+        return !inUse_ || inUse_->contains(eventName);
+    }
 
     std::atomic<bool> failing_{false};
     std::atomic<int> payloadsTaken_{0};

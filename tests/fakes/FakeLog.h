@@ -21,16 +21,38 @@ public:
     };
 
     [[nodiscard]] LogLevel threshold(std::string_view) const noexcept override { return threshold_; }
-    void write(LogLevel level, std::string_view categoryCode, std::string_view line) noexcept override;
+    void write(LogLevel level, std::string_view categoryCode, std::string_view line) noexcept override {
+        // "%25s:%-5d ": the text begins after the blank that follows the number and its padding.
+        const std::size_t colon = line.find(':');
+        std::size_t text = line.find(' ', colon);
+        text = text < colon + 6 ? colon + 7 : text + 1;
+        const std::lock_guard held(mutex_);
+        lines_.push_back({level, std::string(categoryCode), std::string(line.substr(0, text)),
+                          std::string(line.substr(text))});
+    }
 
     /// Every category writes from this level on; takes effect with the next platform, or
     /// `forgetLogThresholds`.
     void setThreshold(LogLevel level) noexcept { threshold_ = level; }
-    [[nodiscard]] std::vector<Line> lines() const;
+    [[nodiscard]] std::vector<Line> lines() const {
+        const std::lock_guard held(mutex_);
+        return lines_;
+    }
     /// The texts that begin so, in order.
-    [[nodiscard]] std::vector<std::string> texts(std::string_view beginning = {}) const;
+    [[nodiscard]] std::vector<std::string> texts(std::string_view beginning = {}) const {
+        std::vector<std::string> found;
+        for (const Line& line : lines()) {
+            if (line.text.starts_with(beginning)) {
+                found.push_back(line.text);
+            }
+        }
+        return found;
+    }
     [[nodiscard]] std::size_t count(std::string_view beginning) const { return texts(beginning).size(); }
-    void clear();
+    void clear() {
+        const std::lock_guard held(mutex_);
+        lines_.clear();
+    }
 
 private:
     std::atomic<LogLevel> threshold_{LogLevel::debug};

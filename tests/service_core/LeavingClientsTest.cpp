@@ -13,7 +13,7 @@ protected:
     LeavingClientsTest() {
         script.atStop["Producer"] = [this](ZRReportingSession& owner) {
             stopped.push_back(owner.reporterID());
-            owner.sendMessage(std::make_shared<ZRReportingSessionMessage>(Dictionary{{"summary", 1}}, 1, 11));
+            owner.sendMessage(messageOf({{"summary", 1}}, 1, 11));
         };
     }
     /// Started sessions of these IDs.
@@ -92,8 +92,7 @@ TEST_F(LeavingClientsTest, APieceStopsSoManyMessages) {
         const auto id = static_cast<ReporterID>(i + 1);
         open(leaving, id);
         for (int message = 0; message < counts[i]; ++message) {
-            find(id)->sendMessage(
-                std::make_shared<ZRReportingSessionMessage>(Dictionary{{"n", message}}, 14, 11));
+            find(id)->sendMessage(messageOf({{"n", message}}));
         }
         device.log.clear();
     }

@@ -157,9 +157,7 @@ TEST_F(ServiceTest, TheSingleMessageSessionLivesUntilItIsIdleForMoreThanFiveSeco
 
 TEST_F(ServiceTest, TheReaperStopsWhileMessagesComeIn) {
     const Connection client = connect(10);
-    script.atStop["Late"] = [](ZRReportingSession& owner) {
-        owner.sendMessage(std::make_shared<ZRReportingSessionMessage>(Dictionary{{"summary", 1}}, 1, 11));
-    };
+    haveStopsSendSummaries("Late");
     std::atomic<bool> isDone{false};
     std::thread reaper([&] {
         while (!isDone) {
@@ -232,9 +230,7 @@ TEST_F(ServiceTest, ShutDownWorksOffWhatIsQueuedThenStopsEverything) {
     const SessionRef single = service->singleMessageSession();
     open(first, 7);
     open(second, 8);
-    script.atStop["Producer"] = [](ZRReportingSession& owner) {
-        owner.sendMessage(std::make_shared<ZRReportingSessionMessage>(Dictionary{{"summary", 1}}, 1, 11));
-    };
+    haveStopsSendSummaries();
     (void)script.take();
     first->object().sendMessage({{"last", 1}}, 14, 11, {7}, note("send"));
     bool isCompleted = false;

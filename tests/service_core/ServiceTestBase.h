@@ -2,9 +2,9 @@
 
 #include "service/ZRReportingClientServerInstance.h"
 #include "service/ZRReportingService.h"
-#include "session/ZRReportingSession.h"
 #include "system/ZRReportingSystemMonitor.h"
 #include "tests/fakes/FakePlatform.h"
+#include "tests/fakes/Messages.h"
 #include "tests/session/ScriptedWorkers.h"
 
 #include <gmock/gmock.h>
@@ -52,6 +52,12 @@ protected:
               Dictionary payload = {{"a", 1}}) {
         client->object().sendMessage(std::move(payload), 14, 11, std::move(reporterIDs), note("send"));
         (void)run();
+    }
+    /// A session that is stopped sends a summary first.
+    void haveStopsSendSummaries(const char* worker = "Producer") {
+        script.atStop[worker] = [](ZRReportingSession& owner) {
+            owner.sendMessage(messageOf({{"summary", 1}}, 1, 11));
+        };
     }
     /// A reply that notes the name and what it is called with.
     template <typename... Result> auto noteWith(std::string name) {

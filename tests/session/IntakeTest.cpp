@@ -1,6 +1,6 @@
 #include "session/LastMessageIndex.h"
-#include "session/ZRReportingSession.h"
 #include "tests/fakes/FakePlatform.h"
+#include "tests/fakes/Messages.h"
 #include "tests/session/ScriptedWorkers.h"
 
 #include <gmock/gmock.h>
@@ -17,8 +17,9 @@ protected:
     FakePlatform device;
 };
 
-MessageRef makeMessage(Dictionary payload, AudioEventCategory category = 14, AudioEventType type = 11) {
-    return std::make_shared<ZRReportingSessionMessage>(std::move(payload), category, type);
+MessageRef makeMessage(Dictionary payload, AudioEventCategory category = AudioEventKindVolume,
+                       AudioEventType type = AudioEventTypeSummary) {
+    return messageOf(std::move(payload), category, type);
 }
 
 TEST_F(IntakeTest, TimestampsAreRepaired) {

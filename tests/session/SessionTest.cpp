@@ -1,6 +1,6 @@
 #include "base/Format.h"
-#include "session/ZRReportingSession.h"
 #include "tests/fakes/FakePlatform.h"
+#include "tests/fakes/Messages.h"
 #include "tests/session/ScriptedWorkers.h"
 
 #include <gmock/gmock.h>
@@ -25,7 +25,7 @@ protected:
     static MessageRef send(ZRReportingSession& session, Dictionary payload,
                            AudioEventCategory category = AudioEventKindVolume,
                            AudioEventType type = AudioEventTypeSummary) {
-        auto message = std::make_shared<ZRReportingSessionMessage>(std::move(payload), category, type);
+        MessageRef message = messageOf(std::move(payload), category, type);
         session.sendMessage(message);
         return message;
     }
@@ -109,7 +109,7 @@ TEST_F(SessionTest, MessagesReachTheConsumersThatMaySeeThem) {
     EXPECT_TRUE(send(*session, {{"a", 1}})->isRedundant);
     EXPECT_THAT(script.take(), ElementsAre("message Redundant 14/11"));
 
-    auto message = std::make_shared<ZRReportingSessionMessage>(Dictionary{{"a", 2}}, 5, 6);
+    const MessageRef message = messageOf({{"a", 2}}, 5, 6);
     message->setDestinationWorkers({workerClassNamed("Late"), workerClassNamed("Producer")});
     bool isAnswered = false;
     session->sendMessage(message, [&](const ReplyError* error) { isAnswered = error == nullptr; });

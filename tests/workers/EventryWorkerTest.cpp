@@ -1,6 +1,6 @@
 #include "session/WorkerClass.h"
-#include "session/ZRReportingSession.h"
 #include "tests/fakes/FakePlatform.h"
+#include "tests/fakes/Messages.h"
 #include "workers/sinks/ZRReportingSessionEventryWorker.h"
 
 #include <gmock/gmock.h>
@@ -33,7 +33,7 @@ TEST(WorkerClassListTest, SeventeenRowsInOrderWithTheirAnswers) {
 class EventryWorkerTest : public testing::Test {
 protected:
     MessageRef handle(AudioEventCategory category, AudioEventType type, Dictionary payload = {{"a", 1}}) {
-        auto message = std::make_shared<ZRReportingSessionMessage>(std::move(payload), category, type);
+        MessageRef message = messageOf(std::move(payload), category, type);
         worker->handleMessage(message);
         return message;
     }
@@ -98,8 +98,8 @@ TEST_F(EventryWorkerTest, AFailingServiceAndALostSessionDoNoHarm) {
 
 TEST_F(EventryWorkerTest, RunsFromTheSessionsCreationOn) {
     session->setServiceType(AudioServiceTypeHaptics);
-    session->sendMessage(std::make_shared<ZRReportingSessionMessage>(Dictionary{{"a b", 1}}, 14, 11));
-    session->sendMessage(std::make_shared<ZRReportingSessionMessage>(Dictionary{{"a b", 1}}, 14, 11));
+    session->sendMessage(messageOf({{"a b", 1}}, 14, 11));
+    session->sendMessage(messageOf({{"a b", 1}}, 14, 11));
     const auto payloads = device.analyticsEvents.payloads("com.vandra.haptics.Volume.Summary");
     ASSERT_EQ(payloads.size(), 1U) << "a repeat is not offered";
     EXPECT_EQ(payloads.front(), (Dictionary{{"a_b", 1},

@@ -1,8 +1,7 @@
-#include "base/Json.h"
 #include "metrics/AudioIssueDetected.h"
-#include "session/ZRReportingSession.h"
 #include "tests/base/AllocationCount.h"
 #include "tests/fakes/FakePlatform.h"
+#include "tests/fakes/Messages.h"
 #include "util/LogCategories.h"
 #include "workers/sinks/ZRReportingSessionJouleryWorker.h"
 #include "workers/sinks/ZRReportingSessionQMXWorker.h"
@@ -19,10 +18,6 @@ namespace {
 using testing::ElementsAre;
 using testing::ElementsAreArray;
 using testing::IsEmpty;
-
-MessageRef messageOf(Dictionary payload, AudioEventType type, AudioEventCategory category = 4) {
-    return std::make_shared<ZRReportingSessionMessage>(std::move(payload), category, type);
-}
 
 template <typename Worker> class SinkTest : public testing::Test {
 protected:
@@ -93,7 +88,7 @@ TEST_F(JouleryWorkerTest, EachTriggerIsAnEventAndWhatIsMissingIsLeftOut) {
         device.log.clear();
         session->updateConfigurationWithContentsOfConfiguration({{"HostApplicationDisplayID", row.appName}});
         device.log.clear();
-        worker->handleMessage(messageOf(row.payload, AudioEventTypeJoulery));
+        worker->handleMessage(messageOf(row.payload, 4, AudioEventTypeJoulery));
         EXPECT_THAT(events(), ElementsAreArray(row.events)) << jsonText(row.payload);
         EXPECT_THAT(device.log.texts(), ElementsAreArray(row.errors)) << jsonText(row.payload);
         for (const FakeLog::Line& line : device.log.lines()) {
@@ -105,7 +100,7 @@ TEST_F(JouleryWorkerTest, EachTriggerIsAnEventAndWhatIsMissingIsLeftOut) {
 
 TEST_F(JouleryWorkerTest, WithoutASessionThereIsNoNameAndTheEventsStillCome) {
     session.reset();
-    worker->handleMessage(messageOf({{"EngineOnTime", 1}, {"EngineState", ""}}, AudioEventTypeJoulery));
+    worker->handleMessage(messageOf({{"EngineOnTime", 1}, {"EngineState", ""}}, 4, AudioEventTypeJoulery));
     EXPECT_THAT(events(), ElementsAre(R"(Korvell_Haptics_EngineOnDuration {"EngineOnDuration":1})",
                                       R"(Korvell_Haptics_ClientStatus {"Status":0})"));
 }
@@ -160,7 +155,7 @@ TEST_F(QMXWorkerTest, EveryDetectionIsARecordOfWhatThereIs) {
     for (const auto& row : cases) {
         device.diagnosticsMetrics.records.clear();
         device.log.clear();
-        worker->handleMessage(messageOf(row.payload, AudioEventTypeIssueDetector, 0xFFFFFFFF));
+        worker->handleMessage(messageOf(row.payload, 0xFFFFFFFF, AudioEventTypeIssueDetector));
         EXPECT_THAT(records(), ElementsAre(row.record));
         EXPECT_THAT(device.log.texts(), ElementsAreArray(row.errors)) << row.record;
         for (const FakeLog::Line& line : device.log.lines()) {
@@ -168,7 +163,7 @@ TEST_F(QMXWorkerTest, EveryDetectionIsARecordOfWhatThereIs) {
             EXPECT_EQ(line.level, LogLevel::error);
         }
     }
-    worker->handleMessage(messageOf({}, AudioEventTypeIssueDetector));
+    worker->handleMessage(messageOf({}, 4, AudioEventTypeIssueDetector));
     EXPECT_EQ(device.diagnosticsMetrics.records.back().second,
               (std::vector<std::uint8_t>{0x10, 0, 0x1A, 0, 0x22, 0, 0x2A, 0}));
 }
@@ -181,7 +176,7 @@ TEST(SinksOfOneType, OtherMessagesCostThemNothing) {
     const Dictionary payload{{"EngineOnTime", 1}, {"EngineState", "EngineOn"}, {"issue_type", 1}};
     constexpr AudioEventType types[] = {0, 6, 7, 8, 9, 20, 7 + 256, 8 + 256, 65535};
     for (const AudioEventType type : types) {
-        const MessageRef message = messageOf(payload, type);
+        const MessageRef message = messageOf(payload, 4, type);
         const test::AllocationCount allocated = test::allocationsOf([&] {
             if (type != AudioEventTypeJoulery) {
                 joulery.handleMessage(message);
@@ -210,8 +205,8 @@ TEST(SinksOfOneType, WorkForEverySessionFromItsCreationOnAndForTheSingleMessageS
             session->start();
         }
         for (int round = 0; round < 2; ++round) { // a repeat is not offered
-            session->sendMessage(messageOf({{"EngineOnTime", 3}}, AudioEventTypeJoulery));
-            session->sendMessage(messageOf({{"node", "n"}}, AudioEventTypeIssueDetector));
+            session->sendMessage(messageOf({{"EngineOnTime", 3}}, 4, AudioEventTypeJoulery));
+            session->sendMessage(messageOf({{"node", "n"}}, 4, AudioEventTypeIssueDetector));
         }
         ASSERT_EQ(device.powerEvents.events.size(), 1U) << isSingle;
         EXPECT_EQ(device.powerEvents.events[0].payload,

@@ -1,7 +1,6 @@
-#include "base/Json.h"
-#include "session/ZRReportingSession.h"
 #include "system/ZRReportingSystemMonitor.h"
 #include "tests/fakes/FakePlatform.h"
+#include "tests/fakes/Messages.h"
 #include "tools/SessionFile.h"
 #include "util/SummaryBuckets.h"
 #include "workers/producers/ZRReportingSessionInputMessagesWorker.h"
@@ -13,7 +12,6 @@
 #include <chrono>
 #include <fstream>
 #include <map>
-#include <set>
 #include <sstream>
 #include <string>
 #include <string_view>
@@ -72,14 +70,6 @@ Dictionary objectFrom(const std::string& json) {
     return std::get<Value>(value).dictionaryValue();
 }
 
-std::set<std::string> keysOf(const Dictionary& payload) {
-    std::set<std::string> keys;
-    for (std::size_t i = 0; i < payload.size(); ++i) {
-        keys.emplace(payload.keyAt(i));
-    }
-    return keys;
-}
-
 class MessagesDocumentTest : public testing::Test {
 protected:
     ~MessagesDocumentTest() override { ZRReportingSystemMonitor::reset(); }
@@ -102,21 +92,12 @@ protected:
             auto parsed = tools::parseSessionLine(text);
             auto& line = std::get<tools::SessionLine>(parsed);
             line.payload.set("zrreporting_timestamp", start + *line.offset);
-            session->sendMessage(std::make_shared<ZRReportingSessionMessage>(
-                line.payload, static_cast<AudioEventCategory>(line.category),
-                static_cast<AudioEventType>(line.type)));
+            session->sendMessage(messageOf(line.payload, static_cast<AudioEventCategory>(line.category),
+                                           static_cast<AudioEventType>(line.type)));
         }
         device.clock.advance(std::chrono::minutes(2));
         session->stop();
     }
-    /// Those of an event's table, and of every message's.
-    std::vector<Row> rowsOf(const std::string& event) {
-        std::vector<Row> rows = page[event].rows;
-        const std::vector<Row>& common = page["What comes"].rows;
-        rows.insert(rows.end(), common.begin(), common.end());
-        return rows;
-    }
-
     FakePlatform device{LogLevel::error};
     std::map<std::string, Section> page = sectionsOfThePage();
 };
@@ -152,36 +133,6 @@ TEST_F(MessagesDocumentTest, ExamplesAreWhatComesOfItsSession) {
     }
 }
 
-TEST_F(MessagesDocumentTest, TablesHaveTheKeysAndTypesThatCome) {
-    const std::map<Value::Kind, std::string> typeNames{{Value::Kind::boolean, "boolean"},
-                                                       {Value::Kind::integer, "integer"},
-                                                       {Value::Kind::singleFloat, "single"},
-                                                       {Value::Kind::doubleFloat, "double"},
-                                                       {Value::Kind::string, "string"}};
-    playTheSessionOfThePage();
-    for (const std::string event : kEvents) {
-        const bool isOfDevice = event.ends_with(".Setup");
-        for (const Dictionary& payload : device.analyticsEvents.payloads(event)) {
-            std::set<std::string> keys;
-            for (const Row& row : rowsOf(event)) {
-                const Value* value = payload.find(row[0]);
-                if (value == nullptr && isOfDevice) {
-                    continue; // one feature for each message
-                }
-                keys.insert(row[0]);
-                ASSERT_NE(value, nullptr) << event << " " << row[0];
-                if (!row[1].starts_with("as ")) {
-                    EXPECT_EQ(typeNames.at(value->kind()), row[1]) << row[0];
-                }
-            }
-            if (isOfDevice) {
-                keys.insert("last_updated");
-            }
-            EXPECT_EQ(keysOf(payload), keys) << event;
-        }
-    }
-}
-
 /// Every cell that says what a change of a key does, tried: all keys at first, one changed, then the end.
 TEST_F(MessagesDocumentTest, KeysDoWhatTheirTableSays) {
     const std::vector<Row>& rows = page["What to send"].rows;
@@ -212,10 +163,7 @@ TEST_F(MessagesDocumentTest, KeysDoWhatTheirTableSays) {
         }
         const Dictionary change{{"zrreporting_timestamp", 1010}, {row[0], valueOf(row, true)}};
         const Dictionary end{{"zrreporting_timestamp", 1020}, {"session_duration", 20}};
-        std::vector<MessageRef> messages;
-        for (const Dictionary& payload : {first, change, end}) {
-            messages.push_back(std::make_shared<ZRReportingSessionMessage>(payload, 5, 0));
-        }
+        const auto messages = messagesOf({first, change, end});
         const std::pair<std::vector<MessageRef>, std::string> summaries[] = {
             {output.createVolumeMessages(messages, &process, {}), row[3]},
             {input.createInputMessages(messages, &process, {}), row[4]},

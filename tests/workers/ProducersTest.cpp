@@ -1,6 +1,5 @@
-#include "base/Json.h"
-#include "session/ZRReportingSession.h"
 #include "tests/fakes/FakePlatform.h"
+#include "tests/fakes/Messages.h"
 #include "util/InternalBuild.h"
 #include "util/LogCategories.h"
 #include "workers/producers/ZRReportingSessionInputMessagesWorker.h"
@@ -24,7 +23,7 @@ using testing::IsEmpty;
 using Payloads = std::vector<Dictionary>;
 using Lines = std::vector<std::string>;
 
-constexpr double kMinimum = 5;
+constexpr std::chrono::duration<double> kMinimum{5};
 
 Dictionary at(const Value& time, Dictionary payload) {
     payload.set("zrreporting_timestamp", time);
@@ -32,29 +31,6 @@ Dictionary at(const Value& time, Dictionary payload) {
 }
 Dictionary at(double time, Dictionary payload) {
     return at(Value(time), std::move(payload));
-}
-
-std::vector<MessageRef> records(const Payloads& payloads) {
-    std::vector<MessageRef> messages;
-    for (const Dictionary& payload : payloads) {
-        messages.push_back(std::make_shared<ZRReportingSessionMessage>(payload, 5, 0));
-    }
-    return messages;
-}
-
-/// The values of some keys of each message as JSON, with blanks between; a key that is absent is left out.
-Lines shown(const std::vector<MessageRef>& messages, std::initializer_list<std::string_view> keys) {
-    Lines lines;
-    for (const MessageRef& message : messages) {
-        std::string line;
-        for (const std::string_view key : keys) {
-            if (const Value* value = message->payload().find(key)) {
-                line += (line.empty() ? "" : " ") + jsonText(*value);
-            }
-        }
-        lines.push_back(line);
-    }
-    return lines;
 }
 
 struct Case {
@@ -71,6 +47,18 @@ protected:
         session->addPreviousValues(previous);
         return session;
     }
+    /// What a worker derives of each row's messages; `derive` has it do so.
+    template <typename Derive>
+    void expectSegments(const std::vector<Case>& cases, std::initializer_list<std::string_view> keys,
+                        const Derive& derive) {
+        for (const Case& row : cases) {
+            Lines found;
+            for (const MessageRef& message : derive(sessionWith(row.previous), messagesOf(row.messages))) {
+                found.push_back(shown(message->payload(), keys));
+            }
+            EXPECT_EQ(found, row.expected) << row.what;
+        }
+    }
 
     FakePlatform device{LogLevel::standard};
     const Value process = "com.example.player";
@@ -84,7 +72,7 @@ protected:
 };
 
 TEST_F(ProducersTest, VolumeSegments) {
-    const Case cases[] = {
+    const std::vector<Case> cases{
         {"a volume change and the end; exactly the minimum is too short",
          {at(10, playing), at(20, {{"QVSessionVolume", 0.8}}), at(25, {{"session_output_running", false}})},
          {"10.0 0.5 \"unknown\" false 1 1"}},
@@ -144,58 +132,39 @@ TEST_F(ProducersTest, VolumeSegments) {
           at(40, {{"session_output_running", false}})},
          {"20.0 0.5 \"unknown\" false 1 1"}},
     };
-    for (const Case& row : cases) {
-        SCOPED_TRACE(row.what);
-        const auto session = sessionWith(row.previous);
-        const ZRReportingSessionVolumeMessagesWorker worker(session);
-        const auto derived = worker.createVolumeMessages(records(row.messages), &process,
-                                                         std::chrono::duration<double>(kMinimum));
-        EXPECT_EQ(shown(derived, {"play_seconds", "QVSessionVolume", "active_devices", "ringerstate",
-                                  "msgidx", "msgcnt"}),
-                  row.expected);
-        EXPECT_THAT(worker.createVolumeMessages(records(row.messages), nullptr, {}), IsEmpty());
-    }
+    expectSegments(cases,
+                   {"play_seconds", "QVSessionVolume", "active_devices", "ringerstate", "msgidx", "msgcnt"},
+                   [this](const auto& session, const auto& messages) {
+                       const ZRReportingSessionVolumeMessagesWorker worker(session);
+                       EXPECT_THAT(worker.createVolumeMessages(messages, nullptr, {}), IsEmpty());
+                       return worker.createVolumeMessages(messages, &process, kMinimum);
+                   });
 }
 
 TEST_F(ProducersTest, AVolumeSummaryHasExactlyTheseKeys) {
-    const auto session = sessionWith({});
-    const ZRReportingSessionVolumeMessagesWorker worker(session);
-    const Dictionary settings{{"session_selected_format", "AAC"},
-                              {"active_devices", "D"},
-                              {"mFormatID", "aac"},
-                              {"QVSessionVolume", 0.0625},
-                              {"ringerstate", true},
-                              {"spatial-audio-accessory-feature", true},
-                              {"mChannelsPerFrame", 2},
-                              {"spatializationEnabled", true}};
-    const auto derived = worker.createVolumeMessages(
-        records({at(0, playing), at(10, settings), at(85.25, {{"session_duration", 75}, {"other", 1}})}),
-        &process, {});
-    ASSERT_EQ(derived.size(), 2U);
-    Dictionary expected{{"session_selected_format", "unknown"},
-                        {"mFormatID", "unknown"},
-                        {"active_devices", "unknown"},
-                        {"HostApplicationDisplayID", "com.example.player"},
-                        {"QVSessionVolume", 0.5},
-                        {"QVSessionVolumeBucketed", "0.5"},
-                        {"play_seconds", 10.0F},
-                        {"spatial-audio-accessory-feature", false},
-                        {"spatializationEnabled", false},
-                        {"ringerstate", false},
-                        {"mChannelsPerFrame", -1},
-                        {"play_secondsBucketed", "10"},
-                        {"msgidx", 1},
-                        {"msgcnt", 2}};
+    const auto derived =
+        ZRReportingSessionVolumeMessagesWorker(sessionWith({}))
+            .createVolumeMessages(
+                messagesOf({at(0, playing), at(10, {{"session_duration", 75}, {"other", 1}})}), &process, {});
+    ASSERT_EQ(derived.size(), 1U);
+    const Dictionary expected{{"session_selected_format", "unknown"},
+                              {"mFormatID", "unknown"},
+                              {"active_devices", "unknown"},
+                              {"HostApplicationDisplayID", "com.example.player"},
+                              {"QVSessionVolume", 0.5},
+                              {"QVSessionVolumeBucketed", "0.5"},
+                              {"play_seconds", 10.0F},
+                              {"spatial-audio-accessory-feature", false},
+                              {"spatializationEnabled", false},
+                              {"ringerstate", false},
+                              {"mChannelsPerFrame", -1},
+                              {"play_secondsBucketed", "10"},
+                              {"msgidx", 1},
+                              {"msgcnt", 1}};
     EXPECT_EQ(derived[0]->payload(), expected);
-    expected.merge(settings);
-    expected.merge({{"QVSessionVolumeBucketed", "0.0625"},
-                    {"play_seconds", 75.25F},
-                    {"play_secondsBucketed", "60"},
-                    {"msgidx", 2}});
-    EXPECT_EQ(derived[1]->payload(), expected);
-    EXPECT_EQ(derived[1]->payload().find("play_seconds")->kind(), Value::Kind::singleFloat);
-    EXPECT_EQ(derived[1]->category(), AudioEventKindVolume);
-    EXPECT_EQ(derived[1]->type(), AudioEventTypeSummary);
+    EXPECT_EQ(derived[0]->payload().find("play_seconds")->kind(), Value::Kind::singleFloat);
+    EXPECT_EQ(derived[0]->category(), AudioEventKindVolume);
+    EXPECT_EQ(derived[0]->type(), AudioEventTypeSummary);
 }
 
 TEST_F(ProducersTest, LogsHowItCutsTheTime) {
@@ -204,29 +173,27 @@ TEST_F(ProducersTest, LogsHowItCutsTheTime) {
     const auto session = sessionWith({});
     device.log.setThreshold(LogLevel::debug);
     forgetLogThresholds();
-    (void)ZRReportingSessionVolumeMessagesWorker(session).createVolumeMessages(records(payloads), &process,
+    (void)ZRReportingSessionVolumeMessagesWorker(session).createVolumeMessages(messagesOf(payloads), &process,
                                                                                {});
-    EXPECT_THAT(device.log.texts(),
-                ElementsAre("entering createVolumeMessages createVolumeMessages",
-                            "playingTime { func=createVolumeMessages, playingTime=10.500000, "
-                            "zrTimestamp=20.5, zrTimestamp_double=20.500000, startZrTimestamp=10.0, "
-                            "startZrTimestamp_double=10.000000 }",
-                            "added volume message { func=createVolumeMessages, action=add, count=1 }",
-                            "playingTime { func=createVolumeMessages, playingTime=-20.500000, "
-                            "zrTimestamp=(null), zrTimestamp_double=0.000000, startZrTimestamp=20.5, "
-                            "startZrTimestamp_double=20.500000 }",
-                            "skipped volume message, too short { func=createVolumeMessages, action=skip, "
-                            "count=1 }"));
-    device.log.clear();
-    (void)ZRReportingSessionInputMessagesWorker(session).createInputMessages(records(payloads), &process, {});
-    (void)ZRReportingSessionKaleenMessagesWorker(session).createKaleenMessages(records(payloads), {});
+    (void)ZRReportingSessionInputMessagesWorker(session).createInputMessages(messagesOf(payloads), &process,
+                                                                             {});
+    (void)ZRReportingSessionKaleenMessagesWorker(session).createKaleenMessages(messagesOf(payloads), {});
     Lines texts = device.log.texts();
+    ASSERT_GT(texts.size(), 3U);
+    EXPECT_EQ(texts[3], "playingTime { func=createVolumeMessages, playingTime=-20.500000, "
+                        "zrTimestamp=(null), zrTimestamp_double=0.000000, startZrTimestamp=20.5, "
+                        "startZrTimestamp_double=20.500000 }");
     for (std::string& text : texts) {
         text.resize(std::min(text.size(), text.find(", zrTimestamp=")));
     }
     EXPECT_THAT(
         texts,
-        ElementsAre("entering createInputMessages createInputMessages",
+        ElementsAre("entering createVolumeMessages createVolumeMessages",
+                    "playingTime { func=createVolumeMessages, playingTime=10.500000",
+                    "added volume message { func=createVolumeMessages, action=add, count=1 }",
+                    "playingTime { func=createVolumeMessages, playingTime=-20.500000",
+                    "skipped volume message, too short { func=createVolumeMessages, action=skip, count=1 }",
+                    "entering createInputMessages createInputMessages",
                     "runningTime { func=createInputMessages, runningTime=10.500000",
                     "added input message { func=createInputMessages, action=add, count=1 }",
                     "runningTime { func=createInputMessages, runningTime=-20.500000",
@@ -242,7 +209,7 @@ TEST_F(ProducersTest, LogsHowItCutsTheTime) {
 
 TEST_F(ProducersTest, InputSegments) {
     const Dictionary running{{"session_input_running", true}, {"active_devices", "A"}};
-    const Case cases[] = {
+    const std::vector<Case> cases{
         {"a device change and the end; exactly the minimum is too short",
          {at(0, running), at(10, {{"active_devices", "B"}}), at(15, {{"session_duration", 15}})},
          {"10.0 \"A\" 1 1"}},
@@ -280,20 +247,16 @@ TEST_F(ProducersTest, InputSegments) {
          {"11.5 \"A\" 1 3", "8.5 \"B\" 2 3", "20.0 \"C\" 3 3"}},
         {"a start without a timestamp", {running, at(20, {{"session_input_running", false}})}, {}},
     };
-    for (const Case& row : cases) {
-        SCOPED_TRACE(row.what);
-        const auto session = sessionWith(row.previous);
-        const ZRReportingSessionInputMessagesWorker worker(session);
-        const auto derived = worker.createInputMessages(records(row.messages), &process,
-                                                        std::chrono::duration<double>(kMinimum));
-        EXPECT_EQ(shown(derived, {"inputrunning_seconds", "active_devices", "vocoders", "msgidx", "msgcnt"}),
-                  row.expected);
-        EXPECT_THAT(worker.createInputMessages(records(row.messages), nullptr, {}), IsEmpty());
-    }
+    expectSegments(cases, {"inputrunning_seconds", "active_devices", "vocoders", "msgidx", "msgcnt"},
+                   [this](const auto& owner, const auto& messages) {
+                       const ZRReportingSessionInputMessagesWorker worker(owner);
+                       EXPECT_THAT(worker.createInputMessages(messages, nullptr, {}), IsEmpty());
+                       return worker.createInputMessages(messages, &process, kMinimum);
+                   });
     const auto session = sessionWith({{"vp_config_input_port", "Mic"}});
     const ZRReportingSessionInputMessagesWorker worker(session);
     const auto derived = worker.createInputMessages(
-        records({at(0, running), at(7, {{"session_input_running", false}})}), &process, {});
+        messagesOf({at(0, running), at(7, {{"session_input_running", false}})}), &process, {});
     ASSERT_EQ(derived.size(), 1U);
     EXPECT_EQ(derived[0]->category(), AudioEventKindInput);
     EXPECT_EQ(derived[0]->payload(), (Dictionary{{"HostApplicationDisplayID", process},
@@ -308,7 +271,7 @@ TEST_F(ProducersTest, InputSegments) {
 
 TEST_F(ProducersTest, GroupSessionSegments) {
     const Dictionary inGroup{{"session_output_running", true}, {"kaleen_session", 1}, {"mFormatID", "F1"}};
-    const Case cases[] = {
+    const std::vector<Case> cases{
         {"a format change and the end",
          {at(0, inGroup), at(30, {{"mFormatID", "F2"}}), at(40, {{"session_duration", 40}})},
          {"30.0 \"F1\" -1 \"unknown\" 1 2", "10.0 \"F2\" -1 \"unknown\" 2 2"}},
@@ -339,16 +302,12 @@ TEST_F(ProducersTest, GroupSessionSegments) {
          {"8.0 \"F1\" -1 \"unknown\" 1 2", "7.0 \"F2\" -1 \"unknown\" 2 2"},
          at(2, inGroup)},
     };
-    for (const Case& row : cases) {
-        SCOPED_TRACE(row.what);
-        const auto session = sessionWith(row.previous);
-        const ZRReportingSessionKaleenMessagesWorker worker(session);
-        const auto derived =
-            worker.createKaleenMessages(records(row.messages), std::chrono::duration<double>(kMinimum));
-        EXPECT_EQ(shown(derived, {"play_seconds", "mFormatID", "mChannelsPerFrame", "session_selected_format",
-                                  "msgidx", "msgcnt"}),
-                  row.expected);
-    }
+    expectSegments(
+        cases,
+        {"play_seconds", "mFormatID", "mChannelsPerFrame", "session_selected_format", "msgidx", "msgcnt"},
+        [](const auto& session, const auto& messages) {
+            return ZRReportingSessionKaleenMessagesWorker(session).createKaleenMessages(messages, kMinimum);
+        });
 }
 
 TEST_F(ProducersTest, SummariesGoThroughTheSessionInOrderAndAreCounted) {
@@ -363,8 +322,7 @@ TEST_F(ProducersTest, SummariesGoThroughTheSessionInOrderAndAreCounted) {
         session->start();
         const double now = secondsSince1970(device.clock.now());
         const auto send = [&](double time, Dictionary payload) {
-            session->sendMessage(std::make_shared<ZRReportingSessionMessage>(
-                at(now + time, std::move(payload)), AudioEventKindGeneric, AudioEventTypeGeneric));
+            session->sendMessage(messageOf(at(now + time, std::move(payload))));
         };
         send(0, allRunning);
         send(3, {{"active_devices", "B"}});
@@ -392,8 +350,8 @@ TEST_F(ProducersTest, SummariesGoThroughTheSessionInOrderAndAreCounted) {
 
         const auto fresh = sessionWith({});
         const auto derived = ZRReportingSessionKaleenMessagesWorker(fresh).createKaleenMessages(
-            records({at(0, {{"session_output_running", true}, {"kaleen_session", 1}}),
-                     at(9, {{"session_duration", 9}})}),
+            messagesOf({at(0, {{"session_output_running", true}, {"kaleen_session", 1}}),
+                        at(9, {{"session_duration", 9}})}),
             {});
         ASSERT_EQ(derived.size(), 1U);
         EXPECT_EQ(jsonText(derived[0]->payload()),
@@ -444,18 +402,15 @@ TEST_F(ProducersTest, ValuesOfTheWrongKind) {
             SCOPED_TRACE(std::string(keys.keyAt(i)) + " " + jsonText(wrong));
             Dictionary odd = at(10, {});
             odd.set(keys.keyAt(i), wrong);
-            const Payloads payloads{at(0, start), odd, at(20, odd), at(30, {{"session_duration", wrong}})};
-            std::vector<MessageRef> sorted = records(payloads);
-            ZRReportingSessionMessage::sortMessages(sorted);
-            for (const auto& messages : {records(payloads), sorted}) {
-                for (const auto& derived : {volume.createVolumeMessages(messages, &wrong, {}),
-                                            input.createInputMessages(messages, &process, {}),
-                                            group.createKaleenMessages(messages, {})}) {
-                    EXPECT_LE(derived.size(), 3U);
-                    for (const MessageRef& message : derived) {
-                        EXPECT_EQ(*message->payload().find("msgcnt"), Value(derived.size()));
-                        EXPECT_FALSE(jsonText(message->payload()).empty());
-                    }
+            const auto messages =
+                messagesOf({at(0, start), odd, at(20, odd), at(30, {{"session_duration", wrong}})});
+            for (const auto& derived : {volume.createVolumeMessages(messages, &wrong, {}),
+                                        input.createInputMessages(messages, &process, {}),
+                                        group.createKaleenMessages(messages, {})}) {
+                EXPECT_LE(derived.size(), 3U);
+                for (const MessageRef& message : derived) {
+                    EXPECT_EQ(*message->payload().find("msgcnt"), Value(derived.size()));
+                    EXPECT_FALSE(jsonText(message->payload()).empty());
                 }
             }
         }
@@ -463,7 +418,7 @@ TEST_F(ProducersTest, ValuesOfTheWrongKind) {
 }
 
 TEST_F(ProducersTest, WrongKindsFollowTheReadingRules) {
-    const Case cases[] = {
+    const std::vector<Case> cases{
         {"texts that read as numbers and booleans",
          {at(0, {{"session_output_running", "YES"}, {"QVSessionVolume", "0.5"}}),
           at(10, {{"QVSessionVolume", 0.5}}), at(20, {{"QVSessionVolume", "0.75 loud"}}),
@@ -484,15 +439,12 @@ TEST_F(ProducersTest, WrongKindsFollowTheReadingRules) {
          {at(0, playing), at(NAN, {{"session_output_running", false}})},
          {}},
     };
-    for (const Case& row : cases) {
-        SCOPED_TRACE(row.what);
-        const auto session = sessionWith({});
-        const auto derived = ZRReportingSessionVolumeMessagesWorker(session).createVolumeMessages(
-            records(row.messages), &process, std::chrono::duration<double>(1));
-        EXPECT_EQ(shown(derived, {"play_seconds", "QVSessionVolume", "QVSessionVolumeBucketed",
-                                  "play_secondsBucketed"}),
-                  row.expected);
-    }
+    expectSegments(cases,
+                   {"play_seconds", "QVSessionVolume", "QVSessionVolumeBucketed", "play_secondsBucketed"},
+                   [this](const auto& session, const auto& messages) {
+                       return ZRReportingSessionVolumeMessagesWorker(session).createVolumeMessages(
+                           messages, &process, std::chrono::duration<double>(1));
+                   });
 }
 
 } // namespace

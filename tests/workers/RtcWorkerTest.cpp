@@ -1,29 +1,16 @@
 #include "base/Format.h"
-#include "base/Json.h"
-#include "platform/linux/LinuxCallQualityService.h"
-#include "platform/linux/LinuxWorkQueues.h"
-#include "session/ZRReportingSession.h"
 #include "tests/fakes/FakePlatform.h"
-#include "tests/platform/LinuxServiceSupport.h"
+#include "tests/fakes/Messages.h"
 #include "util/InternalBuild.h"
 #include "util/LogText.h"
 #include "workers/sinks/LinkmeterSummary.h"
 #include "workers/sinks/ZRReportingSessionRtcWorker.h"
 
 #include <gmock/gmock.h>
-#include <nlohmann/json.hpp>
 
-#include <atomic>
 #include <chrono>
 #include <cmath>
-#include <filesystem>
-#include <iterator>
-#include <map>
 #include <optional>
-#include <sstream>
-#include <string>
-#include <thread>
-#include <vector>
 
 namespace tamblo {
 namespace {
@@ -46,7 +33,7 @@ protected:
         return made;
     }
     void send(Dictionary payload, std::vector<const WorkerClass*> destinations = {}) {
-        auto message = std::make_shared<ZRReportingSessionMessage>(std::move(payload), 0x08000004, 1);
+        const MessageRef message = messageOf(std::move(payload), 0x08000004, 1);
         message->setDestinationWorkers(std::move(destinations));
         session->sendMessage(message);
     }
@@ -319,7 +306,7 @@ TEST_F(RtcWorkerTest, TimestampsAreKeptOnAnInternalBuild) {
 }
 
 MessageRef record(Dictionary payload) {
-    auto made = std::make_shared<ZRReportingSessionMessage>(std::move(payload), 4, 1);
+    MessageRef made = messageOf(std::move(payload));
     made->isSessionStarted = true;
     return made;
 }
@@ -351,104 +338,6 @@ TEST(LinkmeterSummaryTest, OfManyMessagesAndKeysTakesNoLongerThanItsValues) {
     EXPECT_LT(std::chrono::steady_clock::now() - start, 10s) << "quadratic growth would take minutes";
     EXPECT_EQ(summary.size(), 20'002U);
     EXPECT_EQ(summary.find("text")->stringValue().size(), 100'000U * 28 - 1);
-}
-
-/// Workers whose queues run on the threads of a real pool, with a service that a test brings along.
-class RtcWorkerOnThreadsTest : public testing::Test {
-protected:
-    void use(CallQualityService& service) {
-        device.installWith({.workQueues = queues.get(), .callQuality = &service});
-    }
-    static std::shared_ptr<ZRReportingSessionRtcWorker>
-    startedWorker(const std::shared_ptr<ZRReportingSession>& session) {
-        auto worker = std::make_shared<ZRReportingSessionRtcWorker>(session);
-        EXPECT_EQ(worker->start(), true);
-        return worker;
-    }
-    static MessageRef message(int n) {
-        return std::make_shared<ZRReportingSessionMessage>(Dictionary{{"n", n}}, 4, 1);
-    }
-
-    FakePlatform device{LogLevel::fault};
-    std::unique_ptr<LinuxWorkQueues> queues = std::make_unique<LinuxWorkQueues>();
-    std::shared_ptr<ZRReportingSession> session = ZRReportingSession::initWithID(9, {1});
-};
-
-/// Never finds a back end, nor that there is none.
-class SilentService final : public CallQualityService {
-public:
-    [[nodiscard]] std::optional<std::string> NewHierarchyToken(std::string_view) override { return "t"; }
-    [[nodiscard]] SessionRef CreateLinkmeterSession(const Dictionary&, const Dictionary&) override {
-        return nullptr;
-    }
-    void StartConfiguration(const SessionRef&, Completion) override { ++waiting; }
-    [[nodiscard]] std::optional<std::string> SendLinkmeterMessage(const SessionRef&, std::uint16_t,
-                                                                  std::uint16_t, const Dictionary&) override {
-        return "not reached";
-    }
-    void FlushMessages(const SessionRef&) override {}
-    void commit() override {}
-
-    std::atomic<int> waiting{0};
-};
-
-TEST_F(RtcWorkerOnThreadsTest, ThousandsMayWaitWithoutHoldingAThreadOrEachOther) {
-    SilentService service;
-    use(service);
-    std::vector<std::shared_ptr<ZRReportingSessionRtcWorker>> workers;
-    for (int i = 0; i < 2000; ++i) {
-        workers.push_back(startedWorker(session));
-        workers.back()->handleMessage(message(i));
-    }
-    const auto deadline = std::chrono::steady_clock::now() + 8s;
-    while (service.waiting < 2000 && std::chrono::steady_clock::now() < deadline) {
-        std::this_thread::yield();
-    }
-    EXPECT_EQ(service.waiting, 2000) << "none waits for another's nine seconds";
-    const auto threads = std::distance(std::filesystem::directory_iterator("/proc/self/task"),
-                                       std::filesystem::directory_iterator());
-    EXPECT_LE(threads, static_cast<std::ptrdiff_t>(ThreadPool::kMaximumThreads) + 4);
-    workers.clear();
-    queues.reset();
-}
-
-TEST_F(RtcWorkerOnThreadsTest, SpoolsWholeSessionsOfManyWorkersInOrder) {
-    const TemporaryDirectory directory;
-    RecordingLog log;
-    const LinuxPreferences preferences(directory.path(), log);
-    constexpr int kWorkers = 40;
-    constexpr int kMessages = 50;
-    {
-        LinuxCallQualityService service(directory.path(), device.clock, preferences, *queues, log);
-        use(service);
-        for (int i = 0; i < kWorkers; ++i) {
-            const auto worker = startedWorker(session);
-            for (int n = 0; n < kMessages; ++n) {
-                worker->handleMessage(message(n));
-            }
-            if (i % 4 != 0) {
-                worker->stop();
-            }
-        }
-        queues.reset();
-    }
-    std::istringstream lines(directory.read("call-quality.jsonl"));
-    std::map<std::string, std::vector<nlohmann::json>> sessions;
-    for (std::string line; std::getline(lines, line);) {
-        auto parsed = nlohmann::json::parse(line);
-        sessions[parsed["session"]].push_back(parsed);
-    }
-    EXPECT_EQ(sessions.size(), static_cast<std::size_t>(kWorkers));
-    int whole = 0;
-    for (const auto& [name, operations] : sessions) {
-        EXPECT_EQ(operations[0]["op"], "open");
-        for (std::size_t n = 1; n < operations.size() && operations[n]["op"] == "message"; ++n) {
-            EXPECT_EQ(operations[n]["payload"]["n"], n - 1);
-        }
-        whole += operations.back()["op"] == "flush" && operations.size() == kMessages + 2U ? 1 : 0;
-    }
-    EXPECT_EQ(whole, kWorkers * 3 / 4) << "all that were stopped, though dropped at once";
-    EXPECT_THAT(log.take(), IsEmpty());
 }
 
 } // namespace

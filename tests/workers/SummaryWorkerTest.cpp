@@ -1,6 +1,5 @@
-#include "base/Json.h"
-#include "session/ZRReportingSession.h"
 #include "tests/fakes/FakePlatform.h"
+#include "tests/fakes/Messages.h"
 #include "workers/producers/ZRReportingSessionSummaryWorker.h"
 
 #include <gmock/gmock.h>
@@ -17,8 +16,7 @@ using testing::Field;
 class SummaryWorkerTest : public testing::Test {
 protected:
     void send(Dictionary payload, AudioEventType type = AudioEventTypeGeneric) {
-        session->sendMessage(
-            std::make_shared<ZRReportingSessionMessage>(std::move(payload), AudioEventKindIO, type));
+        session->sendMessage(messageOf(std::move(payload), AudioEventKindIO, type));
     }
     Dictionary stopAndTakeSummary() {
         device.analyticsEvents.clear();
@@ -27,15 +25,6 @@ protected:
         EXPECT_EQ(payloads.size(), 1U);
         return payloads.empty() ? Dictionary() : payloads[0];
     }
-    static std::string shown(const Dictionary& summary, std::initializer_list<std::string_view> keys) {
-        std::string text;
-        for (const std::string_view key : keys) {
-            const Value* value = summary.find(key);
-            text += (text.empty() ? "" : " ") + (value != nullptr ? jsonText(*value) : "-");
-        }
-        return text;
-    }
-
     FakePlatform device{LogLevel::standard};
     std::shared_ptr<ZRReportingSession> session = ZRReportingSession::initWithID(5, {1});
 };
@@ -84,7 +73,7 @@ TEST_F(SummaryWorkerTest, TellsWhoReportedAndHowTheDeviceIs) {
                               "singleMessageSession", "thermal_state", "low_power_enabled",
                               "vmInfo_phys_footprint_MiB", "load_avg_1_min", "load_avg_5_min",
                               "load_avg_15_min", "audiotag"}),
-              "\"telephony\" \"Unknown\" - false \"Nominal\" 1 3 0.5 0.25 0.125 \"Session_GenericSummary\"");
+              "\"telephony\" \"Unknown\" false \"Nominal\" 1 3 0.5 0.25 0.125 \"Session_GenericSummary\"");
 
     session->setClientProcessName("phone");
     session->updateConfigurationWithContentsOfConfiguration(
