@@ -1,17 +1,14 @@
 #include "platform/linux/AppendOnlyFile.h"
+#include "tests/platform/FaultyOperations.h"
 #include "tests/platform/LinuxServiceSupport.h"
 
 #include <gmock/gmock.h>
 
-#include <algorithm>
-#include <cerrno>
-#include <functional>
 #include <memory>
 #include <new>
-#include <optional>
 #include <thread>
 
-#include <fcntl.h>
+#include <sys/stat.h>
 
 namespace tamblo {
 namespace {
@@ -21,54 +18,6 @@ using testing::ElementsAre;
 using testing::HasSubstr;
 using testing::IsEmpty;
 
-/// The real system calls on a disk that fills up, and with faults that tests switch on. Time passes at every
-/// look.
-class FaultyOperations final : public FileOperations {
-public:
-    std::optional<std::size_t> room; ///< bytes that can still be written
-    std::size_t largestWrite = 1U << 30U;
-    int openError = 0;
-    int truncateError = 0;
-    std::function<int(std::string_view from)> renameError = [](std::string_view) { return 0; };
-    int interruptions = 0;
-    int writes = 0;
-
-    int open(const char* path, int flags, mode_t mode) noexcept override {
-        return openError != 0 ? fail(openError) : FileOperations::open(path, flags, mode);
-    }
-    ssize_t write(int descriptor, const void* bytes, std::size_t count) noexcept override {
-        ++writes;
-        if (interruptions > 0) {
-            --interruptions;
-            return fail(EINTR);
-        }
-        count = std::min(count, largestWrite);
-        if (room) {
-            if (*room == 0) {
-                return fail(ENOSPC);
-            }
-            count = std::min(count, *room);
-            *room -= count;
-        }
-        return FileOperations::write(descriptor, bytes, count);
-    }
-    int truncate(int descriptor, off_t size) noexcept override {
-        return truncateError != 0 ? fail(truncateError) : FileOperations::truncate(descriptor, size);
-    }
-    int rename(const char* from, const char* to) noexcept override {
-        const int error = renameError(from);
-        return error != 0 ? fail(error) : FileOperations::rename(from, to);
-    }
-    std::chrono::nanoseconds coarseTime() noexcept override { return std::chrono::seconds(++time_); }
-
-private:
-    static int fail(int error) noexcept {
-        errno = error;
-        return -1;
-    }
-    long time_ = 0;
-};
-
 class AppendOnlyFileTest : public testing::Test {
 protected:
     [[nodiscard]] std::unique_ptr<AppendOnlyFile> open(AppendOnlyFile::Limits limits = {}) {
@@ -77,6 +26,10 @@ protected:
     }
     static void append(AppendOnlyFile& file, std::string_view line) {
         file.append([line](TextBuffer& out) { out.append(line); });
+    }
+    static void appendAndFlush(AppendOnlyFile& file, std::string_view line) {
+        append(file, line);
+        file.flush();
     }
     /// What the files hold, oldest first.
     [[nodiscard]] std::vector<std::string> files() const {
@@ -121,8 +74,7 @@ TEST_F(AppendOnlyFileTest, TakesALineBackThatFailsToFormat) {
         throw std::bad_alloc();
     }),
                  std::bad_alloc);
-    append(*file, "three");
-    file->flush();
+    appendAndFlush(*file, "three");
     EXPECT_EQ(directory_.read("sink.jsonl"), "one\nthree\n");
 }
 
@@ -145,8 +97,7 @@ TEST_F(AppendOnlyFileTest, CutsATornLastLineOffWhenOpened) {
         directory_.write("sink.jsonl", before);
         const auto file = open();
         EXPECT_EQ(directory_.read("sink.jsonl"), after);
-        append(*file, "new");
-        file->flush();
+        appendAndFlush(*file, "new");
         EXPECT_EQ(directory_.read("sink.jsonl"), after + "new\n");
     }
     EXPECT_THAT(log_.take(), IsEmpty());
@@ -158,12 +109,10 @@ TEST_F(AppendOnlyFileTest, BeginsANewFileBeforeALineWouldMakeItTooLarge) {
     append(*file, "5678"); // exactly full
     append(*file, "a");
     append(*file, std::string(30, 'L')); // larger than a file: has one of its own
-    append(*file, "b");
-    file->flush();
+    appendAndFlush(*file, "b");
     EXPECT_THAT(files(), ElementsAre("1234\n5678\n", "a\n", std::string(30, 'L') + "\n", "b\n"));
     for (const char* line : {"12345678", "123456789", "c"}) {
-        append(*file, line);
-        file->flush();
+        appendAndFlush(*file, line);
     }
     EXPECT_THAT(files(), ElementsAre(std::string(30, 'L') + "\n", "b\n", "12345678\n", "123456789\n", "c\n"));
 }
@@ -177,12 +126,10 @@ TEST_F(AppendOnlyFileTest, KeepsEarlierFilesWhenRenamingFailsAgainAndAgain) {
     ASSERT_THAT(files(), ElementsAre("aaa\n", "bbb\n", "ccc\n", "ddd\n"));
     operations_.renameError = [](std::string_view from) { return from.ends_with("jsonl") ? EACCES : 0; };
     for (const char* line : {"lost", "lost", "lost"}) {
-        append(*file, line);
-        file->flush();
+        appendAndFlush(*file, line);
     }
     operations_.renameError = [](std::string_view) { return 0; };
-    append(*file, "eee");
-    file->flush();
+    appendAndFlush(*file, "eee");
     EXPECT_THAT(files(), ElementsAre("aaa\n", "bbb\n", "ccc\n", "ddd\n", "eee\n"));
     EXPECT_THAT(log_.take(), ElementsAre(AllOf(HasSubstr("3 zrrs"), HasSubstr("rename: Permission denied")),
                                          HasSubstr("; 3 records were lost")));
@@ -193,8 +140,7 @@ TEST_F(AppendOnlyFileTest, CarriesOnAfterShortAndInterruptedWrites) {
     operations_.interruptions = 2;
     const auto file = open();
     append(*file, "first line");
-    append(*file, "second line");
-    file->flush();
+    appendAndFlush(*file, "second line");
     EXPECT_EQ(directory_.read("sink.jsonl"), "first line\nsecond line\n");
     EXPECT_THAT(log_.take(), IsEmpty());
 }
@@ -216,12 +162,10 @@ TEST_F(AppendOnlyFileTest, TearsAndDoublesNothingWhenTheDiskFillsUp) {
                 EXPECT_EQ(directory_.read("sink.jsonl"), whole);
             }
             operations_.room = 0;
-            append(*file, "ddd");
-            file->flush();
+            appendAndFlush(*file, "ddd");
             operations_.room.reset();
             operations_.truncateError = 0;
-            append(*file, "eee");
-            file->flush();
+            appendAndFlush(*file, "eee");
             EXPECT_EQ(directory_.read("sink.jsonl"), whole + "eee\n");
             const std::string lost = std::to_string(3 - room / 4 + 1);
             EXPECT_THAT(log_.take(), ElementsAre(HasSubstr("No space left"),
@@ -236,14 +180,12 @@ TEST_F(AppendOnlyFileTest, TellsAnOutageOnceAtItsBeginAndOnceAtItsEnd) {
     EXPECT_THAT(log_.take(), IsEmpty()) << "nothing is lost yet";
     for (int flush = 0; flush < 3; ++flush) {
         append(*file, "x");
-        append(*file, "y");
-        file->flush();
+        appendAndFlush(*file, "y");
     }
     EXPECT_THAT(log_.take(),
                 ElementsAre(AllOf(HasSubstr(file->path()), HasSubstr("open: Permission denied"))));
     operations_.openError = 0;
-    append(*file, "z");
-    file->flush();
+    appendAndFlush(*file, "z");
     EXPECT_EQ(directory_.read("sink.jsonl"), "z\n");
     EXPECT_THAT(log_.take(), ElementsAre(HasSubstr("it can be written again; 6 records were lost")));
 
@@ -257,28 +199,24 @@ TEST_F(AppendOnlyFileTest, TellsAnOutageOnceAtItsBeginAndOnceAtItsEnd) {
 TEST_F(AppendOnlyFileTest, FollowsThePathWhenOthersTouchTheFile) {
     const auto file = open({.fileSize = 24});
     const std::string path = directory_.path("sink.jsonl");
-    const auto appendAndFlush = [&file](std::string_view line) {
-        append(*file, line);
-        file->flush();
-    };
-    appendAndFlush("one");
+    appendAndFlush(*file, "one");
     std::filesystem::remove(path);
-    appendAndFlush("two");
+    appendAndFlush(*file, "two");
     EXPECT_EQ(directory_.read("sink.jsonl"), "two\n");
     std::filesystem::rename(path, path + ".shipped");
     directory_.write("sink.jsonl", "theirs\nto");
-    appendAndFlush("three");
+    appendAndFlush(*file, "three");
     EXPECT_EQ(directory_.read("sink.jsonl.shipped"), "two\n");
     EXPECT_EQ(directory_.read("sink.jsonl"), "theirs\nthree\n");
     std::filesystem::resize_file(path, 0); // and the size counts from there
-    appendAndFlush("0123456789");
-    appendAndFlush("0123456789");
+    appendAndFlush(*file, "0123456789");
+    appendAndFlush(*file, "0123456789");
     EXPECT_THAT(files(), ElementsAre("0123456789\n0123456789\n"));
 
     std::filesystem::rename(directory_.path(), directory_.path() + ".away");
-    appendAndFlush("lost");
+    appendAndFlush(*file, "lost");
     std::filesystem::rename(directory_.path() + ".away", directory_.path());
-    appendAndFlush("four");
+    appendAndFlush(*file, "four");
     EXPECT_THAT(files(), ElementsAre("0123456789\n0123456789\n", "four\n"));
     EXPECT_THAT(log_.take(),
                 ElementsAre(HasSubstr("No such file or directory"), HasSubstr("1 records were lost")));
@@ -287,8 +225,7 @@ TEST_F(AppendOnlyFileTest, FollowsThePathWhenOthersTouchTheFile) {
 TEST_F(AppendOnlyFileTest, RefusesWhatIsNoFileWithoutWaitingForAReader) {
     ASSERT_EQ(::mkfifo(directory_.path("sink.jsonl").c_str(), 0600), 0);
     const auto file = open();
-    append(*file, "x");
-    file->flush();
+    appendAndFlush(*file, "x");
     EXPECT_THAT(log_.take(), ElementsAre(HasSubstr("not a regular file")));
 }
 

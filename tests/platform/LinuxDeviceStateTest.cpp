@@ -17,9 +17,6 @@
 #include <string_view>
 #include <variant>
 
-#include <sys/mman.h>
-#include <unistd.h>
-
 namespace tamblo {
 namespace {
 
@@ -49,7 +46,6 @@ void makeZones(const TemporaryDirectory& root, const std::string& description) {
 TEST(LinuxDeviceConditionsTest, TheWorstTripPointReachedIsTheThermalState) {
     const std::pair<const char*, int> cases[] = {
         {"", 0},
-        {"/thermal_zone0 temp=60000", 0},
         {"/thermal_zone0 temp=59999 0:active@60000", 0},
         {"/thermal_zone0 temp=60000 0:active@60000", 1},
         {"/thermal_zone0 temp=60000 0:passive@60000", 2},
@@ -60,11 +56,8 @@ TEST(LinuxDeviceConditionsTest, TheWorstTripPointReachedIsTheThermalState) {
         {"/thermal_zone0 temp=80000 0:active@50000 13:hot@80000", 3},
         {"/thermal_zone0 temp=50 0:active@50 /thermal_zone1 temp=60 0:passive@60 /thermal_zone2 temp=1", 2},
         {"/thermal_zone0 mode=disabled temp=60000 0:hot@60000", 0},
-        {"/thermal_zone0 mode=enabled temp=60000 0:hot@60000", 3},
         {"/thermal_zone0 temp=60000 0:hot@0 1:critical@-274000 2:passive@ 3:hot@5x 4:active@1", 1},
         {"/thermal_zone0 0:hot@1 /thermal_zone1 temp= 0:hot@1 /thermal_zone2 temp=9x 0:hot@1", 0},
-        {"/thermal_zone0 0:hot@1 /thermal_zone1 temp=1 0:hot@5 /thermal_zone2 temp=9", 0},
-        {"/thermal_zone0 temp=-5000 0:hot@60000", 0},
         {"/cooling_device0 temp=60000 0:hot@60000", 0},
     };
     for (const auto& [zones, expected] : cases) {
@@ -105,9 +98,6 @@ TEST(LinuxDeviceConditionsTest, AReadingStandsForASecond) {
     EXPECT_TRUE(conditions.isLowPowerModeEnabled());
 }
 
-constexpr std::uint64_t kKibibyte = 1024;
-constexpr std::uint64_t kMebibyte = 1024 * kKibibyte;
-
 /// The footprint, or minus the error's code.
 std::int64_t footprint(const LinuxProcessInformation& information) {
     const auto result = information.physicalFootprint();
@@ -145,26 +135,6 @@ TEST(LinuxProcessInformationTest, TheFootprintIsWhatFilesCannotGiveBack) {
     std::filesystem::remove(root.path("self/status"));
     std::filesystem::create_directory(root.path("self/status"));
     EXPECT_EQ(footprint(LinuxProcessInformation(root.path())), -EISDIR);
-}
-
-TEST(LinuxProcessInformationTest, TheFootprintFollowsWhatThisProcessUses) {
-    const auto now = [] { return footprint(LinuxProcessInformation()); };
-    const std::int64_t before = now();
-    EXPECT_GT(before, static_cast<std::int64_t>(100 * kKibibyte));
-    std::uint64_t pages = 0, residentPages = 0;
-    const auto pageSize = static_cast<std::uint64_t>(::sysconf(_SC_PAGESIZE));
-    std::ifstream("/proc/self/statm") >> pages >> residentPages;
-    EXPECT_LT(before, static_cast<std::int64_t>(residentPages * pageSize + 16 * kMebibyte));
-    constexpr std::size_t kSize = 64 * kMebibyte;
-    constexpr double kTolerance = 4 * kMebibyte;
-    for (const int touched : {0, MAP_POPULATE}) {
-        const int flags = MAP_PRIVATE | MAP_ANONYMOUS | touched;
-        void* memory = ::mmap(nullptr, kSize, PROT_READ | PROT_WRITE, flags, -1, 0);
-        ASSERT_NE(memory, MAP_FAILED);
-        EXPECT_NEAR(static_cast<double>(now() - before), touched != 0 ? kSize : 0, kTolerance);
-        ::munmap(memory, kSize);
-        EXPECT_NEAR(static_cast<double>(now() - before), 0, kTolerance);
-    }
 }
 
 TEST(LinuxProcessInformationTest, TimesAreTheKernels) {

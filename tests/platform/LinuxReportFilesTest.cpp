@@ -1,11 +1,8 @@
 #include "platform/linux/LinuxReportFiles.h"
+#include "tests/platform/FaultyOperations.h"
 #include "tests/platform/LinuxServiceSupport.h"
 
 #include <gmock/gmock.h>
-
-#include <algorithm>
-#include <cerrno>
-#include <optional>
 
 #include <sys/stat.h>
 
@@ -14,38 +11,12 @@ namespace {
 
 namespace fs = std::filesystem;
 
-/// The real system calls, with short and interrupted writes, a disk that fills up, and a close that fails.
-class FaultyOperations final : public FileOperations {
-public:
-    std::optional<std::size_t> room; ///< bytes that can still be written
-    int closeError = 0;
-
-    ssize_t write(int descriptor, const void* bytes, std::size_t count) noexcept override {
-        interrupted_ = !interrupted_;
-        if (interrupted_) {
-            errno = EINTR;
-            return -1;
-        }
-        count = std::min<std::size_t>({count, 7, room.value_or(7)});
-        if (count == 0) {
-            errno = ENOSPC;
-            return -1;
-        }
-        room = room ? std::optional(*room - count) : room;
-        return FileOperations::write(descriptor, bytes, count);
-    }
-    int close(int descriptor) noexcept override {
-        const int result = FileOperations::close(descriptor);
-        errno = closeError;
-        return closeError != 0 ? -1 : result;
-    }
-
-private:
-    bool interrupted_ = false;
-};
-
 class LinuxReportFilesTest : public testing::Test {
 protected:
+    LinuxReportFilesTest() {
+        operations.largestWrite = 7;
+        operations.interruptions = 1000;
+    }
     [[nodiscard]] std::unique_ptr<ReportFile> create(const std::string& name) {
         auto created = files.createFile(directory.path(name));
         if (const auto* failure = std::get_if<std::string>(&created)) {

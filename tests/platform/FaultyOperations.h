@@ -1,0 +1,66 @@
+#pragma once
+
+#include "platform/linux/FileOperations.h"
+
+#include <algorithm>
+#include <cerrno>
+#include <chrono>
+#include <cstddef>
+#include <functional>
+#include <optional>
+#include <string_view>
+
+namespace tamblo {
+
+/// The real system calls on a disk that fills up, and with faults that tests switch on. Time passes at every
+/// look.
+class FaultyOperations final : public FileOperations {
+public:
+    std::optional<std::size_t> room; ///< bytes that can still be written
+    std::size_t largestWrite = 1U << 30U;
+    int interruptions = 0; ///< of writes to come, every second one
+    int openError = 0;
+    int truncateError = 0;
+    int closeError = 0;
+    std::function<int(std::string_view from)> renameError = [](std::string_view) { return 0; };
+    int writes = 0;
+
+    int open(const char* path, int flags, mode_t mode) noexcept override {
+        return openError != 0 ? fail(openError) : FileOperations::open(path, flags, mode);
+    }
+    ssize_t write(int descriptor, const void* bytes, std::size_t count) noexcept override {
+        ++writes;
+        isInterrupted_ = interruptions > 0 && !isInterrupted_;
+        if (isInterrupted_) {
+            --interruptions;
+            return fail(EINTR);
+        }
+        count = std::min({count, largestWrite, room.value_or(count)});
+        if (room) {
+            *room -= count;
+        }
+        return count == 0 ? fail(ENOSPC) : FileOperations::write(descriptor, bytes, count);
+    }
+    int truncate(int descriptor, off_t size) noexcept override {
+        return truncateError != 0 ? fail(truncateError) : FileOperations::truncate(descriptor, size);
+    }
+    int rename(const char* from, const char* to) noexcept override {
+        const int error = renameError(from);
+        return error != 0 ? fail(error) : FileOperations::rename(from, to);
+    }
+    int close(int descriptor) noexcept override {
+        const int result = FileOperations::close(descriptor);
+        return closeError != 0 ? fail(closeError) : result;
+    }
+    std::chrono::nanoseconds coarseTime() noexcept override { return std::chrono::seconds(++time_); }
+
+private:
+    static int fail(int error) noexcept {
+        errno = error;
+        return -1;
+    }
+    bool isInterrupted_ = false;
+    long time_ = 0;
+};
+
+} // namespace tamblo
