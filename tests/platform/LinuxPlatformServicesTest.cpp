@@ -1,5 +1,6 @@
 #include "platform/linux/Directories.h"
 #include "platform/linux/LinuxAnalyticsEventService.h"
+#include "platform/linux/LinuxBugReportDrafting.h"
 #include "platform/linux/LinuxClock.h"
 #include "platform/linux/LinuxDeviceProperties.h"
 #include "platform/linux/LinuxPreferences.h"
@@ -203,6 +204,42 @@ TEST_F(LinuxPreferencesTest, AMalformedFileIsAbsentAndToldOncePerState) {
     EXPECT_THAT(log_.take(), ElementsAre(HasSubstr("not an object")));
     directory_.write("preferences/d.json", R"({"k": 6})");
     EXPECT_EQ(valueAfterChange(), 6);
+}
+
+TEST_F(LinuxPreferencesTest, AValueIsStoredAtOnceBesideTheOthers) {
+    namespace fs = std::filesystem;
+    directory_.write("preferences/d.json", R"({"a":[1], "k":1})");
+    fs::permissions(path_ + "/d.json", fs::perms(0640));
+    EXPECT_EQ(valueAfterChange(), 1);
+    EXPECT_EQ(preferences_.setPreferenceValue("k", "d", 2), std::nullopt);
+    EXPECT_EQ(value(), 2) << "before the kernel has told of it";
+    EXPECT_EQ(directory_.read("preferences/d.json"), "{\"a\":[1],\"k\":2}\n");
+    EXPECT_EQ(valueAfterChange(), 2);
+    EXPECT_EQ(preferences_.setPreferenceValue("k", "new", 1772366400.25), std::nullopt);
+    EXPECT_EQ(directory_.read("preferences/new.json"), "{\"k\":1772366400.25}\n");
+    EXPECT_EQ(fs::status(path_ + "/d.json").permissions(), fs::perms(0640));
+    EXPECT_EQ(fs::status(path_ + "/new.json").permissions(), fs::perms(0600));
+    EXPECT_EQ(std::distance(fs::directory_iterator(path_), fs::directory_iterator()), 2) << "nothing else";
+}
+
+TEST_F(LinuxPreferencesTest, WhatCannotBeStoredIsReadUntilTheFileChanges) {
+    for (const auto& [content, fault] :
+         {std::pair("{\"k\": 1,\n oops}", "line 2, column 2"), {"[1]", "no"}}) {
+        directory_.write("preferences/d.json", content);
+        EXPECT_EQ(valueAfterChange(), -1);
+        EXPECT_THAT(preferences_.setPreferenceValue("k", "d", 7).value_or(""),
+                    AllOf(HasSubstr(path_ + "/d.json: "), HasSubstr(fault)));
+        EXPECT_EQ(directory_.read("preferences/d.json"), content);
+        EXPECT_EQ(value(), 7);
+        directory_.write("preferences/d.json", R"({"k": 1})");
+        EXPECT_EQ(valueAfterChange(), 1);
+    }
+    std::filesystem::remove_all(path_);
+    EXPECT_EQ(valueAfterChange(), -1);
+    EXPECT_THAT(preferences_.setPreferenceValue("k", "d", 7).value_or(""), HasSubstr("No such file"));
+    EXPECT_EQ(value(), 7);
+    EXPECT_THAT(preferences_.setPreferenceValue("k", "../d", 7).value_or(""),
+                HasSubstr("no preferences domain"));
 }
 
 TEST_F(LinuxPreferencesTest, ADomainNameIsNoPath) {
@@ -440,6 +477,38 @@ TEST(LinuxProcessInformationTest, NamesLivingProcessesInUtf8) {
                                         "b\xC3";
     EXPECT_EQ(information.ProcessNameForPid(::getpid()), "a?b?");
     std::ofstream("/proc/self/comm") << comm;
+}
+
+TEST(LinuxBugReportDraftingTest, ADraftIsALineInTheOrderOfItsFields) {
+    const TemporaryDirectory directory;
+    RecordingLog log;
+    const LinuxClock clock;
+    LinuxBugReportDrafting drafting(directory.path(), clock, log);
+    int completions = 0;
+    const BugReportDraft draft{.title = "a \"b\"",
+                               .problemDescription = "c\nd",
+                               .component = {"n", "All", -5},
+                               .reproducibility = 6,
+                               .classification = 7,
+                               .diagnosticExtensions = {"x", "y\\"}};
+    drafting.createDraft(draft, "caller", "why",
+                         [&](const std::optional<std::string>& error) { completions += error ? 100 : 1; });
+    drafting.createDraft({}, "", "", {});
+    drafting.flush();
+    EXPECT_EQ(completions, 1);
+    constexpr const char* begin = R"(\{"time":[0-9]{10}\.[0-9]+,"process":)";
+    EXPECT_THAT(directory.read("bug-report-drafts.jsonl"),
+                testing::MatchesRegex(
+                    std::string(begin) +
+                    R"("caller","reason":"why","draft":\{"title":"a \\"b\\"","problemDescription":"c\\nd",)"
+                    R"("component":\{"name":"n","version":"All","identifier":-5\},"reproducibility":6,)"
+                    R"("classification":7,"diagnosticExtensions":\["x","y\\\\"\]\}\})"
+                    "\n" +
+                    begin +
+                    R"("","reason":"","draft":\{"title":"","problemDescription":"",)"
+                    R"("component":\{"name":"","version":"","identifier":0\},"reproducibility":0,)"
+                    R"("classification":0,"diagnosticExtensions":\[\]\}\})"
+                    "\n"));
 }
 
 } // namespace

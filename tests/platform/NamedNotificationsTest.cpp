@@ -178,6 +178,39 @@ TEST_F(NamedNotificationsTest, EveryKindOfPostCallsEachRegistrationOfItsName) {
     EXPECT_EQ(queue_.takePaces().size(), 1U);
 }
 
+TEST_F(NamedNotificationsTest, TheServicesOwnPostIsOneAndKeepsTheWord) {
+    const int token = add("n");
+    const std::pair<const char*, std::uint64_t> cases[] = {
+        {nullptr, 0}, {" 18446744073709551615 ", UINT64_MAX}, {"1 2", 0}, {"", 0}};
+    for (const auto& [text, word] : cases) {
+        if (text != nullptr) {
+            post("n", text);
+            (void)callsAfterChange();
+        }
+        EXPECT_EQ(notifications_.PostNamedNotification("n"), 0);
+        (void)queue_.takePaces();
+        EXPECT_THAT(callsAfterChange(), ElementsAre(token));
+        EXPECT_EQ(directory_.read("notifications/n"), std::to_string(word) + "\n");
+    }
+    EXPECT_THAT(log_.take(), IsEmpty());
+}
+
+TEST_F(NamedNotificationsTest, APostThatFailsIsToldOncePerOutage) {
+    const std::string fault = "3 zrrs " + path_ + "/n: Is a directory; the notification is not posted";
+    for (int outage = 0; outage < 2; ++outage) {
+        std::filesystem::create_directory(path_ + "/n");
+        EXPECT_EQ(notifications_.PostNamedNotification("n"), EISDIR);
+        EXPECT_EQ(notifications_.PostNamedNotification("n"), EISDIR);
+        std::filesystem::remove(path_ + "/n");
+        EXPECT_EQ(notifications_.PostNamedNotification("n"), 0);
+        std::filesystem::remove(path_ + "/n");
+        EXPECT_THAT(log_.take(), ElementsAre(fault));
+    }
+    std::filesystem::create_symlink("n", path_ + "/link");
+    EXPECT_EQ(notifications_.PostNamedNotification("link"), ELOOP);
+    EXPECT_EQ(notifications_.PostNamedNotification(".n"), EINVAL);
+}
+
 TEST_F(NamedNotificationsTest, ABurstIsOneWaitingCallThatSeesTheLastState) {
     std::vector<std::uint64_t> seen;
     const int token = add("n", [&](int called) {
