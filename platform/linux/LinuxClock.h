@@ -2,6 +2,8 @@
 
 #include "platform/Clock.h"
 
+#include <mutex>
+
 namespace tamblo {
 
 /// The system's real-time clock, read without entering the kernel, and the time zone that the device has
@@ -11,6 +13,9 @@ public:
     [[nodiscard]] WallTime now() const noexcept override;
     [[nodiscard]] std::chrono::seconds utcOffset(WallTime time) const override;
     void sleepFor(std::chrono::microseconds time) override;
+
+private:
+    mutable std::mutex zone_; ///< held while the C library's zone, which is the whole process's, is read
 };
 
 } // namespace tamblo
