@@ -1,12 +1,14 @@
 #include "base/Json.h"
 
 #include "base/Format.h"
+#include "base/KeySetCache.h"
 #include "base/Utf8.h"
 
 #include <algorithm>
 #include <charconv>
 #include <cstdint>
 #include <optional>
+#include <span>
 #include <utility>
 
 namespace tamblo {
@@ -125,13 +127,20 @@ private:
     bool readUnicodeEscape(std::string& out, std::size_t start);
     bool readArray(Item& item, int depth);
     bool readObject(Item& item, int depth);
-    bool readMember(std::vector<Member>& members, int depth);
-    bool buildDictionary(std::vector<Member>& members, Item& item);
+    bool readMember(int depth);
+    bool buildDictionary(std::span<Member> members, Item& item);
+    bool buildDictionarySorted(std::span<Member> members, Item& item);
     bool nextOrClose(char close, bool& closed);
 
     std::string_view text_;
     JsonReadOptions options_;
     std::size_t at_ = 0;
+    /// Of the objects that are being read, those of the inner ones on top.
+    std::vector<Member> members_;
+    /// Objects of one kind, as the elements of an array mostly are, share their keys.
+    KeySetCache keySets_;
+    std::vector<std::string_view> keys_;
+    std::vector<Value> values_;
     std::optional<JsonError> error_;
 };
 
@@ -408,17 +417,19 @@ bool Reader::readObject(Item& item, int depth) {
         return fail(formatted("values are nested deeper than {}", kMaximumDepth));
     }
     ++at_;
-    std::vector<Member> members;
+    const std::size_t first = members_.size();
     skipSpace();
     for (bool closed = take('}'); !closed;) {
-        if (!readMember(members, depth) || !nextOrClose('}', closed)) {
+        if (!readMember(depth) || !nextOrClose('}', closed)) {
             return false;
         }
     }
-    return buildDictionary(members, item);
+    const bool isBuilt = buildDictionary(std::span(members_).subspan(first), item);
+    members_.resize(first);
+    return isBuilt;
 }
 
-bool Reader::readMember(std::vector<Member>& members, int depth) {
+bool Reader::readMember(int depth) {
     skipSpace();
     if (peek() != '"') {
         return fail(formatted("a key in quotes is expected, not {}", found()));
@@ -434,11 +445,31 @@ bool Reader::readMember(std::vector<Member>& members, int depth) {
     if (!readItem(member.item, depth)) {
         return false;
     }
-    members.push_back(std::move(member));
+    members_.push_back(std::move(member));
     return true;
 }
 
-bool Reader::buildDictionary(std::vector<Member>& members, Item& item) {
+bool Reader::buildDictionary(std::span<Member> members, Item& item) {
+    keys_.clear();
+    values_.clear();
+    for (Member& member : members) {
+        if (!member.item) {
+            return buildDictionarySorted(members, item);
+        }
+        keys_.push_back(member.key);
+        values_.push_back(*member.item);
+    }
+    Dictionary dictionary;
+    if (!keys_.empty() &&
+        keySets_.makeDictionary(keys_, values_, 0, dictionary) != KeySetCache::Fault::none) {
+        return buildDictionarySorted(members, item);
+    }
+    item.emplace(std::move(dictionary));
+    return true;
+}
+
+/// For objects with members that are null, or with a key that stands twice.
+bool Reader::buildDictionarySorted(std::span<Member> members, Item& item) {
     std::sort(members.begin(), members.end(), [](const Member& a, const Member& b) {
         const int order = a.key.compare(b.key);
         return order != 0 ? order < 0 : a.offset < b.offset;

@@ -7,7 +7,9 @@
 #include "util/Log.h"
 
 #include <algorithm>
+#include <cstddef>
 #include <cstdint>
+#include <iterator>
 #include <mutex>
 #include <numeric>
 #include <utility>
@@ -212,7 +214,9 @@ void ZRReportingDriverUtility::sendDriverLogsForSession(const std::shared_ptr<ZR
 
 std::string ZRReportingDriverUtility::getDriverStatsKey(const ChanlogChannel& channel,
                                                         std::string_view type) {
+    constexpr std::size_t kUsualLength = 120;
     std::string key;
+    key.reserve(kUsualLength);
     const auto add = [&key](std::string_view name) {
         std::copy_if(name.begin(), name.end(), std::back_inserter(key),
                      [](char character) { return character != '_' && character != ' '; });

@@ -111,8 +111,8 @@ void ChanlogPcmStreams::list(StructuredLog& log) {
     }
     if (streams_.size() > kMaximumStreams) {
         log.report(LogLevel::error, kLogCategory,
-                   formatted("{}/pcm: {} streams; those beyond {} are left out", soundDirectory_,
-                             streams_.size(), kMaximumStreams));
+                   formatted("{}/pcm: more than {} streams; the others are left out", soundDirectory_,
+                             kMaximumStreams));
         streams_.resize(kMaximumStreams);
     }
     listed_ = std::move(devices.text);

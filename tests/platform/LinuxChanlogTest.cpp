@@ -7,6 +7,8 @@
 
 #include <chrono>
 #include <filesystem>
+#include <fstream>
+#include <sstream>
 #include <string>
 #include <thread>
 #include <variant>
@@ -96,6 +98,17 @@ TEST_F(LinuxChanlogFilesTest, ChannelsAreReadAndSelected) {
     EXPECT_EQ(textOf(sample({"g", "s"})), "st,on:1:18446744073709551615:0.00");
     EXPECT_EQ(sample()->front()->unitLabel, "ms");
     EXPECT_EQ(sample()->front()->driverName, "d");
+    EXPECT_THAT(log.take(), IsEmpty());
+}
+
+TEST_F(LinuxChanlogFilesTest, TheFileOnThePageOfMessagesIsGood) {
+    std::ostringstream page;
+    page << std::ifstream(EXAMPLES_DIR "/../docs/messages.md").rdbuf();
+    const std::string text = page.str();
+    const std::size_t start = text.find("\n[{");
+    publish("a.json", text.substr(start, text.find("```", start) - start));
+    EXPECT_EQ(now(), "buffers_played=47 engine state,idle:1:180:0.00,running:1:70:0.00 "
+                     "wake up time,0-100:9,100-400:1,12..381");
     EXPECT_THAT(log.take(), IsEmpty());
 }
 
