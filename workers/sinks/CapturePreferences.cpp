@@ -4,6 +4,7 @@
 #include "platform/Platform.h"
 #include "util/Log.h"
 
+#include <algorithm>
 #include <map>
 #include <mutex>
 #include <string>
