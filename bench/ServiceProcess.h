@@ -21,7 +21,7 @@ public:
         std::string program;
         int processor = 0;
         /// The names of the analytics events in use, as a JSON array; all of them without it.
-        std::optional<std::string> eventsInUse;
+        std::optional<std::string> eventsInUse = std::nullopt;
         /// With everything on that an internal build can have, and some two hundred driver channels.
         bool isInternalBuild = false;
     };
