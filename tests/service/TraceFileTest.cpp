@@ -5,9 +5,7 @@
 #include <nlohmann/json.hpp>
 
 #include <map>
-#include <set>
 #include <string>
-#include <utility>
 
 #include <unistd.h>
 
@@ -36,26 +34,21 @@ TEST(TraceFile, OfASessionOnAnInternalBuild) {
     const pid_t servicePid = service.pid();
     ASSERT_EQ(service.stop(), 0);
 
-    std::set<std::string> reporters;
+    std::map<std::string, int> events;
     for (const auto& entry : std::filesystem::directory_iterator(directory)) {
         const Json file = Json::parse(readFile(entry.path()), nullptr, false);
         ASSERT_TRUE(file.is_object()) << entry.path() << readFile(entry.path());
-        reporters.insert(file.at("otherData").at("reporterID").dump());
-        if (file.at("otherData").at("reporterID") != 7) {
-            continue;
-        }
-        std::map<std::pair<pid_t, std::string>, int> events;
+        const std::string reporter = file.at("otherData").at("reporterID").dump();
         for (const Json& event : file.at("traceEvents")) {
-            ++events[{event.at("pid").get<pid_t>(), event.at("name").get<std::string>()}];
-        }
-        EXPECT_EQ((events[{::getpid(), "session"}]), 1);
-        EXPECT_EQ((events[{::getpid(), "output"}]), 1);
-        for (const pid_t pid : {::getpid(), servicePid}) {
-            EXPECT_GE((events[{pid, "memory (bytes)"}]), 2);
-            EXPECT_GE((events[{pid, "processor time (% of a core)"}]), 1);
+            const bool isService = event.at("pid") == servicePid;
+            ++events[reporter + (isService ? " service " : " client ") + event.at("name").get<std::string>()];
         }
     }
-    EXPECT_EQ(reporters, (std::set<std::string>{"7", "8"}));
+    EXPECT_EQ(events["7 client session"], 1);
+    EXPECT_EQ(events["7 client output"], 1);
+    EXPECT_GE(events["7 client memory (bytes)"], 2);
+    EXPECT_GE(events["7 service processor time (% of a core)"], 1);
+    EXPECT_EQ(events["8 client session"], 1);
 }
 
 } // namespace

@@ -114,12 +114,7 @@ protected:
         const auto value = device.preferences.copyPreferenceValue("registered", kDomain);
         return value ? jsonText(*value) : "";
     }
-    [[nodiscard]] std::size_t errors() const {
-        const auto lines = device.log.lines();
-        return static_cast<std::size_t>(std::count_if(lines.begin(), lines.end(), [](const auto& line) {
-            return line.category == "zrrz" && line.level == LogLevel::error;
-        }));
-    }
+    [[nodiscard]] std::size_t errors() const { return device.log.count(kDomain); }
 
     static constexpr const char* kDomain = "com.vandra.tamblo.accessories";
     FakePlatform device{LogLevel::info};
