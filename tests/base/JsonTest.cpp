@@ -181,6 +181,7 @@ TEST(JsonReader, SaysWhatIsWrongAndWhere) {
         {R"("\u12g4")", 1, 4, "hexadecimal"},
         {R"("\u12)", 1, 4, "hexadecimal"},
         {R"("\ud800")", 1, 2, "surrogate"},
+        {R"("\udc00\udc00")", 1, 2, "surrogate"},
         {R"("\ud800\ud800")", 1, 2, "surrogate"},
         {R"("\ud800\u0041")", 1, 2, "surrogate"},
         {"[\"\xC0\x80\"]", 1, 2, "UTF-8"},

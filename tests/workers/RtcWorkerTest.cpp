@@ -318,7 +318,10 @@ TEST(LinkmeterSummaryTest, ValuesAreTextsInTheOrderOfTheMessages) {
         record({{"a", "x"}, {"b", 0.5F}, {"ZR_Session_Summary_Event", "mine"}}),
         record({{"a", "y,z"}, {"b", std::nan("")}, {"d", Value::date(0)}}),
         record({{"a", Dictionary{{"k", 1}}}, {"b", ~0ULL}, {"c", Value::data({})}}),
+        record({{"a", "a repeat"}}),
+        messageOf({{"a", "before the start"}}),
     };
+    messages[5]->isRedundant = true;
     EXPECT_EQ(linkmeterSummary(messages, AudioServiceTypeUnknown),
               (Dictionary{{"a", R"(,x,y,z,{"k":1})"},
                           {"b", "true,0.5,null,18446744073709551615"},
