@@ -5,7 +5,6 @@
 #include <gmock/gmock.h>
 
 #include <chrono>
-#include <future>
 #include <thread>
 
 #include <signal.h>
@@ -133,37 +132,6 @@ TEST_F(ProcessFilesTest, MemoryIsInBytesAndOnlyOfThoseThatHaveAny) {
                 ElementsAre(1024, 2048, 3072, 4096, 5120, 6144, 7168));
 }
 
-/// A process of its own that waits on a pipe until it is told to end.
-class BlockedProcess {
-public:
-    BlockedProcess() {
-        EXPECT_EQ(::pipe(pipe_), 0);
-        pid_ = ::fork();
-        if (pid_ == 0) {
-            char byte = 0;
-            ::close(pipe_[1]);
-            ::_exit(::read(pipe_[0], &byte, 1) == 0 ? 0 : 1);
-        }
-        ::close(pipe_[0]);
-    }
-    ~BlockedProcess() { await(); }
-    BlockedProcess(const BlockedProcess&) = delete;
-    BlockedProcess& operator=(const BlockedProcess&) = delete;
-
-    void end() { ::close(std::exchange(pipe_[1], -1)); }
-    void await() {
-        if (pipe_[1] >= 0) {
-            end();
-        }
-        ::waitpid(pid_, nullptr, 0);
-    }
-    [[nodiscard]] pid_t pid() const noexcept { return pid_; }
-
-private:
-    int pipe_[2] = {-1, -1};
-    pid_t pid_ = -1;
-};
-
 /// Its state once it is this one, or after a few seconds.
 ProcessFiles::ThreadSample awaitState(const ProcessFiles& files, pid_t pid, char state) {
     auto sample = files.sampleThread(pid, pid);
@@ -176,42 +144,33 @@ ProcessFiles::ThreadSample awaitState(const ProcessFiles& files, pid_t pid, char
 
 TEST(ProcessFilesOfTheKernel, FollowAProcessFromItsWaitToItsEnd) {
     const ProcessFiles files;
-    BlockedProcess child;
-    const auto waiting = awaitState(files, child.pid(), 'S');
+    int ends[2];
+    ASSERT_EQ(::pipe(ends), 0);
+    const pid_t child = ::fork();
+    if (child == 0) {
+        char byte = 0;
+        ::close(ends[1]);
+        ::_exit(static_cast<int>(::read(ends[0], &byte, 1)));
+    }
+    const auto waiting = awaitState(files, child, 'S');
     EXPECT_EQ(waiting.state, "S (sleeping)");
     EXPECT_THAT(waiting.waitChannel.value_or("pipe_read"), HasSubstr("pipe_read"));
     if (waiting.kernelStack) {
         EXPECT_THAT(*waiting.kernelStack, testing::Contains(HasSubstr("pipe_read+0x")));
     }
-    EXPECT_THAT(files.threads(child.pid()), ElementsAre(child.pid()));
-    EXPECT_EQ(files.threadName(child.pid(), child.pid()), files.name(::getpid()));
-    EXPECT_GT(LinuxProcessSampling().sample(child.pid()).value_or(ProcessSample()).residentBytes, 0U);
-    EXPECT_TRUE(files.memory(child.pid()));
+    EXPECT_THAT(files.threads(child), ElementsAre(child));
+    EXPECT_EQ(files.threadName(child, child), files.name(::getpid()));
+    const auto sample = LinuxProcessSampling().sample(child);
+    const auto memory = files.memory(child);
+    EXPECT_TRUE(sample && sample->residentBytes > 0 && sample->threads == 1);
+    EXPECT_TRUE(memory && memory->anonymous + memory->file + memory->shared == memory->resident);
 
-    child.end();
-    EXPECT_EQ(awaitState(files, child.pid(), 'Z').state, "Z (zombie)");
-    EXPECT_FALSE(files.memory(child.pid()));
-    child.await();
-    EXPECT_FALSE(files.sampleThread(child.pid(), child.pid()));
-    EXPECT_FALSE(files.sample(child.pid()));
-    EXPECT_FALSE(files.name(child.pid()));
-}
-
-TEST(ProcessFilesOfTheKernel, TheFiguresOfThisProcessAgreeWithItsOwn) {
-    const ProcessFiles files;
-    std::promise<void> isOver;
-    std::thread further([over = isOver.get_future()] { over.wait(); });
-    const auto sample = files.sample(::getpid());
-    const auto memory = files.memory(::getpid());
-    EXPECT_THAT(files.threads(::getpid()), SizeIs(testing::Ge(2U)));
-    isOver.set_value();
-    further.join();
-    ASSERT_TRUE(sample && memory);
-    EXPECT_GE(sample->threads, 2U);
-    EXPECT_EQ(memory->threads, sample->threads);
-    EXPECT_GT(sample->voluntarySwitches + sample->involuntarySwitches, 0U);
-    EXPECT_GE(memory->peakResident, memory->resident);
-    EXPECT_EQ(memory->anonymous + memory->file + memory->shared, memory->resident);
+    ::close(ends[0]);
+    ::close(ends[1]);
+    EXPECT_EQ(awaitState(files, child, 'Z').state, "Z (zombie)");
+    EXPECT_FALSE(files.memory(child));
+    ::waitpid(child, nullptr, 0);
+    EXPECT_FALSE(files.sampleThread(child, child) || files.sample(child) || files.name(child));
 }
 
 } // namespace

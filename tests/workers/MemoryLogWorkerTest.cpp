@@ -49,10 +49,13 @@ TEST(ProcessListTest, TakesWhatIsAProcessOnceAndUpToItsLimit) {
 
 class MemoryLogWorkerTest : public testing::Test {
 protected:
+    static MessageRef messageOf(AudioEventType type) {
+        return std::make_shared<ZRReportingSessionMessage>(Dictionary{{"processIDs", 7}}, 4, type);
+    }
     /// Whether a message of this type is recorded.
-    bool records(AudioEventType type = AudioEventTypeMemoryLog, const Dictionary& payload = {}) {
+    bool records(AudioEventType type) {
         const std::size_t before = device.memoryLog.requests.size();
-        worker.handleMessage(std::make_shared<ZRReportingSessionMessage>(payload, 4, type));
+        worker.handleMessage(messageOf(type));
         return device.memoryLog.requests.size() != before;
     }
 
@@ -69,34 +72,28 @@ TEST_F(MemoryLogWorkerTest, ASecondPassesBetweenRecordsUnlessTheClockIsSetBack) 
                  {-1h, true}, {999ms, false}, {-1ns, false},     {-2s, true}, {1h, true}};
     for (const auto& row : cases) {
         device.clock.advance(row.step);
-        EXPECT_EQ(records(), row.isRecorded) << row.step.count() << " " << device.clock.seconds();
+        EXPECT_EQ(records(AudioEventTypeMemoryLog), row.isRecorded)
+            << row.step.count() << " " << device.clock.seconds();
     }
 }
 
-TEST_F(MemoryLogWorkerTest, ARecordNamesTheSessionsProcessesAndThoseOfThePayload) {
-    EXPECT_TRUE(worker.handleRedundantMessages());
-    EXPECT_TRUE(records(AudioEventTypeMemoryLog, {{"processIDs", Array{7, 41}}}));
-    EXPECT_EQ(device.memoryLog.requests.back().reporterID, 5);
-    EXPECT_THAT(device.memoryLog.requests.back().processes, ElementsAre(41, 7));
-    device.clock.advance(1s);
-    session.reset();
-    EXPECT_FALSE(records());
-}
-
-TEST_F(MemoryLogWorkerTest, RepeatsReachItThroughItsSessionStartedOrNot) {
-    for (int i = 0; i < 3; ++i) {
-        session->sendMessage(
-            std::make_shared<ZRReportingSessionMessage>(Dictionary{{"a", 1}}, 4, AudioEventTypeMemoryLog));
+TEST_F(MemoryLogWorkerTest, TheSessionsOwnTakesRepeatsAndNamesItsProcesses) {
+    for (int i = 0; i < 2; ++i) {
+        session->sendMessage(std::make_shared<ZRReportingSessionMessage>(
+            Dictionary{{"processIDs", Array{7, 41}}}, 4, AudioEventTypeMemoryLog));
         device.clock.advance(1s);
     }
-    EXPECT_THAT(device.memoryLog.requests, SizeIs(3));
+    ASSERT_THAT(device.memoryLog.requests, SizeIs(2));
+    EXPECT_EQ(device.memoryLog.requests.back().reporterID, 5);
+    EXPECT_THAT(device.memoryLog.requests.back().processes, ElementsAre(41, 7));
+    session.reset();
+    EXPECT_FALSE(records(AudioEventTypeMemoryLog));
 }
 
 TEST_F(MemoryLogWorkerTest, OtherMessagesCostNothing) {
     constexpr AudioEventType others[] = {0, 18, 20, 19 + 256, 65535};
     for (const AudioEventType type : others) {
-        const auto message =
-            std::make_shared<ZRReportingSessionMessage>(Dictionary{{"processIDs", 7}}, 4, type);
+        const auto message = messageOf(type);
         EXPECT_EQ(test::allocationsOf([&] { worker.handleMessage(message); }).blocks, 0U);
     }
     worker.handleMessage(nullptr);
