@@ -96,11 +96,11 @@ bool LinuxBugCaptureService::request(CaptureRequest request, const GlarnReporter
     }
     request.identifier = CaptureFolders::identifier(request.time, ++lastNumber_);
     const auto kept = std::make_shared<const CaptureRequest>(std::move(request));
-    appendRequest(*kept);
     queue().post([this] { folders_.keep(kAllowanceFile, allowance_.text()); }, Pace::mayBlock);
     if (kept->duration.count() == 0) {
         gatherLater(kept);
     } else {
+        appendRequest(*kept);
         run(kept);
     }
     reply({{glarn::kReplySuccess, true}, {glarn::kReplySessionID, kept->identifier}});
@@ -179,7 +179,11 @@ void LinuxBugCaptureService::gather(const CaptureRequest& request) {
     std::vector<CaptureFile> files = content_.gather(request, now);
     files.push_back({"log.txt", log_.lastLines()});
     folders_.store(request.identifier, files, now);
-    append("end", request.identifier);
+    if (request.duration.count() == 0) {
+        appendRequest(request);
+    } else {
+        append("end", request.identifier);
+    }
     file_.flush();
 }
 

@@ -26,10 +26,10 @@ namespace tamblo {
 ///     {"time":…,"op":"start","session":"20260301T…","signature":{…},"duration":60.0,"payload":{}}
 ///     {"time":…,"op":"end","session":"20260301T…"}
 ///
-/// The line of a request is appended at once; what a capture is made of is gathered on a queue of the
-/// service's own, when the duration is over, and "end" is written once the folder is complete, or could not
-/// be. A capture that is cancelled before, or still runs when the service ends, has "cancel" instead and no
-/// folder.
+/// What a capture is made of is gathered on a queue of the service's own. A snapshot without a duration is
+/// one line, written once its folder is complete, or could not be. A capture with one has its line at once,
+/// and "end" when the duration is over and the folder is complete; one that is cancelled before, or still
+/// runs when the service ends, has "cancel" instead and no folder.
 class LinuxBugCaptureService final : public BugCaptureService {
 public:
     /// A capture that runs longer tells nothing about what it was begun for; requests for one are refused.
