@@ -16,8 +16,8 @@ public:
     /// The value that is stored now, or nothing.
     [[nodiscard]] virtual std::optional<Value> copyPreferenceValue(std::string_view key,
                                                                    std::string_view domain) const = 0;
-    /// Stores a value at once and for good, beside the others of the domain; answers what went wrong, or
-    /// nothing. This process reads the new value in either case.
+    /// Stores a value beside the others of the domain: other processes read it, and it outlives this one,
+    /// from now on. Answers what went wrong, or nothing. This process reads the new value in either case.
     [[nodiscard]] virtual std::optional<std::string>
     setPreferenceValue(std::string_view key, std::string_view domain, const Value& value) = 0;
 };

@@ -51,31 +51,24 @@ bool writeFully(int descriptor, std::string_view content) {
     return true;
 }
 
-bool fill(int descriptor, std::string_view content, const std::string& replaced, Durability durability) {
+bool fill(int descriptor, std::string_view content, const std::string& replaced) {
     struct stat status {};
     const bool modeIsRight = ::lstat(replaced.c_str(), &status) != 0 || !S_ISREG(status.st_mode) ||
                              ::fchmod(descriptor, status.st_mode & kPermissions) == 0;
-    return modeIsRight && writeFully(descriptor, content) &&
-           (durability != Durability::onDisk || ::fsync(descriptor) == 0);
-}
-
-bool syncDirectory(const std::string& path) {
-    const FileDescriptor directory(::open(path.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
-    return directory.isOpen() && ::fsync(directory.get()) == 0;
+    return modeIsRight && writeFully(descriptor, content);
 }
 
 } // namespace
 
-int replaceFileAtomically(const std::string& path, std::string_view content, Durability durability) {
-    const std::size_t slash = path.find_last_of('/');
-    const std::string directory = slash == std::string::npos ? "." : path.substr(0, slash + 1);
-    const std::string temporary = formatted("{}/{}", directory, temporaryName());
+int replaceFileAtomically(const std::string& path, std::string_view content) {
+    // No slash: a name of the working directory.
+    const std::string temporary = path.substr(0, path.find_last_of('/') + 1) + temporaryName();
     {
         const FileDescriptor file = createAnew(temporary);
         if (!file.isOpen()) {
             return errno;
         }
-        if (!fill(file.get(), content, path, durability)) {
+        if (!fill(file.get(), content, path)) {
             const int failure = errno;
             ::unlink(temporary.c_str());
             return failure;
@@ -86,7 +79,7 @@ int replaceFileAtomically(const std::string& path, std::string_view content, Dur
         ::unlink(temporary.c_str());
         return failure;
     }
-    return durability != Durability::onDisk || syncDirectory(directory) ? 0 : errno;
+    return 0;
 }
 
 } // namespace tamblo

@@ -99,8 +99,7 @@ void CaptureFolders::store(std::string_view identifier, std::span<const CaptureF
 void CaptureFolders::keep(std::string_view name, std::string_view text) {
     std::string problem = makeDirectory();
     if (problem.empty()) {
-        const int error =
-            replaceFileAtomically(formatted("{}/{}", directory_, name), text, Durability::untilPowerLoss);
+        const int error = replaceFileAtomically(formatted("{}/{}", directory_, name), text);
         problem = error != 0 ? failure("write", name, error) : "";
     }
     // A small file may still have room where a folder has none: only that ends an outage.
@@ -129,8 +128,7 @@ std::string CaptureFolders::write(std::string_view identifier, std::span<const C
         return failure("make", name, errno);
     }
     for (const CaptureFile& file : files) {
-        const int error = replaceFileAtomically(formatted("{}/{}", folder, file.name), file.text,
-                                                Durability::untilPowerLoss);
+        const int error = replaceFileAtomically(formatted("{}/{}", folder, file.name), file.text);
         if (error != 0) {
             problem = failure("write", file.name, error);
             break;

@@ -133,8 +133,7 @@ int LinuxNamedNotifications::PostNamedNotification(std::string_view name) {
         const SmallFile file = SmallFile::read(path, kMaximumFile, SmallFile::Links::refused);
         // Content that is no word cannot be lost.
         const bool mayWrite = file.error == 0 || file.error == ENOENT || file.error == EFBIG;
-        status = mayWrite ? replaceFileAtomically(path, formatted("{}\n", parseState(file.trimmed()).word),
-                                                  Durability::untilPowerLoss)
+        status = mayWrite ? replaceFileAtomically(path, formatted("{}\n", parseState(file.trimmed()).word))
                           : file.error;
     }
     reportNotPosted(name, status);

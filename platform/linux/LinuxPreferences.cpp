@@ -49,7 +49,7 @@ std::optional<std::string> store(const std::string& path, std::string_view key, 
     }
     Dictionary& values = std::get<Dictionary>(content);
     values.set(key, value);
-    const int failure = replaceFileAtomically(path, jsonText(values) + "\n", Durability::onDisk);
+    const int failure = replaceFileAtomically(path, jsonText(values) + "\n");
     return failure != 0 ? std::optional(formatted("{}: {}", path, std::generic_category().message(failure)))
                         : std::nullopt;
 }
@@ -105,11 +105,11 @@ std::optional<std::string> LinuxPreferences::setPreferenceValue(std::string_view
     if (!isDomainName(domain)) {
         return formatted("\"{}\" is no preferences domain", domain);
     }
-    const std::lock_guard storing(storing_);
-    // Without the other lock, which nobody holds for as long as a disk may take.
-    const std::optional<std::string> failure = store(path(domain), key, value);
+    std::optional<std::string> failure;
     {
+        // From before the file is read, so that no value stored meanwhile is lost.
         const std::lock_guard lock(mutex_);
+        failure = store(path(domain), key, value);
         Domain& entry = domainNamed(domain);
         if (failure) {
             entry.unstored.set(key, value);

@@ -18,9 +18,9 @@ namespace tamblo {
 
 /// Preferences as files: `<directory>/<domain>.json` holds one object, the domain's values by key.
 ///
-/// A value is stored by reading the file anew, replacing it with one that differs in that value and waiting
-/// for the disk. A file that is there and cannot be read as an object is somebody's mistake and is left as it
-/// is. What could not be stored is read back by this process all the same, until the file changes.
+/// A value is stored by reading the file anew and replacing it with one that differs in that value; the disk
+/// is not waited for. A file that is there and cannot be read as an object is somebody's mistake and is left
+/// as it is. What could not be stored is read back by this process all the same, until the file changes.
 ///
 /// A file is read when its domain is first asked for and kept until it changes. Changes are told by the
 /// kernel: the event loop calls `readChanges` when the descriptor is readable, before it handles the sockets
@@ -72,8 +72,6 @@ private:
     /// Used by `readChanges` alone.
     DirectoryWatcher watcher_;
     int reportedError_ = 0;
-    /// Held while a value is stored, so that no other one is lost; taken before `mutex_`.
-    std::mutex storing_;
     mutable std::mutex mutex_;
     mutable std::map<std::string, Domain, std::less<>> domains_; ///< guarded by `mutex_`
 };

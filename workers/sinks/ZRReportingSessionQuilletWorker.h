@@ -16,7 +16,7 @@ namespace tamblo {
 ///
 /// A session's first message arms the worker: it looks at messages from five seconds after that one on. The
 /// period begins when a message is of interest, before the draft is asked for, so that one that fails is not
-/// asked for again. Beginning it waits for the disk, once a period.
+/// asked for again.
 class ZRReportingSessionQuilletWorker final : public ZRReportingSessionWorkerConsumerProtocol {
 public:
     ZRReportingSessionQuilletWorker(std::weak_ptr<ZRReportingSession> session, PreferencesSuite defaults,
