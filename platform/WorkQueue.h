@@ -30,6 +30,9 @@ public:
     /// Called after each run of pieces, on the thread that ran them, before others run. Set before the first
     /// post.
     virtual void setBatchEnd(Work batchEnd) = 0;
+    /// Whether from now on every piece may block, whatever it was posted as. From the queue's own work only,
+    /// so that no piece slips through in between.
+    virtual void setMayBlock(bool mayBlock) = 0;
     [[nodiscard]] virtual std::string_view label() const noexcept = 0;
 };
 

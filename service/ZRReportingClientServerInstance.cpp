@@ -170,7 +170,7 @@ void ZRReportingClientServerInstance::sendMessage(Dictionary message, std::uint3
     };
     static_assert(sizeof(piece) + sizeof(ClientRef) <= kWorkInlineBytes,
                   "a queued message allocates nothing");
-    onServerQueue(paceOfMessages(), std::move(piece));
+    onServerQueue(Pace::quick, std::move(piece));
 }
 
 void ZRReportingClientServerInstance::performSend(Dictionary message, std::uint32_t category,

@@ -12,7 +12,6 @@ namespace {
 
 constinit std::atomic<SerialQueue*> serverQueue{nullptr};
 constinit std::mutex creation;
-constinit std::atomic<Pace> messagePace{Pace::quick};
 
 SerialQueue& createServerQueue() {
     const std::lock_guard lock(creation);
@@ -33,15 +32,6 @@ SerialQueue& ZRReportingUtilityGetReportingServerQueue() {
 
 void resetReportingServerQueue() {
     const std::unique_ptr<SerialQueue> dropped(serverQueue.exchange(nullptr, std::memory_order_acq_rel));
-    setMessagesMayBlock(false);
-}
-
-Pace paceOfMessages() noexcept {
-    return messagePace.load(std::memory_order_relaxed);
-}
-
-void setMessagesMayBlock(bool mayBlock) noexcept {
-    messagePace.store(mayBlock ? Pace::mayBlock : Pace::quick, std::memory_order_relaxed);
 }
 
 } // namespace tamblo

@@ -74,7 +74,7 @@ bool Strand::takeBatch() {
 void Strand::runBatch(bool stopAtBlocking) {
     while (next_ != batch_.size()) {
         Item& item = batch_[next_];
-        if (stopAtBlocking && item.pace == Pace::mayBlock) {
+        if (stopAtBlocking && (mayBlock_ || item.pace == Pace::mayBlock)) {
             break;
         }
         item.work();

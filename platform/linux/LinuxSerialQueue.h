@@ -47,6 +47,7 @@ public:
 
     void post(Work work, Pace pace);
     void setBatchEnd(Work batchEnd) { batchEnd_ = std::move(batchEnd); }
+    void setMayBlock(bool mayBlock) noexcept { mayBlock_ = mayBlock; }
 
 private:
     friend class InlineDrain;
@@ -70,6 +71,7 @@ private:
     std::vector<Item> batch_;
     std::size_t next_ = 0;
     Time inlineAllowedFrom_{};
+    bool mayBlock_ = false;
 
     std::mutex mutex_; ///< guards what follows
     std::vector<Item> pending_;
@@ -84,6 +86,7 @@ public:
 
     void post(Work work, Pace pace) override { strand_->post(std::move(work), pace); }
     void setBatchEnd(Work batchEnd) override { strand_->setBatchEnd(std::move(batchEnd)); }
+    void setMayBlock(bool mayBlock) override { strand_->setMayBlock(mayBlock); }
     [[nodiscard]] std::string_view label() const noexcept override { return label_; }
 
 private:

@@ -44,12 +44,15 @@ public:
 
     void post(Work work, Pace pace) override { strand_->post(std::move(work), pace); }
     void setBatchEnd(Work batchEnd) override { strand_->setBatchEnd(std::move(batchEnd)); }
+    void setMayBlock(bool mayBlockNow) override { mayBlock = mayBlockNow; }
     [[nodiscard]] std::string_view label() const noexcept override { return label_; }
 
     std::size_t runAll() { return strand_->runAll(); }
     bool runOne() { return strand_->runOne(); }
     /// The pace of each piece that was posted since the last call.
     [[nodiscard]] std::vector<Pace> takePaces() { return strand_->takePaces(); }
+
+    bool mayBlock = false;
 
 private:
     const std::string label_;

@@ -100,11 +100,19 @@ TEST(SerialQueue, WorkThatMayBlockLeavesThePosterAndTakesWhatFollowsAlong) {
         mayGoOn.count_down();
     }
     settle(*queue);
-    EXPECT_EQ(trace, "abc");
+    {
+        // So does quick work where any may block, even what was posted before that was said.
+        InlineDrain drain;
+        queue->post([&] { queue->setMayBlock(true); });
+        queue->post(step('d'));
+    }
+    settle(*queue);
+    EXPECT_EQ(trace, "abcd");
     const std::thread::id me = std::this_thread::get_id();
     EXPECT_EQ(threads[0], me);
     EXPECT_NE(threads[1], me);
     EXPECT_NE(threads[2], me);
+    EXPECT_NE(threads[3], me);
 }
 
 TEST(SerialQueue, ManyQueuesShareFewThreadsThatGrowWhileWorkBlocks) {

@@ -79,7 +79,7 @@ ZRReportingSessionDPWorker::initWithSession(const std::shared_ptr<ZRReportingSes
     runTime.minimumBufferSize = bufferSize != 0 ? bufferSize : kUsualBufferSize;
     runTime.minimumCycle = getRunTimeDefaults("io_cycle");
     runTime.waitTime = waitTimeOf(getDoubleRunTimeDefaults("wait_time"));
-    setMessagesMayBlock(runTime.waitTime.count() != 0);
+    ZRReportingUtilityGetReportingServerQueue().setMayBlock(runTime.waitTime.count() != 0);
     return std::make_shared<ZRReportingSessionDPWorker>(session);
 }
 

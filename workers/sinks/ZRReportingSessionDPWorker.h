@@ -14,8 +14,8 @@ namespace tamblo {
 /// enough, and more than ten seconds after the last one that this worker had captured.
 ///
 /// What is large enough, and how long to wait before the capture, are preferences, which the making of each
-/// worker reads for all of them. The wait holds up the reporting server queue; where there is one, messages
-/// are posted as work that may block.
+/// worker reads for all of them. The wait holds up the reporting server queue; where there is one, the
+/// queue's work may block.
 class ZRReportingSessionDPWorker final : public ZRReportingSessionWorkerConsumerProtocol {
 public:
     using ZRReportingSessionWorkerConsumerProtocol::ZRReportingSessionWorkerConsumerProtocol;
