@@ -1,6 +1,5 @@
 #include "platform/linux/Directories.h"
 #include "platform/linux/LinuxAnalyticsEventService.h"
-#include "platform/linux/LinuxBugReportDrafting.h"
 #include "platform/linux/LinuxClock.h"
 #include "platform/linux/LinuxDeviceProperties.h"
 #include "platform/linux/LinuxPreferences.h"
@@ -477,38 +476,6 @@ TEST(LinuxProcessInformationTest, NamesLivingProcessesInUtf8) {
                                         "b\xC3";
     EXPECT_EQ(information.ProcessNameForPid(::getpid()), "a?b?");
     std::ofstream("/proc/self/comm") << comm;
-}
-
-TEST(LinuxBugReportDraftingTest, ADraftIsALineInTheOrderOfItsFields) {
-    const TemporaryDirectory directory;
-    RecordingLog log;
-    const LinuxClock clock;
-    LinuxBugReportDrafting drafting(directory.path(), clock, log);
-    int completions = 0;
-    const BugReportDraft draft{.title = "a \"b\"",
-                               .problemDescription = "c\nd",
-                               .component = {"n", "All", -5},
-                               .reproducibility = 6,
-                               .classification = 7,
-                               .diagnosticExtensions = {"x", "y\\"}};
-    drafting.createDraft(draft, "caller", "why",
-                         [&](const std::optional<std::string>& error) { completions += error ? 100 : 1; });
-    drafting.createDraft({}, "", "", {});
-    drafting.flush();
-    EXPECT_EQ(completions, 1);
-    constexpr const char* begin = R"(\{"time":[0-9]{10}\.[0-9]+,"process":)";
-    EXPECT_THAT(directory.read("bug-report-drafts.jsonl"),
-                testing::MatchesRegex(
-                    std::string(begin) +
-                    R"("caller","reason":"why","draft":\{"title":"a \\"b\\"","problemDescription":"c\\nd",)"
-                    R"("component":\{"name":"n","version":"All","identifier":-5\},"reproducibility":6,)"
-                    R"("classification":7,"diagnosticExtensions":\["x","y\\\\"\]\}\})"
-                    "\n" +
-                    begin +
-                    R"("","reason":"","draft":\{"title":"","problemDescription":"",)"
-                    R"("component":\{"name":"","version":"","identifier":0\},"reproducibility":0,)"
-                    R"("classification":0,"diagnosticExtensions":\[\]\}\})"
-                    "\n"));
 }
 
 } // namespace

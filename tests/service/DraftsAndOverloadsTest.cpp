@@ -25,7 +25,7 @@ protected:
         service.start();
     }
 
-    ServiceProcess service;
+    ServiceProcess service{{.environment = {{"TAMBLO_LOG", "info"}}}};
 };
 
 TEST_F(DraftsAndOverloads, ADraftIsALineAndItsTimeAPreference) {
@@ -44,13 +44,17 @@ TEST_F(DraftsAndOverloads, ADraftIsALineAndItsTimeAPreference) {
     send(client, 5.1);
     const std::string line = readFile(drafts);
     EXPECT_THAT(
-        line, MatchesRegex(
-                  R"(\{"time":[0-9]{10}\.[0-9]+,"process":"tamblo_service_","reason":"a Talvix spatial )"
-                  R"(positioning error occurred","draft":\{"title":"Invalid x/y coordinates during a Talvix )"
-                  R"(call .QLT.","problemDescription":"Invalid coordinates were provided [^"]*","component":)"
-                  R"(\{"name":"[^"]+","version":"All","identifier":[0-9]+\},"reproducibility":6,)"
-                  R"("classification":7,"diagnosticExtensions":\["[^"]+"\]\}\})"
-                  "\n"));
+        line,
+        MatchesRegex(
+            R"(\{"time":[0-9]{10}\.[0-9]+,"process":"tamblo_service_","reason":"a Talvix spatial )"
+            R"(positioning error occurred","draft":\{"title":"Invalid x/y coordinates during a Talvix )"
+            R"(call .QLT.","problemDescription":"Invalid coordinates were provided to the audio layer during a Talvix )"
+            R"(call, making it impossible to render spatial audio correctly. Filing this tiklet will )"
+            R"(help determine what went wrong.","component":)"
+            R"(\{"name":"[^"]+","version":"All","identifier":[0-9]+\},"reproducibility":6,)"
+            R"("classification":7,"diagnosticExtensions":\["[^"]+"\]\}\})"
+            "\n"));
+    EXPECT_TRUE(service.awaitErrorOutput("Successfully created draft"));
     EXPECT_THAT(readFile(service.preferenceFile(kDomain)),
                 MatchesRegex(R"(\{"TalvixInvalidXyBackOffSeconds":3600,"TalvixInvalidXyQLTlastRun":)"
                              R"([0-9]{10}\.[0-9]+,"other":\[1\]\})"
