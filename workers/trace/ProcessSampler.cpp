@@ -4,12 +4,27 @@
 #include "util/Log.h"
 
 #include <algorithm>
+#include <atomic>
 #include <optional>
 #include <utility>
 
 namespace tamblo {
 
 namespace {
+
+constinit std::atomic<std::size_t> placesTaken{0};
+constinit std::atomic<bool> isFullTold{false};
+
+/// One of the places for samples in memory.
+struct Place {
+    Place() noexcept { ++placesTaken; }
+    ~Place() {
+        --placesTaken;
+        isFullTold = false;
+    }
+    Place(const Place&) = delete;
+    Place& operator=(const Place&) = delete;
+};
 
 /// What a tick has found out so far.
 class Found {
@@ -36,7 +51,7 @@ std::shared_ptr<ProcessSampler> ProcessSampler::shared() {
     const std::lock_guard lock(mutex);
     std::shared_ptr<ProcessSampler> sampler = current.lock();
     if (sampler == nullptr) {
-        sampler = std::make_shared<ProcessSampler>(Shared());
+        sampler.reset(new ProcessSampler);
         current = sampler;
     }
     return sampler;
@@ -48,20 +63,20 @@ std::unique_ptr<ProcessSampler::Recording> ProcessSampler::record(std::span<cons
     return samples != nullptr ? std::make_unique<Recording>(sampler, std::move(samples)) : nullptr;
 }
 
-ProcessSampler::ProcessSampler(Shared)
-    : queue_(platform().workQueues.makeSerialQueue("com.vandra.tamblo.trace")) {}
+ProcessSampler::ProcessSampler() : queue_(platform().workQueues.makeSerialQueue("com.vandra.tamblo.trace")) {}
 
 std::shared_ptr<SampleRecording> ProcessSampler::begin(std::span<const pid_t> processes) {
     const std::lock_guard lock(mutex_);
-    if (recordings_.size() >= kMostRecordings) {
-        if (!std::exchange(isFullTold_, true)) {
+    if (placesTaken >= kMostRecordings) {
+        if (!isFullTold.exchange(true)) {
             log::info(ZRReportingTraceCategory(),
-                      "{} sessions are traced already; further ones are not until one of them stops",
-                      recordings_.size());
+                      "{} sessions are traced already; further ones are not until one of their files is done",
+                      kMostRecordings);
         }
         return nullptr;
     }
-    auto recording = std::make_shared<SampleRecording>(processes, platform().clock.now());
+    auto recording =
+        std::make_shared<SampleRecording>(processes, platform().clock.now(), std::make_shared<const Place>());
     recordings_.push_back(recording);
     if (timer_ == nullptr) {
         timer_ = platform().workQueues.makeRepeatingTimer(kInterval, [sampler = weak_from_this()] {
@@ -79,7 +94,6 @@ void ProcessSampler::forget(const SampleRecording& recording) {
     {
         const std::lock_guard lock(mutex_);
         std::erase_if(recordings_, [&recording](const auto& known) { return known.get() == &recording; });
-        isFullTold_ = false;
         if (recordings_.empty()) {
             ended = std::move(timer_);
         }

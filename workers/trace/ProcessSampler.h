@@ -20,14 +20,11 @@ namespace tamblo {
 /// There is one while a session is traced, and none otherwise: a service that traces nothing makes no
 /// wake-up for it. The recordings own it together, and it goes with the last of them.
 class ProcessSampler : public std::enable_shared_from_this<ProcessSampler> {
-    struct Shared {
-        explicit Shared() = default;
-    };
-
 public:
     static constexpr std::chrono::milliseconds kInterval{100};
-    /// Sessions traced at a time: bounds the work of a tick, which reads a few of the kernel's files for each
-    /// process, and the memory of the samples, some 20 MiB at the very most.
+    /// Sessions traced at a time, with those whose samples still wait for a disk to take their file: bounds
+    /// the work of a tick, which reads two of the kernel's files for each process and one for each of its
+    /// threads, and the memory of the samples, some 20 MiB at the very most.
     static constexpr std::size_t kMostRecordings = 32;
 
     /// A recording that goes on until this is destroyed. Used by one thread at a time.
@@ -39,7 +36,7 @@ public:
         Recording(const Recording&) = delete;
         Recording& operator=(const Recording&) = delete;
 
-        /// What there is so far; nothing comes after it.
+        /// What there is so far; nothing comes after it. It counts as recorded for as long as it is held.
         [[nodiscard]] RecordedSamples take(WallTime now) { return samples_->take(now); }
         /// Does work that may wait for a disk, one piece after the other with that of other recordings.
         void runLater(Work work) { sampler_->queue_->post(std::move(work), Pace::mayBlock); }
@@ -53,11 +50,11 @@ public:
     /// thread, without waiting.
     [[nodiscard]] static std::unique_ptr<Recording> record(std::span<const pid_t> processes);
 
-    explicit ProcessSampler(Shared);
     ProcessSampler(const ProcessSampler&) = delete;
     ProcessSampler& operator=(const ProcessSampler&) = delete;
 
 private:
+    ProcessSampler();
     [[nodiscard]] static std::shared_ptr<ProcessSampler> shared();
     [[nodiscard]] std::shared_ptr<SampleRecording> begin(std::span<const pid_t> processes);
     void forget(const SampleRecording& recording);
@@ -67,7 +64,6 @@ private:
     std::mutex mutex_; ///< guards what follows
     std::unique_ptr<RepeatingTimer> timer_;
     std::vector<std::shared_ptr<SampleRecording>> recordings_;
-    bool isFullTold_ = false;
 };
 
 } // namespace tamblo

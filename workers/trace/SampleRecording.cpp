@@ -5,8 +5,11 @@
 
 namespace tamblo {
 
-SampleRecording::SampleRecording(std::span<const pid_t> processes, WallTime begin) : last_(begin) {
+SampleRecording::SampleRecording(std::span<const pid_t> processes, WallTime begin,
+                                 std::shared_ptr<const void> place)
+    : last_(begin) {
     recorded_.begin = begin;
+    recorded_.place = std::move(place);
     for (const pid_t pid : processes) {
         recorded_.processes.emplace_back().pid = pid;
     }

@@ -5,6 +5,7 @@
 
 #include <cstddef>
 #include <cstdint>
+#include <memory>
 #include <mutex>
 #include <optional>
 #include <span>
@@ -30,6 +31,7 @@ struct RecordedSamples {
     WallTime begin;
     WallTime end;
     std::vector<Process> processes;
+    std::shared_ptr<const void> place; ///< goes when these are let go: so many may be held at a time
 };
 
 /// The samples of one session's processes while it is traced. The sampler fills it on its thread, tick by
@@ -46,7 +48,8 @@ public:
     /// Samples of one process, some 300 KiB: seven minutes at ten a second before the first are dropped.
     static constexpr std::size_t kMostSamples = 4096;
 
-    SampleRecording(std::span<const pid_t> processes, WallTime begin);
+    SampleRecording(std::span<const pid_t> processes, WallTime begin,
+                    std::shared_ptr<const void> place = nullptr);
 
     /// Begins a tick: the processes to look at now, none when it is left out.
     [[nodiscard]] std::vector<pid_t> nextTick();
