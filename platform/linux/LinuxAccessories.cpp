@@ -2,12 +2,14 @@
 
 #include "base/Format.h"
 #include "platform/linux/BluetoothRecord.h"
-#include "platform/linux/KeyedHash.h"
 #include "platform/linux/SmallFile.h"
 
 #include <algorithm>
 #include <array>
+#include <bit>
 #include <charconv>
+#include <cstddef>
+#include <cstdint>
 #include <cstdio>
 #include <filesystem>
 #include <set>
@@ -41,6 +43,48 @@ bool isAddress(std::string_view name) noexcept {
         }
     }
     return true;
+}
+
+/// A secret of 128 bits.
+using HashKey = std::array<std::uint64_t, 2>;
+
+/// SipHash-2-4 (Aumasson and Bernstein, 2012): whoever does not have the key can neither tell the text from
+/// its hash nor find it by trying all texts that there are.
+std::uint64_t keyedHash(const HashKey& key, std::string_view text) noexcept {
+    std::array<std::uint64_t, 4> v{key[0] ^ 0x736F6D6570736575U, key[1] ^ 0x646F72616E646F6DU,
+                                   key[0] ^ 0x6C7967656E657261U, key[1] ^ 0x7465646279746573U};
+    const auto rounds = [&v](int count) {
+        for (int i = 0; i < count; ++i) {
+            v[0] += v[1];
+            v[1] = std::rotl(v[1], 13) ^ v[0];
+            v[0] = std::rotl(v[0], 32);
+            v[2] += v[3];
+            v[3] = std::rotl(v[3], 16) ^ v[2];
+            v[0] += v[3];
+            v[3] = std::rotl(v[3], 21) ^ v[0];
+            v[2] += v[1];
+            v[1] = std::rotl(v[1], 17) ^ v[2];
+            v[2] = std::rotl(v[2], 32);
+        }
+    };
+    const auto take = [&v, &rounds](std::uint64_t word) {
+        v[3] ^= word;
+        rounds(2);
+        v[0] ^= word;
+    };
+    // Words of eight bytes, the lowest first; the last one has the length in its highest byte.
+    std::uint64_t word = 0;
+    for (std::size_t i = 0; i < text.size(); ++i) {
+        word |= std::uint64_t{static_cast<unsigned char>(text[i])} << 8U * (i % 8);
+        if (i % 8 == 7) {
+            take(word);
+            word = 0;
+        }
+    }
+    take(word | std::uint64_t{text.size()} << 56U);
+    v[2] ^= 0xFFU;
+    rounds(4);
+    return v[0] ^ v[1] ^ v[2] ^ v[3];
 }
 
 /// The machine's identifier, 32 hexadecimal digits; zero without one.

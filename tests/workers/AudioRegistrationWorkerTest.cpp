@@ -1,8 +1,8 @@
 #include "base/Json.h"
 #include "session/ZRReportingSession.h"
 #include "tests/fakes/FakePlatform.h"
-#include "workers/accessories/AccessoryLookup.h"
 #include "workers/accessories/AccessoryRegistry.h"
+#include "workers/accessories/ZRReportingSessionAudioRegistrationWorker.h"
 
 #include <gmock/gmock.h>
 
@@ -100,15 +100,23 @@ TEST(AccessoryRegistryTest, ForgetsThoseUnseenForTheLongestTime) {
 
 class AudioRegistrationWorkerTest : public testing::Test {
 protected:
-    AudioRegistrationWorkerTest() { forgetAccessoryLookup(); }
-    void startSession() {
-        const auto session = ZRReportingSession::initWithID(5, {1});
-        session->start();
+    AudioRegistrationWorkerTest() { ZRReportingSessionAudioRegistrationWorker::forgetLastLookup(); }
+    /// Starts a session, some time after the one before.
+    void startSession(std::chrono::seconds later = 1min) {
+        device.clock.advance(later);
+        ZRReportingSession::initWithID(5, {1})->start();
         device.workQueues.run("com.vandra.tamblo.accessories");
     }
-    [[nodiscard]] std::vector<Dictionary> reported() {
-        (void)device.serverQueue().runAll();
-        return device.analyticsEvents.payloads(kAccessoryEvent);
+    [[nodiscard]] std::vector<std::string> reported(bool isWorkedOff = true) {
+        if (isWorkedOff) {
+            (void)device.serverQueue().runAll();
+        }
+        std::vector<std::string> texts;
+        for (const Dictionary& payload :
+             device.analyticsEvents.payloads("com.vandra.tamblo.accessoryregistration")) {
+            texts.push_back(jsonText(payload));
+        }
+        return texts;
     }
     [[nodiscard]] std::string kept() const {
         const auto value = device.preferences.copyPreferenceValue("registered", kDomain);
@@ -122,12 +130,15 @@ protected:
 
 TEST_F(AudioRegistrationWorkerTest, LooksAtMostOnceAMinuteAndKeepsWhatItSaw) {
     device.accessories.earbuds = {{"a", "bluetooth:004c:2014:0b10"}};
-    startSession();
-    EXPECT_THAT(device.analyticsEvents.payloads(kAccessoryEvent), IsEmpty()) << "sent on the server queue";
-    ASSERT_THAT(reported(), SizeIs(1));
-    EXPECT_EQ(
-        jsonText(reported()[0]),
-        R"({"first_seen_day":"2026-03-01","last_seen_day":"2026-03-01","model":"bluetooth:004c:2014:0b10"})");
+    device.analyticsEvents.setEventsInUse({{"other"}});
+    startSession(0s);
+    EXPECT_EQ(device.accessories.lookups, 0) << "nobody wants the event";
+    device.analyticsEvents.setEventsInUse(std::nullopt);
+    startSession(0s);
+    EXPECT_EQ(device.accessories.lookups, 1);
+    EXPECT_THAT(reported(false), IsEmpty()) << "sent on the server queue";
+    EXPECT_THAT(reported(), ElementsAre(R"({"first_seen_day":"2026-03-01","last_seen_day":"2026-03-01",)"
+                                        R"("model":"bluetooth:004c:2014:0b10"})"));
     EXPECT_EQ(kept(),
               R"({"a":{"first_seen":"2026-03-01","last_reported":1772366400.0,"last_seen":"2026-03-01"}})");
     const struct {
@@ -136,38 +147,24 @@ TEST_F(AudioRegistrationWorkerTest, LooksAtMostOnceAMinuteAndKeepsWhatItSaw) {
         std::size_t events;
     } cases[] = {{59s, 1, 1}, {1s, 2, 1}, {-3600s, 3, 1}, {59s, 3, 1}, {90'000s, 4, 2}, {-600'000s, 5, 3}};
     for (const auto& c : cases) {
-        device.clock.advance(c.step);
-        startSession();
+        startSession(c.step);
         EXPECT_EQ(device.accessories.lookups, c.lookups);
         EXPECT_EQ(reported().size(), c.events);
     }
     EXPECT_EQ(errors(), 0U);
 }
 
-TEST_F(AudioRegistrationWorkerTest, LooksNothingUpForAnEventThatNobodyWants) {
-    device.analyticsEvents.setEventsInUse({{"other"}});
-    device.accessories.earbuds = {{"a", "m"}};
-    startSession();
-    EXPECT_EQ(device.accessories.lookups, 0);
-    device.analyticsEvents.setEventsInUse(std::nullopt);
-    startSession();
-    EXPECT_THAT(reported(), SizeIs(1)) << "at the next session's start";
-}
-
 TEST_F(AudioRegistrationWorkerTest, RubbishAndAStoreThatFailsAreOneLineEach) {
     startSession();
     EXPECT_EQ(kept(), "") << "nothing to keep";
     device.preferences.set("registered", kDomain, Array{1});
-    device.clock.advance(1min);
     startSession();
     EXPECT_EQ(errors(), 1U);
     EXPECT_EQ(kept(), "{}");
     device.accessories.earbuds = {{"a", "m"}};
     device.preferences.writeFailure = "disk full";
-    for (int i = 0; i < 2; ++i) {
-        device.clock.advance(1min);
-        startSession();
-    }
+    startSession();
+    startSession();
     EXPECT_EQ(errors(), 2U);
     EXPECT_THAT(reported(), SizeIs(1)) << "known in this process all the same";
 }

@@ -3,17 +3,28 @@
 #include "session/ZRReportingSessionWorkerProtocol.h"
 
 #include <optional>
+#include <string_view>
 
 namespace tamblo {
 
 /// Reports which wireless earbuds the device has, when a session starts: each accessory at most once in a
 /// day, by its model, never by its address or name. A consumer by its role, it makes nothing of messages.
+///
+/// Nothing is looked up when nobody wants the event, when the last lookup of any session was within a minute,
+/// or while one is under way: thousands of sessions may start in a moment. The lookup reads files on another
+/// thread, and its events are sent on the reporting server queue, so that they are written out with its
+/// batch. It outlives the session.
 class ZRReportingSessionAudioRegistrationWorker final : public ZRReportingSessionWorkerConsumerProtocol {
 public:
+    static constexpr std::string_view kEvent = "com.vandra.tamblo.accessoryregistration";
+
     using ZRReportingSessionWorkerConsumerProtocol::ZRReportingSessionWorkerConsumerProtocol;
 
     std::optional<bool> start() override;
     void handleMessage(const MessageRef&) override {}
+
+    /// Has the next start look whenever the last lookup was: after another platform was installed.
+    static void forgetLastLookup() noexcept;
 };
 
 } // namespace tamblo
