@@ -76,43 +76,41 @@ TEST(SerialQueue, QuickWorkIsDrainedByThePosterInOneBatch) {
 
 TEST(SerialQueue, WorkThatMayBlockLeavesThePosterAndTakesWhatFollowsAlong) {
     LinuxWorkQueues queues;
-    const auto queue = queues.makeSerialQueue("hand over");
-    std::string trace;
-    std::vector<std::thread::id> threads;
-    std::latch mayGoOn(1);
-    const auto step = [&](char letter) {
-        return [&, letter] {
-            trace += letter;
-            threads.push_back(std::this_thread::get_id());
+    for (const bool mayAllBlock : {false, true}) {
+        const auto queue = queues.makeSerialQueue("hand over");
+        std::string trace;
+        std::vector<std::thread::id> threads;
+        std::promise<void> mayGoOn;
+        const std::future<void> goingOn = mayGoOn.get_future();
+        const auto step = [&](char letter) {
+            return [&, letter] {
+                trace += letter;
+                threads.push_back(std::this_thread::get_id());
+            };
         };
-    };
-    {
-        InlineDrain drain;
-        queue->post(step('a'));
-        queue->post(
-            [&] {
-                mayGoOn.wait();
-                step('b')();
-            },
-            Pace::mayBlock);
-        queue->post(step('c'));
-        drain.drain(); // returns although b has not run
-        mayGoOn.count_down();
+        {
+            InlineDrain drain;
+            queue->post([&] {
+                step('a')();
+                queue->setMayBlock(mayAllBlock); // even what is posted already
+            });
+            queue->post(
+                [&] {
+                    (void)goingOn.wait_for(kPatience);
+                    step('b')();
+                },
+                mayAllBlock ? Pace::quick : Pace::mayBlock);
+            queue->post(step('c'));
+            drain.drain(); // returns although b has not run
+            mayGoOn.set_value();
+        }
+        settle(*queue);
+        EXPECT_EQ(trace, "abc");
+        const std::thread::id me = std::this_thread::get_id();
+        EXPECT_EQ(threads[0], me);
+        EXPECT_NE(threads[1], me);
+        EXPECT_NE(threads[2], me);
     }
-    settle(*queue);
-    {
-        // So does quick work where any may block, even what was posted before that was said.
-        InlineDrain drain;
-        queue->post([&] { queue->setMayBlock(true); });
-        queue->post(step('d'));
-    }
-    settle(*queue);
-    EXPECT_EQ(trace, "abcd");
-    const std::thread::id me = std::this_thread::get_id();
-    EXPECT_EQ(threads[0], me);
-    EXPECT_NE(threads[1], me);
-    EXPECT_NE(threads[2], me);
-    EXPECT_NE(threads[3], me);
 }
 
 TEST(SerialQueue, ManyQueuesShareFewThreadsThatGrowWhileWorkBlocks) {
