@@ -10,6 +10,7 @@
 #include <filesystem>
 #include <functional>
 #include <system_error>
+#include <tuple>
 #include <utility>
 #include <vector>
 
@@ -25,8 +26,6 @@ constexpr std::string_view kUnfinished = ".new-";
 /// An identifier with every digit as 0; those behind the time are hexadecimal.
 constexpr std::string_view kPattern = "00000000T000000.000Z-00000000";
 constexpr std::size_t kTimeLength = kPattern.find('-');
-
-constexpr std::string_view kNoFolders = "captures have no folders until it can be written again";
 
 /// How many entries are looked at, of the directory and of a folder. Thirty days bring 600 folders of less
 /// than 100 files.
@@ -87,25 +86,24 @@ std::string CaptureFolders::identifier(WallTime time, std::uint64_t number) {
 
 void CaptureFolders::store(std::string_view identifier, std::span<const CaptureFile> files, WallTime now) {
     // Before, for a disk that is full of old ones; after, as the new one counts too.
-    removeOld(now);
+    removeOld(now, identifier);
     std::string problem = makeDirectory();
     if (problem.empty()) {
         problem = write(identifier, files);
     }
-    tell(isWritingOut_, problem, kNoFolders);
-    removeOld(now);
+    tell(isWritingOut_, problem, "captures have no folders until it can be written again");
+    // Where there is no folder either, one line says it all.
+    if (problem.empty()) {
+        tell(isKeepingOut_, keepingProblem_, "the service will know nothing of it when it is started again");
+    }
+    removeOld(now, identifier);
 }
 
 void CaptureFolders::keep(std::string_view name, std::string_view text) {
-    std::string problem = makeDirectory();
-    if (problem.empty()) {
-        const int error = replaceFileAtomically(formatted("{}/{}", directory_, name), text);
-        problem = error != 0 ? failure("write", name, error) : "";
-    }
-    // A small file may still have room where a folder has none: only that ends an outage.
-    if (!problem.empty()) {
-        tell(isWritingOut_, problem, kNoFolders);
-    }
+    // A directory that there is not is told with the folder.
+    const bool isThere = makeDirectory().empty();
+    const int error = isThere ? replaceFileAtomically(formatted("{}/{}", directory_, name), text) : 0;
+    keepingProblem_ = error != 0 ? failure("write", name, error) : "";
 }
 
 std::string CaptureFolders::makeDirectory() const {
@@ -145,7 +143,7 @@ std::string CaptureFolders::write(std::string_view identifier, std::span<const C
     return problem;
 }
 
-void CaptureFolders::removeOld(WallTime now) {
+void CaptureFolders::removeOld(WallTime now, std::string_view latest) {
     std::vector<std::string> removed;
     std::vector<std::string> folders;
     forEachEntry<fs::directory_iterator>(directory_, [&](const fs::directory_entry& entry) {
@@ -161,13 +159,17 @@ void CaptureFolders::removeOld(WallTime now) {
             folders.push_back(std::move(name));
         }
     });
-    std::ranges::sort(folders, std::greater());
     const std::string oldest = timeText(now - kMaximumAge);
+    const std::string present = timeText(now);
+    const auto rank = [&](const std::string& name) {
+        return std::tuple(name == latest, name.substr(0, present.size()) <= present, name);
+    };
+    std::ranges::sort(folders, std::greater(), rank);
     std::uint64_t total = 0;
     for (const std::string& name : folders) {
         // Once there is no more room, there is none for those that are older.
         total += total > limits_.totalSize ? 0 : sizeOf(formatted("{}/{}", directory_, name));
-        if (total > limits_.totalSize || name < oldest) {
+        if (name != latest && (total > limits_.totalSize || name < oldest)) {
             removed.push_back(name);
         }
     }

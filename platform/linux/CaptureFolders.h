@@ -22,7 +22,10 @@ struct CaptureFile {
 /// A folder is written under another name, which begins with a dot, and renamed when it is complete: what has
 /// a capture's name is whole, whenever the service was killed. What such a one left is removed with the next
 /// capture, as are folders that are old or more than there is room for, the oldest first. Only what the
-/// service has named itself is removed, and no symbolic link is followed.
+/// service has named itself is removed, and no symbolic link in the directory is followed.
+///
+/// The clock may be set in between: the folder that was just written stays, however long ago its capture was
+/// asked for, and folders of a time that is still to come are the first to make room.
 ///
 /// Directory and files are the owner's alone. A directory that cannot be written is one error line in the log
 /// until it can be again. Used by one thread at a time, which waits for the disk.
@@ -48,21 +51,23 @@ public:
 
     /// Writes a capture's folder, or none.
     void store(std::string_view identifier, std::span<const CaptureFile> files, WallTime now);
-    /// Replaces a file beside the folders.
+    /// Replaces a file beside the folders. That it cannot be written is told with the next folder that can.
     void keep(std::string_view name, std::string_view text);
 
 private:
     [[nodiscard]] std::string makeDirectory() const;
     [[nodiscard]] std::string write(std::string_view identifier, std::span<const CaptureFile> files) const;
-    void removeOld(WallTime now);
+    void removeOld(WallTime now, std::string_view latest);
     [[nodiscard]] std::string remove(const std::string& name) const;
     void tell(bool& isOut, std::string_view problem, std::string_view consequence);
 
     const std::string directory_;
     StructuredLog& log_;
     const Limits limits_;
-    /// Whether the log knows that nothing can be written, or removed.
+    /// Whether the log knows that no folder can be written, no file beside them, or nothing removed.
     bool isWritingOut_ = false;
+    bool isKeepingOut_ = false;
+    std::string keepingProblem_; ///< the last try's
     bool isRemovingOut_ = false;
 };
 

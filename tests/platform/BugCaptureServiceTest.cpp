@@ -153,6 +153,22 @@ TEST_F(CaptureFoldersTest, TheOldestGoWhenThereIsNoRoomForAll) {
     EXPECT_THAT(names(), UnorderedElementsAre(stored[2], stored[3]));
 }
 
+TEST_F(CaptureFoldersTest, AClockThatIsSetLosesNoCaptureThatWasJustMade) {
+    const std::string ahead = CaptureFolders::identifier(clock.now() + 24h, 1);
+    fs::create_directories(directory.path("captures/" + ahead));
+    directory.write("captures/" + ahead + "/log.txt", std::string(600, 'x'));
+    const std::string first = CaptureFolders::identifier(clock.now(), 1);
+    store(first, 400);
+    EXPECT_THAT(names(), UnorderedElementsAre(ahead, first));
+    const std::string second = CaptureFolders::identifier(clock.now(), 2);
+    store(second, 1);
+    EXPECT_THAT(names(), UnorderedElementsAre(first, second)) << "of a time that is still to come";
+    const std::string asked = CaptureFolders::identifier(clock.now(), 3);
+    clock.advance(24h * 365);
+    store(asked);
+    EXPECT_THAT(names(), ElementsAre(asked));
+}
+
 TEST_F(CaptureFoldersTest, AnOutageIsOneLineAndLeavesNoHalfFolder) {
     directory.write("captures", "in the way");
     store(CaptureFolders::identifier(clock.now(), 1));
@@ -167,6 +183,13 @@ TEST_F(CaptureFoldersTest, AnOutageIsOneLineAndLeavesNoHalfFolder) {
     folders.store(CaptureFolders::identifier(clock.now(), 4), impossible, clock.now());
     EXPECT_THAT(names(), ElementsAre(CaptureFolders::identifier(clock.now(), 3)));
     EXPECT_THAT(log.take(), ElementsAre(HasSubstr("cannot write no/such/place: No such file or directory;")));
+    fs::create_directory(directory.path("captures/allowance.json"));
+    for (std::uint64_t number = 5; number < 7; ++number) {
+        folders.keep("allowance.json", "{}");
+        store(CaptureFolders::identifier(clock.now(), number));
+    }
+    EXPECT_THAT(log.take(),
+                ElementsAre(HasSubstr("cannot write allowance.json: Is a directory; the service")));
 }
 
 /// The service in a directory, with a process 12 and without a process 13.
