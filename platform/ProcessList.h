@@ -24,6 +24,8 @@ class ProcessList {
 public:
     static constexpr std::size_t kMaximum = 64;
 
+    explicit ProcessList(std::size_t maximum = kMaximum) : maximum_(maximum) {}
+
     void add(std::span<const pid_t> processes) {
         for (const pid_t process : processes) {
             add(process);
@@ -47,7 +49,7 @@ public:
 
 private:
     void add(std::int64_t process) {
-        if (process <= 0 || process > std::numeric_limits<pid_t>::max() || processes_.size() == kMaximum) {
+        if (process <= 0 || process > std::numeric_limits<pid_t>::max() || processes_.size() == maximum_) {
             return;
         }
         const auto identifier = static_cast<pid_t>(process);
@@ -56,6 +58,7 @@ private:
         }
     }
 
+    const std::size_t maximum_;
     std::vector<pid_t> processes_;
 };
 

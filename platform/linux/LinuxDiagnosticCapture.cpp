@@ -3,6 +3,7 @@
 #include "platform/ProcessList.h"
 #include "platform/linux/SinkLine.h"
 
+#include <algorithm>
 #include <utility>
 
 namespace tamblo {
@@ -26,21 +27,40 @@ struct ProcessStacks {
     std::vector<ThreadStacks> threads;
 };
 
+/// How many threads of each process are looked at, so that those of all are within the limit: the largest
+/// number that does, as it is the process with hundreds that can spare some.
+std::size_t shareOf(const std::vector<std::vector<pid_t>>& threads) {
+    std::size_t share = LinuxDiagnosticCapture::kMaximumThreads;
+    const auto isTooMany = [&] {
+        std::size_t total = 0;
+        for (const auto& ofProcess : threads) {
+            total += std::min(ofProcess.size(), share);
+        }
+        return total > LinuxDiagnosticCapture::kMaximumThreads;
+    };
+    while (isTooMany()) {
+        --share;
+    }
+    return share;
+}
+
 std::vector<ProcessStacks> findThreads(const ProcessFiles& files, const std::vector<pid_t>& processes) {
     std::vector<ProcessStacks> found;
-    std::size_t left = LinuxDiagnosticCapture::kMaximumThreads;
+    std::vector<std::vector<pid_t>> threads;
     for (const pid_t process : processes) {
-        auto name = files.name(process);
-        if (!name) {
-            continue;
+        if (auto name = files.name(process)) {
+            found.push_back({process, std::move(*name), {}});
+            threads.push_back(files.threads(process, LinuxDiagnosticCapture::kMaximumThreads));
         }
-        ProcessStacks& stacks = found.emplace_back(ProcessStacks{process, std::move(*name), {}});
-        for (const pid_t thread : files.threads(process, left)) {
-            if (auto threadName = files.threadName(process, thread)) {
-                stacks.threads.push_back({thread, std::move(*threadName), {}});
+    }
+    const std::size_t share = shareOf(threads);
+    for (std::size_t i = 0; i < found.size(); ++i) {
+        threads[i].resize(std::min(threads[i].size(), share));
+        for (const pid_t thread : threads[i]) {
+            if (auto name = files.threadName(found[i].process, thread)) {
+                found[i].threads.push_back({thread, std::move(*name), {}});
             }
         }
-        left -= stacks.threads.size();
     }
     return found;
 }
@@ -110,18 +130,16 @@ LinuxDiagnosticCapture::LinuxDiagnosticCapture(const std::string& logsDirectory,
              {.waiting = kMaximumWaiting, .what = "stack captures", .categoryCode = "zrrp"}, log) {}
 
 void LinuxDiagnosticCapture::captureStacks(StackCaptureRequest request) {
-    ProcessList processes;
-    processes.addNamedBy(request.payload);
-    processes.add(clientProcesses_());
-    queue_.post([this, request = std::move(request), named = std::move(processes).take()] {
-        capture(request, named);
-    });
+    queue_.post(
+        [this, request = std::move(request), clients = clientProcesses_()] { capture(request, clients); });
 }
 
-void LinuxDiagnosticCapture::capture(const StackCaptureRequest& request,
-                                     const std::vector<pid_t>& processes) {
+void LinuxDiagnosticCapture::capture(const StackCaptureRequest& request, const std::vector<pid_t>& clients) {
+    ProcessList processes(kMaximumThreads);
+    processes.addNamedBy(request.payload);
+    processes.add(clients);
+    std::vector<ProcessStacks> stacks = findThreads(files_, std::move(processes).take());
     const WallTime time = clock_.now();
-    std::vector<ProcessStacks> stacks = findThreads(files_, processes);
     sampleAll(files_, clock_, stacks);
     file_.append([&](TextBuffer& line) {
         SinkLine(line, time)

@@ -24,9 +24,9 @@ namespace tamblo {
 ///         {"count":5,"state":"S (sleeping)","waitChannel":"pipe_read","kernelStack":["pipe_read+0x…",…]}]}]}
 ///
 /// Looked at are the processes that the payload names and those of the clients that are connected when the
-/// capture is asked for, as many as a `ProcessList` takes. All their threads are sampled five times within a
-/// tenth of a second, on a queue of the service's own; samples in a row that are equal are one, with their
-/// count. A thread that ends keeps the samples that it had, one that begins in that time is not seen.
+/// capture is asked for. All their threads are sampled five times within a tenth of a second, on a queue of
+/// the service's own; samples in a row that are equal are one, with their count. A thread that ends keeps the
+/// samples that it had, one that begins in that time is not seen.
 class LinuxDiagnosticCapture final : public DiagnosticCaptureService {
 public:
     using ClientProcesses = std::function<std::vector<pid_t>()>;
@@ -34,7 +34,8 @@ public:
     static constexpr int kSamples = 5;
     static constexpr std::chrono::milliseconds kSampleInterval{25};
     /// Of all processes together: a sample takes some thirty microseconds, so that those of all threads take
-    /// less than the interval. Threads of the processes that come last go without.
+    /// less than the interval. Where there are more, each process is cut to a number of threads that suits
+    /// all; of more processes than this, those that come last go without.
     static constexpr std::size_t kMaximumThreads = 512;
     /// Each takes a tenth of a second, by which it can hold up the service's end.
     static constexpr std::size_t kMaximumWaiting = 4;
@@ -49,7 +50,7 @@ public:
     void captureStacks(StackCaptureRequest request) override;
 
 private:
-    void capture(const StackCaptureRequest& request, const std::vector<pid_t>& processes);
+    void capture(const StackCaptureRequest& request, const std::vector<pid_t>& clients);
 
     Clock& clock_;
     const ClientProcesses clientProcesses_;

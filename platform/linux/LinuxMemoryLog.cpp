@@ -65,12 +65,16 @@ void LinuxMemoryLog::record(std::int64_t reporterID, const std::vector<pid_t>& p
             found.push_back({process, std::move(*name), *memory});
         }
     }
-    const auto kernel = files_.kernelMemory().value_or(ProcessFiles::KernelMemory());
+    const auto kernel = files_.kernelMemory();
     file_.append([&](TextBuffer& line) {
         SinkLine(line, time)
             .number("reporter", reporterID)
             .array("processes", found, appendProcess)
-            .object("kernel", [&](SinkObject& object) { fillKernel(object, kernel); });
+            .object("kernel", [&](SinkObject& object) {
+                if (kernel) {
+                    fillKernel(object, *kernel);
+                }
+            });
     });
     file_.flush();
 }

@@ -17,7 +17,7 @@ namespace tamblo {
 ///     {"time":…,"reporter":7,"processes":[{"process":812,"name":"player","resident":…,…}],"kernel":{…}}
 ///
 /// The figures, in bytes, are read from `/proc` on a queue of the log's own, as each process takes some ten
-/// microseconds. A process that is gone by then is left out.
+/// microseconds. A process that is gone by then is left out; `kernel` is empty where it cannot be read.
 class LinuxMemoryLog final : public MemoryLog {
 public:
     /// Each session asks once a second at most; so many wait only when the device is far behind.

@@ -5,12 +5,14 @@
 #include "tests/platform/LinuxServiceSupport.h"
 
 #include <gmock/gmock.h>
+#include <nlohmann/json.hpp>
+
+#include <map>
 
 namespace tamblo {
 namespace {
 
 using testing::ElementsAre;
-using testing::HasSubstr;
 using testing::IsEmpty;
 
 /// Time stands still but for what the test does while a capture waits for its next sample.
@@ -113,18 +115,26 @@ TEST_F(StackCaptureTest, ThoseBeyondTheFourThatWaitAreDroppedAndCounted) {
     EXPECT_EQ(std::count(all.begin(), all.end(), '\n'), 5);
 }
 
-TEST_F(StackCaptureTest, NoMoreThreadsAreLookedAtThanTheLimit) {
+TEST_F(StackCaptureTest, AProcessWithTooManyThreadsLeavesTheOthersTheirs) {
     writeThread("7", "5000", "S (sleeping)");
-    writeThread("8", "6000", "S (sleeping)");
     for (std::size_t i = 1; i < LinuxDiagnosticCapture::kMaximumThreads; ++i) {
         std::filesystem::create_directory_symlink("5000", root.path("proc/7/task/" + std::to_string(i)));
     }
-    clients = {7, 8};
+    clients = {7};
+    for (pid_t client = 6000; client < 6070; ++client) {
+        clients.push_back(client);
+        writeThread(std::to_string(client), std::to_string(client), "R (running)");
+    }
     capture();
     run();
-    const std::string line = lines();
-    EXPECT_THAT(line, HasSubstr(R"({"thread":5000,)"));
-    EXPECT_THAT(line, HasSubstr(R"({"process":8,"name":"p8","threads":[]})"));
+    std::map<int, std::size_t> threads;
+    const auto line = nlohmann::json::parse(lines());
+    for (const auto& process : line["stacks"]) {
+        threads[process["process"].get<int>()] = process["threads"].size();
+    }
+    EXPECT_EQ(threads[7], LinuxDiagnosticCapture::kMaximumThreads - 70);
+    EXPECT_EQ(std::count_if(threads.begin(), threads.end(), [](const auto& row) { return row.second == 1; }),
+              70);
 }
 
 TEST_F(ProcessSinksTest, TheMemoryLogLeavesOutWhoIsGone) {
@@ -134,11 +144,15 @@ TEST_F(ProcessSinksTest, TheMemoryLogLeavesOutWhoIsGone) {
           "Name:\tp7\nVmPeak:\t9 kB\nVmLck:\t1 kB\nVmHWM:\t3 kB\nVmRSS:\t2 kB\nRssAnon:\t1 kB\n"
           "RssFile:\t1 kB\nVmPTE:\t4 kB\nThreads:\t5\n");
     writeThread("8", "8", "Z (zombie)");
-    memory.logMemory(-5, {9, 8, 7});
+    memory.logMemory(-5, {9});
     EXPECT_EQ(root.read("memory-log.jsonl"), "") << "nothing is read on the caller's thread";
+    EXPECT_EQ(workQueues.run("com.vandra.tamblo.memorylog"), 1U);
+    memory.logMemory(-5, {9, 8, 7});
     write("proc/meminfo", "MemTotal: 9 kB\nSlab: 1 kB\n");
     EXPECT_EQ(workQueues.run("com.vandra.tamblo.memorylog"), 1U);
     EXPECT_EQ(root.read("memory-log.jsonl"),
+              R"({"time":4.0,"reporter":-5,"processes":[],"kernel":{}})"
+              "\n"
               R"({"time":4.0,"reporter":-5,"processes":[{"process":7,"name":"p7","resident":2048,)"
               R"("peakResident":3072,"anonymous":1024,"file":1024,"shared":0,"swapped":0,"locked":1024,)"
               R"("pageTables":4096,"threads":5}],"kernel":{"unevictable":0,"locked":0,"slab":1024,)"
