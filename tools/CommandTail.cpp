@@ -223,7 +223,8 @@ constexpr Command kCommandTail{
     "print what the service reported",
     "[FILE] [--lines N] [--follow] [--event NAME]... [--key KEY[=VALUE]]... [--summary] [--json]",
     "FILE is a report sink by name (analytics-events, power-events, diagnostics-metrics, call-quality,\n"
-    "bug-captures, bug-report-drafts, stack-captures) or by path; analytics-events when there is none.",
+    "bug-captures, bug-report-drafts, stack-captures, memory-log) or by path; analytics-events when there\n"
+    "is none.",
     kOptions,
     run,
 };

@@ -152,7 +152,8 @@ void readLines(const std::string& path, LineFunction& line) {
 }
 
 std::string nameOfRecord(const Dictionary& record) {
-    constexpr std::array<std::string_view, 5> keys{"event", "op", "captureType", "reason", "metric"};
+    constexpr std::array<std::string_view, 6> keys{"event",  "op",     "captureType",
+                                                   "reason", "metric", "reporter"};
     for (const std::string_view key : keys) {
         if (const Value* name = record.find(key)) {
             return name->isString() ? std::string(name->stringValue()) : jsonText(*name);

@@ -200,6 +200,9 @@ TEST(RecordFilter, WantsOneOfTheEventsAndAllOfTheKeys) {
         }
         EXPECT_EQ(filter.accepts(record), row.accepts) << (row.keys.empty() ? "" : row.keys[0]);
     }
+    RecordFilter ofReporter;
+    ofReporter.wantEvent("7");
+    EXPECT_TRUE(ofReporter.accepts({{"time", 1}, {"reporter", 7}})) << "a line of the memory log";
 }
 
 TEST(SinkFollower, ReadsWholeLinesThroughRotationsAndTornEnds) {
