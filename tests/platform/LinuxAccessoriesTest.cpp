@@ -24,27 +24,15 @@ const std::string kIdentity = "[DeviceID]\nSource=1\nVendor=76\nProduct=8212\nVe
 const std::string kEarbud = "[General]\nName=Class=1\nAppearance=0x0941\n" + kIdentity + kKey;
 
 TEST(BluetoothRecordTest, TellsEarbudsAndTheirModel) {
-    const struct {
-        std::string general;
-        bool isEarbud;
-    } kinds[] = {
-        {"Class=0x240404", true},
-        {"Class=0x240418", true},
-        {"Class=0x24041c\r", false},
-        {"Class=0x240518", false},
-        {"Class=2360344", true}, // decimal
-        {"Class=0x1240418", false},
-        {"Class=0x24041g", false},
-        {"Appearance=0x0941", true},
-        {"Appearance=0x0942\nClass=0x240418", false},
-        {"Appearance=0x0941\nClass=0x000100", true},
-        {"Appearance=0x0000\nClass=0x240418", true},
-        {"Appearance=-1\nClass=0x240418", true},
-        {"[Other]\nClass=0x240418", false},
-    };
-    for (const auto& c : kinds) {
-        const std::string text = "[General]\n" + c.general;
-        EXPECT_EQ(BluetoothRecord::parse(text).isEarbud(), c.isEarbud) << text;
+    for (const std::string general : {"Class=0x240404", "Class=0x240418", "Class=2360344",
+                                      "Appearance=0x0941", "Appearance=0x0941\nClass=0x000100",
+                                      "Appearance=0x0000\nClass=0x240418", "Appearance=-1\nClass=0x240418"}) {
+        EXPECT_TRUE(BluetoothRecord::parse("[General]\n" + general).isEarbud()) << general;
+    }
+    for (const std::string general :
+         {"Class=0x24041c\r", "Class=0x240518", "Class=0x1240418", "Class=0x24041g",
+          "Appearance=0x0942\nClass=0x240418", "[Other]\nClass=0x240418"}) {
+        EXPECT_FALSE(BluetoothRecord::parse("[General]\n" + general).isEarbud()) << general;
     }
     const std::pair<std::string, std::string> models[] = {
         {kIdentity, "bluetooth:004c:2014:0b10"},
