@@ -74,14 +74,15 @@ TEST(AccessoryRegistryTest, ReportsEachAccessoryOnceInADay) {
 
 TEST(AccessoryRegistryTest, ForgetsThoseUnseenForTheLongestTime) {
     Dictionary kept;
-    for (int i = 0; i < 64; ++i) {
-        const std::string day = i == 40 ? "2019-01-01" : "2026-02-28";
+    for (int i = 0; i < 65; ++i) {
+        const std::string day = i == 40 ? "2019-01-01" : i == 50 ? "2031-01-01" : "2026-02-28";
         kept.set("k" + std::to_string(i),
                  Dictionary{{"first_seen", day}, {"last_seen", day}, {"last_reported", 1}});
     }
     const Accessory seen[] = {{"new", ""}};
     AccessoryRegistry::Update update = AccessoryRegistry::update(Value(kept), {}, kNow);
     EXPECT_EQ(update.registered.size(), 64U);
+    EXPECT_FALSE(update.registered.contains("k50")) << "of a clock that was wrong";
     update = AccessoryRegistry::update(Value(kept), seen, kNow);
     EXPECT_EQ(update.registered.size(), 64U);
     EXPECT_FALSE(update.registered.contains("k40"));

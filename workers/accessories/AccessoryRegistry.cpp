@@ -7,7 +7,6 @@
 #include <map>
 #include <string>
 #include <string_view>
-#include <utility>
 
 namespace tamblo {
 
@@ -70,11 +69,14 @@ bool isDue(const Entry& entry, double now) noexcept {
     return !entry.lastReported || !(std::abs(now - *entry.lastReported) < kInterval);
 }
 
-void forgetLongestUnseen(Entries& entries) {
+/// A day ahead is of a clock that was wrong: those go first, not the ones that are seen now.
+void forgetLongestUnseen(Entries& entries, std::string_view today) {
+    const auto day = [today](const auto& entry) {
+        return entry.second.lastSeen <= today ? std::string_view(entry.second.lastSeen) : std::string_view();
+    };
     while (entries.size() > AccessoryRegistry::kMostAccessories) {
-        entries.erase(std::min_element(entries.begin(), entries.end(), [](const auto& a, const auto& b) {
-            return a.second.lastSeen < b.second.lastSeen;
-        }));
+        entries.erase(std::min_element(entries.begin(), entries.end(),
+                                       [&day](const auto& a, const auto& b) { return day(a) < day(b); }));
     }
 }
 
@@ -96,7 +98,7 @@ AccessoryRegistry::Update AccessoryRegistry::update(const std::optional<Value>& 
                                       {"last_seen_day", entry.lastSeen}});
         }
     }
-    forgetLongestUnseen(entries);
+    forgetLongestUnseen(entries, today);
     for (const auto& [identifier, entry] : entries) {
         update.registered.set(identifier, Dictionary{{kFirstSeen, entry.firstSeen},
                                                      {kLastSeen, entry.lastSeen},
