@@ -4,7 +4,6 @@
 #include "platform/linux/SmallFile.h"
 
 #include <algorithm>
-#include <cerrno>
 #include <filesystem>
 #include <system_error>
 #include <utility>
@@ -37,6 +36,13 @@ std::string withoutControls(std::string text, std::string_view kept = {}) {
             return isControl && kept.find(character) == kept.npos;
         },
         '?');
+    // The second set that terminals obey, U+0080 to U+009F.
+    for (std::size_t at = 1; at < text.size(); ++at) {
+        const auto byte = static_cast<unsigned char>(text[at]);
+        if (text[at - 1] == '\xC2' && byte >= 0x80 && byte <= 0x9F) {
+            text.replace(at - 1, 2, "??");
+        }
+    }
     return text;
 }
 

@@ -200,7 +200,7 @@ protected:
                                    "sys/class/thermal/thermal_zone0", "sys/class/thermal/cooling_device0"}) {
             fs::create_directories(directory.path(folder));
         }
-        directory.write("proc/12/comm", "mu\x1bsic\n");
+        directory.write("proc/12/comm", "mu\x1bs\xC2\x9Bic\n");
         directory.write("proc/12/status", "Name:\tmu\x1bsic\nVmRSS:\t  64 kB\n");
         directory.write("proc/12/task/12/comm", "music\n");
         directory.write("proc/12/task/12/status", "Name:\tmusic\nState:\tS (sleeping)\n");
@@ -271,7 +271,7 @@ TEST_F(BugCaptureServiceTest, ASnapshotIsALineOnceItsFolderIsComplete) {
                                            "\n");
     EXPECT_EQ(file(0, "log.txt"), "<3>zrrr the last line\n");
     EXPECT_EQ(file(0, "process-12.txt"),
-              "process 12: mu?sic\n\n== threads\n12  music  S (sleeping)  futex_wait\n"
+              "process 12: mu?s??ic\n\n== threads\n12  music  S (sleeping)  futex_wait\n"
               "        futex_wait+0x66/0x120\n14  gone\n\n== status\nName:\tmu?sic\nVmRSS:\t  64 kB\n\n"
               "== memory\n(No such file or directory)\n\n");
     EXPECT_EQ(file(0, "process-13.txt"), "process 13: gone\n");
