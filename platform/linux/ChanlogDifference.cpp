@@ -3,7 +3,6 @@
 #include "base/Format.h"
 
 #include <algorithm>
-#include <cstdint>
 #include <memory>
 #include <tuple>
 #include <vector>

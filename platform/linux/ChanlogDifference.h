@@ -4,7 +4,6 @@
 #include "platform/StructuredLog.h"
 
 #include <cstddef>
-#include <optional>
 #include <set>
 #include <string>
 

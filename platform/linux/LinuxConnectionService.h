@@ -9,7 +9,6 @@
 #include "platform/linux/LinuxConnection.h"
 
 #include <cstddef>
-#include <functional>
 #include <map>
 #include <memory>
 #include <mutex>

@@ -15,10 +15,12 @@ namespace tamblo {
 namespace {
 
 constexpr std::string_view kSuffix = ".json";
+/// Bytes of a domain's name: with the suffix, it has to be a file system's file name.
+constexpr std::size_t kLongestDomainName = 200;
 
 /// Whether a domain's name is the name of a file in the directory and of nothing else.
 bool isDomainName(std::string_view domain) noexcept {
-    return !domain.empty() && domain.size() <= 200 && domain.front() != '.' &&
+    return !domain.empty() && domain.size() <= kLongestDomainName && domain.front() != '.' &&
            domain.find_first_of(std::string_view("/\0", 2)) == std::string_view::npos;
 }
 

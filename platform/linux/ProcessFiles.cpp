@@ -18,8 +18,10 @@ namespace tamblo {
 
 namespace {
 
-/// The kernel cuts names at 15 bytes of its own and ends them with a line end.
+/// A name of 15 bytes at most and a line end.
 constexpr std::size_t kMaximumName = 64;
+/// The name of a function in the kernel.
+constexpr std::size_t kMaximumWaitChannel = 1024;
 /// `stat` and `status` are some hundred bytes, the latter more on machines with many processors.
 constexpr std::size_t kMaximumStatus = 64UL * 1024;
 /// A kernel stack is at most 64 calls deep, each with a name of at most 512 bytes.
@@ -184,7 +186,7 @@ std::optional<ProcessFiles::ThreadSample> ProcessFiles::sampleThread(pid_t pid, 
     ThreadSample sample;
     sample.state = asUtf8(std::string(*state));
     // "0" is a thread that does not wait, and one that may not be looked at.
-    std::string channel = SmallFile::read(pathOf(pid, thread, "wchan"), kMaximumName * 16).text;
+    std::string channel = SmallFile::read(pathOf(pid, thread, "wchan"), kMaximumWaitChannel).text;
     if (!channel.empty() && channel != "0") {
         sample.waitChannel = asUtf8(std::move(channel));
     }

@@ -4,7 +4,6 @@
 #include "platform/Clock.h"
 
 #include <concepts>
-#include <cstdint>
 #include <span>
 #include <string>
 #include <string_view>

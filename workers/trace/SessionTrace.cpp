@@ -3,7 +3,6 @@
 #include "util/MessageKeys.h"
 #include "workers/producers/PayloadFields.h"
 
-#include <algorithm>
 #include <chrono>
 
 namespace tamblo {

@@ -13,8 +13,6 @@
 #include <string_view>
 #include <vector>
 
-#include <sys/types.h>
-
 namespace tamblo {
 
 /// What one session's performance file is made of.

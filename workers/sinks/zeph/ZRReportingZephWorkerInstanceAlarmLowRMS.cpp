@@ -11,6 +11,7 @@ ZRReportingZephWorkerInstanceAlarmLowRMS::ZRReportingZephWorkerInstanceAlarmLowR
     : ZRReportingSessionZephWorkerInstance(std::move(session)) {
     auto state = std::make_shared<WorkerInstanceState>();
     state->interestThresholdCount = 3;
+    // Without effect beside a threshold of the count.
     state->interestThresholdDurationSeconds = std::chrono::seconds(15);
     state->oncePerSession = true;
     setWorkerState(std::move(state));

@@ -9,6 +9,7 @@ namespace {
 std::shared_ptr<WorkerInstanceState> makeState() {
     auto state = std::make_shared<WorkerInstanceState>();
     state->interestThresholdCount = 2;
+    // Without effect beside a threshold of the count.
     state->interestThresholdDurationSeconds = std::chrono::seconds(60);
     return state;
 }
