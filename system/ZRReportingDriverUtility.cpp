@@ -9,7 +9,6 @@
 #include <algorithm>
 #include <cstddef>
 #include <cstdint>
-#include <iterator>
 #include <mutex>
 #include <numeric>
 #include <utility>
@@ -218,8 +217,11 @@ std::string ZRReportingDriverUtility::getDriverStatsKey(const ChanlogChannel& ch
     std::string key;
     key.reserve(kUsualLength);
     const auto add = [&key](std::string_view name) {
-        std::copy_if(name.begin(), name.end(), std::back_inserter(key),
-                     [](char character) { return character != '_' && character != ' '; });
+        const auto start = static_cast<std::ptrdiff_t>(key.size());
+        key += name;
+        key.erase(std::remove_if(key.begin() + start, key.end(),
+                                 [](char character) { return character == '_' || character == ' '; }),
+                  key.end());
     };
     const auto addPart = [&](const std::optional<std::string>& name, std::size_t end = std::string::npos) {
         if (name) {

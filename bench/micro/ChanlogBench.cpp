@@ -120,24 +120,24 @@ BENCHMARK(driverSnapshotWithChangedFiles)
     ->Unit(benchmark::kMicrosecond);
 
 /// What a session's stop does: the sample, the difference and the messages, which a session without consumers
-/// records. All files changed during the session; with the argument 1, also just before it stops.
+/// records. All files changed during the session, as many as the argument says just before it stops.
 void driverMessages(benchmark::State& state) {
     const ChannelDevice device(static_cast<int>(state.range(0)));
     const auto session = ZRReportingSession::initWithID(7, {1});
     int round = 1;
-    const auto publishAll = [&] {
-        for (int driver = 0; driver < state.range(0); ++driver) {
+    const auto publish = [&](std::int64_t drivers) {
+        for (int driver = 0; driver < drivers; ++driver) {
             device.publish(driver, round);
         }
     };
-    publishAll();
+    publish(state.range(0));
     std::this_thread::sleep_for(kUntilCertain);
     benchmark::DoNotOptimize(device.utility().getSnapShot());
     for (auto _ : state) {
         if (state.range(1) != 0) {
             state.PauseTiming();
             ++round;
-            device.publish(0, round);
+            publish(state.range(1));
             state.ResumeTiming();
         }
         device.utility().sendDriverLogsForSession(session, &device.snapShot());
@@ -148,6 +148,7 @@ BENCHMARK(driverMessages)
     ->Args({0, 0})
     ->Args({kDrivers, 0})
     ->Args({kDrivers, 1})
+    ->Args({kDrivers, kDrivers})
     ->Unit(benchmark::kMicrosecond);
 
 } // namespace

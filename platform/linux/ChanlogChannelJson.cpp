@@ -1,13 +1,14 @@
 #include "platform/linux/ChanlogChannelJson.h"
 
-#include "base/Dictionary.h"
 #include "base/Format.h"
 
 #include <array>
 #include <cstdint>
+#include <memory>
 #include <optional>
 #include <string_view>
 #include <utility>
+#include <vector>
 
 namespace tamblo {
 
@@ -23,8 +24,9 @@ constexpr std::array<std::pair<std::string_view, ChanlogFormat>, 4> kFormats{{
 /// Reads the members of one object; stays at the first fault, with which nothing more is read.
 class Members {
 public:
-    Members(const Value& object, std::string& fault) : members_(object.dictionaryValue()), fault_(fault) {
-        if (!object.isDictionary()) {
+    Members(const JsonItem& object, std::string& fault)
+        : object_(object), next_(object.first()), fault_(fault) {
+        if (object.kind != JsonItem::Kind::object) {
             fail("it", "is no object");
         }
     }
@@ -37,16 +39,16 @@ public:
     }
 
     std::optional<std::string> text(std::string_view name) {
-        const Value* value = find(name);
-        if (value == nullptr) {
+        const JsonItem* item = find(name);
+        if (item == nullptr) {
             return std::nullopt;
         }
-        if (!value->isString()) {
+        if (item->kind != JsonItem::Kind::text) {
             fail(name, "is no text");
-        } else if (value->stringValue().size() > kMaximumChanlogNameLength) {
+        } else if (item->text.size() > kMaximumChanlogNameLength) {
             fail(name, formatted("is longer than {} bytes", kMaximumChanlogNameLength));
         }
-        return std::string(value->stringValue());
+        return std::string(item->text);
     }
     std::string requiredText(std::string_view name) {
         std::optional<std::string> found = text(name);
@@ -56,23 +58,19 @@ public:
         return std::move(found).value_or(std::string());
     }
     std::int64_t integer(std::string_view name) {
-        const Value* value = find(name);
-        if (value == nullptr) {
-            fail(name, "is missing");
-        } else if (value->kind() != Value::Kind::integer) {
+        const Value number = scalar(name);
+        if (number.kind() != Value::Kind::integer) {
             fail(name, "is no signed 64-bit integer");
         }
-        return value != nullptr ? value->integerValue() : 0;
+        return number.integerValue();
     }
     std::uint64_t count(std::string_view name) {
-        const Value* value = find(name);
-        if (value == nullptr) {
-            fail(name, "is missing");
-        } else if (value->kind() != Value::Kind::unsignedInteger &&
-                   (value->kind() != Value::Kind::integer || value->rawInteger() < 0)) {
+        const Value number = scalar(name);
+        if (number.kind() != Value::Kind::unsignedInteger &&
+            (number.kind() != Value::Kind::integer || number.rawInteger() < 0)) {
             fail(name, "is no unsigned 64-bit integer");
         }
-        return value != nullptr ? value->unsignedValue() : 0;
+        return number.unsignedValue();
     }
     std::int64_t signedCount(std::string_view name) {
         const std::int64_t found = integer(name);
@@ -81,31 +79,56 @@ public:
         }
         return found;
     }
-    /// Calls `read` with the members of each object in an array.
-    template <typename Read> void forEach(std::string_view name, const Read& read) {
-        const Value* array = find(name);
-        if (array == nullptr || !array->isArray()) {
+    /// What `read` makes of the members of each object in an array.
+    template <typename Element, typename Read>
+    void list(std::string_view name, std::vector<Element>& elements, const Read& read) {
+        const JsonItem* array = find(name);
+        if (array == nullptr || array->kind != JsonItem::Kind::array) {
             return fail(name, array == nullptr ? "is missing" : "is no array");
         }
-        const auto elements = array->arrayValue();
-        if (elements.size() > kMaximumChanlogElements) {
+        std::size_t count = 0;
+        for (const JsonItem* item = array->first(); item != array->end(); item = item->next()) {
+            count += item->kind != JsonItem::Kind::null ? 1 : 0;
+        }
+        if (count > kMaximumChanlogElements) {
             return fail(name, formatted("has more than {} elements", kMaximumChanlogElements));
         }
-        for (std::size_t i = 0; i < elements.size() && isWell(); ++i) {
-            Members members(elements[i], fault_);
-            read(members);
+        elements.reserve(count);
+        for (const JsonItem* item = array->first(); item != array->end() && isWell(); item = item->next()) {
+            if (item->kind == JsonItem::Kind::null) {
+                continue;
+            }
+            Members members(*item, fault_);
+            elements.push_back(read(members));
             if (!isWell()) {
-                fault_ = formatted("{} {}: {}", name, i, fault_);
+                fault_ = formatted("{} {}: {}", name, elements.size() - 1, fault_);
             }
         }
     }
 
 private:
-    [[nodiscard]] const Value* find(std::string_view name) const noexcept {
-        return isWell() ? members_.find(name) : nullptr;
+    const JsonItem* find(std::string_view name) noexcept {
+        if (!isWell()) {
+            return nullptr;
+        }
+        // Members mostly stand in the order in which they are asked for.
+        const bool isNext =
+            next_ != object_.end() && next_->key == name && next_->kind != JsonItem::Kind::null;
+        const JsonItem* const found = isNext ? next_ : object_.find(name);
+        next_ = found != nullptr ? found->next() : next_;
+        return found;
+    }
+    /// The boolean false, which is no number of any kind, when there is none.
+    Value scalar(std::string_view name) {
+        const JsonItem* item = find(name);
+        if (item == nullptr) {
+            fail(name, "is missing");
+        }
+        return item != nullptr ? item->scalar : Value();
     }
 
-    const Dictionary& members_;
+    const JsonItem& object_;
+    const JsonItem* next_; ///< behind the one found last
     std::string& fault_;
 };
 
@@ -126,17 +149,17 @@ void readFigures(Members& members, ChanlogChannel& channel) {
         channel.value = members.integer("value");
         break;
     case ChanlogFormat::state:
-        members.forEach("states", [&channel](Members& state) {
-            channel.states.push_back({.name = state.requiredText("name"),
-                                      .transitions = state.count("transitions"),
-                                      .residency = state.count("residency")});
+        members.list("states", channel.states, [](Members& state) {
+            return ChanlogState{.name = state.requiredText("name"),
+                                .transitions = state.count("transitions"),
+                                .residency = state.count("residency")};
         });
         break;
     case ChanlogFormat::histogram:
-        members.forEach("buckets", [&channel](Members& bucket) {
-            channel.buckets.push_back({.lower = bucket.integer("lower"),
-                                       .upper = bucket.integer("upper"),
-                                       .hits = bucket.signedCount("hits")});
+        members.list("buckets", channel.buckets, [](Members& bucket) {
+            return ChanlogBucket{.lower = bucket.integer("lower"),
+                                 .upper = bucket.integer("upper"),
+                                 .hits = bucket.signedCount("hits")};
         });
         channel.minimum = members.integer("min");
         channel.maximum = members.integer("max");
@@ -149,17 +172,17 @@ void readFigures(Members& members, ChanlogChannel& channel) {
 
 } // namespace
 
-std::variant<ChanlogChannel, std::string> readChanlogChannel(const Value& json) {
+std::variant<ChanlogChannelRef, std::string> readChanlogChannel(const JsonItem& json) {
     std::string fault;
     Members members(json, fault);
-    ChanlogChannel channel;
-    channel.driverName = members.text("driver");
-    channel.groupName = members.text("group");
-    channel.subGroupName = members.text("subgroup");
-    channel.channelName = members.text("name");
-    channel.unitLabel = members.text("unit");
-    channel.format = formatOf(members);
-    readFigures(members, channel);
+    auto channel = std::make_shared<ChanlogChannel>();
+    channel->driverName = members.text("driver");
+    channel->groupName = members.text("group");
+    channel->subGroupName = members.text("subgroup");
+    channel->channelName = members.text("name");
+    channel->unitLabel = members.text("unit");
+    channel->format = formatOf(members);
+    readFigures(members, *channel);
     if (!fault.empty()) {
         return fault;
     }

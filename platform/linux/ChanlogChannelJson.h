@@ -1,6 +1,6 @@
 #pragma once
 
-#include "base/Value.h"
+#include "base/JsonElements.h"
 #include "platform/ChanlogFacility.h"
 
 #include <cstddef>
@@ -21,6 +21,6 @@ inline constexpr std::size_t kMaximumChanlogNameLength = 256; ///< bytes of a na
 /// The texts before the format may be absent. Further members are, by the format, integers all but the names:
 /// "simple": "value"; "state": "states", an array of {"name", "transitions", "residency"}; "histogram":
 /// "buckets", an array of {"lower", "upper", "hits"}, "min" and "max"; "simple_array": none that are read.
-[[nodiscard]] std::variant<ChanlogChannel, std::string> readChanlogChannel(const Value& json);
+[[nodiscard]] std::variant<ChanlogChannelRef, std::string> readChanlogChannel(const JsonItem& json);
 
 } // namespace tamblo

@@ -44,16 +44,20 @@ std::vector<std::string> channelFilesIn(DIR* directory) {
     return names;
 }
 
-/// Whether no later change of the file can bear the same times.
-bool isOld(const FileState& state) noexcept {
+timespec coarseNow() noexcept {
     timespec now{};
     ::clock_gettime(CLOCK_REALTIME_COARSE, &now);
-    const std::int64_t seconds = now.tv_sec - state.changedSeconds;
+    return now;
+}
+
+/// Whether a state was so old that no change from that moment on can bear the same times.
+bool wasOld(const FileState& state, const timespec& moment) noexcept {
+    const std::int64_t seconds = moment.tv_sec - state.changedSeconds;
     if (seconds < 0 || seconds > 1) {
         return seconds > 0;
     }
     const std::chrono::nanoseconds age =
-        std::chrono::seconds(seconds) + std::chrono::nanoseconds(now.tv_nsec - state.changedNanoseconds);
+        std::chrono::seconds(seconds) + std::chrono::nanoseconds(moment.tv_nsec - state.changedNanoseconds);
     return age >= ChanlogFiles::kCertainAge;
 }
 
@@ -109,29 +113,31 @@ bool ChanlogFiles::readFile(File& file, const FileState& state, StructuredLog& l
     }
     const bool hadChannels = !file.channels.empty();
     file.channels.clear();
-    const std::optional<Value> array = file.json.readArray(log);
-    file.isCertain = isOld(file.json.state());
-    if (array) {
-        takeChannels(file, *array, log);
-    }
+    const timespec beforeReading = coarseNow();
+    readChannels(file, log);
+    file.isCertain = wasOld(file.json.state(), beforeReading);
     return hadChannels || !file.channels.empty();
 }
 
-void ChanlogFiles::takeChannels(File& file, const Value& array, StructuredLog& log) {
-    const auto elements = array.arrayValue();
+void ChanlogFiles::readChannels(File& file, StructuredLog& log) {
     std::vector<std::string> faults;
+    std::size_t count = 0;
     std::size_t untold = 0;
-    file.channels.reserve(elements.size());
-    for (std::size_t i = 0; i < elements.size(); ++i) {
-        auto read = readChanlogChannel(elements[i]);
-        if (auto* channel = std::get_if<ChanlogChannel>(&read)) {
-            file.channels.push_back(std::make_shared<const ChanlogChannel>(std::move(*channel)));
+    const auto take = [&](const JsonItem& element) {
+        auto read = readChanlogChannel(element);
+        if (auto* channel = std::get_if<ChanlogChannelRef>(&read)) {
+            file.channels.push_back(std::move(*channel));
         } else if (faults.size() < kMaximumFaultsTold) {
-            faults.push_back(formatted("{}: channel {}: {}; it is left out", file.json.path(), i,
+            faults.push_back(formatted("{}: channel {}: {}; it is left out", file.json.path(), count,
                                        std::get<std::string>(read)));
         } else {
             ++untold;
         }
+        ++count;
+    };
+    if (!file.json.readArray(take, log)) {
+        file.channels.clear();
+        return;
     }
     if (untold > 0) {
         faults.push_back(formatted("{}: {} more channels are left out", file.json.path(), untold));

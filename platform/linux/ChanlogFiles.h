@@ -51,7 +51,7 @@ private:
 
     [[nodiscard]] bool readFiles(int directory, const std::vector<std::string>& names, StructuredLog& log);
     [[nodiscard]] bool readFile(File& file, const FileState& state, StructuredLog& log);
-    static void takeChannels(File& file, const Value& array, StructuredLog& log);
+    static void readChannels(File& file, StructuredLog& log);
     /// Once for as long as the same is said.
     void report(StructuredLog& log, std::string fault);
 

@@ -44,26 +44,44 @@ std::string systemError(int number) {
 } // namespace
 
 std::optional<Dictionary> JsonFile::read(StructuredLog& log) {
-    const std::optional<Value> value = readOfKind(Value::Kind::dictionary, "an object", log);
-    return value ? std::optional(value->dictionaryValue()) : std::nullopt;
-}
-
-std::optional<Value> JsonFile::readArray(StructuredLog& log) {
-    return readOfKind(Value::Kind::array, "an array", log);
-}
-
-std::optional<Value> JsonFile::readOfKind(Value::Kind kind, std::string_view name, StructuredLog& log) {
-    std::optional<Value> value = readValue(log);
-    if (value && value->kind() != kind) {
-        report(log, formatted("line 1, column 1: not {}", name));
-        value.reset();
-    } else if (value) {
-        reportedFault_.clear();
+    const std::optional<std::string> text = readText(log);
+    if (!text) {
+        return std::nullopt;
     }
-    return value;
+    const std::variant<Value, JsonError> read = readJson(*text);
+    if (const JsonError* error = std::get_if<JsonError>(&read)) {
+        report(log, *error);
+        return std::nullopt;
+    }
+    const Value& value = std::get<Value>(read);
+    if (!value.isDictionary()) {
+        report(log, JsonError{1, 1, "not an object"});
+        return std::nullopt;
+    }
+    reportedFault_.clear();
+    return value.dictionaryValue();
 }
 
-std::optional<Value> JsonFile::readValue(StructuredLog& log) {
+bool JsonFile::readArray(const std::function<void(const JsonItem&)>& take, StructuredLog& log) {
+    const std::optional<std::string> text = readText(log);
+    if (!text) {
+        return false;
+    }
+    JsonElements elements(*text);
+    while (const JsonItem* element = elements.next()) {
+        if (element->kind != JsonItem::Kind::null) {
+            take(*element);
+        }
+    }
+    if (elements.error()) {
+        report(log, *elements.error());
+        return false;
+    }
+    reportedFault_.clear();
+    return true;
+}
+
+std::optional<std::string> JsonFile::readText(StructuredLog& log) {
     state_ = {};
     // Not blocking, or a pipe of that name would hold up the service until somebody writes into it.
     const FileDescriptor file(::open(path_.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY));
@@ -88,12 +106,11 @@ std::optional<Value> JsonFile::readValue(StructuredLog& log) {
         report(log, systemError(failure));
         return std::nullopt;
     }
-    std::variant<Value, JsonError> read = readJson(content);
-    if (const JsonError* error = std::get_if<JsonError>(&read)) {
-        report(log, formatted("line {}, column {}: {}", error->line, error->column, error->message));
-        return std::nullopt;
-    }
-    return std::get<Value>(std::move(read));
+    return content;
+}
+
+void JsonFile::report(StructuredLog& log, const JsonError& error) {
+    report(log, formatted("line {}, column {}: {}", error.line, error.column, error.message));
 }
 
 void JsonFile::report(StructuredLog& log, std::string_view fault) {

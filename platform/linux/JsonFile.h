@@ -1,10 +1,12 @@
 #pragma once
 
 #include "base/Dictionary.h"
+#include "base/JsonElements.h"
 #include "platform/StructuredLog.h"
 #include "platform/linux/FileState.h"
 
 #include <cstddef>
+#include <functional>
 #include <optional>
 #include <string>
 #include <string_view>
@@ -26,17 +28,17 @@ public:
         : path_(std::move(path)), maximumSize_(maximumSize) {}
 
     [[nodiscard]] std::optional<Dictionary> read(StructuredLog& log);
-    /// Of a file that holds an array.
-    [[nodiscard]] std::optional<Value> readArray(StructuredLog& log);
+    /// Reads a file that holds an array, element by element; null ones are skipped. Nothing of what was taken
+    /// counts unless the whole file was read: false otherwise.
+    [[nodiscard]] bool readArray(const std::function<void(const JsonItem&)>& take, StructuredLog& log);
     /// The file's state as it was just before it was read last; that of no file when there was none.
     [[nodiscard]] const FileState& state() const noexcept { return state_; }
     [[nodiscard]] const std::string& path() const noexcept { return path_; }
 
 private:
-    [[nodiscard]] std::optional<Value> readOfKind(Value::Kind kind, std::string_view name,
-                                                  StructuredLog& log);
-    [[nodiscard]] std::optional<Value> readValue(StructuredLog& log);
+    [[nodiscard]] std::optional<std::string> readText(StructuredLog& log);
     void report(StructuredLog& log, std::string_view fault);
+    void report(StructuredLog& log, const JsonError& error);
 
     std::string path_;
     std::size_t maximumSize_;

@@ -27,13 +27,17 @@ ChanlogChannels select(const ChanlogChannels& all, const ChanlogSelection& selec
     return selected;
 }
 
+bool areSame(const ChanlogChannelRef& left, const ChanlogChannelRef& right) noexcept {
+    return left == right || (left->channelName == right->channelName && left->format == right->format &&
+                             left->subGroupName == right->subGroupName &&
+                             left->groupName == right->groupName && left->driverName == right->driverName);
+}
+
 struct SameChannel {
-    bool operator()(const ChanlogChannel* left, const ChanlogChannel* right) const noexcept {
-        return left->channelName == right->channelName && left->format == right->format &&
-               left->subGroupName == right->subGroupName && left->groupName == right->groupName &&
-               left->driverName == right->driverName;
+    bool operator()(const ChanlogChannelRef& left, const ChanlogChannelRef& right) const noexcept {
+        return areSame(left, right);
     }
-    std::size_t operator()(const ChanlogChannel* channel) const noexcept {
+    std::size_t operator()(const ChanlogChannelRef& channel) const noexcept {
         const std::hash<std::string_view> hash;
         std::size_t sum = static_cast<std::size_t>(channel->format);
         for (const auto* name :
@@ -128,11 +132,16 @@ ChanlogChannels LinuxChanlogFacility::gather() {
     std::vector<ChanlogChannelRef> found;
     files_.appendTo(found);
     streams_.appendTo(found);
+    // As a rule only figures have changed, and what was found good of the channels before holds of these.
+    if (all_ != nullptr && std::equal(found.begin(), found.end(), all_->begin(), all_->end(), areSame)) {
+        isOverLimit_ = false;
+        return std::make_shared<const std::vector<ChanlogChannelRef>>(std::move(found));
+    }
     auto channels = std::make_shared<std::vector<ChanlogChannelRef>>();
     channels->reserve(std::min(found.size(), kMaximumChannels));
-    std::unordered_set<const ChanlogChannel*, SameChannel, SameChannel> known(found.size());
+    std::unordered_set<ChanlogChannelRef, SameChannel, SameChannel> known(found.size());
     for (const ChanlogChannelRef& channel : found) {
-        if (known.insert(channel.get()).second && channels->size() < kMaximumChannels) {
+        if (known.insert(channel).second && channels->size() < kMaximumChannels) {
             channels->push_back(channel);
         }
     }

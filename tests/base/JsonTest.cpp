@@ -1,4 +1,5 @@
 #include "base/Json.h"
+#include "base/JsonElements.h"
 #include "tests/base/RandomValues.h"
 
 #include <gtest/gtest.h>
@@ -20,6 +21,47 @@ std::string repeated(std::string_view piece, int count) {
         text += piece;
     }
     return text;
+}
+
+Value valueOf(const JsonItem& item) {
+    Array elements;
+    Dictionary members;
+    for (const JsonItem* inner = item.first(); inner != item.end(); inner = inner->next()) {
+        if (inner->kind != JsonItem::Kind::null) {
+            elements.push_back(valueOf(*inner));
+            members.set(inner->key, elements.back());
+        }
+    }
+    switch (item.kind) {
+    case JsonItem::Kind::text:
+        return item.text;
+    case JsonItem::Kind::array:
+        return elements;
+    case JsonItem::Kind::object:
+        return members;
+    default:
+        return item.scalar;
+    }
+}
+
+/// Reading an array element by element finds what reading it as a value does, its errors included.
+void expectSameByElements(const std::string& element) {
+    const std::string text = "[" + element + "]";
+    const auto whole = readJson(text);
+    JsonElements elements(text);
+    Array found;
+    while (const JsonItem* item = elements.next()) {
+        if (item->kind != JsonItem::Kind::null) {
+            found.push_back(valueOf(*item));
+        }
+    }
+    ASSERT_EQ(elements.error().has_value(), std::holds_alternative<JsonError>(whole)) << text;
+    if (elements.error()) {
+        EXPECT_EQ(elements.error()->message, std::get<JsonError>(whole).message) << text;
+        EXPECT_EQ(elements.error()->column, std::get<JsonError>(whole).column) << text;
+    } else {
+        EXPECT_EQ(Value(found), std::get<Value>(whole)) << text;
+    }
 }
 
 TEST(JsonWriter, WritesEveryKind) {
@@ -173,6 +215,8 @@ TEST(JsonReader, SaysWhatIsWrongAndWhere) {
         {"{\"a\":1,}", 1, 8, "key in quotes"},
         {"{a:1}", 1, 2, "key in quotes"},
         {"{\"a\":1,\n \"\xC3\xA9\":2, \"a\":3}", 2, 9, "\"a\" stands here a second time"},
+        {R"({"1":0,"2":0,"3":0,"4":0,"5":0,"6":0,"7":0,"8":0,"9":0,"a":0,"b":0,"c":0,"d":0,"e":0,"f":0,"g":0,"1":0})",
+         1, 98, "\"1\" stands here a second time"},
         {"\"abc", 1, 1, "does not end"},
         {"\"abc\\", 1, 6, "escape"},
         {"\"a\nb\"", 1, 3, "escaped"},
@@ -196,6 +240,7 @@ TEST(JsonReader, SaysWhatIsWrongAndWhere) {
         EXPECT_EQ(error.line, row.line) << row.text << ": " << error.message;
         EXPECT_EQ(error.column, row.column) << row.text << ": " << error.message;
         EXPECT_NE(error.message.find(row.says), std::string::npos) << row.text << ": " << error.message;
+        expectSameByElements(row.text);
     }
     const auto refused = readJson("{\"a\":\n[1, null]}", {.refuseNull = true});
     ASSERT_TRUE(std::holds_alternative<JsonError>(refused));
@@ -232,6 +277,7 @@ TEST(Json, AcceptsNoMoreThanAnIndependentImplementation) {
                 text.erase(at, 1);
             }
         }
+        expectSameByElements(text);
         // Theirs lets a null, a key that stands twice and a number that is too large pass; ours does not.
         const bool ours = std::holds_alternative<Value>(readJson(text));
         const auto theirs = nlohmann::json::parse(text, nullptr, false);

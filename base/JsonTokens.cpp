@@ -1,0 +1,350 @@
+#include "base/JsonTokens.h"
+
+#include "base/Format.h"
+#include "base/Utf8.h"
+
+#include <algorithm>
+#include <array>
+#include <charconv>
+#include <cstdint>
+#include <utility>
+
+namespace tamblo {
+
+namespace {
+
+constexpr int kMaximumDepth = 32;
+
+bool isDigit(char character) noexcept {
+    return character >= '0' && character <= '9';
+}
+
+std::string nameOf(char character) {
+    if (character == '\'') {
+        return "an apostrophe";
+    }
+    if (character > ' ' && character < 0x7F) {
+        return formatted("'{}'", std::string_view(&character, 1));
+    }
+    return formatted("the byte {}", static_cast<unsigned>(static_cast<unsigned char>(character)));
+}
+
+/// Line and column of an offset; a column is a character, not a byte.
+JsonError errorAt(std::string_view text, std::size_t offset, std::string message) {
+    JsonError error{1, 1, std::move(message)};
+    for (const char character : text.substr(0, offset)) {
+        if (character == '\n') {
+            ++error.line;
+            error.column = 1;
+        } else if (!isUtf8Continuation(character)) {
+            ++error.column;
+        }
+    }
+    return error;
+}
+
+/// Whether a number that no double can hold is too small for one, not too large: what counts is the power of
+/// ten in front of which its first digit that is not 0 stands.
+bool isTiny(std::string_view number) noexcept {
+    const std::size_t exponentAt = std::min(number.find_first_of("eE"), number.size());
+    const std::string_view digits = number.substr(0, exponentAt);
+    const std::size_t point = std::min(digits.find('.'), digits.size());
+    const std::size_t first = digits.find_first_of("123456789");
+    if (first == std::string_view::npos) {
+        return true;
+    }
+    if (exponentAt == number.size()) {
+        return first > point;
+    }
+    number.remove_prefix(exponentAt + 1);
+    const bool negative = number.starts_with('-');
+    if (!isDigit(number.front())) {
+        number.remove_prefix(1);
+    }
+    std::int64_t exponent = 0;
+    const auto result = std::from_chars(number.data(), number.data() + number.size(), exponent);
+    if (result.ec != std::errc()) {
+        return negative;
+    }
+    return (negative ? -exponent : exponent) + static_cast<std::int64_t>(point) -
+               static_cast<std::int64_t>(first) <
+           0;
+}
+
+void appendUtf8(std::string& out, std::uint32_t code) {
+    const auto unit = [&out](std::uint32_t byte) { out += static_cast<char>(byte); };
+    if (code < 0x80) {
+        unit(code);
+    } else if (code < 0x800) {
+        unit(0xC0U | code >> 6U);
+        unit(0x80U | (code & 0x3FU));
+    } else if (code < 0x10000) {
+        unit(0xE0U | code >> 12U);
+        unit(0x80U | (code >> 6U & 0x3FU));
+        unit(0x80U | (code & 0x3FU));
+    } else {
+        unit(0xF0U | code >> 18U);
+        unit(0x80U | (code >> 12U & 0x3FU));
+        unit(0x80U | (code >> 6U & 0x3FU));
+        unit(0x80U | (code & 0x3FU));
+    }
+}
+
+/// Of each byte whether it stands for itself in a text, and is ASCII.
+constexpr auto kIsPlainAscii = [] {
+    std::array<bool, 256> isPlain{};
+    for (std::size_t byte = 0x20; byte < 0x80; ++byte) {
+        isPlain[byte] = byte != '"' && byte != '\\';
+    }
+    return isPlain;
+}();
+
+bool isPlainAscii(char character) noexcept {
+    return kIsPlainAscii[static_cast<unsigned char>(character)];
+}
+
+} // namespace
+
+std::string JsonTokens::found() const {
+    return atEnd() ? "the end of the text" : nameOf(peek());
+}
+
+bool JsonTokens::failAt(std::size_t offset, std::string message) {
+    if (!error_) {
+        error_ = errorAt(text_, offset, std::move(message));
+    }
+    return false;
+}
+
+bool JsonTokens::takeLiteral(std::string_view literal) {
+    if (!text_.substr(at_).starts_with(literal)) {
+        return fail(formatted("a value is expected; a word that begins like this can only be {}", literal));
+    }
+    at_ += literal.size();
+    return true;
+}
+
+bool JsonTokens::takeDigits() {
+    if (!isDigit(peek())) {
+        return fail(formatted("a digit is expected, not {}", found()));
+    }
+    while (isDigit(peek())) {
+        ++at_;
+    }
+    return true;
+}
+
+bool JsonTokens::takeNumberText(bool& isInteger) {
+    isInteger = true;
+    take('-');
+    if (take('0')) {
+        if (isDigit(peek())) {
+            return fail("a number does not begin with 0");
+        }
+    } else if (!takeDigits()) {
+        return false;
+    }
+    if (take('.')) {
+        isInteger = false;
+        if (!takeDigits()) {
+            return false;
+        }
+    }
+    if (take('e') || take('E')) {
+        isInteger = false;
+        if (!take('+')) {
+            take('-');
+        }
+        return takeDigits();
+    }
+    return true;
+}
+
+/// A signed integer, where all of the number is one; takes nothing otherwise.
+bool JsonTokens::takeUsualInteger(Value& number) {
+    const char* const begin = text_.data() + at_;
+    const char* const end = text_.data() + text_.size();
+    std::int64_t integer = 0;
+    const auto [behind, failure] = std::from_chars(begin, end, integer);
+    if (failure != std::errc()) {
+        return false;
+    }
+    const char* const digits = *begin == '-' ? begin + 1 : begin;
+    const bool hasMore = behind != end && (*behind == '.' || *behind == 'e' || *behind == 'E');
+    if (hasMore || (*digits == '0' && behind != digits + 1)) {
+        return false;
+    }
+    at_ += static_cast<std::size_t>(behind - begin);
+    number = Value(integer);
+    return true;
+}
+
+bool JsonTokens::takeNumber(Value& number) {
+    if (peek() != '-' && !isDigit(peek())) {
+        return fail(formatted("a value is expected, not {}", found()));
+    }
+    if (takeUsualInteger(number)) {
+        return true;
+    }
+    const std::size_t start = at_;
+    bool isInteger = false;
+    if (!takeNumberText(isInteger)) {
+        return false;
+    }
+    const std::string_view text = text_.substr(start, at_ - start);
+    const char* const begin = text.data();
+    const char* const end = begin + text.size();
+    if (std::uint64_t integer = 0; isInteger && std::from_chars(begin, end, integer).ec == std::errc()) {
+        number = Value(integer);
+        return true;
+    }
+    double real = 0;
+    if (std::from_chars(begin, end, real).ec != std::errc()) {
+        if (!isTiny(text)) {
+            return failAt(start, "the number is too large");
+        }
+        real = text.front() == '-' ? -0.0 : 0.0;
+    }
+    number = Value(real);
+    return true;
+}
+
+bool JsonTokens::takeString(std::string_view& text) {
+    const std::size_t start = at_++;
+    if (!takePlain(start, text)) {
+        return false;
+    }
+    if (take('"')) {
+        return true;
+    }
+    std::string& whole = unescaped_.emplace_back(text);
+    while (!take('"')) {
+        if (atEnd()) {
+            return failAt(start, "the text that begins here does not end");
+        }
+        if (!take('\\')) {
+            return fail(formatted("{} must be escaped in a text", found()));
+        }
+        std::string_view plain;
+        if (!takeEscape(whole) || !takePlain(start, plain)) {
+            return false;
+        }
+        whole += plain;
+    }
+    text = whole;
+    return true;
+}
+
+/// The run of a text that begins at `start` up to what is not plain.
+bool JsonTokens::takePlain(std::size_t start, std::string_view& plain) {
+    const char* const first = text_.data() + at_;
+    const char* const end = text_.data() + text_.size();
+    const char* last = std::find_if_not(first, end, isPlainAscii);
+    const bool isAscii = last == end || static_cast<unsigned char>(*last) < 0x80;
+    if (!isAscii) {
+        last = std::find_if_not(last, end, [](char character) {
+            return isPlainAscii(character) || static_cast<unsigned char>(character) >= 0x80;
+        });
+    }
+    plain = {first, static_cast<std::size_t>(last - first)};
+    at_ += plain.size();
+    return isAscii || isUtf8(plain) || failAt(start, "the text that begins here is not UTF-8");
+}
+
+bool JsonTokens::takeEscape(std::string& out) {
+    const std::size_t start = at_ - 1;
+    if (atEnd()) {
+        return fail("the text ends in an escape");
+    }
+    const char escape = text_[at_++];
+    switch (escape) {
+    case '"':
+    case '\\':
+    case '/':
+        out += escape;
+        return true;
+    case 'b':
+        out += '\b';
+        return true;
+    case 'f':
+        out += '\f';
+        return true;
+    case 'n':
+        out += '\n';
+        return true;
+    case 'r':
+        out += '\r';
+        return true;
+    case 't':
+        out += '\t';
+        return true;
+    case 'u':
+        return takeUnicodeEscape(out, start);
+    default:
+        return failAt(start, formatted("there is no escape of {}", nameOf(escape)));
+    }
+}
+
+bool JsonTokens::takeCodeUnit(std::uint32_t& unit) {
+    const std::string_view digits = text_.substr(at_, 4);
+    const auto result = std::from_chars(digits.data(), digits.data() + digits.size(), unit, 16);
+    if (digits.size() != 4 || result.ec != std::errc() || result.ptr != digits.data() + 4) {
+        return fail("four hexadecimal digits are expected");
+    }
+    at_ += 4;
+    return true;
+}
+
+bool JsonTokens::takeUnicodeEscape(std::string& out, std::size_t start) {
+    std::uint32_t code = 0;
+    if (!takeCodeUnit(code)) {
+        return false;
+    }
+    if (code >= 0xD800 && code < 0xE000) {
+        std::uint32_t low = 0;
+        const bool paired = code < 0xDC00 && text_.substr(at_).starts_with("\\u");
+        at_ += paired ? 2 : 0;
+        if (paired && !takeCodeUnit(low)) {
+            return false;
+        }
+        if (low < 0xDC00 || low >= 0xE000) {
+            return failAt(start, "half of a surrogate pair stands alone");
+        }
+        code = 0x10000 + ((code - 0xD800) << 10U) + (low - 0xDC00);
+    }
+    appendUtf8(out, code);
+    return true;
+}
+
+bool JsonTokens::takeKey(std::string_view& key) {
+    if (peek() != '"') {
+        return fail(formatted("a key in quotes is expected, not {}", found()));
+    }
+    if (!takeString(key)) {
+        return false;
+    }
+    skipSpace();
+    return take(':') || fail(formatted("a colon is expected behind the key, not {}", found()));
+}
+
+bool JsonTokens::takeOpening(int depth) {
+    if (depth > kMaximumDepth) {
+        return fail(formatted("values are nested deeper than {}", kMaximumDepth));
+    }
+    ++at_;
+    return true;
+}
+
+bool JsonTokens::takeCommaOrClosing(char closing, bool& isClosed) {
+    skipSpace();
+    isClosed = take(closing);
+    return isClosed || take(',') ||
+           fail(formatted("a comma or '{}' is expected, not {}", std::string_view(&closing, 1), found()));
+}
+
+bool JsonTokens::takeEnd() {
+    skipSpace();
+    return atEnd() || fail(formatted("{} stands behind the end of the value", found()));
+}
+
+} // namespace tamblo
