@@ -101,9 +101,9 @@ TEST_F(LinuxChanlogFilesTest, ChannelsAreReadAndSelected) {
     EXPECT_THAT(log.take(), IsEmpty());
 }
 
-TEST_F(LinuxChanlogFilesTest, TheFileOnThePageOfMessagesIsGood) {
+TEST_F(LinuxChanlogFilesTest, TheFileOnThePageIsGood) {
     std::ostringstream page;
-    page << std::ifstream(EXAMPLES_DIR "/../docs/messages.md").rdbuf();
+    page << std::ifstream(EXAMPLES_DIR "/../docs/driver-statistics.md").rdbuf();
     const std::string text = page.str();
     const std::size_t start = text.find("\n[{");
     publish("a.json", text.substr(start, text.find("```", start) - start));
