@@ -10,9 +10,9 @@ namespace tamblo {
 
 /// The last lines of the log, for those who want to know what led to something.
 ///
-/// Kept in every process, as nobody knows beforehand when that will be; what it costs is a copy of a line
-/// that was formatted anyway, and memory for no more than was logged: a service at its usual level, which
-/// writes a handful of lines, holds some kilobytes. Bounded in lines and in bytes; the oldest go first. Any
+/// Kept on every build, as the log is there before it is known which; what it costs is a copy of a line that
+/// was formatted anyway, and memory for no more than was logged: a service at its usual level, which writes a
+/// handful of lines, holds some kilobytes. Bounded in lines and in bytes; the oldest go first. Any
 /// thread; the lock is held for a copy.
 class LogRing {
 public:
