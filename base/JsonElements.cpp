@@ -7,18 +7,34 @@ namespace tamblo {
 
 namespace {
 
-bool anyStandsTwice(std::vector<std::string_view>& keys) {
-    constexpr std::size_t kFew = 16; // up to which comparing each with each is quicker than sorting
-    if (keys.size() > kFew) {
-        std::sort(keys.begin(), keys.end());
-        return std::adjacent_find(keys.begin(), keys.end()) != keys.end();
-    }
-    for (auto key = keys.begin(); key != keys.end(); ++key) {
-        if (std::find(keys.begin(), key, *key) != key) {
-            return true;
+/// Whether all members' keys differ in a number of few bits that is made of each: mostly so where they
+/// differ.
+bool differAtAGlance(const JsonItem& object) noexcept {
+    std::uint64_t seen = 0;
+    for (const JsonItem* member = object.first(); member != object.end(); member = member->next()) {
+        const std::string_view key = member->key;
+        const std::size_t ends =
+            key.empty() ? 0
+                        : static_cast<unsigned char>(key.front()) + static_cast<unsigned char>(key.back());
+        const std::uint64_t bit = std::uint64_t{1} << ((key.size() * 3 + ends) % 64);
+        if ((seen & bit) != 0) {
+            return false;
         }
+        seen |= bit;
     }
-    return false;
+    return true;
+}
+
+bool anyStandsTwice(const JsonItem& object) {
+    if (differAtAGlance(object)) {
+        return false;
+    }
+    std::vector<std::string_view> keys;
+    for (const JsonItem* member = object.first(); member != object.end(); member = member->next()) {
+        keys.push_back(member->key);
+    }
+    std::sort(keys.begin(), keys.end());
+    return std::adjacent_find(keys.begin(), keys.end()) != keys.end();
 }
 
 } // namespace
@@ -112,12 +128,7 @@ bool JsonElements::readMembers(std::size_t object, int depth) {
         }
     }
     items_[object].count = items_.size() - object;
-    keys_.clear();
-    const JsonItem& item = items_[object];
-    for (const JsonItem* member = item.first(); member != item.end(); member = member->next()) {
-        keys_.push_back(member->key);
-    }
-    return !anyStandsTwice(keys_) || failAsValue("a key stands twice in an object");
+    return !anyStandsTwice(items_[object]) || failAsValue("a key stands twice in an object");
 }
 
 /// Keeps the error that reading the text as a value meets first; another one when it meets none.

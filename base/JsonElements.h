@@ -56,7 +56,6 @@ private:
     bool isBegun_ = false;
     bool isEnded_ = false;
     std::vector<JsonItem> items_; ///< of one element
-    std::vector<std::string_view> keys_;
     std::optional<JsonError> error_;
 };
 

@@ -116,6 +116,10 @@ bool JsonTokens::failAt(std::size_t offset, std::string message) {
     return false;
 }
 
+bool JsonTokens::failExpecting(std::string_view what) {
+    return fail(formatted("{}, not {}", what, found()));
+}
+
 bool JsonTokens::takeLiteral(std::string_view literal) {
     if (!text_.substr(at_).starts_with(literal)) {
         return fail(formatted("a value is expected; a word that begins like this can only be {}", literal));
@@ -126,7 +130,7 @@ bool JsonTokens::takeLiteral(std::string_view literal) {
 
 bool JsonTokens::takeDigits() {
     if (!isDigit(peek())) {
-        return fail(formatted("a digit is expected, not {}", found()));
+        return failExpecting("a digit is expected");
     }
     while (isDigit(peek())) {
         ++at_;
@@ -181,7 +185,7 @@ bool JsonTokens::takeUsualInteger(Value& number) {
 
 bool JsonTokens::takeNumber(Value& number) {
     if (peek() != '-' && !isDigit(peek())) {
-        return fail(formatted("a value is expected, not {}", found()));
+        return failExpecting("a value is expected");
     }
     if (takeUsualInteger(number)) {
         return true;
@@ -209,14 +213,8 @@ bool JsonTokens::takeNumber(Value& number) {
     return true;
 }
 
-bool JsonTokens::takeString(std::string_view& text) {
-    const std::size_t start = at_++;
-    if (!takePlain(start, text)) {
-        return false;
-    }
-    if (take('"')) {
-        return true;
-    }
+/// The rest of a text, of which the next character is not plain, behind what was taken of it already.
+bool JsonTokens::takeEscaped(std::size_t start, std::string_view& text) {
     std::string& whole = unescaped_.emplace_back(text);
     while (!take('"')) {
         if (atEnd()) {
@@ -316,17 +314,6 @@ bool JsonTokens::takeUnicodeEscape(std::string& out, std::size_t start) {
     return true;
 }
 
-bool JsonTokens::takeKey(std::string_view& key) {
-    if (peek() != '"') {
-        return fail(formatted("a key in quotes is expected, not {}", found()));
-    }
-    if (!takeString(key)) {
-        return false;
-    }
-    skipSpace();
-    return take(':') || fail(formatted("a colon is expected behind the key, not {}", found()));
-}
-
 bool JsonTokens::takeOpening(int depth) {
     if (depth > kMaximumDepth) {
         return fail(formatted("values are nested deeper than {}", kMaximumDepth));
@@ -335,11 +322,8 @@ bool JsonTokens::takeOpening(int depth) {
     return true;
 }
 
-bool JsonTokens::takeCommaOrClosing(char closing, bool& isClosed) {
-    skipSpace();
-    isClosed = take(closing);
-    return isClosed || take(',') ||
-           fail(formatted("a comma or '{}' is expected, not {}", std::string_view(&closing, 1), found()));
+bool JsonTokens::failAtSeparator(char closing) {
+    return failExpecting(formatted("a comma or '{}' is expected", std::string_view(&closing, 1)));
 }
 
 bool JsonTokens::takeEnd() {

@@ -49,6 +49,9 @@ private:
     [[nodiscard]] bool atEnd() const noexcept { return at_ == text_.size(); }
     [[nodiscard]] std::string found() const;
 
+    bool failExpecting(std::string_view what);
+    bool failAtSeparator(char closing);
+    bool takeEscaped(std::size_t start, std::string_view& text);
     bool takePlain(std::size_t start, std::string_view& plain);
     bool takeUsualInteger(Value& number);
     bool takeDigits();
@@ -75,6 +78,28 @@ inline bool JsonTokens::take(char character) noexcept {
     }
     ++at_;
     return true;
+}
+
+inline bool JsonTokens::takeString(std::string_view& text) {
+    const std::size_t start = at_++;
+    return takePlain(start, text) && (take('"') || takeEscaped(start, text));
+}
+
+inline bool JsonTokens::takeKey(std::string_view& key) {
+    if (peek() != '"') {
+        return failExpecting("a key in quotes is expected");
+    }
+    if (!takeString(key)) {
+        return false;
+    }
+    skipSpace();
+    return take(':') || failExpecting("a colon is expected behind the key");
+}
+
+inline bool JsonTokens::takeCommaOrClosing(char closing, bool& isClosed) {
+    skipSpace();
+    isClosed = take(closing);
+    return isClosed || take(',') || failAtSeparator(closing);
 }
 
 } // namespace tamblo

@@ -37,6 +37,9 @@ constexpr DriverNames kDrivers[] = {{"VandraAE2MCA", nullptr},
 /// Room in a payload for what the session adds: timestamp, tag, application and the mark of an own timestamp.
 constexpr std::size_t kKeysToBeAdded = 4;
 
+/// Of a key, and of the text of a state or histogram with a few entries.
+constexpr std::size_t kUsualLength = 120;
+
 ZRReportingDriver driverOf(const DriverNames& names) {
     const auto name = [](const char* text) {
         return text != nullptr ? ZRReportingDriver::Name(text) : std::nullopt;
@@ -213,7 +216,6 @@ void ZRReportingDriverUtility::sendDriverLogsForSession(const std::shared_ptr<ZR
 
 std::string ZRReportingDriverUtility::getDriverStatsKey(const ChanlogChannel& channel,
                                                         std::string_view type) {
-    constexpr std::size_t kUsualLength = 120;
     std::string key;
     key.reserve(kUsualLength);
     const auto add = [&key](std::string_view name) {
@@ -264,6 +266,7 @@ void ZRReportingDriverUtility::processHistogramData(const ChanlogChannel& channe
     }
     hits.pop_back();
     std::string text;
+    text.reserve(kUsualLength);
     appendFormatted(text, "count={},lower={},upper={},min={},max={},unit={}::{}", channel.buckets.size(),
                     lower, upper, channel.minimum, channel.maximum, textOf(channel.unitLabel), hits);
     driverStats.insert_or_assign(getDriverStatsKey(channel, "Histogram"), Value(text));
@@ -271,6 +274,7 @@ void ZRReportingDriverUtility::processHistogramData(const ChanlogChannel& channe
 
 void ZRReportingDriverUtility::processStateData(const ChanlogChannel& channel, DriverStats& driverStats) {
     std::string text;
+    text.reserve(kUsualLength);
     for (const ChanlogState& state : channel.states) {
         if (state.residency != 0) {
             appendFormatted(text, "name:{},transition:{},residency:{},duty_cycle:{};", state.name,

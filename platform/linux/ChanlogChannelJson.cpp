@@ -58,14 +58,14 @@ public:
         return std::move(found).value_or(std::string());
     }
     std::int64_t integer(std::string_view name) {
-        const Value number = scalar(name);
+        const Value& number = scalar(name);
         if (number.kind() != Value::Kind::integer) {
             fail(name, "is no signed 64-bit integer");
         }
         return number.integerValue();
     }
     std::uint64_t count(std::string_view name) {
-        const Value number = scalar(name);
+        const Value& number = scalar(name);
         if (number.kind() != Value::Kind::unsignedInteger &&
             (number.kind() != Value::Kind::integer || number.rawInteger() < 0)) {
             fail(name, "is no unsigned 64-bit integer");
@@ -119,12 +119,13 @@ private:
         return found;
     }
     /// The boolean false, which is no number of any kind, when there is none.
-    Value scalar(std::string_view name) {
+    const Value& scalar(std::string_view name) {
+        static const Value none;
         const JsonItem* item = find(name);
         if (item == nullptr) {
             fail(name, "is missing");
         }
-        return item != nullptr ? item->scalar : Value();
+        return item != nullptr ? item->scalar : none;
     }
 
     const JsonItem& object_;

@@ -29,12 +29,13 @@ bool isChannelFile(std::string_view name) noexcept {
     return name.ends_with(".json") && !name.starts_with('.');
 }
 
-std::vector<std::string> channelFilesIn(DIR* directory) {
+/// Sorted. Nothing when the directory has too many entries to look through.
+std::optional<std::vector<std::string>> channelFilesIn(DIR* directory) {
     std::vector<std::string> names;
-    for (std::size_t count = 0; count < ChanlogFiles::kMaximumEntries; ++count) {
-        const dirent* entry = ::readdir(directory);
-        if (entry == nullptr) {
-            break;
+    std::size_t count = 0;
+    while (const dirent* entry = ::readdir(directory)) {
+        if (++count > ChanlogFiles::kMaximumEntries) {
+            return std::nullopt;
         }
         if (isChannelFile(entry->d_name)) {
             names.emplace_back(entry->d_name);
@@ -65,14 +66,17 @@ bool wasOld(const FileState& state, const timespec& moment) noexcept {
 
 bool ChanlogFiles::read(StructuredLog& log) {
     const std::unique_ptr<DIR, int (*)(DIR*)> directory(::opendir(directory_.c_str()), ::closedir);
-    if (directory == nullptr) {
-        const bool isMissing = errno == ENOENT || errno == ENOTDIR;
-        report(log, isMissing ? std::string()
-                              : formatted("{}: {}; no driver statistics are had from there", directory_,
-                                          std::generic_category().message(errno)));
-        return !std::exchange(files_, {}).empty();
+    const int failure = directory == nullptr ? errno : 0;
+    const auto names = directory != nullptr ? channelFilesIn(directory.get()) : std::nullopt;
+    if (names) {
+        return readFiles(::dirfd(directory.get()), *names, log);
     }
-    return readFiles(::dirfd(directory.get()), channelFilesIn(directory.get()), log);
+    const bool isMissing = failure == ENOENT || failure == ENOTDIR;
+    const std::string fault = failure != 0 ? std::generic_category().message(failure)
+                                           : formatted("more than {} entries", kMaximumEntries);
+    report(log, isMissing ? std::string()
+                          : formatted("{}: {}; no driver statistics are had from there", directory_, fault));
+    return !std::exchange(files_, {}).empty();
 }
 
 bool ChanlogFiles::readFiles(int directory, const std::vector<std::string>& names, StructuredLog& log) {

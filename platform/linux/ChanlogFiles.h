@@ -26,7 +26,8 @@ public:
     static constexpr std::size_t kMaximumFiles = 256;
     static constexpr std::size_t kMaximumFileSize = 1U << 20U;  ///< bytes
     static constexpr std::size_t kMaximumTotalSize = 4U << 20U; ///< bytes
-    /// Of the directory, whatever they are: more are not looked at.
+    /// Of the directory, whatever they are, "." and ".." included. With more, which of them would be looked
+    /// at is left to chance, so that none is.
     static constexpr std::size_t kMaximumEntries = 4096;
     /// Lines about channels of one file; the others are counted in one more.
     static constexpr std::size_t kMaximumFaultsTold = 8;

@@ -238,6 +238,22 @@ TEST_F(LinuxChanlogFilesTest, LimitsHoldAndAreToldOnce) {
                 ElementsAre(HasSubstr("/c1005.json: more than 256 files or 4194304 bytes in all")));
 }
 
+TEST_F(LinuxChanlogFilesTest, ADirectoryThatIsFullOfOtherThingsIsToldOf) {
+    publish("a.json", "[" + simple("a", "1") + "]");
+    const std::size_t others = ChanlogFiles::kMaximumEntries - 3; // besides ".", ".." and the file
+    for (std::size_t i = 0; i < others; ++i) {
+        publish(formatted("other{}", i), "");
+    }
+    EXPECT_EQ(now(), "a=1");
+    publish("one more", "");
+    EXPECT_EQ(now(), "");
+    EXPECT_EQ(now(), "");
+    EXPECT_THAT(log.take(), ElementsAre(HasSubstr("/chanlog: more than 4096 entries; no driver statistics")));
+    std::filesystem::remove(root.path("chanlog/one more"));
+    EXPECT_EQ(now(), "a=1");
+    EXPECT_THAT(log.take(), IsEmpty());
+}
+
 TEST_F(LinuxChanlogFilesTest, DifferencesAreGains) {
     const auto states = [](const std::string& list) {
         return R"([{"name": "s", "format": "state", "states": [)" + list + "]}]";
