@@ -1,4 +1,5 @@
 #include "base/Json.h"
+#include "base/JsonElements.h"
 
 #include <cstddef>
 #include <cstdint>
@@ -17,10 +18,15 @@ void require(bool holds) {
 }
 
 /// What was read and is written again reads back as the same value and is written as the same text; what is
-/// refused is refused at a place in the text.
+/// refused is refused at a place in the text. An array is read by its elements exactly when it is as a value.
 void checkJson(std::string_view text) {
     const auto first = readJson(text);
     const auto strict = readJson(text, {.refuseNull = true});
+    JsonElements elements(text);
+    while (elements.next() != nullptr) {
+    }
+    const auto* read = std::get_if<Value>(&first);
+    require(elements.error().has_value() == (read == nullptr || !read->isArray()));
     if (const auto* error = std::get_if<JsonError>(&first)) {
         require(std::holds_alternative<JsonError>(strict));
         require(error->line >= 1 && error->column >= 1 && !error->message.empty());
