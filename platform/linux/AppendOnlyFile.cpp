@@ -124,21 +124,14 @@ std::size_t AppendOnlyFile::linesThatFit(std::string_view lines) const noexcept 
 }
 
 bool AppendOnlyFile::writeFully(std::string_view& lines, std::size_t length) {
-    std::size_t written = 0;
-    while (written < length) {
-        const ssize_t count = operations_.write(descriptor_, lines.data() + written, length - written);
-        if (count < 0 && errno == EINTR) {
-            continue;
-        }
-        if (count <= 0) {
-            errno = count == 0 ? ENOSPC : errno;
-            const bool result = failed("write");
-            const std::size_t whole = wholeLines(lines, written);
-            cutTornLine(written - whole);
-            lines.remove_prefix(whole);
-            return result;
-        }
-        written += static_cast<std::size_t>(count);
+    std::string_view rest = lines.substr(0, length);
+    if (!operations_.writeAll(descriptor_, rest)) {
+        const bool result = failed("write");
+        const std::size_t written = length - rest.size();
+        const std::size_t whole = wholeLines(lines, written);
+        cutTornLine(written - whole);
+        lines.remove_prefix(whole);
+        return result;
     }
     size_ += length;
     lines.remove_prefix(length);

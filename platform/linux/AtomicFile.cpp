@@ -2,6 +2,7 @@
 
 #include "base/Format.h"
 #include "platform/linux/FileDescriptor.h"
+#include "platform/linux/FileOperations.h"
 
 #include <atomic>
 #include <cerrno>
@@ -35,27 +36,12 @@ FileDescriptor createAnew(const std::string& path) {
     return FileDescriptor(descriptor);
 }
 
-/// False with the reason in `errno`, as below.
-bool writeFully(int descriptor, std::string_view content) {
-    while (!content.empty()) {
-        const ssize_t count = ::write(descriptor, content.data(), content.size());
-        if (count < 0 && errno == EINTR) {
-            continue;
-        }
-        if (count <= 0) {
-            errno = count == 0 ? ENOSPC : errno;
-            return false;
-        }
-        content.remove_prefix(static_cast<std::size_t>(count));
-    }
-    return true;
-}
-
+/// False with the reason in `errno`.
 bool fill(int descriptor, std::string_view content, const std::string& replaced) {
     struct stat status {};
     const bool modeIsRight = ::lstat(replaced.c_str(), &status) != 0 || !S_ISREG(status.st_mode) ||
                              ::fchmod(descriptor, status.st_mode & kPermissions) == 0;
-    return modeIsRight && writeFully(descriptor, content);
+    return modeIsRight && FileOperations::system().writeAll(descriptor, content);
 }
 
 } // namespace

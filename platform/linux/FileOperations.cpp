@@ -1,5 +1,6 @@
 #include "platform/linux/FileOperations.h"
 
+#include <cerrno>
 #include <cstdio>
 #include <ctime>
 
@@ -44,6 +45,21 @@ std::chrono::nanoseconds FileOperations::coarseTime() noexcept {
     timespec time{};
     ::clock_gettime(CLOCK_MONOTONIC_COARSE, &time);
     return std::chrono::seconds(time.tv_sec) + std::chrono::nanoseconds(time.tv_nsec);
+}
+
+bool FileOperations::writeAll(int descriptor, std::string_view& text) noexcept {
+    while (!text.empty()) {
+        const ssize_t count = write(descriptor, text.data(), text.size());
+        if (count < 0 && errno == EINTR) {
+            continue;
+        }
+        if (count <= 0) {
+            errno = count == 0 ? ENOSPC : errno;
+            return false;
+        }
+        text.remove_prefix(static_cast<std::size_t>(count));
+    }
+    return true;
 }
 
 FileOperations& FileOperations::system() noexcept {

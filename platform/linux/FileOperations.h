@@ -2,14 +2,15 @@
 
 #include <chrono>
 #include <cstddef>
+#include <string_view>
 
 #include <sys/stat.h>
 #include <sys/types.h>
 
 namespace tamblo {
 
-/// The system calls behind a sink file, as they are: -1 and `errno` on failure. A test derives from this
-/// class and makes single ones fail.
+/// The system calls behind files that are written, as they are: -1 and `errno` on failure. A test derives
+/// from this class and makes single ones fail.
 class FileOperations {
 public:
     virtual ~FileOperations() = default;
@@ -23,6 +24,10 @@ public:
     virtual int rename(const char* from, const char* to) noexcept;
     /// A clock that is cheap to read and advances every few milliseconds.
     virtual std::chrono::nanoseconds coarseTime() noexcept;
+
+    /// Writes again until all is written; what is written is taken off the front. False, with the reason in
+    /// `errno`, when a write fails or gets nowhere (`ENOSPC`).
+    [[nodiscard]] bool writeAll(int descriptor, std::string_view& text) noexcept;
 
     /// The system calls themselves.
     static FileOperations& system() noexcept;

@@ -65,17 +65,7 @@ public:
     LinuxReportFile& operator=(const LinuxReportFile&) = delete;
 
     std::optional<std::string> write(std::string_view text) override {
-        while (!text.empty()) {
-            const ssize_t count = operations_.write(descriptor_, text.data(), text.size());
-            if (count < 0 && errno == EINTR) {
-                continue;
-            }
-            if (count <= 0) {
-                return textOf(count == 0 ? ENOSPC : errno);
-            }
-            text.remove_prefix(static_cast<std::size_t>(count));
-        }
-        return std::nullopt;
+        return operations_.writeAll(descriptor_, text) ? std::nullopt : std::optional(textOf(errno));
     }
 
     std::optional<std::string> close() override {
