@@ -130,7 +130,7 @@ inline bool KeySet::is(std::size_t index, std::string_view key) const noexcept {
     }
     const char* const mine = text_.get() + entry.offset;
     if (key.size() < 8 || key.size() > 24) {
-        return std::memcmp(mine, key.data(), key.size()) == 0;
+        return key.empty() || std::memcmp(mine, key.data(), key.size()) == 0;
     }
     // Most keys are of this length: three words, which may overlap, cover them without a call.
     const auto differ = [mine, &key](std::size_t at) {
