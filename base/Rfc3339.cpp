@@ -3,6 +3,7 @@
 #include <chrono>
 #include <cmath>
 #include <cstdint>
+#include <string_view>
 
 namespace tamblo {
 
@@ -57,6 +58,15 @@ std::optional<std::string> formatRfc3339(double secondsSince1970) {
     writeDigits(&text[14], 2, ofDay / 60 % 60);
     writeDigits(&text[17], 2, ofDay % 60);
     writeDigits(&text[20], 3, milliseconds);
+    return text;
+}
+
+std::optional<std::string> formatRfc3339Date(double secondsSince1970) {
+    constexpr std::string_view kFullDate = "0000-00-00";
+    auto text = formatRfc3339(secondsSince1970);
+    if (text) {
+        text->resize(kFullDate.size());
+    }
     return text;
 }
 

@@ -14,11 +14,6 @@ namespace {
 constexpr std::string_view kDay = "day";
 constexpr std::string_view kCaptures = "captures";
 
-std::string dayOf(WallTime time) {
-    constexpr std::size_t kDateLength = 10;
-    return formatRfc3339(secondsSince1970(time)).value_or("").substr(0, kDateLength);
-}
-
 } // namespace
 
 DailyAllowance::DailyAllowance(const std::string& path, StructuredLog& log) {
@@ -39,7 +34,7 @@ DailyAllowance::DailyAllowance(const std::string& path, StructuredLog& log) {
 }
 
 bool DailyAllowance::take(WallTime now) {
-    std::string day = dayOf(now);
+    std::string day = formatRfc3339Date(secondsSince1970(now)).value_or("");
     const std::lock_guard lock(mutex_);
     if (day != day_) {
         day_ = std::move(day);

@@ -115,6 +115,9 @@ TEST(Rfc3339, WritesTimes) {
     for (const auto& [seconds, text] : rows) {
         EXPECT_EQ(formatRfc3339(seconds), text == nullptr ? std::nullopt : std::optional<std::string>(text))
             << seconds;
+        EXPECT_EQ(formatRfc3339Date(seconds).value_or("none"),
+                  text == nullptr ? "none" : std::string(text).substr(0, 10))
+            << seconds;
     }
 }
 

@@ -25,13 +25,6 @@ struct Entry {
 };
 using Entries = std::map<std::string, Entry, std::less<>>;
 
-/// "2026-11-21": such texts are in the order of the days.
-std::string dayOf(WallTime time) {
-    std::string text = formatRfc3339(secondsSince1970(time)).value_or(std::string(kDayPattern));
-    text.resize(kDayPattern.size());
-    return text;
-}
-
 bool isDay(const Value* value) noexcept {
     const std::string_view text = value != nullptr ? value->stringValue() : std::string_view();
     return std::equal(
@@ -86,7 +79,7 @@ AccessoryRegistry::Update AccessoryRegistry::update(const std::optional<Value>& 
                                                     std::span<const Accessory> seen, WallTime now) {
     Update update;
     Entries entries = entriesOf(kept, update.hadRubbish);
-    const std::string today = dayOf(now);
+    const std::string today = formatRfc3339Date(secondsSince1970(now)).value_or(std::string(kDayPattern));
     for (const Accessory& accessory : seen.first(std::min(seen.size(), kMostAccessories))) {
         Entry& entry = entries[accessory.identifier];
         entry.firstSeen = entry.firstSeen.empty() ? today : std::min(entry.firstSeen, today);
