@@ -22,7 +22,7 @@ void appendProcess(TextBuffer& line, const ProcessMemory& process) {
         .text("name", process.name)
         .number("resident", memory.resident)
         .number("peakResident", memory.peakResident)
-        .number("anonymous", memory.anonymous)
+        .number("anonymous", memory.anonymous.value_or(0))
         .number("file", memory.file)
         .number("shared", memory.shared)
         .number("swapped", memory.swapped)

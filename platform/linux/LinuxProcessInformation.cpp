@@ -1,7 +1,5 @@
 #include "platform/linux/LinuxProcessInformation.h"
 
-#include "platform/linux/SmallFile.h"
-
 #include <cerrno>
 #include <cstdlib>
 #include <ctime>
@@ -24,24 +22,22 @@ ProcessInformation::QueryError queryError(int code) {
     return {code, std::generic_category().message(code)};
 }
 
-std::variant<std::uint64_t, ProcessInformation::QueryError> readFootprint(const std::string& path) {
-    constexpr std::size_t kMaximumStatus = 64UL * 1024;
-    const SmallFile file = SmallFile::read(path, kMaximumStatus);
-    if (file.error != 0) {
-        return queryError(file.error);
+std::variant<std::uint64_t, ProcessInformation::QueryError> readFootprint(const ProcessFiles& files) {
+    const auto own = files.ownMemory();
+    if (const int* const error = std::get_if<int>(&own)) {
+        return queryError(*error);
     }
-    const auto anonymous = ProcessFiles::bytesOfField(file.text, "RssAnon");
-    if (!anonymous) {
+    const auto& memory = std::get<ProcessFiles::Memory>(own);
+    if (!memory.anonymous) {
         return queryError(ENODATA);
     }
-    return *anonymous + ProcessFiles::bytesOfField(file.text, "RssShmem").value_or(0) +
-           ProcessFiles::bytesOfField(file.text, "VmSwap").value_or(0);
+    return *memory.anonymous + memory.shared + memory.swapped;
 }
 
 } // namespace
 
 LinuxProcessInformation::LinuxProcessInformation(std::string root, SteadyNow now)
-    : root_(std::move(root)), files_(root_), footprint_(kValidity, std::move(now)) {}
+    : files_(std::move(root)), footprint_(kValidity, std::move(now)) {}
 
 pid_t LinuxProcessInformation::ownProcessIdentifier() const noexcept {
     return ::getpid();
@@ -61,7 +57,7 @@ std::chrono::microseconds LinuxProcessInformation::processorTime() const noexcep
 
 std::variant<std::uint64_t, ProcessInformation::QueryError>
 LinuxProcessInformation::physicalFootprint() const {
-    return footprint_.get([this] { return readFootprint(root_ + "/self/status"); });
+    return footprint_.get([this] { return readFootprint(files_); });
 }
 
 std::array<double, 3> LinuxProcessInformation::loadAverages() const {

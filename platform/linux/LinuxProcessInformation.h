@@ -29,7 +29,6 @@ public:
     [[nodiscard]] std::array<double, 3> loadAverages() const override;
 
 private:
-    const std::string root_;
     const ProcessFiles files_;
     mutable RecentReading<std::variant<std::uint64_t, QueryError>> footprint_;
 };

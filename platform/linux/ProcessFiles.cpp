@@ -6,6 +6,7 @@
 
 #include <algorithm>
 #include <array>
+#include <cerrno>
 #include <charconv>
 #include <memory>
 #include <system_error>
@@ -93,6 +94,34 @@ std::optional<std::string_view> fieldOf(std::string_view text, std::string_view 
 std::optional<std::uint64_t> numberOfField(std::string_view text, std::string_view name) {
     const auto field = fieldOf(text, name);
     return field ? leadingNumber<std::uint64_t>(*field) : std::nullopt;
+}
+
+/// The bytes of a line such as "RssAnon:      1234 kB".
+std::optional<std::uint64_t> bytesOfField(std::string_view text, std::string_view name) {
+    const auto kibibytes = numberOfField(text, name);
+    return kibibytes ? std::optional(*kibibytes * 1024) : std::nullopt;
+}
+
+/// From a process's `status`, or an `errno`.
+std::variant<ProcessFiles::Memory, int> readMemory(const std::string& path) {
+    const SmallFile status = SmallFile::read(path, kMaximumStatus);
+    if (status.error != 0) {
+        return status.error;
+    }
+    const auto resident = bytesOfField(status.text, "VmRSS");
+    if (!resident) {
+        return ENODATA;
+    }
+    const auto bytes = [&](std::string_view field) { return bytesOfField(status.text, field).value_or(0); };
+    return ProcessFiles::Memory{.resident = *resident,
+                                .peakResident = bytes("VmHWM"),
+                                .anonymous = bytesOfField(status.text, "RssAnon"),
+                                .file = bytes("RssFile"),
+                                .shared = bytes("RssShmem"),
+                                .swapped = bytes("VmSwap"),
+                                .locked = bytes("VmLck"),
+                                .pageTables = bytes("VmPTE"),
+                                .threads = numberOfField(status.text, "Threads").value_or(0)};
 }
 
 std::optional<std::vector<std::string>> readStack(const std::string& path) {
@@ -221,21 +250,13 @@ void ProcessFiles::addSwitches(pid_t pid, ProcessSample& sample) const {
 }
 
 std::optional<ProcessFiles::Memory> ProcessFiles::memory(pid_t pid) const {
-    const SmallFile status = SmallFile::read(pathOf(pid, "status"), kMaximumStatus);
-    const auto resident = bytesOfField(status.text, "VmRSS");
-    if (!resident) {
-        return std::nullopt;
-    }
-    const auto bytes = [&](std::string_view field) { return bytesOfField(status.text, field).value_or(0); };
-    return Memory{.resident = *resident,
-                  .peakResident = bytes("VmHWM"),
-                  .anonymous = bytes("RssAnon"),
-                  .file = bytes("RssFile"),
-                  .shared = bytes("RssShmem"),
-                  .swapped = bytes("VmSwap"),
-                  .locked = bytes("VmLck"),
-                  .pageTables = bytes("VmPTE"),
-                  .threads = numberOfField(status.text, "Threads").value_or(0)};
+    const auto memory = readMemory(pathOf(pid, "status"));
+    const auto* known = std::get_if<Memory>(&memory);
+    return known != nullptr ? std::optional(*known) : std::nullopt;
+}
+
+std::variant<ProcessFiles::Memory, int> ProcessFiles::ownMemory() const {
+    return readMemory(root_ + "/self/status");
 }
 
 std::optional<ProcessFiles::KernelMemory> ProcessFiles::kernelMemory() const {
@@ -253,11 +274,6 @@ std::optional<ProcessFiles::KernelMemory> ProcessFiles::kernelMemory() const {
                         .slabUnreclaimable = bytes("SUnreclaim"),
                         .pageTables = bytes("PageTables"),
                         .kernelStack = bytes("KernelStack")};
-}
-
-std::optional<std::uint64_t> ProcessFiles::bytesOfField(std::string_view text, std::string_view name) {
-    const auto kibibytes = numberOfField(text, name);
-    return kibibytes ? std::optional(*kibibytes * 1024) : std::nullopt;
 }
 
 } // namespace tamblo

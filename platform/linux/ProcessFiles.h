@@ -7,6 +7,7 @@
 #include <optional>
 #include <string>
 #include <string_view>
+#include <variant>
 #include <vector>
 
 #include <sys/types.h>
@@ -39,7 +40,8 @@ public:
     struct Memory {
         std::uint64_t resident = 0;
         std::uint64_t peakResident = 0;
-        std::uint64_t anonymous = 0; ///< resident, as `file` and `shared`
+        /// Resident, as `file` and `shared`; nothing where the kernel does not tell.
+        std::optional<std::uint64_t> anonymous;
         std::uint64_t file = 0;
         std::uint64_t shared = 0;
         std::uint64_t swapped = 0;
@@ -73,11 +75,9 @@ public:
     /// Nothing, too, for a process that has no memory of its own: one of the kernel's, or one that has ended
     /// and is not yet waited for.
     [[nodiscard]] std::optional<Memory> memory(pid_t pid) const;
+    /// The service's own, or an `errno`: `ENODATA` where the kernel tells nothing of it.
+    [[nodiscard]] std::variant<Memory, int> ownMemory() const;
     [[nodiscard]] std::optional<KernelMemory> kernelMemory() const;
-
-    /// The bytes of a line such as "RssAnon:      1234 kB" behind the text's first line; nothing without it.
-    [[nodiscard]] static std::optional<std::uint64_t> bytesOfField(std::string_view text,
-                                                                   std::string_view name);
 
 private:
     [[nodiscard]] std::string pathOf(pid_t pid, std::string_view file) const;

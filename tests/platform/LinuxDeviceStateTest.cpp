@@ -114,9 +114,9 @@ TEST(LinuxProcessInformationTest, TheFootprintIsWhatFilesCannotGiveBack) {
     const std::pair<const char*, std::int64_t> cases[] = {
         {"Name:\tx\nVmRSS:\t 99 kB\nRssAnon:\t   5 kB\nRssFile:\t 70 kB\nRssShmem:\t 2 kB\nVmSwap:\t 3 kB\n",
          10 * 1024},
-        {"Name:\tx\nRssAnon:\t8388608 kB\n", 8LL << 30},
+        {"Name:\tx\nVmRSS:\t8388608 kB\nRssAnon:\t8388608 kB\n", 8LL << 30},
         {"Name:\tRssAnon: 5 kB\nVmRSS:\t99 kB\n", -ENODATA},
-        {"Name:\tx\nRssAnon:", -ENODATA},
+        {"Name:\tx\nVmRSS:\t99 kB\nRssAnon:", -ENODATA},
         {"", -ENODATA},
     };
     const TemporaryDirectory root;

@@ -116,7 +116,7 @@ TEST_F(ProcessFilesTest, MemoryIsInBytesAndOnlyOfThoseThatHaveAny) {
     const auto memory = files.memory(7);
     ASSERT_TRUE(memory);
     EXPECT_THAT(
-        (std::vector{memory->resident, memory->peakResident, memory->anonymous, memory->file, memory->shared,
+        (std::vector{memory->resident, memory->peakResident, *memory->anonymous, memory->file, memory->shared,
                      memory->swapped, memory->locked, memory->pageTables, memory->threads}),
         ElementsAre(10240, 20480, 5120, 3072, 2048, 0, 1024, 6144, 4));
     write("8/status", "Name:\tkworker\nState:\tI (idle)\nThreads:\t1\n");
@@ -163,7 +163,7 @@ TEST(ProcessFilesOfTheKernel, FollowAProcessFromItsWaitToItsEnd) {
     const auto sample = LinuxProcessSampling().sample(child);
     const auto memory = files.memory(child);
     EXPECT_TRUE(sample && sample->residentBytes > 0 && sample->threads == 1);
-    EXPECT_TRUE(memory && memory->anonymous + memory->file + memory->shared == memory->resident);
+    EXPECT_TRUE(memory && *memory->anonymous + memory->file + memory->shared == memory->resident);
 
     ::close(ends[0]);
     ::close(ends[1]);
