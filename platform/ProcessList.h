@@ -2,10 +2,8 @@
 
 #include "base/Dictionary.h"
 
-#include <algorithm>
 #include <cstddef>
 #include <cstdint>
-#include <limits>
 #include <span>
 #include <string_view>
 #include <utility>
@@ -22,41 +20,23 @@ inline constexpr std::string_view kProcessIDs = "processIDs";
 /// many as are looked at in a moment; those beyond are left out.
 class ProcessList {
 public:
+    /// Processes of a list that is not told how many: more than play and record on a device at a time, and
+    /// not so many that reading several of the kernel's files for each holds up a queue.
     static constexpr std::size_t kMaximum = 64;
+    /// Elements of a payload's array that are looked at, whatever the list has room for: it is a client that
+    /// decides how many there are, and a handful of processes takes part in what it reports.
+    static constexpr std::size_t kMaximumNamed = 64;
 
     explicit ProcessList(std::size_t maximum = kMaximum) : maximum_(maximum) {}
 
-    void add(std::span<const pid_t> processes) {
-        for (const pid_t process : processes) {
-            add(process);
-        }
-    }
+    void add(std::span<const pid_t> processes);
     /// Those that the payload names under `kProcessIDs`. What is no identifier of a process is left out, and
-    /// of an array, as of a list, only the beginning counts.
-    void addNamedBy(const Dictionary& payload) {
-        const Value* const named = payload.find(kProcessIDs);
-        if (named == nullptr) {
-            return;
-        }
-        const std::span<const Value> elements = named->isArray() ? named->arrayValue() : std::span(named, 1);
-        for (const Value& element : elements.first(std::min(elements.size(), kMaximum))) {
-            if (element.isNumber() && element.kind() != Value::Kind::boolean) {
-                add(element.integerValue());
-            }
-        }
-    }
+    /// of an array only the beginning counts.
+    void addNamedBy(const Dictionary& payload);
     [[nodiscard]] std::vector<pid_t> take() && noexcept { return std::move(processes_); }
 
 private:
-    void add(std::int64_t process) {
-        if (process <= 0 || process > std::numeric_limits<pid_t>::max() || processes_.size() == maximum_) {
-            return;
-        }
-        const auto identifier = static_cast<pid_t>(process);
-        if (std::find(processes_.begin(), processes_.end(), identifier) == processes_.end()) {
-            processes_.push_back(identifier);
-        }
-    }
+    void add(std::int64_t process);
 
     const std::size_t maximum_;
     std::vector<pid_t> processes_;

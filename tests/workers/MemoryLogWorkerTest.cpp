@@ -44,6 +44,9 @@ TEST(ProcessListTest, TakesWhatIsAProcessOnceAndUpToItsLimit) {
         ProcessList list;
         list.addNamedBy({{"processIDs", Value(many)}});
         EXPECT_THAT(std::move(list).take(), SizeIs(std::min<std::size_t>(count, 64)));
+        ProcessList larger(512);
+        larger.addNamedBy({{"processIDs", Value(many)}});
+        EXPECT_THAT(std::move(larger).take(), SizeIs(std::min<std::size_t>(count, 64)));
     }
 }
 
