@@ -14,6 +14,7 @@ namespace {
 
 /// The kernel's files have a page or two. `smaps_rollup` and `status` are no longer with many mappings.
 constexpr std::size_t kMaximumFile = 64UL << 10U;
+/// Thermal zones, of which a machine has some ten or twenty; each is two files to read.
 constexpr std::size_t kMaximumZones = 64;
 
 /// A file of the kernel's under a heading, or why there is none.

@@ -31,6 +31,8 @@ struct CaptureFile {
 /// until it can be again. Used by one thread at a time, which waits for the disk.
 class CaptureFolders {
 public:
+    /// Whoever follows a fault up takes the captures within a few weeks; what they tell of processes is not
+    /// to stay on the device for longer.
     static constexpr std::chrono::days kMaximumAge{30};
     struct Limits {
         /// Of all folders, by the lengths of their files. One has 1 MiB of log at most, and some kilobytes

@@ -31,7 +31,12 @@ class LinuxDiagnosticCapture final : public DiagnosticCaptureService {
 public:
     using ClientProcesses = std::function<std::vector<pid_t>()>;
 
+    /// Samples of each thread: enough to tell one that is stuck, all of whose samples are equal, from one
+    /// that happens to wait at that moment; few enough that the capture still shows the moment it was asked
+    /// for.
     static constexpr int kSamples = 5;
+    /// The pause between two samples: longer than an audio device's usual period of ten or
+    /// twenty milliseconds, so that a thread that keeps its deadlines has moved on in between.
     static constexpr std::chrono::milliseconds kSampleInterval{25};
     /// Of all processes together: a sample takes some thirty microseconds, so that those of all threads take
     /// less than the interval. Where there are more, each process is cut to a number of threads that suits
