@@ -1,5 +1,7 @@
 #include "platform/linux/BluetoothRecord.h"
 
+#include "platform/linux/TextPieces.h"
+
 #include <array>
 #include <charconv>
 #include <cstdio>
@@ -27,11 +29,9 @@ std::optional<std::uint32_t> numberFrom(std::string_view text, std::uint32_t mos
     return isWhole && number <= most ? std::optional(number) : std::nullopt;
 }
 
-/// The text up to the end of the line, which is taken from its front.
+/// The line without its end, which may be of either kind.
 std::string_view takeLine(std::string_view& text) noexcept {
-    const std::size_t end = text.find('\n');
-    std::string_view line = text.substr(0, end);
-    text.remove_prefix(end == std::string_view::npos ? text.size() : end + 1);
+    std::string_view line = takeUpTo('\n', text);
     if (line.ends_with('\r')) {
         line.remove_suffix(1);
     }

@@ -1,5 +1,7 @@
 #include "platform/linux/LogFilter.h"
 
+#include "platform/linux/TextPieces.h"
+
 #include <algorithm>
 #include <array>
 #include <optional>
@@ -26,21 +28,11 @@ std::optional<LogLevel> levelNamed(std::string_view name) noexcept {
     return std::nullopt;
 }
 
-std::string_view trimmed(std::string_view text) noexcept {
-    const std::size_t first = text.find_first_not_of(" \t");
-    if (first == std::string_view::npos) {
-        return {};
-    }
-    return text.substr(first, text.find_last_not_of(" \t") - first + 1);
-}
-
 } // namespace
 
 LogFilter::LogFilter(std::string_view words) {
     while (!words.empty()) {
-        const std::size_t comma = std::min(words.find(','), words.size());
-        const std::string_view word = trimmed(words.substr(0, comma));
-        words.remove_prefix(std::min(comma + 1, words.size()));
+        const std::string_view word = trimmed(takeUpTo(',', words));
         if (word.empty()) {
             continue;
         }

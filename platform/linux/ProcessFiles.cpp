@@ -3,6 +3,7 @@
 #include "base/Format.h"
 #include "base/Utf8.h"
 #include "platform/linux/SmallFile.h"
+#include "platform/linux/TextPieces.h"
 
 #include <algorithm>
 #include <array>
@@ -65,13 +66,6 @@ std::optional<std::string> readName(const std::string& path) {
         name.pop_back();
     }
     return asUtf8(std::move(name));
-}
-
-/// Takes the text up to the separator, or all of it.
-std::string_view takeUpTo(char separator, std::string_view& text) {
-    const std::string_view taken = text.substr(0, text.find(separator));
-    text.remove_prefix(std::min(taken.size() + 1, text.size()));
-    return taken;
 }
 
 template <typename Number> std::optional<Number> leadingNumber(std::string_view text) {

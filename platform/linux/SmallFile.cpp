@@ -1,6 +1,7 @@
 #include "platform/linux/SmallFile.h"
 
 #include "platform/linux/FileDescriptor.h"
+#include "platform/linux/TextPieces.h"
 
 #include <algorithm>
 #include <array>
@@ -45,12 +46,7 @@ SmallFile SmallFile::read(const std::string& path, std::size_t limit, Links link
 }
 
 std::string_view SmallFile::trimmed() const noexcept {
-    constexpr std::string_view kWhiteSpace = " \t\r\n\v\f";
-    const std::size_t first = text.find_first_not_of(kWhiteSpace);
-    if (first == std::string::npos) {
-        return {};
-    }
-    return std::string_view(text).substr(first, text.find_last_not_of(kWhiteSpace) + 1 - first);
+    return tamblo::trimmed(text);
 }
 
 } // namespace tamblo
