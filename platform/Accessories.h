@@ -17,8 +17,8 @@ struct Accessory {
 class Accessories {
 public:
     virtual ~Accessories() = default;
-    /// The wireless earbuds that are connected, each once; where the device cannot tell that, those that it is
-    /// paired with. Any thread; may read a disk.
+    /// The wireless earbuds that are connected, each once; where the device cannot tell that, those that it
+    /// is paired with. Any thread; may read a disk.
     [[nodiscard]] virtual std::vector<Accessory> connectedEarbuds() = 0;
 };
 
