@@ -43,7 +43,7 @@ bool isKeySection(std::string_view section) noexcept {
     return section == "LinkKey" || section.ends_with("LongTermKey");
 }
 
-void setIdentity(BluetoothRecord::Identity& identity, std::string_view key, std::string_view value) noexcept {
+void setIdentity(BluetoothDeviceID& identity, std::string_view key, std::string_view value) noexcept {
     const std::array<std::pair<std::string_view, std::uint32_t*>, 4> members{
         {{"Source", &identity.source},
          {"Vendor", &identity.vendor},

@@ -7,20 +7,20 @@
 
 namespace tamblo {
 
+/// A record's section `DeviceID`.
+struct BluetoothDeviceID {
+    std::uint32_t source = 0; ///< who gave out the vendor's number: 1 the Bluetooth SIG, 2 the USB forum
+    std::uint32_t vendor = 0;
+    std::uint32_t product = 0;
+    std::uint32_t version = 0;
+};
+
 /// What the Bluetooth daemon's record of a device (a key file, `info`) says of what kind it is. The device's
 /// name, its address and its keys are not taken from it.
 struct BluetoothRecord {
-    /// `DeviceID`: who gave out the vendor's number (1: Bluetooth SIG, 2: USB), vendor, product and version.
-    struct Identity {
-        std::uint32_t source = 0;
-        std::uint32_t vendor = 0;
-        std::uint32_t product = 0;
-        std::uint32_t version = 0;
-    };
-
     std::optional<std::uint32_t> deviceClass; ///< class of device, 24 bits
     std::optional<std::uint32_t> appearance;  ///< 16 bits; none when the device gives it as unknown (0)
-    std::optional<Identity> identity;
+    std::optional<BluetoothDeviceID> identity;
     bool isPaired = false; ///< a key of the device is kept
 
     /// Reads any text; a line that is none of a key file, or whose number is none, is passed over.
