@@ -41,7 +41,7 @@ public:
         words_[name] = word;
         for (const auto& [token, registration] : registered_) {
             if (registration.name == name) {
-                registration.queue->post([this, posted = token] { call(posted); }, Pace::mayBlock);
+                registration.queue->post([this, which = token] { call(which); }, Pace::mayBlock);
             }
         }
     }
