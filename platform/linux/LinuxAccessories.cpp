@@ -117,7 +117,8 @@ std::vector<Accessory> LinuxAccessories::connectedEarbuds() {
         const std::string directory = storage_ + "/" + adapter;
         for (const std::string& device : addressesIn(directory, kMostDevices - devices)) {
             ++devices;
-            const SmallFile file = SmallFile::read(directory + "/" + device + "/info", kLongestRecord);
+            const SmallFile file =
+                SmallFile::read(formatted("{}/{}/info", directory, device), kLongestRecord);
             const BluetoothRecord record = BluetoothRecord::parse(file.text);
             // A device that is paired with two adapters is still one.
             if (record.isPaired && record.isEarbud() && seen.insert(device).second) {

@@ -195,6 +195,7 @@ void LinuxConnectionService::accept(FileDescriptor socket) {
 std::vector<pid_t> LinuxConnectionService::clientProcesses() {
     const std::lock_guard lock(mutex_);
     std::vector<pid_t> processes;
+    processes.reserve(connectionsByProcess_.size());
     for (const auto& [process, connections] : connectionsByProcess_) {
         processes.push_back(process);
     }
