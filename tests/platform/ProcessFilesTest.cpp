@@ -158,11 +158,13 @@ TEST(ProcessFilesOfTheKernel, FollowAProcessFromItsWaitToItsEnd) {
     if (waiting.kernelStack) {
         EXPECT_THAT(*waiting.kernelStack, testing::Contains(HasSubstr("pipe_read+0x")));
     }
-    EXPECT_THAT(files.threads(child), ElementsAre(child));
+    // The thread sanitizer's runtime has one of its own in each process.
+    const std::vector<pid_t> threads = files.threads(child);
+    EXPECT_THAT(threads, testing::Contains(child));
     EXPECT_EQ(files.threadName(child, child), files.name(::getpid()));
     const auto sample = LinuxProcessSampling().sample(child);
     const auto memory = files.memory(child);
-    EXPECT_TRUE(sample && sample->residentBytes > 0 && sample->threads == 1);
+    EXPECT_TRUE(sample && sample->residentBytes > 0 && sample->threads == threads.size());
     EXPECT_TRUE(memory && *memory->anonymous + memory->file + memory->shared == memory->resident);
 
     ::close(ends[0]);
