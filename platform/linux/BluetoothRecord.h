@@ -30,7 +30,7 @@ struct BluetoothRecord {
     /// without one is taken for an earbud by its class (2.8: audio, wearable headset or headphones): classes
     /// know nothing nearer.
     [[nodiscard]] bool isEarbud() const noexcept;
-    /// "bluetooth:004c:2014:0b10": who gave out the vendor's number, vendor, product and version in
+    /// "bluetooth:ffff:0101:0203": who gave out the vendor's number, vendor, product and version in
     /// hexadecimal digits; empty when the device does not state them.
     [[nodiscard]] std::string model() const;
 };

@@ -20,7 +20,7 @@ using testing::IsEmpty;
 using testing::SizeIs;
 
 const std::string kKey = "\n[LinkKey]\nKey=00112233445566778899AABBCCDDEEFF\nType=4\n";
-const std::string kIdentity = "[DeviceID]\nSource=1\nVendor=76\nProduct=8212\nVersion=2832\n";
+const std::string kIdentity = "[DeviceID]\nSource=1\nVendor=65535\nProduct=257\nVersion=515\n";
 const std::string kEarbud = "[General]\nName=Class=1\nAppearance=0x0941\n" + kIdentity + kKey;
 
 TEST(BluetoothRecordTest, TellsEarbudsAndTheirModel) {
@@ -35,11 +35,11 @@ TEST(BluetoothRecordTest, TellsEarbudsAndTheirModel) {
         EXPECT_FALSE(BluetoothRecord::parse("[General]\n" + general).isEarbud()) << general;
     }
     const std::pair<std::string, std::string> models[] = {
-        {kIdentity, "bluetooth:004c:2014:0b10"},
+        {kIdentity, "bluetooth:ffff:0101:0203"},
         {"[DeviceID]\nVersion=x\nProduct=0xFFFF\nVendor=1\nSource=2", "usb:0001:ffff:0000"},
         {"[DeviceID]\nSource=9\nVendor=65536\nProduct=1", "unknown:0000:0001:0000"},
         {"[DeviceID]\nSource=1\nVendor=0\nProduct=0", ""},
-        {"Vendor=76\n[DeviceID\nVendor=76\n=\n[]\n[", ""},
+        {"Vendor=7\n[DeviceID\nVendor=7\n=\n[]\n[", ""},
     };
     for (const auto& [text, model] : models) {
         EXPECT_EQ(BluetoothRecord::parse(text).model(), model) << text;
@@ -81,7 +81,7 @@ TEST_F(LinuxAccessoriesTest, FindsPairedEarbudsEachOnce) {
     directory.write("bt/" + address(8), "no directory");
     const std::vector<Accessory> found = accessories().connectedEarbuds();
     ASSERT_THAT(found, SizeIs(2));
-    EXPECT_EQ(found[0].model, "bluetooth:004c:2014:0b10");
+    EXPECT_EQ(found[0].model, "bluetooth:ffff:0101:0203");
     EXPECT_EQ(found[1].model, "");
     // SipHash-2-4 of the address: the same at every start, another on another machine, and on none.
     EXPECT_EQ(found[0].identifier, "6880d6789892f418");

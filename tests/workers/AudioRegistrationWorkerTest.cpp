@@ -121,7 +121,7 @@ protected:
 };
 
 TEST_F(AudioRegistrationWorkerTest, LooksAtMostOnceAMinuteAndKeepsWhatItSaw) {
-    device.accessories.earbuds = {{"a", "bluetooth:004c:2014:0b10"}};
+    device.accessories.earbuds = {{"a", "bluetooth:ffff:0101:0203"}};
     device.analyticsEvents.setEventsInUse({{"other"}});
     startSession(0s);
     EXPECT_EQ(device.accessories.lookups, 0) << "nobody wants the event";
@@ -132,7 +132,7 @@ TEST_F(AudioRegistrationWorkerTest, LooksAtMostOnceAMinuteAndKeepsWhatItSaw) {
     ASSERT_THAT(reported(), SizeIs(1));
     EXPECT_EQ(
         jsonText(reported()[0]),
-        R"({"first_seen_day":"2026-03-01","last_seen_day":"2026-03-01","model":"bluetooth:004c:2014:0b10"})");
+        R"({"first_seen_day":"2026-03-01","last_seen_day":"2026-03-01","model":"bluetooth:ffff:0101:0203"})");
     EXPECT_EQ(kept(),
               R"({"a":{"first_seen":"2026-03-01","last_reported":1772366400.0,"last_seen":"2026-03-01"}})");
     const struct {
