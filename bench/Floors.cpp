@@ -5,7 +5,7 @@
 #include "Meter.h"
 #include "Payloads.h"
 #include "base/TextBuffer.h"
-#include "platform/linux/FileDescriptor.h"
+#include "os/FileDescriptor.h"
 
 #include <cerrno>
 #include <chrono>

@@ -2,7 +2,7 @@
 
 #include "base/TextBuffer.h"
 #include "client/Vocabulary.h"
-#include "platform/linux/FileDescriptor.h"
+#include "os/FileDescriptor.h"
 #include "wire/Reply.h"
 #include "wire/Request.h"
 

@@ -1,7 +1,7 @@
 #include "ServiceProcess.h"
 
 #include "Processes.h"
-#include "platform/linux/FileDescriptor.h"
+#include "os/FileDescriptor.h"
 #include "wire/Protocol.h"
 
 #include <array>

@@ -2,7 +2,7 @@
 // what is refused is refused once, what is answered is a well-formed reply, and what asks for a reply gets
 // one unless its method may hold it back.
 
-#include "platform/linux/RequestDispatch.h"
+#include "platform/linux/connections/RequestDispatch.h"
 #include "service/ZRReportingService.h"
 #include "system/ZRReportingSystemMonitor.h"
 #include "tests/fakes/FakePlatform.h"

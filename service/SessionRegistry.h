@@ -1,7 +1,7 @@
 #pragma once
 
+#include "base/Hash.h"
 #include "service/ZRReportingServiceDelegateProtocol.h"
-#include "util/Mixing.h"
 
 #include <cstddef>
 #include <cstdint>
@@ -36,9 +36,9 @@ public:
 
 private:
     struct Hash {
-        Hash() noexcept : seed(processSeed()) {}
+        Hash() noexcept : seed(processHashSeed()) {}
         std::size_t operator()(ReporterID reporterID) const noexcept {
-            return mixed(static_cast<std::uint64_t>(reporterID) ^ seed);
+            return mixBits(static_cast<std::uint64_t>(reporterID) ^ seed);
         }
         std::uint64_t seed;
     };

@@ -1,6 +1,6 @@
 #include "session/LastMessageIndex.h"
 
-#include "util/Mixing.h"
+#include "base/Hash.h"
 
 #include <utility>
 
@@ -12,11 +12,11 @@ constexpr std::size_t kInitialSlots = 16;
 
 } // namespace
 
-LastMessageIndex::LastMessageIndex() : slots_(kInitialSlots), seed_(processSeed()) {}
+LastMessageIndex::LastMessageIndex() : slots_(kInitialSlots), seed_(processHashSeed()) {}
 
 std::size_t LastMessageIndex::place(std::uint64_t key) const noexcept {
     const std::size_t mask = slots_.size() - 1;
-    std::size_t at = mixed(key ^ seed_) & mask;
+    std::size_t at = mixBits(key ^ seed_) & mask;
     while (slots_[at].message != nullptr && slots_[at].key != key) {
         at = (at + 1) & mask;
     }

@@ -1,6 +1,6 @@
 #include "../TemporaryDirectory.h"
 
-#include "platform/linux/LinuxChanlogFacility.h"
+#include "platform/linux/drivers/LinuxChanlogFacility.h"
 #include "session/ZRReportingSession.h"
 #include "system/ZRReportingDriverUtility.h"
 #include "tests/fakes/FakePlatform.h"

@@ -3,10 +3,10 @@
 
 #include "base/Json.h"
 #include "base/TextBuffer.h"
-#include "platform/linux/LinuxAnalyticsEventService.h"
-#include "platform/linux/LinuxClock.h"
-#include "platform/linux/LinuxPreferences.h"
-#include "platform/linux/LinuxStructuredLog.h"
+#include "platform/linux/device/LinuxClock.h"
+#include "platform/linux/log/LinuxStructuredLog.h"
+#include "platform/linux/settings/LinuxPreferences.h"
+#include "platform/linux/sinks/LinuxAnalyticsEventService.h"
 
 #include <benchmark/benchmark.h>
 

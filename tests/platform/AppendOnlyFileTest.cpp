@@ -1,4 +1,4 @@
-#include "platform/linux/AppendOnlyFile.h"
+#include "platform/linux/sinks/AppendOnlyFile.h"
 #include "tests/platform/FaultyOperations.h"
 #include "tests/platform/LinuxServiceSupport.h"
 

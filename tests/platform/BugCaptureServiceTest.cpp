@@ -1,5 +1,5 @@
-#include "platform/linux/LinuxBugCaptureService.h"
-#include "platform/linux/LinuxWorkQueues.h"
+#include "platform/linux/captures/LinuxBugCaptureService.h"
+#include "platform/linux/loop/LinuxWorkQueues.h"
 #include "tests/fakes/FakeClock.h"
 #include "tests/fakes/FakeWorkQueues.h"
 #include "tests/platform/LinuxServiceSupport.h"

@@ -1,6 +1,6 @@
 #pragma once
 
-#include "platform/linux/FileOperations.h"
+#include "os/FileOperations.h"
 
 #include <algorithm>
 #include <cerrno>

@@ -1,5 +1,5 @@
-#include "platform/linux/LinuxAccessories.h"
-#include "platform/linux/BluetoothRecord.h"
+#include "platform/linux/device/LinuxAccessories.h"
+#include "platform/linux/device/BluetoothRecord.h"
 #include "tests/platform/LinuxServiceSupport.h"
 
 #include <gmock/gmock.h>

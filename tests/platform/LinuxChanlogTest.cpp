@@ -1,6 +1,6 @@
 #include "base/Format.h"
-#include "platform/linux/ChanlogChannelJson.h"
-#include "platform/linux/LinuxChanlogFacility.h"
+#include "platform/linux/drivers/ChanlogChannelJson.h"
+#include "platform/linux/drivers/LinuxChanlogFacility.h"
 #include "tests/platform/LinuxServiceSupport.h"
 
 #include <gmock/gmock.h>

@@ -1,5 +1,5 @@
-#include "platform/linux/LinuxDeviceConditions.h"
-#include "platform/linux/LinuxProcessInformation.h"
+#include "platform/linux/device/LinuxDeviceConditions.h"
+#include "platform/linux/device/LinuxProcessInformation.h"
 #include "tests/platform/LinuxServiceSupport.h"
 
 #include <gmock/gmock.h>

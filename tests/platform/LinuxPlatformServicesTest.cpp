@@ -1,11 +1,11 @@
 #include "platform/linux/Directories.h"
-#include "platform/linux/LinuxAnalyticsEventService.h"
-#include "platform/linux/LinuxClock.h"
-#include "platform/linux/LinuxDeviceProperties.h"
-#include "platform/linux/LinuxPreferences.h"
-#include "platform/linux/LinuxProcessInformation.h"
-#include "platform/linux/LinuxStructuredLog.h"
-#include "platform/linux/LinuxTracePoints.h"
+#include "platform/linux/device/LinuxClock.h"
+#include "platform/linux/device/LinuxProcessInformation.h"
+#include "platform/linux/log/LinuxStructuredLog.h"
+#include "platform/linux/log/LinuxTracePoints.h"
+#include "platform/linux/settings/LinuxDeviceProperties.h"
+#include "platform/linux/settings/LinuxPreferences.h"
+#include "platform/linux/sinks/LinuxAnalyticsEventService.h"
 #include "tests/platform/LinuxServiceSupport.h"
 
 #include <gmock/gmock.h>

@@ -1,4 +1,4 @@
-#include "platform/linux/LinuxReportFiles.h"
+#include "platform/linux/sinks/LinuxReportFiles.h"
 #include "tests/platform/FaultyOperations.h"
 #include "tests/platform/LinuxServiceSupport.h"
 

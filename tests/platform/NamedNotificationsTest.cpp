@@ -1,5 +1,5 @@
-#include "platform/linux/LinuxNamedNotifications.h"
-#include "platform/linux/LinuxWorkQueues.h"
+#include "platform/linux/loop/LinuxWorkQueues.h"
+#include "platform/linux/settings/LinuxNamedNotifications.h"
 #include "tests/fakes/FakeSerialQueue.h"
 #include "tests/platform/LinuxServiceSupport.h"
 

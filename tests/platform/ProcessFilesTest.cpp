@@ -1,5 +1,5 @@
-#include "platform/linux/ProcessFiles.h"
-#include "platform/linux/LinuxProcessSampling.h"
+#include "platform/linux/device/ProcessFiles.h"
+#include "platform/linux/device/LinuxProcessSampling.h"
 #include "tests/platform/LinuxServiceSupport.h"
 
 #include <gmock/gmock.h>

@@ -1,5 +1,5 @@
-#include "platform/linux/LinuxDiagnosticCapture.h"
-#include "platform/linux/LinuxMemoryLog.h"
+#include "platform/linux/captures/LinuxDiagnosticCapture.h"
+#include "platform/linux/captures/LinuxMemoryLog.h"
 #include "tests/fakes/FakeClock.h"
 #include "tests/fakes/FakeWorkQueues.h"
 #include "tests/platform/LinuxServiceSupport.h"

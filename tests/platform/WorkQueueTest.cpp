@@ -1,5 +1,5 @@
-#include "platform/linux/LinuxSerialQueue.h"
-#include "platform/linux/LinuxWorkQueues.h"
+#include "platform/linux/loop/LinuxSerialQueue.h"
+#include "platform/linux/loop/LinuxWorkQueues.h"
 
 #include <gtest/gtest.h>
 

@@ -1,0 +1,54 @@
+#pragma once
+
+#include "os/FileDescriptor.h"
+
+#include <functional>
+#include <optional>
+#include <string>
+#include <string_view>
+
+struct inotify_event;
+
+namespace tamblo {
+
+/// Notices files of one directory whose writing has finished, and files that went away.
+///
+/// One descriptor for an event loop: when it is readable, `read` takes in what happened. The directory may be
+/// missing at first, vanish, or be replaced: then its nearest existing parent is watched until it is there
+/// again. Owned by whoever wants to know; `read` is called by one thread at a time. Without activity it costs
+/// nothing.
+class DirectoryWatcher {
+public:
+    /// Called with the name of a file that was written, replaced or removed, or with nothing when any file
+    /// may have been: the directory has come or gone, or more happened than the kernel could remember.
+    using Handler = std::function<void(std::optional<std::string_view> fileName)>;
+
+    explicit DirectoryWatcher(std::string directory);
+    DirectoryWatcher(const DirectoryWatcher&) = delete;
+    DirectoryWatcher& operator=(const DirectoryWatcher&) = delete;
+
+    /// Readable, level-triggered, when `read` has something to do; -1 when nothing can be watched.
+    [[nodiscard]] int fileDescriptor() const noexcept { return inotify_.get(); }
+    /// Hands over everything that has happened up to now, in order, without waiting.
+    void read(const Handler& handler);
+    /// The `errno` that keeps the directory, or the return of a missing one, from being watched; or 0.
+    [[nodiscard]] int error() const noexcept { return error_; }
+    [[nodiscard]] const std::string& directory() const noexcept { return directory_; }
+
+private:
+    void watch();
+    [[nodiscard]] int watchNearestParent();
+    void replaceWatch(int& current, int next) noexcept;
+    /// False when the place that is watched has changed, so that the watches must be set anew.
+    [[nodiscard]] bool take(const inotify_event& event, const Handler& handler);
+
+    const std::string directory_;
+    FileDescriptor inotify_;
+    int directoryWatch_ = -1;
+    int parentWatch_ = -1;
+    /// The entry below the watched parent that leads to the directory.
+    std::string awaitedName_;
+    int error_ = 0;
+};
+
+} // namespace tamblo

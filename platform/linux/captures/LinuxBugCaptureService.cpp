@@ -1,0 +1,209 @@
+#include "platform/linux/captures/LinuxBugCaptureService.h"
+
+#include "base/Format.h"
+#include "platform/ProcessList.h"
+#include "platform/linux/sinks/SinkLine.h"
+
+#include <span>
+#include <utility>
+#include <vector>
+
+#include <sys/random.h>
+
+namespace tamblo {
+
+namespace {
+
+/// Beside the folders.
+constexpr std::string_view kAllowanceFile = "allowance.json";
+
+std::uint64_t firstNumber(const Clock& clock) {
+    // The time will do early in the device's start, when there is no randomness yet.
+    auto number = static_cast<std::uint64_t>(clock.now().time_since_epoch().count());
+    std::uint64_t random = 0;
+    return ::getrandom(&random, sizeof random, GRND_NONBLOCK) == sizeof random ? random : number;
+}
+
+std::vector<pid_t> withoutRepeats(std::span<const pid_t> processes) {
+    ProcessList list;
+    list.add(processes);
+    return std::move(list).take();
+}
+
+} // namespace
+
+class LinuxBugCaptureService::Reporter final : public GlarnReporter {
+public:
+    Reporter(LinuxBugCaptureService& service, std::span<const pid_t> processes)
+        : service_(service), processes_(withoutRepeats(processes)) {}
+
+    [[nodiscard]] bool snapshot(const BugCaptureSignature& signature, std::chrono::duration<double> duration,
+                                const Dictionary& payload, Reply reply) override {
+        return request("snapshot", signature, duration, payload, reply);
+    }
+    [[nodiscard]] bool startSession(const BugCaptureSignature& signature,
+                                    std::chrono::duration<double> duration, Reply reply) override {
+        return request("start", signature, duration, {}, reply);
+    }
+    void cancelSession(std::string_view sessionIdentifier) override {
+        service_.cancel(std::string(sessionIdentifier));
+    }
+
+private:
+    [[nodiscard]] bool request(std::string_view operation, const BugCaptureSignature& signature,
+                               std::chrono::duration<double> duration, const Dictionary& payload,
+                               const Reply& reply) {
+        CaptureRequest request{.operation = operation,
+                               .identifier = {},
+                               .time = {},
+                               .signature = signature,
+                               .duration = duration,
+                               .payload = payload,
+                               .processes = processes_};
+        return service_.request(std::move(request), reply);
+    }
+
+    LinuxBugCaptureService& service_;
+    const std::vector<pid_t> processes_;
+};
+
+LinuxBugCaptureService::LinuxBugCaptureService(const std::string& logsDirectory, const Clock& clock,
+                                               WorkQueues& workQueues, LinuxStructuredLog& log,
+                                               FileOperations& operations, const CaptureContent& content)
+    : content_(content),
+      clock_(clock),
+      workQueues_(workQueues),
+      log_(log),
+      file_(logsDirectory + "/bug-captures.jsonl", "zrrb", log, operations),
+      folders_(logsDirectory + "/captures", log),
+      allowance_(formatted("{}/captures/{}", logsDirectory, kAllowanceFile), log),
+      lastNumber_(firstNumber(clock)) {}
+
+std::unique_ptr<GlarnReporter> LinuxBugCaptureService::makeReporter(std::span<const pid_t> processes) {
+    return std::make_unique<Reporter>(*this, processes);
+}
+
+bool LinuxBugCaptureService::request(CaptureRequest request, const GlarnReporter::Reply& reply) {
+    // Written so that what is no number is refused.
+    if (!(request.duration.count() >= 0 && request.duration <= kMaximumDuration)) {
+        return false;
+    }
+    request.time = clock_.now();
+    const GlarnError refusal = admit(request.time);
+    if (refusal != kGlarnErrorNone) {
+        reply({{glarn::kReplySuccess, false}, {glarn::kReplyReason, static_cast<std::int32_t>(refusal)}});
+        return true;
+    }
+    request.identifier = CaptureFolders::identifier(request.time, ++lastNumber_);
+    const auto kept = std::make_shared<const CaptureRequest>(std::move(request));
+    queue().post([this] { folders_.keep(kAllowanceFile, allowance_.text()); }, Pace::mayBlock);
+    if (kept->duration.count() == 0) {
+        gatherLater(kept);
+    } else {
+        appendRequest(*kept);
+        run(kept);
+    }
+    reply({{glarn::kReplySuccess, true}, {glarn::kReplySessionID, kept->identifier}});
+    return true;
+}
+
+GlarnError LinuxBugCaptureService::admit(WallTime time) {
+    {
+        const std::lock_guard lock(mutex_);
+        if (isEnded_) {
+            return kGlarnErrorServiceUnavailable;
+        }
+    }
+    return allowance_.take(time) ? kGlarnErrorNone : kGlarnErrorDailyLimitExceeded;
+}
+
+void LinuxBugCaptureService::run(const RequestRef& request) {
+    const auto delay = std::chrono::ceil<std::chrono::milliseconds>(request->duration);
+    {
+        // A call that comes at once waits here until it can be found.
+        const std::lock_guard lock(mutex_);
+        if (!isEnded_) {
+            running_.try_emplace(
+                request->identifier,
+                Running{request, workQueues_.callAfter(delay, [this, identifier = request->identifier] {
+                            finish(identifier);
+                        })});
+            return;
+        }
+    }
+    append("cancel", request->identifier);
+}
+
+LinuxBugCaptureService::RequestRef LinuxBugCaptureService::takeRunning(const std::string& identifier) {
+    Running taken;
+    const std::lock_guard lock(mutex_);
+    const auto found = running_.find(identifier);
+    if (found == running_.end()) {
+        return nullptr;
+    }
+    taken = std::move(found->second);
+    running_.erase(found);
+    return taken.request;
+}
+
+void LinuxBugCaptureService::cancel(const std::string& identifier) {
+    if (takeRunning(identifier) != nullptr) {
+        append("cancel", identifier);
+    }
+}
+
+void LinuxBugCaptureService::finish(const std::string& identifier) {
+    if (const RequestRef request = takeRunning(identifier)) {
+        gatherLater(request);
+    }
+}
+
+void LinuxBugCaptureService::endSessions() {
+    std::map<std::string, Running, std::less<>> running;
+    {
+        const std::lock_guard lock(mutex_);
+        isEnded_ = true;
+        running.swap(running_);
+    }
+    for (const auto& [identifier, capture] : running) {
+        append("cancel", identifier);
+    }
+}
+
+void LinuxBugCaptureService::gatherLater(const RequestRef& request) {
+    queue().post([this, request] { gather(*request); }, Pace::mayBlock);
+}
+
+void LinuxBugCaptureService::gather(const CaptureRequest& request) {
+    const WallTime now = clock_.now();
+    std::vector<CaptureFile> files = content_.gather(request, now);
+    files.push_back({"log.txt", log_.lastLines()});
+    folders_.store(request.identifier, files, now);
+    if (request.duration.count() == 0) {
+        appendRequest(request);
+    } else {
+        append("end", request.identifier);
+    }
+    file_.flush();
+}
+
+void LinuxBugCaptureService::appendRequest(const CaptureRequest& request) {
+    file_.append([&](TextBuffer& line) {
+        SinkLine fields(line, request.time);
+        addRequest(fields, request);
+    });
+}
+
+void LinuxBugCaptureService::append(std::string_view operation, std::string_view identifier) {
+    file_.append([&](TextBuffer& line) {
+        SinkLine(line, clock_.now()).text("op", operation).text("session", identifier);
+    });
+}
+
+SerialQueue& LinuxBugCaptureService::queue() {
+    std::call_once(isQueueMade_,
+                   [this] { queue_ = workQueues_.makeSerialQueue("com.vandra.tamblo.bugcaptures"); });
+    return *queue_;
+}
+
+} // namespace tamblo

@@ -1,0 +1,88 @@
+#pragma once
+
+#include "platform/BugCaptureService.h"
+#include "platform/Clock.h"
+#include "platform/WorkQueue.h"
+#include "platform/linux/captures/CaptureContent.h"
+#include "platform/linux/captures/CaptureFolders.h"
+#include "platform/linux/captures/DailyAllowance.h"
+#include "platform/linux/log/LinuxStructuredLog.h"
+#include "platform/linux/sinks/AppendOnlyFile.h"
+
+#include <atomic>
+#include <chrono>
+#include <cstdint>
+#include <map>
+#include <memory>
+#include <mutex>
+#include <string>
+#include <string_view>
+
+namespace tamblo {
+
+/// The bug-capture service as a sink file, `bug-captures.jsonl`, and a folder for each capture, below
+/// `captures`:
+///
+///     {"time":…,"op":"start","session":"20260301T…","signature":{…},"duration":60.0,"payload":{}}
+///     {"time":…,"op":"end","session":"20260301T…"}
+///
+/// What a capture is made of is gathered on a queue of the service's own. A snapshot without a duration is
+/// one line, written once its folder is complete, or could not be. A capture with one has its line at once,
+/// and "end" when the duration is over and the folder is complete; one that is cancelled before, or still
+/// runs when the service ends, has "cancel" instead and no folder.
+class LinuxBugCaptureService final : public BugCaptureService {
+public:
+    /// A capture that runs longer tells nothing about what it was begun for; requests for one are refused.
+    static constexpr std::chrono::hours kMaximumDuration{1};
+
+    /// What is referred to must outlive the service, except the queues: before they go, `endSessions` is
+    /// called.
+    LinuxBugCaptureService(const std::string& logsDirectory, const Clock& clock, WorkQueues& workQueues,
+                           LinuxStructuredLog& log, FileOperations& operations = FileOperations::system(),
+                           const CaptureContent& content = CaptureContent());
+    ~LinuxBugCaptureService() override { endSessions(); }
+
+    [[nodiscard]] std::unique_ptr<GlarnReporter> makeReporter(std::span<const pid_t> processes) override;
+    /// Cancels the captures that run, and makes no others.
+    void endSessions();
+    void flush() { file_.flush(); }
+
+private:
+    class Reporter;
+    using RequestRef = std::shared_ptr<const CaptureRequest>;
+    struct Running {
+        RequestRef request;
+        std::unique_ptr<DelayedCall> end;
+    };
+
+    [[nodiscard]] bool request(CaptureRequest request, const GlarnReporter::Reply& reply);
+    [[nodiscard]] GlarnError admit(WallTime time);
+    void run(const RequestRef& request);
+    void cancel(const std::string& identifier);
+    void finish(const std::string& identifier);
+    [[nodiscard]] RequestRef takeRunning(const std::string& identifier);
+    void gatherLater(const RequestRef& request);
+    void gather(const CaptureRequest& request);
+    void appendRequest(const CaptureRequest& request);
+    void append(std::string_view operation, std::string_view identifier);
+    [[nodiscard]] SerialQueue& queue();
+
+    const CaptureContent content_;
+    const Clock& clock_;
+    WorkQueues& workQueues_;
+    LinuxStructuredLog& log_;
+    AppendOnlyFile file_;
+    CaptureFolders folders_; ///< the queue's
+    DailyAllowance allowance_;
+    /// Begins at random, so that captures of one millisecond differ across the service's starts, too.
+    std::atomic<std::uint64_t> lastNumber_;
+
+    std::mutex mutex_; ///< guards what follows
+    std::map<std::string, Running, std::less<>> running_;
+    bool isEnded_ = false;
+
+    std::once_flag isQueueMade_;
+    std::unique_ptr<SerialQueue> queue_;
+};
+
+} // namespace tamblo

@@ -1,0 +1,251 @@
+#include "platform/linux/connections/LinuxConnectionService.h"
+
+#include "platform/linux/loop/LinuxSerialQueue.h"
+#include "wire/Protocol.h"
+
+#include <cerrno>
+#include <charconv>
+#include <chrono>
+#include <cstdlib>
+#include <cstring>
+#include <string_view>
+#include <utility>
+
+#include <fcntl.h>
+#include <sys/epoll.h>
+#include <sys/file.h>
+#include <sys/socket.h>
+#include <sys/un.h>
+#include <unistd.h>
+
+namespace tamblo {
+
+namespace {
+
+constexpr int kActivatedSocket = 3;
+/// Waiting connections beyond this are turned away by the kernel.
+constexpr int kBacklog = 1024;
+/// How long accepting rests when the process has no descriptors left.
+constexpr std::chrono::milliseconds kAcceptPause{100};
+/// How many connections one wake-up accepts, so that those there are get their turn.
+constexpr int kAcceptsPerWakeUp = 64;
+constexpr std::string_view kLogCategory = "zrrs";
+
+std::string because(const std::string& what, int error) {
+    return what + ": " + std::strerror(error);
+}
+
+bool environmentSays(const char* name, long wanted) {
+    const char* const text = std::getenv(name);
+    if (text == nullptr) {
+        return false;
+    }
+    long number = 0;
+    const char* const end = text + std::strlen(text);
+    const auto result = std::from_chars(text, end, number);
+    return result.ec == std::errc{} && result.ptr == end && number == wanted;
+}
+
+bool activatedSocketHas(int option, int wanted) {
+    int value = 0;
+    socklen_t length = sizeof value;
+    return ::getsockopt(kActivatedSocket, SOL_SOCKET, option, &value, &length) == 0 && value == wanted;
+}
+
+/// Whether somebody answers on the socket at this address.
+bool isAnswered(const sockaddr_un& address) {
+    const FileDescriptor probe(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0));
+    const auto* generic = reinterpret_cast<const sockaddr*>(&address);
+    return ::connect(probe.get(), generic, sizeof address) == 0 || errno == EAGAIN;
+}
+
+} // namespace
+
+LinuxConnectionService::LinuxConnectionService(EventLoop& loop, StructuredLog& log)
+    : loop_(loop), log_(log), readBuffer_(new std::uint8_t[kBytesPerRead + kSmallRest]) {}
+
+LinuxConnectionService::~LinuxConnectionService() {
+    removeSocketFile();
+}
+
+std::optional<std::string> LinuxConnectionService::open(const std::string& runtimeDirectory) {
+    const bool isActivated = environmentSays("LISTEN_PID", ::getpid()) && environmentSays("LISTEN_FDS", 1);
+    return isActivated ? adoptActivatedSocket() : bindSocket(wire::socketPath(runtimeDirectory));
+}
+
+std::optional<std::string> LinuxConnectionService::adoptActivatedSocket() {
+    // Whatever else has that number may be a descriptor of our own by now.
+    if (!activatedSocketHas(SO_DOMAIN, AF_UNIX) || !activatedSocketHas(SO_TYPE, SOCK_STREAM) ||
+        !activatedSocketHas(SO_ACCEPTCONN, 1)) {
+        return "LISTEN_FDS is set, but file descriptor 3 is no listening local stream socket: pass one, or "
+               "unset LISTEN_FDS";
+    }
+    ::unsetenv("LISTEN_PID");
+    ::unsetenv("LISTEN_FDS");
+    socket_ = FileDescriptor(kActivatedSocket);
+    ::fcntl(socket_.get(), F_SETFD, FD_CLOEXEC);
+    ::fcntl(socket_.get(), F_SETFL, ::fcntl(socket_.get(), F_GETFL) | O_NONBLOCK);
+    return std::nullopt;
+}
+
+std::optional<std::string> LinuxConnectionService::bindSocket(const std::string& path) {
+    sockaddr_un address{};
+    address.sun_family = AF_UNIX;
+    if (path.size() >= sizeof address.sun_path) {
+        return "the socket's path is too long for the system (" + path +
+               "): set RUNTIME_DIRECTORY to a shorter one";
+    }
+    std::memcpy(address.sun_path, path.data(), path.size());
+    const auto* generic = reinterpret_cast<const sockaddr*>(&address);
+
+    // Two services that start at the same time must not both take a left-over socket for theirs to replace.
+    const FileDescriptor directory(
+        ::open(path.substr(0, path.rfind('/')).c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+    ::flock(directory.get(), LOCK_EX);
+
+    FileDescriptor socket(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0));
+    if (::bind(socket.get(), generic, sizeof address) != 0) {
+        if (errno != EADDRINUSE) {
+            return because("cannot make the socket " + path, errno);
+        }
+        struct stat there {};
+        if (::lstat(path.c_str(), &there) == 0 && !S_ISSOCK(there.st_mode)) {
+            return path + " is in the way and no socket: remove it, or set RUNTIME_DIRECTORY";
+        }
+        if (isAnswered(address)) {
+            return "another tamblod already answers at " + path + ": stop it first, or set RUNTIME_DIRECTORY";
+        }
+        if (::unlink(path.c_str()) != 0 || ::bind(socket.get(), generic, sizeof address) != 0) {
+            return because("cannot replace the left-over socket " + path, errno);
+        }
+    }
+    if (::listen(socket.get(), kBacklog) != 0) {
+        return because("cannot listen on " + path, errno);
+    }
+    ::chmod(path.c_str(), 0666);
+    ::stat(path.c_str(), &socketFile_);
+    socketPath_ = path;
+    socket_ = std::move(socket);
+    return std::nullopt;
+}
+
+void LinuxConnectionService::removeSocketFile() {
+    struct stat now {};
+    if (!socketPath_.empty() && ::stat(socketPath_.c_str(), &now) == 0 && now.st_ino == socketFile_.st_ino &&
+        now.st_dev == socketFile_.st_dev) {
+        ::unlink(socketPath_.c_str());
+    }
+    socketPath_.clear();
+}
+
+ConnectionListener& LinuxConnectionService::listenerForServiceName(std::string_view) {
+    return *this;
+}
+
+void LinuxConnectionService::resume() {
+    loop_.add(socket_.get(), EPOLLIN, *this);
+}
+
+void LinuxConnectionService::ready(std::uint32_t) {
+    for (int i = 0; i < kAcceptsPerWakeUp; ++i) {
+        FileDescriptor socket(::accept4(socket_.get(), nullptr, nullptr, SOCK_CLOEXEC | SOCK_NONBLOCK));
+        if (socket.isOpen()) {
+            if (std::exchange(isPaused_, false)) {
+                log_.report(LogLevel::error, kLogCategory, "accepting connections again");
+            }
+            accept(std::move(socket));
+            continue;
+        }
+        if (errno == EMFILE || errno == ENFILE || errno == ENOBUFS || errno == ENOMEM) {
+            pauseAccepting(errno);
+            return;
+        }
+        if (errno != ECONNABORTED && errno != EINTR) {
+            return;
+        }
+    }
+}
+
+void LinuxConnectionService::pauseAccepting(int error) {
+    if (!std::exchange(isPaused_, true)) {
+        log_.report(LogLevel::error, kLogCategory, because("accepting connections rests", error));
+    }
+    loop_.remove(socket_.get());
+    loop_.callAfter(kAcceptPause, [this] {
+        if (socket_.isOpen()) {
+            resume();
+        }
+    });
+}
+
+void LinuxConnectionService::accept(FileDescriptor socket) {
+    ucred credentials{};
+    socklen_t length = sizeof credentials;
+    ::getsockopt(socket.get(), SOL_SOCKET, SO_PEERCRED, &credentials, &length);
+    auto connection = std::make_shared<LinuxConnection>(*this, std::move(socket), credentials.pid);
+    connections_.emplace(connection.get(), connection);
+    if (!delegate_->shouldAcceptNewConnection(*connection)) {
+        connections_.erase(connection.get());
+        return;
+    }
+    const std::lock_guard lock(mutex_);
+    ++connectionsByProcess_[credentials.pid];
+}
+
+std::vector<pid_t> LinuxConnectionService::clientProcesses() {
+    const std::lock_guard lock(mutex_);
+    std::vector<pid_t> processes;
+    processes.reserve(connectionsByProcess_.size());
+    for (const auto& [process, connections] : connectionsByProcess_) {
+        processes.push_back(process);
+    }
+    return processes;
+}
+
+void LinuxConnectionService::hasReplies(std::shared_ptr<LinuxConnection> connection) {
+    const std::lock_guard lock(mutex_);
+    replied_.push_back(std::move(connection));
+}
+
+void LinuxConnectionService::releaseReplies() {
+    std::vector<std::shared_ptr<LinuxConnection>> replied;
+    {
+        const std::lock_guard lock(mutex_);
+        replied.swap(replied_);
+    }
+    for (const std::shared_ptr<LinuxConnection>& connection : replied) {
+        connection->releaseReplies();
+    }
+}
+
+void LinuxConnectionService::posted(std::size_t requests) {
+    InlineDrain* const drain = InlineDrain::current();
+    if (drain != nullptr && drain->add(requests) >= kRequestsPerBatch) {
+        drain->drain();
+    }
+}
+
+void LinuxConnectionService::ended(LinuxConnection& connection) {
+    // Sources of the same wake-up may still name it, so it is let go after them.
+    const auto found = connections_.find(&connection);
+    if (found != connections_.end()) {
+        loop_.post([kept = std::move(found->second)] {});
+        connections_.erase(found);
+        const std::lock_guard lock(mutex_);
+        const auto process = connectionsByProcess_.find(connection.peerProcessIdentifier());
+        if (process != connectionsByProcess_.end() && --process->second == 0) {
+            connectionsByProcess_.erase(process);
+        }
+    }
+}
+
+void LinuxConnectionService::stop() {
+    loop_.remove(socket_.get());
+    removeSocketFile();
+    socket_.reset();
+    for (const auto& [pointer, connection] : connections_) {
+        connection->stopReading();
+    }
+}
+
+} // namespace tamblo

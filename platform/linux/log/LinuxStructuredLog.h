@@ -1,0 +1,63 @@
+#pragma once
+
+#include "os/FileDescriptor.h"
+#include "platform/StructuredLog.h"
+#include "platform/linux/log/LogFilter.h"
+#include "platform/linux/log/LogRing.h"
+
+#include <atomic>
+#include <cstddef>
+#include <cstdint>
+#include <string>
+#include <string_view>
+
+#include <sys/types.h>
+
+namespace tamblo {
+
+/// The log on standard error, one line per record: `<P>CODE TEXT`, P the sd-daemon priority.
+///
+/// A record is one write, of at most `kMaximumLine` bytes. What a client can put into a text cannot make a
+/// line of its own or reach a terminal: control characters are written as escapes. A reader that is slow or
+/// gone neither holds up the service nor ends it: what cannot be written at once is dropped, and the next
+/// line that can be is preceded by one that says how many were. The last lines are remembered, those that
+/// were dropped among them. Any thread; the only lock is the one in which a line is remembered.
+class LinuxStructuredLog final : public StructuredLog {
+public:
+    static constexpr std::size_t kMaximumLine = 8192;
+
+    /// The log of this process: standard error, filtered by `TAMBLO_LOG`.
+    LinuxStructuredLog();
+    /// The descriptor is borrowed. When it is closed, it is opened on nothing, lest the next file that the
+    /// service opens take its number and be given the log. SIGPIPE is ignored from here on, in the whole
+    /// process.
+    LinuxStructuredLog(int descriptor, std::string_view filter);
+
+    [[nodiscard]] LogLevel threshold(std::string_view categoryCode) const noexcept override;
+    void write(LogLevel level, std::string_view categoryCode, std::string_view line) noexcept override;
+    /// The last lines, as they are written to standard error.
+    [[nodiscard]] std::string lastLines() const { return lastLines_.text(); }
+
+private:
+    /// How to write without waiting.
+    enum class Channel : std::uint8_t {
+        plain,    ///< a file, or a description of our own that does not block
+        socket,   ///< per call
+        askFirst, ///< a pipe or terminal that is shared with others and may not be changed
+    };
+
+    void prepareChannel(int descriptor);
+    [[nodiscard]] bool put(std::string_view bytes) noexcept;
+    [[nodiscard]] ssize_t putSome(std::string_view bytes) noexcept;
+    [[nodiscard]] bool reportDropped() noexcept;
+
+    LogFilter filter_;
+    LogRing lastLines_;
+    int descriptor_;
+    FileDescriptor own_;
+    Channel channel_ = Channel::plain;
+    std::atomic<std::uint64_t> dropped_{0};
+    std::atomic<bool> isTorn_{false};
+};
+
+} // namespace tamblo

@@ -1,0 +1,34 @@
+#pragma once
+
+#include "platform/WorkQueue.h"
+#include "platform/linux/loop/LinuxRepeatingTimer.h"
+#include "platform/linux/loop/ThreadPool.h"
+
+#include <memory>
+
+namespace tamblo {
+
+/// Serial queues as strands over one pool, which also makes the delayed calls, and timers. Works off what was
+/// posted before it goes. A queue may be let go after that, but not posted to; a delayed call may not.
+class LinuxWorkQueues final : public WorkQueues {
+public:
+    LinuxWorkQueues();
+    ~LinuxWorkQueues() override;
+
+    [[nodiscard]] std::unique_ptr<SerialQueue> makeSerialQueue(std::string_view label) override;
+    [[nodiscard]] std::unique_ptr<RepeatingTimer> makeRepeatingTimer(std::chrono::milliseconds interval,
+                                                                     UniqueFunction<void()> tick) override;
+    [[nodiscard]] std::unique_ptr<DelayedCall> callAfter(std::chrono::milliseconds delay,
+                                                         UniqueFunction<void()> call) override;
+    /// Called after each tick of any timer, on its thread: what a tick recorded is written out.
+    void setTickEnd(UniqueFunction<void()> tickEnd);
+
+private:
+    struct TickEnd;
+
+    std::shared_ptr<TickEnd> tickEnd_;
+    std::shared_ptr<LinuxRepeatingTimer::Retired> retired_;
+    ThreadPool pool_;
+};
+
+} // namespace tamblo

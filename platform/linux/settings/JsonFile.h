@@ -1,0 +1,51 @@
+#pragma once
+
+#include "base/Dictionary.h"
+#include "base/JsonElements.h"
+#include "os/FileState.h"
+#include "platform/StructuredLog.h"
+
+#include <cstddef>
+#include <functional>
+#include <optional>
+#include <string>
+#include <string_view>
+
+namespace tamblo {
+
+/// A file that holds one JSON object or array, written by somebody else: an operator, a test, another
+/// program.
+///
+/// A missing file is no value and no error. One that cannot be read, is not JSON or holds another kind of
+/// value is one error line for each state of the file that is met, naming the file and the place. Not
+/// thread-safe; reading may block on the disk.
+class JsonFile {
+public:
+    /// Larger files are refused, unread.
+    static constexpr std::size_t kMaximumSize = 4U << 20U;
+
+    explicit JsonFile(std::string path, std::size_t maximumSize = kMaximumSize)
+        : path_(std::move(path)), maximumSize_(maximumSize) {}
+
+    [[nodiscard]] std::optional<Dictionary> read(StructuredLog& log);
+    /// Reads a file that holds an array, element by element; null ones are skipped. Nothing of what was taken
+    /// counts unless the whole file was read: false otherwise.
+    [[nodiscard]] bool readArray(const std::function<void(const JsonItem&)>& take, StructuredLog& log);
+    /// The file's state as it was just before it was read last; that of no file when there was none.
+    [[nodiscard]] const FileState& state() const noexcept { return state_; }
+    [[nodiscard]] const std::string& path() const noexcept { return path_; }
+
+private:
+    [[nodiscard]] std::optional<std::string> readText(StructuredLog& log);
+    void report(StructuredLog& log, std::string_view fault);
+    void report(StructuredLog& log, const JsonError& error);
+
+    std::string path_;
+    std::size_t maximumSize_;
+    FileState state_;
+    /// The state of the file and its fault as reported last; no fault when it was well.
+    FileState reportedState_;
+    std::string reportedFault_;
+};
+
+} // namespace tamblo

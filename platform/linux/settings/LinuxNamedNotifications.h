@@ -1,0 +1,79 @@
+#pragma once
+
+#include "os/DirectoryWatcher.h"
+#include "platform/NamedNotifications.h"
+#include "platform/StructuredLog.h"
+
+#include <functional>
+#include <map>
+#include <memory>
+#include <mutex>
+#include <set>
+#include <string>
+#include <string_view>
+#include <unordered_map>
+
+namespace tamblo {
+
+/// Named notifications as files: `<directory>/<name>` holds the name's state word in decimal, and each
+/// finished write of it is a post. Removing the file is a post too, after which the state cannot be read.
+///
+/// The kernel tells of the writes: the event loop calls `deliverPosts` when the descriptor is readable. Each
+/// registration has at most one call waiting on its queue, however many posts come meanwhile: a call reads
+/// the state when it runs, so that the last one is always seen. A post just before a registration may be told
+/// to it. When the directory comes or goes, any word may have changed, and every handler is called.
+///
+/// Statuses are `errno` values. Any thread may register, ask and cancel.
+class LinuxNamedNotifications final : public NamedNotifications {
+public:
+    /// The log must outlive the notifications.
+    LinuxNamedNotifications(std::string directory, StructuredLog& log);
+
+    /// Fails for a name that is no plain file name: `EINVAL`, or `ENAMETOOLONG`. Succeeds when the directory
+    /// cannot be watched (said in the log): the state can be read all the same.
+    [[nodiscard]] Registration RegisterNamedNotification(std::string_view name, SerialQueue& queue,
+                                                         Handler handler) override;
+    /// The word in the file at this moment. `EBADF` for an unknown token, `ENOENT` for a name that was never
+    /// posted, `EBADMSG` for a file that does not hold one decimal number and nothing else but white space
+    /// around it, `ERANGE` for one beyond 64 bits, and whatever keeps the file from being read. A symbolic
+    /// link is `ELOOP`: writes through it would not be noticed. What stands there and cannot be read is one
+    /// error line for each state of the file that is met.
+    [[nodiscard]] State GetNamedNotificationState(int token) override;
+    /// Replaces the file with one that holds the same word, or 0 for content that is no word. Fails for a
+    /// name that cannot be registered, for what is no regular file, and for what cannot be written: one error
+    /// line for each name until it can be posted again.
+    [[nodiscard]] int PostNamedNotification(std::string_view name) override;
+    void CancelNamedNotification(int token) override;
+
+    /// For the event loop; -1 when posts cannot be noticed (said in the log).
+    [[nodiscard]] int fileDescriptor() const noexcept { return watcher_.fileDescriptor(); }
+    /// After a post has been taken in and before it is delivered, `beforeDelivery` takes in what its poster
+    /// may have done before.
+    void deliverPosts(const std::function<void()>& beforeDelivery = [] {});
+
+private:
+    struct Registered;
+    using ByName = std::multimap<std::string, std::shared_ptr<Registered>, std::less<>>;
+
+    static void post(const std::shared_ptr<Registered>& registered);
+    void reportUnwatched();
+    /// An empty fault is none.
+    void reportUnreadable(const std::string& name, const std::string& content, std::string_view fault);
+    /// 0 is no failure.
+    void reportNotPosted(std::string_view name, int status);
+
+    StructuredLog& log_;
+    /// Used by `deliverPosts` alone.
+    DirectoryWatcher watcher_;
+    int reportedError_ = 0;
+    std::mutex mutex_; ///< guards what follows
+    ByName byName_;
+    std::unordered_map<int, ByName::iterator> byToken_;
+    int lastToken_ = 0;
+    /// By name: the content and its fault as reported last.
+    std::map<std::string, std::string> reported_;
+    /// The names whose last post failed.
+    std::set<std::string, std::less<>> notPosted_;
+};
+
+} // namespace tamblo

@@ -1,0 +1,79 @@
+#pragma once
+
+#include "base/Dictionary.h"
+#include "os/DirectoryWatcher.h"
+#include "platform/Preferences.h"
+#include "platform/StructuredLog.h"
+#include "platform/linux/settings/JsonFile.h"
+
+#include <atomic>
+#include <cstdint>
+#include <map>
+#include <mutex>
+#include <optional>
+#include <string>
+#include <string_view>
+
+namespace tamblo {
+
+/// Preferences as files: `<directory>/<domain>.json` holds one object, the domain's values by key.
+///
+/// A value is stored by reading the file anew and replacing it with one that differs in that value; the disk
+/// is not waited for. A file that is there and cannot be read as an object is somebody's mistake and is left
+/// as it is. What could not be stored is read back by this process all the same, until the file changes.
+///
+/// A file is read when its domain is first asked for and kept until it changes. Changes are told by the
+/// kernel: the event loop calls `readChanges` when the descriptor is readable, before it handles the sockets
+/// of the same wake-up, so that a preference is in force for every message sent after it was written. Any
+/// thread may ask.
+class LinuxPreferences final : public Preferences {
+public:
+    /// The log must outlive the preferences.
+    LinuxPreferences(std::string directory, StructuredLog& log);
+
+    [[nodiscard]] std::optional<Value> copyPreferenceValue(std::string_view key,
+                                                           std::string_view domain) const override;
+    [[nodiscard]] std::optional<std::string> setPreferenceValue(std::string_view key, std::string_view domain,
+                                                                const Value& value) override;
+
+    /// The file of a domain, whether it is there or not.
+    [[nodiscard]] std::string path(std::string_view domain) const;
+
+    /// For the event loop; -1 when changes cannot be noticed (said in the log; files are then read at every
+    /// request).
+    [[nodiscard]] int fileDescriptor() const noexcept { return watcher_.fileDescriptor(); }
+    void readChanges();
+    /// Another number after every change of a preference: what was worked out from preferences holds for as
+    /// long as this stays the same. Never 0. Read it before the preferences themselves.
+    [[nodiscard]] std::uint64_t generation() const noexcept {
+        return generation_.load(std::memory_order_acquire);
+    }
+
+private:
+    struct Domain {
+        JsonFile file;
+        bool isCurrent = false;
+        std::optional<Dictionary> values = std::nullopt;
+        /// Set here and not in the file.
+        Dictionary unstored = {};
+
+        void forgetFile() {
+            isCurrent = false;
+            unstored = {};
+        }
+    };
+
+    void reportUnwatched();
+    [[nodiscard]] Domain& domainNamed(std::string_view name) const;
+
+    StructuredLog& log_;
+    std::atomic<std::uint64_t> generation_{1};
+    std::atomic<bool> isWatched_{false};
+    /// Used by `readChanges` alone.
+    DirectoryWatcher watcher_;
+    int reportedError_ = 0;
+    mutable std::mutex mutex_;
+    mutable std::map<std::string, Domain, std::less<>> domains_; ///< guarded by `mutex_`
+};
+
+} // namespace tamblo

@@ -1,0 +1,272 @@
+#include "platform/linux/sinks/AppendOnlyFile.h"
+
+#include "base/Format.h"
+
+#include <algorithm>
+#include <array>
+#include <cerrno>
+#include <memory>
+#include <system_error>
+#include <utility>
+
+#include <fcntl.h>
+
+namespace tamblo {
+
+namespace {
+
+/// A buffer that once held an unusually long line gives its memory back.
+constexpr std::size_t kKeptCapacity = 1U << 20U;
+
+/// How often the path of an open file is looked up.
+constexpr std::chrono::milliseconds kPathCheckInterval{100};
+
+std::uint64_t countLines(std::string_view lines) noexcept {
+    return static_cast<std::uint64_t>(std::count(lines.begin(), lines.end(), '\n'));
+}
+
+/// The length of the whole lines among the first `length` bytes.
+std::size_t wholeLines(std::string_view bytes, std::size_t length) noexcept {
+    const std::size_t end = bytes.substr(0, length).find_last_of('\n');
+    return end == std::string_view::npos ? 0 : end + 1;
+}
+
+} // namespace
+
+AppendOnlyFile::AppendOnlyFile(std::string path, std::string_view categoryCode, StructuredLog& log,
+                               FileOperations& operations)
+    : AppendOnlyFile(std::move(path), categoryCode, log, operations, Limits()) {}
+
+AppendOnlyFile::AppendOnlyFile(std::string path, std::string_view categoryCode, StructuredLog& log,
+                               FileOperations& operations, Limits limits)
+    : path_(std::move(path)),
+      categoryCode_(categoryCode),
+      limits_(limits),
+      log_(log),
+      operations_(operations) {
+    // What fails here fails again with the first line, and is told then.
+    static_cast<void>(openFile(0));
+}
+
+AppendOnlyFile::~AppendOnlyFile() {
+    flush();
+    if (isOut_) {
+        endOutage("the service ends");
+    }
+    closeFile();
+}
+
+void AppendOnlyFile::flush() {
+    const std::lock_guard lock(mutex_);
+    if (!waiting_.empty()) {
+        writeOut();
+    }
+}
+
+void AppendOnlyFile::writeOut() {
+    std::string_view lines = waiting_.view();
+    const bool wasOut = isOut_;
+    if (writeLines(lines)) {
+        if (wasOut) {
+            endOutage("it can be written again");
+        }
+    } else {
+        if (!std::exchange(isOut_, true)) {
+            log_.report(
+                LogLevel::error, categoryCode_,
+                formatted("{}: {}; its records are lost until it can be written again", path_, fault_));
+        }
+        lostLines_ += countLines(lines);
+    }
+    if (waiting_.capacity() > kKeptCapacity) {
+        waiting_.reset();
+    }
+    waiting_.clear();
+}
+
+void AppendOnlyFile::endOutage(std::string_view ending) {
+    isOut_ = false;
+    log_.report(LogLevel::error, categoryCode_,
+                formatted("{}: {}; {} records were lost", path_, ending, std::exchange(lostLines_, 0)));
+}
+
+/// Takes the lines that have been written off the front.
+bool AppendOnlyFile::writeLines(std::string_view& lines) {
+    if (!isStillInPlace()) {
+        closeFile();
+    }
+    while (!lines.empty()) {
+        if (descriptor_ < 0 && !openFile(O_CREAT)) {
+            return false;
+        }
+        const std::size_t length = linesThatFit(lines);
+        if (length == 0) {
+            if (!rotate()) {
+                return false;
+            }
+            continue;
+        }
+        if (!writeFully(lines, length)) {
+            return false;
+        }
+    }
+    return true;
+}
+
+/// The length of the lines that the file still takes; at least one line when it is empty.
+std::size_t AppendOnlyFile::linesThatFit(std::string_view lines) const noexcept {
+    const std::uint64_t room = limits_.fileSize - std::min(size_, limits_.fileSize);
+    if (lines.size() <= room) {
+        return lines.size();
+    }
+    const std::size_t fitting = wholeLines(lines, static_cast<std::size_t>(room));
+    return fitting == 0 && size_ == 0 ? lines.find('\n') + 1 : fitting;
+}
+
+bool AppendOnlyFile::writeFully(std::string_view& lines, std::size_t length) {
+    std::string_view rest = lines.substr(0, length);
+    if (!operations_.writeAll(descriptor_, rest)) {
+        const bool result = failed("write");
+        const std::size_t written = length - rest.size();
+        const std::size_t whole = wholeLines(lines, written);
+        cutTornLine(written - whole);
+        lines.remove_prefix(whole);
+        return result;
+    }
+    size_ += length;
+    lines.remove_prefix(length);
+    return true;
+}
+
+/// Takes back the part of a line that was written last. If that fails too, the line is cut off when the file
+/// is opened again, which is the next thing that happens to it.
+void AppendOnlyFile::cutTornLine(std::size_t tornBytes) noexcept {
+    struct stat status {};
+    if (tornBytes != 0 && operations_.status(descriptor_, status) == 0 &&
+        status.st_size >= static_cast<off_t>(tornBytes)) {
+        static_cast<void>(operations_.truncate(descriptor_, status.st_size - static_cast<off_t>(tornBytes)));
+    }
+    closeFile();
+}
+
+/// Whether the path still leads to the file that is open; takes in its size, in case somebody shortened it. A
+/// look costs half of what a small write does, so it is taken now and then: what is written to a file in the
+/// moments after somebody removed it goes with it.
+bool AppendOnlyFile::isStillInPlace() noexcept {
+    if (descriptor_ < 0) {
+        return false;
+    }
+    const std::chrono::nanoseconds now = operations_.coarseTime();
+    if (now - pathCheckedAt_ < kPathCheckInterval) {
+        return true;
+    }
+    pathCheckedAt_ = now;
+    struct stat status {};
+    if (operations_.status(path_.c_str(), status) != 0 || status.st_ino != inode_ ||
+        status.st_dev != device_) {
+        return false;
+    }
+    size_ = static_cast<std::uint64_t>(status.st_size);
+    return true;
+}
+
+bool AppendOnlyFile::openFile(int creationFlag) {
+    const int flags = O_RDWR | O_APPEND | O_CLOEXEC | O_NOCTTY | O_NONBLOCK | creationFlag;
+    const int descriptor = operations_.open(path_.c_str(), flags, S_IRUSR | S_IWUSR);
+    if (descriptor < 0) {
+        return failed("open");
+    }
+    if (adopt(descriptor)) {
+        return true;
+    }
+    operations_.close(descriptor);
+    return false;
+}
+
+bool AppendOnlyFile::adopt(int descriptor) {
+    struct stat status {};
+    if (operations_.status(descriptor, status) != 0) {
+        return failed("examine");
+    }
+    if (!S_ISREG(status.st_mode)) {
+        fault_ = "not a regular file";
+        return false;
+    }
+    std::uint64_t end = static_cast<std::uint64_t>(status.st_size);
+    if (!findEndOfLastLine(descriptor, end)) {
+        return failed("read");
+    }
+    if (end != static_cast<std::uint64_t>(status.st_size) &&
+        operations_.truncate(descriptor, static_cast<off_t>(end)) != 0) {
+        return failed("cut a torn line off");
+    }
+    descriptor_ = descriptor;
+    size_ = end;
+    device_ = status.st_dev;
+    inode_ = status.st_ino;
+    return true;
+}
+
+/// Moves `end` back to behind the last line end before it.
+bool AppendOnlyFile::findEndOfLastLine(int descriptor, std::uint64_t& end) {
+    char last = '\0';
+    if (end == 0) {
+        return true;
+    }
+    if (operations_.readAt(descriptor, &last, 1, static_cast<off_t>(end - 1)) != 1) {
+        return false;
+    }
+    if (last == '\n') {
+        return true;
+    }
+    const auto block = std::make_unique<std::array<char, 65536>>();
+    while (end != 0) {
+        const std::size_t count = std::min<std::uint64_t>(end, block->size());
+        const std::uint64_t start = end - count;
+        if (operations_.readAt(descriptor, block->data(), count, static_cast<off_t>(start)) !=
+            static_cast<ssize_t>(count)) {
+            return false;
+        }
+        const std::size_t whole = wholeLines({block->data(), count}, count);
+        end = start + whole;
+        if (whole != 0) {
+            break;
+        }
+    }
+    return true;
+}
+
+/// Moves the file out of the way. Earlier files move up only as far as the first free number, so that a
+/// rotation that fails half-way and is tried again pushes none of them out.
+bool AppendOnlyFile::rotate() {
+    const auto numbered = [this](int number) {
+        return number == 0 ? path_ : formatted("{}.{}", path_, number);
+    };
+    int free = 1;
+    struct stat status {};
+    while (free < kKeptFiles && operations_.status(numbered(free).c_str(), status) == 0) {
+        ++free;
+    }
+    for (int number = free; number > 0; --number) {
+        if (operations_.rename(numbered(number - 1).c_str(), numbered(number).c_str()) != 0) {
+            const bool result = failed("rename");
+            closeFile();
+            return result;
+        }
+    }
+    closeFile();
+    return true;
+}
+
+void AppendOnlyFile::closeFile() noexcept {
+    if (descriptor_ >= 0) {
+        operations_.close(std::exchange(descriptor_, -1));
+    }
+}
+
+bool AppendOnlyFile::failed(std::string_view action) {
+    fault_ = formatted("cannot {}: {}", action, std::generic_category().message(errno));
+    return false;
+}
+
+} // namespace tamblo

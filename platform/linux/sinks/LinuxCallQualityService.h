@@ -1,0 +1,68 @@
+#pragma once
+
+#include "platform/CallQualityService.h"
+#include "platform/Clock.h"
+#include "platform/StructuredLog.h"
+#include "platform/WorkQueue.h"
+#include "platform/linux/settings/LinuxPreferences.h"
+#include "platform/linux/sinks/AppendOnlyFile.h"
+
+#include <atomic>
+#include <cstdint>
+#include <memory>
+#include <mutex>
+#include <optional>
+#include <string>
+
+namespace tamblo {
+
+/// The call-quality service as a spool, the file of JSON lines `call-quality.jsonl`:
+///
+///     {"time":…,"op":"open","session":"9f86d081884c7d65.1","sessionInfo":{…},"userInfo":{…}}
+///     {"time":…,"op":"message","session":"9f86d081884c7d65.1","category":4,"type":1,"payload":{…}}
+///     {"time":…,"op":"flush","session":"9f86d081884c7d65.1"}
+///
+/// A session's name is one for the file's whole life: 64 random bits of the process, and a count. Which back
+/// ends there are is a preference, domain `com.vandra.tamblo.callquality`, key `backends`; it is looked up on
+/// a queue of the service's own, as looking for real ones would take its time.
+class LinuxCallQualityService final : public CallQualityService {
+public:
+    /// What is referred to must outlive the service, except the queues, which are used from the first session
+    /// on and work off what was posted before the service goes.
+    LinuxCallQualityService(const std::string& logsDirectory, const Clock& clock,
+                            const LinuxPreferences& preferences, WorkQueues& workQueues, StructuredLog& log,
+                            FileOperations& operations = FileOperations::system());
+
+    [[nodiscard]] std::optional<std::string> NewHierarchyToken(std::string_view parent) override;
+    [[nodiscard]] SessionRef CreateLinkmeterSession(const Dictionary& sessionInfo,
+                                                    const Dictionary& userInfo) override;
+    void StartConfiguration(const SessionRef& session, Completion completion) override;
+    [[nodiscard]] std::optional<std::string> SendLinkmeterMessage(const SessionRef& session,
+                                                                  std::uint16_t category, std::uint16_t type,
+                                                                  const Dictionary& payload) override;
+    void FlushMessages(const SessionRef& session) override;
+    void commit() override;
+
+    /// What was recorded goes to the file.
+    void flush() { file_.flush(); }
+
+private:
+    class SpoolSession;
+
+    [[nodiscard]] std::optional<std::vector<std::string>> findBackends();
+
+    const std::string processName_;
+    const Clock& clock_;
+    const LinuxPreferences& preferences_;
+    WorkQueues& workQueues_;
+    StructuredLog& log_;
+    AppendOnlyFile file_;
+    std::atomic<std::uint64_t> lastToken_{0};
+    std::atomic<std::uint64_t> lastSession_{0};
+    std::once_flag isQueueMade_;
+    std::unique_ptr<SerialQueue> queue_;
+    /// The malformed value that the log knows of; the queue's.
+    std::optional<Value> reported_;
+};
+
+} // namespace tamblo
