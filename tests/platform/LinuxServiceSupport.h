@@ -14,6 +14,7 @@
 #include <utility>
 #include <vector>
 
+#include <poll.h>
 #include <stdlib.h>
 
 namespace tamblo {
@@ -48,6 +49,11 @@ public:
 private:
     std::string path_;
 };
+
+[[nodiscard]] inline bool isReadable(int descriptor, int milliseconds = 2000) {
+    pollfd question{descriptor, POLLIN, 0};
+    return ::poll(&question, 1, milliseconds) == 1;
+}
 
 /// Keeps what is logged, as `LEVEL CODE TEXT` with the level as a digit, without the prefix of 32 bytes.
 class RecordingLog final : public StructuredLog {

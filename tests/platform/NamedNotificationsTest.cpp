@@ -18,7 +18,6 @@
 #include <utility>
 #include <vector>
 
-#include <poll.h>
 #include <sys/stat.h>
 
 namespace tamblo {
@@ -28,11 +27,6 @@ using testing::ElementsAre;
 using testing::HasSubstr;
 using testing::IsEmpty;
 using testing::UnorderedElementsAre;
-
-bool isReadable(int descriptor, int milliseconds) {
-    pollfd question{descriptor, POLLIN, 0};
-    return ::poll(&question, 1, milliseconds) == 1;
-}
 
 class NamedNotificationsTest : public testing::Test {
 protected:
