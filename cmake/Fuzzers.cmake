@@ -3,7 +3,7 @@
 file(GLOB tamblo_fuzzers CONFIGURE_DEPENDS RELATIVE "${CMAKE_SOURCE_DIR}" fuzz/*Fuzzer.cpp)
 foreach(source IN LISTS tamblo_fuzzers)
     get_filename_component(name "${source}" NAME_WE)
-    set(libraries metrics wire base)
+    set(libraries tools wire base)
     if(name STREQUAL ServiceFuzzer)
         list(APPEND libraries service platform/linux tests/fakes)
     endif()

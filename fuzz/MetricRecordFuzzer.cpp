@@ -1,4 +1,4 @@
-#include "metrics/AudioIssueDetected.h"
+#include "tools/MetricRecord.h"
 
 #include <cstddef>
 #include <cstdint>
@@ -90,7 +90,7 @@ struct Model {
                 if (!text) {
                     return false;
                 }
-            } else if (!skip(rest, *key, ProtoReader::kMaximumDepth)) {
+            } else if (!skip(rest, *key, tools::ProtoReader::kMaximumDepth)) {
                 return false;
             }
         }
@@ -100,9 +100,9 @@ struct Model {
 
 /// The reader agrees with the model; what was read is written so that it reads back equal, and is shown.
 void checkRecord(Bytes bytes) {
-    ProtoReader reader(bytes);
+    tools::ProtoReader reader(bytes);
     qmxmetrics::AudioIssueDetected record;
-    const bool isAccepted = record.readFrom(reader);
+    const bool isAccepted = tools::readRecord(reader, record);
     require(reader.position() <= bytes.size());
     Model model;
     require(isAccepted == model.read(bytes));
@@ -115,13 +115,12 @@ void checkRecord(Bytes bytes) {
     TextBuffer written;
     ProtoWriter writer(written);
     record.writeTo(writer);
-    ProtoReader again(written.bytes());
+    tools::ProtoReader again(written.bytes());
     qmxmetrics::AudioIssueDetected reread;
-    require(reread.readFrom(again) && again.atEnd() && reread == record);
+    require(tools::readRecord(again, reread) && again.atEnd() && reread == record);
     require(hash_value(reread) == hash_value(record));
     std::string text;
-    ProtoTextFormatter formatter(text);
-    record.formatText(formatter, "record");
+    tools::appendRecordText(text, record);
     require(text.ends_with("}\n"));
 }
 

@@ -1,6 +1,6 @@
 #pragma once
 
-#include "metrics/ProtoMessageBase.h"
+#include "metrics/ProtoWriter.h"
 
 #include <cstddef>
 #include <cstdint>
@@ -12,27 +12,24 @@ namespace tamblo::qmxmetrics {
 /// The number of the metric whose records these are.
 inline constexpr std::uint32_t kAudioIssueMetric = 0x005B0003;
 
-/// The metric record of one detected audio issue. `packaging/audio_issue_detected.proto` describes it for
-/// other programs.
+/// The metric record of one detected audio issue, a Protocol Buffers message (proto2).
+/// `packaging/audio_issue_detected.proto` describes it for other programs.
 ///
 /// Only the timestamp may be absent, which is something else than 0: the other fields are always written,
 /// also when they are empty or 0.
-class AudioIssueDetected final : public ProtoMessageBase {
-public:
-    [[nodiscard]] bool readFrom(ProtoReader& reader) override;
-    void writeTo(ProtoWriter& writer) const override;
-    void formatText(ProtoTextFormatter& formatter, std::string_view name) const override;
+struct AudioIssueDetected {
+    enum Field : std::uint32_t { kTimestamp = 1, kDuration, kIssuetype, kNode, kRtaidclient };
 
-    [[nodiscard]] bool operator==(const AudioIssueDetected& other) const noexcept;
-
+    std::optional<std::uint64_t> timestamp;
+    std::int32_t duration = 0;
     std::string issuetype;
     std::string node;
     std::string rtaidclient;
-    std::optional<std::uint64_t> timestamp;
-    std::int32_t duration = 0;
 
-private:
-    void readField(ProtoReader& reader, std::uint64_t field);
+    /// In the order of the field numbers.
+    void writeTo(ProtoWriter& writer) const;
+
+    [[nodiscard]] bool operator==(const AudioIssueDetected& other) const noexcept = default;
 };
 
 void swap(AudioIssueDetected& first, AudioIssueDetected& second) noexcept;

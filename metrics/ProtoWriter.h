@@ -7,19 +7,38 @@
 
 namespace tamblo {
 
-/// Appends fields in the Protocol Buffers wire format (see `ProtoReader`), each with its key.
+/// Appends fields in the Protocol Buffers wire format, each with its key:
+///
+///   field    key value
+///   key      varint: field number << 3 | wire type
+///   value    by wire type: 0 varint, 1 eight bytes, 2 varint length and that many bytes,
+///            3 fields up to the key of the same number with wire type 4, 5 four bytes
+///   varint   groups of seven bits, the lowest first; the top bit says that another follows
 class ProtoWriter {
 public:
     explicit ProtoWriter(TextBuffer& out) noexcept : out_(out) {}
 
-    void unsigned64(std::uint32_t field, std::uint64_t value);
+    void unsigned64(std::uint32_t field, std::uint64_t value) {
+        varint(std::uint64_t{field} << 3U);
+        varint(value);
+    }
     /// A negative number takes ten bytes, as one of 64 bits would.
-    void signed32(std::uint32_t field, std::int32_t value);
-    void string(std::uint32_t field, std::string_view bytes);
+    void signed32(std::uint32_t field, std::int32_t value) {
+        unsigned64(field, static_cast<std::uint64_t>(std::int64_t{value}));
+    }
+    void string(std::uint32_t field, std::string_view bytes) {
+        varint(std::uint64_t{field} << 3U | 2U);
+        varint(bytes.size());
+        out_.append(bytes);
+    }
 
 private:
-    void key(std::uint32_t field, std::uint8_t wireType);
-    void varint(std::uint64_t value);
+    void varint(std::uint64_t value) {
+        for (; value >= 0x80; value >>= 7U) {
+            out_.append(static_cast<char>(value | 0x80U));
+        }
+        out_.append(static_cast<char>(value));
+    }
 
     TextBuffer& out_;
 };

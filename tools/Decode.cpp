@@ -4,8 +4,9 @@
 #include "base/Format.h"
 #include "base/Json.h"
 #include "base/Rfc3339.h"
-#include "metrics/AudioIssueDetected.h"
+#include "base/SplitText.h"
 #include "tools/DecodeFrames.h"
+#include "tools/MetricRecord.h"
 #include "tools/Payload.h"
 #include "tools/SinkFile.h"
 
@@ -16,16 +17,7 @@ namespace tamblo::tools {
 
 namespace {
 
-constexpr std::string_view kWhiteSpace = " \t\r\n";
 constexpr std::array<std::string_view, 3> kKindNames{"record", "line", "frame"};
-
-std::string_view trimmed(std::string_view text) {
-    const std::size_t first = text.find_first_not_of(kWhiteSpace);
-    if (first == std::string_view::npos) {
-        return {};
-    }
-    return text.substr(first, text.find_last_not_of(kWhiteSpace) + 1 - first);
-}
 
 /// What is wrong with the record, if anything; what could be read of it is shown all the same.
 std::optional<std::string> appendRecord(std::string& out, std::string_view base64) {
@@ -35,9 +27,8 @@ std::optional<std::string> appendRecord(std::string& out, std::string_view base6
     }
     ProtoReader reader(*bytes);
     qmxmetrics::AudioIssueDetected record;
-    const bool isWhole = record.readFrom(reader);
-    ProtoTextFormatter formatter(out);
-    record.formatText(formatter, "AudioIssueDetected");
+    const bool isWhole = readRecord(reader, record);
+    appendRecordText(out, record);
     if (!record.timestamp) {
         out += "# timestamp is not set\n";
     }
@@ -108,9 +99,7 @@ Decoded decodeLines(std::string_view input, AppendOne appendOne) {
     Decoded decoded;
     std::size_t number = 0;
     while (!input.empty()) {
-        const std::size_t end = std::min(input.find('\n'), input.size());
-        const std::string_view line = trimmed(input.substr(0, end));
-        input.remove_prefix(std::min(end + 1, input.size()));
+        const std::string_view line = trimmed(takeUpTo('\n', input));
         ++number;
         if (line.empty()) {
             continue;

@@ -1,7 +1,7 @@
-#include "metrics/AudioIssueDetected.h"
 #include "tests/base/AllocationCount.h"
 #include "tests/fakes/FakePlatform.h"
 #include "tests/fakes/Messages.h"
+#include "tools/MetricRecord.h"
 #include "util/LogCategories.h"
 #include "workers/sinks/ZRReportingSessionJouleryWorker.h"
 #include "workers/sinks/ZRReportingSessionQMXWorker.h"
@@ -112,9 +112,9 @@ protected:
         std::vector<std::string> texts;
         for (const auto& [metric, bytes] : device.diagnosticsMetrics.records) {
             EXPECT_EQ(metric, 5963779U);
-            ProtoReader reader(bytes);
+            tools::ProtoReader reader(bytes);
             qmxmetrics::AudioIssueDetected record;
-            EXPECT_TRUE(record.readFrom(reader) && reader.atEnd());
+            EXPECT_TRUE(tools::readRecord(reader, record) && reader.atEnd());
             EXPECT_FALSE(record.timestamp);
             texts.push_back(std::to_string(record.duration) + " " + record.issuetype + "|" + record.node +
                             "|" + record.rtaidclient);

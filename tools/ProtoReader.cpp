@@ -1,6 +1,6 @@
-#include "metrics/ProtoReader.h"
+#include "tools/ProtoReader.h"
 
-namespace tamblo {
+namespace tamblo::tools {
 
 std::uint64_t ProtoReader::readVarint() noexcept {
     constexpr unsigned longest = 10;
@@ -76,4 +76,4 @@ bool ProtoReader::skipBytes(std::uint64_t count) noexcept {
     return true;
 }
 
-} // namespace tamblo
+} // namespace tamblo::tools

@@ -5,16 +5,10 @@
 #include <span>
 #include <string_view>
 
-namespace tamblo {
+namespace tamblo::tools {
 
-/// Reads the Protocol Buffers wire format from bytes that nobody vouches for: a cursor that never leaves
-/// them, and that stays at its first error.
-///
-///   field    key value
-///   key      varint: field number << 3 | wire type
-///   value    by wire type: 0 varint, 1 eight bytes, 2 varint length and that many bytes,
-///            3 fields up to the key of the same number with wire type 4, 5 four bytes
-///   varint   groups of seven bits, the lowest first; the top bit says that another follows
+/// Reads the Protocol Buffers wire format (see `ProtoWriter`) from bytes that nobody vouches for: a cursor
+/// that never leaves them, and that stays at its first error.
 class ProtoReader {
 public:
     explicit ProtoReader(std::span<const std::uint8_t> bytes) noexcept : bytes_(bytes) {}
@@ -60,4 +54,4 @@ private:
     bool hasError_ = false;
 };
 
-} // namespace tamblo
+} // namespace tamblo::tools
