@@ -33,6 +33,12 @@ public:
     /// Whether from now on every piece may block, whatever it was posted as. From the queue's own work only,
     /// so that no piece slips through in between.
     virtual void setMayBlock(bool mayBlock) = 0;
+    /// No further piece begins until `resume`, on whatever thread that is called; what is posted meanwhile
+    /// waits. From any thread; from the queue's own work, not even what was posted before begins. Not nested:
+    /// to suspend twice is to suspend once, and to resume a queue that runs is nothing. Destroying the queue
+    /// resumes it, so that nothing is stranded.
+    virtual void suspend() = 0;
+    virtual void resume() = 0;
     [[nodiscard]] virtual std::string_view label() const noexcept = 0;
 };
 

@@ -12,7 +12,7 @@ bool FakeStrand::runOne() {
     Work piece;
     {
         const std::lock_guard held(mutex_);
-        if (pieces_.empty()) {
+        if (isSuspended_ || pieces_.empty()) {
             return false;
         }
         piece = std::move(pieces_.front());
@@ -37,6 +37,11 @@ std::size_t FakeStrand::runAll() {
         batchEnd_();
     }
     return count;
+}
+
+void FakeStrand::setSuspended(bool isSuspended) {
+    const std::lock_guard held(mutex_);
+    isSuspended_ = isSuspended;
 }
 
 std::vector<Pace> FakeStrand::takePaces() {

@@ -22,14 +22,16 @@ public:
     /// Runs what is posted, and what that posts, then the batch's end; the number of pieces. Does nothing
     /// inside a piece of its own.
     std::size_t runAll();
-    /// Runs one piece, without the batch's end; false when there is none.
+    /// Runs one piece, without the batch's end; false when there is none, or the queue is suspended.
     bool runOne();
     [[nodiscard]] std::vector<Pace> takePaces();
+    void setSuspended(bool isSuspended);
 
 private:
     Work batchEnd_;
     bool isRunning_ = false;
     std::mutex mutex_;
+    bool isSuspended_ = false;
     std::deque<Work> pieces_;
     std::vector<Pace> paces_;
 };
@@ -40,11 +42,16 @@ public:
     explicit FakeSerialQueue(std::string_view label,
                              std::shared_ptr<FakeStrand> strand = std::make_shared<FakeStrand>())
         : label_(label), strand_(std::move(strand)) {}
-    ~FakeSerialQueue() override { strand_->runAll(); }
+    ~FakeSerialQueue() override {
+        strand_->setSuspended(false);
+        strand_->runAll();
+    }
 
     void post(Work work, Pace pace) override { strand_->post(std::move(work), pace); }
     void setBatchEnd(Work batchEnd) override { strand_->setBatchEnd(std::move(batchEnd)); }
     void setMayBlock(bool mayBlockNow) override { mayBlock = mayBlockNow; }
+    void suspend() override { strand_->setSuspended(true); }
+    void resume() override { strand_->setSuspended(false); }
     [[nodiscard]] std::string_view label() const noexcept override { return label_; }
 
     std::size_t runAll() { return strand_->runAll(); }

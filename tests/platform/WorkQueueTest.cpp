@@ -10,8 +10,11 @@
 #include <future>
 #include <latch>
 #include <memory>
+#include <mutex>
+#include <optional>
 #include <string>
 #include <thread>
+#include <utility>
 #include <vector>
 
 namespace tamblo {
@@ -166,6 +169,90 @@ TEST(SerialQueue, WhatWasPostedRunsAfterItIsDestroyed) {
         EXPECT_EQ(queue, nullptr);
     }
     EXPECT_EQ(ran, 1002);
+}
+
+TEST(SerialQueue, RunsNothingWhileItIsSuspendedAndAllOfItAfterwards) {
+    LinuxWorkQueues queues;
+    for (const bool isInline : {true, false}) {
+        auto queue = queues.makeSerialQueue("suspended");
+        std::mutex mutex;
+        std::string trace;
+        const auto append = [&](char letter) {
+            return [&, letter] {
+                const std::lock_guard lock(mutex);
+                trace += letter;
+            };
+        };
+        const auto traced = [&] {
+            const std::lock_guard lock(mutex);
+            return trace;
+        };
+        std::promise<void> suspended;
+        std::optional<InlineDrain> drain;
+        if (isInline) {
+            drain.emplace();
+        }
+        queue->setBatchEnd([&, isFirst = true]() mutable {
+            if (std::exchange(isFirst, false)) {
+                suspended.set_value();
+            }
+        });
+        queue->post([&] {
+            queue->suspend();
+            queue->suspend();
+            append('a')();
+        });
+        queue->post(append('b')); // as a rule of the same batch
+        drain.reset();
+        ASSERT_EQ(suspended.get_future().wait_for(kPatience), std::future_status::ready);
+        queue->post(append('c'), Pace::mayBlock);
+        queue->post(append('d'));
+        auto other = queues.makeSerialQueue("other");
+        settle(*other);
+        EXPECT_EQ(traced(), "a");
+        other->post([&] { queue->resume(); });
+        settle(*other);
+        settle(*queue);
+        EXPECT_EQ(traced(), "abcd");
+        queue->resume(); // of a queue that runs
+
+        queue->suspend();
+        queue->post(append('e'));
+        std::promise<void> done;
+        queue->post([&done] { done.set_value(); });
+        queue.reset();
+        EXPECT_EQ(done.get_future().wait_for(kPatience), std::future_status::ready);
+        EXPECT_EQ(traced(), "abcde");
+    }
+}
+
+TEST(SerialQueue, LosesNothingWhenItIsSuspendedAndResumedFromManyThreads) {
+    LinuxWorkQueues queues;
+    const auto queue = queues.makeSerialQueue("on and off");
+    constexpr int kPieces = 20'000;
+    int ran = 0;
+    std::atomic<bool> isOver{false};
+    std::vector<std::thread> threads;
+    for (int i = 0; i < 2; ++i) {
+        threads.emplace_back([&] {
+            while (!isOver) {
+                queue->suspend();
+                std::this_thread::yield();
+                queue->resume();
+            }
+        });
+    }
+    for (int i = 0; i < kPieces; ++i) {
+        queue->post([&, i] { ran += static_cast<int>(ran == i); });
+    }
+    std::promise<void> done;
+    queue->post([&done] { done.set_value(); });
+    EXPECT_EQ(done.get_future().wait_for(kPatience), std::future_status::ready);
+    isOver = true;
+    for (std::thread& thread : threads) {
+        thread.join();
+    }
+    EXPECT_EQ(ran, kPieces);
 }
 
 TEST(DelayedCall, IsMadeOnceItsTimeHasComeUnlessItIsCalledOff) {

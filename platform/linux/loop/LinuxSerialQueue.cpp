@@ -48,6 +48,22 @@ void Strand::post(Work work, Pace pace) {
             return;
         }
     }
+    schedule();
+}
+
+void Strand::resume() {
+    {
+        const std::lock_guard lock(mutex_);
+        // The rest of a batch is nobody's while none drains.
+        if (!isSuspended_.exchange(false) || isScheduled_ || (next_ == batch_.size() && pending_.empty())) {
+            return;
+        }
+        isScheduled_ = true;
+    }
+    schedule();
+}
+
+void Strand::schedule() {
     if (currentDrain != nullptr) {
         currentDrain->strands_.push_back(shared_from_this());
     } else {
@@ -59,20 +75,25 @@ void Strand::handToPool() {
     pool_.post([strand = shared_from_this()] { strand->drainOnPool(); });
 }
 
-bool Strand::takeBatch() {
-    batch_.clear();
-    next_ = 0;
+bool Strand::hasBatch() {
+    const bool hasRest = next_ != batch_.size();
+    if (!hasRest) {
+        batch_.clear();
+        next_ = 0;
+    }
     const std::lock_guard lock(mutex_);
-    if (pending_.empty()) {
+    if (isSuspended_ || (!hasRest && pending_.empty())) {
         isScheduled_ = false;
         return false;
     }
-    batch_.swap(pending_);
+    if (!hasRest) {
+        batch_.swap(pending_);
+    }
     return true;
 }
 
 void Strand::runBatch(bool stopAtBlocking) {
-    while (next_ != batch_.size()) {
+    while (next_ != batch_.size() && !isSuspended_) {
         Item& item = batch_[next_];
         if (stopAtBlocking && (mayBlock_ || item.pace == Pace::mayBlock)) {
             break;
@@ -88,7 +109,7 @@ void Strand::runBatch(bool stopAtBlocking) {
 }
 
 void Strand::drainOnPool() {
-    while (next_ != batch_.size() || takeBatch()) {
+    while (hasBatch()) {
         runBatch(false);
     }
 }
@@ -99,11 +120,14 @@ void Strand::drainInline() {
         handToPool();
         return;
     }
-    while (takeBatch()) {
+    while (hasBatch()) {
         runBatch(true);
         const Time ended = std::chrono::steady_clock::now();
         if (ended - started > kSlowBatch) {
             inlineAllowedFrom_ = ended + kInlineBanFactor * (ended - started);
+        }
+        if (isSuspended_) {
+            continue;
         }
         if (next_ != batch_.size() || ended < inlineAllowedFrom_) {
             handToPool();

@@ -3,6 +3,7 @@
 #include "platform/WorkQueue.h"
 #include "platform/linux/loop/ThreadPool.h"
 
+#include <atomic>
 #include <chrono>
 #include <cstddef>
 #include <memory>
@@ -48,6 +49,8 @@ public:
     void post(Work work, Pace pace);
     void setBatchEnd(Work batchEnd) { batchEnd_ = std::move(batchEnd); }
     void setMayBlock(bool mayBlock) noexcept { mayBlock_ = mayBlock; }
+    void suspend() noexcept { isSuspended_ = true; }
+    void resume();
 
 private:
     friend class InlineDrain;
@@ -60,8 +63,10 @@ private:
 
     void drainOnPool();
     void drainInline();
-    bool takeBatch();
+    /// Whether there is something to run: the rest of a batch, or a new one. Otherwise the draining is over.
+    bool hasBatch();
     void runBatch(bool stopAtBlocking);
+    void schedule();
     void handToPool();
 
     ThreadPool& pool_;
@@ -73,9 +78,10 @@ private:
     Time inlineAllowedFrom_{};
     bool mayBlock_ = false;
 
+    std::atomic<bool> isSuspended_{false};
     std::mutex mutex_; ///< guards what follows
     std::vector<Item> pending_;
-    bool isScheduled_ = false;
+    bool isScheduled_ = false; ///< somebody drains, or is about to
 };
 
 /// A serial queue: its user's hold on a strand, which lives on until it has run what was posted.
@@ -83,10 +89,15 @@ class LinuxSerialQueue final : public SerialQueue {
 public:
     LinuxSerialQueue(ThreadPool& pool, std::string_view label)
         : label_(label), strand_(std::make_shared<Strand>(pool)) {}
+    ~LinuxSerialQueue() override { strand_->resume(); }
+    LinuxSerialQueue(const LinuxSerialQueue&) = delete;
+    LinuxSerialQueue& operator=(const LinuxSerialQueue&) = delete;
 
     void post(Work work, Pace pace) override { strand_->post(std::move(work), pace); }
     void setBatchEnd(Work batchEnd) override { strand_->setBatchEnd(std::move(batchEnd)); }
     void setMayBlock(bool mayBlock) override { strand_->setMayBlock(mayBlock); }
+    void suspend() override { strand_->suspend(); }
+    void resume() override { strand_->resume(); }
     [[nodiscard]] std::string_view label() const noexcept override { return label_; }
 
 private:
