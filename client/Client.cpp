@@ -2,8 +2,7 @@
 
 #include "client/Directories.h"
 #include "client/PumpThread.h"
-#include "client/RequestFrame.h"
-#include "wire/Protocol.h"
+#include "wire/Request.h"
 
 #include <limits>
 #include <type_traits>
@@ -13,51 +12,56 @@ namespace tamblo::client {
 
 using std::chrono::milliseconds;
 using wire::Method;
+using wire::ResultKind;
 
 namespace {
 
-template <typename T> Result<T> failed(ErrorCode code) {
-    return {.value = {}, .error = makeError(code)};
+/// What a callback for a result of each kind takes.
+template <ResultKind kKind> struct Taken;
+template <> struct Taken<ResultKind::never> : std::type_identity<bool> {};
+template <> struct Taken<ResultKind::null> : std::type_identity<Nothing> {};
+template <> struct Taken<ResultKind::boolean> : std::type_identity<bool> {};
+template <> struct Taken<ResultKind::serviceType> : std::type_identity<ServiceType> {};
+template <> struct Taken<ResultKind::dictionary> : std::type_identity<Dictionary> {};
+template <> struct Taken<ResultKind::reporterIDs> : std::type_identity<std::vector<std::int64_t>> {};
+
+template <Method kMethod> using ResultOf = Taken<wire::rowOf(kMethod).result>::type;
+
+/// Each answers whether the value, null for null, is of the result's kind.
+bool take(const Value* value, Nothing&) {
+    return value == nullptr;
 }
 
-std::optional<bool> toResult(const ReplyView& reply, std::type_identity<bool>) {
-    if (reply.kind == ReplyView::Kind::boolean) {
-        return reply.boolean;
-    }
-    return reply.kind == ReplyView::Kind::value && reply.value->kind() == Value::Kind::boolean
-               ? std::optional(reply.value->boolValue())
-               : std::nullopt;
+bool take(const Value* value, bool& result) {
+    result = value != nullptr && value->boolValue();
+    return value != nullptr && value->kind() == Value::Kind::boolean;
 }
 
-std::optional<Nothing> toResult(const ReplyView& reply, std::type_identity<Nothing>) {
-    return reply.kind == ReplyView::Kind::null ? std::optional(Nothing{}) : std::nullopt;
+bool take(const Value* value, ServiceType& result) {
+    if (value == nullptr || value->kind() != Value::Kind::integer ||
+        value->unsignedValue() > std::numeric_limits<std::uint16_t>::max()) {
+        return false;
+    }
+    result = static_cast<ServiceType>(value->unsignedValue());
+    return true;
 }
 
-std::optional<ServiceType> toResult(const ReplyView& reply, std::type_identity<ServiceType>) {
-    if (reply.kind != ReplyView::Kind::value || reply.value->kind() != Value::Kind::integer ||
-        reply.value->unsignedValue() > std::numeric_limits<std::uint16_t>::max()) {
-        return std::nullopt;
+bool take(const Value* value, Dictionary& result) {
+    if (value == nullptr || !value->isDictionary()) {
+        return false;
     }
-    return static_cast<ServiceType>(reply.value->unsignedValue());
+    result = value->dictionaryValue();
+    return true;
 }
 
-std::optional<Dictionary> toResult(const ReplyView& reply, std::type_identity<Dictionary>) {
-    if (reply.kind != ReplyView::Kind::value || !reply.value->isDictionary()) {
-        return std::nullopt;
+bool take(const Value* value, std::vector<std::int64_t>& result) {
+    if (value == nullptr || !value->isArray()) {
+        return false;
     }
-    return reply.value->dictionaryValue();
-}
-
-std::optional<std::vector<std::int64_t>> toResult(const ReplyView& reply,
-                                                  std::type_identity<std::vector<std::int64_t>>) {
-    if (reply.kind != ReplyView::Kind::value || !reply.value->isArray()) {
-        return std::nullopt;
+    for (const Value& element : value->arrayValue()) {
+        result.push_back(element.integerValue());
     }
-    std::vector<std::int64_t> numbers;
-    for (const Value& element : reply.value->arrayValue()) {
-        numbers.push_back(element.integerValue());
-    }
-    return numbers;
+    return true;
 }
 
 /// What takes a reply as it comes and hands it to a callback that wants one kind of result.
@@ -66,27 +70,53 @@ template <typename T> ReplyFunction expecting(Callback<T> callback) {
         return {};
     }
     return [callback = std::move(callback)](const ReplyView& reply) mutable {
-        if (reply.kind == ReplyView::Kind::error) {
-            callback({.value = {}, .error = *reply.error});
-            return;
+        Result<T> result;
+        if (reply.error != nullptr) {
+            result.error = *reply.error;
+        } else if (!take(reply.value, result.value)) {
+            result.error = makeError(ErrorCode::unexpectedReply);
         }
-        auto value = toResult(reply, std::type_identity<T>());
-        if (value) {
-            callback({.value = std::move(*value), .error = std::nullopt});
-        } else {
-            callback(failed<T>(ErrorCode::unexpectedReply));
-        }
+        callback(std::move(result));
     };
 }
 
-/// Starts a request whose reply fulfils a future, one that was refused included.
-template <typename T, typename Start> std::future<Result<T>> asFuture(const Start& start) {
+/// Queues a request of the method with the parameters that it has; false when it is refused.
+template <Method kMethod>
+bool request(Engine& engine, wire::RequestView request, Callback<ResultOf<kMethod>> callback,
+             Replies replies = Replies::first) {
+    ClaimedFrame frame(engine);
+    request.method = kMethod;
+    if (callback) {
+        request.id = 0; // another is assigned when it is sent
+    }
+    if (!frame || !wire::appendRequestFrame(frame->frame, request)) {
+        engine.countRefused();
+        return false;
+    }
+    frame->reply = expecting(std::move(callback));
+    frame->wantsEveryReply = replies == Replies::every;
+    frame.publish();
+    return true;
+}
+
+/// The same with a future, which is fulfilled even if the request is refused.
+template <Method kMethod, typename T = ResultOf<kMethod>>
+std::future<Result<T>> requested(Engine& engine, const wire::RequestView& view) {
     const auto promise = std::make_shared<std::promise<Result<T>>>();
     auto future = promise->get_future();
-    if (!start([promise](Result<T>&& result) { promise->set_value(std::move(result)); })) {
-        promise->set_value(failed<T>(ErrorCode::refused));
+    if (!request<kMethod>(engine, view,
+                          [promise](Result<T>&& result) { promise->set_value(std::move(result)); })) {
+        promise->set_value({.value = {}, .error = makeError(ErrorCode::refused)});
     }
     return future;
+}
+
+wire::RequestView messageView(const Dictionary& payload, EventCategory category, EventType type,
+                              std::span<const std::int64_t> reporterIDs) {
+    return {.dictionary = payload,
+            .category = static_cast<std::uint32_t>(category),
+            .type = static_cast<std::uint16_t>(type),
+            .reporterIDs = reporterIDs};
 }
 
 Engine::Options engineOptions(Client::Options& options) {
@@ -114,146 +144,106 @@ Client::~Client() {
     }
 }
 
-template <typename Write> bool Client::enqueue(ReplyFunction reply, Replies replies, const Write& write) {
-    ClaimedFrame frame(*engine_);
-    if (!frame || !write(frame->frame, static_cast<bool>(reply))) {
-        engine_->countRefused();
-        return false;
-    }
-    frame->reply = std::move(reply);
-    frame->wantsEveryReply = replies == Replies::every;
-    frame.publish();
-    return true;
-}
-
 bool Client::createReportingSession(std::int64_t reporterID, Callback<bool> callback) {
-    return enqueue(expecting(std::move(callback)), Replies::first, [&](TextBuffer& out, bool wantsReply) {
-        return request_frame::writeForReporter(out, wantsReply, Method::createReportingSession, reporterID);
-    });
+    return request<Method::createReportingSession>(*engine_, {.reporterID = reporterID}, std::move(callback));
 }
 
 bool Client::setServiceType(ServiceType type, std::int64_t reporterID, Callback<bool> callback) {
-    return enqueue(expecting(std::move(callback)), Replies::first, [&](TextBuffer& out, bool wantsReply) {
-        return request_frame::writeSetServiceType(out, wantsReply, type, reporterID);
-    });
+    return request<Method::setServiceType>(
+        *engine_, {.reporterID = reporterID, .serviceType = static_cast<std::uint16_t>(type)},
+        std::move(callback));
 }
 
 bool Client::getServiceNameForReporterID(std::int64_t reporterID, Callback<ServiceType> callback,
                                          Replies replies) {
-    return enqueue(expecting(std::move(callback)), replies, [&](TextBuffer& out, bool wantsReply) {
-        return request_frame::writeForReporter(out, wantsReply, Method::getServiceNameForReporterID,
-                                               reporterID);
-    });
+    return request<Method::getServiceNameForReporterID>(*engine_, {.reporterID = reporterID},
+                                                        std::move(callback), replies);
 }
 
 bool Client::setConfiguration(const Dictionary& configuration, std::int64_t reporterID,
                               Callback<bool> callback) {
-    return enqueue(expecting(std::move(callback)), Replies::first, [&](TextBuffer& out, bool wantsReply) {
-        return request_frame::writeSetConfiguration(out, wantsReply, configuration, reporterID);
-    });
+    return request<Method::setConfiguration>(
+        *engine_, {.reporterID = reporterID, .dictionary = configuration}, std::move(callback));
 }
 
 bool Client::startReportingSessionForID(std::int64_t reporterID, Callback<bool> callback, Replies replies) {
-    return enqueue(expecting(std::move(callback)), replies, [&](TextBuffer& out, bool wantsReply) {
-        return request_frame::writeForReporter(out, wantsReply, Method::startReportingSessionForID,
-                                               reporterID);
-    });
+    return request<Method::startReportingSessionForID>(*engine_, {.reporterID = reporterID},
+                                                       std::move(callback), replies);
 }
 
 bool Client::sendMessage(const Dictionary& payload, EventCategory category, EventType type,
                          std::span<const std::int64_t> reporterIDs, Callback<Nothing> callback) {
-    return enqueue(expecting(std::move(callback)), Replies::first, [&](TextBuffer& out, bool wantsReply) {
-        return request_frame::writeMessage(out, wantsReply, payload, category, type, reporterIDs);
-    });
+    return request<Method::sendMessage>(*engine_, messageView(payload, category, type, reporterIDs),
+                                        std::move(callback));
 }
 
 bool Client::stopReportingSessionForID(std::int64_t reporterID, Callback<bool> callback) {
-    return enqueue(expecting(std::move(callback)), Replies::first, [&](TextBuffer& out, bool wantsReply) {
-        return request_frame::writeForReporter(out, wantsReply, Method::stopReportingSessionForID,
-                                               reporterID);
-    });
+    return request<Method::stopReportingSessionForID>(*engine_, {.reporterID = reporterID},
+                                                      std::move(callback));
 }
 
 bool Client::destroyReportingSession(std::int64_t reporterID, Callback<bool> callback) {
-    return enqueue(expecting(std::move(callback)), Replies::first, [&](TextBuffer& out, bool wantsReply) {
-        return request_frame::writeForReporter(out, wantsReply, Method::destroyReportingSession, reporterID);
-    });
+    return request<Method::destroyReportingSession>(*engine_, {.reporterID = reporterID},
+                                                    std::move(callback));
 }
 
 bool Client::reporterID(std::int64_t reporterID, Callback<Dictionary> callback) {
-    return enqueue(expecting(std::move(callback)), Replies::first, [&](TextBuffer& out, bool wantsReply) {
-        return request_frame::writeForReporter(out, wantsReply, Method::reporterID, reporterID);
-    });
+    return request<Method::reporterID>(*engine_, {.reporterID = reporterID}, std::move(callback));
 }
 
 bool Client::getAllReporters(Callback<std::vector<std::int64_t>> callback) {
-    return enqueue(expecting(std::move(callback)), Replies::first, [&](TextBuffer& out, bool wantsReply) {
-        return request_frame::writeSimple(out, wantsReply, Method::getAllReporters);
-    });
+    return request<Method::getAllReporters>(*engine_, {}, std::move(callback));
 }
 
 bool Client::killService(Callback<bool> callback) {
-    return enqueue(expecting(std::move(callback)), Replies::first, [&](TextBuffer& out, bool wantsReply) {
-        return request_frame::writeSimple(out, wantsReply, Method::killService);
-    });
+    return request<Method::killService>(*engine_, {}, std::move(callback));
 }
 
 std::future<Result<bool>> Client::createReportingSession(std::int64_t reporterID) {
-    return asFuture<bool>(
-        [&](Callback<bool> callback) { return createReportingSession(reporterID, std::move(callback)); });
+    return requested<Method::createReportingSession>(*engine_, {.reporterID = reporterID});
 }
 
 std::future<Result<bool>> Client::setServiceType(ServiceType type, std::int64_t reporterID) {
-    return asFuture<bool>(
-        [&](Callback<bool> callback) { return setServiceType(type, reporterID, std::move(callback)); });
+    return requested<Method::setServiceType>(
+        *engine_, {.reporterID = reporterID, .serviceType = static_cast<std::uint16_t>(type)});
 }
 
 std::future<Result<ServiceType>> Client::getServiceNameForReporterID(std::int64_t reporterID) {
-    return asFuture<ServiceType>([&](Callback<ServiceType> callback) {
-        return getServiceNameForReporterID(reporterID, std::move(callback));
-    });
+    return requested<Method::getServiceNameForReporterID>(*engine_, {.reporterID = reporterID});
 }
 
 std::future<Result<bool>> Client::setConfiguration(const Dictionary& configuration, std::int64_t reporterID) {
-    return asFuture<bool>([&](Callback<bool> callback) {
-        return setConfiguration(configuration, reporterID, std::move(callback));
-    });
+    return requested<Method::setConfiguration>(*engine_,
+                                               {.reporterID = reporterID, .dictionary = configuration});
 }
 
 std::future<Result<bool>> Client::startReportingSessionForID(std::int64_t reporterID) {
-    return asFuture<bool>(
-        [&](Callback<bool> callback) { return startReportingSessionForID(reporterID, std::move(callback)); });
+    return requested<Method::startReportingSessionForID>(*engine_, {.reporterID = reporterID});
 }
 
 std::future<Result<Nothing>> Client::sendMessage(const Dictionary& payload, EventCategory category,
                                                  EventType type, std::span<const std::int64_t> reporterIDs) {
-    return asFuture<Nothing>([&](Callback<Nothing> callback) {
-        return sendMessage(payload, category, type, reporterIDs, std::move(callback));
-    });
+    return requested<Method::sendMessage>(*engine_, messageView(payload, category, type, reporterIDs));
 }
 
 std::future<Result<bool>> Client::stopReportingSessionForID(std::int64_t reporterID) {
-    return asFuture<bool>(
-        [&](Callback<bool> callback) { return stopReportingSessionForID(reporterID, std::move(callback)); });
+    return requested<Method::stopReportingSessionForID>(*engine_, {.reporterID = reporterID});
 }
 
 std::future<Result<bool>> Client::destroyReportingSession(std::int64_t reporterID) {
-    return asFuture<bool>(
-        [&](Callback<bool> callback) { return destroyReportingSession(reporterID, std::move(callback)); });
+    return requested<Method::destroyReportingSession>(*engine_, {.reporterID = reporterID});
 }
 
 std::future<Result<Dictionary>> Client::reporterID(std::int64_t reporterID) {
-    return asFuture<Dictionary>(
-        [&](Callback<Dictionary> callback) { return this->reporterID(reporterID, std::move(callback)); });
+    return requested<Method::reporterID>(*engine_, {.reporterID = reporterID});
 }
 
 std::future<Result<std::vector<std::int64_t>>> Client::getAllReporters() {
-    return asFuture<std::vector<std::int64_t>>(
-        [&](Callback<std::vector<std::int64_t>> callback) { return getAllReporters(std::move(callback)); });
+    return requested<Method::getAllReporters>(*engine_, {});
 }
 
 std::future<Result<bool>> Client::killService() {
-    return asFuture<bool>([&](Callback<bool> callback) { return killService(std::move(callback)); });
+    return requested<Method::killService>(*engine_, {});
 }
 
 bool Client::post(const Dictionary& payload, EventCategory category, EventType type,

@@ -152,8 +152,6 @@ public:
 private:
     class PumpThread;
 
-    template <typename Write> bool enqueue(ReplyFunction reply, Replies replies, const Write& write);
-
     std::chrono::milliseconds linger_;
     std::unique_ptr<Engine> engine_;
     std::unique_ptr<PumpThread> thread_; ///< in background mode

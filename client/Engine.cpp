@@ -1,9 +1,8 @@
 #include "client/Engine.h"
 
-#include "client/PlainReply.h"
-#include "client/RequestFrame.h"
 #include "wire/FrameSplitter.h"
 #include "wire/Reply.h"
+#include "wire/Request.h"
 
 #include <algorithm>
 #include <bit>
@@ -26,53 +25,30 @@ namespace tamblo::client {
 
 using std::chrono::milliseconds;
 
-namespace {
-
-/// The engine that says on this thread that it is connected.
-thread_local const Engine* announcingEngine = nullptr;
-
-/// Sets a variable for as long as the scope lasts.
-template <typename T> class Scoped {
-public:
-    Scoped(T& variable, T value) : variable_(variable), before_(std::exchange(variable, value)) {}
-    ~Scoped() { variable_ = before_; }
-    Scoped(const Scoped&) = delete;
-    Scoped& operator=(const Scoped&) = delete;
-
-private:
-    T& variable_;
-    T before_;
-};
-
-} // namespace
-
 Engine::Engine(Options options) : options_(std::move(options)), queue_(options_.queueCapacity) {
     (void)received_.room(kReadBytes);
     if (options_.wakeable) {
-        wakeUp_ = ::eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK);
+        wakeUp_ = FileDescriptor(::eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK));
     }
 }
 
 Engine::~Engine() {
     close();
-    if (wakeUp_ >= 0) {
-        ::close(wakeUp_);
-    }
 }
 
 OutgoingFrame* Engine::outgoing() noexcept {
-    if (announcingEngine == this) [[unlikely]] {
+    if (goesAhead()) [[unlikely]] {
         return &prologue_.emplace_back();
     }
     return isClosed_.load(std::memory_order_relaxed) ? nullptr : queue_.claim();
 }
 
 void Engine::publish(OutgoingFrame& frame) noexcept {
-    if (announcingEngine == this) [[unlikely]] {
+    if (goesAhead()) [[unlikely]] {
         return;
     }
     auto& slot = static_cast<SendQueue::Slot&>(frame);
-    if (wakeUp_ < 0) {
+    if (!wakeUp_.isOpen()) {
         queue_.publish(slot, std::memory_order_release);
         return;
     }
@@ -97,7 +73,7 @@ void Engine::wake() noexcept {
 
 void Engine::writeWakeUp() noexcept {
     const std::uint64_t one = 1;
-    (void)!::write(wakeUp_, &one, sizeof one);
+    (void)!::write(wakeUp_.get(), &one, sizeof one);
 }
 
 OutgoingFrame* Engine::frameAt(std::size_t index) noexcept {
@@ -117,25 +93,21 @@ bool Engine::open() {
         return false;
     }
     std::memcpy(address.sun_path, path.data(), path.size());
-    const int descriptor = ::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0);
-    if (descriptor < 0) {
-        return false;
-    }
-    if (::connect(descriptor, reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0) {
-        ::close(descriptor);
+    FileDescriptor socket(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0));
+    if (::connect(socket.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0) {
         return false;
     }
     if (!options_.wakeable) {
         // One call then both waits for a reply and reads it; what must not wait says so call by call.
-        (void)::fcntl(descriptor, F_SETFL, 0);
+        (void)::fcntl(socket.get(), F_SETFL, 0);
     }
-    socket_ = descriptor;
+    socket_ = std::move(socket);
     return true;
 }
 
 bool Engine::connect() {
-    if (socket_ >= 0 || isAnnouncing_ || isClosed_) {
-        return socket_ >= 0;
+    if (socket_.isOpen() || isAnnouncing_ || isClosed_) {
+        return socket_.isOpen();
     }
     lastAttempt_ = Clock::now();
     hadWaiting_ = !isFlushed();
@@ -168,14 +140,22 @@ void Engine::announce(ConnectionState state) {
     if (!options_.onState) {
         return;
     }
-    const Scoped<bool> announcing(isAnnouncing_, true);
-    const Scoped<const Engine*> ahead(announcingEngine, state == ConnectionState::connected ? this : nullptr);
+    isAnnouncing_ = true;
+    if (state == ConnectionState::connected) {
+        announcingThread_.store(std::this_thread::get_id(), std::memory_order_relaxed);
+    }
     options_.onState(state);
+    announcingThread_.store({}, std::memory_order_relaxed);
+    isAnnouncing_ = false;
+}
+
+void Engine::disconnect() noexcept {
+    socket_.reset();
+    isConnected_.store(false, std::memory_order_relaxed);
 }
 
 void Engine::lose() {
-    ::close(std::exchange(socket_, -1));
-    isConnected_.store(false, std::memory_order_relaxed);
+    disconnect();
     delay_ = kFirstDelay;
     lastAttempt_ = Clock::now();
     hadWaiting_ = !isFlushed();
@@ -196,7 +176,7 @@ void Engine::failFrame(OutgoingFrame& frame, ErrorCode code) {
     if (reply) {
         hasNews_ = true;
         const Error error = makeError(code);
-        reply({.kind = ReplyView::Kind::error, .error = &error});
+        reply({.error = &error});
     }
 }
 
@@ -207,7 +187,8 @@ void Engine::failPrologue(ErrorCode code) {
     }
 }
 
-void Engine::failQueue(ErrorCode code) {
+void Engine::failWaiting(ErrorCode code) {
+    failPrologue(code);
     // No more than a queue's length: those who are told may send again at once.
     for (std::size_t i = 0; i < queue_.capacity(); ++i) {
         OutgoingFrame* const frame = queue_.peek(0);
@@ -225,13 +206,9 @@ void Engine::close() {
     }
     isClosed_ = true;
     options_.onState.reset();
-    if (socket_ >= 0) {
-        ::close(std::exchange(socket_, -1));
-        isConnected_.store(false, std::memory_order_relaxed);
-    }
+    disconnect();
     pending_.failAll(makeError(ErrorCode::closed));
-    failPrologue(ErrorCode::closed);
-    failQueue(ErrorCode::closed);
+    failWaiting(ErrorCode::closed);
 }
 
 // Sending
@@ -245,12 +222,12 @@ bool Engine::assignId(OutgoingFrame& frame) {
         return false;
     }
     frame.id = *id;
-    request_frame::fillInId(frame.frame, *id);
+    wire::replaceId(frame.frame, *id);
     return true;
 }
 
 void Engine::send() {
-    while (socket_ >= 0) {
+    while (socket_.isOpen()) {
         iovec pieces[kFramesPerSend];
         std::size_t count = 0;
         while (count < kFramesPerSend) {
@@ -282,7 +259,7 @@ bool Engine::sendPieces(std::span<iovec> pieces) {
     msghdr message{};
     message.msg_iov = pieces.data();
     message.msg_iovlen = pieces.size();
-    const ssize_t sent = ::sendmsg(socket_, &message, MSG_NOSIGNAL | MSG_DONTWAIT);
+    const ssize_t sent = ::sendmsg(socket_.get(), &message, MSG_NOSIGNAL | MSG_DONTWAIT);
     if (sent < 0) {
         if (errno == EINTR) {
             return true;
@@ -324,15 +301,11 @@ void Engine::dropSent(std::size_t bytes, std::size_t frames) {
 std::size_t Engine::readReplies(int flags) {
     const std::size_t room = std::max(kReadBytes - std::min(kReadBytes, received_.size()), wantedBytes_);
     char* const to = received_.room(room);
-    const ssize_t count = ::recv(socket_, to, room, flags | MSG_NOSIGNAL);
-    if (count < 0) {
-        if (errno != EAGAIN && errno != EINTR) {
+    const ssize_t count = ::recv(socket_.get(), to, room, flags | MSG_NOSIGNAL);
+    if (count <= 0) {
+        if (count == 0 || (errno != EAGAIN && errno != EINTR)) {
             lose();
         }
-        return 0;
-    }
-    if (count == 0) {
-        lose();
         return 0;
     }
     received_.commit(static_cast<std::size_t>(count));
@@ -359,22 +332,9 @@ std::size_t Engine::handleReceived() {
 }
 
 bool Engine::handleReply(std::span<const std::uint8_t> item) {
-    if (const auto plain = readPlainReply(item)) [[likely]] {
-        return pending_.deliver(plain->id, plain->view);
-    }
-    auto reply = wire::decodeReply(item);
-    if (!reply) {
-        return false;
-    }
-    if (reply->error) {
-        const Error error{std::move(reply->error->domain), reply->error->code,
-                          std::move(reply->error->message)};
-        return pending_.deliver(reply->id, {.kind = ReplyView::Kind::error, .error = &error});
-    }
-    if (!reply->result) {
-        return pending_.deliver(reply->id, {.kind = ReplyView::Kind::null});
-    }
-    return pending_.deliver(reply->id, {.kind = ReplyView::Kind::value, .value = &*reply->result});
+    const auto reply = wire::decodeReply(item);
+    return reply && pending_.deliver(reply->id, {.error = reply->error ? &*reply->error : nullptr,
+                                                 .value = reply->result ? &*reply->result : nullptr});
 }
 
 // Pumping
@@ -383,31 +343,29 @@ std::size_t Engine::pump(milliseconds timeout) {
     if (isPumping_ || isClosed_) {
         return 0;
     }
-    const Scoped<bool> pumping(isPumping_, true);
+    isPumping_ = true;
     const Clock::time_point deadline = Clock::now() + timeout;
     hasNews_ = false;
     std::size_t handled = 0;
     do {
-        if (socket_ < 0 && Clock::now() >= nextAttempt(!isFlushed())) {
+        if (!socket_.isOpen() && Clock::now() >= nextAttempt(!isFlushed())) {
             connect();
         }
-        if (socket_ >= 0) {
-            send();
-        }
-        if (socket_ < 0 && !options_.reconnect) {
-            failPrologue(ErrorCode::connectionLost);
-            failQueue(ErrorCode::connectionLost);
+        send();
+        if (!socket_.isOpen() && !options_.reconnect) {
+            failWaiting(ErrorCode::connectionLost);
         }
         if (hasNews_) {
             break;
         }
         handled = waitAndReceive(deadline);
     } while (handled == 0 && !hasNews_ && !isWakeWanted_.exchange(false) && Clock::now() < deadline);
+    isPumping_ = false;
     return handled;
 }
 
 std::size_t Engine::waitAndReceive(Clock::time_point deadline) {
-    if (socket_ < 0) {
+    if (!socket_.isOpen()) {
         if (!options_.reconnect) {
             (void)sleepUntil(deadline, true);
             return 0;
@@ -437,7 +395,7 @@ bool Engine::setReceiveTimeout(milliseconds timeout) noexcept {
         return true;
     }
     const timeval value{.tv_sec = timeout.count() / 1000, .tv_usec = timeout.count() % 1000 * 1000};
-    if (::setsockopt(socket_, SOL_SOCKET, SO_RCVTIMEO, &value, sizeof value) != 0) {
+    if (::setsockopt(socket_.get(), SOL_SOCKET, SO_RCVTIMEO, &value, sizeof value) != 0) {
         return false;
     }
     receiveTimeout_ = timeout;
@@ -448,8 +406,8 @@ bool Engine::sleepUntil(Clock::time_point time, bool framesWake) {
     if (framesWake && !mayFallAsleep()) {
         return false;
     }
-    pollfd watched[2] = {{.fd = wakeUp_, .events = POLLIN, .revents = 0},
-                         {.fd = socket_, .events = POLLIN, .revents = 0}};
+    pollfd watched[2] = {{.fd = wakeUp_.get(), .events = POLLIN, .revents = 0},
+                         {.fd = socket_.get(), .events = POLLIN, .revents = 0}};
     if (socketIsFull_) {
         watched[1].events |= POLLOUT;
     }
@@ -460,13 +418,13 @@ bool Engine::sleepUntil(Clock::time_point time, bool framesWake) {
     isAsleep_.store(false, std::memory_order_relaxed);
     if (ready > 0 && watched[0].revents != 0) {
         std::uint64_t count = 0;
-        (void)!::read(wakeUp_, &count, sizeof count);
+        (void)!::read(wakeUp_.get(), &count, sizeof count);
     }
     return ready > 0 && (watched[1].revents & ~POLLOUT) != 0;
 }
 
 bool Engine::mayFallAsleep() noexcept {
-    if (wakeUp_ < 0) {
+    if (!wakeUp_.isOpen()) {
         return true;
     }
     isAsleep_.store(true, std::memory_order_seq_cst);

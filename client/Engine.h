@@ -2,8 +2,8 @@
 
 #include "base/TextBuffer.h"
 #include "client/PendingReplies.h"
-#include "client/Reply.h"
 #include "client/SendQueue.h"
+#include "os/FileDescriptor.h"
 
 #include <atomic>
 #include <chrono>
@@ -12,6 +12,7 @@
 #include <deque>
 #include <span>
 #include <string>
+#include <thread>
 #include <utility>
 
 struct iovec;
@@ -83,14 +84,19 @@ private:
     static constexpr std::size_t kFramesPerSend = 256;
     static constexpr std::size_t kReadBytes = 128 * 1024;
 
+    [[nodiscard]] bool goesAhead() const noexcept {
+        return announcingThread_.load(std::memory_order_relaxed) == std::this_thread::get_id();
+    }
     [[nodiscard]] OutgoingFrame* frameAt(std::size_t index) noexcept;
     [[nodiscard]] bool open();
     [[nodiscard]] Clock::time_point nextAttempt(bool framesWait) const noexcept;
     void announce(ConnectionState state);
     void lose();
+    void disconnect() noexcept;
     void failFrame(OutgoingFrame& frame, ErrorCode code);
     void failPrologue(ErrorCode code);
-    void failQueue(ErrorCode code);
+    /// Answers everything that waits to be sent.
+    void failWaiting(ErrorCode code);
 
     void send();
     [[nodiscard]] bool sendPieces(std::span<iovec> pieces);
@@ -116,8 +122,8 @@ private:
     PendingReplies pending_;
     TextBuffer received_;
 
-    int socket_ = -1;
-    int wakeUp_ = -1;
+    FileDescriptor socket_;
+    FileDescriptor wakeUp_; ///< an eventfd, when wakeable
     bool isPumping_ = false;
     bool isAnnouncing_ = false;
     /// Something happened that a caller of `pump` may wait for, other than a reply.
@@ -132,6 +138,8 @@ private:
     std::chrono::milliseconds delay_{0};
     Clock::time_point lastAttempt_{};
 
+    /// The pumping thread while it says `connected`: what that thread sends then goes ahead.
+    std::atomic<std::thread::id> announcingThread_{};
     std::atomic<bool> isClosed_{false};
     std::atomic<bool> isWakeWanted_{false};
     std::atomic<bool> isConnected_{false};

@@ -43,6 +43,7 @@ public:
 private:
     Engine& engine_;
     ClaimedFrame frame_;
+    std::size_t mapOffset_ = 0; ///< where the payload's map begins
     std::size_t entries_ = 0;
 };
 

@@ -2,6 +2,18 @@
 
 namespace tamblo::client {
 
+Error makeError(ErrorCode code) {
+    constexpr std::string_view messages[] = {
+        "the connection to the service was lost before it answered",
+        "not sent: the queue is full, or the message is longer than the service accepts",
+        "the client was closed before the service answered",
+        "the service answered with another kind of result",
+        "too many requests are unanswered",
+    };
+    const auto number = static_cast<std::int64_t>(code);
+    return {std::string(kErrorDomain), number, std::string(messages[number - 1])};
+}
+
 std::optional<std::uint64_t> PendingReplies::reserve() {
     if (firstFree_ == kNone) {
         if (entries_.size() == kMaximumEntries) {
@@ -41,7 +53,7 @@ bool PendingReplies::deliver(std::uint64_t id, const ReplyView& reply) {
 }
 
 void PendingReplies::failAll(const Error& error) {
-    const ReplyView reply{.kind = ReplyView::Kind::error, .error = &error};
+    const ReplyView reply{.error = &error};
     for (std::size_t index = 0; index < entries_.size(); ++index) {
         if (entries_[index].reply) {
             entries_[index].everyReply = false;

@@ -48,7 +48,7 @@ void Client::PumpThread::run() {
 }
 
 void Client::PumpThread::answerFlushes() {
-    const std::lock_guard lock(mutex_);
+    const MutexLock lock(mutex_);
     if (engine_.isFlushed() && engine_.isConnected()) {
         flushesDone_ = flushesWanted_;
         isFlushWanted_.store(false);
@@ -57,15 +57,18 @@ void Client::PumpThread::answerFlushes() {
 }
 
 bool Client::PumpThread::flush(milliseconds timeout) {
-    std::unique_lock lock(mutex_);
+    const auto deadline = std::chrono::steady_clock::now() + timeout;
+    MutexLock lock(mutex_);
     const std::uint64_t mine = ++flushesWanted_;
     isFlushWanted_.store(true);
     engine_.wake();
-    const bool done = flushed_.wait_for(lock, timeout, [this, mine] { return flushesDone_ >= mine; });
-    if (!done && flushesWanted_ == mine) {
+    while (flushesDone_ < mine &&
+           flushed_.wait_until(lock.forWaiting(), deadline) == std::cv_status::no_timeout) {
+    }
+    if (flushesDone_ < mine && flushesWanted_ == mine) {
         isFlushWanted_.store(false);
     }
-    return done;
+    return flushesDone_ >= mine;
 }
 
 } // namespace tamblo::client

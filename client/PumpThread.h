@@ -1,11 +1,11 @@
 #pragma once
 
+#include "base/Mutex.h"
 #include "client/Client.h"
 
 #include <atomic>
 #include <chrono>
 #include <condition_variable>
-#include <mutex>
 #include <thread>
 
 namespace tamblo::client {
@@ -19,6 +19,8 @@ public:
     PumpThread(const PumpThread&) = delete;
     PumpThread& operator=(const PumpThread&) = delete;
 
+    /// Any thread but its own: waits until all that was queued has been handed to the kernel, at most this
+    /// long; whether it has.
     bool flush(std::chrono::milliseconds timeout);
 
 private:
@@ -29,11 +31,12 @@ private:
     const std::chrono::milliseconds linger_;
     std::atomic<bool> isStopping_{false};
 
-    std::mutex mutex_;
-    std::condition_variable flushed_;
-    std::uint64_t flushesWanted_ = 0;
-    std::uint64_t flushesDone_ = 0;
     std::atomic<bool> isFlushWanted_{false};
+
+    Mutex mutex_;
+    std::condition_variable flushed_;
+    std::uint64_t flushesWanted_ TAMBLO_GUARDED_BY(mutex_) = 0;
+    std::uint64_t flushesDone_ TAMBLO_GUARDED_BY(mutex_) = 0;
 
     std::thread thread_;
 };

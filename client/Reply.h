@@ -2,21 +2,16 @@
 
 #include "base/UniqueFunction.h"
 #include "base/Value.h"
+#include "wire/Protocol.h"
 
 #include <cstdint>
 #include <optional>
-#include <string>
 #include <string_view>
-#include <utility>
 
 namespace tamblo::client {
 
 /// An error as a reply brings it: the service's, the protocol's, or the library's own.
-struct Error {
-    std::string domain;
-    std::int64_t code = 0;
-    std::string message; ///< may be empty
-};
+using wire::Error;
 
 /// Errors that the library itself answers a request with.
 inline constexpr std::string_view kErrorDomain = "com.vandra.tamblo.client";
@@ -28,6 +23,9 @@ enum class ErrorCode : std::int64_t {
     tooManyPending = 5,  ///< it was not sent: a million requests are unanswered
 };
 [[nodiscard]] Error makeError(ErrorCode code);
+[[nodiscard]] inline bool isError(const Error& error, ErrorCode code) noexcept {
+    return error.domain == kErrorDomain && error.code == static_cast<std::int64_t>(code);
+}
 
 /// What a request was answered with: a value, or an error.
 template <typename T> struct Result {
@@ -45,12 +43,8 @@ template <typename T> using Callback = UniqueFunction<void(Result<T>&&)>;
 /// A reply before it is known which kind of result the request wants. What it points to holds during the call
 /// only.
 struct ReplyView {
-    enum class Kind : std::uint8_t { null, boolean, value, error };
-
-    Kind kind = Kind::null;
-    bool boolean = false;
-    const Value* value = nullptr;
     const Error* error = nullptr;
+    const Value* value = nullptr; ///< null for an error, and for a result that is null
 };
 
 /// Takes a reply. Large enough to hold a `Callback` without an allocation.

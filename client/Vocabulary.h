@@ -1,5 +1,7 @@
 #pragma once
 
+#include "wire/Vocabulary.h"
+
 #include <cstdint>
 #include <optional>
 #include <string>
@@ -9,39 +11,11 @@
 /// no name here may be sent all the same, by a cast.
 namespace tamblo::client {
 
-/// The high half of a category: the part of the audio stack that reports.
-enum class Subsystem : std::uint32_t {
-    none = 0,
-    midi = 0x04000000,
-    session = 0x08000000,
-    dsp = 0x10000000,
-    hal = 0x20000000,
-    routing = 0x40000000,
-    toolbox = 0x80000000,
-};
-
-/// The low half of a category: what is reported on.
-enum class EventKind : std::uint32_t {
-    generic = 1,
-    record,
-    input,
-    playback,
-    output,
-    playbackAndRecord,
-    io,
-    setup,
-    clientRequest,
-    routeChange,
-    error,
-    chanlog,
-    performance,
-    volume,
-    kaleen,
-    hearingHealth,
-    wirrels,
-};
-
-enum class EventCategory : std::uint32_t { unknown = 0xFFFFFFFF };
+using wire::EventCategory;
+using wire::EventKind;
+using wire::EventType;
+using wire::ServiceType;
+using wire::Subsystem;
 
 [[nodiscard]] constexpr EventCategory category(Subsystem subsystem, EventKind kind) noexcept {
     return static_cast<EventCategory>(static_cast<std::uint32_t>(subsystem) |
@@ -50,48 +24,6 @@ enum class EventCategory : std::uint32_t { unknown = 0xFFFFFFFF };
 [[nodiscard]] constexpr EventCategory category(EventKind kind) noexcept {
     return category(Subsystem::none, kind);
 }
-
-enum class EventType : std::uint16_t {
-    generic,
-    start,
-    stop,
-    activate,
-    deactivate,
-    setup,
-    error,
-    issueDetector,
-    joulery,
-    audioUnitUsage,
-    midiDriver,
-    summary,
-    headphoneAudioExposure,
-    audioExposure,
-    listeningEnhancement,
-    pulsedeck,
-    simple,
-    histogram,
-    state,
-    memoryLog,
-    unknown = 65535,
-};
-
-enum class ServiceType : std::uint16_t {
-    generic,
-    velka,
-    telephony,
-    haptics,
-    alarms,
-    standalone,
-    soundAutoConfig,
-    longFormAudio,
-    nonLongFormAudio,
-    audioDeviceUsage,
-    alerts,
-    test,
-    apiUsage,
-    systemSounds,
-    unknown = 65535,
-};
 
 /// By name, exact as the service writes it ("Volume", "Session_Playback", "Start", "longformaudio"), or by
 /// number, decimal or with 0x.

@@ -1,6 +1,6 @@
 #include "base/Format.h"
+#include "base/NumberText.h"
 #include "client/Directories.h"
-#include "client/NumberText.h"
 #include "tools/Command.h"
 #include "tools/Files.h"
 
@@ -16,7 +16,7 @@ namespace {
 std::uint64_t currentState(const std::string& path) {
     std::string text = readFile(path).value_or("");
     text.resize(text.find_last_not_of(" \t\r\n") + 1);
-    return client::parseUnsigned(text).value_or(0);
+    return parseDecimalOrHex<std::uint64_t>(text).value_or(0);
 }
 
 ExitStatus run(const Arguments& arguments) {
@@ -34,7 +34,7 @@ ExitStatus run(const Arguments& arguments) {
                         "the runtime directory is not known: set RUNTIME_DIRECTORY or XDG_RUNTIME_DIR");
     }
     const std::string path = directories.notifications() + "/" + name;
-    const auto state = words.size() == 2 ? client::parseUnsigned(words[1]) : currentState(path);
+    const auto state = words.size() == 2 ? parseDecimalOrHex<std::uint64_t>(words[1]) : currentState(path);
     if (!state) {
         return complain(ExitStatus::usage,
                         formatted("\"{}\" is no state: it is an unsigned 64-bit number", words[1]));

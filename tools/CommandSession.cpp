@@ -1,7 +1,7 @@
 #include "base/Format.h"
 #include "base/Json.h"
+#include "base/NumberText.h"
 #include "client/Directories.h"
-#include "client/NumberText.h"
 #include "tools/Command.h"
 #include "tools/Payload.h"
 #include "tools/ServiceConnection.h"
@@ -49,7 +49,7 @@ std::variant<Plan, std::string> makePlan(const Arguments& arguments) {
     if (!arguments.rest().empty()) {
         return formatted("session takes no \"{}\"; a file to play is named with --play", arguments.rest()[0]);
     }
-    const auto reporter = client::parseInteger(arguments.last("--reporter").value_or(""));
+    const auto reporter = parseNumber<std::int64_t>(arguments.last("--reporter").value_or(""));
     if (!reporter || *reporter == 0) {
         return std::string("--reporter needs a signed 64-bit number other than 0");
     }

@@ -1,8 +1,8 @@
 #include "base/Format.h"
 #include "base/Json.h"
+#include "base/NumberText.h"
 #include "base/Rfc3339.h"
 #include "client/Directories.h"
-#include "client/NumberText.h"
 #include "tools/Command.h"
 #include "tools/Payload.h"
 #include "tools/RecordFilter.h"
@@ -53,7 +53,7 @@ std::variant<Plan, std::string> makePlan(const Arguments& arguments) {
     }
     plan.path = sinkPath(directories.logs, typed);
     if (const auto text = arguments.last("--lines")) {
-        const auto lines = client::parseUnsigned(*text);
+        const auto lines = parseDecimalOrHex<std::uint64_t>(*text);
         if (!lines) {
             return std::string("--lines needs a number");
         }
@@ -66,7 +66,7 @@ std::variant<Plan, std::string> makePlan(const Arguments& arguments) {
         plan.filter.wantKey(key);
     }
     if (const auto text = arguments.last("--reporter")) {
-        if (!client::parseInteger(*text)) {
+        if (!parseNumber<std::int64_t>(*text)) {
             return formatted("\"{}\" is no reporter ID: it is a signed 64-bit number", *text);
         }
         plan.filter.wantKey("reporterid=" + std::string(*text));

@@ -111,7 +111,7 @@ std::string lineOf(const wire::Request& request) {
     if (request.id) {
         object.add("id", *request.id);
     }
-    object.add("method", wire::methodName(request.method));
+    object.add("method", wire::rowOf(request.method).name);
     addParameters(object, request);
     return object.line();
 }

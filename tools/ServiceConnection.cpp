@@ -1,7 +1,7 @@
 #include "tools/ServiceConnection.h"
 
 #include "base/Format.h"
-#include "client/NumberText.h"
+#include "base/NumberText.h"
 
 #include <algorithm>
 #include <charconv>
@@ -60,7 +60,7 @@ ExitStatus ServiceConnection::complainAbout(const client::Error& error) {
 }
 
 std::optional<std::int64_t> parseReporterID(std::string_view text) {
-    const auto number = client::parseInteger(text);
+    const auto number = parseNumber<std::int64_t>(text);
     if (!number) {
         complain(ExitStatus::usage,
                  formatted("\"{}\" is no reporter ID: it is a signed 64-bit number", text));

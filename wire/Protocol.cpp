@@ -1,22 +1,28 @@
 #include "wire/Protocol.h"
 
-#include <algorithm>
-
 namespace tamblo::wire {
 
-std::optional<Method> methodNamed(std::string_view name) noexcept {
-    const auto found = std::find(kMethodNames.begin(), kMethodNames.end(), name);
-    if (found == kMethodNames.end()) {
-        return std::nullopt;
+std::size_t beginFrame(TextBuffer& out) {
+    const std::size_t start = out.size();
+    (void)out.room(kLengthBytes);
+    out.commit(kLengthBytes);
+    return start;
+}
+
+bool finishFrame(TextBuffer& out, std::size_t start) noexcept {
+    const std::size_t length = out.size() - start - kLengthBytes;
+    if (length > kMaximumFrameBytes) {
+        out.truncate(start);
+        return false;
     }
-    return static_cast<Method>(found - kMethodNames.begin());
+    for (std::size_t i = 0; i < kLengthBytes; ++i) {
+        out.data()[start + i] = static_cast<char>(length >> (8 * i));
+    }
+    return true;
 }
 
 std::string socketPath(std::string_view runtimeDirectory) {
-    std::string path(runtimeDirectory);
-    path += '/';
-    path += kServiceName;
-    return path;
+    return std::string(runtimeDirectory).append("/").append(kServiceName);
 }
 
 } // namespace tamblo::wire

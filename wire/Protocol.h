@@ -1,9 +1,9 @@
 #pragma once
 
-#include <array>
+#include "base/TextBuffer.h"
+
 #include <cstddef>
 #include <cstdint>
-#include <optional>
 #include <string>
 #include <string_view>
 
@@ -24,39 +24,6 @@ inline constexpr std::size_t kMaximumFrameBytes = 1024 * 1024;
 
 enum class FrameKind : std::uint8_t { request = 0, reply = 1, requestWithoutReply = 2 };
 
-enum class Method : std::uint8_t {
-    createReportingSession,
-    setServiceType,
-    getServiceNameForReporterID,
-    setConfiguration,
-    startReportingSessionForID,
-    sendMessage,
-    stopReportingSessionForID,
-    destroyReportingSession,
-    reporterID,
-    getAllReporters,
-    killService,
-};
-
-inline constexpr std::array<std::string_view, 11> kMethodNames{
-    "createReportingSession",
-    "setServiceType",
-    "getServiceNameForReporterID",
-    "setConfiguration",
-    "startReportingSessionForID",
-    "sendMessage",
-    "stopReportingSessionForID",
-    "destroyReportingSession",
-    "reporterID",
-    "getAllReporters",
-    "killService",
-};
-
-[[nodiscard]] constexpr std::string_view methodName(Method method) noexcept {
-    return kMethodNames[static_cast<std::size_t>(method)];
-}
-[[nodiscard]] std::optional<Method> methodNamed(std::string_view name) noexcept;
-
 /// The domain of the protocol's own errors; their codes are those of JSON-RPC 2.0.
 inline constexpr std::string_view kProtocolErrorDomain = "com.vandra.tamblo.protocol";
 inline constexpr std::int64_t kNotWellFormed = -32700;
@@ -64,12 +31,18 @@ inline constexpr std::int64_t kNotARequest = -32600;
 inline constexpr std::int64_t kUnknownMethod = -32601;
 inline constexpr std::int64_t kWrongParameters = -32602;
 
-/// An error as it travels: of the service's own domain or of the protocol's.
+/// An error as a reply brings it: of the service's own domain, the protocol's, or the client library's.
 struct Error {
     std::string domain;
     std::int64_t code = 0;
     std::string message; ///< empty: absent
 };
+
+/// Begins a frame at the end of the buffer: leaves room for its length, behind which the item is written.
+/// What is answered belongs to `finishFrame`.
+[[nodiscard]] std::size_t beginFrame(TextBuffer& out);
+/// Fills in the length. False, and the frame taken back, when it is longer than allowed.
+[[nodiscard]] bool finishFrame(TextBuffer& out, std::size_t start) noexcept;
 
 /// Where the service's socket lies.
 [[nodiscard]] std::string socketPath(std::string_view runtimeDirectory);

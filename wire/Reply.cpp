@@ -1,27 +1,26 @@
 #include "wire/Reply.h"
 
 #include "base/Cbor.h"
-#include "wire/FrameScope.h"
 
 namespace tamblo::wire {
 
 namespace {
 
-/// Everything of a successful reply but its result.
+/// Everything of a reply up to its error.
 void beginReply(CborWriter& writer, std::uint64_t id) {
     writer.arrayHead(4);
     writer.unsignedInteger(static_cast<std::uint64_t>(FrameKind::reply));
     writer.unsignedInteger(id);
-    writer.null();
 }
 
 template <typename WriteResult>
 void appendReply(TextBuffer& out, std::uint64_t id, const WriteResult& writeResult) {
-    FrameScope frame(out);
+    const std::size_t start = beginFrame(out);
     CborWriter writer(out);
     beginReply(writer, id);
+    writer.null();
     writeResult(writer);
-    if (!frame.finish()) {
+    if (!finishFrame(out, start)) {
         appendErrorReply(out, id,
                          {std::string(kProtocolErrorDomain), kNotARequest, "the result is too long"});
     }
@@ -68,11 +67,9 @@ void appendIntegersReply(TextBuffer& out, std::uint64_t id, std::span<const std:
 }
 
 void appendErrorReply(TextBuffer& out, std::uint64_t id, const Error& error) {
-    FrameScope frame(out);
+    const std::size_t start = beginFrame(out);
     CborWriter writer(out);
-    writer.arrayHead(4);
-    writer.unsignedInteger(static_cast<std::uint64_t>(FrameKind::reply));
-    writer.unsignedInteger(id);
+    beginReply(writer, id);
     writer.mapHead(error.message.empty() ? 2 : 3);
     writer.text("domain");
     writer.text(error.domain);
@@ -83,43 +80,39 @@ void appendErrorReply(TextBuffer& out, std::uint64_t id, const Error& error) {
         writer.text(error.message);
     }
     writer.null();
-    (void)frame.finish();
+    (void)finishFrame(out, start);
 }
 
 std::optional<Reply> decodeReply(std::span<const std::uint8_t> item) {
     CborReader reader(item);
     auto array = reader.readArrayHead();
-    if (!array || !reader.moreElements(*array) ||
-        reader.readUnsigned() != static_cast<std::uint64_t>(FrameKind::reply) ||
-        !reader.moreElements(*array)) {
+    const auto hasNext = [&] { return array && reader.moreElements(*array); };
+    if (!hasNext() || reader.readUnsigned() != static_cast<std::uint64_t>(FrameKind::reply) || !hasNext()) {
         return std::nullopt;
     }
     const auto id = reader.readUnsigned();
-    if (!id || !reader.moreElements(*array)) {
+    if (!id || !hasNext()) {
         return std::nullopt;
     }
-    Reply reply;
-    reply.id = *id;
+    std::optional<Reply> reply(std::in_place);
+    reply->id = *id;
     if (!reader.readNull()) {
         const auto dictionary = reader.readDictionary();
-        if (!dictionary) {
-            return std::nullopt;
-        }
-        reply.error = errorFrom(*dictionary);
-        if (!reply.error) {
+        reply->error = dictionary ? errorFrom(*dictionary) : std::nullopt;
+        if (!reply->error) {
             return std::nullopt;
         }
     }
-    if (!reader.moreElements(*array)) {
+    if (!hasNext()) {
         return std::nullopt;
     }
     if (!reader.readNull()) {
-        reply.result = reader.readValue();
-        if (!reply.result) {
+        reply->result = reader.readValue();
+        if (!reply->result) {
             return std::nullopt;
         }
     }
-    if (reader.moreElements(*array) || reader.error() != CborError::none || !reader.atEnd()) {
+    if (hasNext() || reader.error() != CborError::none || !reader.atEnd()) {
         return std::nullopt;
     }
     return reply;

@@ -1,8 +1,9 @@
 #include "wire/Request.h"
 
-#include "wire/FrameScope.h"
+#include "base/Format.h"
 
 #include <limits>
+#include <string>
 
 namespace tamblo::wire {
 
@@ -12,151 +13,12 @@ namespace {
 /// name.
 constexpr std::size_t kKeysYetToCome = 4;
 
-class ParameterReader {
-public:
-    ParameterReader(CborReader& reader, CborReader::ArrayHead& array) noexcept
-        : reader_(reader), array_(array) {}
+constexpr std::size_t kIdBytes = 8;
 
-    [[nodiscard]] bool next(std::string_view name) noexcept {
-        missing_ = reader_.moreElements(array_) ? std::string_view() : name;
-        return missing_.empty();
+void storeId(char* to, std::uint64_t id) noexcept {
+    for (std::size_t i = 0; i < kIdBytes; ++i) {
+        to[i] = static_cast<char>(id >> (8 * (kIdBytes - 1 - i)));
     }
-
-    bool signedInteger(std::string_view name, std::int64_t& number) noexcept {
-        if (!next(name)) {
-            return false;
-        }
-        const auto read = reader_.readInteger();
-        number = read.value_or(0);
-        return read.has_value() || refuse(name, "a signed 64-bit integer");
-    }
-
-    template <typename Unsigned>
-    bool unsignedInteger(std::string_view name, std::string_view wanted, Unsigned& number) noexcept {
-        if (!next(name)) {
-            return false;
-        }
-        const auto read = reader_.readUnsigned();
-        if (!read || *read > std::numeric_limits<Unsigned>::max()) {
-            return refuse(name, wanted);
-        }
-        number = static_cast<Unsigned>(*read);
-        return true;
-    }
-
-    bool dictionary(std::string_view name, std::string_view wanted, Dictionary& dictionary) {
-        if (!next(name)) {
-            return false;
-        }
-        auto read = reader_.readDictionary(kKeysYetToCome);
-        if (!read) {
-            return refuse(name, wanted);
-        }
-        dictionary = std::move(*read);
-        return true;
-    }
-
-    bool payload(Dictionary& dictionary) {
-        if (reader_.nextIsNull() && next("payload")) {
-            dictionary = Dictionary();
-            return reader_.readNull();
-        }
-        return this->dictionary("payload", "a map or null", dictionary);
-    }
-
-    bool reporterIDs(std::vector<std::int64_t>& numbers) {
-        numbers.clear();
-        if (!next("reporter IDs")) {
-            return false;
-        }
-        if (reader_.readNull()) {
-            return true;
-        }
-        constexpr std::string_view wanted = "an array of signed 64-bit integers, or null";
-        auto inner = reader_.readArrayHead();
-        if (!inner) {
-            return refuse("reporter IDs", wanted);
-        }
-        while (reader_.moreElements(*inner)) {
-            const auto number = reader_.readInteger();
-            if (!number) {
-                return refuse("reporter IDs", wanted);
-            }
-            numbers.push_back(*number);
-        }
-        return reader_.error() == CborError::none || refuse("reporter IDs", wanted);
-    }
-
-    /// Whether all were read and none is left.
-    [[nodiscard]] bool finish() noexcept {
-        if (isWrong() || !missing_.empty()) {
-            return false;
-        }
-        isLong_ = reader_.moreElements(array_);
-        return !isLong_ && reader_.error() == CborError::none;
-    }
-
-    [[nodiscard]] std::string message(Method method) const {
-        std::string text(methodName(method));
-        if (isWrong()) {
-            text.append(": ").append(wrong_).append(": wanted ").append(wanted_);
-            if (reader_.error() != CborError::none) {
-                text.append(", found ").append(describe(reader_.error()));
-            }
-            return text;
-        }
-        if (isLong_) {
-            return text.append(": too many parameters");
-        }
-        return text.append(": too few parameters: ").append(missing_).append(" is missing");
-    }
-
-private:
-    bool refuse(std::string_view name, std::string_view wanted) noexcept {
-        wrong_ = name;
-        wanted_ = wanted;
-        return false;
-    }
-    [[nodiscard]] bool isWrong() const noexcept { return !wrong_.empty(); }
-
-    CborReader& reader_;
-    CborReader::ArrayHead& array_;
-    std::string_view wrong_; ///< the parameter that was not read, and what it should have been
-    std::string_view wanted_;
-    std::string_view missing_; ///< the parameter at whose place the array ended
-    bool isLong_ = false;
-};
-
-bool readParameters(ParameterReader& parameters, Request& request) {
-    constexpr std::string_view sixteenBits = "an unsigned 16-bit integer";
-    switch (request.method) {
-    case Method::createReportingSession:
-    case Method::getServiceNameForReporterID:
-    case Method::startReportingSessionForID:
-    case Method::stopReportingSessionForID:
-    case Method::destroyReportingSession:
-    case Method::reporterID:
-        parameters.signedInteger("reporter ID", request.reporterID);
-        break;
-    case Method::setServiceType:
-        parameters.unsignedInteger("type", sixteenBits, request.serviceType) &&
-            parameters.signedInteger("reporter ID", request.reporterID);
-        break;
-    case Method::setConfiguration:
-        parameters.dictionary("configuration", "a map", request.dictionary) &&
-            parameters.signedInteger("reporter ID", request.reporterID);
-        break;
-    case Method::sendMessage:
-        parameters.payload(request.dictionary) &&
-            parameters.unsignedInteger("category", "an unsigned 32-bit integer", request.category) &&
-            parameters.unsignedInteger("type", sixteenBits, request.type) &&
-            parameters.reporterIDs(request.reporterIDs);
-        break;
-    case Method::getAllReporters:
-    case Method::killService:
-        break;
-    }
-    return parameters.finish();
 }
 
 Refusal refusal(const Request& request, std::int64_t code, std::string message) {
@@ -213,6 +75,86 @@ std::optional<Refusal> readHead(CborReader& reader, CborReader::ArrayHead& frame
     return std::nullopt;
 }
 
+template <typename Unsigned> bool readUnsigned(CborReader& reader, Unsigned& number) noexcept {
+    const auto read = reader.readUnsigned();
+    number = static_cast<Unsigned>(read.value_or(0));
+    return read.has_value() && *read <= std::numeric_limits<Unsigned>::max();
+}
+
+bool readReporterIDs(CborReader& reader, std::vector<std::int64_t>& numbers) {
+    numbers.clear();
+    if (reader.readNull()) {
+        return true;
+    }
+    auto array = reader.readArrayHead();
+    while (array && reader.moreElements(*array)) {
+        const auto number = reader.readInteger();
+        if (!number) {
+            return false;
+        }
+        numbers.push_back(*number);
+    }
+    return array && reader.error() == CborError::none;
+}
+
+bool readDictionary(CborReader& reader, Dictionary& dictionary) {
+    auto read = reader.readDictionary(kKeysYetToCome);
+    if (read) {
+        dictionary = std::move(*read);
+    }
+    return read.has_value();
+}
+
+bool readParameter(CborReader& reader, Parameter parameter, Request& request) {
+    switch (parameter) {
+    case Parameter::none:
+        break;
+    case Parameter::payload:
+        if (reader.nextIsNull()) {
+            request.dictionary = Dictionary();
+            return reader.readNull();
+        }
+        return readDictionary(reader, request.dictionary);
+    case Parameter::configuration:
+        return readDictionary(reader, request.dictionary);
+    case Parameter::category:
+        return readUnsigned(reader, request.category);
+    case Parameter::type:
+        return readUnsigned(reader, request.type);
+    case Parameter::serviceType:
+        return readUnsigned(reader, request.serviceType);
+    case Parameter::reporterID: {
+        const auto number = reader.readInteger();
+        request.reporterID = number.value_or(0);
+        return number.has_value();
+    }
+    case Parameter::reporterIDs:
+        return readReporterIDs(reader, request.reporterIDs);
+    }
+    return false;
+}
+
+std::optional<Refusal> readParameters(CborReader& reader, CborReader::ArrayHead& array, Request& request) {
+    const MethodRow& method = rowOf(request.method);
+    for (const Parameter parameter : parametersOf(request.method)) {
+        const auto& [name, wanted] = kParameters[static_cast<std::size_t>(parameter)];
+        if (!reader.moreElements(array)) {
+            return refusal(request, kWrongParameters,
+                           formatted("{}: too few parameters: {} is missing", method.name, name));
+        }
+        if (!readParameter(reader, parameter, request)) {
+            const bool isNoValue = reader.error() != CborError::none;
+            return refusal(request, kWrongParameters,
+                           formatted("{}: {}: wanted {}{}{}", method.name, name, wanted,
+                                     isNoValue ? ", found " : "", isNoValue ? describe(reader.error()) : ""));
+        }
+    }
+    if (reader.moreElements(array)) {
+        return refusal(request, kWrongParameters, formatted("{}: too many parameters", method.name));
+    }
+    return std::nullopt;
+}
+
 std::optional<Refusal> readRequest(CborReader& reader, Request& request) {
     request.id.reset();
     auto frame = reader.readArrayHead();
@@ -225,11 +167,10 @@ std::optional<Refusal> readRequest(CborReader& reader, Request& request) {
     auto array = reader.moreElements(*frame) ? reader.readArrayHead() : std::nullopt;
     if (!array) {
         return refusal(request, kWrongParameters,
-                       std::string(methodName(request.method)) + ": params: wanted an array");
+                       formatted("{}: params: wanted an array", rowOf(request.method).name));
     }
-    ParameterReader parameters(reader, *array);
-    if (!readParameters(parameters, request)) {
-        return refusal(request, kWrongParameters, parameters.message(request.method));
+    if (auto refused = readParameters(reader, *array, request)) {
+        return refused;
     }
     if (reader.moreElements(*frame)) {
         return refusal(request, kNotARequest, "the frame has too many elements");
@@ -252,49 +193,25 @@ std::optional<Refusal> decodeRequest(std::span<const std::uint8_t> item, KeySetC
     return refused;
 }
 
-bool appendRequestFrame(TextBuffer& out, const Request& request) {
-    FrameScope frame(out);
+std::size_t beginRequest(TextBuffer& out, Method method, std::optional<std::uint64_t> id) {
+    const std::size_t start = beginFrame(out);
     CborWriter writer(out);
-    if (request.id) {
-        writer.arrayHead(4);
-        writer.unsignedInteger(static_cast<std::uint64_t>(FrameKind::request));
-        writer.unsignedInteger(*request.id);
-    } else {
-        writer.arrayHead(3);
-        writer.unsignedInteger(static_cast<std::uint64_t>(FrameKind::requestWithoutReply));
+    writer.arrayHead(id ? 4 : 3);
+    writer.unsignedInteger(
+        static_cast<std::uint64_t>(id ? FrameKind::request : FrameKind::requestWithoutReply));
+    if (id) {
+        // The head that says the longest number, whose bytes replaceId can overwrite.
+        writer.unsignedInteger(std::numeric_limits<std::uint64_t>::max());
+        storeId(out.data() + out.size() - kIdBytes, *id);
     }
-    writer.text(methodName(request.method));
-    switch (request.method) {
-    case Method::setServiceType:
-        writer.arrayHead(2);
-        writer.unsignedInteger(request.serviceType);
-        writer.integer(request.reporterID);
-        break;
-    case Method::setConfiguration:
-        writer.arrayHead(2);
-        writer.dictionary(request.dictionary);
-        writer.integer(request.reporterID);
-        break;
-    case Method::sendMessage:
-        writer.arrayHead(4);
-        writer.dictionary(request.dictionary);
-        writer.unsignedInteger(request.category);
-        writer.unsignedInteger(request.type);
-        writer.arrayHead(request.reporterIDs.size());
-        for (const std::int64_t reporterID : request.reporterIDs) {
-            writer.integer(reporterID);
-        }
-        break;
-    case Method::getAllReporters:
-    case Method::killService:
-        writer.arrayHead(0);
-        break;
-    default:
-        writer.arrayHead(1);
-        writer.integer(request.reporterID);
-        break;
-    }
-    return frame.finish();
+    writer.text(rowOf(method).name);
+    writer.arrayHead(parametersOf(method).size());
+    return start;
+}
+
+void replaceId(TextBuffer& frame, std::uint64_t id) noexcept {
+    // Behind the length, the array's head, the kind and the number's own head.
+    storeId(frame.data() + kLengthBytes + 3, id);
 }
 
 } // namespace tamblo::wire

@@ -4,27 +4,32 @@
 #include "base/Dictionary.h"
 #include "base/TextBuffer.h"
 #include "wire/Protocol.h"
+#include "wire/Vocabulary.h"
 
 #include <cstdint>
 #include <optional>
 #include <span>
-#include <string>
 #include <vector>
 
 namespace tamblo::wire {
 
+inline const Dictionary kNoEntries;
+
 /// A request of any method; of the parameters, those that its method has.
-struct Request {
+template <typename Entries, typename Numbers> struct BasicRequest {
     Method method{};
     /// Absent: the client asks for no reply.
-    std::optional<std::uint64_t> id;
+    std::optional<std::uint64_t> id{};
     std::int64_t reporterID = 0;
     std::uint16_t serviceType = 0;
-    Dictionary dictionary; ///< the configuration, or a message's payload
+    Entries dictionary = kNoEntries; ///< the configuration, or a message's payload
     std::uint32_t category = 0;
     std::uint16_t type = 0;
-    std::vector<std::int64_t> reporterIDs;
+    Numbers reporterIDs{};
 };
+/// As the service reads it, and as the client writes it, which copies nothing.
+using Request = BasicRequest<Dictionary, std::vector<std::int64_t>>;
+using RequestView = BasicRequest<const Dictionary&, std::span<const std::int64_t>>;
 
 /// Why a frame is not carried out.
 struct Refusal {
@@ -38,7 +43,51 @@ struct Refusal {
 [[nodiscard]] std::optional<Refusal> decodeRequest(std::span<const std::uint8_t> item, KeySetCache& keySets,
                                                    Request& request);
 
+/// Begins a request's frame: everything before its first parameter. What is answered belongs to
+/// `finishFrame`. An id is written in its longest form, so that `replaceId` can put another one in its place.
+[[nodiscard]] std::size_t beginRequest(TextBuffer& out, Method method, std::optional<std::uint64_t> id);
+/// For a frame that begins its buffer.
+void replaceId(TextBuffer& frame, std::uint64_t id) noexcept;
+
+template <typename AnyRequest>
+void writeParameters(CborWriter& writer, std::span<const Parameter> parameters, const AnyRequest& request) {
+    for (const Parameter parameter : parameters) {
+        switch (parameter) {
+        case Parameter::none:
+            break;
+        case Parameter::payload:
+        case Parameter::configuration:
+            writer.dictionary(request.dictionary);
+            break;
+        case Parameter::category:
+            writer.unsignedInteger(request.category);
+            break;
+        case Parameter::type:
+            writer.unsignedInteger(request.type);
+            break;
+        case Parameter::serviceType:
+            writer.unsignedInteger(request.serviceType);
+            break;
+        case Parameter::reporterID:
+            writer.integer(request.reporterID);
+            break;
+        case Parameter::reporterIDs:
+            writer.arrayHead(request.reporterIDs.size());
+            for (const std::int64_t reporterID : request.reporterIDs) {
+                writer.integer(reporterID);
+            }
+            break;
+        }
+    }
+}
+
 /// Appends a whole frame, length included. False, and nothing appended, when it would be longer than allowed.
-[[nodiscard]] bool appendRequestFrame(TextBuffer& out, const Request& request);
+template <typename AnyRequest>
+[[nodiscard]] bool appendRequestFrame(TextBuffer& out, const AnyRequest& request) {
+    const std::size_t start = beginRequest(out, request.method, request.id);
+    CborWriter writer(out);
+    writeParameters(writer, parametersOf(request.method), request);
+    return finishFrame(out, start);
+}
 
 } // namespace tamblo::wire

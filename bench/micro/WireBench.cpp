@@ -1,7 +1,6 @@
 #include "../Payloads.h"
 
 #include "base/TextBuffer.h"
-#include "client/RequestFrame.h"
 #include "wire/Protocol.h"
 #include "wire/Reply.h"
 #include "wire/Request.h"
@@ -69,8 +68,13 @@ void encodeByTheClientLibrary(benchmark::State& state) {
     for (auto _ : state) {
         out.clear();
         const Message& message = messages[i++ % kMessages];
-        benchmark::DoNotOptimize(client::request_frame::writeMessage(
-            out, true, message.payload, message.category, message.type, reporterIDs));
+        benchmark::DoNotOptimize(wire::appendRequestFrame(
+            out, wire::RequestView{.method = wire::Method::sendMessage,
+                                   .id = 0,
+                                   .dictionary = message.payload,
+                                   .category = static_cast<std::uint32_t>(message.category),
+                                   .type = static_cast<std::uint16_t>(message.type),
+                                   .reporterIDs = reporterIDs}));
     }
 }
 BENCHMARK(encodeByTheClientLibrary);

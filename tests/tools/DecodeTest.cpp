@@ -3,7 +3,6 @@
 #include "base/Base64.h"
 #include "base/Cbor.h"
 #include "metrics/AudioIssueDetected.h"
-#include "wire/FrameScope.h"
 #include "wire/Reply.h"
 #include "wire/Request.h"
 
@@ -136,9 +135,9 @@ TEST(Decode, LinesOfEverySinkAreLaidOut) {
 std::string framesOf(const std::vector<std::string>& items) {
     TextBuffer out;
     for (const std::string& item : items) {
-        wire::FrameScope frame(out);
+        const std::size_t start = wire::beginFrame(out);
         out.append(item);
-        EXPECT_TRUE(frame.finish());
+        EXPECT_TRUE(wire::finishFrame(out, start));
     }
     return std::string(out.view());
 }

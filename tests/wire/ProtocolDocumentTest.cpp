@@ -78,7 +78,7 @@ void expectNotationToMatch(const Example& example, const Bytes& item) {
 
 TEST(ProtocolDocument, RequestsAreOfTheMethodTheyStandUnder) {
     KeySetCache keySets;
-    std::vector<bool> isShown(kMethodNames.size());
+    std::vector<bool> isShown(kMethods.size());
     for (const Example& example : examplesOfThePage()) {
         const auto method = methodNamed(example.heading);
         if (example.sender != 'C' || !method) {
@@ -93,8 +93,8 @@ TEST(ProtocolDocument, RequestsAreOfTheMethodTheyStandUnder) {
         expectNotationToMatch(example, item);
         isShown[static_cast<std::size_t>(*method)] = true;
     }
-    for (std::size_t i = 0; i < kMethodNames.size(); ++i) {
-        EXPECT_TRUE(isShown[i]) << "no example of " << kMethodNames[i];
+    for (std::size_t i = 0; i < kMethods.size(); ++i) {
+        EXPECT_TRUE(isShown[i]) << "no example of " << kMethods[i].name;
     }
 }
 

@@ -32,7 +32,7 @@ Request everyParameter(Method method) {
 
 TEST(Request, EveryMethodIsReadAsItWasWritten) {
     KeySetCache keySets;
-    for (std::size_t i = 0; i < kMethodNames.size(); ++i) {
+    for (std::size_t i = 0; i < kMethods.size(); ++i) {
         for (const bool wantsReply : {true, false}) {
             Request written = everyParameter(static_cast<Method>(i));
             if (!wantsReply) {
@@ -47,7 +47,7 @@ TEST(Request, EveryMethodIsReadAsItWasWritten) {
 
             Request read;
             const auto refusal = decodeRequest(*frame, keySets, read);
-            ASSERT_FALSE(refusal) << kMethodNames[i] << ": " << refusal->error.message;
+            ASSERT_FALSE(refusal) << kMethods[i].name << ": " << refusal->error.message;
             EXPECT_EQ(read.method, written.method);
             EXPECT_EQ(read.id, written.id);
             TextBuffer again;

@@ -4,49 +4,55 @@
 #include "wire/Reply.h"
 #include "wire/Request.h"
 
+#include <concepts>
 #include <cstdint>
 #include <memory>
-#include <type_traits>
+#include <optional>
 #include <utility>
 #include <vector>
 
 namespace tamblo {
 
-namespace detail {
+/// Becomes whichever kind of reply an operation takes: one that writes its frame to the receiver, or an empty
+/// one when the client asked for none.
+template <typename Receiver> class ReplyTo {
+public:
+    ReplyTo(std::optional<std::uint64_t> id, const std::shared_ptr<Receiver>& receiver)
+        : id_(id), receiver_(receiver) {}
 
-/// Appends the frame of a reply with a result of whatever type.
-template <typename Result> void appendReplyFrame(TextBuffer& out, std::uint64_t id, Result result) {
-    if constexpr (std::is_same_v<Result, bool>) {
+    template <typename... Result> operator UniqueFunction<void(const ReplyError*, Result...), 32>() const {
+        if (!id_) {
+            return {};
+        }
+        return [receiver = receiver_, id = *id_](const ReplyError* error, Result... result) {
+            receiver->reply([&](TextBuffer& out) {
+                if (error != nullptr) {
+                    wire::appendErrorReply(out, id, {error->domain, error->code, {}});
+                } else {
+                    append(out, id, result...);
+                }
+            });
+        };
+    }
+
+private:
+    static void append(TextBuffer& out, std::uint64_t id) { wire::appendNullReply(out, id); }
+    static void append(TextBuffer& out, std::uint64_t id, std::same_as<bool> auto result) {
         wire::appendBooleanReply(out, id, result);
-    } else if constexpr (std::is_same_v<Result, std::uint16_t>) {
+    }
+    static void append(TextBuffer& out, std::uint64_t id, std::same_as<std::uint16_t> auto result) {
         wire::appendUnsignedReply(out, id, result);
-    } else if constexpr (std::is_same_v<Result, const Dictionary&>) {
+    }
+    static void append(TextBuffer& out, std::uint64_t id, const Dictionary& result) {
         wire::appendDictionaryReply(out, id, result);
-    } else {
+    }
+    static void append(TextBuffer& out, std::uint64_t id, const std::vector<std::int64_t>& result) {
         wire::appendIntegersReply(out, id, result);
     }
-}
 
-/// A reply that writes its frame to the receiver; an empty one when the client asked for none.
-template <typename Reply, typename... Result, typename Receiver>
-Reply replyTo(const wire::Request& request, const std::shared_ptr<Receiver>& receiver) {
-    if (!request.id) {
-        return {};
-    }
-    return [receiver, id = *request.id](const ReplyError* error, Result... result) {
-        receiver->reply([&](TextBuffer& out) {
-            if (error != nullptr) {
-                wire::appendErrorReply(out, id, {error->domain, error->code, {}});
-            } else if constexpr (sizeof...(Result) == 0) {
-                wire::appendNullReply(out, id);
-            } else {
-                appendReplyFrame<Result...>(out, id, result...);
-            }
-        });
-    };
-}
-
-} // namespace detail
+    std::optional<std::uint64_t> id_;
+    const std::shared_ptr<Receiver>& receiver_;
+};
 
 /// Calls the object's operation for a request, whose parts are moved from. Each reply, whenever it comes and
 /// from whatever thread, is handed to `receiver->reply` as a callable that appends its frame to a
@@ -54,46 +60,33 @@ Reply replyTo(const wire::Request& request, const std::shared_ptr<Receiver>& rec
 template <typename Receiver>
 void dispatchRequest(ZRReportingServiceProtocol& object, wire::Request& request,
                      const std::shared_ptr<Receiver>& receiver) {
-    using namespace detail;
+    using wire::Method;
     const ReporterID reporterID = request.reporterID;
-    const auto booleanReply = [&] { return replyTo<BooleanReply, bool>(request, receiver); };
+    const ReplyTo reply(request.id, receiver);
     switch (request.method) {
-    case wire::Method::createReportingSession:
-        object.createReportingSession(reporterID, booleanReply());
-        break;
-    case wire::Method::setServiceType:
-        object.setServiceType(request.serviceType, reporterID, booleanReply());
-        break;
-    case wire::Method::getServiceNameForReporterID:
-        object.getServiceNameForReporterID(reporterID,
-                                           replyTo<ServiceTypeReply, std::uint16_t>(request, receiver));
-        break;
-    case wire::Method::setConfiguration:
-        object.setConfiguration(std::move(request.dictionary), reporterID, booleanReply());
-        break;
-    case wire::Method::startReportingSessionForID:
-        object.startReportingSessionForID(reporterID, booleanReply());
-        break;
-    case wire::Method::sendMessage:
-        object.sendMessage(std::move(request.dictionary), request.category, request.type,
-                           std::move(request.reporterIDs), replyTo<ErrorReply>(request, receiver));
-        break;
-    case wire::Method::stopReportingSessionForID:
-        object.stopReportingSessionForID(reporterID, booleanReply());
-        break;
-    case wire::Method::destroyReportingSession:
-        object.destroyReportingSession(reporterID, booleanReply());
-        break;
-    case wire::Method::reporterID:
-        object.reporterID(reporterID, replyTo<DictionaryReply, const Dictionary&>(request, receiver));
-        break;
-    case wire::Method::getAllReporters:
-        object.getAllReporters(
-            replyTo<ReporterIDsReply, const std::vector<std::int64_t>&>(request, receiver));
-        break;
-    case wire::Method::killService:
-        object.killService();
-        break;
+    case Method::createReportingSession:
+        return object.createReportingSession(reporterID, reply);
+    case Method::setServiceType:
+        return object.setServiceType(request.serviceType, reporterID, reply);
+    case Method::getServiceNameForReporterID:
+        return object.getServiceNameForReporterID(reporterID, reply);
+    case Method::setConfiguration:
+        return object.setConfiguration(std::move(request.dictionary), reporterID, reply);
+    case Method::startReportingSessionForID:
+        return object.startReportingSessionForID(reporterID, reply);
+    case Method::sendMessage:
+        return object.sendMessage(std::move(request.dictionary), request.category, request.type,
+                                  std::move(request.reporterIDs), reply);
+    case Method::stopReportingSessionForID:
+        return object.stopReportingSessionForID(reporterID, reply);
+    case Method::destroyReportingSession:
+        return object.destroyReportingSession(reporterID, reply);
+    case Method::reporterID:
+        return object.reporterID(reporterID, reply);
+    case Method::getAllReporters:
+        return object.getAllReporters(reply);
+    case Method::killService:
+        return object.killService();
     }
 }
 

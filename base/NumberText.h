@@ -1,0 +1,26 @@
+#pragma once
+
+#include <charconv>
+#include <optional>
+#include <string_view>
+
+namespace tamblo {
+
+/// The number that the whole text is, in digits of this base; nothing when it is anything else or does not
+/// fit.
+template <typename Number>
+[[nodiscard]] std::optional<Number> parseNumber(std::string_view text, int base = 10) noexcept {
+    Number number{};
+    const char* const behind = text.data() + text.size();
+    const auto [end, error] = std::from_chars(text.data(), behind, number, base);
+    return error == std::errc() && end == behind ? std::optional(number) : std::nullopt;
+}
+
+/// The same, decimal or with 0x.
+template <typename Number>
+[[nodiscard]] std::optional<Number> parseDecimalOrHex(std::string_view text) noexcept {
+    const bool isHexadecimal = text.starts_with("0x") || text.starts_with("0X");
+    return isHexadecimal ? parseNumber<Number>(text.substr(2), 16) : parseNumber<Number>(text);
+}
+
+} // namespace tamblo
