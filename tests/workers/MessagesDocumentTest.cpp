@@ -1,21 +1,14 @@
 #include "system/ZRReportingSystemMonitor.h"
-#include "tests/fakes/FakePlatform.h"
-#include "tests/fakes/Messages.h"
+#include "tests/workers/WorkerTest.h"
 #include "tools/SessionFile.h"
 #include "util/SummaryBuckets.h"
 #include "workers/producers/ZRReportingSessionInputMessagesWorker.h"
 #include "workers/producers/ZRReportingSessionKaleenMessagesWorker.h"
 #include "workers/producers/ZRReportingSessionVolumeMessagesWorker.h"
 
-#include <gmock/gmock.h>
-
-#include <chrono>
 #include <fstream>
 #include <map>
 #include <sstream>
-#include <string>
-#include <string_view>
-#include <vector>
 
 // Holds docs/messages.md against what the workers do.
 
@@ -30,16 +23,13 @@ struct Section {
     std::string text;
 };
 
-Row cellsOf(std::string_view line) {
+Row cellsOf(const std::string& line) {
     Row cells;
-    for (line.remove_prefix(1); !line.empty();) {
-        const std::size_t end = line.find('|');
-        std::string cell(line.substr(1, end - (end > 1 ? 2 : 1)));
-        if (cell.starts_with('`') && cell.ends_with('`')) {
-            cell = cell.substr(1, cell.size() - 2);
-        }
-        cells.push_back(cell);
-        line.remove_prefix(end + 1);
+    std::istringstream text(line.substr(1));
+    for (std::string cell; std::getline(text, cell, '|');) {
+        const std::size_t begin = cell.find_first_not_of(" `");
+        cells.push_back(begin == cell.npos ? ""
+                                           : cell.substr(begin, cell.find_last_not_of(" `") - begin + 1));
     }
     return cells;
 }
@@ -49,29 +39,22 @@ std::map<std::string, Section> sectionsOfThePage() {
     EXPECT_TRUE(page);
     std::map<std::string, Section> sections;
     Section* section = &sections[""];
-    bool isBehindHead = false;
     for (std::string line; std::getline(page, line);) {
         if (line.starts_with("##")) {
             section = &sections[line.substr(line.find(' ') + 1)];
         } else if (line.starts_with("{")) {
             section->json.push_back(line);
-        } else if (line.starts_with("|") && isBehindHead) {
+        } else if (line.starts_with("| ") && !line.starts_with("| key")) {
             section->rows.push_back(cellsOf(line));
         }
-        isBehindHead = line.starts_with("|---") || (line.starts_with("|") && isBehindHead);
         section->text += line + " ";
     }
     return sections;
 }
 
-Dictionary objectFrom(const std::string& json) {
-    const auto value = readJson(json);
-    EXPECT_TRUE(std::holds_alternative<Value>(value)) << json;
-    return std::get<Value>(value).dictionaryValue();
-}
-
-class MessagesDocumentTest : public testing::Test {
+class MessagesDocumentTest : public WorkerTest {
 protected:
+    MessagesDocumentTest() : WorkerTest(LogLevel::error) {}
     ~MessagesDocumentTest() override { ZRReportingSystemMonitor::reset(); }
 
     /// Plays the page's session, on a device that reports about itself.
@@ -81,40 +64,36 @@ protected:
         ZRReportingSystemMonitor::initializeWithQueue(device.serverQueue());
         device.namedNotifications.post("com.vandra.dashlo.ringerstate", 1);
         (void)device.serverQueue().runAll();
-        const auto session = ZRReportingSession::initWithID(7, {1});
-        session->setServiceType(AudioServiceTypeTelephony);
+        session = makeSession(AudioServiceTypeTelephony, {{"HostApplicationDisplayID", "com.example.phone"}});
         session->setClientProcessName("phone");
-        session->updateConfigurationWithContentsOfConfiguration(
-            {{"HostApplicationDisplayID", "com.example.phone"}});
         session->start();
         const double start = device.clock.seconds();
         for (const std::string& text : page["What to send"].json) {
             auto parsed = tools::parseSessionLine(text);
             auto& line = std::get<tools::SessionLine>(parsed);
             line.payload.set("zrreporting_timestamp", start + *line.offset);
-            session->sendMessage(messageOf(line.payload, static_cast<AudioEventCategory>(line.category),
-                                           static_cast<AudioEventType>(line.type)));
+            send(line.payload, static_cast<AudioEventCategory>(line.category),
+                 static_cast<AudioEventType>(line.type));
         }
         device.clock.advance(std::chrono::minutes(2));
         session->stop();
     }
-    FakePlatform device{LogLevel::error};
     std::map<std::string, Section> page = sectionsOfThePage();
 };
 
-constexpr const char* kEvents[] = {
-    "com.vandra.tamblo.Volume.Summary", "com.vandra.tamblo.Kaleen.Summary", "com.vandra.tamblo.Input.Summary",
-    "com.vandra.tamblo.Session_Generic.Summary", "com.vandra.tamblo.Setup.Setup"};
-
 TEST_F(MessagesDocumentTest, ExamplesAreWhatComesOfItsSession) {
     playTheSessionOfThePage();
-    for (const std::string event : kEvents) {
+    for (const std::string event :
+         {"com.vandra.tamblo.Volume.Summary", "com.vandra.tamblo.Kaleen.Summary",
+          "com.vandra.tamblo.Input.Summary", "com.vandra.tamblo.Session_Generic.Summary",
+          "com.vandra.tamblo.Setup.Setup"}) {
         const std::vector<Dictionary> payloads = device.analyticsEvents.payloads(event);
         ASSERT_EQ(page[event].json.size(), payloads.size()) << event;
         for (std::size_t i = 0; i < payloads.size(); ++i) {
-            const Dictionary line = objectFrom(page[event].json[i]);
-            EXPECT_EQ(*line.find("event"), Value(event));
-            Dictionary shown = line.find("payload")->dictionaryValue();
+            const auto line = readJson(page[event].json[i]);
+            Dictionary shown = std::get<Value>(line).dictionaryValue();
+            EXPECT_EQ(*shown.find("event"), Value(event));
+            shown = Dictionary(shown.find("payload")->dictionaryValue());
             // What a run measures stands for itself, lengths up to a hundredth of a second.
             for (const std::string_view measured :
                  {"zrreporting_timestamp", "last_updated", "vmInfo_phys_footprint_MiB", "load_avg_1_min",
@@ -135,7 +114,6 @@ TEST_F(MessagesDocumentTest, ExamplesAreWhatComesOfItsSession) {
 
 /// Every cell that says what a change of a key does, tried: all keys at first, one changed, then the end.
 TEST_F(MessagesDocumentTest, KeysDoWhatTheirTableSays) {
-    const std::vector<Row>& rows = page["What to send"].rows;
     const auto valueOf = [](const Row& row, bool isChanged) -> Value {
         if (row[1] == "string") {
             return isChanged ? "b" : "a";
@@ -144,37 +122,33 @@ TEST_F(MessagesDocumentTest, KeysDoWhatTheirTableSays) {
                                    : Value(isChanged ? 0.0 : 1.0);
     };
     Dictionary first{{"zrreporting_timestamp", 1000}};
-    for (const Row& row : rows) {
+    for (const Row& row : page["What to send"].rows) {
         if (row[0] != "zrreporting_timestamp" && row[0] != "session_duration") {
             first.set(row[0], valueOf(row, false));
         }
     }
-    const auto session = ZRReportingSession::initWithID(5, {1});
-    const ZRReportingSessionVolumeMessagesWorker output(session);
-    const ZRReportingSessionInputMessagesWorker input(session);
-    const ZRReportingSessionKaleenMessagesWorker group(session);
+    const auto output = make<ZRReportingSessionVolumeMessagesWorker>();
+    const auto input = make<ZRReportingSessionInputMessagesWorker>();
+    const auto group = make<ZRReportingSessionKaleenMessagesWorker>();
     const Value process("player");
     const std::map<std::string, std::string> lengths{
         {"opens", "10.0 "}, {"ends", "10.0 10.0 "}, {"carried", "20.0 "}, {"-", "20.0 "}};
     int tried = 0;
-    for (const Row& row : rows) {
+    for (const Row& row : page["What to send"].rows) {
         if (!first.contains(row[0])) {
             continue;
         }
-        const Dictionary change{{"zrreporting_timestamp", 1010}, {row[0], valueOf(row, true)}};
-        const Dictionary end{{"zrreporting_timestamp", 1020}, {"session_duration", 20}};
-        const auto messages = messagesOf({first, change, end});
+        const auto messages = messagesOf({first,
+                                          {{"zrreporting_timestamp", 1010}, {row[0], valueOf(row, true)}},
+                                          {{"zrreporting_timestamp", 1020}, {"session_duration", 20}}});
         const std::pair<std::vector<MessageRef>, std::string> summaries[] = {
-            {output.createVolumeMessages(messages, &process, {}), row[3]},
-            {input.createInputMessages(messages, &process, {}), row[4]},
-            {group.createKaleenMessages(messages, {}), row[5]}};
+            {output->createVolumeMessages(messages, &process, {}), row[3]},
+            {input->createInputMessages(messages, &process, {}), row[4]},
+            {group->createKaleenMessages(messages, {}), row[5]}};
         for (const auto& [derived, cell] : summaries) {
             std::string found;
             for (const MessageRef& message : derived) {
-                const Value* seconds = message->payload().find("play_seconds");
-                found += jsonText(seconds != nullptr ? *seconds
-                                                     : *message->payload().find("inputrunning_seconds")) +
-                         " ";
+                found += shown(message->payload(), {"play_seconds", "inputrunning_seconds"}) + " ";
                 if (cell == "ends" || cell == "carried" || cell == "-") {
                     EXPECT_EQ(message->payload().contains(row[0]), cell != "-") << row[0];
                 }

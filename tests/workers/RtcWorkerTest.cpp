@@ -1,14 +1,9 @@
 #include "base/Format.h"
-#include "tests/fakes/FakePlatform.h"
-#include "tests/fakes/Messages.h"
-#include "util/InternalBuild.h"
+#include "tests/workers/WorkerTest.h"
 #include "util/LogText.h"
 #include "workers/sinks/LinkmeterSummary.h"
 #include "workers/sinks/ZRReportingSessionRtcWorker.h"
 
-#include <gmock/gmock.h>
-
-#include <chrono>
 #include <cmath>
 #include <optional>
 
@@ -24,43 +19,31 @@ const std::optional<std::vector<std::string>> kFound{{"one", "two"}};
 
 /// Sessions of a device whose call-quality service answers, and whose worker's queue runs, when a test says
 /// so.
-class RtcWorkerTest : public testing::Test {
+class RtcWorkerTest : public WorkerTest {
 protected:
-    std::shared_ptr<ZRReportingSession> makeSession(AudioServiceType type, Dictionary configuration = {}) {
-        auto made = ZRReportingSession::initWithID(77, {1});
-        made->setServiceType(type);
-        made->updateConfigurationWithContentsOfConfiguration(configuration);
-        return made;
-    }
-    void send(Dictionary payload, std::vector<const WorkerClass*> destinations = {}) {
-        const MessageRef message = messageOf(std::move(payload), 0x08000004, 1);
-        message->setDestinationWorkers(std::move(destinations));
-        session->sendMessage(message);
+    RtcWorkerTest() { session = makeSession(AudioServiceTypeTelephony); }
+
+    void sendNumber(int n, Dictionary payload = {}) {
+        payload.set("n", n);
+        send(std::move(payload), 0x08000004, 1);
     }
     void run() { device.workQueues.run(kQueue); }
+    /// Answers the oldest configuration that waits, and lets the queue go on.
+    void findBackends(bool areFound = true) {
+        device.callQuality.findBackends(areFound ? kFound : std::nullopt);
+        run();
+    }
     /// The values of the key in the messages that a Linkmeter session was given: the summary's in brackets,
     /// an "s" for the session's own summary, which its stop sends.
     std::string sent(std::size_t number = 0, std::string_view key = "n") {
         std::string text;
         for (const auto& message : device.callQuality.sessions.at(number)->messages) {
-            std::string value;
             const Value* found = message.payload.find(key);
-            appendText(value, found != nullptr ? *found : Value("-"));
+            const std::string value = found != nullptr ? formatted("{}", *found) : "";
             const bool isSummary = message.category == 0xFFFF && message.type == 0xFFFF;
             text += message.type == AudioEventTypeSummary ? "s" : isSummary ? "[" + value + "]" : value;
         }
         return text;
-    }
-    /// What the worker has logged since the last call, debug lines aside.
-    std::vector<std::string> logged() {
-        std::vector<std::string> texts;
-        for (const FakeLog::Line& line : device.log.lines()) {
-            if (line.category == "zrri" && line.level != LogLevel::debug) {
-                texts.push_back(line.text);
-            }
-        }
-        device.log.clear();
-        return texts;
     }
     /// Linkmeter sessions that somebody besides the fake holds.
     [[nodiscard]] long held() const {
@@ -70,9 +53,6 @@ protected:
         }
         return count;
     }
-
-    FakePlatform device;
-    std::shared_ptr<ZRReportingSession> session = makeSession(AudioServiceTypeTelephony);
 };
 
 TEST_F(RtcWorkerTest, DescribesTheSessionToTheService) {
@@ -94,65 +74,52 @@ TEST_F(RtcWorkerTest, DescribesTheSessionToTheService) {
         described->start();
         run();
         const auto& made = *device.callQuality.sessions.back();
-        Dictionary info{{"ClientType", 19},          {"ClientVersion", 2.1F},
-                        {"SessionID", 77},           {"BatchEvent", c.batches},
-                        {"HierarchyToken", "token"}, {"ContainsRealtimeEvents", !c.batches}};
+        Dictionary info{
+            {"ClientType", 19},        {"ClientVersion", 2.1F},     {"SessionID", 5},
+            {"BatchEvent", c.batches}, {"HierarchyToken", "token"}, {"ContainsRealtimeEvents", !c.batches}};
         if (const Value* name = described->configuration().find("HostApplicationDisplayID")) {
             info.set("ClientBundleID", *name);
         }
         EXPECT_EQ(jsonText(made.sessionInfo), jsonText(info));
-        Dictionary user{{"ClientName", "com.vandra.tamblo"},
-                        {"ZRReportingSessionID", 77},
-                        {"ServiceName", c.serviceName}};
+        Dictionary user{
+            {"ClientName", "com.vandra.tamblo"}, {"ZRReportingSessionID", 5}, {"ServiceName", c.serviceName}};
         user.merge(described->configuration());
         EXPECT_EQ(jsonText(made.userInfo), jsonText(user));
     }
-    const std::size_t queues = device.workQueues.made(kQueue);
-    makeSession(AudioServiceTypeTest)->start();
-    EXPECT_EQ(device.workQueues.made(kQueue), queues) << "the service type \"test\" has no worker";
-    EXPECT_EQ(ZRReportingSessionRtcWorker::initWithSession(makeSession(AudioServiceTypeTest)), nullptr);
     session->setServiceType(AudioServiceTypeTest);
-    EXPECT_EQ(ZRReportingSessionRtcWorker(session).start(), false);
+    EXPECT_EQ(make<ZRReportingSessionRtcWorker>()->start(), false);
 }
 
 TEST_F(RtcWorkerTest, WhatIsHandedInWhileItSetsUpFollowsInOrderWhateverComesOfIt) {
-    const std::string never = "Session never started. handleMessage";
-    const std::string neverStopped = "Session never started. stop";
-    const std::string none = "no backends found, this session won't get sent to the server";
-    const std::string timedOut = "timed out waiting for backends";
-    const std::string list = R"(list of backends ["one","two"])";
-    const std::string summary = "sending rtc summary event. reporterID=77";
     const struct {
         std::chrono::milliseconds waits;
         bool isFound;
-        std::vector<std::string> log;
-        std::string sent;
+        const char* sent;
+        const char* logged; ///< of the back ends, of the end of the wait, of what is not sent, of the stop
     } cases[] = {
-        {8'999ms, true, {list, "continuing with backends!", summary}, "12s[1,2]"},
-        {0ms, false, {none, "failed to find backend", never, never, never, neverStopped}, ""},
-        {9s, false, {none, timedOut, never, never, never, neverStopped}, ""},
-        // Too late, and before what waited has run.
-        {9s, true, {list, timedOut, summary}, ""},
+        {8'999ms, true, "12s[1,2]", "sss"},
+        {0ms, false, "", "esssss"},
+        {9s, false, "", "esssss"},
+        {9s, true, "", "sss"}, // too late, and before what waited has run
     };
     for (const auto& c : cases) {
         session = makeSession(AudioServiceTypeTelephony);
         session->start();
-        EXPECT_EQ(logged(), std::vector<std::string>());
-        send({{"n", 1}});
+        sendNumber(1);
         run();
-        send({{"n", 2}});
+        sendNumber(2);
         run();
-        EXPECT_THAT(logged(), ElementsAre("waiting to find backends"));
         EXPECT_EQ(sent(device.callQuality.sessions.size() - 1), "");
+        EXPECT_EQ(loggedLevels(ZRReportingSessionLinkmeterCategory()), "s");
         session->stop();
         run();
         device.workQueues.elapse(c.waits);
         device.callQuality.findBackends(c.isFound ? kFound : std::nullopt);
         device.workQueues.elapse(9s);
         run();
-        EXPECT_EQ(logged(), c.log);
+        EXPECT_EQ(loggedLevels(ZRReportingSessionLinkmeterCategory()), c.logged);
         EXPECT_EQ(sent(device.callQuality.sessions.size() - 1), c.sent);
-        EXPECT_EQ(device.callQuality.sessions.back()->flushes, c.sent.empty() ? 0 : 1);
+        EXPECT_EQ(device.callQuality.sessions.back()->flushes, *c.sent != '\0' ? 1 : 0);
         EXPECT_EQ(device.workQueues.delayedCalls(), 0U);
     }
 }
@@ -160,37 +127,31 @@ TEST_F(RtcWorkerTest, WhatIsHandedInWhileItSetsUpFollowsInOrderWhateverComesOfIt
 TEST_F(RtcWorkerTest, SendsAtOnceOnceStartedAndSetsUpAnewForTheNextRun) {
     session->start();
     run();
-    device.callQuality.findBackends(kFound);
-    run();
-    (void)logged();
+    findBackends();
     const int commits = device.callQuality.commits;
-    send({{"n", 1}});
+    sendNumber(1);
     EXPECT_EQ(sent(), "");
     run();
     EXPECT_EQ(sent(), "1");
     EXPECT_EQ(device.callQuality.commits, commits + 1);
-    EXPECT_THAT(device.log.texts("LinkmeterAgent"),
-                ElementsAre(R"(LinkmeterAgent fake session : message {"HostApplicationDisplayID":"Unknown",)"
-                            R"("audiotag":"Session_PlaybackStart","invalid_timestamp":"nil","n":1} : )"
-                            R"(category 134217732 : type 1)"));
     EXPECT_EQ(device.callQuality.sessions[0]->messages[0].category, 4) << "the kind";
     device.callQuality.sendFailure = "no room";
-    send({{"n", 2}});
+    (void)logged(ZRReportingSessionLinkmeterCategory());
+    sendNumber(2);
     run();
-    EXPECT_THAT(logged(), ElementsAre("error sending message no room"));
+    EXPECT_EQ(loggedLevels(ZRReportingSessionLinkmeterCategory()), "e");
     device.callQuality.sendFailure.reset();
 
     // Stop, and all of the next run, before the queue gets to any of it.
     session->stop();
-    send({{"n", 3}});
+    sendNumber(3);
     session->start();
-    send({{"n", 4}});
+    sendNumber(4);
     session->stop();
     run();
     EXPECT_EQ(sent(), "1s[1,2]");
     EXPECT_EQ(sent(1), "");
-    device.callQuality.findBackends(kFound);
-    run();
+    findBackends();
     EXPECT_EQ(sent(1), "4s[4]");
     EXPECT_EQ(device.callQuality.sessions[0]->flushes + device.callQuality.sessions[1]->flushes, 2);
     EXPECT_EQ(held(), 0);
@@ -202,10 +163,7 @@ TEST_F(RtcWorkerTest, WithoutATokenNothingIsOpened) {
     session->start();
     session->stop();
     run();
-    EXPECT_THAT(
-        logged(),
-        ElementsAre("newHierarchyTokenFromParentToken returned nil. Will skip rtc for this session. start",
-                    "Session never started. handleMessage", "Session never started. stop"));
+    EXPECT_EQ(loggedLevels(ZRReportingSessionLinkmeterCategory()), "ess");
     EXPECT_THAT(device.callQuality.sessions, IsEmpty());
 }
 
@@ -215,21 +173,18 @@ TEST_F(RtcWorkerTest, BackendsFoundTooLateTurnTheWorkerOnAndEndTheNextRunsWait) 
     device.workQueues.elapse(9s);
     run();
     EXPECT_EQ(held(), 0) << "the session is let go";
-    device.callQuality.findBackends(kFound);
-    send({{"n", 1}});
+    findBackends();
+    sendNumber(1);
     run();
     EXPECT_EQ(sent(), "");
-    EXPECT_THAT(logged(), ElementsAre("waiting to find backends", "timed out waiting for backends",
-                                      R"(list of backends ["one","two"])"));
     session->stop();
     session->start();
-    send({{"n", 2}});
+    sendNumber(2);
     run();
-    EXPECT_THAT(logged(), ElementsAre("sending rtc summary event. reporterID=77", "waiting to find backends",
-                                      "failed to find backend", "Session never started. handleMessage"));
-    EXPECT_EQ(device.workQueues.delayedCalls(), 0U);
-    device.callQuality.findBackends(kFound);
-    send({{"n", 3}});
+    EXPECT_EQ(device.workQueues.delayedCalls(), 0U) << "does not wait, and is not started";
+    EXPECT_EQ(sent(1), "");
+    findBackends();
+    sendNumber(3);
     run();
     EXPECT_EQ(sent(1), "3") << "the second run's own back ends";
 }
@@ -237,17 +192,16 @@ TEST_F(RtcWorkerTest, BackendsFoundTooLateTurnTheWorkerOnAndEndTheNextRunsWait) 
 TEST_F(RtcWorkerTest, ADroppedSessionLeavesNothingBehindWhileItsWorkerWaits) {
     session->start();
     run();
-    send({{"n", 1}});
+    sendNumber(1);
     EXPECT_EQ(device.workQueues.delayedCalls(), 1U);
-    (void)logged();
     session.reset();
     run();
     EXPECT_EQ(device.workQueues.delayedCalls(), 0U);
     EXPECT_EQ(held(), 0);
-    device.callQuality.findBackends(kFound);
-    run();
+    device.log.clear();
+    findBackends();
     EXPECT_EQ(sent(), "");
-    EXPECT_THAT(logged(), IsEmpty());
+    EXPECT_THAT(device.log.lines(), IsEmpty());
 }
 
 TEST_F(RtcWorkerTest, AStoppedSessionIsReportedInFullAfterItWasDropped) {
@@ -258,13 +212,12 @@ TEST_F(RtcWorkerTest, AStoppedSessionIsReportedInFullAfterItWasDropped) {
             if (isWaitingAtStop) {
                 run();
             }
-            send({{"n", 1}});
+            sendNumber(1);
             session->stop();
             session.reset();
             run();
             device.workQueues.elapse(isFound ? 0s : 9s);
-            device.callQuality.findBackends(kFound);
-            run();
+            findBackends();
             EXPECT_EQ(sent(device.callQuality.sessions.size() - 1), isFound ? "1s[1]" : "");
             EXPECT_EQ(held(), 0);
             EXPECT_EQ(device.workQueues.delayedCalls(), 0U);
@@ -273,36 +226,31 @@ TEST_F(RtcWorkerTest, AStoppedSessionIsReportedInFullAfterItWasDropped) {
 }
 
 TEST_F(RtcWorkerTest, TheSummaryJoinsWhatWasSentOnceWhileStarted) {
-    send({{"early", true}, {"n", 0}});
+    sendNumber(0, {{"early", true}});
     session->start();
     run();
-    device.callQuality.findBackends(kFound);
-    send({{"volume", 3}, {"n", 1}});
-    send({{"volume", 3}, {"n", 1}});
-    send({{"volume", 5}, {"n", 2}}, {workerClassNamed("ZRReportingSessionEventryWorker")});
+    findBackends();
+    sendNumber(1, {{"volume", 3}, {"zrreporting_timestamp", 4e9}});
+    sendNumber(1, {{"volume", 3}, {"zrreporting_timestamp", 4e9}});
+    const MessageRef elsewhere =
+        messageOf({{"volume", 5}, {"n", 2}, {"zrreporting_timestamp", 5e9}}, 0x08000004, 1);
+    elsewhere->setDestinationWorkers({workerClassNamed("ZRReportingSessionEventryWorker")});
+    session->sendMessage(elsewhere);
     session->stop();
     run();
     EXPECT_EQ(sent(), "1s[1,2]") << "the destinations count for the sending alone";
+    EXPECT_EQ(sent(0, "zrreporting_timestamp"), "s[]") << "outside internal builds";
     const auto& summary = device.callQuality.sessions[0]->messages.back();
     EXPECT_EQ(*summary.payload.find("volume"), Value("3,5"));
     EXPECT_EQ(*summary.payload.find("ZR_Session_Summary_Event"), Value("2"));
     EXPECT_FALSE(summary.payload.contains("early"));
-    EXPECT_THAT(device.log.texts("sending rtc summary event. reporterID=77 volume"),
-                ElementsAre(R"(sending rtc summary event. reporterID=77 volume="3,5")"));
-    session.reset();
-    EXPECT_EQ(held(), 0);
-}
-
-TEST_F(RtcWorkerTest, TimestampsAreKeptOnAnInternalBuild) {
-    device.deviceProperties.set("InternalBuild", true);
-    forgetInternalBuild();
+    setInternalBuild(true);
     session->start();
     run();
-    device.callQuality.findBackends(kFound);
-    send({{"zrreporting_timestamp", 4e9}});
-    session->stop();
+    findBackends();
+    sendNumber(3, {{"zrreporting_timestamp", 4e9}});
     run();
-    EXPECT_EQ(sent(0, "zrreporting_timestamp"), "4000000000.0s[4000000000.0,1772366400.0]");
+    EXPECT_EQ(sent(1, "zrreporting_timestamp"), "4000000000.0");
 }
 
 MessageRef record(Dictionary payload) {

@@ -1,32 +1,24 @@
-#include "session/ZRReportingSession.h"
-#include "tests/fakes/FakePlatform.h"
-#include "util/InternalBuild.h"
+#include "tests/workers/WorkerTest.h"
 #include "workers/trace/ChromeTrace.h"
 #include "workers/trace/ProcessSampler.h"
 #include "workers/trace/SessionTrace.h"
 #include "workers/trace/ZRReportingSessionTraceWorker.h"
 
-#include <gmock/gmock.h>
 #include <nlohmann/json.hpp>
 
 #include <limits>
 #include <map>
 #include <span>
-#include <string>
-#include <utility>
-#include <vector>
 
 namespace tamblo {
 namespace {
 
 using namespace std::chrono_literals;
 using Json = nlohmann::json;
-using testing::ElementsAre;
 using testing::IsEmpty;
 using testing::SizeIs;
 
 constexpr const char* kPath = "/performance/20260301-120000+0000-5-Unknown-velka.json";
-constexpr pid_t kClient = 77;
 constexpr pid_t kService = 4321;
 constexpr std::int64_t kStart = 1'772'366'400'000'000; ///< of the fake clock, in microseconds
 const WallTime kStartTime{std::chrono::microseconds(kStart)};
@@ -41,14 +33,10 @@ ProcessSample sampleOf(std::int64_t userMicroseconds, std::uint64_t faults = 0) 
     return sample;
 }
 
-class TraceWorkerTest : public testing::Test {
+class TraceWorkerTest : public WorkerTest {
 protected:
-    static std::shared_ptr<ZRReportingSession> makeSession() {
-        auto session = ZRReportingSession::initWithID(5, {kClient});
-        session->setServiceType(AudioServiceTypeVelka);
-        session->setClientProcessName("player");
-        return session;
-    }
+    TraceWorkerTest() : WorkerTest(LogLevel::info, true) { session = makeSession(AudioServiceTypeVelka); }
+
     void tick(std::chrono::milliseconds step = 100ms) {
         device.clock.advance(step);
         device.workQueues.tick();
@@ -71,12 +59,10 @@ protected:
         }
         return found;
     }
-    FakePlatform device{LogLevel::info, true};
 };
 
 TEST_F(TraceWorkerTest, WritesWhatASessionsProcessesDid) {
     device.processInformation.names[kService] = "tamblod";
-    const auto session = makeSession();
     session->start();
     const auto other = makeSession(); // of the same client: it changes nothing
     other->start();
@@ -107,35 +93,23 @@ TEST_F(TraceWorkerTest, WritesWhatASessionsProcessesDid) {
 
     const auto files = written();
     ASSERT_THAT(files, SizeIs(1));
-    ASSERT_EQ(files.begin()->first, kPath);
-    const Json file = Json::parse(files.begin()->second);
+    const Json file = Json::parse(files.at(kPath));
     EXPECT_EQ(counter(file, kClient, "processor time (% of a core)", "user"), "200:5.0 ");
     EXPECT_EQ(counter(file, kClient, "memory (bytes)", "resident"), "100:1048576 200:1048576 200:1048576 ");
     EXPECT_EQ(counter(file, kService, "context switches (per second)", "voluntary"),
               "200:0.0 300:0.0 400:0.0 ");
     EXPECT_EQ(counter(file, kService, "page faults (per second)", "minor"), "200:0.0 300:0.0 400:100.0 ");
     const Json& events = file.at("traceEvents");
-    EXPECT_EQ(events.at(0).at("args").at("name"), "player");
+    EXPECT_EQ(events.at(0).at("args").at("name"), "caller");
     EXPECT_EQ(events.at(1).at("args").at("name"), "tamblod");
     EXPECT_EQ(events.at(5).at("name"), "session");
     EXPECT_EQ(events.at(5).at("dur"), 3'600'000'000) << "the clock goes on from where it was";
 }
 
-TEST_F(TraceWorkerTest, OnOtherBuildsNothingIsTraced) {
-    device.deviceProperties.set("InternalBuild", false);
-    forgetInternalBuild();
-    const auto session = makeSession();
-    EXPECT_EQ(ZRReportingSessionTraceWorker::initWithSession(session), nullptr);
-    session->start();
-    session->stop();
-    EXPECT_THAT(device.workQueues.timers(), IsEmpty());
-    EXPECT_THAT(written(), IsEmpty());
-}
-
 TEST_F(TraceWorkerTest, HoldsSoManyTracesAtATimeAndForgetsDroppedSessions) {
     std::vector<std::shared_ptr<ZRReportingSession>> sessions;
     for (std::size_t i = 0; i < ProcessSampler::kMostRecordings + 3; ++i) {
-        sessions.push_back(ZRReportingSession::initWithID(static_cast<ReporterID>(i), {kClient}));
+        sessions.push_back(makeSession(AudioServiceTypeVelka, {}, static_cast<ReporterID>(i)));
         sessions.back()->start();
     }
     const auto timesFull = [this] { return device.log.count("32 sessions are traced already"); };
@@ -145,9 +119,9 @@ TEST_F(TraceWorkerTest, HoldsSoManyTracesAtATimeAndForgetsDroppedSessions) {
     sessions.back()->start();
     EXPECT_EQ(timesFull(), 1U) << "there was room for it";
     tick();
-    for (const auto& session : std::span(sessions).first(sessions.size() - 1)) {
-        session->stop();
-        session->start();
+    for (const auto& traced : std::span(sessions).first(sessions.size() - 1)) {
+        traced->stop();
+        traced->start();
     }
     EXPECT_EQ(timesFull(), 2U) << "the files wait";
     EXPECT_THAT(written(), SizeIs(ProcessSampler::kMostRecordings - 1));
@@ -163,18 +137,14 @@ TEST_F(TraceWorkerTest, HoldsSoManyTracesAtATimeAndForgetsDroppedSessions) {
 }
 
 TEST_F(TraceWorkerTest, EachFailureIsOneLine) {
-    const auto session = makeSession();
     for (const auto step : {&FakeReportFiles::directoryFailure, &FakeReportFiles::openFailure,
                             &FakeReportFiles::writeFailure, &FakeReportFiles::closeFailure}) {
-        device.log.clear();
         device.reportFiles.*step = "no way";
         session->start();
         session->stop();
         (void)written();
         device.reportFiles.*step = std::nullopt;
-        EXPECT_THAT(device.log.texts("TraceWorker"),
-                    ElementsAre(std::string("TraceWorker failed to write file. file=") + kPath +
-                                " error=\"no way\""));
+        EXPECT_EQ(loggedLevels(ZRReportingTraceCategory()), "e");
     }
 }
 

@@ -1,19 +1,9 @@
 #include "base/Format.h"
-#include "tests/fakes/FakePlatform.h"
-#include "tests/fakes/Messages.h"
-#include "util/InternalBuild.h"
-#include "util/LogCategories.h"
+#include "tests/workers/WorkerTest.h"
 #include "workers/sinks/ZRReportingSessionZephWorker.h"
-#include "workers/sinks/zeph/ZRReportingZephWorkerInstanceHapticLeaks.h"
 
-#include <gmock/gmock.h>
-
-#include <chrono>
 #include <optional>
-#include <string>
 #include <thread>
-#include <utility>
-#include <vector>
 
 namespace tamblo {
 namespace {
@@ -44,51 +34,45 @@ public:
     static inline std::string calls;
 };
 
-class ZephWorkerTest : public testing::Test {
+class ZephWorkerTest : public WorkerTest {
 protected:
+    ZephWorkerTest() : WorkerTest(LogLevel::debug, true) {}
     ~ZephWorkerTest() override { ZRReportingSessionZephWorker::reset(); }
 
-    static std::shared_ptr<ZRReportingSession> startedSession(AudioServiceType type, bool isSingle = false) {
-        auto session = ZRReportingSession::initWithID(5, {42, 43});
+    void startSession(AudioServiceType type, bool isSingle = false) {
+        session = makeSession(type);
         session->setIsSingleMessageSession(isSingle);
-        session->setServiceType(type);
-        session->setClientProcessName("alarmd");
         session->start();
-        return session;
     }
-    void sendLeak(ZRReportingSession& session, const char* key, std::chrono::nanoseconds wait = 1ms) {
+    void sendLeak(const char* key, std::chrono::nanoseconds wait = 1ms) {
         device.clock.advance(wait);
-        session.sendMessage(messageOf({{key, 90}}, AudioEventKindPlayback, AudioEventTypeJoulery));
+        send({{key, 90}}, AudioEventKindPlayback, AudioEventTypeJoulery);
     }
-    void sendLow(ZRReportingSession& session, int times = 3) {
+    void sendLow(int times = 3) {
         for (int i = 0; i < times; ++i) {
             device.clock.advance(1ms);
-            session.sendMessage(messageOf(kLow, AudioEventKindError, AudioEventTypeIssueDetector));
+            send(kLow, AudioEventKindError, AudioEventTypeIssueDetector);
         }
     }
-    /// Since the last call: what was asked of the capture service, and then `LEVEL TEXT` of the bug captures'
-    /// lines above debug.
-    std::vector<std::string> seen() {
+    /// What was asked of the capture service since the last call.
+    std::vector<std::string> asked() {
         std::vector<std::string> found;
-        for (const auto& [operation, processes, filed, duration, payload, session] :
+        for (const auto& [operation, processes, filed, duration, payload, identifier] :
              std::exchange(device.bugCapture.requests, {})) {
-            EXPECT_THAT(processes, ElementsAre(42, 43));
+            EXPECT_THAT(processes, ElementsAre(kClient, kOtherClient));
             found.push_back(operation == "cancel"
-                                ? "cancel " + session
+                                ? "cancel " + identifier
                                 : formatted("{} {}/{}/{}/{}/{} {} {}", operation, filed.domain, filed.type,
                                             filed.subType, filed.subTypeContext, filed.detectedProcess,
                                             duration.count(), jsonText(payload)));
         }
-        for (const FakeLog::Line& line : device.log.lines()) {
-            if (line.category == ZRReportingZephLogCategory().code() && line.level != LogLevel::debug) {
-                found.push_back((line.level == LogLevel::error ? "error " : "info ") + line.text);
-            }
-        }
-        device.log.clear();
         return found;
     }
-
-    FakePlatform device{LogLevel::debug, true};
+    std::string snapshotOf(const char* what) {
+        return formatted("snapshot Tonmetry/{}/Playback/Joulery/Unknown 0.000000 ", what) +
+               R"({"diagnostic_extension_parameters":)"
+               R"({"com.vandra.powerlog.systemlog.filterprocess":{"processIDs":[77,78]}}})";
+    }
 };
 
 TEST_F(ZephWorkerTest, DetectorsFireAtTheirThresholdsAndBeginAnew) {
@@ -116,8 +100,8 @@ TEST_F(ZephWorkerTest, DetectorsFireAtTheirThresholdsAndBeginAnew) {
     constexpr ZephWorkerInstanceClass scripted{
         .name = "Scripted",
         .messageType = AudioEventTypeState,
-        .initWithSession = [](const auto& session) -> std::unique_ptr<ZRReportingSessionZephWorkerInstance> {
-            auto detector = std::make_unique<ScriptedDetector>(session);
+        .initWithSession = [](const auto& owner) -> std::unique_ptr<ZRReportingSessionZephWorkerInstance> {
+            auto detector = std::make_unique<ScriptedDetector>(owner);
             detector->setWorkerState(state);
             return detector;
         }};
@@ -130,21 +114,19 @@ TEST_F(ZephWorkerTest, DetectorsFireAtTheirThresholdsAndBeginAnew) {
         ScriptedDetector::doesFire = row.doesFire;
         ScriptedDetector::calls.clear();
         device.bugCapture.reportersMade = 0;
-        const auto session = startedSession(row.serviceType);
-        ZRReportingSessionZephWorker worker(session);
-        worker.addInstance(scripted);
-        EXPECT_EQ(worker.start(), true);
+        startSession(row.serviceType);
+        const auto worker = make<ZRReportingSessionZephWorker>();
+        worker->addInstance(scripted);
+        EXPECT_EQ(worker->start(), true);
         for (const auto& [wait, number] : row.steps) {
             device.clock.advance(wait);
-            worker.handleMessage(messageOf({{number != 0 ? "n" : "m", number}}, 4, AudioEventTypeState));
-            worker.handleMessage(messageOf({{"n", -number}}, 4, AudioEventTypeHistogram));
+            worker->handleMessage(messageOf({{number != 0 ? "n" : "m", number}}, 4, AudioEventTypeState));
+            worker->handleMessage(messageOf({{"n", -number}}, 4, AudioEventTypeHistogram));
         }
-        worker.stop();
+        worker->stop();
         EXPECT_EQ(ScriptedDetector::calls, "s" + row.calls + "e");
         EXPECT_EQ(device.bugCapture.reportersMade, row.fired) << row.calls;
     }
-    const std::string skipped = "info Skipping actual fire, as we are running in test mode.";
-    EXPECT_THAT(seen(), ElementsAre(skipped, skipped));
     state.reset();
 }
 
@@ -173,113 +155,90 @@ TEST_F(ZephWorkerTest, EachDetectorLooksAtItsOwnMessages) {
     };
     const std::string beginning = "Interested in message. instance=ZRReportingZephWorkerInstance";
     for (const auto& row : cases) {
-        const auto session = startedSession(row.service, row.isSingle);
+        startSession(row.service, row.isSingle);
         device.log.clear();
         device.clock.advance(1s);
-        session->sendMessage(messageOf(row.payload, row.category, row.type));
+        send(row.payload, row.category, row.type);
         std::string interested;
         for (const std::string& line : device.log.texts(beginning)) {
             interested += line.substr(beginning.size(), line.find(',') - beginning.size()) + " ";
         }
         EXPECT_EQ(interested, row.interested) << row.type << jsonText(row.payload);
     }
-    device.deviceProperties.set("InternalBuild", false);
-    forgetInternalBuild();
-    EXPECT_EQ(ZRReportingSessionZephWorker::initWithSession(startedSession(4)), nullptr);
 }
 
 TEST_F(ZephWorkerTest, LeaksOfHapticsAreCountedOverSessionsAndRepeats) {
-    const std::string snapshot = "snapshot Tonmetry/haptics/Playback/Joulery/Unknown 0.000000 "
-                                 R"({"diagnostic_extension_parameters":)"
-                                 R"({"com.vandra.powerlog.systemlog.filterprocess":{"processIDs":[42,43]}}})";
-    sendLeak(*startedSession(AudioServiceTypeAlerts), kHapticKey); // counted by nobody
+    startSession(AudioServiceTypeAlerts);
+    sendLeak(kHapticKey); // counted by nobody
     device.deviceProperties.set("HapticLeakCapture", true);
-    device.bugCapture.promptAnswer = kOpened;
-    sendLeak(*startedSession(AudioServiceTypeAlerts), kHapticKey);
-    const auto session = startedSession(AudioServiceTypeTelephony);
-    EXPECT_THAT(seen(), IsEmpty());
-    sendLeak(*session, kHapticKey);
-    EXPECT_THAT(seen(), ElementsAre(snapshot, "info Started Zeph session. sessionId=S-1",
-                                    "info Started Zeph session for haptics leaks. sessionId=S-1 response=" +
-                                        jsonText(kOpened),
-                                    "info Parameters to Zeph session accepted."));
-    EXPECT_EQ(sharedWorkerInstanceState(ZRReportingZephWorkerInstanceHapticLeaks::kClassName, nullptr)
-                  ->currentZephSessionIdentifier(),
-              "S-1");
+    startSession(AudioServiceTypeAlerts);
+    sendLeak(kHapticKey);
+    startSession(AudioServiceTypeTelephony);
+    EXPECT_THAT(asked(), IsEmpty());
+    sendLeak(kHapticKey);
+    EXPECT_THAT(asked(), ElementsAre(snapshotOf("haptics")));
+    (void)logged(ZRReportingZephLogCategory());
     device.bugCapture.accepts = false;
-    sendLeak(*session, kHapticKey);
-    sendLeak(*session, kHapticKey);
-    EXPECT_THAT(seen(), ElementsAre(snapshot, "error Parameters to Zeph session not accepted!"));
+    sendLeak(kHapticKey);
+    sendLeak(kHapticKey);
+    EXPECT_THAT(asked(), ElementsAre(snapshotOf("haptics")));
+    EXPECT_EQ(loggedLevels(ZRReportingZephLogCategory()), "e");
     EXPECT_EQ(session->acceptedMessageCount(), 1U); // the others repeated it
 }
 
 TEST_F(ZephWorkerTest, StuckSystemSoundsAreCapturedOnceInFifteenSeconds) {
-    constexpr std::chrono::nanoseconds waits[] = {0s, 15s - 1ns, 1ns, 10s, 5s};
-    std::string answers;
-    for (const auto wait : waits) {
-        sendLeak(*startedSession(AudioServiceTypeAlerts), kSoundKey, wait);
-        const std::string first = seen().at(0);
-        answers += first.substr(0, first.find('{'));
+    const std::pair<std::chrono::nanoseconds, std::size_t> steps[] = {
+        {0s, 1}, {15s - 1ns, 0}, {1ns, 1}, {10s, 0}, {5s, 1}};
+    for (const auto& [wait, captures] : steps) {
+        startSession(AudioServiceTypeAlerts);
+        sendLeak(kSoundKey, wait);
+        EXPECT_EQ(asked(), std::vector<std::string>(captures, snapshotOf("systemsounds")));
     }
-    const std::string captured = "snapshot Tonmetry/systemsounds/Playback/Joulery/Unknown 0.000000 ";
-    const std::string limited = "info Already fired ZRReportingZephWorkerInstanceSSSLeaks recently.";
-    EXPECT_EQ(answers, captured + limited + captured + limited + captured);
-    device.bugCapture.answer({{"reason", 6}});
-    EXPECT_EQ(seen().back(), "info Started Zeph session for system sound server leaks. "
-                             R"(sessionId=NONE_RETURNED response={"reason":6})");
 }
 
 TEST_F(ZephWorkerTest, StopCancelsTheCaptureOfALowAlarm) {
-    const std::string start = "start Tonmetry/alarms/Error/IssueDetector/alarmd 60.000000 {}";
-    auto session = startedSession(AudioServiceTypeAlarms);
-    sendLow(*session, 2);
+    const std::string start = "start Tonmetry/alarms/Error/IssueDetector/caller 60.000000 {}";
+    startSession(AudioServiceTypeAlarms);
+    sendLow(2);
     session->stop();
     session->start();
-    EXPECT_THAT(seen(), IsEmpty());
-    sendLow(*session, 4); // once only
-    session->stop();      // not answered yet: nothing to cancel
+    EXPECT_THAT(asked(), IsEmpty());
+    sendLow(4);      // once only
+    session->stop(); // not answered yet: nothing to cancel
     device.bugCapture.answer(kOpened);
-    EXPECT_THAT(seen(),
-                ElementsAre(start,
-                            "info Parameters to Zeph session for alarm Low RMS accepted. Will fire if "
-                            "not cancelled. timeout=60.000000.",
-                            "info Started Zeph session. sessionId=S-1",
-                            "info Started Zeph session for alarm Low RMS. sessionId=S-1 "
-                            "timeout=60.000000 response=" +
-                                jsonText(kOpened)));
+    EXPECT_THAT(asked(), ElementsAre(start));
     for (int round = 0; round < 2; ++round) {
         session->start();
-        sendLow(*session);
+        sendLow();
         session->stop();
-        EXPECT_THAT(seen(),
-                    ElementsAre("cancel S-1", "info Stop called. Cancelling Zeph session for alarm Low RMS. "
-                                              "sessionId=S-1 timeout=60.000000"));
+        EXPECT_THAT(asked(), ElementsAre("cancel S-1"));
     }
-    session = startedSession(AudioServiceTypeAlarms);
+    startSession(AudioServiceTypeAlarms);
     device.bugCapture.promptAnswer = Dictionary{{"reason", 1}};
-    sendLow(*session);
+    sendLow();
     session->stop();
-    EXPECT_THAT(seen(), testing::IsSupersetOf({start, std::string("cancel NONE_RETURNED")}));
-    session = startedSession(AudioServiceTypeAlarms);
+    EXPECT_THAT(asked(), ElementsAre(start, "cancel NONE_RETURNED"));
+    startSession(AudioServiceTypeAlarms);
+    (void)logged(ZRReportingZephLogCategory());
     device.bugCapture.accepts = false;
-    sendLow(*session);
+    sendLow();
     session->stop();
-    EXPECT_THAT(seen(), ElementsAre(start, "error Zeph session for alarm Low RMS failed to start."));
+    EXPECT_THAT(asked(), ElementsAre(start));
+    EXPECT_EQ(loggedLevels(ZRReportingZephLogCategory()), "e");
 }
 
 TEST_F(ZephWorkerTest, AnswersComeOnAnyThreadAndWhenEverythingIsGone) {
-    auto session = startedSession(AudioServiceTypeAlarms);
-    sendLow(*session);
-    sendLeak(*session, kSoundKey);
+    startSession(AudioServiceTypeAlarms);
+    sendLow();
+    sendLeak(kSoundKey);
     session.reset();
     ZRReportingSessionZephWorker::reset();
     device.bugCapture.answer(kOpened);
     device.bugCapture.answer(kOpened);
     EXPECT_EQ(device.log.count("Started Zeph session for"), 2U);
-    session = startedSession(AudioServiceTypeAlarms);
-    sendLow(*session);
-    device.log.setThreshold(LogLevel::fault); // the log's lock would keep the threads apart
-    forgetLogThresholds();
+    startSession(AudioServiceTypeAlarms);
+    sendLow();
+    setLogThreshold(LogLevel::fault); // the log's lock would keep the threads apart
     std::thread answering([this] { device.bugCapture.answer(kOpened); });
     for (int i = 0; i < 20; ++i) {
         session->stop();
@@ -297,23 +256,22 @@ TEST_F(ZephWorkerTest, RepliesSayWhetherThereIsACapture) {
         std::string line;
         std::string identifier = "NONE_RETURNED";
     } cases[] = {
-        {kOpened, "info Started Zeph session. sessionId=S-1", "S-1"},
-        {{{"success", 1.0}, {"session_id", 17}}, "info Started Zeph session. sessionId=17", "17"},
-        {{{"success", true}, {"reason", 3}}, "error Started Zeph session, but no sessionId found!"},
-        {{}, "error Failed starting zeph session. Unknown reason."},
-        {{{"success", 2}, {"session_id", "S"}}, "error Failed starting zeph session. Unknown reason."},
-        {{{"success", "true"}, {"reason", "none"}}, "error " + failed + "kGlarnErrorNone"},
-        {{{"success", false}, {"reason", 0x1'0000'0000}}, "error " + failed + "kGlarnErrorNone"},
-        {{{"reason", 1.9}}, "info " + failed + "kGlarnErrorServiceNotReady"},
-        {{{"reason", 7}}, "info " + failed + "kGlarnErrorRandomizedSuppression"},
-        {{{"reason", 9}}, "info " + failed + "kGlarnErrorRequestThrottled"},
-        {{{"reason", 10}}, "info " + failed + "10"},
-        {{{"reason", 0xFFFF'FFFF}}, "info " + failed + "-1"},
+        {kOpened, "i Started Zeph session. sessionId=S-1", "S-1"},
+        {{{"success", 1.0}, {"session_id", 17}}, "i Started Zeph session. sessionId=17", "17"},
+        {{{"success", true}, {"reason", 3}}, "e Started Zeph session, but no sessionId found!"},
+        {{}, "e Failed starting zeph session. Unknown reason."},
+        {{{"success", 2}, {"session_id", "S"}}, "e Failed starting zeph session. Unknown reason."},
+        {{{"success", "true"}, {"reason", "none"}}, "e " + failed + "kGlarnErrorNone"},
+        {{{"success", false}, {"reason", 0x1'0000'0000}}, "e " + failed + "kGlarnErrorNone"},
+        {{{"reason", 1.9}}, "i " + failed + "kGlarnErrorServiceNotReady"},
+        {{{"reason", 9}}, "i " + failed + "kGlarnErrorRequestThrottled"},
+        {{{"reason", 10}}, "i " + failed + "10"},
+        {{{"reason", 0xFFFF'FFFF}}, "i " + failed + "-1"},
     };
     for (const auto& row : cases) {
         EXPECT_EQ(ZRReportingSessionZephWorker::getSessionIdentifierFromResponse(row.response),
                   row.identifier);
-        EXPECT_THAT(seen(), ElementsAre(row.line));
+        EXPECT_THAT(logged(ZRReportingZephLogCategory()), ElementsAre(row.line));
     }
 }
 

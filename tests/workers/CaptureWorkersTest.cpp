@@ -1,0 +1,233 @@
+#include "tests/base/AllocationCount.h"
+#include "tests/workers/WorkerTest.h"
+#include "workers/sinks/ZRReportingSessionDPWorker.h"
+#include "workers/sinks/ZRReportingSessionQuilletWorker.h"
+
+#include <cmath>
+
+// The workers that draft bug reports and capture stacks.
+
+namespace tamblo {
+namespace {
+
+using namespace std::chrono_literals;
+using testing::ElementsAre;
+using testing::IsEmpty;
+using testing::SizeIs;
+
+constexpr const char* kLastRun = "TalvixInvalidXyQLTlastRun";
+constexpr const char* kSize = "smallest_buffer_frame_size";
+constexpr const char* kCycle = "io_cycle";
+
+class CaptureTest : public WorkerTest {
+protected:
+    CaptureTest() : WorkerTest(LogLevel::debug, true) {}
+    void prefer(const std::string& key, Value value) {
+        device.preferences.set(key, "com.vandra.tamblo.zrreporting", std::move(value));
+    }
+};
+
+class QuilletWorkerTest : public CaptureTest {
+protected:
+    QuilletWorkerTest() {
+        prefer("TalvixInvalidXyBackOffSeconds", "60.5 s");
+        device.clock.advance(500ms);
+    }
+    /// How many drafts a message now makes, by its time after the first one's.
+    std::size_t draftsOf(double offset, const std::string& key = "tvac_invalid_x") {
+        const std::size_t before = device.bugReportDrafting.requests.size();
+        worker->handleMessage(messageOf({{key, 1}, {"zrreporting_timestamp", 1e9 + offset}}));
+        return device.bugReportDrafting.requests.size() - before;
+    }
+    void arm() {
+        worker = tryToMake<ZRReportingSessionQuilletWorker>();
+        EXPECT_EQ(draftsOf(0.0), 0U);
+        device.log.clear();
+    }
+    Value lastRun() {
+        return device.preferences.copyPreferenceValue(kLastRun, "com.vandra.tamblo.zrreporting")
+            .value_or("none");
+    }
+
+    std::shared_ptr<ZRReportingSessionQuilletWorker> worker;
+};
+
+TEST_F(QuilletWorkerTest, LooksAtMessagesFiveSecondsAfterTheFirst) {
+    const struct {
+        double offset;
+        const char* key;
+        std::size_t drafts;
+    } cases[] = {{5.0, "tvac_invalid_x", 0},
+                 {5.1, "tvac_invalid_x", 1},
+                 {5.1, "tvac_invalid_", 1},
+                 {5.1, "Tvac_invalid_x", 0},
+                 {5.1, "tvac_invalid", 0}};
+    for (const auto& [offset, key, drafts] : cases) {
+        device.preferences.remove(kLastRun, "com.vandra.tamblo.zrreporting");
+        arm();
+        EXPECT_EQ(draftsOf(offset, key), drafts) << offset << ' ' << key;
+        EXPECT_EQ(lastRun(), drafts == 0 ? Value("none") : Value(1772366400.5)) << key;
+    }
+}
+
+TEST_F(QuilletWorkerTest, DraftsOnceInARunAndOnceInABackOffPeriod) {
+    arm();
+    EXPECT_EQ(draftsOf(6.0), 1U);
+    EXPECT_EQ(draftsOf(7.0), 0U);
+    const auto& [draft, process, reason, completion] = device.bugReportDrafting.requests.front();
+    EXPECT_EQ(process, "caller");
+    completion("no disk");
+    worker->stop();
+    EXPECT_THAT(logged(ZRReportingSessionCategory()),
+                ElementsAre("s Starting quillet for TalvixXYerrorMessage reporterID=5",
+                            "e Error creating draft - no disk"));
+    device.clock.advance(60'499ms);
+    EXPECT_EQ(draftsOf(70.0), 0U);
+    device.clock.advance(1ms);
+    EXPECT_EQ(draftsOf(70.0), 1U);
+}
+
+TEST_F(QuilletWorkerTest, DraftsEvenWhenTheTimeCannotBeStoredOrTheSessionIsGone) {
+    prefer("TalvixInvalidXyBackOffSeconds", 0);
+    prefer(kLastRun, Array{1});
+    device.preferences.writeFailure = "disk full";
+    arm();
+    session.reset();
+    // Without a period, a run still has one draft; each message of interest moves the time on.
+    for (const std::size_t drafts : {1U, 0U}) {
+        device.clock.advance(1s);
+        EXPECT_EQ(draftsOf(6.0), drafts);
+        EXPECT_EQ(lastRun(), Value(device.clock.seconds()));
+    }
+    EXPECT_EQ(device.bugReportDrafting.requests.front().processName, "");
+    EXPECT_EQ(loggedLevels(ZRReportingSessionCategory()), "iees")
+        << "the session's end, the rubbish, the disk, the draft";
+}
+
+class DPWorkerTest : public CaptureTest {
+protected:
+    DPWorkerTest() { prefer("enable_stackburst", "YES"); }
+    using Worker = ZRReportingSessionDPWorker;
+
+    /// Whether an overload with these is captured.
+    bool isCaptured(Worker& worker, const Dictionary& payload, AudioEventType type = 6,
+                    AudioEventCategory category = 7) {
+        const std::size_t before = device.diagnosticCapture.requests.size();
+        worker.handleMessage(messageOf(payload, category, type));
+        return device.diagnosticCapture.requests.size() != before;
+    }
+
+    const Dictionary overload{{kSize, 512}, {kCycle, 3}};
+};
+
+TEST_F(DPWorkerTest, CapturesOverloadsOfLargeBuffersAndCycles) {
+    EXPECT_FALSE(isCaptured(*tryToMake<Worker>(), overload, 6, 0x08000007));
+    EXPECT_FALSE(isCaptured(*tryToMake<Worker>(), overload, 5, 7));
+    const struct {
+        Value leastSize; ///< preferences
+        Value leastCycle;
+        Dictionary payload;
+        bool isCaptured;
+    } cases[] = {
+        {0, 0, {{kSize, 511}}, false},
+        {0, 0, {{kSize, 512}}, true},
+        {"64", 0, {{kSize, 63.9}}, false},
+        {"64", 0, {{kSize, "64"}}, true},
+        {-1, 0, {}, true},
+        {1, 0, {}, false},
+        {std::int64_t{1} << 40, 0, {{kSize, INT32_MAX}}, true},
+        {1, 0, {{kSize, std::int64_t{1} << 32}}, true},
+        {1, 3, {{kSize, 1}, {kCycle, 2}}, false},
+        {1, 3, {{kSize, 1}, {kCycle, 3}}, true},
+        {1, 3, {{kSize, 1}}, false},
+        {1, -1, {{kSize, 1}, {kCycle, -2}}, false},
+    };
+    for (const auto& [leastSize, leastCycle, payload, isToBeCaptured] : cases) {
+        prefer("io_buffer_size", leastSize);
+        prefer("io_cycle", leastCycle);
+        EXPECT_EQ(isCaptured(*tryToMake<Worker>(), payload), isToBeCaptured)
+            << jsonText(leastSize) << jsonText(leastCycle) << jsonText(payload);
+    }
+}
+
+TEST_F(DPWorkerTest, RequestsTheCapturePostsItAndTheNextMoreThanTenSecondsLater) {
+    const auto worker = tryToMake<Worker>();
+    Dictionary payload = overload;
+    payload.set("HostApplicationDisplayID", "com.a");
+    EXPECT_TRUE(isCaptured(*worker, payload));
+    device.clock.advance(10s);
+    EXPECT_FALSE(isCaptured(*worker, overload));
+    EXPECT_TRUE(isCaptured(*tryToMake<Worker>(), overload)) << "each worker counts for itself";
+    device.clock.advance(500ms);
+    EXPECT_TRUE(isCaptured(*worker, overload));
+    const auto& requests = device.diagnosticCapture.requests;
+    EXPECT_EQ(requests[0].requester, "com.vandra.tamblo");
+    EXPECT_EQ(requests[0].captureType, "AudioOverloads");
+    EXPECT_EQ(requests[0].payload, payload);
+    EXPECT_THAT(requests[0].options, ElementsAre(1, 1, 0, 0, 0));
+    EXPECT_EQ(requests[0].reason, "com.a");
+    EXPECT_EQ(requests[1].reason, "(null)");
+    EXPECT_THAT(device.namedNotifications.posted, SizeIs(3));
+    EXPECT_EQ(device.namedNotifications.posted.front(), "com.vandra.tamblo.dropped-stackburst");
+}
+
+TEST_F(DPWorkerTest, TellsOfEveryOtherMessageWhenDebuggingAndElseCostsNothing) {
+    const auto worker = tryToMake<Worker>();
+    const auto message = messageOf({{kSize, 7.9}, {kCycle, std::int64_t{1} << 33}});
+    const std::string told = "Did not drop stackburst, right conditions not met: buffer size : 7, time diff";
+    worker->handleMessage(message);
+    EXPECT_THAT(device.log.texts(told), SizeIs(1));
+    setLogThreshold(LogLevel::info);
+    worker->handleMessage(message);
+    EXPECT_EQ(test::allocationsOf([&] { worker->handleMessage(message); }).blocks, 0U);
+    EXPECT_THAT(device.log.texts(told), SizeIs(1));
+}
+
+TEST_F(DPWorkerTest, WaitsAsLongAsWantedAndTheServerQueueMayThenBlock) {
+    const std::pair<Value, std::int64_t> cases[] = {{0.9, 0},
+                                                    {1, 1},
+                                                    {1'500'000.9, 1'500'000},
+                                                    {-1, 0},
+                                                    {4'294'967'295.0, 4'294'967'295},
+                                                    {4'294'967'296.0, 4'294'967'295},
+                                                    {std::nan(""), 0}};
+    for (const auto& [preference, microseconds] : cases) {
+        prefer("wait_time", preference);
+        const auto worker = tryToMake<Worker>();
+        const WallTime before = device.clock.now();
+        EXPECT_TRUE(isCaptured(*worker, overload));
+        EXPECT_EQ(device.clock.now() - before, std::chrono::microseconds(microseconds));
+        EXPECT_EQ(device.serverQueue().mayBlock, microseconds != 0) << microseconds;
+    }
+}
+
+TEST_F(DPWorkerTest, AValueOfTheWrongKindIsOneErrorLineUntilItChanges) {
+    const std::pair<Value, int> cases[] = {// 1: it is no number; 2: nor is it a flag
+                                           {" -.5", 0},
+                                           {"7 x", 0},
+                                           {"NO", 1},
+                                           {"true", 1},
+                                           {"", 2},
+                                           {Array{1}, 2},
+                                           {1.5, 0},
+                                           {"NO", 1},
+                                           {Dictionary{{"a", 1}}, 2},
+                                           {"-", 2},
+                                           {Value::date(1), 2},
+                                           {".x", 2}};
+    for (const auto& [value, faults] : cases) {
+        prefer("io_cycle", value);
+        prefer("enable_stackburst", value);
+        std::string told;
+        for (int reading = 0; reading < 2; ++reading) {
+            (void)logged(ZRReportingDPLogCategory());
+            EXPECT_EQ(Worker::getRunTimeDefaults("io_cycle"), value.integerValue());
+            EXPECT_EQ(Worker::getEnableFlag("enable_stackburst"), value.boolValue());
+            told += loggedLevels(ZRReportingDPLogCategory());
+        }
+        EXPECT_EQ(told, std::string("ee").substr(0, static_cast<std::size_t>(faults))) << jsonText(value);
+    }
+}
+
+} // namespace
+} // namespace tamblo

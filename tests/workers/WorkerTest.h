@@ -1,0 +1,84 @@
+#pragma once
+
+#include "tests/fakes/FakePlatform.h"
+#include "tests/fakes/Messages.h"
+#include "util/InternalBuild.h"
+#include "util/LogCategories.h"
+
+#include <gmock/gmock.h>
+
+#include <memory>
+#include <string>
+#include <string_view>
+#include <utility>
+#include <vector>
+
+#include <sys/types.h>
+
+namespace tamblo {
+
+inline constexpr pid_t kClient = 77;
+inline constexpr pid_t kOtherClient = 78;
+
+/// A device in memory and a session of two client processes on it. The one way for tests of workers to make
+/// sessions and workers.
+class WorkerTest : public testing::Test {
+protected:
+    explicit WorkerTest(LogLevel threshold = LogLevel::debug, bool isInternalBuild = false)
+        : device(threshold, isInternalBuild), session(makeSession()) {}
+
+    static std::shared_ptr<ZRReportingSession> makeSession(AudioServiceType type = AudioServiceTypeUnknown,
+                                                           const Dictionary& configuration = {},
+                                                           ReporterID reporterID = 5) {
+        auto made = ZRReportingSession::initWithID(reporterID, {kClient, kOtherClient});
+        made->setServiceType(type);
+        made->setClientProcessName("caller");
+        made->updateConfigurationWithContentsOfConfiguration(configuration);
+        return made;
+    }
+    /// A worker of the session that the session itself does not have.
+    template <typename Worker> std::shared_ptr<Worker> make() { return std::make_shared<Worker>(session); }
+    /// The same from the class's factory, null when it refuses.
+    template <typename Worker> std::shared_ptr<Worker> tryToMake() {
+        return std::static_pointer_cast<Worker>(Worker::initWithSession(session));
+    }
+    MessageRef send(Dictionary payload, AudioEventCategory category = AudioEventKindPlayback,
+                    AudioEventType type = AudioEventTypeGeneric) {
+        MessageRef message = messageOf(std::move(payload), category, type);
+        session->sendMessage(message);
+        return message;
+    }
+
+    void setInternalBuild(bool isInternal) {
+        device.deviceProperties.set("InternalBuild", isInternal);
+        forgetInternalBuild();
+    }
+    void setLogThreshold(LogLevel level) {
+        device.log.setThreshold(level);
+        forgetLogThresholds();
+    }
+    /// `L TEXT` of the category's lines above debug since the last call, `L` for the level's first letter.
+    std::vector<std::string> logged(const LogCategory& category) {
+        std::vector<std::string> texts;
+        for (const FakeLog::Line& line : device.log.lines()) {
+            if (line.category == category.code() && line.level != LogLevel::debug) {
+                texts.push_back("disef"[static_cast<std::size_t>(line.level)] + (" " + line.text));
+            }
+        }
+        device.log.clear();
+        return texts;
+    }
+    /// The first letters of those lines alone.
+    std::string loggedLevels(const LogCategory& category) {
+        std::string levels;
+        for (const std::string& line : logged(category)) {
+            levels += line.front();
+        }
+        return levels;
+    }
+
+    FakePlatform device;
+    std::shared_ptr<ZRReportingSession> session;
+};
+
+} // namespace tamblo
