@@ -1,38 +1,26 @@
 #include "tests/client/FakeService.h"
 
+#include "tests/Sockets.h"
 #include "wire/FrameSplitter.h"
 
 #include <chrono>
-#include <cstdlib>
-#include <cstring>
 
-#include <gtest/gtest.h>
 #include <poll.h>
 #include <sys/socket.h>
-#include <sys/un.h>
 #include <unistd.h>
 
 namespace tamblo::test {
 
 FakeService::FakeService(Handler handler) : handler_(std::move(handler)) {
-    char name[] = "/tmp/tamblo-client-XXXXXX";
-    directory_ = ::mkdtemp(name);
-    path_ = directory_ + "/socket";
     start();
 }
 
 FakeService::~FakeService() {
     stop();
-    ::rmdir(directory_.c_str());
 }
 
 void FakeService::start() {
-    sockaddr_un address{};
-    address.sun_family = AF_UNIX;
-    std::memcpy(address.sun_path, path_.data(), path_.size());
-    listener_ = ::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
-    ASSERT_EQ(::bind(listener_, reinterpret_cast<const sockaddr*>(&address), sizeof address), 0);
-    ASSERT_EQ(::listen(listener_, 8), 0);
+    listener_ = boundSocket(SOCK_STREAM, path_);
     isStopping_ = false;
     thread_ = std::thread([this] { run(); });
 }

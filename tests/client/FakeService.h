@@ -1,5 +1,6 @@
 #pragma once
 
+#include "tests/Files.h"
 #include "wire/Reply.h"
 #include "wire/Request.h"
 
@@ -47,8 +48,8 @@ private:
     [[nodiscard]] bool serve(Connection& connection);
 
     Handler handler_;
-    std::string directory_;
-    std::string path_;
+    TemporaryDirectory directory_;
+    const std::string path_ = directory_.path("socket");
     int listener_ = -1;
     std::atomic<bool> isStopping_{false};
     std::atomic<int> refusals_{0};

@@ -1,6 +1,7 @@
 #pragma once
 
 #include "platform/StructuredLog.h"
+#include "tests/Files.h"
 
 #include <gtest/gtest.h>
 
@@ -18,37 +19,6 @@
 #include <stdlib.h>
 
 namespace tamblo {
-
-/// A directory that goes away with its owner.
-class TemporaryDirectory {
-public:
-    TemporaryDirectory() {
-        std::string pattern = (std::filesystem::temp_directory_path() / "tamblo-test-XXXXXX").string();
-        path_ = ::mkdtemp(pattern.data());
-    }
-    ~TemporaryDirectory() {
-        std::error_code ignored;
-        std::filesystem::remove_all(path_, ignored);
-    }
-    TemporaryDirectory(const TemporaryDirectory&) = delete;
-    TemporaryDirectory& operator=(const TemporaryDirectory&) = delete;
-
-    [[nodiscard]] std::string path(const std::string& name = {}) const {
-        return name.empty() ? path_ : path_ + "/" + name;
-    }
-    void write(const std::string& name, const std::string& text) const {
-        std::ofstream(path(name), std::ios::binary) << text;
-    }
-    /// Nothing and an empty file read the same.
-    [[nodiscard]] std::string read(const std::string& name) const {
-        std::ostringstream text;
-        text << std::ifstream(path(name), std::ios::binary).rdbuf();
-        return text.str();
-    }
-
-private:
-    std::string path_;
-};
 
 [[nodiscard]] inline bool isReadable(int descriptor, int milliseconds = 2000) {
     pollfd question{descriptor, POLLIN, 0};

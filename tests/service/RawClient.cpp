@@ -1,12 +1,11 @@
 #include "tests/service/RawClient.h"
 
-#include "tests/service/ServiceProcess.h"
+#include "tests/Sockets.h"
 #include "wire/FrameSplitter.h"
 
 #include <array>
 
 #include <poll.h>
-#include <sys/socket.h>
 #include <unistd.h>
 
 namespace tamblo::test {
@@ -15,6 +14,13 @@ namespace {
 
 constexpr int kPatienceMilliseconds = 20'000;
 constexpr int kSilenceMilliseconds = 50;
+/// Above those that `call` gives.
+constexpr std::uint64_t kStartID = 1'000'000;
+
+bool isReadable(int socket, int milliseconds) {
+    pollfd descriptor{.fd = socket, .events = POLLIN, .revents = 0};
+    return ::poll(&descriptor, 1, milliseconds) == 1;
+}
 
 } // namespace
 
@@ -24,10 +30,6 @@ RawClient::RawClient(const std::string& socketPath)
     if (::connect(socket_, reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0) {
         close();
     }
-}
-
-RawClient::~RawClient() {
-    close();
 }
 
 void RawClient::close() {
@@ -70,12 +72,9 @@ std::optional<wire::Reply> RawClient::receive() {
                             received_.end() - static_cast<std::ptrdiff_t>(frames.rest().size()));
             return reply;
         }
-        pollfd descriptor{.fd = socket_, .events = POLLIN, .revents = 0};
-        if (::poll(&descriptor, 1, kPatienceMilliseconds) != 1) {
-            return std::nullopt;
-        }
         std::array<std::uint8_t, 65536> bytes;
-        const ssize_t count = ::recv(socket_, bytes.data(), bytes.size(), 0);
+        const ssize_t count =
+            isReadable(socket_, kPatienceMilliseconds) ? ::recv(socket_, bytes.data(), bytes.size(), 0) : 0;
         if (count <= 0) {
             return std::nullopt;
         }
@@ -83,30 +82,55 @@ std::optional<wire::Reply> RawClient::receive() {
     }
 }
 
+std::size_t RawClient::receiveAll(std::uint64_t leastID) {
+    std::size_t count = 0;
+    for (auto reply = receive(); reply; reply = receive()) {
+        count += reply->id >= leastID ? 1U : 0U;
+    }
+    return count;
+}
+
 std::optional<wire::Reply> RawClient::call(wire::Request request) {
     request.id = nextID_++;
     return send(request) ? receive() : std::nullopt;
 }
 
+std::optional<wire::Reply> RawClient::call(Method method, std::int64_t reporterID) {
+    return call(request(method, reporterID));
+}
+
+void RawClient::startSession(std::int64_t reporterID, std::uint16_t serviceType) {
+    call(Method::createReportingSession, reporterID);
+    wire::Request type = request(Method::setServiceType, reporterID);
+    type.serviceType = serviceType;
+    call(type);
+    wire::Request start = request(Method::startReportingSessionForID, reporterID);
+    start.id = kStartID + static_cast<std::uint64_t>(reporterID);
+    send(start);
+    // The start itself is not answered yet: what comes behind it shows that it has been carried out.
+    call(Method::reporterID, reporterID);
+}
+
+bool RawClient::stopSession(std::int64_t reporterID) {
+    const auto start = call(Method::stopReportingSessionForID, reporterID);
+    return start && start->id >= kStartID && receive();
+}
+
 bool RawClient::staysSilent() const {
-    pollfd descriptor{.fd = socket_, .events = POLLIN, .revents = 0};
-    return received_.empty() && ::poll(&descriptor, 1, kSilenceMilliseconds) == 0;
+    return received_.empty() && !isReadable(socket_, kSilenceMilliseconds);
 }
 
 bool RawClient::isClosedByService() {
     std::array<std::uint8_t, 65536> bytes;
-    for (;;) {
-        pollfd descriptor{.fd = socket_, .events = POLLIN, .revents = 0};
-        if (::poll(&descriptor, 1, kPatienceMilliseconds) != 1) {
-            return false;
-        }
+    while (isReadable(socket_, kPatienceMilliseconds)) {
         if (::recv(socket_, bytes.data(), bytes.size(), 0) <= 0) {
             return true;
         }
     }
+    return false;
 }
 
-wire::Request request(wire::Method method, std::int64_t reporterID) {
+wire::Request request(Method method, std::int64_t reporterID) {
     wire::Request request;
     request.method = method;
     request.reporterID = reporterID;
@@ -116,7 +140,7 @@ wire::Request request(wire::Method method, std::int64_t reporterID) {
 wire::Request message(Dictionary payload, std::vector<std::int64_t> reporterIDs, std::uint32_t category,
                       std::uint16_t type) {
     wire::Request request;
-    request.method = wire::Method::sendMessage;
+    request.method = Method::sendMessage;
     request.dictionary = std::move(payload);
     request.category = category;
     request.type = type;
@@ -124,16 +148,13 @@ wire::Request message(Dictionary payload, std::vector<std::int64_t> reporterIDs,
     return request;
 }
 
-void startSession(RawClient& client, std::int64_t reporterID, std::uint16_t serviceType) {
-    client.call(request(wire::Method::createReportingSession, reporterID));
-    wire::Request type = request(wire::Method::setServiceType, reporterID);
-    type.serviceType = serviceType;
-    client.call(type);
-    wire::Request start = request(wire::Method::startReportingSessionForID, reporterID);
-    start.id = 1'000'000 + static_cast<std::uint64_t>(reporterID);
-    client.send(start);
-    // The start itself is not answered yet: what comes behind it shows that it has been carried out.
-    client.call(request(wire::Method::reporterID, reporterID));
+std::string framesOf(wire::Request request, std::size_t count, std::uint64_t firstID) {
+    TextBuffer frames;
+    for (std::size_t i = 0; i < count; ++i) {
+        request.id = firstID + i;
+        (void)wire::appendRequestFrame(frames, request);
+    }
+    return std::string(frames.view());
 }
 
 } // namespace tamblo::test

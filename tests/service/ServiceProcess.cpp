@@ -1,17 +1,17 @@
 #include "tests/service/ServiceProcess.h"
 
+#include "tests/Sockets.h"
+
+#include <algorithm>
 #include <chrono>
 #include <csignal>
 #include <cstdio>
 #include <cstdlib>
-#include <fstream>
-#include <sstream>
 #include <stdexcept>
 #include <thread>
 
 #include <fcntl.h>
 #include <poll.h>
-#include <sys/socket.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -54,34 +54,6 @@ CommandResult run(const std::string& command) {
     return done;
 }
 
-sockaddr_un addressOf(const std::string& socketPath) {
-    sockaddr_un address{};
-    address.sun_family = AF_UNIX;
-    socketPath.copy(address.sun_path, sizeof address.sun_path - 1);
-    return address;
-}
-
-int boundSocket(int type, const std::string& path) {
-    const sockaddr_un address = addressOf(path);
-    const int socket = ::socket(AF_UNIX, type | SOCK_CLOEXEC, 0);
-    if (::bind(socket, reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0) {
-        throw std::runtime_error("cannot bind " + path);
-    }
-    return socket;
-}
-
-std::string readFile(const std::filesystem::path& path) {
-    std::ifstream file(path, std::ios::binary);
-    std::ostringstream text;
-    text << file.rdbuf();
-    return text.str();
-}
-
-void writeFile(const std::filesystem::path& path, std::string_view text) {
-    std::filesystem::create_directories(path.parent_path());
-    std::ofstream(path, std::ios::binary) << text;
-}
-
 bool eventually(const std::function<bool()>& condition) {
     const auto end = std::chrono::steady_clock::now() + kPatience;
     while (!condition()) {
@@ -93,41 +65,44 @@ bool eventually(const std::function<bool()>& condition) {
     return true;
 }
 
+std::size_t countOf(std::string_view part, std::string_view text) {
+    std::size_t count = 0;
+    for (std::size_t at = text.find(part); at != std::string_view::npos; at = text.find(part, at + 1)) {
+        ++count;
+    }
+    return count;
+}
+
 ServiceProcess::ServiceProcess() : ServiceProcess(Options()) {}
 
 ServiceProcess::ServiceProcess(Options options) : options_(std::move(options)) {
-    std::string name = (std::filesystem::temp_directory_path() / "tamblo-XXXXXX").string();
-    if (::mkdtemp(name.data()) == nullptr) {
-        throw std::runtime_error("no temporary directory");
+    if (options_.isInternalBuild) {
+        writeFile(directory() / "config/device-properties.json", R"({"InternalBuild": true})");
     }
-    directory_ = name;
+    for (const auto& [domain, values] : options_.preferences) {
+        writeFile(preferenceFile(domain), values);
+    }
     start();
 }
 
 ServiceProcess::~ServiceProcess() {
-    if (pid_ > 0) {
-        signal(SIGKILL);
-        (void)awaitEnd();
-    }
-    std::error_code ignored;
-    std::filesystem::permissions(logs(), std::filesystem::perms::owner_all, ignored);
-    std::filesystem::remove_all(directory_, ignored);
+    signal(SIGKILL);
+    (void)awaitEnd();
 }
 
 void ServiceProcess::start() {
-    const std::string errors = (directory_ / "stderr").string();
-    const ReadySocket ready(directory_ / "ready");
+    const ReadySocket ready(directory() / "ready");
     pid_ = ::fork();
     if (pid_ == 0) {
-        ::setenv("RUNTIME_DIRECTORY", (directory_ / "run").c_str(), 1);
-        ::setenv("CONFIGURATION_DIRECTORY", (directory_ / "config").c_str(), 1);
+        ::setenv("RUNTIME_DIRECTORY", runtimeDirectory().c_str(), 1);
+        ::setenv("CONFIGURATION_DIRECTORY", directory_.path("config").c_str(), 1);
         ::setenv("LOGS_DIRECTORY", logs().c_str(), 1);
-        ::setenv("NOTIFY_SOCKET", (directory_ / "ready").c_str(), 1);
+        ::setenv("NOTIFY_SOCKET", directory_.path("ready").c_str(), 1);
         ::unsetenv("TAMBLO_LOG");
         for (const auto& [name, value] : options_.environment) {
             ::setenv(name.c_str(), value.c_str(), 1);
         }
-        ::dup2(::open(errors.c_str(), O_WRONLY | O_CREAT | O_APPEND, 0600), STDERR_FILENO);
+        ::dup2(::open(directory_.path("stderr").c_str(), O_WRONLY | O_CREAT | O_APPEND, 0600), STDERR_FILENO);
         if (options_.beforeExec) {
             options_.beforeExec();
         }
@@ -140,12 +115,14 @@ void ServiceProcess::start() {
 }
 
 void ServiceProcess::signal(int number) const {
-    ::kill(pid_, number);
+    if (pid_ > 0) {
+        ::kill(pid_, number);
+    }
 }
 
 std::optional<int> ServiceProcess::awaitEnd() {
     int status = 0;
-    if (!eventually([this, &status] { return ::waitpid(pid_, &status, WNOHANG) == pid_; })) {
+    if (pid_ <= 0 || !eventually([this, &status] { return ::waitpid(pid_, &status, WNOHANG) == pid_; })) {
         return std::nullopt;
     }
     pid_ = -1;
@@ -158,38 +135,36 @@ std::optional<int> ServiceProcess::stop() {
 }
 
 std::string ServiceProcess::socketPath() const {
-    return (directory_ / "run" / "com.vandra.tamblo.reporting").string();
+    return runtimeDirectory() + "/com.vandra.tamblo.reporting";
 }
 
 std::filesystem::path ServiceProcess::preferenceFile(std::string_view domain) const {
-    return directory_ / "config" / "preferences" / (std::string(domain) + ".json");
+    return directory() / "config/preferences" / (std::string(domain) + ".json");
+}
+
+std::string ServiceProcess::tambloctlCommand(const std::string& arguments) const {
+    return "RUNTIME_DIRECTORY=" + runtimeDirectory() +
+           " CONFIGURATION_DIRECTORY=" + directory_.path("config") + " LOGS_DIRECTORY=" + logs().string() +
+           " timeout 20 " TAMBLOCTL_PATH " " + arguments;
+}
+
+CommandResult ServiceProcess::tambloctl(const std::string& arguments) const {
+    return run(tambloctlCommand(arguments) + " 2>&1");
 }
 
 std::string ServiceProcess::errorOutput() const {
-    return readFile(directory_ / "stderr");
+    return directory_.read("stderr");
 }
 
 bool ServiceProcess::awaitErrorOutput(std::string_view text) const {
     return eventually([this, text] { return errorOutput().find(text) != std::string::npos; });
 }
 
-std::vector<std::string> ServiceProcess::events() const {
-    std::vector<std::string> lines;
-    for (const char* const suffix : {".4", ".3", ".2", ".1", ""}) {
-        std::istringstream text(readFile(logs() / (std::string("analytics-events.jsonl") + suffix)));
-        for (std::string line; std::getline(text, line);) {
-            lines.push_back(line);
-        }
-    }
-    return lines;
-}
-
 std::size_t ServiceProcess::countEvents(std::string_view text) const {
-    std::size_t count = 0;
-    for (const std::string& line : events()) {
-        count += line.find(text) != std::string::npos ? 1U : 0U;
-    }
-    return count;
+    const auto lines = linesOf(logs() / "analytics-events.jsonl");
+    return static_cast<std::size_t>(
+        std::count_if(lines.begin(), lines.end(),
+                      [text](const std::string& line) { return line.find(text) != std::string::npos; }));
 }
 
 } // namespace tamblo::test

@@ -1,33 +1,37 @@
+#include "tests/Sockets.h"
 #include "tests/service/RawClient.h"
 #include "tests/service/ServiceProcess.h"
 
-#include <gtest/gtest.h>
+#include <gmock/gmock.h>
 
+#include <algorithm>
 #include <csignal>
 #include <string>
 
 #include <fcntl.h>
-#include <sys/socket.h>
+#include <sys/file.h>
+#include <sys/stat.h>
+#include <unistd.h>
 
-// What one client sees of a running service, and what lies on the disk afterwards.
+// How the service begins and ends, what one client sees of it, and what lies on the disk afterwards.
 
 namespace tamblo::test {
 namespace {
 
-using wire::Method;
+using testing::HasSubstr;
 
 TEST(Service, MessageOfAStartedSessionBecomesTwoEvents) {
     ServiceProcess service;
     RawClient client(service.socketPath());
-    EXPECT_EQ(client.call(request(Method::createReportingSession, 7))->result, Value(true));
+    EXPECT_EQ(client.call(Method::createReportingSession, 7)->result, Value(true));
     wire::Request type = request(Method::setServiceType, 7);
     type.serviceType = 7;
     EXPECT_EQ(client.call(type)->result, Value(true));
     wire::Request configuration = request(Method::setConfiguration, 7);
     configuration.dictionary = {{"HostApplicationDisplayID", "com.example.music"}};
     EXPECT_EQ(client.call(configuration)->result, Value(true));
-    EXPECT_EQ(client.call(request(Method::getServiceNameForReporterID, 7))->result, Value(7));
-    EXPECT_EQ(client.call(request(Method::getAllReporters))->result, Value(Array{7}));
+    EXPECT_EQ(client.call(Method::getServiceNameForReporterID, 7)->result, Value(7));
+    EXPECT_EQ(client.call(Method::getAllReporters)->result, Value(Array{7}));
 
     wire::Request start = request(Method::startReportingSessionForID, 7);
     start.id = 77;
@@ -49,33 +53,44 @@ TEST(Service, MessageOfAStartedSessionBecomesTwoEvents) {
     EXPECT_EQ(service.countEvents("Playback.Start"), 2U);
 
     // The stop answers the held start first.
-    wire::Request stop = request(Method::stopReportingSessionForID, 7);
-    const auto held = client.call(stop);
+    const auto held = client.call(Method::stopReportingSessionForID, 7);
     EXPECT_EQ(held->id, 77U);
     EXPECT_EQ(held->result, Value(true));
     EXPECT_EQ(client.receive()->result, Value(true));
-    EXPECT_EQ(client.call(request(Method::destroyReportingSession, 7))->result, Value(true));
-    EXPECT_EQ(client.call(request(Method::getServiceNameForReporterID, 7))->result, Value(65535));
+    EXPECT_EQ(client.call(Method::destroyReportingSession, 7)->result, Value(true));
+    EXPECT_EQ(client.call(Method::getServiceNameForReporterID, 7)->result, Value(65535));
 }
 
 TEST(Service, WhatIsAnsweredSurvivesAKill) {
-    ServiceProcess service;
-    RawClient client(service.socketPath());
-    startSession(client, 7);
-    for (int i = 0; i < 100; ++i) {
-        ASSERT_TRUE(client.call(message({{"n", i}}, {7})));
+    ServiceProcess service({.environment = {{"TAMBLO_LOG", "error"}}});
+    std::string frames;
+    for (int i = 0; i < 400; ++i) {
+        frames += framesOf(message({{"n", i}}), 1, 1);
     }
-    service.signal(SIGKILL);
-    EXPECT_EQ(service.awaitEnd(), -SIGKILL);
-    EXPECT_EQ(service.countEvents("Playback.Start"), 200U);
+    // One is answered, then ever more of those that follow at once, before the kill.
+    for (const std::size_t awaited : {0, 1, 2, 3, 10, 30, 64, 100, 200, 400}) {
+        const std::size_t before = service.countEvents("Playback.Start");
+        RawClient client(service.socketPath());
+        client.startSession();
+        EXPECT_TRUE(client.call(message({{"n", 1}})));
+        client.sendBytes(frames);
+        for (std::size_t i = 0; i < awaited; ++i) {
+            ASSERT_TRUE(client.receive());
+        }
+        service.signal(SIGKILL);
+        EXPECT_EQ(service.awaitEnd(), -SIGKILL);
+        const std::size_t answered = 1 + awaited + client.receiveAll();
+        EXPECT_GE(service.countEvents("Playback.Start") - before, 2 * answered);
+        service.start();
+    }
 }
 
 TEST(Service, EndsAsAskedTo) {
     ServiceProcess service;
     {
         RawClient client(service.socketPath());
-        startSession(client, 7);
-        client.send(message({{"last", true}}, {7}));
+        client.startSession();
+        client.send(message({{"last", true}}));
         EXPECT_EQ(service.stop(), 0);
         EXPECT_TRUE(client.isClosedByService());
     }
@@ -84,46 +99,39 @@ TEST(Service, EndsAsAskedTo) {
     EXPECT_EQ(service.countEvents("zrreportingclientuptime"), 1U);
 
     service.start();
-    RawClient killer(service.socketPath());
-    killer.send(request(Method::killService));
+    RawClient(service.socketPath()).send(request(Method::killService));
     EXPECT_EQ(service.awaitEnd(), 2);
-    EXPECT_NE(service.errorOutput().find("DESTROYING SERVICE"), std::string::npos);
+    EXPECT_THAT(service.errorOutput(), HasSubstr("DESTROYING SERVICE"));
     // The socket that the killed service left behind is replaced.
     service.start();
-    EXPECT_TRUE(RawClient(service.socketPath()).call(request(Method::getAllReporters)));
+    EXPECT_TRUE(RawClient(service.socketPath()).call(Method::getAllReporters));
 
     // A second signal ends it at once, without a word about its clients.
-    service.signal(SIGSTOP);
-    service.signal(SIGTERM);
-    service.signal(SIGINT);
-    service.signal(SIGCONT);
+    const auto leavers = [&service] { return service.countEvents("zrreportingclientuptime"); };
+    EXPECT_TRUE(eventually([&] { return leavers() == 2; }));
+    RawClient client(service.socketPath());
+    client.startSession();
+    for (const int signal : {SIGSTOP, SIGTERM, SIGINT, SIGCONT}) {
+        service.signal(signal);
+    }
     EXPECT_EQ(service.awaitEnd(), 0);
-    EXPECT_EQ(service.countEvents("zrreportingclientuptime"), 1U);
+    EXPECT_EQ(leavers(), 2U);
 }
 
 TEST(Service, WhatIsAnsweredAtItsEndIsInTheFile) {
     ServiceProcess service;
     RawClient before(service.socketPath()), after(service.socketPath());
-    startSession(before, 7);
-    startSession(after, 8);
-    wire::Request last = message({{"last", true}}, {7});
-    ASSERT_TRUE(before.call(last));
-    last.id = 5;
-    last.dictionary.set("n", 2);
+    before.startSession(7);
+    after.startSession(8);
+    ASSERT_TRUE(before.call(message({{"last", true}})));
     // Two more messages and the signal between them wait for the same wake-up.
     service.signal(SIGSTOP);
-    before.send(last);
+    before.sendBytes(framesOf(message({{"last", true}, {"n", 2}}, {7}), 1, 2'000'000));
     service.signal(SIGTERM);
-    last.reporterIDs = {8};
-    after.send(last);
+    after.sendBytes(framesOf(message({{"last", true}, {"n", 2}}, {8}), 1, 2'000'000));
     service.signal(SIGCONT);
     EXPECT_EQ(service.awaitEnd(), 0);
-    std::size_t answered = 1;
-    for (RawClient* client : {&before, &after}) {
-        for (auto reply = client->receive(); reply; reply = client->receive()) {
-            answered += reply->id == 5 ? 1U : 0U;
-        }
-    }
+    const std::size_t answered = 1 + before.receiveAll(2'000'000) + after.receiveAll(2'000'000);
     EXPECT_EQ(service.countEvents("\"last\":true"), 2 * answered);
 }
 
@@ -131,8 +139,8 @@ TEST(Service, ClientThatLeavesIsReportedOnce) {
     ServiceProcess service;
     {
         RawClient client(service.socketPath());
-        startSession(client, 7);
-        client.send(message({{"n", 1}}, {7}));
+        client.startSession();
+        client.send(message({{"n", 1}}));
         // What was sent before the end, within a frame, is answered to who still listens.
         wire::Request reporters = request(Method::getAllReporters);
         reporters.id = 5;
@@ -144,16 +152,16 @@ TEST(Service, ClientThatLeavesIsReportedOnce) {
     }
     EXPECT_TRUE(eventually([&] { return service.countEvents("zrreportingclientuptime") == 1; }));
     RawClient other(service.socketPath());
-    EXPECT_EQ(other.call(request(Method::getAllReporters))->result, Value(Array{}));
+    EXPECT_EQ(other.call(Method::getAllReporters)->result, Value(Array{}));
     EXPECT_EQ(service.countEvents("\"n\":1"), 2U);
     EXPECT_EQ(service.countEvents("zrreportingclientuptime"), 1U);
 }
 
 TEST(Service, WhatKeepsItFromStartingIsOneClearLine) {
     ServiceProcess first;
-    const std::string longPath = (std::filesystem::temp_directory_path() / std::string(90, 'x')).string();
-    const std::string taken = (std::filesystem::temp_directory_path() / "tamblo-taken").string();
-    writeFile(taken + "/com.vandra.tamblo.reporting", "somebody's");
+    const TemporaryDirectory directory;
+    const std::string taken = directory.path("taken/com.vandra.tamblo.reporting");
+    writeFile(taken, "somebody's");
     const auto activateWithoutSocket = [] {
         ::setenv("LISTEN_PID", std::to_string(::getpid()).c_str(), 1);
         ::setenv("LISTEN_FDS", "1", 1);
@@ -161,40 +169,39 @@ TEST(Service, WhatKeepsItFromStartingIsOneClearLine) {
     const struct {
         std::string runtimeDirectory;
         std::string mentions;
-        std::function<void()> beforeExec;
+        std::function<void()> beforeExec{};
     } cases[] = {
-        {"/proc/tamblo", "/proc/tamblo", {}},
-        {longPath, "too long", {}},
-        {taken, "no socket: remove it", {}},
-        {taken, "file descriptor 3", activateWithoutSocket},
-        {first.directory() / "run", "already answers at " + first.socketPath(), {}},
+        {"/proc/tamblo", "/proc/tamblo"},
+        {directory.path(std::string(90, 'x')), "too long"},
+        {directory.path("taken"), "no socket: remove it"},
+        {directory.path("taken"), "file descriptor 3", activateWithoutSocket},
+        {first.runtimeDirectory(), "already answers at " + first.socketPath()},
     };
     for (const auto& hindrance : cases) {
         ServiceProcess service({.environment = {{"RUNTIME_DIRECTORY", hindrance.runtimeDirectory}},
                                 .beforeExec = hindrance.beforeExec,
                                 .awaitsReady = false});
         EXPECT_EQ(service.awaitEnd(), 1) << hindrance.mentions;
-        const std::string said = service.errorOutput();
-        EXPECT_NE(said.find(hindrance.mentions), std::string::npos) << said;
-        EXPECT_EQ(std::count(said.begin(), said.end(), '\n'), 1) << said;
+        EXPECT_THAT(service.errorOutput(), HasSubstr(hindrance.mentions));
+        EXPECT_EQ(countOf("\n", service.errorOutput()), 1U) << service.errorOutput();
     }
-    EXPECT_TRUE(RawClient(first.socketPath()).call(request(Method::getAllReporters)));
-    EXPECT_EQ(readFile(taken + "/com.vandra.tamblo.reporting"), "somebody's");
-    std::filesystem::remove_all(taken);
-    std::filesystem::remove_all(longPath);
+    EXPECT_TRUE(RawClient(first.socketPath()).call(Method::getAllReporters));
+    EXPECT_EQ(contentOf(taken), "somebody's");
 }
 
 TEST(Service, TakesOverAnActivatedSocketAndTellsItsManager) {
-    std::string directory = (std::filesystem::temp_directory_path() / "tamblo-act-XXXXXX").string();
-    ASSERT_NE(::mkdtemp(directory.data()), nullptr);
-    const std::string path = directory + "/activated";
+    const TemporaryDirectory directory;
+    const std::string path = directory.path("activated");
     const int listening = boundSocket(SOCK_STREAM, path);
-    ASSERT_EQ(::listen(listening, 8), 0);
-    const int manager = boundSocket(SOCK_DGRAM, directory + "/notify");
+    const int manager = boundSocket(SOCK_DGRAM, directory.path("notify"));
+    const auto told = [manager] {
+        char text[64] = {};
+        EXPECT_GT(::recv(manager, text, sizeof text - 1, 0), 0);
+        return std::string(text);
+    };
     // A client may connect before the service runs.
     RawClient early(path);
-
-    ServiceProcess service({.environment = {{"NOTIFY_SOCKET", directory + "/notify"}},
+    ServiceProcess service({.environment = {{"NOTIFY_SOCKET", directory.path("notify")}},
                             .beforeExec =
                                 [listening] {
                                     ::dup2(listening, 3);
@@ -203,54 +210,74 @@ TEST(Service, TakesOverAnActivatedSocketAndTellsItsManager) {
                                     ::setenv("LISTEN_FDS", "1", 1);
                                 },
                             .awaitsReady = false});
-    EXPECT_TRUE(early.call(request(Method::getAllReporters)));
+    EXPECT_TRUE(early.call(Method::getAllReporters));
     EXPECT_FALSE(std::filesystem::exists(service.socketPath()));
-    std::array<char, 64> told{};
-    EXPECT_GT(::recv(manager, told.data(), told.size(), 0), 0);
-    EXPECT_STREQ(told.data(), "READY=1");
+    EXPECT_EQ(told(), "READY=1");
     EXPECT_EQ(service.stop(), 0);
-    told.fill(0);
-    EXPECT_GT(::recv(manager, told.data(), told.size(), 0), 0);
-    EXPECT_STREQ(told.data(), "STOPPING=1");
+    EXPECT_EQ(told(), "STOPPING=1");
     EXPECT_TRUE(std::filesystem::exists(path));
     ::close(listening);
     ::close(manager);
-    std::filesystem::remove_all(directory);
 }
 
-TEST(Service, PreferenceIsInForceForTheNextMessage) {
-    ServiceProcess service;
-    const auto preferences = service.preferenceFile("com.vandra.tamblo.analytics");
-    RawClient client(service.socketPath());
-    startSession(client, 7);
-    writeFile(preferences, R"({"events_in_use": ["com.vandra.telephony.*"]})");
-    client.call(message({{"n", 1}}, {7}));
-    EXPECT_EQ(service.countEvents("Playback.Start"), 1U);
-    std::filesystem::remove(preferences);
-    client.call(message({{"n", 2}}, {7}));
-    EXPECT_EQ(service.countEvents("Playback.Start"), 3U);
+TEST(Service, SocketIsForAllWhoMayEnterItsDirectoryAndNotItsSuccessors) {
+    ServiceProcess service({.beforeExec = [] { ::umask(077); }});
+    const auto modeOf = [](const std::string& path) {
+        return static_cast<int>(std::filesystem::status(path).permissions());
+    };
+    EXPECT_EQ(modeOf(service.socketPath()), 0666);
+    EXPECT_EQ(modeOf(service.runtimeDirectory()), 0700);
+
+    std::filesystem::remove(service.socketPath());
+    const ServiceProcess successor({.environment = {{"RUNTIME_DIRECTORY", service.runtimeDirectory()}}});
+    EXPECT_EQ(service.stop(), 0);
+    EXPECT_TRUE(RawClient(service.socketPath()).call(Method::getAllReporters));
+}
+
+TEST(Service, OfTwoThatStartAtOnceOneServes) {
+    ServiceProcess before;
+    before.signal(SIGKILL);
+    EXPECT_EQ(before.awaitEnd(), -SIGKILL);
+    // Whoever takes the left-over socket for theirs to replace takes turns.
+    const int directory = ::open(before.runtimeDirectory().c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC);
+    ASSERT_EQ(::flock(directory, LOCK_EX), 0);
+    const ServiceProcess::Options options{
+        .environment = {{"RUNTIME_DIRECTORY", before.runtimeDirectory()}, {"TAMBLO_LOG", "error"}},
+        .awaitsReady = false};
+    ServiceProcess one(options), other(options);
+    EXPECT_TRUE(eventually([&] {
+        const std::string locks = contentOf("/proc/locks");
+        return std::ranges::all_of(std::array{one.pid(), other.pid()}, [&locks](pid_t process) {
+            return locks.find("-> FLOCK  ADVISORY  WRITE " + std::to_string(process)) != std::string::npos;
+        });
+    })) << contentOf("/proc/locks");
+    ::close(directory);
+    EXPECT_TRUE(eventually([&] { return !(one.errorOutput() + other.errorOutput()).empty(); }));
+    ServiceProcess& loser = one.errorOutput().empty() ? other : one;
+    ServiceProcess& winner = &loser == &one ? other : one;
+    EXPECT_EQ(loser.awaitEnd(), 1);
+    EXPECT_THAT(loser.errorOutput(), HasSubstr("another tamblod already answers"));
+    EXPECT_TRUE(RawClient(before.socketPath()).call(Method::getAllReporters));
+    EXPECT_EQ(winner.stop(), 0);
 }
 
 TEST(Service, SleepsWhenThereIsNothingToDo) {
     ServiceProcess service;
     {
         RawClient client(service.socketPath());
-        startSession(client, 7);
-        client.call(message({{"n", 1}}, {7}));
-        client.call(request(Method::stopReportingSessionForID, 7));
+        client.startSession();
+        client.call(message({{"n", 1}}));
+        EXPECT_TRUE(client.stopSession());
     }
     const std::filesystem::path process = "/proc/" + std::to_string(service.pid());
     const auto wakeUps = [&process] {
-        const std::string status = readFile(process / "status");
+        const std::string status = contentOf(process / "status");
         return std::stoul(status.substr(status.find("\nvoluntary_ctxt_switches:") + 26));
     };
     // The pool's threads end after some idle seconds; then nothing moves any more.
-    EXPECT_TRUE(eventually([&process] {
-        using Tasks = std::filesystem::directory_iterator;
-        return std::distance(Tasks(process / "task"), Tasks()) == 1;
-    }));
+    EXPECT_TRUE(eventually([&process] { return entriesOf(process / "task") == 1; }));
     const std::size_t before = wakeUps();
-    ::usleep(1'000'000);
+    ::usleep(500'000);
     EXPECT_EQ(wakeUps(), before);
 }
 

@@ -1,0 +1,183 @@
+#include "tests/service/RawClient.h"
+#include "tests/service/ServiceProcess.h"
+
+#include <gmock/gmock.h>
+#include <nlohmann/json.hpp>
+
+#include <cstdio>
+#include <future>
+#include <string>
+#include <vector>
+
+// The real tambloctl: with a real service, with its files, and without either.
+
+namespace tamblo::test {
+namespace {
+
+using Json = nlohmann::json;
+using testing::HasSubstr;
+
+constexpr const char* kAnalytics = "com.vandra.tamblo.analytics";
+
+TEST(Tambloctl, ExitStatusSaysWhoWasWrong) {
+    ServiceProcess service;
+    RawClient client(service.socketPath());
+    client.startSession();
+    writeFile(service.preferenceFile("broken"), "{\"a\":");
+    struct Row {
+        const char* arguments;
+        int status;
+        const char* output;
+    };
+    const auto expectAll = [&service](std::initializer_list<Row> rows) {
+        for (const Row& row : rows) {
+            const CommandResult done = service.tambloctl(row.arguments);
+            EXPECT_EQ(done.status, row.status) << row.arguments << "\n" << done.output;
+            EXPECT_THAT(done.output, HasSubstr(row.output)) << row.arguments;
+        }
+    };
+    expectAll({
+        {"", 2, "usage: tambloctl COMMAND"},
+        {"help", 0, "usage: tambloctl COMMAND"},
+        {"help tail", 0, "usage: tambloctl tail"},
+        {"nonsense", 2, "unknown command \"nonsense\""},
+        {"tail nothing", 1, "there is no "},
+        {"send --category Volume --reporter 7 n=5", 0, "sent"},
+        {"send --category Nope", 2, "--category needs"},
+        {"send --category Volume --bogus", 2, "--bogus"},
+        {"tail --lines 1", 0, "Z com.vandra.tamblo.zrreportingclientuptime {\"processName\":\"tambloctl\","},
+        {"tail --summary", 0, "  in all\n"},
+        {"tail --lines x", 2, "--lines needs a number"},
+        {"reporters", 0, "7 telephony\n"},
+        {"reporters 7", 2, "takes no arguments"},
+        {"validate 7", 0, "7 telephony\n"},
+        {"validate 99", 1, "99 is not a reporter"},
+        {"validate x", 2, "x"},
+        {"session --reporter 9 --quiet", 0, ""},
+        {"session", 2, "--reporter needs"},
+        {"notify com.example.news 0x10", 0, ""},
+        {"notify a/b", 2, "no notification name"},
+        {"preference set d key 5", 0, ""},
+        {"preference get d key", 0, "5\n"},
+        {"preference get d other", 1, "has no key \"other\""},
+        {"preference get broken", 1, "correct it by hand first"},
+        {"preference set broken a 1", 1, "correct it by hand first"},
+        {"preference lose d", 2, "preference needs"},
+        {"decode EAIaATMiAW4qA2NvbQ==", 0, "  issuetype: \"3\""},
+        {"decode '05000000 84 01 03 f6 f5'", 0, R"({"frame":"reply","id":3,"error":null,"result":true})"},
+        {"decode --kind=line EAIaATMiAW4qA2NvbQ==", 2, "tambloctl: line 1: not usable JSON: "},
+        {"decode --kind frames x", 2, "\"frames\" is no kind"},
+        {"decode '?'", 2, "not Base64\ntambloctl: it was taken for a record; --kind names another"},
+        {"decode < /dev/null", 2, "there is nothing to decode"},
+        {"decode a b", 2, "one text or one file"},
+        {"decode a --file b", 2, "one text or one file"},
+        {"decode --file /nowhere/x", 2, "cannot read /nowhere/x: No such file"},
+        {"kill now", 2, "takes no arguments"},
+        {"kill", 0, ""},
+    });
+    EXPECT_EQ(service.awaitEnd(), 2);
+    EXPECT_EQ(contentOf(service.runtimeDirectory() + "/notifications/com.example.news"), "16\n");
+    EXPECT_EQ(contentOf(service.preferenceFile("broken")), "{\"a\":");
+    EXPECT_THAT(run("printf '\\5\\0\\0\\0\\204\\1\\3\\366\\365' | " TAMBLOCTL_PATH " decode").output,
+                HasSubstr(R"({"frame":"reply","id":3,)"));
+    for (const char* command :
+         {"send --category Volume", "reporters", "validate 7", "session --reporter 9", "kill"}) {
+        const CommandResult done = service.tambloctl(std::string(command) + " --timeout 0");
+        EXPECT_EQ(done.status, 3) << command << "\n" << done.output;
+    }
+}
+
+TEST(Tambloctl, TailGoesOnThroughARotation) {
+    ServiceProcess service;
+    service.stop();
+    const auto file = service.logs() / "power-events.jsonl";
+    const auto line = [](int n) {
+        return R"({"time":1.5,"subsystem":28,"event":"e","payload":{"n":)" + std::to_string(n) + "}}\n";
+    };
+    writeFile(file, line(1) + line(2) + line(3));
+    EXPECT_EQ(service.tambloctl("tail power-events --json --lines 2 --key n").output, line(2) + line(3));
+    EXPECT_EQ(service.tambloctl("tail power-events --lines 1").output,
+              R"(1970-01-01T00:00:01.500Z e {"payload":{"n":3},"subsystem":28})"
+              "\n");
+
+    std::FILE* const follower =
+        ::popen(service.tambloctlCommand("tail power-events --json --lines 1 --follow").c_str(), "r");
+    const auto next = [follower] {
+        char text[256] = {};
+        return std::string(std::fgets(text, sizeof text, follower) == nullptr ? "" : text);
+    };
+    EXPECT_EQ(next(), line(3));
+    writeFile(file, line(4), std::ios::app);
+    EXPECT_EQ(next(), line(4));
+    writeFile(file, line(5), std::ios::app);
+    std::filesystem::rename(file, file.string() + ".1");
+    writeFile(file, line(6));
+    EXPECT_EQ(next(), line(5));
+    EXPECT_EQ(next(), line(6));
+    EXPECT_EQ(WEXITSTATUS(::pclose(follower)), 0) << "it ends with its reader";
+}
+
+TEST(Tambloctl, PreferenceIsInForceForTheNextMessage) {
+    ServiceProcess service;
+    const std::string domain(kAnalytics);
+    const auto file = service.preferenceFile(domain);
+    RawClient client(service.socketPath());
+    client.startSession();
+    for (const char* act : {R"(set %s events_in_use '["com.vandra.telephony.*"]')", "set %s other text"}) {
+        std::string arguments = act;
+        arguments.replace(arguments.find("%s"), 2, domain);
+        EXPECT_EQ(service.tambloctl("preference " + arguments).status, 0);
+    }
+    EXPECT_EQ(contentOf(file), "{\"events_in_use\":[\"com.vandra.telephony.*\"],\"other\":\"text\"}\n");
+    client.call(message({{"n", 1}}));
+    EXPECT_EQ(service.countEvents("Playback.Start"), 1U);
+    EXPECT_EQ(service.tambloctl("preference unset " + domain + " events_in_use").status, 0);
+    EXPECT_EQ(contentOf(file), "{\"other\":\"text\"}\n");
+    client.call(message({{"n", 2}}));
+    EXPECT_EQ(service.countEvents("Playback.Start"), 3U);
+
+    // On a full disk the file stays as it is.
+    const std::string full = "trap '' XFSZ; ulimit -f 0; ";
+    EXPECT_EQ(run(full + service.tambloctlCommand("preference set " + domain + " a 1 2> /dev/null")).status,
+              1);
+    EXPECT_EQ(contentOf(file), "{\"other\":\"text\"}\n");
+    EXPECT_EQ(entriesOf(file.parent_path()), 1);
+}
+
+TEST(Tambloctl, ShowsTheSummariesOfTheSessionsItPlays) {
+    ServiceProcess service;
+    // Four sessions that stop at about the same time.
+    std::vector<std::future<CommandResult>> runs;
+    for (const char* number : {"1", "2", "3", "4"}) {
+        runs.push_back(std::async(
+            std::launch::async, run,
+            service.tambloctlCommand("session --json --fast --recorded-spacing --service-type telephony "
+                                     "--play " EXAMPLES_DIR "/call.jsonl --reporter " +
+                                     std::string(number) +
+                                     R"( --configuration '{"HostApplicationDisplayID":"application)" +
+                                     number + R"("}')")));
+    }
+    for (std::size_t i = 0; i < runs.size(); ++i) {
+        const Json report = Json::parse(runs[i].get().output);
+        std::string kinds;
+        for (const Json& summary : report["summaries"]) {
+            kinds += summary["event"].get<std::string>().substr(18, 1);
+            EXPECT_EQ(summary["payload"]["HostApplicationDisplayID"], "application" + std::to_string(i + 1));
+        }
+        EXPECT_EQ(kinds, "VVVVSII");
+        EXPECT_FALSE(report.contains("summaries_missing"));
+    }
+    const auto shown = [&service](const std::string& arguments) {
+        return service.tambloctl("session " + arguments).output;
+    };
+    EXPECT_THAT(shown("--reporter 5"), HasSubstr("\nsession  (com.vandra."));
+    EXPECT_EQ(shown("--reporter 6 --quiet"), "");
+    writeFile(service.preferenceFile(kAnalytics), R"({"events_in_use": []})");
+    EXPECT_THAT(shown("--reporter 8"), HasSubstr("no summaries: none came to "));
+    std::filesystem::remove(service.logs() / "analytics-events.jsonl");
+    EXPECT_THAT(shown("--reporter 7"), HasSubstr("no summaries: cannot read " + service.logs().string() +
+                                                 "/analytics-events.jsonl"));
+}
+
+} // namespace
+} // namespace tamblo::test
