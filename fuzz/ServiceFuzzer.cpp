@@ -4,7 +4,6 @@
 
 #include "platform/linux/connections/RequestDispatch.h"
 #include "service/ZRReportingService.h"
-#include "system/ZRReportingSystemMonitor.h"
 #include "tests/fakes/FakePlatform.h"
 #include "wire/FrameSplitter.h"
 
@@ -75,7 +74,7 @@ void feed(FakePlatform& device, FakeClientConnection& connection, std::span<cons
 extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* bytes, std::size_t size) {
     using namespace tamblo;
     FakePlatform device(LogLevel::error, size % 2 == 0);
-    ZRReportingService service([](int) {});
+    ZRReportingService service(device.context(), [](int) {});
     ConnectionListener& listener = device.connections.listenerForServiceName("fuzzed");
     listener.setDelegate(service);
     listener.resume();
@@ -88,6 +87,5 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* bytes, std::size_t siz
     connection->invalidate();
     device.serverQueue().runAll();
     demand(service.getAllClients().empty());
-    ZRReportingSystemMonitor::reset(); // made with the service, on this device
     return 0;
 }

@@ -23,38 +23,46 @@
 #include "platform/TracePoints.h"
 #include "platform/WorkQueue.h"
 
+#include <memory>
+#include <utility>
+
 namespace tamblo {
 
-/// The services that the system finds on the device, one of each. Installed once, before anything else runs,
-/// and alive until the process ends; a test installs its fakes the same way.
+/// The services that the system finds on the device, one of each; owned by `main`, or by a test's fixture.
+/// All are there before anything uses one. In the order in which they may need each other: the last goes
+/// first, and while the work queues go, what was posted may still use all others.
 struct Platform {
-    Clock& clock;
-    WorkQueues& workQueues;
-    StructuredLog& log;
-    TracePoints& tracePoints;
-    DeviceProperties& deviceProperties;
-    Preferences& preferences;
-    NamedNotifications& namedNotifications;
-    ProcessInformation& processInformation;
-    DeviceConditions& deviceConditions;
-    AnalyticsEventService& analyticsEvents;
-    PowerEventLog& powerEvents;
-    DiagnosticsMetricsService& diagnosticsMetrics;
-    CallQualityService& callQuality;
-    ReportFiles& reportFiles;
-    BugCaptureService& bugCapture;
-    BugReportDraftingService& bugReportDrafting;
-    DiagnosticCaptureService& diagnosticCapture;
-    MemoryLog& memoryLog;
-    ChanlogFacility& chanlog;
-    ProcessSampling& processSampling;
-    Accessories& accessories;
-    ConnectionService& connections;
+    std::unique_ptr<StructuredLog> log;
+    std::unique_ptr<Clock> clock;
+    std::unique_ptr<TracePoints> tracePoints;
+    std::unique_ptr<ProcessInformation> processInformation;
+    std::unique_ptr<DeviceConditions> deviceConditions;
+    std::unique_ptr<NamedNotifications> namedNotifications;
+    std::unique_ptr<DeviceProperties> deviceProperties;
+    std::unique_ptr<Preferences> preferences;
+    std::unique_ptr<AnalyticsEventService> analyticsEvents;
+    std::unique_ptr<PowerEventLog> powerEvents;
+    std::unique_ptr<DiagnosticsMetricsService> diagnosticsMetrics;
+    std::unique_ptr<CallQualityService> callQuality;
+    std::unique_ptr<ReportFiles> reportFiles;
+    std::unique_ptr<BugCaptureService> bugCapture;
+    std::unique_ptr<BugReportDraftingService> bugReportDrafting;
+    std::unique_ptr<MemoryLog> memoryLog;
+    std::unique_ptr<ChanlogFacility> chanlog;
+    std::unique_ptr<ProcessSampling> processSampling;
+    std::unique_ptr<Accessories> accessories;
+    std::unique_ptr<ConnectionService> connections;
+    std::unique_ptr<DiagnosticCaptureService> diagnosticCapture;
+    std::unique_ptr<WorkQueues> workQueues;
 };
 
-/// Makes these the platform of the process, in place of any before. Not while work runs.
-void installPlatform(const Platform& platform);
-/// The installed platform. Before one is installed there is none, and calling this is a fault.
-[[nodiscard]] const Platform& platform() noexcept;
+/// Makes a service in its place among the others; answers it as what it is, for those who wire it.
+template <typename Service, typename Interface, typename... Arguments>
+[[nodiscard]] Service& provide(std::unique_ptr<Interface>& place, Arguments&&... arguments) {
+    auto service = std::make_unique<Service>(std::forward<Arguments>(arguments)...);
+    Service& made = *service;
+    place = std::move(service);
+    return made;
+}
 
 } // namespace tamblo

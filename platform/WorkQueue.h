@@ -69,6 +69,9 @@ public:
     /// Makes the call once, after the delay, on some thread; it must not block.
     [[nodiscard]] virtual std::unique_ptr<DelayedCall> callAfter(std::chrono::milliseconds delay,
                                                                  UniqueFunction<void()> call) = 0;
+    /// Returns once everything that was posted has run, and what that has posted; calls whose time has not
+    /// come are called off. Not from a piece of work.
+    virtual void workOff() = 0;
 };
 
 } // namespace tamblo

@@ -1,6 +1,5 @@
 #include "service/ClientUptime.h"
 
-#include "platform/Platform.h"
 #include "service/ZRReportingClientServerInstance.h"
 #include "util/Log.h"
 
@@ -31,7 +30,8 @@ Value uptimeBetween(const std::optional<WallTime>& start, WallTime end, pid_t pr
 
 } // namespace
 
-void reportClientUptime(const ClientRef& client, pid_t processIdentifier, WallTime end) {
+void reportClientUptime(const Context& context, const ClientRef& client, pid_t processIdentifier,
+                        WallTime end) {
     if (client != nullptr && !client->claimUptimeReport()) {
         return;
     }
@@ -48,7 +48,7 @@ void reportClientUptime(const ClientRef& client, pid_t processIdentifier, WallTi
                       processIdentifier);
         return;
     }
-    platform().analyticsEvents.sendEventLazy("com.vandra.tamblo.zrreportingclientuptime", [&] {
+    context.platform().analyticsEvents->sendEventLazy("com.vandra.tamblo.zrreportingclientuptime", [&] {
         return Dictionary{{"processName", name}, {"seconds", uptime}};
     });
 }

@@ -1,6 +1,5 @@
 #include "service/SingleMessageSessionKeeper.h"
 
-#include "platform/Platform.h"
 #include "session/ZRReportingSession.h"
 #include "util/AudioEvents.h"
 #include "util/Log.h"
@@ -31,7 +30,7 @@ SingleMessageSessionKeeper::~SingleMessageSessionKeeper() {
 SessionRef SingleMessageSessionKeeper::create() {
     log::standard(ZRReportingServiceDelegateCategory(), "Creating singleMessageSession");
     SessionRef session = ZRReportingSession::initWithID(
-        kSingleMessageReporterID, {platform().processInformation.ownProcessIdentifier()});
+        context_, kSingleMessageReporterID, {context_.platform().processInformation->ownProcessIdentifier()});
     session->setIsSingleMessageSession(true);
     session->setServiceType(AudioServiceTypeStandalone);
     session->updateConfigurationWithContentsOfConfiguration({{ZRReportingApplicationName, "Unknown"}});
@@ -45,11 +44,11 @@ SessionRef SingleMessageSessionKeeper::retrieve() {
         singleMessageSession_ = create();
     }
     if (singleMessageSessionReaper_ == nullptr) {
-        singleMessageSessionReaper_ =
-            platform().workQueues.makeRepeatingTimer(kReaperInterval, [this] { reapSingleMessageSession(); });
+        singleMessageSessionReaper_ = context_.platform().workQueues->makeRepeatingTimer(
+            kReaperInterval, [this] { reapSingleMessageSession(); });
         singleMessageSessionReaper_->start();
     }
-    singleMessageSessionLastRetrieved_ = platform().clock.now();
+    singleMessageSessionLastRetrieved_ = context_.platform().clock->now();
     return singleMessageSession_;
 }
 
@@ -72,7 +71,7 @@ SessionRef SingleMessageSessionKeeper::takeIdleSession(std::unique_ptr<Repeating
         return nullptr;
     }
     const std::chrono::duration<double> elapsed =
-        platform().clock.now() - *singleMessageSessionLastRetrieved_;
+        context_.platform().clock->now() - *singleMessageSessionLastRetrieved_;
     if (!(kTimeout < elapsed)) {
         log::debug(ZRReportingServiceDelegateCategory(),
                    "Not stopping singleMessageSession. elapsed={} timeout={}", elapsed.count(),

@@ -3,6 +3,7 @@
 #include "platform/Clock.h"
 #include "platform/WorkQueue.h"
 #include "service/ZRReportingServiceDelegateProtocol.h"
+#include "util/Context.h"
 
 #include <chrono>
 #include <condition_variable>
@@ -20,7 +21,7 @@ namespace tamblo {
 /// wait for it.
 class SingleMessageSessionKeeper {
 public:
-    SingleMessageSessionKeeper() = default;
+    explicit SingleMessageSessionKeeper(Context& context) noexcept : context_(context) {}
     /// Drops the session unstopped; returns when the reaper is at rest.
     ~SingleMessageSessionKeeper();
     SingleMessageSessionKeeper(const SingleMessageSessionKeeper&) = delete;
@@ -39,12 +40,13 @@ private:
     static constexpr std::chrono::milliseconds kReaperInterval{500};
     static constexpr std::chrono::duration<double> kTimeout{5.0};
 
-    [[nodiscard]] static SessionRef create();
+    [[nodiscard]] SessionRef create();
     /// One tick of the reaper.
     void reapSingleMessageSession();
     /// The session, if it has been idle for too long; it and the reaper are gone from here then.
     [[nodiscard]] SessionRef takeIdleSession(std::unique_ptr<RepeatingTimer>& reaper);
 
+    Context& context_;
     mutable std::mutex mutex_;
     SessionRef singleMessageSession_;
     std::optional<WallTime> singleMessageSessionLastRetrieved_;

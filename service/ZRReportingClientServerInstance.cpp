@@ -2,9 +2,7 @@
 
 #include "session/ZRReportingSession.h"
 #include "util/AudioEvents.h"
-#include "util/InternalBuild.h"
 #include "util/Log.h"
-#include "util/ReportingServerQueue.h"
 #include "util/TraceEvents.h"
 
 #include <utility>
@@ -42,8 +40,8 @@ void appendText(std::string& out, const OptionalSession& optional) {
 } // namespace
 
 ZRReportingClientServerInstance::ZRReportingClientServerInstance(
-    pid_t processIdentifier, std::weak_ptr<ZRReportingServiceDelegateProtocol> delegate)
-    : processIdentifier_(processIdentifier), delegate_(std::move(delegate)) {
+    Context& context, pid_t processIdentifier, std::weak_ptr<ZRReportingServiceDelegateProtocol> delegate)
+    : context_(context), processIdentifier_(processIdentifier), delegate_(std::move(delegate)) {
     log::standard(ZRReportingServiceDelegateCategory(), "new client with pid {}", processIdentifier);
 }
 
@@ -54,7 +52,7 @@ ZRReportingClientServerInstance::~ZRReportingClientServerInstance() {
 
 template <typename Piece> void ZRReportingClientServerInstance::onServerQueue(Pace pace, Piece piece) {
     auto work = [client = shared_from_this(), piece = std::move(piece)]() mutable { piece(*client); };
-    ZRReportingUtilityGetReportingServerQueue().post(std::move(work), pace);
+    context_.serverQueue().post(std::move(work), pace);
 }
 
 void ZRReportingClientServerInstance::createReportingSession(ReporterID reporterID, BooleanReply reply) {
@@ -66,7 +64,7 @@ void ZRReportingClientServerInstance::createReportingSession(ReporterID reporter
 
 void ZRReportingClientServerInstance::performCreate(ReporterID reporterID) {
     log::debug(ZRReportingServiceDelegateCategory(), "creating session for reporter {}", reporterID);
-    emitTracePoint(TraceEvent::createReportingSession);
+    emitTracePoint(context_, TraceEvent::createReportingSession);
     storeSession(reporterID, makeSession(reporterID));
     log::standard(ZRReportingServiceDelegateCategory(), "session created for reporter {}", reporterID);
 }
@@ -138,7 +136,7 @@ void ZRReportingClientServerInstance::startReportingSessionForID(ReporterID repo
 
 void ZRReportingClientServerInstance::performStart(ReporterID reporterID, BooleanReply reply) {
     log::debug(ZRReportingServiceDelegateCategory(), "starting session for reporter {}", reporterID);
-    emitTracePoint(TraceEvent::startReportingSession);
+    emitTracePoint(context_, TraceEvent::startReportingSession);
     const SessionRef session = reporterID != 0 ? findReportingSessionForID(reporterID, false) : nullptr;
     if (session == nullptr) {
         answer(reply, true);
@@ -151,7 +149,7 @@ void ZRReportingClientServerInstance::performStart(ReporterID reporterID, Boolea
     sessionChanged(reporterID, session);
     BooleanReply earlier = session->takeTransactionCompleteBlock();
     answer(earlier, true);
-    if (session->serviceType() == AudioServiceTypeTest && ZRReportingUtilityIsInternalBuild()) {
+    if (session->serviceType() == AudioServiceTypeTest && context_.isInternalBuild()) {
         answer(reply, true);
     }
     session->setTransactionCompleteBlock(std::move(reply));
@@ -161,7 +159,7 @@ void ZRReportingClientServerInstance::performStart(ReporterID reporterID, Boolea
 void ZRReportingClientServerInstance::sendMessage(Dictionary message, std::uint32_t category,
                                                   std::uint16_t type, std::vector<ReporterID> reporterIDs,
                                                   ErrorReply reply) {
-    if (reporterIDs.empty() && ZRReportingUtilityIsInternalBuild() && isReportingEnabled()) {
+    if (reporterIDs.empty() && context_.isInternalBuild() && isReportingEnabled()) {
         message.set("sendSingleMessage", 1);
     }
     auto piece = [message = std::move(message), category, type, reporterIDs = std::move(reporterIDs),
@@ -179,7 +177,7 @@ void ZRReportingClientServerInstance::performSend(Dictionary message, std::uint3
                                                   ErrorReply reply) {
     log::debug(ZRReportingServiceDelegateCategory(), "sending message for reporter {}",
                NumberList{reporterIDs});
-    emitTracePoint(TraceEvent::sendMessageRequest);
+    emitTracePoint(context_, TraceEvent::sendMessageRequest);
     const Delegate delegate = delegate_.lock();
     if (delegate == nullptr || !delegate->isReportingEnabled()) {
         if (reply) {
@@ -212,7 +210,7 @@ void ZRReportingClientServerInstance::stopReportingSessionForID(ReporterID repor
 
 void ZRReportingClientServerInstance::performStop(ReporterID reporterID) {
     log::debug(ZRReportingServiceDelegateCategory(), "stopping session for reporter {}", reporterID);
-    emitTracePoint(TraceEvent::stopReportingSession);
+    emitTracePoint(context_, TraceEvent::stopReportingSession);
     if (reporterID == 0) {
         return;
     }
@@ -241,7 +239,7 @@ void ZRReportingClientServerInstance::destroyReportingSession(ReporterID reporte
 
 void ZRReportingClientServerInstance::performDestroy(ReporterID reporterID) {
     log::debug(ZRReportingServiceDelegateCategory(), "destroying session for reporter {}", reporterID);
-    emitTracePoint(TraceEvent::destroyReportingSession);
+    emitTracePoint(context_, TraceEvent::destroyReportingSession);
     if (reporterID == 0) {
         return;
     }
@@ -315,7 +313,7 @@ SessionRef ZRReportingClientServerInstance::findReportingSessionForID(ReporterID
 }
 
 SessionRef ZRReportingClientServerInstance::makeSession(ReporterID reporterID) const {
-    SessionRef session = ZRReportingSession::initWithID(reporterID, {processIdentifier_});
+    SessionRef session = ZRReportingSession::initWithID(context_, reporterID, {processIdentifier_});
     session->setClientProcessName(clientProcessName_);
     return session;
 }
@@ -326,7 +324,7 @@ void ZRReportingClientServerInstance::storeSession(ReporterID reporterID, Sessio
     sessionChanged(reporterID, place);
     if (replaced != nullptr && replaced->messages().size() > kManyMessages) {
         // Freed as a piece of work of its own, which may take its time.
-        ZRReportingUtilityGetReportingServerQueue().post([session = std::move(replaced)] {}, Pace::mayBlock);
+        context_.serverQueue().post([session = std::move(replaced)] {}, Pace::mayBlock);
     }
 }
 

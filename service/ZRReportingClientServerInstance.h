@@ -4,6 +4,7 @@
 #include "platform/WorkQueue.h"
 #include "platform/ZRReportingServiceProtocol.h"
 #include "service/ZRReportingServiceDelegateProtocol.h"
+#include "util/Context.h"
 
 #include <cstdint>
 #include <map>
@@ -28,7 +29,7 @@ class ZRReportingClientServerInstance final
 public:
     using SessionMap = std::map<ReporterID, SessionRef>;
 
-    ZRReportingClientServerInstance(pid_t processIdentifier,
+    ZRReportingClientServerInstance(Context& context, pid_t processIdentifier,
                                     std::weak_ptr<ZRReportingServiceDelegateProtocol> delegate);
     ~ZRReportingClientServerInstance() override;
     ZRReportingClientServerInstance(const ZRReportingClientServerInstance&) = delete;
@@ -94,6 +95,7 @@ private:
     void logReportingSessions() const;
     [[nodiscard]] bool isReportingEnabled() const noexcept;
 
+    Context& context_;
     const pid_t processIdentifier_;
     const std::weak_ptr<ZRReportingServiceDelegateProtocol> delegate_;
     std::optional<WallTime> clientStartDate_;

@@ -1,21 +1,19 @@
 #include "service/ZRReportingService.h"
 
-#include "platform/Platform.h"
 #include "service/ClientUptime.h"
 #include "service/ZRReportingClientServerInstance.h"
 #include "session/ZRReportingSession.h"
 #include "system/ZRReportingSystemMonitor.h"
 #include "util/Log.h"
-#include "util/ReportingServerQueue.h"
 
 #include <algorithm>
 #include <utility>
 
 namespace tamblo {
 
-ZRReportingService::ZRReportingService(ExitProcess exit)
-    : exitProcess_(exit), self_(this, [](ZRReportingService*) {}) {
-    ZRReportingSystemMonitor::initializeWithQueue(ZRReportingUtilityGetReportingServerQueue());
+ZRReportingService::ZRReportingService(Context& context, ExitProcess exit)
+    : context_(context), exitProcess_(exit), self_(this, [](ZRReportingService*) {}) {
+    ZRReportingSystemMonitor::initializeWithQueue(context, context.serverQueue());
 }
 
 ZRReportingService::~ZRReportingService() {
@@ -28,7 +26,7 @@ bool ZRReportingService::shouldAcceptNewConnection(ClientConnection& connection)
     if (ZRReportingServiceDelegateCategory().isOn(LogLevel::standard)) {
         log::standard(ZRReportingServiceDelegateCategory(), "newConnection: {}", connection.description());
     }
-    const auto client = std::make_shared<ZRReportingClientServerInstance>(processIdentifier, self_);
+    const auto client = std::make_shared<ZRReportingClientServerInstance>(context_, processIdentifier, self_);
     connection.setExportedObject(client);
     const auto addClientPiece = [service = std::weak_ptr(self_), client] {
         if (const auto held = service.lock()) {
@@ -36,7 +34,7 @@ bool ZRReportingService::shouldAcceptNewConnection(ClientConnection& connection)
         }
     };
     // The process's name is read from a file of the kernel's, which is memory.
-    ZRReportingUtilityGetReportingServerQueue().post(addClientPiece);
+    context_.serverQueue().post(addClientPiece);
     setHandlers(connection, client);
     connection.resume();
     return true;
@@ -50,26 +48,27 @@ void ZRReportingService::setHandlers(ClientConnection& connection, const ClientR
             held->handleConnectionError();
         }
     });
-    connection.setInvalidationHandler([weakClient, processIdentifier = client->processIdentifier()] {
-        const ClientRef held = weakClient.lock();
-        if (held != nullptr) {
-            held->handleConnectionError();
-        }
-        // The client's fields are the queue's to read; it is kept until they are. What the queue has to do
-        // before is none of the client's time.
-        ZRReportingUtilityGetReportingServerQueue().post(
-            [held, processIdentifier, end = platform().clock.now()] {
-                reportClientUptime(held, processIdentifier, end);
-            });
-    });
+    connection.setInvalidationHandler(
+        [&context = context_, weakClient, processIdentifier = client->processIdentifier()] {
+            const ClientRef held = weakClient.lock();
+            if (held != nullptr) {
+                held->handleConnectionError();
+            }
+            // The client's fields are the queue's to read; it is kept until they are. What the queue has to
+            // do before is none of the client's time.
+            context.serverQueue().post(
+                [&context, held, processIdentifier, end = context.platform().clock->now()] {
+                    reportClientUptime(context, held, processIdentifier, end);
+                });
+        });
 }
 
 void ZRReportingService::addClient(const ClientRef& client) {
     client->setAcceptanceOrder(++lastAcceptanceOrder_);
     clients_.push_back(client);
-    client->setClientStartDate(platform().clock.now());
+    client->setClientStartDate(context_.platform().clock->now());
     client->setClientProcessName(
-        platform().processInformation.ProcessNameForPid(client->processIdentifier()));
+        context_.platform().processInformation->ProcessNameForPid(client->processIdentifier()));
 }
 
 void ZRReportingService::removeClient(ZRReportingClientServerInstance& client) {
@@ -94,7 +93,7 @@ void ZRReportingService::queueFurtherStops() {
     if (leaving_.isEmpty() || std::exchange(areStopsQueued_, true)) {
         return;
     }
-    ZRReportingUtilityGetReportingServerQueue().post(
+    context_.serverQueue().post(
         [service = std::weak_ptr(self_)] {
             if (const auto held = service.lock()) {
                 held->leaving_.stopSome();
@@ -180,7 +179,7 @@ void ZRReportingService::findReportingSessionsForIDs(std::span<const ReporterID>
 }
 
 void ZRReportingService::shutDown(UniqueFunction<void()> completed) {
-    ZRReportingUtilityGetReportingServerQueue().post(
+    context_.serverQueue().post(
         [service = std::weak_ptr(self_), completed = std::move(completed)]() mutable {
             if (const auto held = service.lock()) {
                 held->endAllClients();
@@ -196,10 +195,10 @@ void ZRReportingService::endAllClients() {
     // Each leaves the list as it ends.
     const std::vector<ClientRef> remaining = clients_;
     for (const ClientRef& client : remaining) {
-        const WallTime end = platform().clock.now();
+        const WallTime end = context_.platform().clock->now();
         client->endConnection();
         leaving_.stopAll();
-        reportClientUptime(client, client->processIdentifier(), end);
+        reportClientUptime(context_, client, client->processIdentifier(), end);
     }
 }
 

@@ -6,6 +6,7 @@
 #include "service/SessionRegistry.h"
 #include "service/SingleMessageSessionKeeper.h"
 #include "service/ZRReportingServiceDelegateProtocol.h"
+#include "util/Context.h"
 
 #include <atomic>
 #include <cstdint>
@@ -27,7 +28,7 @@ public:
     using ExitProcess = void (*)(int status);
 
     /// `exit` ends the process for `killService`; it may be called on any thread.
-    explicit ZRReportingService(ExitProcess exit = std::_Exit);
+    explicit ZRReportingService(Context& context, ExitProcess exit = std::_Exit);
     ~ZRReportingService() override;
     ZRReportingService(const ZRReportingService&) = delete;
     ZRReportingService& operator=(const ZRReportingService&) = delete;
@@ -62,8 +63,9 @@ private:
     /// For what clients that have left have yet to stop; one piece of work at a time.
     void queueFurtherStops();
     void logSessionsOfClients() const;
-    static void setHandlers(ClientConnection& connection, const ClientRef& client);
+    void setHandlers(ClientConnection& connection, const ClientRef& client);
 
+    Context& context_;
     const ExitProcess exitProcess_;
     std::atomic<bool> reportingEnabled_{true};
     std::vector<ClientRef> clients_;
@@ -71,7 +73,7 @@ private:
     SessionRegistry sessions_;
     LeavingClients leaving_;
     bool areStopsQueued_ = false;
-    SingleMessageSessionKeeper singleMessages_;
+    SingleMessageSessionKeeper singleMessages_{context_};
     /// Clients and queued work hold the service weakly, through this; it owns nothing.
     std::shared_ptr<ZRReportingService> self_;
 };

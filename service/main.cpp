@@ -1,6 +1,6 @@
 #include "platform/linux/LinuxPlatform.h"
 #include "service/ZRReportingService.h"
-#include "util/ReportingServerQueue.h"
+#include "util/Context.h"
 
 #include <cstdio>
 #include <cstdlib>
@@ -9,8 +9,8 @@
 #include <utility>
 #include <variant>
 
-/// Installs the platform, makes the service the delegate of the process's listener, and runs until a signal
-/// ends it.
+/// Makes the platform, the context and the service, makes the service the delegate of the process's listener,
+/// and runs until a signal ends it.
 int main() {
     using namespace tamblo;
 
@@ -20,14 +20,13 @@ int main() {
         return EXIT_FAILURE;
     }
     LinuxPlatform& linuxPlatform = *std::get<std::unique_ptr<LinuxPlatform>>(opened);
-    installPlatform(linuxPlatform.services());
-
-    ZRReportingService service;
+    Context context(linuxPlatform.services());
+    ZRReportingService service(context);
     ConnectionListener& listener =
-        platform().connections.listenerForServiceName("com.vandra.tamblo.reporting");
+        context.platform().connections->listenerForServiceName("com.vandra.tamblo.reporting");
     listener.setDelegate(service);
     listener.resume();
-    linuxPlatform.run(ZRReportingUtilityGetReportingServerQueue(),
+    linuxPlatform.run(context.serverQueue(),
                       [&service](auto completion) { service.shutDown(std::move(completion)); });
     return EXIT_SUCCESS;
 }

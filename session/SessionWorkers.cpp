@@ -32,7 +32,7 @@ void ZRReportingSession::makeWorker(const WorkerClass& workerClass) {
                "Initializing ZRReportingSessionWorker. action=init worker={} reporterID={}", workerClass,
                reporterID_);
     std::shared_ptr<ZRReportingSessionWorkerProtocol> instance =
-        workerClass.initWithSession(shared_from_this());
+        workerClass.initWithSession(context_, shared_from_this());
     if (instance == nullptr) {
         // Not remembered, so that the next start tries again.
         log::debug(ZRReportingSessionCategory(),

@@ -19,8 +19,8 @@ struct WorkerRole {
 struct WorkerClass {
     /// A worker for the session, or null when it refuses. A consumer's factory makes a
     /// `ZRReportingSessionWorkerConsumerProtocol`.
-    using Factory =
-        std::shared_ptr<ZRReportingSessionWorkerProtocol> (*)(const std::shared_ptr<ZRReportingSession>&);
+    using Factory = std::shared_ptr<ZRReportingSessionWorkerProtocol> (*)(
+        Context&, const std::shared_ptr<ZRReportingSession>&);
 
     std::string_view name;
     WorkerRole role;
@@ -34,8 +34,8 @@ struct WorkerClass {
 /// The factory of a class whose workers need nothing but their session.
 template <typename Worker>
 [[nodiscard]] std::shared_ptr<ZRReportingSessionWorkerProtocol>
-initWithSession(const std::shared_ptr<ZRReportingSession>& session) {
-    return std::make_shared<Worker>(session);
+initWithSession(Context& context, const std::shared_ptr<ZRReportingSession>& session) {
+    return std::make_shared<Worker>(context, session);
 }
 
 /// All worker classes, in the order in which sessions make them. Defined outside this folder, which knows no

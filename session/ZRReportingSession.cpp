@@ -1,6 +1,5 @@
 #include "session/ZRReportingSession.h"
 
-#include "platform/Platform.h"
 #include "session/MessageIntake.h"
 #include "util/Log.h"
 #include "util/MessageKeys.h"
@@ -11,24 +10,27 @@
 
 namespace tamblo {
 
-std::shared_ptr<ZRReportingSession> ZRReportingSession::initWithID(ReporterID reporterID,
+std::shared_ptr<ZRReportingSession> ZRReportingSession::initWithID(Context& context, ReporterID reporterID,
                                                                    std::vector<pid_t> processIdentifiers) {
     const WorkerClassLists& classes = workerClassLists();
-    auto session = std::make_shared<ZRReportingSession>(Created(), reporterID, std::move(processIdentifiers));
+    auto session =
+        std::make_shared<ZRReportingSession>(Created(), context, reporterID, std::move(processIdentifiers));
     session->setServiceType(AudioServiceTypeUnknown);
     session->startWorkersFromClasses(classes.startOnInit);
     log::info(ZRReportingSessionCategory(), "created reporting session for ID: {}", reporterID);
-    emitTracePoint(TraceEvent::sessionCreated);
+    emitTracePoint(context, TraceEvent::sessionCreated);
     return session;
 }
 
-ZRReportingSession::ZRReportingSession(Created, ReporterID reporterID, std::vector<pid_t> processIdentifiers)
-    : reporterID_(reporterID),
+ZRReportingSession::ZRReportingSession(Created, Context& context, ReporterID reporterID,
+                                       std::vector<pid_t> processIdentifiers)
+    : context_(context),
+      reporterID_(reporterID),
       processIdentifiers_(std::move(processIdentifiers)),
       appName_(ZRReportingUtilityRetrieveAppName(configuration_)) {}
 
 ZRReportingSession::~ZRReportingSession() {
-    emitTracePoint(TraceEvent::sessionDestroyed);
+    emitTracePoint(context_, TraceEvent::sessionDestroyed);
     log::info(ZRReportingSessionCategory(), "deallocing this session {}", reporterID_);
 }
 
@@ -60,7 +62,7 @@ void ZRReportingSession::start() {
     }
     log::debug(ZRReportingSessionCategory(), "self.started==false. starting. reporterID={}", reporterID_);
     started_ = true;
-    emitTracePoint(TraceEvent::sessionStarted);
+    emitTracePoint(context_, TraceEvent::sessionStarted);
     startWorkersFromClasses(workerClassLists().valid);
 }
 
@@ -72,7 +74,7 @@ void ZRReportingSession::stop() {
         return;
     }
     log::debug(ZRReportingSessionCategory(), "ending session. reporterID={}", reporterID_);
-    emitTracePoint(TraceEvent::sessionStopped);
+    emitTracePoint(context_, TraceEvent::sessionStopped);
     if (ZRReportingSessionMessage::sortMessages(messages_)) {
         lastMessages_.rebuild(messages_);
     }
@@ -104,7 +106,7 @@ void ZRReportingSession::recordOwnMessage(AudioEventType type, std::string_view 
         {"running" + suffix, yesOrNo(started_)},
     };
     auto message = std::make_shared<ZRReportingSessionMessage>(std::move(payload), AudioEventKindSetup, type);
-    addMissingDates(*message, platform().clock.now());
+    addMissingDates(*message, context_.platform().clock->now());
     addAudioMessageTag(*message);
     record(std::move(message));
     ++ownRecordCount_;
@@ -119,7 +121,7 @@ void ZRReportingSession::sendMessage(const MessageRef& message, ErrorReply reply
     const auto held = monitor();
     ++totalMessageCount_;
     normalise(*message);
-    emitTracePoint(TraceEvent::sessionMessage);
+    emitTracePoint(context_, TraceEvent::sessionMessage);
     message->isSessionStarted = started_;
     message->isRedundant = messageIsRedundant(*message);
     log::debug(ZRReportingSessionCategory(),
@@ -136,7 +138,7 @@ void ZRReportingSession::sendMessage(const MessageRef& message, ErrorReply reply
 }
 
 void ZRReportingSession::normalise(ZRReportingSessionMessage& message) const {
-    const WallTime now = platform().clock.now();
+    const WallTime now = context_.platform().clock->now();
     message.editPayload([&](Dictionary& payload) {
         intake::addMissingDates(payload, now);
         intake::removeWhiteSpaceFromKeys(payload);

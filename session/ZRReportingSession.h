@@ -37,8 +37,9 @@ class ZRReportingSession : public std::enable_shared_from_this<ZRReportingSessio
 public:
     /// A session whose start-on-init workers are made and started.
     [[nodiscard]] static std::shared_ptr<ZRReportingSession>
-    initWithID(ReporterID reporterID, std::vector<pid_t> processIdentifiers);
-    ZRReportingSession(Created, ReporterID reporterID, std::vector<pid_t> processIdentifiers);
+    initWithID(Context& context, ReporterID reporterID, std::vector<pid_t> processIdentifiers);
+    ZRReportingSession(Created, Context& context, ReporterID reporterID,
+                       std::vector<pid_t> processIdentifiers);
     ~ZRReportingSession();
     ZRReportingSession(const ZRReportingSession&) = delete;
     ZRReportingSession& operator=(const ZRReportingSession&) = delete;
@@ -120,6 +121,7 @@ private:
     void normalise(ZRReportingSessionMessage& message) const;
     void deliver(const MessageRef& message);
 
+    Context& context_;
     const ReporterID reporterID_;
     const std::vector<pid_t> processIdentifiers_;
     bool started_ = false;

@@ -1,6 +1,7 @@
 #pragma once
 
 #include "session/ZRReportingSessionMessage.h"
+#include "util/Context.h"
 
 #include <memory>
 #include <optional>
@@ -16,8 +17,8 @@ class ZRReportingSession;
 /// worker registers elsewhere ends with the worker.
 class ZRReportingSessionWorkerProtocol {
 public:
-    explicit ZRReportingSessionWorkerProtocol(std::weak_ptr<ZRReportingSession> session)
-        : session_(std::move(session)) {}
+    ZRReportingSessionWorkerProtocol(Context& context, std::weak_ptr<ZRReportingSession> session)
+        : context_(context), session_(std::move(session)) {}
     virtual ~ZRReportingSessionWorkerProtocol() = default;
     ZRReportingSessionWorkerProtocol(const ZRReportingSessionWorkerProtocol&) = delete;
     ZRReportingSessionWorkerProtocol& operator=(const ZRReportingSessionWorkerProtocol&) = delete;
@@ -35,7 +36,12 @@ public:
     /// Called only while started. A producer sends its derived messages from here, through the session.
     virtual void stop() {}
 
+protected:
+    [[nodiscard]] Context& context() const noexcept { return context_; }
+    [[nodiscard]] const Platform& platform() const noexcept { return context_.platform(); }
+
 private:
+    Context& context_;
     std::weak_ptr<ZRReportingSession> session_;
     bool started_ = false;
 };

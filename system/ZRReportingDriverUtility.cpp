@@ -1,7 +1,6 @@
 #include "system/ZRReportingDriverUtility.h"
 
 #include "base/Dictionary.h"
-#include "platform/Platform.h"
 #include "session/ZRReportingSession.h"
 #include "util/AudioEvents.h"
 #include "util/Log.h"
@@ -9,7 +8,6 @@
 #include <algorithm>
 #include <cstddef>
 #include <cstdint>
-#include <mutex>
 #include <numeric>
 #include <utility>
 #include <variant>
@@ -50,17 +48,6 @@ ZRReportingDriver driverOf(const DriverNames& names) {
 /// A name in a log line or a text.
 std::string_view textOf(const std::optional<std::string>& name) noexcept {
     return name ? std::string_view(*name) : "(null)";
-}
-
-struct Shared {
-    std::mutex mutex;
-    std::unique_ptr<ZRReportingDriverUtility> utility;
-};
-
-/// Never destroyed: it lives as long as the process.
-Shared& sharedPlace() {
-    static Shared& only = *new Shared;
-    return only;
 }
 
 /// The channels, or null after a failure, which is logged where there is something to tell.
@@ -125,25 +112,10 @@ void send(ZRReportingSession& session, ZRReportingDriverUtility::DriverStats& st
 
 } // namespace
 
-ZRReportingDriverUtility& ZRReportingDriverUtility::shared() {
-    Shared& place = sharedPlace();
-    const std::lock_guard held(place.mutex);
-    if (place.utility == nullptr) {
-        place.utility = std::make_unique<ZRReportingDriverUtility>();
-    }
-    return *place.utility;
-}
-
-void ZRReportingDriverUtility::reset() {
-    const std::lock_guard held(sharedPlace().mutex);
-    sharedPlace().utility.reset();
-}
-
-ZRReportingDriverUtility::ZRReportingDriverUtility() {
+ZRReportingDriverUtility::ZRReportingDriverUtility(ChanlogFacility& facility) : facility_(facility) {
     const LogCategory& category = ZRReportingDriverUtilityCategory();
     log::standard(category, "creating chanlog driver utility");
-    ChanlogFacility& facility = platform().chanlog;
-    const std::unique_ptr<ChanlogSampling> moment = facility.beginSampling();
+    const std::unique_ptr<ChanlogSampling> moment = facility_.beginSampling();
     for (const DriverNames& names : kDrivers) {
         const ZRReportingDriver driver = driverOf(names);
         const ChanlogSelection selection{driver.groupName(), driver.subGroupName()};
@@ -157,7 +129,7 @@ ZRReportingDriverUtility::ZRReportingDriverUtility() {
             log::info(category, "couldn't find any channels for driver group {}", driver);
             continue;
         }
-        auto made = facility.subscribe(selection, channels);
+        auto made = facility_.subscribe(selection, channels);
         if (const int* error = std::get_if<int>(&made)) {
             log::error(category, "error {} creating subscription for {}", *error, driver);
             continue;
@@ -173,7 +145,7 @@ ZRReportingDriverUtility::DriverSnapShot ZRReportingDriverUtility::getSnapShot()
     if (ioChannelSubscriptions_.empty()) {
         return snapShot;
     }
-    const std::unique_ptr<ChanlogSampling> moment = platform().chanlog.beginSampling();
+    const std::unique_ptr<ChanlogSampling> moment = facility_.beginSampling();
     for (const ZRReportingIOChannelSubscription& subscription : ioChannelSubscriptions_) {
         log::info(ZRReportingDriverUtilityCategory(), "sampling driver {}", subscription.driver());
         if (auto sample = channelsOrNull(moment->sample(subscription.subscription()))) {
@@ -188,8 +160,7 @@ void ZRReportingDriverUtility::sendDriverLogsForSession(const std::shared_ptr<ZR
     if (ioChannelSubscriptions_.empty()) {
         return;
     }
-    ChanlogFacility& facility = platform().chanlog;
-    const std::unique_ptr<ChanlogSampling> moment = facility.beginSampling();
+    const std::unique_ptr<ChanlogSampling> moment = facility_.beginSampling();
     Stats stats;
     for (const ZRReportingIOChannelSubscription& subscription : ioChannelSubscriptions_) {
         log::info(ZRReportingDriverUtilityCategory(), "getting latest samples");
@@ -201,7 +172,7 @@ void ZRReportingDriverUtility::sendDriverLogsForSession(const std::shared_ptr<ZR
         }
         const auto found = driverSnapShot->find(subscription.driver().description());
         const ChanlogChannels earlier = found != driverSnapShot->end() ? found->second : nullptr;
-        if (const ChanlogChannels gained = channelsOrNull(facility.difference(earlier, latest))) {
+        if (const ChanlogChannels gained = channelsOrNull(facility_.difference(earlier, latest))) {
             for (const ChanlogChannelRef& channel : *gained) {
                 stats.add(*channel);
             }

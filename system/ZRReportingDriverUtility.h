@@ -18,7 +18,7 @@ class ZRReportingSession;
 /// Samples the statistics channels of a fixed set of audio drivers, and turns what a session's time has added
 /// to them into messages of that session.
 ///
-/// One for the process, made with the first start of a session. It then subscribes to the drivers' channels,
+/// One for the context, made with the first start of a session. It then subscribes to the drivers' channels,
 /// once: a driver without channels at that moment is not asked again. Used on the reporting server queue,
 /// where a pass over the channels may read files; without any subscription it reads nothing.
 ///
@@ -32,12 +32,7 @@ public:
     /// that came last.
     using DriverStats = std::map<std::string, Value, std::less<>>;
 
-    /// The process's utility, made by the first call. Any thread.
-    [[nodiscard]] static ZRReportingDriverUtility& shared();
-    /// Drops the process's utility: after another platform was installed. Only while nobody uses it.
-    static void reset();
-
-    ZRReportingDriverUtility();
+    explicit ZRReportingDriverUtility(ChanlogFacility& facility);
     ZRReportingDriverUtility(const ZRReportingDriverUtility&) = delete;
     ZRReportingDriverUtility& operator=(const ZRReportingDriverUtility&) = delete;
 
@@ -65,6 +60,7 @@ public:
     static void processStateData(const ChanlogChannel& channel, DriverStats& driverStats);
 
 private:
+    ChanlogFacility& facility_;
     std::vector<ZRReportingIOChannelSubscription> ioChannelSubscriptions_;
 };
 

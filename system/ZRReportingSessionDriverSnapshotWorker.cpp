@@ -3,14 +3,17 @@
 namespace tamblo {
 
 std::optional<bool> ZRReportingSessionDriverSnapshotWorker::start() {
-    driverSnapShot_ = ZRReportingDriverUtility::shared().getSnapShot();
+    driverSnapShot_ = utility().getSnapShot();
     return true;
 }
 
 void ZRReportingSessionDriverSnapshotWorker::stop() {
-    ZRReportingDriverUtility::shared().sendDriverLogsForSession(session(), driverSnapShot_ ? &*driverSnapShot_
-                                                                                           : nullptr);
+    utility().sendDriverLogsForSession(session(), driverSnapShot_ ? &*driverSnapShot_ : nullptr);
     driverSnapShot_.reset();
+}
+
+const ZRReportingDriverUtility& ZRReportingSessionDriverSnapshotWorker::utility() const {
+    return context().shared<ZRReportingDriverUtility>(*platform().chanlog);
 }
 
 } // namespace tamblo

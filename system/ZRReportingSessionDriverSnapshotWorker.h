@@ -18,6 +18,8 @@ public:
     void stop() override;
 
 private:
+    [[nodiscard]] const ZRReportingDriverUtility& utility() const;
+
     std::optional<ZRReportingDriverUtility::DriverSnapShot> driverSnapShot_;
 };
 

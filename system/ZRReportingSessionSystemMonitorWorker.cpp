@@ -15,10 +15,10 @@ constexpr std::string_view kLastUpdatedKey = "last_updated";
 } // namespace
 
 ZRReportingSessionSystemMonitorWorker::ZRReportingSessionSystemMonitorWorker(
-    std::weak_ptr<ZRReportingSession> session)
-    : ZRReportingSessionWorkerProducerProtocol(std::move(session)),
-      systemMonitorDictionary_(ZRReportingSystemMonitor::getSystemMonitorDictionary()),
-      featureKeys_(ZRReportingSystemMonitor::getSystemMonitorKeys()) {}
+    Context& context, std::weak_ptr<ZRReportingSession> session)
+    : ZRReportingSessionWorkerProducerProtocol(context, std::move(session)),
+      systemMonitorDictionary_(ZRReportingSystemMonitor::getSystemMonitorDictionary(context)),
+      featureKeys_(ZRReportingSystemMonitor::getSystemMonitorKeys(context)) {}
 
 std::optional<bool> ZRReportingSessionSystemMonitorWorker::start() {
     if (systemMonitorDictionary_ == nullptr) {

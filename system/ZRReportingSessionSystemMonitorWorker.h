@@ -19,7 +19,7 @@ namespace tamblo {
 class ZRReportingSessionSystemMonitorWorker final : public ZRReportingSessionWorkerProducerProtocol,
                                                     public SystemMonitorDictionary::KeyObserver {
 public:
-    explicit ZRReportingSessionSystemMonitorWorker(std::weak_ptr<ZRReportingSession> session);
+    ZRReportingSessionSystemMonitorWorker(Context& context, std::weak_ptr<ZRReportingSession> session);
 
     std::optional<bool> start() override;
     void stop() override;

@@ -1,12 +1,11 @@
 #include "system/ZRReportingSystemMonitor.h"
 
-#include "platform/Platform.h"
+#include "base/Mutex.h"
 #include "util/Log.h"
 #include "util/MessageKeys.h"
 #include "util/ReportingUtilities.h"
 
 #include <cstdint>
-#include <mutex>
 #include <string>
 #include <utility>
 
@@ -24,40 +23,35 @@ constexpr std::string_view kRingerNotification = "com.vandra.dashlo.ringerstate"
 constexpr std::string_view kDeviceNameKey = "device_name";
 constexpr std::string_view kDisableReportingKey = "disable_reporting";
 
-struct SharedMonitor {
-    std::mutex mutex;
-    std::shared_ptr<ZRReportingSystemMonitor> monitor;
-};
-
-/// Never destroyed: it lives as long as the process.
-SharedMonitor& shared() {
-    static SharedMonitor& only = *new SharedMonitor;
-    return only;
-}
-
-std::shared_ptr<ZRReportingSystemMonitor> sharedMonitor() {
-    const std::lock_guard held(shared().mutex);
-    return shared().monitor;
-}
-
 } // namespace
 
-void ZRReportingSystemMonitor::initializeWithQueue(SerialQueue& queue) {
-    const std::lock_guard held(shared().mutex);
-    if (shared().monitor == nullptr) {
-        shared().monitor = initWithQueue(queue);
+struct ZRReportingSystemMonitor::Shared {
+    [[nodiscard]] std::shared_ptr<ZRReportingSystemMonitor> current() {
+        const MutexLock lock(mutex);
+        return monitor;
+    }
+
+    Mutex mutex;
+    std::shared_ptr<ZRReportingSystemMonitor> monitor TAMBLO_GUARDED_BY(mutex);
+};
+
+void ZRReportingSystemMonitor::initializeWithQueue(Context& context, SerialQueue& queue) {
+    auto& shared = context.shared<Shared>();
+    const MutexLock lock(shared.mutex);
+    if (shared.monitor == nullptr) {
+        shared.monitor = initWithQueue(context.platform(), queue);
     }
 }
 
-std::shared_ptr<SystemMonitorDictionary> ZRReportingSystemMonitor::getSystemMonitorDictionary() {
-    const auto monitor = sharedMonitor();
+std::shared_ptr<SystemMonitorDictionary>
+ZRReportingSystemMonitor::getSystemMonitorDictionary(Context& context) {
+    const auto monitor = context.shared<Shared>().current();
     return monitor != nullptr ? monitor->systemMonitorDictionary_ : nullptr;
 }
 
-std::vector<std::string_view> ZRReportingSystemMonitor::getSystemMonitorKeys() {
+std::vector<std::string_view> ZRReportingSystemMonitor::getSystemMonitorKeys(Context& context) {
     std::vector<std::string_view> keys;
-    if (const auto monitor = sharedMonitor()) {
-        keys.reserve(monitor->features_.size());
+    if (const auto monitor = context.shared<Shared>().current()) {
         for (const auto& [featureName, feature] : monitor->features_) {
             keys.push_back(featureName);
         }
@@ -65,19 +59,21 @@ std::vector<std::string_view> ZRReportingSystemMonitor::getSystemMonitorKeys() {
     return keys;
 }
 
-void ZRReportingSystemMonitor::reset() {
+void ZRReportingSystemMonitor::reset(Context& context) {
+    auto& shared = context.shared<Shared>();
     std::shared_ptr<ZRReportingSystemMonitor> dropped;
     {
-        const std::lock_guard held(shared().mutex);
-        dropped = std::move(shared().monitor);
+        const MutexLock lock(shared.mutex);
+        dropped = std::move(shared.monitor);
     }
     if (dropped != nullptr) {
         dropped->clear();
     }
 }
 
-std::shared_ptr<ZRReportingSystemMonitor> ZRReportingSystemMonitor::initWithQueue(SerialQueue& queue) {
-    auto monitor = std::make_shared<ZRReportingSystemMonitor>(Created(), queue);
+std::shared_ptr<ZRReportingSystemMonitor> ZRReportingSystemMonitor::initWithQueue(const Platform& platform,
+                                                                                  SerialQueue& queue) {
+    auto monitor = std::make_shared<ZRReportingSystemMonitor>(Created(), platform, queue);
     // In this order on purpose: a state word is read through a registration, so the ringer has no state until
     // its first notification.
     monitor->populateInitialValues();
@@ -85,17 +81,18 @@ std::shared_ptr<ZRReportingSystemMonitor> ZRReportingSystemMonitor::initWithQueu
     return monitor;
 }
 
-ZRReportingSystemMonitor::ZRReportingSystemMonitor(Created, SerialQueue& queue)
-    : defaults_(ZRReportingDefaults()),
+ZRReportingSystemMonitor::ZRReportingSystemMonitor(Created, const Platform& platform, SerialQueue& queue)
+    : platform_(platform),
       queue_(queue),
+      defaults_(ZRReportingDefaults(platform)),
       features_{{ZRReportingMessageKeySpatialAudioAccessoryFeature,
                  {ZRReportingMessageKeySpatialAudioAccessoryFeatureDomain, kSpatialAudioNotification, {}}},
                 {kDeviceNameKey, {kReportingDomain, kReportingNotification, {}}},
                 {kRingerStateKey, {{}, kRingerNotification, {}}}},
       systemMonitorDictionary_(std::make_shared<SystemMonitorDictionary>()) {}
 
-Dictionary ZRReportingSystemMonitor::ZRReportingDefaults() {
-    const PreferencesSuite preferences(platform().preferences, std::string(kReportingDomain));
+Dictionary ZRReportingSystemMonitor::ZRReportingDefaults(const Platform& platform) {
+    const PreferencesSuite preferences(*platform.preferences, std::string(kReportingDomain));
     Dictionary defaults{{kDisableReportingKey, preferences.boolValue(kDisableReportingKey)}};
     if (preferences.hasValue(kDeviceNameKey)) {
         defaults.set(kDeviceNameKey, preferences.stringValue(kDeviceNameKey));
@@ -131,21 +128,21 @@ std::optional<Dictionary> ZRReportingSystemMonitor::getFeatureState(std::string_
         return std::nullopt;
     }
     return Dictionary{{featureName, *std::move(value)},
-                      {ZRReportingInternalEventEpochTime, secondsSince1970(platform().clock.now())},
+                      {ZRReportingInternalEventEpochTime, secondsSince1970(platform_.clock->now())},
                       {ZRReportingInternalEventSystemUptimeSec,
-                       roundedTo32Bits(platform().processInformation.systemUptime().count())}};
+                       roundedTo32Bits(platform_.processInformation->systemUptime().count())}};
 }
 
 std::optional<Value> ZRReportingSystemMonitor::valueOf(std::string_view featureName,
                                                        const Feature& feature) const {
     if (!feature.defaultsDomain.empty()) {
-        return platform().preferences.copyPreferenceValue(featureName, feature.defaultsDomain);
+        return platform_.preferences->copyPreferenceValue(featureName, feature.defaultsDomain);
     }
     if (!feature.notifyToken) {
         return std::nullopt;
     }
     constexpr std::uint64_t kOn = 1;
-    const auto state = platform().namedNotifications.GetNamedNotificationState(*feature.notifyToken);
+    const auto state = platform_.namedNotifications->GetNamedNotificationState(*feature.notifyToken);
     return state.status == 0 ? std::optional<Value>(state.word == kOn) : std::nullopt;
 }
 
@@ -163,7 +160,7 @@ void ZRReportingSystemMonitor::listenForFeatureStateChanges() {
     log::info(ZRReportingServiceDelegateCategory(), "listening for features {}", features());
     const auto held = systemMonitorDictionary_->lock();
     for (auto& [name, feature] : features_) {
-        const auto registration = platform().namedNotifications.RegisterNamedNotification(
+        const auto registration = platform_.namedNotifications->RegisterNamedNotification(
             feature.notification, queue_, [monitor = weak_from_this(), featureName = name](int token) {
                 if (const auto listening = monitor.lock()) {
                     listening->featureChanged(featureName, token);
@@ -188,7 +185,7 @@ void ZRReportingSystemMonitor::featureChanged(std::string_view featureName, int 
 void ZRReportingSystemMonitor::clear() {
     const auto held = systemMonitorDictionary_->lock();
     for (const auto& [featureName, feature] : features_) {
-        platform().namedNotifications.CancelNamedNotification(feature.notifyToken.value_or(0));
+        platform_.namedNotifications->CancelNamedNotification(feature.notifyToken.value_or(0));
     }
 }
 

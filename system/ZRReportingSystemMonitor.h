@@ -3,6 +3,7 @@
 #include "base/Dictionary.h"
 #include "platform/WorkQueue.h"
 #include "system/SystemMonitorDictionary.h"
+#include "util/Context.h"
 
 #include <map>
 #include <memory>
@@ -15,7 +16,7 @@ namespace tamblo {
 /// Watches a few features of the device (the spatial-audio accessory feature, the reporting device's name,
 /// the ringer) and keeps the latest state of each in a snapshot that sessions observe.
 ///
-/// One for the process, made by the service at start-up. A feature's value is a preference, or the state word
+/// One for the context, made by the service at start-up. A feature's value is a preference, or the state word
 /// of a named notification; either way a notification tells of its changes, on the queue, where the feature
 /// is read anew and stored. The descriptors' tokens are guarded by the snapshot's lock.
 class ZRReportingSystemMonitor : public std::enable_shared_from_this<ZRReportingSystemMonitor> {
@@ -24,27 +25,29 @@ class ZRReportingSystemMonitor : public std::enable_shared_from_this<ZRReporting
     };
 
 public:
-    /// Makes the process's monitor, unless there is one. Any thread.
-    static void initializeWithQueue(SerialQueue& queue);
-    /// The process's snapshot itself; null without a monitor. Any thread.
-    [[nodiscard]] static std::shared_ptr<SystemMonitorDictionary> getSystemMonitorDictionary();
+    /// Makes the context's monitor, unless there is one. Any thread.
+    static void initializeWithQueue(Context& context, SerialQueue& queue);
+    /// The context's snapshot itself; null without a monitor. Any thread.
+    [[nodiscard]] static std::shared_ptr<SystemMonitorDictionary>
+    getSystemMonitorDictionary(Context& context);
     /// The features' names, whether or not they have values; none without a monitor. The texts live as long
     /// as the process. Any thread.
-    [[nodiscard]] static std::vector<std::string_view> getSystemMonitorKeys();
-    /// Drops the process's monitor; its snapshot changes no more. On the monitor's queue, or when that is at
+    [[nodiscard]] static std::vector<std::string_view> getSystemMonitorKeys(Context& context);
+    /// Drops the context's monitor; its snapshot changes no more. On the monitor's queue, or when that is at
     /// rest.
-    static void reset();
+    static void reset(Context& context);
 
     /// A monitor whose snapshot is filled, and which listens. The queue must outlive its registrations.
-    [[nodiscard]] static std::shared_ptr<ZRReportingSystemMonitor> initWithQueue(SerialQueue& queue);
-    ZRReportingSystemMonitor(Created, SerialQueue& queue);
+    [[nodiscard]] static std::shared_ptr<ZRReportingSystemMonitor> initWithQueue(const Platform& platform,
+                                                                                 SerialQueue& queue);
+    ZRReportingSystemMonitor(Created, const Platform& platform, SerialQueue& queue);
     ~ZRReportingSystemMonitor() { clear(); }
     ZRReportingSystemMonitor(const ZRReportingSystemMonitor&) = delete;
     ZRReportingSystemMonitor& operator=(const ZRReportingSystemMonitor&) = delete;
 
     /// The preferences that say how to report, as they are now: "disable_reporting", and "device_name" where
     /// there is one.
-    [[nodiscard]] static Dictionary ZRReportingDefaults();
+    [[nodiscard]] static Dictionary ZRReportingDefaults(const Platform& platform);
     /// The same as they were when the monitor was made.
     [[nodiscard]] const Dictionary& getDefaults() const noexcept { return defaults_; }
     /// The feature table as it is logged: a dictionary for each feature's name.
@@ -62,6 +65,7 @@ public:
     void clear();
 
 private:
+    struct Shared;
     struct Feature {
         std::string_view defaultsDomain; ///< empty when the value is the notification's state word
         std::string_view notification;
@@ -71,8 +75,9 @@ private:
     [[nodiscard]] std::optional<Value> valueOf(std::string_view featureName, const Feature& feature) const;
     void featureChanged(std::string_view featureName, int token);
 
-    const Dictionary defaults_;
+    const Platform& platform_;
     SerialQueue& queue_;
+    const Dictionary defaults_;
     std::map<std::string_view, Feature> features_;
     const std::shared_ptr<SystemMonitorDictionary> systemMonitorDictionary_;
 };

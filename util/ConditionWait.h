@@ -1,6 +1,6 @@
 #pragma once
 
-#include "util/LogCategory.h"
+#include "util/LogCategories.h"
 
 #include <chrono>
 #include <condition_variable>

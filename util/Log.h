@@ -1,13 +1,35 @@
 #pragma once
 
+#include "base/Dictionary.h"
 #include "base/Format.h"
+#include "base/Value.h"
 #include "platform/StructuredLog.h"
 #include "util/LogCategories.h"
-#include "util/LogText.h"
 
+#include <cstdint>
+#include <span>
 #include <string>
 #include <string_view>
 #include <type_traits>
+
+namespace tamblo {
+
+/// A payload in a log line: JSON.
+void appendText(std::string& out, const Dictionary& dictionary);
+/// A value in a log line: a string as it is, anything else as JSON.
+void appendText(std::string& out, const Value& value);
+
+/// Numbers in a log line: "[1, 2]".
+struct NumberList {
+    std::span<const std::int64_t> numbers;
+};
+void appendText(std::string& out, const NumberList& list);
+
+[[nodiscard]] constexpr std::string_view yesOrNo(bool value) noexcept {
+    return value ? "YES" : "NO";
+}
+
+} // namespace tamblo
 
 /// One function per level. A line is the prefix, "%25s:%-5d " of the source unit's name and the line number,
 /// and the formatted text. Arguments become text only when the level is on for the category.

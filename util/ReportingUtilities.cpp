@@ -1,6 +1,6 @@
 #include "util/ReportingUtilities.h"
 
-#include "platform/Platform.h"
+#include "util/Context.h"
 #include "util/MessageKeys.h"
 
 #include <algorithm>
@@ -28,12 +28,12 @@ double ZRReportingUtilityRoundWithPlaces(double value, int places) noexcept {
 
 Dictionary ZRReportingUtilityAddDates(const Dictionary& message) {
     constexpr float kTicksPerSecond = 1'000'000;
-    const Platform& device = platform();
-    const float ticks = static_cast<float>(device.processInformation.processorTime().count());
+    const Platform& device = Context::current().platform();
+    const float ticks = static_cast<float>(device.processInformation->processorTime().count());
     Dictionary dated = message;
-    dated.set(ZRReportingInternalEventEpochTime, secondsSince1970(device.clock.now()));
+    dated.set(ZRReportingInternalEventEpochTime, secondsSince1970(device.clock->now()));
     dated.set(ZRReportingInternalEventSystemUptimeSec,
-              roundedTo32Bits(device.processInformation.systemUptime().count()));
+              roundedTo32Bits(device.processInformation->systemUptime().count()));
     dated.set(ZRReportingInternalEventProcessUptimeMS, roundedTo32Bits(ticks / kTicksPerSecond * 1000.0F));
     return dated;
 }

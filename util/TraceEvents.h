@@ -1,6 +1,6 @@
 #pragma once
 
-#include "platform/Platform.h"
+#include "util/Context.h"
 
 #include <cstdint>
 
@@ -25,8 +25,8 @@ enum class TraceEvent : std::uint32_t {
     return 0x21040000U | static_cast<std::uint32_t>(event) << 2U;
 }
 
-inline void emitTracePoint(TraceEvent event) noexcept {
-    platform().tracePoints.EmitTracePoint(traceCode(event));
+inline void emitTracePoint(const Context& context, TraceEvent event) noexcept {
+    context.platform().tracePoints->EmitTracePoint(traceCode(event));
 }
 
 } // namespace tamblo

@@ -2,7 +2,7 @@
 
 #include "base/Format.h"
 #include "base/Utf8.h"
-#include "util/LogText.h"
+#include "util/Log.h"
 
 #include <algorithm>
 #include <chrono>

@@ -70,22 +70,22 @@ public:
         for (int driver = 0; driver < drivers; ++driver) {
             publish(driver, 0);
         }
-        device_.installWith({.analyticsEvents = &noEvents_, .chanlog = &facility_});
+        device_.services().analyticsEvents = std::make_unique<NoEvents>();
         std::this_thread::sleep_for(kUntilCertain);
-        utility_ = std::make_unique<ZRReportingDriverUtility>();
+        utility_ = std::make_unique<ZRReportingDriverUtility>(facility_);
         snapShot_ = utility_->getSnapShot();
     }
 
     void publish(int driver, int round) const {
         directory_.write("chanlog/driver" + std::to_string(driver) + ".json", driverChannels(driver, round));
     }
+    [[nodiscard]] std::shared_ptr<ZRReportingSession> makeSession() { return device_.makeSession(7, {1}); }
     [[nodiscard]] const ZRReportingDriverUtility& utility() const { return *utility_; }
     [[nodiscard]] const ZRReportingDriverUtility::DriverSnapShot& snapShot() const { return snapShot_; }
 
 private:
     TemporaryDirectory directory_;
     FakePlatform device_{LogLevel::standard};
-    NoEvents noEvents_;
     LinuxChanlogFacility facility_{directory_.path() + "/chanlog", device_.log};
     std::unique_ptr<ZRReportingDriverUtility> utility_;
     ZRReportingDriverUtility::DriverSnapShot snapShot_;
@@ -122,8 +122,8 @@ BENCHMARK(driverSnapshotWithChangedFiles)
 /// What a session's stop does: the sample, the difference and the messages, which a session without consumers
 /// records. All files changed during the session, as many as the argument says just before it stops.
 void driverMessages(benchmark::State& state) {
-    const ChannelDevice device(static_cast<int>(state.range(0)));
-    const auto session = ZRReportingSession::initWithID(7, {1});
+    ChannelDevice device(static_cast<int>(state.range(0)));
+    const auto session = device.makeSession();
     int round = 1;
     const auto publish = [&](std::int64_t drivers) {
         for (int driver = 0; driver < drivers; ++driver) {

@@ -1,6 +1,5 @@
 #include "../Payloads.h"
 
-#include "platform/Platform.h"
 #include "session/ZRReportingSession.h"
 #include "tests/fakes/FakePlatform.h"
 
@@ -31,14 +30,17 @@ public:
 class QuietDevice {
 public:
     QuietDevice() {
-        device_.installWith({.tracePoints = &noTracePoints_, .analyticsEvents = &noEvents_});
+        device_.services().tracePoints = std::make_unique<NoTracePoints>();
+        device_.services().analyticsEvents = std::make_unique<NoEvents>();
         device_.clock.set(std::chrono::time_point_cast<WallTime::duration>(std::chrono::system_clock::now()));
     }
 
     void advance(std::chrono::milliseconds time) { device_.clock.advance(time); }
 
-    [[nodiscard]] static std::shared_ptr<ZRReportingSession> startedSession() {
-        auto session = ZRReportingSession::initWithID(7, {1});
+    [[nodiscard]] WallTime now() const { return device_.clock.now(); }
+
+    [[nodiscard]] std::shared_ptr<ZRReportingSession> startedSession() {
+        auto session = device_.makeSession(7, {1});
         // The service type that the call-quality worker refuses: nobody runs the queue that it would fill.
         session->setServiceType(AudioServiceTypeTest);
         session->updateConfigurationWithContentsOfConfiguration(sessionConfiguration());
@@ -48,8 +50,6 @@ public:
 
 private:
     FakePlatform device_{LogLevel::standard};
-    NoEvents noEvents_;
-    NoTracePoints noTracePoints_;
 };
 
 void send(ZRReportingSession& session, const Message& message) {
@@ -60,9 +60,9 @@ void send(ZRReportingSession& session, const Message& message) {
 
 /// One message through the intake, the redundancy test and the workers; a thousand to a session.
 void sessionSend(benchmark::State& state, Variety variety) {
-    const QuietDevice device;
+    QuietDevice device;
     const std::vector<Message> messages = makeMessages(kMessages, variety);
-    const auto session = QuietDevice::startedSession();
+    const auto session = device.startedSession();
     std::size_t i = 0;
     for (auto _ : state) {
         send(*session, messages[i++ % kMessages]);
@@ -89,14 +89,14 @@ BENCHMARK(sessionSendRepeated);
 void sessionStop(benchmark::State& state) {
     constexpr std::chrono::milliseconds kBetweenMessages{20};
     QuietDevice device;
-    const auto session = QuietDevice::startedSession();
+    const auto session = device.startedSession();
     const auto count = static_cast<std::uint64_t>(state.range(0));
     for (auto _ : state) {
         state.PauseTiming();
         for (std::uint64_t i = 0; i < count; ++i) {
             Message message = makeMessage(i, Variety::distinct);
             device.advance(kBetweenMessages);
-            message.payload.set("zrreporting_timestamp", secondsSince1970(platform().clock.now()));
+            message.payload.set("zrreporting_timestamp", secondsSince1970(device.now()));
             if (i % 100 == 0) {
                 message.payload.merge({{"session_output_running", true},
                                        {"session_input_running", true},

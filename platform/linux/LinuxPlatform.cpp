@@ -102,62 +102,65 @@ private:
     UniqueFunction<void()> read_;
 };
 
-/// In the order in which they depend on each other.
 struct LinuxPlatform::Services {
-    explicit Services(const Directories& directories)
-        : namedNotifications(directories.notifications(), log),
-          notificationChanges([this] {
-              // A post may tell of a preference that was written just before it.
-              namedNotifications.deliverPosts([this] { preferences.readChanges(); });
-          }),
-          deviceProperties(directories.deviceProperties(), log),
-          preferences(directories.preferences(), log),
-          preferenceChanges([this] { preferences.readChanges(); }),
-          analyticsEvents(directories.logs, clock, preferences, log),
-          powerEvents(directories.logs, clock, log),
-          diagnosticsMetrics(directories.logs, clock, log),
-          callQuality(directories.logs, clock, preferences, workQueues, log),
-          reportFiles(directories.logs),
-          bugCapture(directories.logs, clock, workQueues, log),
-          bugReportDrafting(directories.logs, clock, log),
-          memoryLog(directories.logs, clock, workQueues, log),
-          chanlog(directories.driverChannels(), log),
-          accessories(log),
-          connections(loop, log),
-          diagnosticCapture(
-              directories.logs, clock, workQueues, [this] { return connections.clientProcesses(); }, log) {}
-    ~Services() { bugCapture.endSessions(); }
+    explicit Services(const Directories& places) : directories(places) {}
+    ~Services() {
+        bugCapture.endSessions();
+        // What was posted is worked off while everything is there, and what the loop drives goes before it.
+        platform.workQueues.reset();
+        platform.diagnosticCapture.reset();
+        platform.connections.reset();
+    }
     Services(const Services&) = delete;
     Services& operator=(const Services&) = delete;
 
+    const Directories directories;
+    Platform platform;
     // First, as it makes sure that standard error is open before anything else can take its number.
-    LinuxStructuredLog log;
+    LinuxStructuredLog& log = provide<LinuxStructuredLog>(platform.log);
     Signals signals;
-    LinuxClock clock;
-    LinuxTracePoints tracePoints;
-    LinuxProcessInformation processInformation;
-    LinuxDeviceConditions deviceConditions;
-    LinuxNamedNotifications namedNotifications;
-    Changes notificationChanges;
-    LinuxDeviceProperties deviceProperties;
-    LinuxPreferences preferences;
-    Changes preferenceChanges;
-    LinuxAnalyticsEventService analyticsEvents;
-    LinuxPowerEventLog powerEvents;
-    LinuxDiagnosticsMetrics diagnosticsMetrics;
-    LinuxCallQualityService callQuality;
-    LinuxReportFiles reportFiles;
-    LinuxBugCaptureService bugCapture;
-    LinuxBugReportDrafting bugReportDrafting;
-    LinuxMemoryLog memoryLog;
-    LinuxChanlogFacility chanlog;
-    LinuxProcessSampling processSampling;
-    LinuxAccessories accessories;
     EventLoop loop;
-    LinuxConnectionService connections;
-    LinuxDiagnosticCapture diagnosticCapture;
-    // Behind what its work uses: it works off what was posted before it goes.
-    LinuxWorkQueues workQueues;
+    LinuxClock& clock = provide<LinuxClock>(platform.clock);
+    LinuxWorkQueues& workQueues = provide<LinuxWorkQueues>(platform.workQueues);
+    LinuxTracePoints& tracePoints = provide<LinuxTracePoints>(platform.tracePoints);
+    LinuxProcessInformation& processInformation =
+        provide<LinuxProcessInformation>(platform.processInformation);
+    LinuxDeviceConditions& deviceConditions = provide<LinuxDeviceConditions>(platform.deviceConditions);
+    LinuxNamedNotifications& namedNotifications =
+        provide<LinuxNamedNotifications>(platform.namedNotifications, directories.notifications(), log);
+    LinuxDeviceProperties& deviceProperties =
+        provide<LinuxDeviceProperties>(platform.deviceProperties, directories.deviceProperties(), log);
+    LinuxPreferences& preferences =
+        provide<LinuxPreferences>(platform.preferences, directories.preferences(), log);
+    LinuxAnalyticsEventService& analyticsEvents = provide<LinuxAnalyticsEventService>(
+        platform.analyticsEvents, directories.logs, clock, preferences, log);
+    LinuxPowerEventLog& powerEvents =
+        provide<LinuxPowerEventLog>(platform.powerEvents, directories.logs, clock, log);
+    LinuxDiagnosticsMetrics& diagnosticsMetrics =
+        provide<LinuxDiagnosticsMetrics>(platform.diagnosticsMetrics, directories.logs, clock, log);
+    LinuxCallQualityService& callQuality = provide<LinuxCallQualityService>(
+        platform.callQuality, directories.logs, clock, preferences, workQueues, log);
+    LinuxReportFiles& reportFiles = provide<LinuxReportFiles>(platform.reportFiles, directories.logs);
+    LinuxBugCaptureService& bugCapture =
+        provide<LinuxBugCaptureService>(platform.bugCapture, directories.logs, clock, workQueues, log);
+    LinuxBugReportDrafting& bugReportDrafting =
+        provide<LinuxBugReportDrafting>(platform.bugReportDrafting, directories.logs, clock, log);
+    LinuxMemoryLog& memoryLog =
+        provide<LinuxMemoryLog>(platform.memoryLog, directories.logs, clock, workQueues, log);
+    LinuxChanlogFacility& chanlog =
+        provide<LinuxChanlogFacility>(platform.chanlog, directories.driverChannels(), log);
+    LinuxProcessSampling& processSampling = provide<LinuxProcessSampling>(platform.processSampling);
+    LinuxAccessories& accessories = provide<LinuxAccessories>(platform.accessories, log);
+    LinuxConnectionService& connections = provide<LinuxConnectionService>(platform.connections, loop, log);
+    LinuxDiagnosticCapture& diagnosticCapture = provide<LinuxDiagnosticCapture>(
+        platform.diagnosticCapture, directories.logs, clock, workQueues,
+        [this] { return connections.clientProcesses(); }, log);
+
+    Changes notificationChanges{[this] {
+        // A post may tell of a preference that was written just before it.
+        namedNotifications.deliverPosts([this] { preferences.readChanges(); });
+    }};
+    Changes preferenceChanges{[this] { preferences.readChanges(); }};
     std::optional<InlineDrain> drain;
 };
 
@@ -183,29 +186,8 @@ LinuxPlatform::LinuxPlatform(const Directories& directories)
 
 LinuxPlatform::~LinuxPlatform() = default;
 
-Platform LinuxPlatform::services() {
-    return {.clock = services_->clock,
-            .workQueues = services_->workQueues,
-            .log = services_->log,
-            .tracePoints = services_->tracePoints,
-            .deviceProperties = services_->deviceProperties,
-            .preferences = services_->preferences,
-            .namedNotifications = services_->namedNotifications,
-            .processInformation = services_->processInformation,
-            .deviceConditions = services_->deviceConditions,
-            .analyticsEvents = services_->analyticsEvents,
-            .powerEvents = services_->powerEvents,
-            .diagnosticsMetrics = services_->diagnosticsMetrics,
-            .callQuality = services_->callQuality,
-            .reportFiles = services_->reportFiles,
-            .bugCapture = services_->bugCapture,
-            .bugReportDrafting = services_->bugReportDrafting,
-            .diagnosticCapture = services_->diagnosticCapture,
-            .memoryLog = services_->memoryLog,
-            .chanlog = services_->chanlog,
-            .processSampling = services_->processSampling,
-            .accessories = services_->accessories,
-            .connections = services_->connections};
+const Platform& LinuxPlatform::services() const noexcept {
+    return services_->platform;
 }
 
 void LinuxPlatform::flushSinks() {

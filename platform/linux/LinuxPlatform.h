@@ -21,8 +21,8 @@ public:
     LinuxPlatform(const LinuxPlatform&) = delete;
     LinuxPlatform& operator=(const LinuxPlatform&) = delete;
 
-    /// To be installed as the platform of the process.
-    [[nodiscard]] Platform services();
+    /// The services behind the interfaces. They live as long as this does.
+    [[nodiscard]] const Platform& services() const noexcept;
 
     /// Carries out requests until the first SIGTERM or SIGINT, then `shutDown`, and returns once that has
     /// called the completion that it is given. The request queue is written out and answered batch by batch:

@@ -31,8 +31,7 @@ public:
                           std::string(line.substr(text))});
     }
 
-    /// Every category writes from this level on; takes effect with the next platform, or
-    /// `forgetLogThresholds`.
+    /// What each category is told when the context is made.
     void setThreshold(LogLevel level) noexcept { threshold_ = level; }
     [[nodiscard]] std::vector<Line> lines() const {
         const std::lock_guard held(mutex_);

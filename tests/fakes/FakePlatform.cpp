@@ -1,55 +1,40 @@
 #include "tests/fakes/FakePlatform.h"
 
-#include "util/InternalBuild.h"
 #include "util/LogCategories.h"
-#include "util/ReportingServerQueue.h"
+
+#include <utility>
 
 namespace tamblo {
 
 FakePlatform::FakePlatform(LogLevel threshold, bool isInternalBuild) {
     log.setThreshold(threshold);
+    setInternalBuild(isInternalBuild);
+}
+
+void FakePlatform::setThreshold(LogLevel threshold) {
+    log.setThreshold(threshold);
+    for (const LogCategory& category : log_categories::all) {
+        category.turnOn(threshold);
+    }
+}
+
+void FakePlatform::setInternalBuild(bool isInternalBuild) {
     deviceProperties.set("InternalBuild", isInternalBuild);
-    installWith({});
-    forgetLogThresholds();
-    forgetInternalBuild();
-    resetReportingServerQueue();
+    restart();
 }
 
-void FakePlatform::installWith(const Others& others) {
-    const auto choose = [](auto* other, auto& fake) -> auto& {
-        return other != nullptr ? *other : fake;
-    };
-    installPlatform({.clock = clock,
-                     .workQueues = choose(others.workQueues, workQueues),
-                     .log = log,
-                     .tracePoints = choose(others.tracePoints, tracePoints),
-                     .deviceProperties = deviceProperties,
-                     .preferences = preferences,
-                     .namedNotifications = namedNotifications,
-                     .processInformation = processInformation,
-                     .deviceConditions = deviceConditions,
-                     .analyticsEvents = choose(others.analyticsEvents, analyticsEvents),
-                     .powerEvents = powerEvents,
-                     .diagnosticsMetrics = diagnosticsMetrics,
-                     .callQuality = choose(others.callQuality, callQuality),
-                     .reportFiles = reportFiles,
-                     .bugCapture = bugCapture,
-                     .bugReportDrafting = bugReportDrafting,
-                     .diagnosticCapture = diagnosticCapture,
-                     .memoryLog = memoryLog,
-                     .chanlog = choose(others.chanlog, chanlog),
-                     .processSampling = processSampling,
-                     .accessories = accessories,
-                     .connections = connections});
-}
-
-FakePlatform::~FakePlatform() {
-    resetReportingServerQueue();
-    workQueues.workOff();
+void FakePlatform::restart() {
+    context_.reset();
+    context_.emplace(services_);
 }
 
 FakeSerialQueue& FakePlatform::serverQueue() {
-    return static_cast<FakeSerialQueue&>(ZRReportingUtilityGetReportingServerQueue());
+    return static_cast<FakeSerialQueue&>(context().serverQueue());
+}
+
+std::shared_ptr<ZRReportingSession> FakePlatform::makeSession(ReporterID reporterID,
+                                                              std::vector<pid_t> processIdentifiers) {
+    return ZRReportingSession::initWithID(context(), reporterID, std::move(processIdentifiers));
 }
 
 } // namespace tamblo

@@ -1,6 +1,6 @@
 #pragma once
 
-#include "platform/Platform.h"
+#include "session/ZRReportingSession.h"
 #include "tests/fakes/FakeAnalyticsEventService.h"
 #include "tests/fakes/FakeBugCaptureService.h"
 #include "tests/fakes/FakeBugReportDraftingService.h"
@@ -21,54 +21,71 @@
 #include "tests/fakes/FakeReportFiles.h"
 #include "tests/fakes/FakeTracePoints.h"
 #include "tests/fakes/FakeWorkQueues.h"
+#include "util/Context.h"
+
+#include <memory>
+#include <optional>
+#include <vector>
 
 namespace tamblo {
 
-/// A device in memory. Installed for as long as it lives; one at a time, and what a test makes on it goes
+/// A device in memory, and the context of the process on it; one at a time, and what a test makes on it goes
 /// first.
 class FakePlatform {
+    Platform services_;
+
 public:
     /// Lines from this level on are written; without an internal build unless it is asked for.
     explicit FakePlatform(LogLevel threshold = LogLevel::debug, bool isInternalBuild = false);
-    ~FakePlatform();
     FakePlatform(const FakePlatform&) = delete;
     FakePlatform& operator=(const FakePlatform&) = delete;
 
-    /// Services that a test brings along in place of the fakes; null for those that it does not.
-    struct Others {
-        WorkQueues* workQueues = nullptr;
-        TracePoints* tracePoints = nullptr;
-        AnalyticsEventService* analyticsEvents = nullptr;
-        CallQualityService* callQuality = nullptr;
-        ChanlogFacility* chanlog = nullptr;
-    };
-    void installWith(const Others& others);
-
-    /// The process's reporting server queue, which runs when told.
+    [[nodiscard]] Context& context() noexcept { return *context_; }
+    /// The server queue, which runs when told.
     [[nodiscard]] FakeSerialQueue& serverQueue();
+    [[nodiscard]] std::shared_ptr<ZRReportingSession>
+    makeSession(ReporterID reporterID = 5, std::vector<pid_t> processIdentifiers = {1});
 
-    FakeClock clock;
-    FakeWorkQueues workQueues;
-    FakeLog log;
-    FakeTracePoints tracePoints;
-    FakeDeviceProperties deviceProperties;
-    FakePreferences preferences;
-    FakeNamedNotifications namedNotifications;
-    FakeProcessInformation processInformation;
-    FakeDeviceConditions deviceConditions;
-    FakeAnalyticsEventService analyticsEvents;
-    FakePowerEventLog powerEvents;
-    FakeDiagnosticsMetricsService diagnosticsMetrics;
-    FakeCallQualityService callQuality;
-    FakeReportFiles reportFiles;
-    FakeBugCaptureService bugCapture;
-    FakeBugReportDraftingService bugReportDrafting;
-    FakeDiagnosticCaptureService diagnosticCapture;
-    FakeMemoryLog memoryLog;
-    FakeChanlogFacility chanlog;
-    FakeProcessSampling processSampling;
-    FakeAccessories accessories;
-    FakeConnectionService connections;
+    /// From now on, lines from this level on are written.
+    void setThreshold(LogLevel threshold);
+    /// Restarts the process on another build.
+    void setInternalBuild(bool isInternalBuild);
+    /// As if the process were started anew: posted work is done, and nothing that sessions share is left.
+    void restart();
+    /// For a service of a test's own, before it is used; the fake's own is then gone.
+    [[nodiscard]] Platform& services() noexcept { return services_; }
+
+    FakeLog& log = provide<FakeLog>(services_.log);
+    FakeClock& clock = provide<FakeClock>(services_.clock);
+    FakeTracePoints& tracePoints = provide<FakeTracePoints>(services_.tracePoints);
+    FakeProcessInformation& processInformation =
+        provide<FakeProcessInformation>(services_.processInformation);
+    FakeDeviceConditions& deviceConditions = provide<FakeDeviceConditions>(services_.deviceConditions);
+    FakeNamedNotifications& namedNotifications =
+        provide<FakeNamedNotifications>(services_.namedNotifications);
+    FakeDeviceProperties& deviceProperties = provide<FakeDeviceProperties>(services_.deviceProperties);
+    FakePreferences& preferences = provide<FakePreferences>(services_.preferences);
+    FakeAnalyticsEventService& analyticsEvents =
+        provide<FakeAnalyticsEventService>(services_.analyticsEvents);
+    FakePowerEventLog& powerEvents = provide<FakePowerEventLog>(services_.powerEvents);
+    FakeDiagnosticsMetricsService& diagnosticsMetrics =
+        provide<FakeDiagnosticsMetricsService>(services_.diagnosticsMetrics);
+    FakeCallQualityService& callQuality = provide<FakeCallQualityService>(services_.callQuality);
+    FakeReportFiles& reportFiles = provide<FakeReportFiles>(services_.reportFiles);
+    FakeBugCaptureService& bugCapture = provide<FakeBugCaptureService>(services_.bugCapture);
+    FakeBugReportDraftingService& bugReportDrafting =
+        provide<FakeBugReportDraftingService>(services_.bugReportDrafting);
+    FakeMemoryLog& memoryLog = provide<FakeMemoryLog>(services_.memoryLog);
+    FakeChanlogFacility& chanlog = provide<FakeChanlogFacility>(services_.chanlog);
+    FakeProcessSampling& processSampling = provide<FakeProcessSampling>(services_.processSampling);
+    FakeAccessories& accessories = provide<FakeAccessories>(services_.accessories);
+    FakeConnectionService& connections = provide<FakeConnectionService>(services_.connections);
+    FakeDiagnosticCaptureService& diagnosticCapture =
+        provide<FakeDiagnosticCaptureService>(services_.diagnosticCapture);
+    FakeWorkQueues& workQueues = provide<FakeWorkQueues>(services_.workQueues);
+
+private:
+    std::optional<Context> context_;
 };
 
 } // namespace tamblo

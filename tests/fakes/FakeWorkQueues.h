@@ -30,7 +30,7 @@ public:
     [[nodiscard]] std::size_t made(std::string_view label) const;
     /// Runs every queue, and makes every delayed call, until nothing is left: nothing holds what it needs any
     /// more.
-    void workOff();
+    void workOff() override;
 
     /// Turns the time of the delayed calls, and makes those that are due.
     void elapse(std::chrono::milliseconds time);

@@ -2,7 +2,6 @@
 
 #include "service/ZRReportingClientServerInstance.h"
 #include "service/ZRReportingService.h"
-#include "system/ZRReportingSystemMonitor.h"
 #include "tests/fakes/FakePlatform.h"
 #include "tests/fakes/Messages.h"
 #include "tests/session/ScriptedWorkers.h"
@@ -30,7 +29,6 @@ protected:
     }
     ~ServiceTestBase() override {
         (void)run();
-        ZRReportingSystemMonitor::reset();
         script.reset();
     }
 
@@ -106,7 +104,7 @@ protected:
     WorkerScript& script = WorkerScript::current();
     std::vector<std::string> replies;
     std::unique_ptr<ZRReportingService> service =
-        std::make_unique<ZRReportingService>([](int status) { exitStatus() = status; });
+        std::make_unique<ZRReportingService>(device.context(), [](int status) { exitStatus() = status; });
 };
 
 } // namespace tamblo

@@ -70,7 +70,7 @@ TEST_F(IntakeTest, TagAndApplicationName) {
     ZRReportingSession::addAudioMessageTag(*message);
     EXPECT_EQ(message->payload().find("audiotag")->stringValue(), "Session_PlaybackStart");
 
-    const auto session = ZRReportingSession::initWithID(5, {1});
+    const auto session = device.makeSession(5, {1});
     session->updateConfigurationWithContentsOfConfiguration({{"HostApplicationDisplayID", "com.configured"}});
     const std::pair<Value, const char*> names[] = {
         {"com.mine", "com.mine"}, {"Unknown", "com.configured"}, {"unknown", "unknown"}, {"", ""}};
@@ -121,7 +121,7 @@ TEST_F(IntakeTest, WhatIsRedundant) {
         {"a subsystem's Error", 0x2000000B, 11, {{"a", 1}}, {{"a", 1}}, true},
     };
     for (const auto& c : cases) {
-        const auto session = ZRReportingSession::initWithID(5, {1});
+        const auto session = device.makeSession(5, {1});
         const auto first = makeMessage(c.first, c.category, c.type);
         const auto second = makeMessage(c.second, c.category, c.type);
         session->sendMessage(first);
@@ -154,7 +154,7 @@ bool walkSaysRedundant(const std::vector<MessageRef>& accepted, const ZRReportin
 TEST_F(IntakeTest, TheIndexSaysWhatAWalkOverTheListWouldAlsoAfterTheSort) {
     std::mt19937 random(7);
     const auto upTo = [&](int most) { return static_cast<int>(random() % static_cast<unsigned>(most + 1)); };
-    const auto session = ZRReportingSession::initWithID(5, {1});
+    const auto session = device.makeSession(5, {1});
     int redundant = 0;
     const auto sendRandom = [&] {
         constexpr AudioEventCategory kCategories[] = {8, 11, 14, 0x2000000B, 0x08000004};

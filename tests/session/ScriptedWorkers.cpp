@@ -12,8 +12,8 @@ namespace {
 
 class ScriptedWorker final : public ZRReportingSessionWorkerConsumerProtocol {
 public:
-    ScriptedWorker(const std::shared_ptr<ZRReportingSession>& session, std::string name)
-        : ZRReportingSessionWorkerConsumerProtocol(session), name_(std::move(name)) {}
+    ScriptedWorker(Context& context, const std::shared_ptr<ZRReportingSession>& session, std::string name)
+        : ZRReportingSessionWorkerConsumerProtocol(context, session), name_(std::move(name)) {}
 
     std::optional<bool> start() override {
         if (name_ == "Only" || name_ == "Redundant") {
@@ -43,11 +43,12 @@ constexpr std::array<std::string_view, 7> kNames{"Only",      "Producer", "Both"
                                                  "Redundant", "Absent",   "Late"};
 
 template <std::size_t Row>
-std::shared_ptr<ZRReportingSessionWorkerProtocol> make(const std::shared_ptr<ZRReportingSession>& session) {
+std::shared_ptr<ZRReportingSessionWorkerProtocol> make(Context& context,
+                                                       const std::shared_ptr<ZRReportingSession>& session) {
     if (WorkerScript::current().refusing.contains(kNames[Row])) {
         return nullptr;
     }
-    return std::make_shared<ScriptedWorker>(session, std::string(kNames[Row]));
+    return std::make_shared<ScriptedWorker>(context, session, std::string(kNames[Row]));
 }
 
 constexpr std::array<WorkerClass, 7> kClasses{{

@@ -18,7 +18,7 @@ protected:
     ~SessionTest() override { script.reset(); }
 
     std::shared_ptr<ZRReportingSession> makeSession() {
-        auto session = ZRReportingSession::initWithID(77, {42});
+        auto session = device.makeSession(77, {42});
         (void)script.take();
         return session;
     }
@@ -35,7 +35,7 @@ protected:
 };
 
 TEST_F(SessionTest, WorkersStartAndStopInOrder) {
-    const auto session = ZRReportingSession::initWithID(77, {42});
+    const auto session = device.makeSession(77, {42});
     EXPECT_THAT(script.take(), ElementsAre("start Init"));
     EXPECT_EQ(session->workerInstanceCount(), 2U);
     EXPECT_FALSE(session->started());

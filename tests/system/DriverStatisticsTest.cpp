@@ -48,11 +48,8 @@ std::string textOf(const ChanlogChannel& channel,
 /// Sessions with their real workers on a device whose channels a test sets.
 class DriverStatisticsTest : public testing::Test {
 protected:
-    DriverStatisticsTest() { Utility::reset(); }
-    ~DriverStatisticsTest() override { Utility::reset(); }
-
-    static std::shared_ptr<ZRReportingSession> startedSession() {
-        auto session = ZRReportingSession::initWithID(7, {100});
+    std::shared_ptr<ZRReportingSession> startedSession() {
+        auto session = device.makeSession(7, {100});
         session->start();
         return session;
     }
@@ -104,7 +101,12 @@ TEST_F(DriverStatisticsTest, TheFirstStartSubscribesToTheGroupsThatThereAre) {
                             "1 couldn't find any channels for driver group pdm-(null)",
                             "1 sampling driver Speaker-(null)", "1 sampling driver (null)-MCA",
                             "1 sampling driver Haptics-Stats"));
-    EXPECT_EQ(Utility::shared().ioChannelSubscriptions()[1].subscribedChannels()->size(), 1U);
+    EXPECT_EQ(device.context()
+                  .shared<Utility>(device.chanlog)
+                  .ioChannelSubscriptions()[1]
+                  .subscribedChannels()
+                  ->size(),
+              1U);
 
     device.chanlog.channels.push_back(simple(1, "pdm"));
     device.chanlog.calls.clear();
@@ -122,16 +124,16 @@ TEST_F(DriverStatisticsTest, WithoutChannelsNothingIsAskedAgain) {
 TEST_F(DriverStatisticsTest, ADriverThatFailsIsAbsent) {
     device.chanlog.channels = {simple(5, "Speaker")};
     device.chanlog.channelsError = 13;
-    EXPECT_THAT(Utility().ioChannelSubscriptions(), IsEmpty());
+    EXPECT_THAT(Utility(device.chanlog).ioChannelSubscriptions(), IsEmpty());
     EXPECT_EQ(lines()[2], "3 error 13 getting channels for driver Speaker-(null)");
     device.chanlog.channelsError.reset();
     device.chanlog.subscribeError = 14;
-    EXPECT_THAT(Utility().ioChannelSubscriptions(), IsEmpty());
+    EXPECT_THAT(Utility(device.chanlog).ioChannelSubscriptions(), IsEmpty());
     EXPECT_EQ(lines()[2], "3 error 14 creating subscription for Speaker-(null)");
 
     device.chanlog.subscribeError.reset();
-    const Utility utility;
-    const auto session = ZRReportingSession::initWithID(7, {100});
+    const Utility utility(device.chanlog);
+    const auto session = device.makeSession(7, {100});
     (void)lines();
     for (const auto& [code, line] : {std::pair(0, ""), std::pair(15, "3 ChanlogCreateSamples error 15")}) {
         device.chanlog.sampleError = code;

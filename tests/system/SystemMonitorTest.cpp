@@ -21,11 +21,9 @@ constexpr const char* kReporting = "com.vandra.tamblo.reporting";
 
 class SystemMonitorTest : public testing::Test {
 protected:
-    ~SystemMonitorTest() override { ZRReportingSystemMonitor::reset(); }
-
     std::shared_ptr<SystemMonitorDictionary> makeMonitor() {
-        ZRReportingSystemMonitor::initializeWithQueue(device.serverQueue());
-        return ZRReportingSystemMonitor::getSystemMonitorDictionary();
+        ZRReportingSystemMonitor::initializeWithQueue(device.context(), device.serverQueue());
+        return ZRReportingSystemMonitor::getSystemMonitorDictionary(device.context());
     }
     void post(const std::string& name, std::uint64_t word) {
         device.namedNotifications.post(name, word);
@@ -88,7 +86,7 @@ TEST_F(SystemMonitorTest, ReadsPreferencesAtOnceAndTheRingerAtItsFirstNotificati
 }
 
 TEST_F(SystemMonitorTest, RingerIsOnForTheWordOneOnly) {
-    const auto monitor = ZRReportingSystemMonitor::initWithQueue(device.serverQueue());
+    const auto monitor = ZRReportingSystemMonitor::initWithQueue(device.services(), device.serverQueue());
     EXPECT_EQ(monitor->getFeatureState("ringerstate"), std::nullopt) << "never posted: the read fails";
     for (const std::uint64_t word :
          {std::uint64_t{1}, std::uint64_t{0}, std::uint64_t{2}, UINT64_MAX, (std::uint64_t{1} << 32U) + 1}) {
@@ -109,7 +107,7 @@ TEST_F(SystemMonitorTest, RingerIsOnForTheWordOneOnly) {
 TEST_F(SystemMonitorTest, FailedRegistrationsAreLoggedAndNeverValued) {
     device.namedNotifications.registrationStatus = 7;
     device.preferences.set("device_name", "com.vandra.tamblo", "den");
-    const auto monitor = ZRReportingSystemMonitor::initWithQueue(device.serverQueue());
+    const auto monitor = ZRReportingSystemMonitor::initWithQueue(device.services(), device.serverQueue());
     EXPECT_EQ(device.log.count("notify setup result 7 token 0"), 3U);
     EXPECT_EQ(monitor->features().find("ringerstate")->dictionaryValue().find("notify_token")->integerValue(),
               0);
@@ -120,20 +118,21 @@ TEST_F(SystemMonitorTest, FailedRegistrationsAreLoggedAndNeverValued) {
 }
 
 TEST_F(SystemMonitorTest, DefaultsAreReadOnce) {
-    const auto unset = ZRReportingSystemMonitor::initWithQueue(device.serverQueue());
+    const auto unset = ZRReportingSystemMonitor::initWithQueue(device.services(), device.serverQueue());
     EXPECT_EQ(unset->getDefaults(), (Dictionary{{"disable_reporting", false}}));
     device.preferences.set("device_name", "com.vandra.tamblo", 42);
     device.preferences.set("disable_reporting", "com.vandra.tamblo", "YES");
     EXPECT_EQ(unset->getDefaults(), (Dictionary{{"disable_reporting", false}}));
-    const Dictionary set = ZRReportingSystemMonitor::initWithQueue(device.serverQueue())->getDefaults();
+    const Dictionary set =
+        ZRReportingSystemMonitor::initWithQueue(device.services(), device.serverQueue())->getDefaults();
     EXPECT_EQ(set, (Dictionary{{"device_name", "42"}, {"disable_reporting", true}}));
     EXPECT_EQ(set.find("disable_reporting")->kind(), Value::Kind::boolean);
 }
 
 TEST_F(SystemMonitorTest, OneForTheProcessUntilItIsReset) {
-    EXPECT_EQ(ZRReportingSystemMonitor::getSystemMonitorDictionary(), nullptr);
-    EXPECT_THAT(ZRReportingSystemMonitor::getSystemMonitorKeys(), IsEmpty());
-    ZRReportingSystemMonitor::reset();
+    EXPECT_EQ(ZRReportingSystemMonitor::getSystemMonitorDictionary(device.context()), nullptr);
+    EXPECT_THAT(ZRReportingSystemMonitor::getSystemMonitorKeys(device.context()), IsEmpty());
+    ZRReportingSystemMonitor::reset(device.context());
     std::vector<std::thread> makers;
     for (int i = 0; i != 4; ++i) {
         makers.emplace_back([this] { (void)makeMonitor(); });
@@ -142,18 +141,18 @@ TEST_F(SystemMonitorTest, OneForTheProcessUntilItIsReset) {
         maker.join();
     }
     EXPECT_EQ(device.namedNotifications.registrationCount(), 3U);
-    EXPECT_THAT(ZRReportingSystemMonitor::getSystemMonitorKeys(),
+    EXPECT_THAT(ZRReportingSystemMonitor::getSystemMonitorKeys(device.context()),
                 ElementsAre("device_name", "ringerstate", kSpatial));
 
-    const auto first = ZRReportingSystemMonitor::getSystemMonitorDictionary();
+    const auto first = ZRReportingSystemMonitor::getSystemMonitorDictionary(device.context());
     FakeSerialQueue other("other");
-    ZRReportingSystemMonitor::initializeWithQueue(other);
-    EXPECT_EQ(ZRReportingSystemMonitor::getSystemMonitorDictionary(), first);
+    ZRReportingSystemMonitor::initializeWithQueue(device.context(), other);
+    EXPECT_EQ(ZRReportingSystemMonitor::getSystemMonitorDictionary(device.context()), first);
     device.namedNotifications.post(kRinger, 1);
     EXPECT_EQ(other.runAll(), 0U);
     EXPECT_TRUE(first->find("ringerstate").empty()) << "the first queue runs the handler";
 
-    ZRReportingSystemMonitor::reset(); // with a notification on its way
+    ZRReportingSystemMonitor::reset(device.context()); // with a notification on its way
     EXPECT_EQ(device.namedNotifications.registrationCount(), 0U);
     const auto second = makeMonitor();
     EXPECT_NE(second, first);

@@ -22,11 +22,12 @@ constexpr std::size_t kObservations = 3; ///< of a started session
 /// Sessions with their real workers beside a monitor.
 class SystemMonitorWorkerTest : public testing::Test {
 protected:
-    SystemMonitorWorkerTest() { ZRReportingSystemMonitor::initializeWithQueue(device.serverQueue()); }
-    ~SystemMonitorWorkerTest() override { ZRReportingSystemMonitor::reset(); }
+    SystemMonitorWorkerTest() {
+        ZRReportingSystemMonitor::initializeWithQueue(device.context(), device.serverQueue());
+    }
 
-    static std::shared_ptr<ZRReportingSession> startedSession(ReporterID reporterID) {
-        auto session = ZRReportingSession::initWithID(reporterID, {100});
+    std::shared_ptr<ZRReportingSession> startedSession(ReporterID reporterID) {
+        auto session = device.makeSession(reporterID, {100});
         session->start();
         return session;
     }
@@ -56,7 +57,7 @@ protected:
                                    {"HostApplicationDisplayID", "Unknown"}});
     }
     std::size_t observationCount() {
-        return ZRReportingSystemMonitor::getSystemMonitorDictionary()->observationCount();
+        return ZRReportingSystemMonitor::getSystemMonitorDictionary(device.context())->observationCount();
     }
 
     FakePlatform device{LogLevel::fault};
@@ -126,10 +127,10 @@ TEST_F(SystemMonitorWorkerTest, SessionThatIsDroppedWhileStartedLeavesNothingBeh
 TEST_F(SystemMonitorWorkerTest, WorkersKeepTheSnapshotThatTheyFound) {
     post(kRinger, 1);
     const auto session = startedSession(1);
-    ZRReportingSystemMonitor::reset();
+    ZRReportingSystemMonitor::reset(device.context());
     const auto between = startedSession(2);
     EXPECT_THAT(sent(between), IsEmpty()) << "no monitor, no features";
-    ZRReportingSystemMonitor::initializeWithQueue(device.serverQueue());
+    ZRReportingSystemMonitor::initializeWithQueue(device.context(), device.serverQueue());
     post(kRinger, 0);
     EXPECT_EQ(session->totalMessageCount(), 1);
     EXPECT_EQ(between->totalMessageCount(), 0);

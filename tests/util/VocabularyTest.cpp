@@ -1,6 +1,6 @@
 #include "tests/fakes/FakePlatform.h"
 #include "util/AudioEvents.h"
-#include "util/InternalBuild.h"
+#include "util/Context.h"
 #include "util/Log.h"
 
 #include <gmock/gmock.h>

@@ -80,9 +80,7 @@ TEST(AccessoryRegistryTest, ForgetsThoseUnseenForTheLongestTime) {
 
 class AudioRegistrationWorkerTest : public WorkerTest {
 protected:
-    AudioRegistrationWorkerTest() : WorkerTest(LogLevel::info) {
-        ZRReportingSessionAudioRegistrationWorker::forgetLastLookup();
-    }
+    AudioRegistrationWorkerTest() : WorkerTest(LogLevel::info) {}
     /// Starts a session, some time after the one before; `run` has what it posted run.
     void startSession(std::chrono::seconds later = 1min) {
         device.clock.advance(later);

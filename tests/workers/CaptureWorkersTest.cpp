@@ -177,7 +177,7 @@ TEST_F(DPWorkerTest, TellsOfEveryOtherMessageWhenDebuggingAndElseCostsNothing) {
     const std::string told = "Did not drop stackburst, right conditions not met: buffer size : 7, time diff";
     worker->handleMessage(message);
     EXPECT_THAT(device.log.texts(told), SizeIs(1));
-    setLogThreshold(LogLevel::info);
+    device.setThreshold(LogLevel::info);
     worker->handleMessage(message);
     EXPECT_EQ(test::allocationsOf([&] { worker->handleMessage(message); }).blocks, 0U);
     EXPECT_THAT(device.log.texts(told), SizeIs(1));
@@ -221,8 +221,8 @@ TEST_F(DPWorkerTest, AValueOfTheWrongKindIsOneErrorLineUntilItChanges) {
         std::string told;
         for (int reading = 0; reading < 2; ++reading) {
             (void)logged(ZRReportingDPLogCategory());
-            EXPECT_EQ(Worker::getRunTimeDefaults("io_cycle"), value.integerValue());
-            EXPECT_EQ(Worker::getEnableFlag("enable_stackburst"), value.boolValue());
+            EXPECT_EQ(Worker::getRunTimeDefaults(device.context(), "io_cycle"), value.integerValue());
+            EXPECT_EQ(Worker::getEnableFlag(device.context(), "enable_stackburst"), value.boolValue());
             told += loggedLevels(ZRReportingDPLogCategory());
         }
         EXPECT_EQ(told, std::string("ee").substr(0, static_cast<std::size_t>(faults))) << jsonText(value);

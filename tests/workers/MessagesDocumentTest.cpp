@@ -55,13 +55,12 @@ std::map<std::string, Section> sectionsOfThePage() {
 class MessagesDocumentTest : public WorkerTest {
 protected:
     MessagesDocumentTest() : WorkerTest(LogLevel::error) {}
-    ~MessagesDocumentTest() override { ZRReportingSystemMonitor::reset(); }
 
     /// Plays the page's session, on a device that reports about itself.
     void playTheSessionOfThePage() {
         device.preferences.set("device_name", "com.vandra.tamblo", "Kitchen");
         device.preferences.set("spatial-audio-accessory-feature", "com.vandra.dashlo", true);
-        ZRReportingSystemMonitor::initializeWithQueue(device.serverQueue());
+        ZRReportingSystemMonitor::initializeWithQueue(device.context(), device.serverQueue());
         device.namedNotifications.post("com.vandra.dashlo.ringerstate", 1);
         (void)device.serverQueue().runAll();
         session = makeSession(AudioServiceTypeTelephony, {{"HostApplicationDisplayID", "com.example.phone"}});

@@ -1,6 +1,5 @@
 #include "base/Format.h"
 #include "tests/workers/WorkerTest.h"
-#include "util/LogText.h"
 #include "workers/sinks/LinkmeterSummary.h"
 #include "workers/sinks/ZRReportingSessionRtcWorker.h"
 
@@ -245,6 +244,7 @@ TEST_F(RtcWorkerTest, TheSummaryJoinsWhatWasSentOnceWhileStarted) {
     EXPECT_EQ(*summary.payload.find("ZR_Session_Summary_Event"), Value("2"));
     EXPECT_FALSE(summary.payload.contains("early"));
     setInternalBuild(true);
+    session = makeSession(AudioServiceTypeTelephony);
     session->start();
     run();
     findBackends();

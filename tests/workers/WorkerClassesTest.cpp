@@ -48,7 +48,9 @@ TEST_F(WorkerClassesTest, RefuseSessionsOnBuildsAndDevicesThatDoNotWantThem) {
         }
         std::string refusing;
         for (const WorkerClass& row : workerClassList()) {
-            refusing += row.initWithSession(makeSession(c.type)) == nullptr ? shortName(row) + " " : "";
+            refusing += row.initWithSession(device.context(), makeSession(c.type)) == nullptr
+                            ? shortName(row) + " "
+                            : "";
         }
         EXPECT_EQ(refusing, c.refusing);
     }

@@ -2,7 +2,6 @@
 
 #include "tests/fakes/FakePlatform.h"
 #include "tests/fakes/Messages.h"
-#include "util/InternalBuild.h"
 #include "util/LogCategories.h"
 
 #include <gmock/gmock.h>
@@ -27,20 +26,22 @@ protected:
     explicit WorkerTest(LogLevel threshold = LogLevel::debug, bool isInternalBuild = false)
         : device(threshold, isInternalBuild), session(makeSession()) {}
 
-    static std::shared_ptr<ZRReportingSession> makeSession(AudioServiceType type = AudioServiceTypeUnknown,
-                                                           const Dictionary& configuration = {},
-                                                           ReporterID reporterID = 5) {
-        auto made = ZRReportingSession::initWithID(reporterID, {kClient, kOtherClient});
+    std::shared_ptr<ZRReportingSession> makeSession(AudioServiceType type = AudioServiceTypeUnknown,
+                                                    const Dictionary& configuration = {},
+                                                    ReporterID reporterID = 5) {
+        auto made = device.makeSession(reporterID, {kClient, kOtherClient});
         made->setServiceType(type);
         made->setClientProcessName("caller");
         made->updateConfigurationWithContentsOfConfiguration(configuration);
         return made;
     }
     /// A worker of the session that the session itself does not have.
-    template <typename Worker> std::shared_ptr<Worker> make() { return std::make_shared<Worker>(session); }
+    template <typename Worker> std::shared_ptr<Worker> make() {
+        return std::make_shared<Worker>(device.context(), session);
+    }
     /// The same from the class's factory, null when it refuses.
     template <typename Worker> std::shared_ptr<Worker> tryToMake() {
-        return std::static_pointer_cast<Worker>(Worker::initWithSession(session));
+        return std::static_pointer_cast<Worker>(Worker::initWithSession(device.context(), session));
     }
     MessageRef send(Dictionary payload, AudioEventCategory category = AudioEventKindPlayback,
                     AudioEventType type = AudioEventTypeGeneric) {
@@ -49,13 +50,11 @@ protected:
         return message;
     }
 
+    /// Restarts the process on another build, with a new session.
     void setInternalBuild(bool isInternal) {
-        device.deviceProperties.set("InternalBuild", isInternal);
-        forgetInternalBuild();
-    }
-    void setLogThreshold(LogLevel level) {
-        device.log.setThreshold(level);
-        forgetLogThresholds();
+        session.reset();
+        device.setInternalBuild(isInternal);
+        session = makeSession();
     }
     /// `L TEXT` of the category's lines above debug since the last call, `L` for the level's first letter.
     std::vector<std::string> logged(const LogCategory& category) {

@@ -37,7 +37,6 @@ public:
 class ZephWorkerTest : public WorkerTest {
 protected:
     ZephWorkerTest() : WorkerTest(LogLevel::debug, true) {}
-    ~ZephWorkerTest() override { ZRReportingSessionZephWorker::reset(); }
 
     void startSession(AudioServiceType type, bool isSingle = false) {
         session = makeSession(type);
@@ -100,8 +99,9 @@ TEST_F(ZephWorkerTest, DetectorsFireAtTheirThresholdsAndBeginAnew) {
     constexpr ZephWorkerInstanceClass scripted{
         .name = "Scripted",
         .messageType = AudioEventTypeState,
-        .initWithSession = [](const auto& owner) -> std::unique_ptr<ZRReportingSessionZephWorkerInstance> {
-            auto detector = std::make_unique<ScriptedDetector>(owner);
+        .initWithSession = [](Context& context,
+                              const auto& owner) -> std::unique_ptr<ZRReportingSessionZephWorkerInstance> {
+            auto detector = std::make_unique<ScriptedDetector>(context, owner);
             detector->setWorkerState(state);
             return detector;
         }};
@@ -232,13 +232,13 @@ TEST_F(ZephWorkerTest, AnswersComeOnAnyThreadAndWhenEverythingIsGone) {
     sendLow();
     sendLeak(kSoundKey);
     session.reset();
-    ZRReportingSessionZephWorker::reset();
+    device.restart();
     device.bugCapture.answer(kOpened);
     device.bugCapture.answer(kOpened);
     EXPECT_EQ(device.log.count("Started Zeph session for"), 2U);
     startSession(AudioServiceTypeAlarms);
     sendLow();
-    setLogThreshold(LogLevel::fault); // the log's lock would keep the threads apart
+    device.setThreshold(LogLevel::fault); // the log's lock would keep the threads apart
     std::thread answering([this] { device.bugCapture.answer(kOpened); });
     for (int i = 0; i < 20; ++i) {
         session->stop();

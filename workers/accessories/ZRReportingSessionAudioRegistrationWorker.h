@@ -22,9 +22,6 @@ public:
 
     std::optional<bool> start() override;
     void handleMessage(const MessageRef&) override {}
-
-    /// Has the next start look whenever the last lookup was: after another platform was installed.
-    static void forgetLastLookup() noexcept;
 };
 
 } // namespace tamblo

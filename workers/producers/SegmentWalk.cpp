@@ -1,7 +1,7 @@
 #include "workers/producers/SegmentWalk.h"
 
 #include "base/Format.h"
-#include "util/LogText.h"
+#include "util/Log.h"
 #include "util/MessageKeys.h"
 #include "util/NumberBuckets.h"
 #include "util/SummaryBuckets.h"

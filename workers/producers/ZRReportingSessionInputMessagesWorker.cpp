@@ -2,7 +2,6 @@
 
 #include "session/ZRReportingSession.h"
 #include "util/Log.h"
-#include "util/LogText.h"
 #include "util/MessageKeys.h"
 #include "util/ReportingUtilities.h"
 #include "workers/producers/PayloadFields.h"

@@ -2,7 +2,7 @@
 
 #include "session/WorkerClass.h"
 #include "session/ZRReportingSession.h"
-#include "util/InternalBuild.h"
+#include "util/Context.h"
 #include "util/Log.h"
 #include "util/MessageKeys.h"
 #include "workers/producers/PayloadFields.h"

@@ -1,6 +1,5 @@
 #include "workers/producers/ZRReportingSessionSummaryWorker.h"
 
-#include "platform/Platform.h"
 #include "session/ZRReportingSession.h"
 #include "util/Log.h"
 #include "util/MessageKeys.h"
@@ -36,12 +35,11 @@ void addFootprint(Dictionary& payload, const ProcessInformation& process) {
     payload.set("vmInfo_phys_footprint_MiB", lowBytes >> 20U);
 }
 
-void addDeviceState(Dictionary& payload) {
-    const Platform& device = platform();
-    payload.set("thermal_state", thermalStateName(device.deviceConditions.thermalState()));
-    payload.set("low_power_enabled", device.deviceConditions.isLowPowerModeEnabled() ? 1 : 0);
-    addFootprint(payload, device.processInformation);
-    const auto [oneMinute, fiveMinutes, fifteenMinutes] = device.processInformation.loadAverages();
+void addDeviceState(Dictionary& payload, const Platform& device) {
+    payload.set("thermal_state", thermalStateName(device.deviceConditions->thermalState()));
+    payload.set("low_power_enabled", device.deviceConditions->isLowPowerModeEnabled() ? 1 : 0);
+    addFootprint(payload, *device.processInformation);
+    const auto [oneMinute, fiveMinutes, fifteenMinutes] = device.processInformation->loadAverages();
     payload.set("load_avg_1_min", oneMinute);
     payload.set("load_avg_5_min", fiveMinutes);
     payload.set("load_avg_15_min", fifteenMinutes);
@@ -49,10 +47,18 @@ void addDeviceState(Dictionary& payload) {
 
 } // namespace
 
+/// Where the keys stand; shared, as messages are of few kinds, and most have neither key.
+struct ZRReportingSessionSummaryWorker::Places {
+    KeyPlaces places{kKeys};
+};
+
+ZRReportingSessionSummaryWorker::ZRReportingSessionSummaryWorker(Context& context,
+                                                                 std::weak_ptr<ZRReportingSession> session)
+    : ZRReportingSessionWorkerConsumerProtocol(context, std::move(session)),
+      places_(context.shared<Places>()) {}
+
 void ZRReportingSessionSummaryWorker::handleMessage(const MessageRef& message) {
-    // One for each thread that does session work: messages are of few kinds, and most have neither key.
-    static thread_local KeyPlaces places(kKeys);
-    const Fields fields(message->payload(), places);
+    const Fields fields(message->payload(), places_.places);
     if (fields.holds(Field::duration)) {
         totalActiveTime_ += fields[Field::duration]->doubleValue();
         ++activeCount_;
@@ -87,7 +93,7 @@ Dictionary ZRReportingSessionSummaryWorker::summaryOf(const ZRReportingSession& 
     if (session.clientProcessName()) {
         payload.set("clientProcessName", *session.clientProcessName());
     }
-    addDeviceState(payload);
+    addDeviceState(payload, platform());
     return payload;
 }
 

@@ -16,7 +16,7 @@ namespace tamblo {
 /// summary comes back to it and counts nothing.
 class ZRReportingSessionSummaryWorker final : public ZRReportingSessionWorkerConsumerProtocol {
 public:
-    using ZRReportingSessionWorkerConsumerProtocol::ZRReportingSessionWorkerConsumerProtocol;
+    ZRReportingSessionSummaryWorker(Context& context, std::weak_ptr<ZRReportingSession> session);
 
     std::optional<bool> start() override { return true; }
     void handleMessage(const MessageRef& message) override;
@@ -28,8 +28,11 @@ public:
     [[nodiscard]] std::uint32_t overloadCount() const noexcept { return overloadCount_; }
 
 private:
+    struct Places;
+
     [[nodiscard]] Dictionary summaryOf(const ZRReportingSession& session) const;
 
+    Places& places_;
     std::uint32_t activeCount_ = 0;
     std::uint32_t overloadCount_ = 0;
     double totalActiveTime_ = 0.0;

@@ -1,12 +1,11 @@
 #include "workers/sinks/CapturePreferences.h"
 
 #include "base/Format.h"
-#include "platform/Platform.h"
+#include "base/Mutex.h"
 #include "util/Log.h"
 
 #include <algorithm>
 #include <map>
-#include <mutex>
 #include <string>
 #include <utility>
 
@@ -14,17 +13,27 @@ namespace tamblo {
 
 namespace {
 
-/// The values that the log knows of, by key.
-struct Reported {
-    std::mutex mutex;
-    std::map<std::string, Value, std::less<>> values;
-};
+/// The values of a wrong kind that the log knows of, by key.
+class Reported {
+public:
+    /// Whether the value is another one than was reported last for its key; it then is the one.
+    [[nodiscard]] bool isNews(std::string_view key, const Value& value) {
+        const MutexLock lock(mutex_);
+        const auto [place, isNew] = values_.emplace(key, value);
+        return isNew || !(std::exchange(place->second, value) == value);
+    }
+    void forget(std::string_view key) {
+        const MutexLock lock(mutex_);
+        const auto found = values_.find(key);
+        if (found != values_.end()) {
+            values_.erase(found);
+        }
+    }
 
-/// Never destroyed: it lives as long as the process.
-Reported& reported() {
-    static Reported& only = *new Reported;
-    return only;
-}
+private:
+    Mutex mutex_;
+    std::map<std::string, Value, std::less<>> values_ TAMBLO_GUARDED_BY(mutex_);
+};
 
 bool beginsWithNumber(std::string_view text) noexcept {
     text.remove_prefix(std::min(text.find_first_not_of(" \t\n\v\f\r"), text.size()));
@@ -60,27 +69,13 @@ std::string_view kindOf(const Value& value) noexcept {
     }
 }
 
-/// Whether the value is another one than was reported last for its key; it then is the one.
-bool isNews(std::string_view key, const Value& value) {
-    const std::lock_guard held(reported().mutex);
-    const auto [place, isNew] = reported().values.emplace(key, value);
-    return isNew || !(std::exchange(place->second, value) == value);
-}
-
-void forget(std::string_view key) {
-    const std::lock_guard held(reported().mutex);
-    const auto found = reported().values.find(key);
-    if (found != reported().values.end()) {
-        reported().values.erase(found);
-    }
-}
-
-std::optional<Value> checked(const PreferencesSuite& suite, std::string_view key, const LogCategory& category,
-                             bool (&isRight)(const Value&) noexcept, std::string_view wanted) {
+std::optional<Value> checked(Reported& reported, const PreferencesSuite& suite, std::string_view key,
+                             const LogCategory& category, bool (&isRight)(const Value&) noexcept,
+                             std::string_view wanted) {
     std::optional<Value> value = suite.value(key);
     if (!value || isRight(*value)) {
-        forget(key);
-    } else if (isNews(key, *value)) {
+        reported.forget(key);
+    } else if (reported.isNews(key, *value)) {
         log::error(category, "preference {} {}: {} in place of {}; it is read as 0",
                    kCapturePreferencesDomain, key, kindOf(*value), wanted);
     }
@@ -89,18 +84,18 @@ std::optional<Value> checked(const PreferencesSuite& suite, std::string_view key
 
 } // namespace
 
-PreferencesSuite capturePreferences() {
-    return PreferencesSuite(platform().preferences, std::string(kCapturePreferencesDomain));
+PreferencesSuite capturePreferences(const Context& context) {
+    return PreferencesSuite(*context.platform().preferences, std::string(kCapturePreferencesDomain));
 }
 
-std::optional<Value> numberPreference(const PreferencesSuite& suite, std::string_view key,
+std::optional<Value> numberPreference(Context& context, const PreferencesSuite& suite, std::string_view key,
                                       const LogCategory& category) {
-    return checked(suite, key, category, isNumberOrItsText, "a number");
+    return checked(context.shared<Reported>(), suite, key, category, isNumberOrItsText, "a number");
 }
 
-std::optional<Value> flagPreference(const PreferencesSuite& suite, std::string_view key,
+std::optional<Value> flagPreference(Context& context, const PreferencesSuite& suite, std::string_view key,
                                     const LogCategory& category) {
-    return checked(suite, key, category, isFlagOrItsText, "true or false");
+    return checked(context.shared<Reported>(), suite, key, category, isFlagOrItsText, "true or false");
 }
 
 } // namespace tamblo

@@ -1,7 +1,8 @@
 #pragma once
 
 #include "platform/Preferences.h"
-#include "util/LogCategory.h"
+#include "util/Context.h"
+#include "util/LogCategories.h"
 
 #include <optional>
 #include <string_view>
@@ -11,16 +12,14 @@ namespace tamblo {
 /// The domain of the preferences by which a developer has an internal build capture or draft something.
 inline constexpr std::string_view kCapturePreferencesDomain = "com.vandra.tamblo.zrreporting";
 
-/// The domain of the installed platform. A suite is no more than a name: what is kept for the process is the
-/// platform's store, which is asked at every reading.
-[[nodiscard]] PreferencesSuite capturePreferences();
+[[nodiscard]] PreferencesSuite capturePreferences(const Context& context);
 
 /// A value that is to be read as a number, or as a flag, if it is set. One of another kind, such as an array,
 /// is answered as well, and reads as `Value` has it; the category gets one error line for it, and another
 /// only when the value has changed. Any thread.
-[[nodiscard]] std::optional<Value> numberPreference(const PreferencesSuite& suite, std::string_view key,
-                                                    const LogCategory& category);
-[[nodiscard]] std::optional<Value> flagPreference(const PreferencesSuite& suite, std::string_view key,
-                                                  const LogCategory& category);
+[[nodiscard]] std::optional<Value> numberPreference(Context& context, const PreferencesSuite& suite,
+                                                    std::string_view key, const LogCategory& category);
+[[nodiscard]] std::optional<Value> flagPreference(Context& context, const PreferencesSuite& suite,
+                                                  std::string_view key, const LogCategory& category);
 
 } // namespace tamblo

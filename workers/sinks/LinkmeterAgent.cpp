@@ -1,7 +1,5 @@
 #include "workers/sinks/LinkmeterAgent.h"
 
-#include "platform/Platform.h"
-#include "util/InternalBuild.h"
 #include "util/Log.h"
 #include "util/MessageKeys.h"
 #include "workers/sinks/LinkmeterSummary.h"
@@ -72,8 +70,9 @@ void LinkmeterAgent::stop(std::vector<MessageRef> messages, AudioServiceType ser
 
 void LinkmeterAgent::post(Piece piece) {
     if (linkmeterQueue_ == nullptr) {
-        linkmeterQueue_ = platform().workQueues.makeSerialQueue("com.vandra.tamblo.session.linkmeter");
-        linkmeterQueue_->setBatchEnd([&service = platform().callQuality] { service.commit(); });
+        linkmeterQueue_ =
+            context_.platform().workQueues->makeSerialQueue("com.vandra.tamblo.session.linkmeter");
+        linkmeterQueue_->setBatchEnd([&service = *context_.platform().callQuality] { service.commit(); });
     }
     const std::lock_guard held(mutex_);
     if (piece.isStop) {
@@ -125,7 +124,7 @@ bool LinkmeterAgent::takePieces() {
 
 void LinkmeterAgent::setUp(const Identity& identity) {
     const LogCategory& category = ZRReportingSessionLinkmeterCategory();
-    CallQualityService& service = platform().callQuality;
+    CallQualityService& service = *context_.platform().callQuality;
     log::debug(category, "entering linkmeter {}", "start");
     linkmeterAgentToken_ = service.NewHierarchyToken({});
     if (!linkmeterAgentToken_) {
@@ -173,7 +172,7 @@ void LinkmeterAgent::waitForBackends() {
     }
     held.unlock();
     isWaiting_ = true;
-    timeOut_ = platform().workQueues.callAfter(kBackendPatience, [weak = weak_from_this(), number] {
+    timeOut_ = context_.platform().workQueues->callAfter(kBackendPatience, [weak = weak_from_this(), number] {
         if (const auto agent = weak.lock()) {
             agent->timeOut(number);
         }
@@ -238,13 +237,13 @@ void LinkmeterAgent::handle(Message message) {
 void LinkmeterAgent::sendMessage(Message message) {
     const LogCategory& category = ZRReportingSessionLinkmeterCategory();
     log::debug(category, "entering linkmeter {}", "_sendMessage");
-    if (!ZRReportingUtilityIsInternalBuild()) {
+    if (!context_.isInternalBuild()) {
         message.payload.remove(ZRReportingInternalEventEpochTime);
     }
     if (linkmeterSession_ == nullptr) {
         return;
     }
-    const std::optional<std::string> failure = platform().callQuality.SendLinkmeterMessage(
+    const std::optional<std::string> failure = context_.platform().callQuality->SendLinkmeterMessage(
         linkmeterSession_,
         ZRReportingSessionRtcWorker::retrieveLinkmeterCategoryFromCategory(message.category), message.type,
         message.payload);
@@ -273,7 +272,7 @@ void LinkmeterAgent::finish(const std::vector<MessageRef>& messages, AudioServic
     }
     log::debug(category, "entering linkmeter {}", "stop");
     if (linkmeterSession_ != nullptr) {
-        platform().callQuality.FlushMessages(linkmeterSession_);
+        context_.platform().callQuality->FlushMessages(linkmeterSession_);
     }
     linkmeterSession_.reset();
     linkmeterAgentToken_.reset();

@@ -6,6 +6,7 @@
 #include "platform/ZRReportingServiceProtocol.h"
 #include "session/ZRReportingSessionMessage.h"
 #include "util/AudioEvents.h"
+#include "util/Context.h"
 
 #include <atomic>
 #include <cstddef>
@@ -44,7 +45,7 @@ public:
         AudioEventType type;
     };
 
-    LinkmeterAgent() = default;
+    explicit LinkmeterAgent(const Context& context) noexcept : context_(context) {}
     LinkmeterAgent(const LinkmeterAgent&) = delete;
     LinkmeterAgent& operator=(const LinkmeterAgent&) = delete;
 
@@ -90,6 +91,7 @@ private:
     void sendSummary(const std::vector<MessageRef>& messages, AudioServiceType serviceType,
                      ReporterID reporterID);
 
+    const Context& context_;
     std::unique_ptr<SerialQueue> linkmeterQueue_; ///< made by the first post
     std::atomic<bool> linkmeterSessionStarted_{false};
 

@@ -1,13 +1,10 @@
 #include "workers/sinks/ZRReportingSessionDPWorker.h"
 
 #include "base/Format.h"
-#include "platform/Platform.h"
 #include "session/ZRReportingSession.h"
 #include "util/AudioEvents.h"
-#include "util/InternalBuild.h"
 #include "util/Log.h"
 #include "util/MessageKeys.h"
-#include "util/ReportingServerQueue.h"
 #include "workers/sinks/CapturePreferences.h"
 
 #include <algorithm>
@@ -28,15 +25,6 @@ constexpr std::int32_t kUsualBufferSize = 512; ///< frames
 constexpr double kLeastSecondsBetweenCaptures = 10.0;
 /// The range of the 32 bits, unsigned, that a wait may have: about 71 minutes.
 constexpr double kLongestWaitMicroseconds = std::numeric_limits<std::uint32_t>::max();
-
-/// What the preferences ask for, as the worker that was made last read them. Used on the reporting server
-/// queue alone.
-struct RunTimeValues {
-    std::int32_t minimumBufferSize = kUsualBufferSize; ///< frames
-    std::int32_t minimumCycle = 0;
-    std::chrono::microseconds waitTime{0};
-};
-constinit RunTimeValues runTime;
 
 /// The nearest number of 32 bits; 0 when absent.
 std::int32_t integerOf(const Value* value) noexcept {
@@ -69,18 +57,33 @@ std::optional<Value> told(std::string_view key, std::optional<Value> value) {
 
 } // namespace
 
+/// What the preferences ask for, as the worker that was made last read them. Used on the reporting server
+/// queue alone.
+struct ZRReportingSessionDPWorker::RunTimeValues {
+    std::int32_t minimumBufferSize = kUsualBufferSize; ///< frames
+    std::int32_t minimumCycle = 0;
+    std::chrono::microseconds waitTime{0};
+};
+
+ZRReportingSessionDPWorker::ZRReportingSessionDPWorker(Context& context,
+                                                       std::weak_ptr<ZRReportingSession> session)
+    : ZRReportingSessionWorkerConsumerProtocol(context, std::move(session)),
+      runTime_(context.shared<RunTimeValues>()) {}
+
 std::shared_ptr<ZRReportingSessionWorkerProtocol>
-ZRReportingSessionDPWorker::initWithSession(const std::shared_ptr<ZRReportingSession>& session) {
-    const bool isEnabled = getEnableFlag("enable_stackburst");
-    if (!ZRReportingUtilityIsInternalBuild() || !isEnabled) {
+ZRReportingSessionDPWorker::initWithSession(Context& context,
+                                            const std::shared_ptr<ZRReportingSession>& session) {
+    const bool isEnabled = getEnableFlag(context, "enable_stackburst");
+    if (!context.isInternalBuild() || !isEnabled) {
         return nullptr;
     }
-    const std::int32_t bufferSize = getRunTimeDefaults("io_buffer_size");
+    auto& runTime = context.shared<RunTimeValues>();
+    const std::int32_t bufferSize = getRunTimeDefaults(context, "io_buffer_size");
     runTime.minimumBufferSize = bufferSize != 0 ? bufferSize : kUsualBufferSize;
-    runTime.minimumCycle = getRunTimeDefaults("io_cycle");
-    runTime.waitTime = waitTimeOf(getDoubleRunTimeDefaults("wait_time"));
-    ZRReportingUtilityGetReportingServerQueue().setMayBlock(runTime.waitTime.count() != 0);
-    return std::make_shared<ZRReportingSessionDPWorker>(session);
+    runTime.minimumCycle = getRunTimeDefaults(context, "io_cycle");
+    runTime.waitTime = waitTimeOf(getDoubleRunTimeDefaults(context, "wait_time"));
+    context.serverQueue().setMayBlock(runTime.waitTime.count() != 0);
+    return std::make_shared<ZRReportingSessionDPWorker>(context, session);
 }
 
 std::optional<bool> ZRReportingSessionDPWorker::start() {
@@ -96,7 +99,7 @@ void ZRReportingSessionDPWorker::handleMessage(const MessageRef& message) {
     if (!isInteresting && !ZRReportingDPLogCategory().isOn(LogLevel::debug)) {
         return;
     }
-    const double now = secondsSince1970(platform().clock.now());
+    const double now = secondsSince1970(platform().clock->now());
     if (isInteresting && isToBeCaptured(message->payload(), now)) {
         capture(*message, now);
     } else if (ZRReportingDPLogCategory().isOn(LogLevel::debug)) {
@@ -114,53 +117,56 @@ bool ZRReportingSessionDPWorker::interestedInMessage(const ZRReportingSessionMes
 }
 
 bool ZRReportingSessionDPWorker::isToBeCaptured(const Dictionary& payload, double now) const {
-    if (integerOf(payload.find(kBufferSizeKey)) < runTime.minimumBufferSize) {
+    if (integerOf(payload.find(kBufferSizeKey)) < runTime_.minimumBufferSize) {
         return false;
     }
     // A clock that was set back holds captures off until it has caught up.
     if (lastMessageTime_ != 0.0 && now - lastMessageTime_ <= kLeastSecondsBetweenCaptures) {
         return false;
     }
-    return integerOf(payload.find(kCycleKey)) >= runTime.minimumCycle;
+    return integerOf(payload.find(kCycleKey)) >= runTime_.minimumCycle;
 }
 
 void ZRReportingSessionDPWorker::capture(ZRReportingSessionMessage& message, double now) {
-    if (runTime.waitTime.count() != 0) {
-        platform().clock.sleepFor(runTime.waitTime);
+    if (runTime_.waitTime.count() != 0) {
+        platform().clock->sleepFor(runTime_.waitTime);
     }
     Dictionary payload = message.message();
     log::info(ZRReportingDPLogCategory(), "Dropping stackburst {}", message);
     const Value* application = payload.find(ZRReportingApplicationName);
     std::string reason = application != nullptr ? formatted("{}", *application) : "(null)";
-    platform().diagnosticCapture.captureStacks({.requester = "com.vandra.tamblo",
-                                                .captureType = "AudioOverloads",
-                                                .reason = std::move(reason),
-                                                .payload = std::move(payload),
-                                                .options = {1, 1, 0, 0, 0}});
+    platform().diagnosticCapture->captureStacks({.requester = "com.vandra.tamblo",
+                                                 .captureType = "AudioOverloads",
+                                                 .reason = std::move(reason),
+                                                 .payload = std::move(payload),
+                                                 .options = {1, 1, 0, 0, 0}});
     // Whether somebody could be told changes nothing here.
     static_cast<void>(
-        platform().namedNotifications.PostNamedNotification("com.vandra.tamblo.dropped-stackburst"));
+        platform().namedNotifications->PostNamedNotification("com.vandra.tamblo.dropped-stackburst"));
     log::info(ZRReportingDPLogCategory(), "Dropped stackburst");
     lastMessageTime_ = now;
 }
 
-bool ZRReportingSessionDPWorker::getEnableFlag(std::string_view key) {
-    const auto value = told(key, flagPreference(getUserDefaults(), key, ZRReportingDPLogCategory()));
+bool ZRReportingSessionDPWorker::getEnableFlag(Context& context, std::string_view key) {
+    const auto value =
+        told(key, flagPreference(context, getUserDefaults(context), key, ZRReportingDPLogCategory()));
     return value && value->boolValue();
 }
 
-std::int32_t ZRReportingSessionDPWorker::getRunTimeDefaults(std::string_view key) {
-    const auto value = told(key, numberPreference(getUserDefaults(), key, ZRReportingDPLogCategory()));
+std::int32_t ZRReportingSessionDPWorker::getRunTimeDefaults(Context& context, std::string_view key) {
+    const auto value =
+        told(key, numberPreference(context, getUserDefaults(context), key, ZRReportingDPLogCategory()));
     return integerOf(value ? &*value : nullptr);
 }
 
-double ZRReportingSessionDPWorker::getDoubleRunTimeDefaults(std::string_view key) {
-    const auto value = told(key, numberPreference(getUserDefaults(), key, ZRReportingDPLogCategory()));
+double ZRReportingSessionDPWorker::getDoubleRunTimeDefaults(Context& context, std::string_view key) {
+    const auto value =
+        told(key, numberPreference(context, getUserDefaults(context), key, ZRReportingDPLogCategory()));
     return value ? value->doubleValue() : 0.0;
 }
 
-PreferencesSuite ZRReportingSessionDPWorker::getUserDefaults() {
-    return capturePreferences();
+PreferencesSuite ZRReportingSessionDPWorker::getUserDefaults(const Context& context) {
+    return capturePreferences(context);
 }
 
 } // namespace tamblo

@@ -18,10 +18,10 @@ namespace tamblo {
 /// queue's work may block.
 class ZRReportingSessionDPWorker final : public ZRReportingSessionWorkerConsumerProtocol {
 public:
-    using ZRReportingSessionWorkerConsumerProtocol::ZRReportingSessionWorkerConsumerProtocol;
+    ZRReportingSessionDPWorker(Context& context, std::weak_ptr<ZRReportingSession> session);
     /// Null where no captures are wanted.
     [[nodiscard]] static std::shared_ptr<ZRReportingSessionWorkerProtocol>
-    initWithSession(const std::shared_ptr<ZRReportingSession>& session);
+    initWithSession(Context& context, const std::shared_ptr<ZRReportingSession>& session);
 
     std::optional<bool> start() override;
     void handleMessage(const MessageRef& message) override;
@@ -29,15 +29,18 @@ public:
     /// Whether it is an overload of the audio I/O itself: an error of that kind, without a subsystem.
     [[nodiscard]] static bool interestedInMessage(const ZRReportingSessionMessage& message);
     /// Preferences; false, 0 or 0.0 without a value.
-    [[nodiscard]] static bool getEnableFlag(std::string_view key);
-    [[nodiscard]] static std::int32_t getRunTimeDefaults(std::string_view key);
-    [[nodiscard]] static double getDoubleRunTimeDefaults(std::string_view key);
-    [[nodiscard]] static PreferencesSuite getUserDefaults();
+    [[nodiscard]] static bool getEnableFlag(Context& context, std::string_view key);
+    [[nodiscard]] static std::int32_t getRunTimeDefaults(Context& context, std::string_view key);
+    [[nodiscard]] static double getDoubleRunTimeDefaults(Context& context, std::string_view key);
+    [[nodiscard]] static PreferencesSuite getUserDefaults(const Context& context);
 
 private:
+    struct RunTimeValues;
+
     [[nodiscard]] bool isToBeCaptured(const Dictionary& payload, double now) const;
     void capture(ZRReportingSessionMessage& message, double now);
 
+    const RunTimeValues& runTime_;
     double lastMessageTime_ = 0.0; ///< seconds since 1970, of the last capture; 0.0 before the first
 };
 

@@ -2,6 +2,9 @@
 
 #include "session/ZRReportingSessionWorkerProtocol.h"
 
+#include <memory>
+#include <string>
+
 namespace tamblo {
 
 /// Offers every message that is not redundant to the analytics-event service, under two names: one of the
@@ -9,9 +12,16 @@ namespace tamblo {
 /// payload is handed over, as it stands then, only for a name that is in use.
 class ZRReportingSessionEventryWorker final : public ZRReportingSessionWorkerConsumerProtocol {
 public:
-    using ZRReportingSessionWorkerConsumerProtocol::ZRReportingSessionWorkerConsumerProtocol;
+    ZRReportingSessionEventryWorker(Context& context, std::weak_ptr<ZRReportingSession> session);
 
     void handleMessage(const MessageRef& message) override;
+
+private:
+    class EventNameCache;
+
+    void offer(const std::string& eventName, const ZRReportingSessionMessage& message) const;
+
+    EventNameCache& names_;
 };
 
 } // namespace tamblo

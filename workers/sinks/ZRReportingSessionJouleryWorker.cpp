@@ -1,6 +1,5 @@
 #include "workers/sinks/ZRReportingSessionJouleryWorker.h"
 
-#include "platform/Platform.h"
 #include "session/ZRReportingSession.h"
 #include "util/AudioEvents.h"
 #include "util/Log.h"
@@ -21,8 +20,8 @@ constexpr std::string_view kActiveClients = "Active_Clients";
 constexpr std::string_view kEventApplicationName = "ApplicationName";
 constexpr std::string_view kEventTimestampEnd = "TimestampEnd";
 
-void post(std::string_view eventName, const Dictionary& event) {
-    platform().powerEvents.postRegisteredPowerEvent(kHapticsSubsystem, eventName, event);
+void post(const Platform& platform, std::string_view eventName, const Dictionary& event) {
+    platform.powerEvents->postRegisteredPowerEvent(kHapticsSubsystem, eventName, event);
 }
 
 /// Nothing once the session is gone.
@@ -60,7 +59,7 @@ void ZRReportingSessionJouleryWorker::handleEngineOnDurationMessage(const Dictio
     } else {
         log::error(ZRReportingJouleryCategory(), "failed to get ZRReporting timestamp for joulery");
     }
-    post("Korvell_Haptics_EngineOnDuration", event);
+    post(platform(), "Korvell_Haptics_EngineOnDuration", event);
 }
 
 /// Unlike the event of the engine's duration, this one names an application that is not known, and nothing is
@@ -77,10 +76,10 @@ void ZRReportingSessionJouleryWorker::handleEngineStateMessage(const Dictionary&
     if (const Value* timestamp = payload.find(ZRReportingInternalEventEpochTime)) {
         event.set(kEventTimestampEnd, *timestamp);
     }
-    post("Korvell_Haptics_ClientStatus", event);
+    post(platform(), "Korvell_Haptics_ClientStatus", event);
 }
 
-void ZRReportingSessionJouleryWorker::handleLongRunningMessage(const Dictionary& payload) {
+void ZRReportingSessionJouleryWorker::handleLongRunningMessage(const Dictionary& payload) const {
     const Value* seconds = payload.find(kActiveHardwareTime);
     if (seconds == nullptr) {
         return;
@@ -89,7 +88,7 @@ void ZRReportingSessionJouleryWorker::handleLongRunningMessage(const Dictionary&
     if (const Value* clients = payload.find(kActiveClients)) {
         event.set(kActiveClients, *clients);
     }
-    post("LeakedHapticsSessionInfo", event);
+    post(platform(), "LeakedHapticsSessionInfo", event);
 }
 
 } // namespace tamblo

@@ -18,7 +18,7 @@ private:
     /// Each posts its event when the payload has the key that it is about.
     void handleEngineOnDurationMessage(const Dictionary& payload) const;
     void handleEngineStateMessage(const Dictionary& payload) const;
-    static void handleLongRunningMessage(const Dictionary& payload);
+    void handleLongRunningMessage(const Dictionary& payload) const;
 };
 
 } // namespace tamblo

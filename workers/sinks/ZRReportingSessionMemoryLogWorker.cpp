@@ -1,6 +1,5 @@
 #include "workers/sinks/ZRReportingSessionMemoryLogWorker.h"
 
-#include "platform/Platform.h"
 #include "platform/ProcessList.h"
 #include "session/ZRReportingSession.h"
 #include "util/AudioEvents.h"
@@ -13,7 +12,7 @@ void ZRReportingSessionMemoryLogWorker::handleMessage(const MessageRef& message)
     if (message == nullptr || message->type() != AudioEventTypeMemoryLog) {
         return;
     }
-    const WallTime now = platform().clock.now();
+    const WallTime now = platform().clock->now();
     const auto ownSession = session();
     if (ownSession == nullptr || !isDue(now)) {
         return;
@@ -22,7 +21,7 @@ void ZRReportingSessionMemoryLogWorker::handleMessage(const MessageRef& message)
     ProcessList processes;
     processes.add(ownSession->processIdentifiers());
     processes.addNamedBy(message->payload());
-    platform().memoryLog.logMemory(ownSession->reporterID(), std::move(processes).take());
+    platform().memoryLog->logMemory(ownSession->reporterID(), std::move(processes).take());
 }
 
 bool ZRReportingSessionMemoryLogWorker::isDue(WallTime now) const noexcept {

@@ -1,10 +1,8 @@
 #include "workers/sinks/ZRReportingSessionQMXWorker.h"
 
 #include "metrics/AudioIssueDetected.h"
-#include "platform/Platform.h"
 #include "util/AudioEvents.h"
 #include "util/Log.h"
-#include "util/LogText.h"
 #include "util/MessageKeys.h"
 
 namespace tamblo {
@@ -47,7 +45,7 @@ void ZRReportingSessionQMXWorker::handleMessage(const MessageRef& message) {
     TextBuffer bytes;
     ProtoWriter writer(bytes);
     recordOf(message->payload()).writeTo(writer);
-    platform().diagnosticsMetrics.SubmitMetricRecord(qmxmetrics::kAudioIssueMetric, bytes.bytes());
+    platform().diagnosticsMetrics->SubmitMetricRecord(qmxmetrics::kAudioIssueMetric, bytes.bytes());
 }
 
 } // namespace tamblo

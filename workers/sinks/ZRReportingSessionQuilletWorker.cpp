@@ -1,8 +1,6 @@
 #include "workers/sinks/ZRReportingSessionQuilletWorker.h"
 
-#include "platform/Platform.h"
 #include "session/ZRReportingSession.h"
-#include "util/InternalBuild.h"
 #include "util/Log.h"
 #include "workers/ZRReportingSessionWorkerUtility.h"
 #include "workers/sinks/CapturePreferences.h"
@@ -41,25 +39,27 @@ void draftCreated(const std::optional<std::string>& error) {
 } // namespace
 
 std::shared_ptr<ZRReportingSessionWorkerProtocol>
-ZRReportingSessionQuilletWorker::initWithSession(const std::shared_ptr<ZRReportingSession>& session) {
-    if (!ZRReportingUtilityIsInternalBuild()) {
+ZRReportingSessionQuilletWorker::initWithSession(Context& context,
+                                                 const std::shared_ptr<ZRReportingSession>& session) {
+    if (!context.isInternalBuild()) {
         return nullptr;
     }
-    PreferencesSuite defaults = capturePreferences();
-    const auto backOff = numberPreference(defaults, kBackOffKey, ZRReportingSessionCategory());
+    PreferencesSuite defaults = capturePreferences(context);
+    const auto backOff = numberPreference(context, defaults, kBackOffKey, ZRReportingSessionCategory());
     if (!backOff) {
         log::debug(ZRReportingSessionCategory(), "{} default not set. Skipping worker. reporterID={}",
                    kBackOffKey, session->reporterID());
         return nullptr;
     }
     return std::make_shared<ZRReportingSessionQuilletWorker>(
-        session, std::move(defaults), std::chrono::duration<double>(backOff->doubleValue()));
+        context, session, std::move(defaults), std::chrono::duration<double>(backOff->doubleValue()));
 }
 
-ZRReportingSessionQuilletWorker::ZRReportingSessionQuilletWorker(std::weak_ptr<ZRReportingSession> session,
+ZRReportingSessionQuilletWorker::ZRReportingSessionQuilletWorker(Context& context,
+                                                                 std::weak_ptr<ZRReportingSession> session,
                                                                  PreferencesSuite defaults,
                                                                  std::chrono::duration<double> backOffTime)
-    : ZRReportingSessionWorkerConsumerProtocol(std::move(session)),
+    : ZRReportingSessionWorkerConsumerProtocol(context, std::move(session)),
       defaults_(std::move(defaults)),
       backOffTime_(backOffTime) {}
 
@@ -80,8 +80,8 @@ void ZRReportingSessionQuilletWorker::handleMessage(const MessageRef& message) {
     // Empty for a process that had exited before its name could be had.
     const std::string processName =
         owner != nullptr ? owner->clientProcessName().value_or(std::string()) : std::string();
-    platform().bugReportDrafting.createDraft(tikletDraftForTalvixXYerror(), processName, kDisplayReason,
-                                             draftCreated);
+    platform().bugReportDrafting->createDraft(tikletDraftForTalvixXYerror(), processName, kDisplayReason,
+                                              draftCreated);
 }
 
 void ZRReportingSessionQuilletWorker::stop() {
@@ -104,8 +104,8 @@ bool ZRReportingSessionQuilletWorker::interestedInMessage(const ZRReportingSessi
 
 bool ZRReportingSessionQuilletWorker::hasRunInTimeframe(std::chrono::duration<double> backOff,
                                                         std::string_view defaultsKey) {
-    const double now = secondsSince1970(platform().clock.now());
-    const auto lastRun = numberPreference(defaults_, defaultsKey, ZRReportingSessionCategory());
+    const double now = secondsSince1970(platform().clock->now());
+    const auto lastRun = numberPreference(context(), defaults_, defaultsKey, ZRReportingSessionCategory());
     if (lastRun && lastRun->doubleValue() > now - backOff.count()) {
         log::debug(ZRReportingSessionCategory(), "Quillet has run. key={} lastRun={}", defaultsKey, *lastRun);
         return true;

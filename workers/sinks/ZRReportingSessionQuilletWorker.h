@@ -19,11 +19,11 @@ namespace tamblo {
 /// asked for again.
 class ZRReportingSessionQuilletWorker final : public ZRReportingSessionWorkerConsumerProtocol {
 public:
-    ZRReportingSessionQuilletWorker(std::weak_ptr<ZRReportingSession> session, PreferencesSuite defaults,
-                                    std::chrono::duration<double> backOffTime);
+    ZRReportingSessionQuilletWorker(Context& context, std::weak_ptr<ZRReportingSession> session,
+                                    PreferencesSuite defaults, std::chrono::duration<double> backOffTime);
     /// Null where no drafts are wanted.
     [[nodiscard]] static std::shared_ptr<ZRReportingSessionWorkerProtocol>
-    initWithSession(const std::shared_ptr<ZRReportingSession>& session);
+    initWithSession(Context& context, const std::shared_ptr<ZRReportingSession>& session);
 
     void handleMessage(const MessageRef& message) override;
     /// The next run of the session may have a draft again.

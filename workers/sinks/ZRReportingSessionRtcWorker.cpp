@@ -11,11 +11,12 @@
 namespace tamblo {
 
 std::shared_ptr<ZRReportingSessionWorkerProtocol>
-ZRReportingSessionRtcWorker::initWithSession(const std::shared_ptr<ZRReportingSession>& session) {
+ZRReportingSessionRtcWorker::initWithSession(Context& context,
+                                             const std::shared_ptr<ZRReportingSession>& session) {
     if (session->serviceType() == AudioServiceTypeTest) {
         return nullptr;
     }
-    return std::make_shared<ZRReportingSessionRtcWorker>(session);
+    return std::make_shared<ZRReportingSessionRtcWorker>(context, session);
 }
 
 std::optional<bool> ZRReportingSessionRtcWorker::start() {

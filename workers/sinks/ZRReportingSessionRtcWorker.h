@@ -19,7 +19,7 @@ class ZRReportingSessionRtcWorker final : public ZRReportingSessionWorkerConsume
 public:
     /// None for a session of the service type "test".
     [[nodiscard]] static std::shared_ptr<ZRReportingSessionWorkerProtocol>
-    initWithSession(const std::shared_ptr<ZRReportingSession>& session);
+    initWithSession(Context& context, const std::shared_ptr<ZRReportingSession>& session);
     using ZRReportingSessionWorkerConsumerProtocol::ZRReportingSessionWorkerConsumerProtocol;
 
     /// The category's kind.
@@ -41,7 +41,7 @@ public:
     void stop() override;
 
 private:
-    const std::shared_ptr<LinkmeterAgent> agent_ = std::make_shared<LinkmeterAgent>();
+    const std::shared_ptr<LinkmeterAgent> agent_ = std::make_shared<LinkmeterAgent>(context());
 };
 
 } // namespace tamblo

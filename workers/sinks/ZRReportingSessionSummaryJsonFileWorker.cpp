@@ -2,10 +2,8 @@
 
 #include "base/Format.h"
 #include "base/JsonPretty.h"
-#include "platform/Platform.h"
 #include "session/ZRReportingSession.h"
 #include "util/AudioEvents.h"
-#include "util/InternalBuild.h"
 #include "util/Log.h"
 #include "workers/ReportFileName.h"
 
@@ -59,11 +57,12 @@ private:
 };
 
 std::shared_ptr<ZRReportingSessionWorkerProtocol>
-ZRReportingSessionSummaryJsonFileWorker::initWithSession(const std::shared_ptr<ZRReportingSession>& session) {
-    if (session->serviceType() != AudioServiceTypeTest && !ZRReportingUtilityIsInternalBuild()) {
+ZRReportingSessionSummaryJsonFileWorker::initWithSession(Context& context,
+                                                         const std::shared_ptr<ZRReportingSession>& session) {
+    if (session->serviceType() != AudioServiceTypeTest && !context.isInternalBuild()) {
         return nullptr;
     }
-    auto worker = std::make_shared<ZRReportingSessionSummaryJsonFileWorker>(session);
+    auto worker = std::make_shared<ZRReportingSessionSummaryJsonFileWorker>(context, session);
     worker->setStarted(true);
     return worker;
 }
@@ -106,17 +105,17 @@ void ZRReportingSessionSummaryJsonFileWorker::writeMessage(ZRReportingSessionMes
 
 void ZRReportingSessionSummaryJsonFileWorker::openFile(const ZRReportingSession& session) {
     const Platform& device = platform();
-    const std::string directory = device.reportFiles.reportingLogsDirectory();
-    if (const auto failure = device.reportFiles.createDirectory(directory)) {
+    const std::string directory = device.reportFiles->reportingLogsDirectory();
+    if (const auto failure = device.reportFiles->createDirectory(directory)) {
         log::error(ZRReportingSessionCategory(), "can't create logging directory at {}: {}", directory,
                    *failure);
     }
-    const WallTime now = device.clock.now();
+    const WallTime now = device.clock->now();
     reportPath_ =
         directory + "/" +
-        reportFileName(now, device.clock.utcOffset(now), session.reporterID(),
+        reportFileName(now, device.clock->utcOffset(now), session.reporterID(),
                        ZRReportingUtilityRetrieveAppName(session.configuration()), session.serviceName());
-    auto file = device.reportFiles.createFile(*reportPath_);
+    auto file = device.reportFiles->createFile(*reportPath_);
     if (const auto* failure = std::get_if<std::string>(&file)) {
         log::error(ZRReportingSessionCategory(),
                    "SummaryJsonFileWorker failed to open file. action=open file={} error=\"{}\"",

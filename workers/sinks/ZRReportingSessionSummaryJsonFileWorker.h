@@ -23,7 +23,7 @@ public:
 
     /// Null for a session that gets no file. The worker is started.
     [[nodiscard]] static std::shared_ptr<ZRReportingSessionWorkerProtocol>
-    initWithSession(const std::shared_ptr<ZRReportingSession>& session);
+    initWithSession(Context& context, const std::shared_ptr<ZRReportingSession>& session);
 
     /// Leaves its mark in the session's records: each payload gets the key that says whether the message was
     /// sent while the session was started.

@@ -1,8 +1,6 @@
 #include "workers/sinks/ZRReportingSessionZephWorker.h"
 
-#include "platform/Platform.h"
 #include "session/ZRReportingSession.h"
-#include "util/InternalBuild.h"
 #include "util/Log.h"
 #include "workers/sinks/zeph/ZRReportingZephWorkerInstanceSSSLeaks.h"
 
@@ -49,14 +47,17 @@ void logFailure(const Value* reason) {
 } // namespace
 
 std::shared_ptr<ZRReportingSessionWorkerProtocol>
-ZRReportingSessionZephWorker::initWithSession(const std::shared_ptr<ZRReportingSession>& session) {
-    if (!ZRReportingUtilityIsInternalBuild()) {
+ZRReportingSessionZephWorker::initWithSession(Context& context,
+                                              const std::shared_ptr<ZRReportingSession>& session) {
+    if (!context.isInternalBuild()) {
         return nullptr;
     }
-    auto worker = std::make_shared<ZRReportingSessionZephWorker>(session);
+    auto worker = std::make_shared<ZRReportingSessionZephWorker>(context, session);
     for (const ZephWorkerInstanceClass& instanceClass : zephWorkerInstanceClasses()) {
         if (instanceClass.deviceProperty.empty() ||
-            platform().deviceProperties.booleanProperty(instanceClass.deviceProperty).value_or(false)) {
+            context.platform()
+                .deviceProperties->booleanProperty(instanceClass.deviceProperty)
+                .value_or(false)) {
             worker->addInstance(instanceClass);
         }
     }
@@ -68,7 +69,7 @@ void ZRReportingSessionZephWorker::addInstance(const ZephWorkerInstanceClass& in
     if (owner == nullptr || (owner->isSingleMessageSession() && !instanceClass.handleSingleMessageSession)) {
         return;
     }
-    if (auto detector = instanceClass.initWithSession(owner)) {
+    if (auto detector = instanceClass.initWithSession(context(), owner)) {
         instances_.push_back({&instanceClass, std::move(detector)});
     }
 }
@@ -110,7 +111,7 @@ void ZRReportingSessionZephWorker::consider(const Instance& instance,
     }
     log::debug(ZRReportingZephLogCategory(), "Interested in message. instance={}, {}",
                instance.instanceClass->name, message);
-    const WallTime now = platform().clock.now();
+    const WallTime now = platform().clock->now();
     ++state->interestedCount;
     if (!state->interestFirstSeen) {
         state->interestFirstSeen = now;
@@ -120,7 +121,7 @@ void ZRReportingSessionZephWorker::consider(const Instance& instance,
     if (!detector.canFire() || !state->isDue(now)) {
         return;
     }
-    state->symptomReporter = platform().bugCapture.makeReporter(owner->processIdentifiers());
+    state->symptomReporter = platform().bugCapture->makeReporter(owner->processIdentifiers());
     ++state->firedCount;
     if (owner->serviceType() == AudioServiceTypeTest) {
         log::info(ZRReportingZephLogCategory(), "Skipping actual fire, as we are running in test mode.");
@@ -155,11 +156,6 @@ ZRReportingSessionZephWorker::signatureFromMessage(const ZRReportingSessionMessa
             .subType = ZRReportingUtilityCategoryString(message.category()),
             .subTypeContext = std::string(ZRReportingUtilityTypeString(message.type())),
             .detectedProcess = std::string(clientProcessName)};
-}
-
-void ZRReportingSessionZephWorker::reset() {
-    forgetSharedWorkerInstanceStates();
-    ZRReportingZephWorkerInstanceSSSLeaks::forgetLastFiring();
 }
 
 } // namespace tamblo

@@ -26,7 +26,7 @@ public:
 
     /// Null on a build that is not internal. The worker has the detectors of the session.
     [[nodiscard]] static std::shared_ptr<ZRReportingSessionWorkerProtocol>
-    initWithSession(const std::shared_ptr<ZRReportingSession>& session);
+    initWithSession(Context& context, const std::shared_ptr<ZRReportingSession>& session);
     /// Adds a detector behind the others, unless the class has none for such a session or refuses. The class
     /// must outlive the worker.
     void addInstance(const ZephWorkerInstanceClass& instanceClass);
@@ -42,9 +42,6 @@ public:
     [[nodiscard]] static BugCaptureSignature signatureFromMessage(const ZRReportingSessionMessage& message,
                                                                   AudioServiceType audioServiceType,
                                                                   std::string_view clientProcessName);
-
-    /// Drops what detectors keep for the process: after another platform was installed.
-    static void reset();
 
 private:
     struct Instance {

@@ -3,7 +3,7 @@
 #include "base/Format.h"
 #include "base/Json.h"
 #include "base/Utf8.h"
-#include "util/LogText.h"
+#include "util/Log.h"
 
 #include <chrono>
 #include <cmath>

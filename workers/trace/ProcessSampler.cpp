@@ -1,6 +1,5 @@
 #include "workers/trace/ProcessSampler.h"
 
-#include "platform/Platform.h"
 #include "util/Log.h"
 
 #include <algorithm>
@@ -12,18 +11,25 @@ namespace tamblo {
 
 namespace {
 
-constinit std::atomic<std::size_t> placesTaken{0};
-constinit std::atomic<bool> isFullTold{false};
+/// The places for samples in memory.
+struct Places {
+    std::atomic<std::size_t> taken{0};
+    std::atomic<bool> isFullTold{false};
+};
 
-/// One of the places for samples in memory.
-struct Place {
-    Place() noexcept { ++placesTaken; }
+/// One of them.
+class Place {
+public:
+    explicit Place(Places& places) noexcept : places_(places) { ++places_.taken; }
     ~Place() {
-        --placesTaken;
-        isFullTold = false;
+        --places_.taken;
+        places_.isFullTold = false;
     }
     Place(const Place&) = delete;
     Place& operator=(const Place&) = delete;
+
+private:
+    Places& places_;
 };
 
 /// What a tick has found out so far.
@@ -45,41 +51,49 @@ private:
 
 } // namespace
 
-std::shared_ptr<ProcessSampler> ProcessSampler::shared() {
-    static constinit std::mutex mutex;
-    static std::weak_ptr<ProcessSampler> current;
-    const std::lock_guard lock(mutex);
-    std::shared_ptr<ProcessSampler> sampler = current.lock();
-    if (sampler == nullptr) {
-        sampler.reset(new ProcessSampler);
-        current = sampler;
+struct ProcessSampler::Shared {
+    [[nodiscard]] std::shared_ptr<ProcessSampler> sampler(Context& context) {
+        const MutexLock lock(mutex);
+        std::shared_ptr<ProcessSampler> sampler = current.lock();
+        if (sampler == nullptr) {
+            sampler.reset(new ProcessSampler(context, *this));
+            current = sampler;
+        }
+        return sampler;
     }
-    return sampler;
-}
 
-std::unique_ptr<ProcessSampler::Recording> ProcessSampler::record(std::span<const pid_t> processes) {
-    const std::shared_ptr<ProcessSampler> sampler = shared();
+    Places places;
+    Mutex mutex;
+    std::weak_ptr<ProcessSampler> current TAMBLO_GUARDED_BY(mutex);
+};
+
+std::unique_ptr<ProcessSampler::Recording> ProcessSampler::record(Context& context,
+                                                                  std::span<const pid_t> processes) {
+    const std::shared_ptr<ProcessSampler> sampler = context.shared<Shared>().sampler(context);
     std::shared_ptr<SampleRecording> samples = sampler->begin(processes);
     return samples != nullptr ? std::make_unique<Recording>(sampler, std::move(samples)) : nullptr;
 }
 
-ProcessSampler::ProcessSampler() : queue_(platform().workQueues.makeSerialQueue("com.vandra.tamblo.trace")) {}
+ProcessSampler::ProcessSampler(Context& context, Shared& shared)
+    : platform_(context.platform()),
+      shared_(shared),
+      queue_(platform_.workQueues->makeSerialQueue("com.vandra.tamblo.trace")) {}
 
 std::shared_ptr<SampleRecording> ProcessSampler::begin(std::span<const pid_t> processes) {
     const std::lock_guard lock(mutex_);
-    if (placesTaken >= kMostRecordings) {
-        if (!isFullTold.exchange(true)) {
+    if (shared_.places.taken >= kMostRecordings) {
+        if (!shared_.places.isFullTold.exchange(true)) {
             log::info(ZRReportingTraceCategory(),
                       "{} sessions are traced already; further ones are not until one of their files is done",
                       kMostRecordings);
         }
         return nullptr;
     }
-    auto recording =
-        std::make_shared<SampleRecording>(processes, platform().clock.now(), std::make_shared<const Place>());
+    auto recording = std::make_shared<SampleRecording>(processes, platform_.clock->now(),
+                                                       std::make_shared<const Place>(shared_.places));
     recordings_.push_back(recording);
     if (timer_ == nullptr) {
-        timer_ = platform().workQueues.makeRepeatingTimer(kInterval, [sampler = weak_from_this()] {
+        timer_ = platform_.workQueues->makeRepeatingTimer(kInterval, [sampler = weak_from_this()] {
             if (const std::shared_ptr<ProcessSampler> alive = sampler.lock()) {
                 alive->tick();
             }
@@ -111,12 +125,11 @@ void ProcessSampler::tick() {
         const std::lock_guard lock(mutex_);
         recordings = recordings_;
     }
-    const Platform& device = platform();
-    Found found(device.processSampling);
+    Found found(*platform_.processSampling);
     for (const std::shared_ptr<SampleRecording>& recording : recordings) {
         for (const pid_t pid : recording->nextTick()) {
             const std::optional<ProcessSample>& figures = found.of(pid);
-            recording->add(pid, device.clock.now(), figures);
+            recording->add(pid, platform_.clock->now(), figures);
         }
     }
 }

@@ -1,6 +1,6 @@
 #pragma once
 
-#include "platform/WorkQueue.h"
+#include "util/Context.h"
 #include "workers/trace/SampleRecording.h"
 
 #include <chrono>
@@ -48,18 +48,23 @@ public:
 
     /// Begins to record these processes; null when as many sessions as may be are recorded already. Any
     /// thread, without waiting.
-    [[nodiscard]] static std::unique_ptr<Recording> record(std::span<const pid_t> processes);
+    [[nodiscard]] static std::unique_ptr<Recording> record(Context& context,
+                                                           std::span<const pid_t> processes);
 
     ProcessSampler(const ProcessSampler&) = delete;
     ProcessSampler& operator=(const ProcessSampler&) = delete;
 
 private:
-    ProcessSampler();
-    [[nodiscard]] static std::shared_ptr<ProcessSampler> shared();
+    /// What the samplers, of which there is one at a time, have in common.
+    struct Shared;
+
+    ProcessSampler(Context& context, Shared& shared);
     [[nodiscard]] std::shared_ptr<SampleRecording> begin(std::span<const pid_t> processes);
     void forget(const SampleRecording& recording);
     void tick();
 
+    const Platform& platform_;
+    Shared& shared_;
     const std::unique_ptr<SerialQueue> queue_;
     std::mutex mutex_; ///< guards what follows
     std::unique_ptr<RepeatingTimer> timer_;

@@ -1,8 +1,6 @@
 #include "workers/trace/ZRReportingSessionTraceWorker.h"
 
-#include "platform/Platform.h"
 #include "session/ZRReportingSession.h"
-#include "util/InternalBuild.h"
 #include "util/Log.h"
 #include "workers/ReportFileName.h"
 #include "workers/trace/ChromeTrace.h"
@@ -17,8 +15,8 @@ namespace tamblo {
 namespace {
 
 /// Writes a whole file; answers what went wrong, or nothing.
-std::optional<std::string> writeFile(const std::string& path, std::string_view text) {
-    auto opened = platform().reportFiles.createFile(path);
+std::optional<std::string> writeFile(ReportFiles& files, const std::string& path, std::string_view text) {
+    auto opened = files.createFile(path);
     if (auto* failure = std::get_if<std::string>(&opened)) {
         return std::move(*failure);
     }
@@ -29,21 +27,20 @@ std::optional<std::string> writeFile(const std::string& path, std::string_view t
 }
 
 /// Makes the file of a trace that is complete but for the service's name, at the time of its end.
-void deliver(SessionTrace& trace, WallTime stoppedAt) {
-    const Platform& device = platform();
-    const pid_t service = device.processInformation.ownProcessIdentifier();
+void deliver(const Platform& device, SessionTrace& trace, WallTime stoppedAt) {
+    const pid_t service = device.processInformation->ownProcessIdentifier();
     for (std::size_t i = 0; i < trace.recorded.processes.size(); ++i) {
         if (trace.recorded.processes[i].pid == service) {
-            trace.processNames[i] = device.processInformation.ProcessNameForPid(service).value_or("");
+            trace.processNames[i] = device.processInformation->ProcessNameForPid(service).value_or("");
         }
     }
-    const std::string directory = device.reportFiles.performanceLogsDirectory();
+    const std::string directory = device.reportFiles->performanceLogsDirectory();
     const std::string path = directory + "/" +
-                             reportFileName(stoppedAt, device.clock.utcOffset(stoppedAt), trace.reporterID,
+                             reportFileName(stoppedAt, device.clock->utcOffset(stoppedAt), trace.reporterID,
                                             trace.applicationName, trace.serviceName);
-    std::optional<std::string> failure = device.reportFiles.createDirectory(directory);
+    std::optional<std::string> failure = device.reportFiles->createDirectory(directory);
     if (!failure) {
-        failure = writeFile(path, chromeTraceText(trace).view());
+        failure = writeFile(*device.reportFiles, path, chromeTraceText(trace).view());
     }
     if (failure) {
         log::error(ZRReportingTraceCategory(), "TraceWorker failed to write file. file={} error=\"{}\"", path,
@@ -56,9 +53,10 @@ void deliver(SessionTrace& trace, WallTime stoppedAt) {
 } // namespace
 
 std::shared_ptr<ZRReportingSessionWorkerProtocol>
-ZRReportingSessionTraceWorker::initWithSession(const std::shared_ptr<ZRReportingSession>& session) {
-    return ZRReportingUtilityIsInternalBuild() ? std::make_shared<ZRReportingSessionTraceWorker>(session)
-                                               : nullptr;
+ZRReportingSessionTraceWorker::initWithSession(Context& context,
+                                               const std::shared_ptr<ZRReportingSession>& session) {
+    return context.isInternalBuild() ? std::make_shared<ZRReportingSessionTraceWorker>(context, session)
+                                     : nullptr;
 }
 
 std::optional<bool> ZRReportingSessionTraceWorker::start() {
@@ -66,13 +64,13 @@ std::optional<bool> ZRReportingSessionTraceWorker::start() {
     if (owner == nullptr) {
         return false;
     }
-    std::vector<pid_t> processes{platform().processInformation.ownProcessIdentifier()};
+    std::vector<pid_t> processes{platform().processInformation->ownProcessIdentifier()};
     // The client's comes first, unless the service is its own client.
     const std::vector<pid_t>& clients = owner->processIdentifiers();
     if (!clients.empty() && clients.front() != processes.front()) {
         processes.insert(processes.begin(), clients.front());
     }
-    recording_ = ProcessSampler::record(processes);
+    recording_ = ProcessSampler::record(context(), processes);
     return recording_ != nullptr;
 }
 
@@ -82,7 +80,7 @@ void ZRReportingSessionTraceWorker::stop() {
     if (owner == nullptr || recording == nullptr) {
         return;
     }
-    const WallTime now = platform().clock.now();
+    const WallTime now = platform().clock->now();
     auto trace = std::make_unique<SessionTrace>();
     trace->reporterID = owner->reporterID();
     trace->serviceName = owner->serviceName();
@@ -91,7 +89,8 @@ void ZRReportingSessionTraceWorker::stop() {
     trace->processNames = {owner->clientProcessName().value_or("")};
     trace->processNames.resize(trace->recorded.processes.size());
     addMarks(*trace, owner->messages());
-    recording->runLater([trace = std::move(trace), now] { deliver(*trace, now); });
+    recording->runLater(
+        [&device = platform(), trace = std::move(trace), now] { deliver(device, *trace, now); });
 }
 
 } // namespace tamblo

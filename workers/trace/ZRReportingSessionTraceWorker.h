@@ -21,7 +21,7 @@ public:
 
     /// Null on any other build.
     [[nodiscard]] static std::shared_ptr<ZRReportingSessionWorkerProtocol>
-    initWithSession(const std::shared_ptr<ZRReportingSession>& session);
+    initWithSession(Context& context, const std::shared_ptr<ZRReportingSession>& session);
 
     std::optional<bool> start() override;
     void stop() override;

@@ -20,6 +20,7 @@ public:
                                                                      UniqueFunction<void()> tick) override;
     [[nodiscard]] std::unique_ptr<DelayedCall> callAfter(std::chrono::milliseconds delay,
                                                          UniqueFunction<void()> call) override;
+    void workOff() override { pool_.workOff(); }
     /// Called after each tick of any timer, on its thread: what a tick recorded is written out.
     void setTickEnd(UniqueFunction<void()> tickEnd);
 

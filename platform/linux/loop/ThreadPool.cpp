@@ -57,6 +57,17 @@ void ThreadPool::cancel(const DelayedKey& key) {
     }
 }
 
+void ThreadPool::workOff() {
+    std::unique_lock lock(mutex_);
+    while (!delayed_.empty() || !work_.empty() || busy_ != 0) {
+        auto dropped = std::exchange(delayed_, {});
+        lock.unlock();
+        dropped.clear();
+        lock.lock();
+        isWorkedOff_.wait(lock, [this] { return work_.empty() && busy_ == 0; });
+    }
+}
+
 void ThreadPool::callThread() {
     if (isEnding_) {
         // Whoever posts at the end is one of the pool's threads, and takes it next.
@@ -127,10 +138,14 @@ void ThreadPool::run() {
             // While this work blocks, another thread has to wait for the calls to come.
             callThread();
         }
+        ++busy_;
         lock.unlock();
         work();
         work.reset();
         lock.lock();
+        if (--busy_ == 0 && work_.empty()) {
+            isWorkedOff_.notify_all();
+        }
     }
     finished_.push_back(std::this_thread::get_id());
 }

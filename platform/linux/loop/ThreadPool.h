@@ -35,6 +35,8 @@ public:
     [[nodiscard]] DelayedKey postAfter(std::chrono::milliseconds delay, UniqueFunction<void()> work);
     /// Nothing when the call has begun.
     void cancel(const DelayedKey& key);
+    /// Returns when there is no work left; delayed calls that have not begun are dropped. Not from work.
+    void workOff();
 
 private:
     void run();
@@ -52,6 +54,8 @@ private:
     std::vector<std::thread> threads_;
     std::vector<std::thread::id> finished_;
     std::size_t idle_ = 0;
+    std::size_t busy_ = 0;
+    std::condition_variable isWorkedOff_;
     bool isEnding_ = false;
 };
 

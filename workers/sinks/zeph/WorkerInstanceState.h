@@ -7,6 +7,7 @@
 #include <chrono>
 #include <cstdint>
 #include <limits>
+#include <map>
 #include <memory>
 #include <mutex>
 #include <optional>
@@ -50,11 +51,21 @@ private:
     std::optional<std::string> currentZephSessionIdentifier_;
 };
 
-/// The state that all detectors of a class share. The first of them has it made.
-[[nodiscard]] std::shared_ptr<WorkerInstanceState>
-sharedWorkerInstanceState(std::string_view detectorClassName,
-                          std::shared_ptr<WorkerInstanceState> (*makeState)());
-/// Makes the next detectors begin with new states: after another platform was installed.
-void forgetSharedWorkerInstanceStates();
+/// The states that the detectors of a class share, in all sessions. On the thread that does their work.
+class SharedWorkerInstanceStates {
+public:
+    /// The first detector of the class has it made.
+    [[nodiscard]] const std::shared_ptr<WorkerInstanceState>&
+    of(std::string_view detectorClassName, std::shared_ptr<WorkerInstanceState> (*makeState)()) {
+        std::shared_ptr<WorkerInstanceState>& state = byClassName_[detectorClassName];
+        if (state == nullptr) {
+            state = makeState();
+        }
+        return state;
+    }
+
+private:
+    std::map<std::string_view, std::shared_ptr<WorkerInstanceState>> byClassName_;
+};
 
 } // namespace tamblo

@@ -2,6 +2,7 @@
 
 #include "session/ZRReportingSessionMessage.h"
 #include "util/AudioEvents.h"
+#include "util/Context.h"
 #include "workers/sinks/zeph/WorkerInstanceState.h"
 
 #include <memory>
@@ -22,8 +23,8 @@ class ZRReportingSession;
 /// thread and when the detector is gone: it holds the state weakly and never the detector.
 class ZRReportingSessionZephWorkerInstance {
 public:
-    explicit ZRReportingSessionZephWorkerInstance(std::weak_ptr<ZRReportingSession> session) noexcept
-        : session_(std::move(session)) {}
+    ZRReportingSessionZephWorkerInstance(Context& context, std::weak_ptr<ZRReportingSession> session) noexcept
+        : context_(context), session_(std::move(session)) {}
     virtual ~ZRReportingSessionZephWorkerInstance() = default;
     ZRReportingSessionZephWorkerInstance(const ZRReportingSessionZephWorkerInstance&) = delete;
     ZRReportingSessionZephWorkerInstance& operator=(const ZRReportingSessionZephWorkerInstance&) = delete;
@@ -52,15 +53,19 @@ public:
     virtual void handleMessage(const ZRReportingSessionMessage&) {}
     virtual void stop() {}
 
+protected:
+    [[nodiscard]] Context& context() const noexcept { return context_; }
+
 private:
+    Context& context_;
     std::weak_ptr<ZRReportingSession> session_;
     std::shared_ptr<WorkerInstanceState> workerState_;
 };
 
 /// Describes one detector class.
 struct ZephWorkerInstanceClass {
-    using Factory =
-        std::unique_ptr<ZRReportingSessionZephWorkerInstance> (*)(const std::shared_ptr<ZRReportingSession>&);
+    using Factory = std::unique_ptr<ZRReportingSessionZephWorkerInstance> (*)(
+        Context&, const std::shared_ptr<ZRReportingSession>&);
 
     std::string_view name;
     /// The one type of message that its detectors look at, so that all others cost them nothing. None for a

@@ -7,8 +7,8 @@
 namespace tamblo {
 
 ZRReportingZephWorkerInstanceAlarmLowRMS::ZRReportingZephWorkerInstanceAlarmLowRMS(
-    std::weak_ptr<ZRReportingSession> session)
-    : ZRReportingSessionZephWorkerInstance(std::move(session)) {
+    Context& context, std::weak_ptr<ZRReportingSession> session)
+    : ZRReportingSessionZephWorkerInstance(context, std::move(session)) {
     auto state = std::make_shared<WorkerInstanceState>();
     state->interestThresholdCount = 3;
     // Without effect beside a threshold of the count.

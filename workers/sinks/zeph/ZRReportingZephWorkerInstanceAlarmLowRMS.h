@@ -10,7 +10,7 @@ namespace tamblo {
 /// stop of the session cancels it, so that it is kept only when the session outlives it.
 class ZRReportingZephWorkerInstanceAlarmLowRMS final : public ZRReportingSessionZephWorkerInstance {
 public:
-    explicit ZRReportingZephWorkerInstanceAlarmLowRMS(std::weak_ptr<ZRReportingSession> session);
+    ZRReportingZephWorkerInstanceAlarmLowRMS(Context& context, std::weak_ptr<ZRReportingSession> session);
 
     [[nodiscard]] bool interestedInMessage(const ZRReportingSessionMessage& message) const override;
     [[nodiscard]] bool canFire() const noexcept override { return true; }

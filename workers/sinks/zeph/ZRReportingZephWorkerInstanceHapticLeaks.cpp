@@ -17,9 +17,9 @@ std::shared_ptr<WorkerInstanceState> makeState() {
 } // namespace
 
 ZRReportingZephWorkerInstanceHapticLeaks::ZRReportingZephWorkerInstanceHapticLeaks(
-    std::weak_ptr<ZRReportingSession> session)
-    : ZRReportingSessionZephWorkerInstance(std::move(session)) {
-    setWorkerState(sharedWorkerInstanceState(kClassName, makeState));
+    Context& context, std::weak_ptr<ZRReportingSession> session)
+    : ZRReportingSessionZephWorkerInstance(context, std::move(session)) {
+    setWorkerState(context.shared<SharedWorkerInstanceStates>().of(kClassName, makeState));
 }
 
 bool ZRReportingZephWorkerInstanceHapticLeaks::interestedInMessage(

@@ -12,7 +12,7 @@ class ZRReportingZephWorkerInstanceHapticLeaks final : public ZRReportingSession
 public:
     static constexpr std::string_view kClassName = "ZRReportingZephWorkerInstanceHapticLeaks";
 
-    explicit ZRReportingZephWorkerInstanceHapticLeaks(std::weak_ptr<ZRReportingSession> session);
+    ZRReportingZephWorkerInstanceHapticLeaks(Context& context, std::weak_ptr<ZRReportingSession> session);
 
     [[nodiscard]] bool interestedInMessage(const ZRReportingSessionMessage& message) const override;
     [[nodiscard]] bool canFire() const noexcept override { return true; }

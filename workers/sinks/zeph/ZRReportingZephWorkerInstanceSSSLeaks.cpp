@@ -1,6 +1,5 @@
 #include "workers/sinks/zeph/ZRReportingZephWorkerInstanceSSSLeaks.h"
 
-#include "platform/Platform.h"
 #include "util/Log.h"
 #include "workers/sinks/zeph/LeakSnapshot.h"
 
@@ -11,8 +10,10 @@ namespace {
 /// A stuck sound is reported again and again; its captures would all show the same.
 constexpr std::chrono::seconds kBetweenFirings{15};
 
-/// Used on the thread that does the sessions' work, like the state that the detectors share.
-constinit std::optional<WallTime> lastFiring;
+/// The last firing of any of the detectors. On the thread that does the sessions' work.
+struct Firings {
+    std::optional<WallTime> last;
+};
 
 std::shared_ptr<WorkerInstanceState> makeState() {
     auto state = std::make_shared<WorkerInstanceState>();
@@ -23,9 +24,9 @@ std::shared_ptr<WorkerInstanceState> makeState() {
 } // namespace
 
 ZRReportingZephWorkerInstanceSSSLeaks::ZRReportingZephWorkerInstanceSSSLeaks(
-    std::weak_ptr<ZRReportingSession> session)
-    : ZRReportingSessionZephWorkerInstance(std::move(session)) {
-    setWorkerState(sharedWorkerInstanceState(kClassName, makeState));
+    Context& context, std::weak_ptr<ZRReportingSession> session)
+    : ZRReportingSessionZephWorkerInstance(context, std::move(session)) {
+    setWorkerState(context.shared<SharedWorkerInstanceStates>().of(kClassName, makeState));
 }
 
 bool ZRReportingZephWorkerInstanceSSSLeaks::interestedInMessage(
@@ -35,17 +36,14 @@ bool ZRReportingZephWorkerInstanceSSSLeaks::interestedInMessage(
 }
 
 void ZRReportingZephWorkerInstanceSSSLeaks::fire(const ZRReportingSessionMessage& message) {
-    const WallTime now = platform().clock.now();
+    const WallTime now = context().platform().clock->now();
+    std::optional<WallTime>& lastFiring = context().shared<Firings>().last;
     if (lastFiring && now - *lastFiring < kBetweenFirings) {
         log::info(ZRReportingZephLogCategory(), "Already fired {} recently.", kClassName);
         return;
     }
     lastFiring = now;
     requestLeakSnapshot(*this, message, AudioServiceTypeSystemSounds, "system sound server");
-}
-
-void ZRReportingZephWorkerInstanceSSSLeaks::forgetLastFiring() noexcept {
-    lastFiring.reset();
 }
 
 } // namespace tamblo

@@ -12,14 +12,11 @@ class ZRReportingZephWorkerInstanceSSSLeaks final : public ZRReportingSessionZep
 public:
     static constexpr std::string_view kClassName = "ZRReportingZephWorkerInstanceSSSLeaks";
 
-    explicit ZRReportingZephWorkerInstanceSSSLeaks(std::weak_ptr<ZRReportingSession> session);
+    ZRReportingZephWorkerInstanceSSSLeaks(Context& context, std::weak_ptr<ZRReportingSession> session);
 
     [[nodiscard]] bool interestedInMessage(const ZRReportingSessionMessage& message) const override;
     [[nodiscard]] bool canFire() const noexcept override { return true; }
     void fire(const ZRReportingSessionMessage& message) override;
-
-    /// Makes the next firing the process's first.
-    static void forgetLastFiring() noexcept;
 };
 
 } // namespace tamblo

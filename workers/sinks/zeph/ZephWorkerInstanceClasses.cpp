@@ -12,8 +12,8 @@ namespace {
 
 template <typename Detector>
 std::unique_ptr<ZRReportingSessionZephWorkerInstance>
-initWithSession(const std::shared_ptr<ZRReportingSession>& session) {
-    return std::make_unique<Detector>(session);
+initWithSession(Context& context, const std::shared_ptr<ZRReportingSession>& session) {
+    return std::make_unique<Detector>(context, session);
 }
 
 constexpr std::array<ZephWorkerInstanceClass, 4> kInstanceClasses{{
