@@ -5,6 +5,7 @@
 #include "base/Value.h"
 
 #include <cstddef>
+#include <optional>
 #include <string>
 #include <string_view>
 #include <variant>
@@ -15,14 +16,20 @@ namespace tamblo {
 /// text that reads back the same, with `.0` when integral; single-precision floats likewise in single
 /// precision. Dates become RFC 3339 texts, byte strings Base64 texts, numbers that are not finite `null`.
 void appendJson(TextBuffer& out, const Value& value);
-void appendJson(TextBuffer& out, const Dictionary& dictionary);
 /// Appends a text in quotes, escaped.
 void appendJsonString(TextBuffer& out, std::string_view text);
 /// Appends a double by the rule above.
 void appendJsonNumber(TextBuffer& out, double number);
 
 [[nodiscard]] std::string jsonText(const Value& value);
-[[nodiscard]] std::string jsonText(const Dictionary& dictionary);
+
+/// Appends an object of one key and the dictionary for people: two spaces for each level, a key or an element
+/// on a line of its own, `"key": value`; `{}` and `[]` when empty; no line end behind it.
+///
+/// Nothing stands in for a value without a JSON form (a date, a byte string, a number that is not finite):
+/// then nothing is appended, and the answer says which kind it is and where, as a pointer (RFC 6901).
+[[nodiscard]] std::optional<std::string> appendPrettyJson(TextBuffer& out, std::string_view key,
+                                                          const Dictionary& dictionary);
 
 /// Where and why a text is not JSON, for people: line and column count from 1.
 struct JsonError {

@@ -9,6 +9,7 @@
 #include <cmath>
 #include <cstdint>
 #include <cstring>
+#include <span>
 
 namespace tamblo {
 
@@ -37,30 +38,9 @@ char escapeOf(char character) noexcept {
     return kEscapes[static_cast<unsigned char>(character)];
 }
 
-/// Whether one of the eight bytes needs an escape: each test sets the high bit of the bytes that it finds,
-/// and may do so for others only next to one that it found.
-bool anyNeedsEscape(std::uint64_t block) noexcept {
-    constexpr std::uint64_t ones = 0x0101'0101'0101'0101;
-    constexpr std::uint64_t highBits = ones * 0x80;
-    const std::uint64_t quote = block ^ (ones * '"');
-    const std::uint64_t backslash = block ^ (ones * '\\');
-    const std::uint64_t found =
-        ((block - ones * 0x20) & ~block) | ((quote - ones) & ~quote) | ((backslash - ones) & ~backslash);
-    return (found & highBits) != 0;
-}
-
 /// Copies bytes up to the first that needs an escape, and answers how many.
 std::size_t copyPlain(char* to, std::string_view text) noexcept {
     std::size_t i = 0;
-    while (text.size() - i >= 8) {
-        std::uint64_t block;
-        std::memcpy(&block, text.data() + i, sizeof block);
-        if (anyNeedsEscape(block)) {
-            break;
-        }
-        std::memcpy(to + i, &block, sizeof block);
-        i += 8;
-    }
     while (i < text.size() && escapeOf(text[i]) == 0) {
         to[i] = text[i];
         ++i;
@@ -89,37 +69,6 @@ char* writeText(char* to, std::string_view text) noexcept {
 
 template <typename Number> char* writeNumber(char* to, Number number) noexcept {
     return std::to_chars(to, to + kScalarRoom, number).ptr;
-}
-
-/// Writes a number of few decimals, as most measurements are, without the general algorithm; nothing for
-/// others. Among the decimals of as few digits as the type holds exactly, no two read as the same number: the
-/// one that reads back is therefore the shortest.
-template <typename Float> char* writeShortDecimal(char* to, Float number) noexcept {
-    constexpr bool isSingle = std::is_same_v<Float, float>;
-    constexpr std::uint32_t scale = isSingle ? 1'000 : 1'000'000;
-    constexpr Float limit = isSingle ? Float(1e3) : Float(1e9);
-    const Float magnitude = std::abs(number);
-    if (!(magnitude >= Float(1e-3) && magnitude < limit)) {
-        return nullptr;
-    }
-    const auto scaled = static_cast<std::uint64_t>(magnitude * Float(scale) + Float(0.5));
-    auto fraction = static_cast<std::uint32_t>(scaled % scale);
-    if (static_cast<Float>(scaled) / Float(scale) != magnitude || fraction == 0) {
-        return nullptr;
-    }
-    if (number < 0) {
-        *to++ = '-';
-    }
-    to = writeNumber(to, static_cast<std::uint32_t>(scaled / scale));
-    *to++ = '.';
-    std::size_t digits = isSingle ? 3 : 6;
-    for (; fraction % 10 == 0; fraction /= 10) {
-        --digits;
-    }
-    for (std::size_t i = digits; i > 0; fraction /= 10) {
-        to[--i] = static_cast<char>('0' + fraction % 10);
-    }
-    return to + digits;
 }
 
 /// The shortest text of a number with a fraction, in exact fixed-point arithmetic: its digits, up to the
@@ -184,9 +133,6 @@ template <typename Float> char* writeFloat(char* to, Float number) noexcept {
             return end;
         }
     }
-    if (char* const end = writeShortDecimal(to, number)) {
-        return end;
-    }
     char* const end = writeNumber(to, number);
     const std::string_view text(to, static_cast<std::size_t>(end - to));
     return text.find_first_of(".e") == std::string_view::npos ? writeText(end, ".0") : end;
@@ -220,8 +166,6 @@ char* writeScalar(char* to, const Value& value) {
     }
 }
 
-void appendArray(TextBuffer& out, std::span<const Value> elements);
-
 /// Appends a text behind a lead-in (a separator, a key).
 void appendQuoted(TextBuffer& out, std::string_view lead, std::string_view text) {
     char* const begin = out.room(lead.size() + text.size() + 2);
@@ -242,59 +186,151 @@ void appendQuoted(TextBuffer& out, std::string_view lead, std::string_view text)
     out.commit(static_cast<std::size_t>(at - out.data()) - out.size());
 }
 
-void appendItem(TextBuffer& out, std::string_view lead, const Value& value) {
+/// Writes values on one line, or for people: a key or an element on a line of its own.
+class Writer {
+public:
+    Writer(TextBuffer& out, std::size_t indent) noexcept : out_(out), indent_(indent) {}
+
+    /// A value behind a lead-in (a key).
+    void item(std::string_view lead, const Value& value) {
+        switch (value.kind()) {
+        case Value::Kind::string:
+            return appendQuoted(out_, lead, value.stringValue());
+        case Value::Kind::data:
+            return appendQuoted(out_, lead, encodeBase64(value.dataValue()));
+        case Value::Kind::array:
+            out_.append(lead);
+            return array(value.arrayValue());
+        case Value::Kind::dictionary:
+            out_.append(lead);
+            return dictionary(value.dictionaryValue());
+        default:
+            break;
+        }
+        char* const begin = out_.room(lead.size() + kScalarRoom);
+        char* const end = writeScalar(writeText(begin, lead), value);
+        out_.commit(static_cast<std::size_t>(end - begin));
+    }
+
+    void open(char bracket) {
+        out_.append(bracket);
+        depth_ += indent_;
+    }
+    void separate(std::size_t index) {
+        if (index != 0) {
+            out_.append(',');
+        }
+        startLine();
+    }
+    void close(char bracket, std::size_t count) {
+        depth_ -= indent_;
+        if (count != 0) {
+            startLine();
+        }
+        out_.append(bracket);
+    }
+
+private:
+    void dictionary(const Dictionary& dictionary) {
+        const KeySet& keys = dictionary.keys();
+        const std::span<const Value> values = dictionary.values();
+        open('{');
+        for (std::size_t i = 0; i < values.size(); ++i) {
+            separate(i);
+            if (indent_ == 0) {
+                item(keys.jsonKey(i), values[i]);
+            } else {
+                out_.append(keys.jsonKey(i));
+                item(" ", values[i]);
+            }
+        }
+        close('}', values.size());
+    }
+
+    void array(std::span<const Value> elements) {
+        open('[');
+        for (std::size_t i = 0; i < elements.size(); ++i) {
+            separate(i);
+            item("", elements[i]);
+        }
+        close(']', elements.size());
+    }
+
+    void startLine() {
+        if (indent_ != 0) {
+            char* const line = out_.room(1 + depth_);
+            *line = '\n';
+            std::memset(line + 1, ' ', depth_);
+            out_.commit(1 + depth_);
+        }
+    }
+
+    TextBuffer& out_;
+    std::size_t indent_; ///< spaces for each level; none for one line
+    std::size_t depth_ = 0;
+};
+
+/// The kind of the first value in this one, which stands at `step`, that JSON has no form for, for people;
+/// null without one. The way to it is put in front of `pointer`.
+const char* kindWithoutForm(std::string_view step, const Value& value, std::string& pointer) {
+    const char* kind = nullptr;
     switch (value.kind()) {
-    case Value::Kind::string:
-        return appendQuoted(out, lead, value.stringValue());
+    case Value::Kind::date:
+        kind = "a date";
+        break;
     case Value::Kind::data:
-        return appendQuoted(out, lead, encodeBase64(value.dataValue()));
+        kind = "a byte string";
+        break;
+    case Value::Kind::singleFloat:
+    case Value::Kind::doubleFloat:
+        kind = std::isfinite(value.doubleValue()) ? nullptr : "a number that is not finite";
+        break;
     case Value::Kind::array:
-        out.append(lead);
-        return appendArray(out, value.arrayValue());
-    case Value::Kind::dictionary:
-        out.append(lead);
-        return appendJson(out, value.dictionaryValue());
+        for (std::size_t i = 0; kind == nullptr && i < value.arrayValue().size(); ++i) {
+            kind = kindWithoutForm(std::to_string(i), value.arrayValue()[i], pointer);
+        }
+        break;
+    case Value::Kind::dictionary: {
+        const Dictionary& dictionary = value.dictionaryValue();
+        for (std::size_t i = 0; kind == nullptr && i < dictionary.size(); ++i) {
+            kind = kindWithoutForm(dictionary.keyAt(i), dictionary.valueAt(i), pointer);
+        }
+        break;
+    }
     default:
         break;
     }
-    char* const begin = out.room(lead.size() + kScalarRoom);
-    char* const end = writeScalar(writeText(begin, lead), value);
-    out.commit(static_cast<std::size_t>(end - begin));
-}
-
-void appendArray(TextBuffer& out, std::span<const Value> elements) {
-    out.append('[');
-    std::string_view separator = "";
-    for (const Value& element : elements) {
-        appendItem(out, separator, element);
-        separator = ",";
+    if (kind != nullptr) {
+        std::string escaped = "/";
+        for (const char character : step) {
+            escaped += character == '~' ? "~0" : character == '/' ? "~1" : std::string(1, character);
+        }
+        pointer.insert(0, escaped);
     }
-    out.append(']');
-}
-
-template <typename Item> std::string textOf(const Item& item) {
-    TextBuffer out;
-    appendJson(out, item);
-    return std::string(out.view());
+    return kind;
 }
 
 } // namespace
 
 void appendJson(TextBuffer& out, const Value& value) {
-    appendItem(out, "", value);
+    Writer(out, 0).item("", value);
 }
 
-void appendJson(TextBuffer& out, const Dictionary& dictionary) {
-    const KeySet& keys = dictionary.keys();
-    const std::span<const Value> values = dictionary.values();
-    out.append('{');
-    for (std::size_t i = 0; i < values.size(); ++i) {
-        if (i != 0) {
-            out.append(',');
-        }
-        appendItem(out, keys.jsonKey(i), values[i]);
+std::optional<std::string> appendPrettyJson(TextBuffer& out, std::string_view key,
+                                            const Dictionary& dictionary) {
+    const Value value(dictionary);
+    std::string pointer;
+    if (const char* const kind = kindWithoutForm(key, value, pointer)) {
+        return std::string(kind) + " has no JSON form, at " + pointer;
     }
-    out.append('}');
+    constexpr std::size_t indent = 2;
+    Writer writer(out, indent);
+    writer.open('{');
+    writer.separate(0);
+    appendJsonString(out, key);
+    writer.item(": ", value);
+    writer.close('}', 1);
+    return std::nullopt;
 }
 
 void appendJsonString(TextBuffer& out, std::string_view text) {
@@ -307,11 +343,9 @@ void appendJsonNumber(TextBuffer& out, double number) {
 }
 
 std::string jsonText(const Value& value) {
-    return textOf(value);
-}
-
-std::string jsonText(const Dictionary& dictionary) {
-    return textOf(dictionary);
+    TextBuffer out;
+    appendJson(out, value);
+    return std::string(out.view());
 }
 
 } // namespace tamblo

@@ -1,5 +1,4 @@
-#include "base/Json.h"
-#include "base/JsonElements.h"
+#include "base/JsonReader.h"
 
 #include <cstddef>
 #include <cstdint>
@@ -22,8 +21,8 @@ void require(bool holds) {
 void checkJson(std::string_view text) {
     const auto first = readJson(text);
     const auto strict = readJson(text, {.refuseNull = true});
-    JsonElements elements(text);
-    while (elements.next() != nullptr) {
+    JsonReader elements(text);
+    while (elements.readElement() != nullptr) {
     }
     const auto* read = std::get_if<Value>(&first);
     require(elements.error().has_value() == (read == nullptr || !read->isArray()));

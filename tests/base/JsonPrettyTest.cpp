@@ -1,4 +1,3 @@
-#include "base/JsonPretty.h"
 #include "base/Json.h"
 #include "tests/base/RandomValues.h"
 

@@ -1,5 +1,4 @@
-#include "base/Json.h"
-#include "base/JsonElements.h"
+#include "base/JsonReader.h"
 #include "tests/base/RandomValues.h"
 
 #include <gtest/gtest.h>
@@ -48,9 +47,9 @@ Value valueOf(const JsonItem& item) {
 void expectSameByElements(const std::string& element) {
     const std::string text = "[" + element + "]";
     const auto whole = readJson(text);
-    JsonElements elements(text);
+    JsonReader elements(text);
     Array found;
-    while (const JsonItem* item = elements.next()) {
+    while (const JsonItem* item = elements.readElement()) {
         if (item->kind != JsonItem::Kind::null) {
             found.push_back(valueOf(*item));
         }

@@ -1,7 +1,7 @@
 #include "workers/sinks/ZRReportingSessionSummaryJsonFileWorker.h"
 
 #include "base/Format.h"
-#include "base/JsonPretty.h"
+#include "base/Json.h"
 #include "session/ZRReportingSession.h"
 #include "util/AudioEvents.h"
 #include "util/Log.h"

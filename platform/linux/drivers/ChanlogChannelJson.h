@@ -1,6 +1,6 @@
 #pragma once
 
-#include "base/JsonElements.h"
+#include "base/JsonReader.h"
 #include "platform/ChanlogFacility.h"
 
 #include <cstddef>

@@ -67,14 +67,14 @@ bool JsonFile::readArray(const std::function<void(const JsonItem&)>& take, Struc
     if (!text) {
         return false;
     }
-    JsonElements elements(*text);
-    while (const JsonItem* element = elements.next()) {
+    JsonReader reader(*text);
+    while (const JsonItem* element = reader.readElement()) {
         if (element->kind != JsonItem::Kind::null) {
             take(*element);
         }
     }
-    if (elements.error()) {
-        report(log, *elements.error());
+    if (reader.error()) {
+        report(log, *reader.error());
         return false;
     }
     reportedFault_.clear();

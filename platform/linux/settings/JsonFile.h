@@ -1,7 +1,7 @@
 #pragma once
 
 #include "base/Dictionary.h"
-#include "base/JsonElements.h"
+#include "base/JsonReader.h"
 #include "os/FileState.h"
 #include "platform/StructuredLog.h"
 
