@@ -128,7 +128,6 @@ private:
     bool readFloatingPoint(const Head& head, Value& value) noexcept;
     bool readSimple(const Head& head, Value& value) noexcept;
     bool readString(const Head& head, Value& value);
-    bool readRecentText(std::string_view text, Value& value);
     bool readKey(std::string_view& key);
     bool takeBytes(const Head& head, std::string_view& bytes) noexcept;
     /// One definite piece of a text or byte string of indefinite length.

@@ -334,40 +334,28 @@ bool CborReader::assembleChunks(Type major, std::string& bytes) {
 bool CborReader::readString(const Head& head, Value& value) {
     std::string_view bytes;
     std::string assembled;
-    if (head.info == kIndefinite) {
-        if (!assembleChunks(head.major, assembled)) {
-            return false;
-        }
-        bytes = assembled;
-    } else {
+    if (head.info != kIndefinite) {
         if (!takeBytes(head, bytes)) {
             return false;
         }
-        if (head.major == Type::text && keySets_ != nullptr && RecentTexts::covers(bytes)) {
-            return readRecentText(bytes, value);
-        }
-        if (head.major == Type::text && !isUtf8(bytes)) {
-            return fail(CborError::notUtf8);
-        }
-    }
-    if (head.major == Type::text) {
-        value = Value(bytes);
+    } else if (assembleChunks(head.major, assembled)) {
+        bytes = assembled;
     } else {
+        return false;
+    }
+    if (head.major == Type::bytes) {
         value = Value::data({reinterpret_cast<const std::uint8_t*>(bytes.data()), bytes.size()});
+        return true;
     }
-    return true;
-}
-
-bool CborReader::readRecentText(std::string_view text, Value& value) {
-    Value& recent = keySets_->recentTexts().place(text);
-    if (recent.stringValue() != text) {
-        if (!isUtf8(text)) {
-            return fail(CborError::notUtf8);
+    if (keySets_ != nullptr) {
+        std::optional<Value> text = keySets_->textValue(bytes);
+        if (text) {
+            value = *std::move(text);
         }
-        recent = Value(text);
+        return text || fail(CborError::notUtf8);
     }
-    value = recent;
-    return true;
+    value = Value(bytes);
+    return isUtf8(bytes) || fail(CborError::notUtf8);
 }
 
 bool CborReader::readDate(const Head& head, Value& value) {

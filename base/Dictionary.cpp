@@ -234,11 +234,11 @@ void Dictionary::addAll(const Dictionary& other) {
     for (; mine < count; ++mine) {
         add(keyAt(mine), valueAt(mine));
     }
-    *this = adopt(KeySet::make(merged), mergedValues, places);
+    *this = fromKeySet(KeySet::make(merged), mergedValues, places);
 }
 
-Dictionary Dictionary::adopt(KeySetRef keys, std::span<Value> values, std::span<const std::uint32_t> places,
-                             std::size_t spare) {
+Dictionary Dictionary::fromKeySet(KeySetRef keys, std::span<Value> values,
+                                  std::span<const std::uint32_t> places, std::size_t spare) {
     Dictionary dictionary;
     dictionary.block_ = Block::make(values.size() + spare, std::move(keys));
     Value* to = dictionary.block_->values();

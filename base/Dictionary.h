@@ -52,8 +52,8 @@ public:
 
     /// Builds a dictionary from one value for each key; `places[i]` is the index of the key that `values[i]`
     /// belongs to, each index once. `spare` is room for keys to come. The values are moved from.
-    static Dictionary adopt(KeySetRef keys, std::span<Value> values, std::span<const std::uint32_t> places,
-                            std::size_t spare = 0);
+    static Dictionary fromKeySet(KeySetRef keys, std::span<Value> values,
+                                 std::span<const std::uint32_t> places, std::size_t spare = 0);
 
     [[nodiscard]] bool operator==(const Dictionary& other) const noexcept;
     /// Equal but for the entries of the ignored keys, wherever they stand.

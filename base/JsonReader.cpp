@@ -2,11 +2,13 @@
 
 #include "base/Format.h"
 #include "base/KeySetCache.h"
+#include "base/NumberText.h"
 #include "base/Utf8.h"
 
 #include <algorithm>
 #include <array>
 #include <charconv>
+#include <cmath>
 #include <cstdint>
 #include <utility>
 
@@ -42,34 +44,6 @@ JsonError errorAt(std::string_view text, std::size_t offset, std::string message
         }
     }
     return error;
-}
-
-/// Whether a number that no double can hold is too small for one, not too large: what counts is the power of
-/// ten in front of which its first digit that is not 0 stands.
-bool isTiny(std::string_view number) noexcept {
-    const std::size_t exponentAt = std::min(number.find_first_of("eE"), number.size());
-    const std::string_view digits = number.substr(0, exponentAt);
-    const std::size_t point = std::min(digits.find('.'), digits.size());
-    const std::size_t first = digits.find_first_of("123456789");
-    if (first == std::string_view::npos) {
-        return true;
-    }
-    if (exponentAt == number.size()) {
-        return first > point;
-    }
-    number.remove_prefix(exponentAt + 1);
-    const bool negative = number.starts_with('-');
-    if (!isDigit(number.front())) {
-        number.remove_prefix(1);
-    }
-    std::int64_t exponent = 0;
-    const auto result = std::from_chars(number.data(), number.data() + number.size(), exponent);
-    if (result.ec != std::errc()) {
-        return negative;
-    }
-    return (negative ? -exponent : exponent) + static_cast<std::int64_t>(point) -
-               static_cast<std::int64_t>(first) <
-           0;
 }
 
 void appendUtf8(std::string& out, std::uint32_t code) {
@@ -338,14 +312,12 @@ bool JsonReader::takeNumber(Value& number) {
         number = Value(integer);
         return true;
     }
-    double real = 0;
-    if (std::from_chars(begin, end, real).ec != std::errc()) {
-        if (!isTiny(text)) {
-            return failAt(start, "the number is too large");
-        }
-        real = text.front() == '-' ? -0.0 : 0.0;
+    const bool isNegative = text.front() == '-';
+    const double magnitude = nearestDouble(text.substr(isNegative ? 1 : 0));
+    if (std::isinf(magnitude)) {
+        return failAt(start, "the number is too large");
     }
-    number = Value(real);
+    number = Value(isNegative ? -magnitude : magnitude);
     return true;
 }
 
@@ -493,13 +465,12 @@ bool JsonReader::takeEnd() {
 
 namespace {
 
-/// Objects of one kind, as the elements of an array mostly are, share their keys.
-Value valueOf(const JsonItem& item, KeySetCache& keySets) {
+Value valueOf(const JsonItem& item) {
     Array values;
     std::vector<std::string_view> keys;
     for (const JsonItem* inner = item.first(); inner != item.end(); inner = inner->next()) {
         if (inner->kind != JsonItem::Kind::null) {
-            values.push_back(valueOf(*inner, keySets));
+            values.push_back(valueOf(*inner));
             keys.push_back(inner->key);
         }
     }
@@ -510,7 +481,7 @@ Value valueOf(const JsonItem& item, KeySetCache& keySets) {
         return values;
     case JsonItem::Kind::object: {
         Dictionary dictionary;
-        (void)keySets.makeDictionary(keys, values, 0, dictionary); // the keys are known to differ
+        (void)KeySetCache::makeDictionaryOnce(keys, values, 0, dictionary); // the keys are known to differ
         return dictionary;
     }
     default:
@@ -529,8 +500,7 @@ std::variant<Value, JsonError> readJson(std::string_view text, JsonReadOptions o
     if (whole->kind == JsonItem::Kind::null) {
         return JsonError{1, 1, "null is not a value here"};
     }
-    KeySetCache keySets;
-    return valueOf(*whole, keySets);
+    return valueOf(*whole);
 }
 
 } // namespace tamblo

@@ -1,5 +1,6 @@
 #pragma once
 
+#include "base/BoundedCache.h"
 #include "base/KeySet.h"
 
 #include <algorithm>
@@ -31,28 +32,26 @@ public:
     /// The index of each key in the key set, `kAbsent` for those that it does not hold. Lives until the next
     /// call.
     [[nodiscard]] const Places& in(const KeySet& keySet) {
-        Known& known = known_[slotOf(keySet)];
-        if (known.keySet.get() != &keySet) [[unlikely]] {
-            find(keySet, known);
-        }
-        return known.places;
+        return known_.get(reinterpret_cast<std::uintptr_t>(&keySet), [&] { return find(keySet); }).places;
     }
 
 private:
-    static constexpr std::size_t kSlots = 32;
-
     struct Known {
         KeySetRef keySet; ///< held, so that no other can come to stand at its address
         Places places;
     };
 
-    static std::size_t slotOf(const KeySet& keySet) noexcept {
-        return (reinterpret_cast<std::uintptr_t>(&keySet) >> 6U) % kSlots;
+    [[nodiscard]] Known find(const KeySet& keySet) const {
+        Known known{KeySetRef(&keySet), {}};
+        for (std::size_t i = 0; i < keys_.size(); ++i) {
+            const std::size_t place = keySet.find(keys_[i]);
+            known.places[i] = place != KeySet::kNotFound ? static_cast<std::uint32_t>(place) : kAbsent;
+        }
+        return known;
     }
-    void find(const KeySet& keySet, Known& known) const;
 
     const std::span<const std::string_view> keys_;
-    std::array<Known, kSlots> known_;
+    BoundedCache<Known, 8> known_;
 };
 
 } // namespace tamblo

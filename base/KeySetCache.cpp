@@ -19,8 +19,8 @@ std::uint64_t mix(std::uint64_t hash, std::uint64_t word) noexcept {
     return hash ^ hash >> 29;
 }
 
-/// A hash of keys in their order, good enough to tell the kinds of messages apart: of each key its length and
-/// up to sixteen of its bytes. What it answers is verified key by key.
+/// A hash of texts in their order, good enough to tell the kinds of messages apart: of each text its length
+/// and up to sixteen of its bytes. What is found by it is verified text by text.
 std::uint64_t hashKeys(std::span<const std::string_view> keys) noexcept {
     std::uint64_t hash = keys.size();
     for (const std::string_view key : keys) {
@@ -74,48 +74,36 @@ bool isWorthRemembering(std::span<const std::string_view> keys) noexcept {
 
 } // namespace
 
-/// The keys of a map as they came, and where each stands among the sorted ones.
-struct KeySetCache::Shape {
-    std::uint64_t hash;
-    KeySetRef keys;
-    std::vector<std::uint32_t> places;
-
-    [[nodiscard]] bool matches(std::uint64_t otherHash,
-                               std::span<const std::string_view> arrived) const noexcept {
-        if (hash != otherHash || places.size() != arrived.size()) {
+bool KeySetCache::Shape::matches(std::span<const std::string_view> arrived) const noexcept {
+    if (!keys || places.size() != arrived.size()) {
+        return false;
+    }
+    for (std::size_t i = 0; i < arrived.size(); ++i) {
+        if (!keys->is(places[i], arrived[i])) {
             return false;
         }
-        for (std::size_t i = 0; i < arrived.size(); ++i) {
-            if (!keys->is(places[i], arrived[i])) {
-                return false;
-            }
-        }
-        return true;
     }
-};
-
-KeySetCache::KeySetCache() = default;
-KeySetCache::~KeySetCache() = default;
+    return true;
+}
 
 KeySetCache::Fault KeySetCache::makeDictionary(std::span<const std::string_view> keys,
                                                std::span<Value> values, std::size_t spare,
                                                Dictionary& dictionary) {
     const std::uint64_t hash = hashKeys(keys);
-    std::unique_ptr<Shape>& slot = slots_[hash % kSlots];
-    if (slot && slot->matches(hash, keys)) {
-        dictionary = Dictionary::adopt(slot->keys, values, slot->places, spare);
-        return Fault::none;
+    const Shape* known = shapes_.find(hash, [keys](const Shape& shape) { return shape.matches(keys); });
+    if (known == nullptr) {
+        if (!isWorthRemembering(keys)) {
+            return makeDictionaryOnce(keys, values, spare, dictionary);
+        }
+        Shape shape;
+        const Fault fault = sortKeys(keys, shape.keys, shape.places);
+        if (fault != Fault::none) {
+            return fault;
+        }
+        known = &shapes_.put(hash, std::move(shape));
     }
-    if (!isWorthRemembering(keys)) {
-        return makeDictionaryOnce(keys, values, spare, dictionary);
-    }
-    Shape shape{hash, {}, {}};
-    const Fault fault = sortKeys(keys, shape.keys, shape.places);
-    if (fault == Fault::none) {
-        dictionary = Dictionary::adopt(shape.keys, values, shape.places, spare);
-        slot = std::make_unique<Shape>(std::move(shape));
-    }
-    return fault;
+    dictionary = Dictionary::fromKeySet(known->keys, values, known->places, spare);
+    return Fault::none;
 }
 
 KeySetCache::Fault KeySetCache::makeDictionaryOnce(std::span<const std::string_view> keys,
@@ -125,9 +113,27 @@ KeySetCache::Fault KeySetCache::makeDictionaryOnce(std::span<const std::string_v
     std::vector<std::uint32_t> places;
     const Fault fault = sortKeys(keys, sorted, places);
     if (fault == Fault::none) {
-        dictionary = Dictionary::adopt(std::move(sorted), values, places, spare);
+        dictionary = Dictionary::fromKeySet(std::move(sorted), values, places, spare);
     }
     return fault;
+}
+
+std::optional<Value> KeySetCache::textValue(std::string_view text) {
+    // Shorter texts lie in their value. Longer ones would make the memory held here large, and seldom repeat.
+    constexpr std::size_t shortest = 15;
+    constexpr std::size_t longest = 96;
+    const bool isRemembered = text.size() >= shortest && text.size() <= longest;
+    const std::uint64_t hash = isRemembered ? hashKeys({&text, 1}) : 0;
+    if (isRemembered) {
+        if (const Value* known =
+                texts_.find(hash, [text](const Value& value) { return value.stringValue() == text; })) {
+            return *known;
+        }
+    }
+    if (!isUtf8(text)) {
+        return std::nullopt;
+    }
+    return isRemembered ? texts_.put(hash, Value(text)) : Value(text);
 }
 
 } // namespace tamblo

@@ -1,14 +1,13 @@
 #pragma once
 
+#include "base/BoundedCache.h"
 #include "base/Dictionary.h"
-#include "base/RecentTexts.h"
 #include "base/Value.h"
 
-#include <array>
 #include <cstddef>
 #include <cstdint>
 #include <list>
-#include <memory>
+#include <optional>
 #include <span>
 #include <string>
 #include <string_view>
@@ -31,8 +30,7 @@ class KeySetCache {
 public:
     enum class Fault : std::uint8_t { none, notUtf8, duplicateKey };
 
-    KeySetCache();
-    ~KeySetCache();
+    KeySetCache() = default;
     KeySetCache(const KeySetCache&) = delete;
     KeySetCache& operator=(const KeySetCache&) = delete;
 
@@ -45,17 +43,27 @@ public:
                                                   std::span<Value> values, std::size_t spare,
                                                   Dictionary& dictionary);
 
+    /// The value of a text; nothing when that is not UTF-8. A client sends the same few over and over (its
+    /// application, a device, a route): the values of those that were read last share one block, which saves
+    /// the time to check and copy them and, in a session that retains its messages, most of the memory of
+    /// their payloads. The values may go to other threads.
+    [[nodiscard]] std::optional<Value> textValue(std::string_view text);
+
     /// Memory for whoever reads with this cache.
     [[nodiscard]] MapEntries& entries() noexcept { return entries_; }
-    [[nodiscard]] RecentTexts& recentTexts() noexcept { return recentTexts_; }
 
 private:
-    struct Shape;
-    static constexpr std::size_t kSlots = 512;
+    /// The keys of a map as they came, and where each stands among the sorted ones.
+    struct Shape {
+        KeySetRef keys;
+        std::vector<std::uint32_t> places;
 
-    std::array<std::unique_ptr<Shape>, kSlots> slots_;
+        [[nodiscard]] bool matches(std::span<const std::string_view> arrived) const noexcept;
+    };
+
+    BoundedCache<Shape, 128> shapes_;
+    BoundedCache<Value, 64> texts_;
     MapEntries entries_;
-    RecentTexts recentTexts_;
 };
 
 } // namespace tamblo

@@ -23,4 +23,8 @@ template <typename Number>
     return isHexadecimal ? parseNumber<Number>(text.substr(2), 16) : parseNumber<Number>(text);
 }
 
+/// The number that is nearest to a decimal text, which begins with a digit or a point and is read as far as
+/// it goes: infinity for one too large for a double, 0 for one too small.
+[[nodiscard]] double nearestDouble(std::string_view decimal) noexcept;
+
 } // namespace tamblo

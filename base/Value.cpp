@@ -1,6 +1,7 @@
 #include "base/Value.h"
 
 #include "base/Dictionary.h"
+#include "base/NumberText.h"
 
 #include <algorithm>
 #include <atomic>
@@ -51,15 +52,7 @@ double leadingNumber(std::string_view text) noexcept {
     if (text.empty() || !((text.front() >= '0' && text.front() <= '9') || text.front() == '.')) {
         return 0.0;
     }
-    double number = 0.0;
-    const auto result = std::from_chars(text.data(), text.data() + text.size(), number);
-    if (result.ec == std::errc::result_out_of_range) {
-        const std::string_view read(text.data(), static_cast<std::size_t>(result.ptr - text.data()));
-        const std::size_t exponent = read.find_first_of("eE");
-        const bool isTiny = exponent != std::string_view::npos ? read[exponent + 1] == '-'
-                                                               : read[read.find_first_not_of('0')] == '.';
-        number = isTiny ? 0.0 : std::numeric_limits<double>::infinity();
-    }
+    const double number = nearestDouble(text);
     return negative ? -number : number;
 }
 

@@ -1,6 +1,6 @@
 #include "session/MessageIntake.h"
 
-#include "util/BoundedCache.h"
+#include "base/BoundedCache.h"
 #include "util/MessageKeys.h"
 
 #include <algorithm>
@@ -77,7 +77,7 @@ void removeWhiteSpaceFromKeys(Dictionary& payload) {
     }
     std::vector<std::uint32_t> places(keys.size());
     std::iota(places.begin(), places.end(), 0U);
-    payload = Dictionary::adopt(KeySet::make(keys), values, places, kKeysAddedAfterwards);
+    payload = Dictionary::fromKeySet(KeySet::make(keys), values, places, kKeysAddedAfterwards);
 }
 
 void addAudioMessageTag(Dictionary& payload, AudioEventCategory category, AudioEventType type) {

@@ -100,7 +100,7 @@ Dictionary payloadOf(ZRReportingDriverUtility::DriverStats& stats) {
     }
     std::vector<std::uint32_t> places(keys.size());
     std::iota(places.begin(), places.end(), 0U);
-    return Dictionary::adopt(KeySet::make(keys), values, places, kKeysToBeAdded);
+    return Dictionary::fromKeySet(KeySet::make(keys), values, places, kKeysToBeAdded);
 }
 
 void send(ZRReportingSession& session, ZRReportingDriverUtility::DriverStats& stats, AudioEventType type) {

@@ -2,7 +2,7 @@
 
 #include "base/Cbor.h"
 #include "base/Format.h"
-#include "base/Json.h"
+#include "base/JsonObject.h"
 #include "client/Vocabulary.h"
 #include "wire/FrameSplitter.h"
 #include "wire/Reply.h"
@@ -49,52 +49,27 @@ std::optional<std::vector<std::uint8_t>> bytesOfHex(std::string_view text) {
     return isHalf ? std::nullopt : std::optional(std::move(bytes));
 }
 
-/// A JSON object whose members stay in the order in which they are added.
-class JsonObject {
-public:
-    template <typename T> JsonObject& add(std::string_view name, const T& value) {
-        begin(name);
-        appendJson(out_, Value(value));
-        return *this;
-    }
-    JsonObject& addNull(std::string_view name) {
-        begin(name);
-        out_.append("null");
-        return *this;
-    }
-    [[nodiscard]] std::string line() const { return std::string(out_.view()) + "}\n"; }
-
-private:
-    void begin(std::string_view name) {
-        out_.append(out_.empty() ? '{' : ',');
-        appendJsonString(out_, name);
-        out_.append(':');
-    }
-
-    TextBuffer out_;
-};
-
 void addParameters(JsonObject& object, const wire::Request& request) {
     switch (request.method) {
     case wire::Method::sendMessage: {
-        object.add("payload", request.dictionary).add("category", request.category);
+        object.value("payload", request.dictionary).value("category", request.category);
         if (const auto name = client::categoryName(client::EventCategory{request.category}); !name.empty()) {
-            object.add("categoryName", name);
+            object.value("categoryName", name);
         }
-        object.add("type", unsigned{request.type});
+        object.value("type", unsigned{request.type});
         if (const auto name = client::typeName(client::EventType{request.type}); !name.empty()) {
-            object.add("typeName", name);
+            object.value("typeName", name);
         }
         Array reporters(request.reporterIDs.begin(), request.reporterIDs.end());
-        object.add("reporterIDs", reporters);
+        object.value("reporterIDs", reporters);
         return;
     }
     case wire::Method::setServiceType:
-        object.add("type", unsigned{request.serviceType})
-            .add("typeName", client::serviceTypeName(client::ServiceType{request.serviceType}));
+        object.value("type", unsigned{request.serviceType})
+            .value("typeName", client::serviceTypeName(client::ServiceType{request.serviceType}));
         break;
     case wire::Method::setConfiguration:
-        object.add("configuration", request.dictionary);
+        object.value("configuration", request.dictionary);
         break;
     case wire::Method::getAllReporters:
     case wire::Method::killService:
@@ -102,38 +77,43 @@ void addParameters(JsonObject& object, const wire::Request& request) {
     default:
         break;
     }
-    object.add("reporterID", request.reporterID);
+    object.value("reporterID", request.reporterID);
 }
 
-std::string lineOf(const wire::Request& request) {
-    JsonObject object;
-    object.add("frame", request.id ? "request" : "request without reply");
+void appendObject(TextBuffer& out, const wire::Request& request) {
+    JsonObject object(out);
+    object.value("frame", request.id ? "request" : "request without reply");
     if (request.id) {
-        object.add("id", *request.id);
+        object.value("id", *request.id);
     }
-    object.add("method", wire::rowOf(request.method).name);
+    object.value("method", wire::rowOf(request.method).name);
     addParameters(object, request);
-    return object.line();
 }
 
-std::string lineOf(const wire::Reply& reply) {
-    JsonObject object;
-    object.add("frame", "reply").add("id", reply.id);
+void appendObject(TextBuffer& out, const wire::Reply& reply) {
+    JsonObject object(out);
+    object.value("frame", "reply").value("id", reply.id);
     if (reply.error) {
         Dictionary error{{"domain", reply.error->domain}, {"code", reply.error->code}};
         if (!reply.error->message.empty()) {
             error.set("message", reply.error->message);
         }
-        object.add("error", error);
+        object.value("error", error);
     } else {
-        object.addNull("error");
+        object.null("error");
     }
     if (reply.result) {
-        object.add("result", *reply.result);
+        object.value("result", *reply.result);
     } else {
-        object.addNull("result");
+        object.null("result");
     }
-    return object.line();
+}
+
+template <typename Frame> std::string lineOf(const Frame& frame) {
+    TextBuffer line;
+    appendObject(line, frame);
+    line.append('\n');
+    return std::string(line.view());
 }
 
 bool beginsLikeAReply(Bytes item) {

@@ -42,7 +42,7 @@ Dictionary unshared(const Model& model) {
         keys.push_back(key);
         values.push_back(value);
     }
-    return Dictionary::adopt(KeySet::make(keys), values, places);
+    return Dictionary::fromKeySet(KeySet::make(keys), values, places);
 }
 
 void expectHolds(const Dictionary& dictionary, const Model& model) {

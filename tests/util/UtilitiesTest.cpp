@@ -1,5 +1,5 @@
+#include "base/BoundedCache.h"
 #include "tests/fakes/FakePlatform.h"
-#include "util/BoundedCache.h"
 #include "util/ConditionWait.h"
 #include "util/DataSerialize.h"
 #include "util/LogCategories.h"

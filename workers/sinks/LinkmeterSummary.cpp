@@ -44,7 +44,7 @@ public:
             keys.push_back(key);
             values.emplace_back(joined.text.view());
         }
-        return Dictionary::adopt(KeySet::make(keys), values, places);
+        return Dictionary::fromKeySet(KeySet::make(keys), values, places);
     }
 
 private:

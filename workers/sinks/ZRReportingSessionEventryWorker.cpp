@@ -1,9 +1,9 @@
 #include "workers/sinks/ZRReportingSessionEventryWorker.h"
 
+#include "base/BoundedCache.h"
 #include "base/Format.h"
 #include "session/ZRReportingSession.h"
 #include "util/AudioEvents.h"
-#include "util/BoundedCache.h"
 
 #include <cstdint>
 #include <utility>

@@ -60,11 +60,11 @@ std::string requestText(const CaptureRequest& request, WallTime now) {
 
 } // namespace
 
-void addRequest(SinkObject& line, const CaptureRequest& request) {
+void addRequest(JsonObject& line, const CaptureRequest& request) {
     line.text("op", request.operation)
         .text("session", request.identifier)
         .object("signature",
-                [&signature = request.signature](SinkObject& fields) {
+                [&signature = request.signature](JsonObject& fields) {
                     fields.text("domain", signature.domain)
                         .text("type", signature.type)
                         .text("subType", signature.subType)
@@ -72,7 +72,7 @@ void addRequest(SinkObject& line, const CaptureRequest& request) {
                         .text("detectedProcess", signature.detectedProcess);
                 })
         .number("duration", request.duration.count())
-        .dictionary("payload", request.payload);
+        .value("payload", request.payload);
 }
 
 std::vector<CaptureFile> CaptureContent::gather(const CaptureRequest& request, WallTime now) const {

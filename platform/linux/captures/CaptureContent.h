@@ -59,6 +59,6 @@ private:
 };
 
 /// Adds what was asked for.
-void addRequest(SinkObject& line, const CaptureRequest& request);
+void addRequest(JsonObject& line, const CaptureRequest& request);
 
 } // namespace tamblo

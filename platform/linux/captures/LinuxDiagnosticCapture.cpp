@@ -92,7 +92,7 @@ void sampleAll(const ProcessFiles& files, Clock& clock, std::vector<ProcessStack
 
 void appendSample(TextBuffer& line, const RepeatedSample& repeated) {
     const ProcessFiles::ThreadSample& sample = repeated.sample;
-    SinkObject object(line);
+    JsonObject object(line);
     object.number("count", repeated.count).text("state", sample.state);
     if (sample.waitChannel) {
         object.text("waitChannel", *sample.waitChannel);
@@ -103,14 +103,14 @@ void appendSample(TextBuffer& line, const RepeatedSample& repeated) {
 }
 
 void appendThread(TextBuffer& line, const ThreadStacks& thread) {
-    SinkObject(line)
+    JsonObject(line)
         .number("thread", thread.thread)
         .text("name", thread.name)
         .array("samples", thread.samples, appendSample);
 }
 
 void appendProcess(TextBuffer& line, const ProcessStacks& process) {
-    SinkObject(line)
+    JsonObject(line)
         .number("process", process.process)
         .text("name", process.name)
         .array("threads", process.threads, appendThread);
@@ -146,7 +146,7 @@ void LinuxDiagnosticCapture::capture(const StackCaptureRequest& request, const s
             .text("requester", request.requester)
             .text("captureType", request.captureType)
             .text("reason", request.reason)
-            .dictionary("payload", request.payload)
+            .value("payload", request.payload)
             .array("options", request.options,
                    [](TextBuffer& element, std::int32_t option) { appendJson(element, Value(option)); })
             .array("stacks", stacks, appendProcess);

@@ -17,7 +17,7 @@ struct ProcessMemory {
 
 void appendProcess(TextBuffer& line, const ProcessMemory& process) {
     const ProcessFiles::Memory& memory = process.memory;
-    SinkObject(line)
+    JsonObject(line)
         .number("process", process.process)
         .text("name", process.name)
         .number("resident", memory.resident)
@@ -31,7 +31,7 @@ void appendProcess(TextBuffer& line, const ProcessMemory& process) {
         .number("threads", memory.threads);
 }
 
-void fillKernel(SinkObject& object, const ProcessFiles::KernelMemory& memory) {
+void fillKernel(JsonObject& object, const ProcessFiles::KernelMemory& memory) {
     object.number("unevictable", memory.unevictable)
         .number("locked", memory.locked)
         .number("slab", memory.slab)
@@ -70,7 +70,7 @@ void LinuxMemoryLog::record(std::int64_t reporterID, const std::vector<pid_t>& p
         SinkLine(line, time)
             .number("reporter", reporterID)
             .array("processes", found, appendProcess)
-            .object("kernel", [&](SinkObject& object) {
+            .object("kernel", [&](JsonObject& object) {
                 if (kernel) {
                     fillKernel(object, *kernel);
                 }

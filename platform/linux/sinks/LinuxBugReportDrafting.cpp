@@ -10,11 +10,11 @@ void LinuxBugReportDrafting::createDraft(const BugReportDraft& draft, const std:
         SinkLine(line, clock_.now())
             .text("process", processName)
             .text("reason", displayReason)
-            .object("draft", [&draft](SinkObject& fields) {
+            .object("draft", [&draft](JsonObject& fields) {
                 fields.text("title", draft.title)
                     .text("problemDescription", draft.problemDescription)
                     .object("component",
-                            [&component = draft.component](SinkObject& parts) {
+                            [&component = draft.component](JsonObject& parts) {
                                 parts.text("name", component.name)
                                     .text("version", component.version)
                                     .number("identifier", component.identifier);

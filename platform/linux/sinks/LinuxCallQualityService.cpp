@@ -70,8 +70,8 @@ CallQualityService::SessionRef LinuxCallQualityService::CreateLinkmeterSession(c
         SinkLine(line, clock_.now())
             .text("op", "open")
             .text("session", session->name())
-            .dictionary("sessionInfo", sessionInfo)
-            .dictionary("userInfo", userInfo);
+            .value("sessionInfo", sessionInfo)
+            .value("userInfo", userInfo);
     });
     return session;
 }
@@ -123,7 +123,7 @@ std::optional<std::string> LinuxCallQualityService::SendLinkmeterMessage(const S
                 .text("session", SpoolSession::nameOf(session))
                 .number("category", category)
                 .number("type", type)
-                .dictionary("payload", payload);
+                .value("payload", payload);
         });
     }
     return std::nullopt;

@@ -10,7 +10,7 @@ void LinuxPowerEventLog::postRegisteredPowerEvent(std::uint32_t subsystem, std::
         SinkLine(line, clock_.now())
             .number("subsystem", subsystem)
             .text("event", eventName)
-            .dictionary("payload", payload);
+            .value("payload", payload);
     });
 }
 
