@@ -1,18 +1,20 @@
 #pragma once
 
 #include <charconv>
+#include <concepts>
 #include <optional>
 #include <string_view>
 
 namespace tamblo {
 
-/// The number that the whole text is, in digits of this base; nothing when it is anything else or does not
-/// fit.
+/// The number that the whole text is, an integer perhaps in digits of a base other than ten; nothing when it
+/// is anything else or does not fit.
 template <typename Number>
-[[nodiscard]] std::optional<Number> parseNumber(std::string_view text, int base = 10) noexcept {
+[[nodiscard]] std::optional<Number> parseNumber(std::string_view text,
+                                                std::same_as<int> auto... base) noexcept {
     Number number{};
     const char* const behind = text.data() + text.size();
-    const auto [end, error] = std::from_chars(text.data(), behind, number, base);
+    const auto [end, error] = std::from_chars(text.data(), behind, number, base...);
     return error == std::errc() && end == behind ? std::optional(number) : std::nullopt;
 }
 

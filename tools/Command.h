@@ -1,11 +1,40 @@
 #pragma once
 
-#include "tools/Arguments.h"
-
+#include <optional>
 #include <span>
+#include <string>
 #include <string_view>
+#include <utility>
+#include <variant>
+#include <vector>
 
 namespace tamblo::tools {
+
+/// An option that a command takes.
+struct Option {
+    std::string_view name;  ///< with its dashes
+    std::string_view value; ///< what stands for its value in the help; empty: it takes none
+    std::string_view help;
+};
+
+/// A command line, taken apart: options as `--name value` or `--name=value`, the rest in order. Everything
+/// behind `--` belongs to the rest.
+class Arguments {
+public:
+    /// Or a line that says what is wrong.
+    [[nodiscard]] static std::variant<Arguments, std::string> parse(std::span<const Option> options,
+                                                                    std::span<const std::string_view> words);
+
+    [[nodiscard]] bool has(std::string_view option) const { return last(option).has_value(); }
+    /// The value given last.
+    [[nodiscard]] std::optional<std::string_view> last(std::string_view option) const;
+    [[nodiscard]] std::vector<std::string_view> all(std::string_view option) const;
+    [[nodiscard]] const std::vector<std::string_view>& rest() const noexcept { return rest_; }
+
+private:
+    std::vector<std::pair<std::string_view, std::string_view>> options_;
+    std::vector<std::string_view> rest_;
+};
 
 /// What every command exits with.
 enum class ExitStatus : int {

@@ -4,7 +4,6 @@
 #include "base/NumberText.h"
 
 #include <algorithm>
-#include <charconv>
 
 namespace tamblo::tools {
 
@@ -12,15 +11,12 @@ namespace {
 
 std::optional<std::chrono::milliseconds> timeoutFrom(const Arguments& arguments) {
     constexpr double longest = 86400;
-    double seconds = 10;
-    if (const auto text = arguments.last("--timeout")) {
-        const char* const behind = text->data() + text->size();
-        const auto [end, error] = std::from_chars(text->data(), behind, seconds);
-        if (error != std::errc() || end != behind || !(seconds >= 0)) {
-            return std::nullopt;
-        }
+    const auto text = arguments.last("--timeout");
+    const auto seconds = text ? parseNumber<double>(*text) : 10;
+    if (!seconds || !(*seconds >= 0)) {
+        return std::nullopt;
     }
-    return std::chrono::milliseconds(static_cast<std::int64_t>(std::min(seconds, longest) * 1000));
+    return std::chrono::milliseconds(static_cast<std::int64_t>(std::min(*seconds, longest) * 1000));
 }
 
 } // namespace
@@ -48,12 +44,9 @@ std::optional<ExitStatus> ServiceConnection::connect() {
 }
 
 ExitStatus ServiceConnection::complainAbout(const client::Error& error) {
-    if (error.domain == client::kErrorDomain &&
-        error.code == static_cast<std::int64_t>(client::ErrorCode::connectionLost)) {
-        return complain(ExitStatus::unreachable, error.message);
-    }
     if (error.domain == client::kErrorDomain) {
-        return complain(ExitStatus::failed, error.message);
+        const bool isLost = isError(error, client::ErrorCode::connectionLost);
+        return complain(isLost ? ExitStatus::unreachable : ExitStatus::failed, error.message);
     }
     return complain(ExitStatus::failed, formatted("the service refused: {} {}{}{}", error.domain, error.code,
                                                   error.message.empty() ? "" : ": ", error.message));

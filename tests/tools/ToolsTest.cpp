@@ -1,12 +1,10 @@
 #include "base/Json.h"
 #include "tests/client/FakeService.h"
 #include "tests/platform/LinuxServiceSupport.h"
-#include "tools/Arguments.h"
 #include "tools/Files.h"
 #include "tools/Payload.h"
 #include "tools/RecordFilter.h"
 #include "tools/ServiceConnection.h"
-#include "tools/SessionFile.h"
 #include "tools/SessionPlayer.h"
 #include "tools/SinkFile.h"
 

@@ -1,6 +1,6 @@
 #include "system/ZRReportingSystemMonitor.h"
 #include "tests/workers/WorkerTest.h"
-#include "tools/SessionFile.h"
+#include "tools/SessionPlayer.h"
 #include "util/SummaryBuckets.h"
 #include "workers/producers/ZRReportingSessionInputMessagesWorker.h"
 #include "workers/producers/ZRReportingSessionKaleenMessagesWorker.h"

@@ -1,0 +1,184 @@
+#include "base/Format.h"
+#include "base/Json.h"
+#include "tools/Command.h"
+#include "tools/Payload.h"
+#include "tools/ServiceConnection.h"
+
+#include <vector>
+
+// The commands that are one request, or a few, and print what the service answers.
+namespace tamblo::tools {
+
+namespace {
+
+constexpr Option kSendOptions[] = {
+    {"--category", "CATEGORY", "by name (Volume, Session_Playback) or number; needed"},
+    {"--type", "TYPE", "by name (Start, Summary) or number (Generic)"},
+    {"--reporter", "ID", "the session's reporter; may be given several times"},
+    kJsonOption,
+    kSocketOption,
+    kTimeoutOption,
+};
+
+ExitStatus send(const Arguments& arguments) {
+    const auto category = client::parseCategory(arguments.last("--category").value_or(""));
+    if (!category) {
+        return complain(ExitStatus::usage, "--category needs the name of a category, such as Volume or "
+                                           "Session_Playback, or its number");
+    }
+    const auto type = client::parseType(arguments.last("--type").value_or("Generic"));
+    if (!type) {
+        return complain(ExitStatus::usage, "--type needs the name of a type, such as Start, or its number");
+    }
+    std::vector<std::int64_t> reporters;
+    for (const std::string_view text : arguments.all("--reporter")) {
+        const auto reporter = parseReporterID(text);
+        if (!reporter) {
+            return ExitStatus::usage;
+        }
+        reporters.push_back(*reporter);
+    }
+    const auto payload = parsePayload(arguments.rest());
+    if (const auto* wrong = std::get_if<std::string>(&payload)) {
+        return complain(ExitStatus::usage, *wrong);
+    }
+    ServiceConnection service(arguments);
+    if (const auto failure = service.connect()) {
+        return *failure;
+    }
+    auto future = service.client().sendMessage(std::get<Dictionary>(payload), *category, *type, reporters);
+    client::Nothing nothing;
+    if (const auto failure = service.await(future, nothing)) {
+        return *failure;
+    }
+    printLine(arguments.has("--json") ? "{\"sent\":true}" : "sent");
+    return ExitStatus::done;
+}
+
+constexpr Option kReportersOptions[] = {kJsonOption, kSocketOption, kTimeoutOption};
+
+ExitStatus reporters(const Arguments& arguments) {
+    if (!arguments.rest().empty()) {
+        return complain(ExitStatus::usage, "reporters takes no arguments");
+    }
+    ServiceConnection service(arguments);
+    if (const auto failure = service.connect()) {
+        return *failure;
+    }
+    auto future = service.client().getAllReporters();
+    std::vector<std::int64_t> reporters;
+    if (const auto failure = service.await(future, reporters)) {
+        return *failure;
+    }
+    Array lines;
+    for (const std::int64_t reporter : reporters) {
+        auto typeFuture = service.client().getServiceNameForReporterID(reporter);
+        client::ServiceType type{};
+        if (const auto failure = service.await(typeFuture, type)) {
+            return *failure;
+        }
+        const std::string_view name = client::serviceTypeName(type);
+        if (arguments.has("--json")) {
+            lines.emplace_back(Dictionary{{"reporterID", reporter},
+                                          {"serviceType", static_cast<unsigned>(type)},
+                                          {"serviceName", name}});
+        } else {
+            printLine(formatted("{} {}", reporter, name));
+        }
+    }
+    if (arguments.has("--json")) {
+        printLine(jsonText(Value(std::move(lines))));
+    }
+    return ExitStatus::done;
+}
+
+constexpr Option kValidateOptions[] = {kJsonOption, kSocketOption, kTimeoutOption};
+
+ExitStatus validate(const Arguments& arguments) {
+    if (arguments.rest().size() != 1) {
+        return complain(ExitStatus::usage, "validate needs one reporter ID");
+    }
+    const auto reporter = parseReporterID(arguments.rest()[0]);
+    if (!reporter) {
+        return ExitStatus::usage;
+    }
+    ServiceConnection service(arguments);
+    if (const auto failure = service.connect()) {
+        return *failure;
+    }
+    auto future = service.client().reporterID(*reporter);
+    Dictionary answer;
+    if (const auto failure = service.await(future, answer)) {
+        return *failure;
+    }
+    const Value* found = answer.find("reporterID");
+    const Value* type = answer.find("serviceType");
+    const bool isValid = found != nullptr && *reporter != 0 && *found == Value(*reporter);
+    if (arguments.has("--json")) {
+        answer.set("valid", isValid);
+        printLine(jsonText(answer));
+    } else if (isValid && type != nullptr) {
+        printLine(
+            formatted("{} {}", *reporter,
+                      client::serviceTypeName(static_cast<client::ServiceType>(type->unsignedValue()))));
+    } else {
+        printLine(formatted("{} is not a reporter", *reporter));
+    }
+    return isValid ? ExitStatus::done : ExitStatus::failed;
+}
+
+constexpr Option kKillOptions[] = {kSocketOption, kTimeoutOption};
+
+ExitStatus kill(const Arguments& arguments) {
+    if (!arguments.rest().empty()) {
+        return complain(ExitStatus::usage, "kill takes no arguments");
+    }
+    ServiceConnection service(arguments);
+    if (const auto failure = service.connect()) {
+        return *failure;
+    }
+    auto future = service.client().killService();
+    if (!service.client().wait(future, service.timeout())) {
+        return complain(ExitStatus::failed, "the service still runs");
+    }
+    const auto error = future.get().error;
+    if (error && isError(*error, client::ErrorCode::connectionLost)) {
+        return ExitStatus::done;
+    }
+    return error ? ServiceConnection::complainAbout(*error)
+                 : complain(ExitStatus::failed, "the service answered instead of ending");
+}
+
+} // namespace
+
+constexpr Command kCommandSend{
+    "send",
+    "send one message",
+    "--category CATEGORY [--type TYPE] [--reporter ID]... [KEY=VALUE... | JSON]",
+    "A value that is a JSON scalar is taken as one; any other is a text. A message reaches a reporter "
+    "whichever\n"
+    "client made it. Without a reporter it goes to every started session of every client or, when none is\n"
+    "started, to the service's single-message session.",
+    kSendOptions,
+    send,
+};
+
+constexpr Command kCommandReporters{
+    "reporters",       "list the reporters of all clients, with their service types",
+    "[--json]",        "",
+    kReportersOptions, reporters,
+};
+
+constexpr Command kCommandValidate{
+    "validate",       "ask whether a reporter exists, and for its service type",
+    "ID [--json]",    "Exits with 1 when the service does not know the reporter.",
+    kValidateOptions, validate,
+};
+
+constexpr Command kCommandKill{
+    "kill",       "end the service at once, without stopping its sessions",
+    "",           "Ends when the connection does. The service exits with status 2.",
+    kKillOptions, kill,
+};
+
+} // namespace tamblo::tools
