@@ -1,15 +1,14 @@
 #include "FrameChannel.h"
 
 #include "Payloads.h"
+#include "os/LocalAddress.h"
 #include "wire/FrameSplitter.h"
 
 #include <cerrno>
-#include <cstring>
 #include <stdexcept>
 #include <system_error>
 
 #include <sys/socket.h>
-#include <sys/un.h>
 
 namespace tamblo::bench {
 
@@ -21,14 +20,11 @@ constexpr std::size_t kBytesPerRead = 64 * 1024;
 
 FrameChannel::FrameChannel(const std::string& socketPath)
     : socket_(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0)) {
-    sockaddr_un address{};
-    address.sun_family = AF_UNIX;
-    if (socketPath.size() >= sizeof address.sun_path) {
+    const auto address = LocalAddress::of(socketPath);
+    if (!address) {
         throw std::runtime_error("the socket's path is too long; set TMPDIR");
     }
-    std::memcpy(address.sun_path, socketPath.c_str(), socketPath.size() + 1);
-    if (!socket_.isOpen() ||
-        ::connect(socket_.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0) {
+    if (!socket_.isOpen() || ::connect(socket_.get(), address->get(), address->size()) != 0) {
         throw std::system_error(errno, std::generic_category(), socketPath);
     }
 }

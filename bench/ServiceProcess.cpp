@@ -2,6 +2,7 @@
 
 #include "Processes.h"
 #include "os/FileDescriptor.h"
+#include "os/LocalAddress.h"
 #include "wire/Protocol.h"
 
 #include <array>
@@ -9,7 +10,6 @@
 #include <csignal>
 #include <cstdio>
 #include <cstdlib>
-#include <cstring>
 #include <fstream>
 #include <sstream>
 #include <stdexcept>
@@ -21,7 +21,6 @@
 #include <poll.h>
 #include <sys/prctl.h>
 #include <sys/socket.h>
-#include <sys/un.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -39,14 +38,11 @@ constexpr std::chrono::seconds kStopLimit{60};
 /// Where the service announces that it is ready.
 FileDescriptor bindNotifySocket(const std::string& path) {
     FileDescriptor socket(::socket(AF_UNIX, SOCK_DGRAM | SOCK_CLOEXEC, 0));
-    sockaddr_un address{};
-    address.sun_family = AF_UNIX;
-    if (path.size() >= sizeof address.sun_path) {
+    const auto address = LocalAddress::of(path);
+    if (!address) {
         throw std::runtime_error("the path of the temporary directory is too long for a socket; set TMPDIR");
     }
-    std::memcpy(address.sun_path, path.c_str(), path.size() + 1);
-    if (!socket.isOpen() ||
-        ::bind(socket.get(), reinterpret_cast<sockaddr*>(&address), sizeof address) != 0) {
+    if (!socket.isOpen() || ::bind(socket.get(), address->get(), address->size()) != 0) {
         fail(path);
     }
     return socket;

@@ -1,5 +1,6 @@
 #include "client/Engine.h"
 
+#include "os/LocalAddress.h"
 #include "wire/FrameSplitter.h"
 #include "wire/Reply.h"
 #include "wire/Request.h"
@@ -7,7 +8,6 @@
 #include <algorithm>
 #include <bit>
 #include <cerrno>
-#include <cstring>
 #include <ctime>
 #include <span>
 #include <utility>
@@ -18,7 +18,6 @@
 #include <sys/socket.h>
 #include <sys/time.h>
 #include <sys/uio.h>
-#include <sys/un.h>
 #include <unistd.h>
 
 namespace tamblo::client {
@@ -86,15 +85,9 @@ OutgoingFrame* Engine::frameAt(std::size_t index) noexcept {
 // Connecting
 
 bool Engine::open() {
-    sockaddr_un address{};
-    address.sun_family = AF_UNIX;
-    const std::string& path = options_.socketPath;
-    if (path.empty() || path.size() >= sizeof address.sun_path) {
-        return false;
-    }
-    std::memcpy(address.sun_path, path.data(), path.size());
+    const auto address = LocalAddress::of(options_.socketPath);
     FileDescriptor socket(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0));
-    if (::connect(socket.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0) {
+    if (!address || ::connect(socket.get(), address->get(), address->size()) != 0) {
         return false;
     }
     if (!options_.wakeable) {

@@ -1,33 +1,25 @@
 #include "os/ServiceManager.h"
 
 #include "os/FileDescriptor.h"
+#include "os/LocalAddress.h"
 
-#include <cstddef>
 #include <cstdlib>
-#include <cstring>
-
-#include <sys/socket.h>
-#include <sys/un.h>
+#include <string>
 
 namespace tamblo {
 
 void notifyServiceManager(std::string_view state) noexcept {
-    const char* const path = std::getenv("NOTIFY_SOCKET");
-    sockaddr_un address{};
-    if (path == nullptr || *path == '\0' || std::strlen(path) >= sizeof address.sun_path) {
-        return;
-    }
-    const std::size_t length = std::strlen(path);
-    address.sun_family = AF_UNIX;
-    std::memcpy(address.sun_path, path, length);
+    const char* const variable = std::getenv("NOTIFY_SOCKET");
+    std::string path(variable != nullptr ? variable : "");
     // A leading @ stands for the abstract namespace.
-    if (address.sun_path[0] == '@') {
-        address.sun_path[0] = '\0';
+    if (path.starts_with('@')) {
+        path.front() = '\0';
     }
-    const FileDescriptor socket(::socket(AF_UNIX, SOCK_DGRAM | SOCK_CLOEXEC, 0));
-    (void)::sendto(socket.get(), state.data(), state.size(), MSG_DONTWAIT | MSG_NOSIGNAL,
-                   reinterpret_cast<const sockaddr*>(&address),
-                   static_cast<socklen_t>(offsetof(sockaddr_un, sun_path) + length));
+    if (const auto address = LocalAddress::of(path)) {
+        const FileDescriptor socket(::socket(AF_UNIX, SOCK_DGRAM | SOCK_CLOEXEC, 0));
+        (void)::sendto(socket.get(), state.data(), state.size(), MSG_DONTWAIT | MSG_NOSIGNAL, address->get(),
+                       address->size());
+    }
 }
 
 } // namespace tamblo

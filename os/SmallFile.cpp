@@ -4,8 +4,8 @@
 #include "os/FileDescriptor.h"
 
 #include <algorithm>
-#include <array>
 #include <cerrno>
+#include <system_error>
 
 #include <fcntl.h>
 #include <sys/stat.h>
@@ -17,32 +17,49 @@ SmallFile SmallFile::read(const std::string& path, std::size_t limit, Links link
     const FileDescriptor file(::open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY | linkFlag));
     struct stat status {};
     if (!file.isOpen() || ::fstat(file.get(), &status) != 0) {
-        return {errno};
+        return {.error = errno};
     }
-    if (!S_ISREG(status.st_mode)) {
-        return {S_ISDIR(status.st_mode) ? EISDIR : EINVAL};
-    }
+    // The kernel's own files have no size.
+    const auto size = static_cast<std::size_t>(status.st_size);
     SmallFile content;
-    std::array<char, 4096> bytes;
-    for (;;) {
-        // One byte beyond the limit tells that there is more. The size in `status` says nothing about the
-        // kernel's own files.
-        const std::size_t wanted = std::min(bytes.size(), limit + 1 - content.text.size());
-        const ssize_t count = ::read(file.get(), bytes.data(), wanted);
-        if (count < 0 && errno == EINTR) {
-            continue;
-        }
-        if (count < 0) {
-            return {errno};
+    if (!S_ISREG(status.st_mode)) {
+        content.error = S_ISDIR(status.st_mode) ? EISDIR : EINVAL;
+    } else if (size > limit) {
+        content.error = EFBIG;
+    } else {
+        content = read(file.get(), limit, size);
+    }
+    content.state = FileState::of(status);
+    return content;
+}
+
+SmallFile SmallFile::read(int descriptor, std::size_t limit, std::size_t expected) {
+    constexpr std::size_t kLeastRoom = 4096;
+    std::string text;
+    for (std::size_t filled = 0;;) {
+        // One byte beyond what is expected tells the end, one beyond the limit that there is more.
+        text.resize(std::min(limit + 1, std::max({expected + 1, 2 * filled, kLeastRoom})));
+        const ssize_t count = ::read(descriptor, text.data() + filled, text.size() - filled);
+        if (count < 0 && errno != EINTR) {
+            return {.error = errno};
         }
         if (count == 0) {
-            return content;
+            text.resize(filled);
+            return {.text = std::move(text)};
         }
-        content.text.append(bytes.data(), static_cast<std::size_t>(count));
-        if (content.text.size() > limit) {
-            return {EFBIG};
+        filled += static_cast<std::size_t>(std::max<ssize_t>(count, 0));
+        if (filled > limit) {
+            return {.error = EFBIG};
         }
     }
+}
+
+bool SmallFile::isMissing() const noexcept {
+    return error == ENOENT || error == ENOTDIR;
+}
+
+std::string SmallFile::reason() const {
+    return error == EINVAL ? "not a regular file" : std::generic_category().message(error);
 }
 
 std::string_view SmallFile::trimmed() const noexcept {

@@ -1,15 +1,21 @@
 #include "base/Format.h"
+#include "os/FileDescriptor.h"
+#include "os/SmallFile.h"
 #include "tools/Command.h"
 #include "tools/Decode.h"
-#include "tools/Files.h"
 
 #include <cerrno>
 #include <cstdio>
-#include <cstring>
+#include <utility>
+
+#include <fcntl.h>
 
 namespace tamblo::tools {
 
 namespace {
+
+/// Bytes: far above what a service writes in a year.
+constexpr std::size_t kLargestInput = 1U << 30U;
 
 constexpr Option kOptions[] = {
     {"--kind", "KIND", "record, line or frame; guessed without it"},
@@ -34,10 +40,13 @@ ExitStatus run(const Arguments& arguments) {
         input = arguments.rest()[0];
     } else {
         const std::string path(file.value_or("/dev/stdin"));
-        input = readFile(path);
-        if (!input) {
-            return complain(ExitStatus::usage, formatted("cannot read {}: {}", path, std::strerror(errno)));
+        // Of any kind: a pipe or a terminal, too.
+        const FileDescriptor opened(::open(path.c_str(), O_RDONLY | O_CLOEXEC));
+        SmallFile content = opened.isOpen() ? SmallFile::read(opened.get(), kLargestInput) : SmallFile{errno};
+        if (content.error != 0) {
+            return complain(ExitStatus::usage, formatted("cannot read {}: {}", path, content.reason()));
         }
+        input = std::move(content.text);
     }
     const EncodedKind used = kind ? *kind : guessEncodedKind(*input);
     const Decoded decoded = decode(*input, used);

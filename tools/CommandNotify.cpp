@@ -1,22 +1,23 @@
 #include "base/Format.h"
 #include "base/NumberText.h"
-#include "client/Directories.h"
+#include "os/Directory.h"
+#include "os/ReplaceFile.h"
+#include "os/SmallFile.h"
 #include "tools/Command.h"
-#include "tools/Files.h"
+#include "wire/Directories.h"
 
 #include <string>
-
-#include <unistd.h>
+#include <system_error>
 
 namespace tamblo::tools {
 
 namespace {
 
+constexpr std::size_t kLongestState = 4096;
+
 /// What the notification's file holds, 0 without one.
 std::uint64_t currentState(const std::string& path) {
-    std::string text = readFile(path).value_or("");
-    text.resize(text.find_last_not_of(" \t\r\n") + 1);
-    return parseDecimalOrHex<std::uint64_t>(text).value_or(0);
+    return parseDecimalOrHex<std::uint64_t>(SmallFile::read(path, kLongestState).trimmed()).value_or(0);
 }
 
 ExitStatus run(const Arguments& arguments) {
@@ -28,7 +29,7 @@ ExitStatus run(const Arguments& arguments) {
     if (name.empty() || name.find('/') != std::string::npos || name.starts_with('.')) {
         return complain(ExitStatus::usage, formatted("\"{}\" is no notification name", name));
     }
-    const client::Directories directories = client::Directories::ofThisProcess();
+    const auto directories = wire::Directories::ofThisProcess();
     if (directories.runtime.empty()) {
         return complain(ExitStatus::usage,
                         "the runtime directory is not known: set RUNTIME_DIRECTORY or XDG_RUNTIME_DIR");
@@ -39,15 +40,13 @@ ExitStatus run(const Arguments& arguments) {
         return complain(ExitStatus::usage,
                         formatted("\"{}\" is no state: it is an unsigned 64-bit number", words[1]));
     }
-    if (const auto failed = createDirectories(directories.notifications())) {
-        return complain(ExitStatus::failed, *failed);
+    int failure = makeDirectories(directories.notifications());
+    if (failure == 0) {
+        failure = replaceFileAtomically(path, formatted("{}\n", *state));
     }
-    // Outside the directory of notifications, where it would count as one.
-    const std::string temporary = formatted("{}/.notification.{}", directories.runtime, ::getpid());
-    if (const auto failed = replaceFile(path, temporary, formatted("{}\n", *state))) {
-        return complain(ExitStatus::failed, *failed);
-    }
-    return ExitStatus::done;
+    return failure == 0 ? ExitStatus::done
+                        : complain(ExitStatus::failed, formatted("cannot write {}: {}", path,
+                                                                 std::generic_category().message(failure)));
 }
 
 } // namespace

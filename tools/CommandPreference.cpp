@@ -1,92 +1,59 @@
 #include "base/Format.h"
 #include "base/Json.h"
-#include "client/Directories.h"
+#include "os/Directory.h"
+#include "os/PreferenceFile.h"
 #include "tools/Command.h"
-#include "tools/Files.h"
-#include "tools/Payload.h"
+#include "wire/Directories.h"
 
-#include <cerrno>
-#include <cstring>
 #include <string>
-
-#include <unistd.h>
+#include <system_error>
 
 namespace tamblo::tools {
 
 namespace {
 
-/// One domain's file.
-struct Domain {
-    std::string directory;
-    std::string path;
-    Dictionary content;
-};
+using Words = std::span<const std::string_view>;
 
-/// Reads the domain's file; a missing one is empty, any other fault is a line that says what is wrong.
-std::variant<Domain, std::string> load(const std::string& name) {
-    if (name.empty() || name.find('/') != std::string::npos || name.starts_with('.')) {
-        return formatted("\"{}\" is no preferences domain", name);
-    }
-    const client::Directories directories = client::Directories::ofThisProcess();
-    if (directories.configuration.empty()) {
-        return std::string("the configuration directory is not known: set CONFIGURATION_DIRECTORY");
-    }
-    Domain domain{.directory = directories.preferences(), .path = {}, .content = {}};
-    domain.path = domain.directory + "/" + name + ".json";
-    const auto text = readFile(domain.path);
-    if (!text) {
-        return errno == ENOENT ? std::variant<Domain, std::string>(std::move(domain))
-                               : formatted("cannot read {}: {}", domain.path, std::strerror(errno));
-    }
-    auto content = parseJsonObject(*text);
-    if (const auto* wrong = std::get_if<std::string>(&content)) {
-        return formatted("{} is {}; correct it by hand first", domain.path, *wrong);
-    }
-    domain.content = std::get<Dictionary>(std::move(content));
-    return domain;
+ExitStatus complainOfKey(const PreferenceFile& file, std::string_view key) {
+    return complain(ExitStatus::failed, formatted("{} has no key \"{}\"", file.path(), key));
 }
 
-ExitStatus store(const Domain& domain) {
-    if (const auto failed = createDirectories(domain.directory)) {
-        return complain(ExitStatus::failed, *failed);
+ExitStatus get(const PreferenceFile& file, Words rest) {
+    const auto content = file.read();
+    if (const auto* fault = std::get_if<std::string>(&content)) {
+        return complain(ExitStatus::failed, *fault);
     }
-    // In a file that is not named like a domain's.
-    const std::string temporary = formatted("{}.{}", domain.path, ::getpid());
-    if (const auto failed = replaceFile(domain.path, temporary, jsonText(domain.content) + "\n")) {
-        return complain(ExitStatus::failed, *failed);
+    const auto& values = std::get<Dictionary>(content);
+    const Value* const value = rest.empty() ? nullptr : values.find(rest[0]);
+    if (!rest.empty() && value == nullptr) {
+        return complainOfKey(file, rest[0]);
     }
+    printLine(rest.empty() ? jsonText(values) : jsonText(*value));
     return ExitStatus::done;
 }
 
-ExitStatus get(const Domain& domain, std::span<const std::string_view> rest) {
-    if (rest.empty()) {
-        printLine(jsonText(domain.content));
-        return ExitStatus::done;
-    }
-    const Value* value = domain.content.find(rest[0]);
-    if (value == nullptr) {
-        return complain(ExitStatus::failed, formatted("{} has no key \"{}\"", domain.path, rest[0]));
-    }
-    printLine(jsonText(*value));
-    return ExitStatus::done;
+ExitStatus edit(const PreferenceFile& file, const std::function<bool(Dictionary&)>& change) {
+    const auto fault = file.edit(change);
+    return fault ? complain(ExitStatus::failed, *fault) : ExitStatus::done;
 }
 
-ExitStatus set(Domain& domain, std::span<const std::string_view> rest) {
-    auto value = readJson(rest[1]);
-    const Value* const json = std::get_if<Value>(&value);
-    domain.content.set(rest[0], json != nullptr ? *json : Value(rest[1]));
-    return store(domain);
+ExitStatus set(const PreferenceFile& file, std::string_view key, std::string_view text) {
+    const auto json = readJson(text);
+    const Value* const value = std::get_if<Value>(&json);
+    return edit(file, [&](Dictionary& values) {
+        values.set(key, value != nullptr ? *value : Value(text));
+        return true;
+    });
 }
 
-ExitStatus unset(Domain& domain, std::span<const std::string_view> rest) {
-    if (!domain.content.remove(rest[0])) {
-        return complain(ExitStatus::failed, formatted("{} has no key \"{}\"", domain.path, rest[0]));
-    }
-    return store(domain);
+ExitStatus unset(const PreferenceFile& file, std::string_view key) {
+    bool wasThere = false;
+    const ExitStatus status = edit(file, [&](Dictionary& values) { return wasThere = values.remove(key); });
+    return status == ExitStatus::done && !wasThere ? complainOfKey(file, key) : status;
 }
 
 ExitStatus run(const Arguments& arguments) {
-    const std::span<const std::string_view> words = arguments.rest();
+    const Words words = arguments.rest();
     const std::string_view act = words.empty() ? "" : words[0];
     const bool isGet = act == "get" && (words.size() == 2 || words.size() == 3);
     const bool isSet = act == "set" && words.size() == 4;
@@ -95,16 +62,23 @@ ExitStatus run(const Arguments& arguments) {
         return complain(ExitStatus::usage, "preference needs: get DOMAIN [KEY], set DOMAIN KEY VALUE, or "
                                            "unset DOMAIN KEY");
     }
-    auto loaded = load(std::string(words[1]));
-    if (const auto* wrong = std::get_if<std::string>(&loaded)) {
-        return complain(ExitStatus::failed, *wrong);
+    const auto directories = wire::Directories::ofThisProcess();
+    if (directories.configuration.empty()) {
+        return complain(ExitStatus::failed,
+                        "the configuration directory is not known: set CONFIGURATION_DIRECTORY");
     }
-    Domain& domain = std::get<Domain>(loaded);
-    const auto rest = words.subspan(2);
+    const auto file = PreferenceFile::of(directories.preferences(), words[1]);
+    if (!file) {
+        return complain(ExitStatus::failed, formatted("\"{}\" is no preferences domain", words[1]));
+    }
     if (isGet) {
-        return get(domain, rest);
+        return get(*file, words.subspan(2));
     }
-    return isSet ? set(domain, rest) : unset(domain, rest);
+    if (const int failure = makeDirectories(directories.preferences())) {
+        return complain(ExitStatus::failed, formatted("cannot create {}: {}", directories.preferences(),
+                                                      std::generic_category().message(failure)));
+    }
+    return isSet ? set(*file, words[2], words[3]) : unset(*file, words[2]);
 }
 
 } // namespace

@@ -1,12 +1,12 @@
 #include "base/Format.h"
 #include "base/Json.h"
 #include "base/NumberText.h"
-#include "client/Directories.h"
 #include "tools/Command.h"
 #include "tools/Payload.h"
 #include "tools/ServiceConnection.h"
 #include "tools/SessionPlayer.h"
 #include "tools/SessionSummaries.h"
+#include "wire/Directories.h"
 
 #include <cmath>
 #include <fstream>
@@ -162,7 +162,7 @@ ExitStatus playAndStop(ServiceConnection& service, const Arguments& arguments, c
     if (lines != nullptr) {
         wrong = player.play(*lines, plan.file);
     }
-    SummaryReader reader(client::Directories::ofThisProcess().logs);
+    SummaryReader reader(wire::Directories::ofThisProcess().logs);
     auto stopped = service.client().stopReportingSessionForID(plan.player.reporterID);
     bool answer = false;
     const auto failure = service.await(stopped, answer);

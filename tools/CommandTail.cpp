@@ -2,12 +2,13 @@
 #include "base/Json.h"
 #include "base/NumberText.h"
 #include "base/Rfc3339.h"
-#include "client/Directories.h"
+#include "os/FileDescriptor.h"
 #include "tools/Command.h"
 #include "tools/Payload.h"
 #include "tools/RecordFilter.h"
 #include "tools/ServiceConnection.h"
 #include "tools/SinkFile.h"
+#include "wire/Directories.h"
 
 #include <algorithm>
 #include <cstdio>
@@ -47,7 +48,7 @@ std::variant<Plan, std::string> makePlan(const Arguments& arguments) {
     }
     Plan plan;
     const std::string_view typed = arguments.rest().empty() ? "analytics-events" : arguments.rest()[0];
-    const client::Directories directories = client::Directories::ofThisProcess();
+    const auto directories = wire::Directories::ofThisProcess();
     if (directories.logs.empty()) {
         return std::string("the logs directory is not known: set LOGS_DIRECTORY");
     }
@@ -137,8 +138,8 @@ std::deque<std::string> lastLines(const Plan& plan, SinkFollower& follower) {
 
 ExitStatus follow(const Plan& plan) {
     const std::string directory = plan.path.substr(0, plan.path.find_last_of('/'));
-    const int watch = ::inotify_init1(IN_CLOEXEC | IN_NONBLOCK);
-    if (watch < 0 || ::inotify_add_watch(watch, directory.c_str(), IN_MODIFY | IN_CREATE | IN_MOVED_TO) < 0) {
+    const FileDescriptor watch(::inotify_init1(IN_CLOEXEC | IN_NONBLOCK));
+    if (::inotify_add_watch(watch.get(), directory.c_str(), IN_MODIFY | IN_CREATE | IN_MOVED_TO) < 0) {
         return complain(ExitStatus::failed, formatted("cannot watch {}", directory));
     }
     SinkFollower follower(plan.path);
@@ -147,17 +148,16 @@ ExitStatus follow(const Plan& plan) {
         printRecord(plan, line);
     }
     while (std::fflush(stdout) == 0 && std::ferror(stdout) == 0) {
-        pollfd watched[2] = {{.fd = watch, .events = POLLIN, .revents = 0},
+        pollfd watched[2] = {{.fd = watch.get(), .events = POLLIN, .revents = 0},
                              {.fd = STDOUT_FILENO, .events = 0, .revents = 0}};
         if (::poll(watched, 2, -1) > 0 && watched[1].revents != 0) {
             break; // nobody reads what is printed any more
         }
         char events[16 * 1024];
-        while (::read(watch, events, sizeof events) > 0) {
+        while (::read(watch.get(), events, sizeof events) > 0) {
         }
         follower.readNew(print);
     }
-    ::close(watch);
     return ExitStatus::done;
 }
 

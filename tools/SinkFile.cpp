@@ -73,22 +73,11 @@ std::vector<std::string> filesOfSink(const std::string& path) {
     return files;
 }
 
-void SinkFollower::close() noexcept {
-    if (descriptor_ >= 0) {
-        ::close(std::exchange(descriptor_, -1));
-    }
-}
-
-SinkFollower::~SinkFollower() {
-    close();
-}
-
 void SinkFollower::openFile(const std::string& path) {
-    close();
     struct stat status {};
-    descriptor_ = ::open(path.c_str(), O_RDONLY | O_CLOEXEC);
-    if (descriptor_ < 0 || ::fstat(descriptor_, &status) != 0) {
-        close();
+    file_ = FileDescriptor(::open(path.c_str(), O_RDONLY | O_CLOEXEC));
+    if (::fstat(file_.get(), &status) != 0) {
+        file_.reset();
         return;
     }
     device_ = status.st_dev;
@@ -99,16 +88,16 @@ void SinkFollower::openFile(const std::string& path) {
 void SinkFollower::skipToEnd() {
     struct stat status {};
     openFile(path_);
-    if (descriptor_ >= 0 && ::fstat(descriptor_, &status) == 0) {
+    if (file_.isOpen() && ::fstat(file_.get(), &status) == 0) {
         offset_ = status.st_size;
     }
 }
 
 void SinkFollower::readNew(LineFunction& line) {
-    if (descriptor_ < 0) {
+    if (!file_.isOpen()) {
         openFile(path_);
     }
-    while (descriptor_ >= 0) {
+    while (file_.isOpen()) {
         // Asked before reading: once renamed, the file is not written to any more, and what is read is all of
         // it.
         const bool isRenamed = !isFile(path_);
@@ -137,18 +126,15 @@ void SinkFollower::openNext() {
 
 void SinkFollower::readToEnd(LineFunction& line) {
     struct stat status {};
-    if (::fstat(descriptor_, &status) == 0 && status.st_size < offset_) {
+    if (::fstat(file_.get(), &status) == 0 && status.st_size < offset_) {
         offset_ = status.st_size;
     }
-    offset_ += static_cast<off_t>(readLines(descriptor_, offset_, line));
+    offset_ += static_cast<off_t>(readLines(file_.get(), offset_, line));
 }
 
 void readLines(const std::string& path, LineFunction& line) {
-    const int descriptor = ::open(path.c_str(), O_RDONLY | O_CLOEXEC);
-    if (descriptor >= 0) {
-        (void)readLines(descriptor, 0, line);
-        ::close(descriptor);
-    }
+    const FileDescriptor file(::open(path.c_str(), O_RDONLY | O_CLOEXEC));
+    (void)readLines(file.get(), 0, line);
 }
 
 std::string nameOfRecord(const Dictionary& record) {

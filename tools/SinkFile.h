@@ -2,6 +2,7 @@
 
 #include "base/Dictionary.h"
 #include "base/UniqueFunction.h"
+#include "os/FileDescriptor.h"
 
 #include <string>
 #include <string_view>
@@ -25,9 +26,6 @@ using LineFunction = UniqueFunction<void(std::string_view line)>;
 class SinkFollower {
 public:
     explicit SinkFollower(std::string path) : path_(std::move(path)) {}
-    ~SinkFollower();
-    SinkFollower(const SinkFollower&) = delete;
-    SinkFollower& operator=(const SinkFollower&) = delete;
 
     /// Passes over what stands in the file now, without reading it. The next line handed over may be the rest
     /// of one that was just being written.
@@ -41,10 +39,9 @@ private:
     void openFile(const std::string& path);
     void openNext();
     [[nodiscard]] bool isFile(const std::string& path) const;
-    void close() noexcept;
 
     const std::string path_;
-    int descriptor_ = -1;
+    FileDescriptor file_;
     off_t offset_ = 0; ///< behind the last whole line
     dev_t device_ = 0;
     ino_t inode_ = 0;

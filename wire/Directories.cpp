@@ -1,17 +1,34 @@
 #include "wire/Directories.h"
 
 #include "base/Format.h"
+#include "os/Directory.h"
+#include "wire/Protocol.h"
 
 #include <algorithm>
-#include <cstdlib>
+#include <string_view>
+#include <system_error>
 #include <utility>
-
-#include <pwd.h>
-#include <unistd.h>
 
 namespace tamblo::wire {
 
 namespace {
+
+/// Where one root comes from.
+struct Root {
+    std::string Directories::*directory;
+    std::string_view what;
+    std::string_view variable;
+    std::string_view forRoot;
+    std::string_view userVariable;
+    std::string_view belowHome; ///< empty when there is no place for it there
+};
+
+constexpr Root kRoots[] = {
+    {&Directories::runtime, "runtime", "RUNTIME_DIRECTORY", "/run/tamblo", "XDG_RUNTIME_DIR", ""},
+    {&Directories::configuration, "configuration", "CONFIGURATION_DIRECTORY", "/etc/tamblo",
+     "XDG_CONFIG_HOME", ".config"},
+    {&Directories::logs, "logs", "LOGS_DIRECTORY", "/var/log/tamblo", "XDG_STATE_HOME", ".local/state"},
+};
 
 std::string withoutTrailingSlashes(std::string path) {
     while (path.size() > 1 && path.back() == '/') {
@@ -20,24 +37,8 @@ std::string withoutTrailingSlashes(std::string path) {
     return path;
 }
 
-} // namespace
-
-Environment Environment::ofThisProcess() {
-    Environment environment;
-    environment.variable = [](std::string_view name) {
-        const char* value = std::getenv(std::string(name).c_str());
-        return std::string(value != nullptr ? value : "");
-    };
-    environment.isRoot = ::geteuid() == 0;
-    environment.home = environment.variable("HOME");
-    if (environment.home.empty()) {
-        const passwd* user = ::getpwuid(::geteuid());
-        environment.home = user != nullptr && user->pw_dir != nullptr ? user->pw_dir : "";
-    }
-    return environment;
-}
-
-std::optional<std::string> placeOf(const Root& root, const Environment& environment) {
+/// Empty when there is nothing to go by.
+std::string placeOf(const Root& root, const Environment& environment) {
     // The variable may name several directories; the first is the unit's own.
     std::string value = environment.variable(root.variable);
     value.resize(std::min(value.find(':'), value.size()));
@@ -52,10 +53,47 @@ std::optional<std::string> placeOf(const Root& root, const Environment& environm
     if (base.starts_with('/')) {
         return withoutTrailingSlashes(base) + "/tamblo";
     }
-    if (!root.belowHome.empty() && !environment.home.empty()) {
-        return formatted("{}/{}/tamblo", withoutTrailingSlashes(environment.home), root.belowHome);
+    return root.belowHome.empty() || environment.home.empty()
+               ? std::string()
+               : formatted("{}/{}/tamblo", withoutTrailingSlashes(environment.home), root.belowHome);
+}
+
+} // namespace
+
+std::string Directories::socketFile() const {
+    return runtime.empty() ? std::string() : socketPath(runtime);
+}
+
+Directories Directories::find(const Environment& environment) {
+    Directories directories;
+    for (const Root& root : kRoots) {
+        directories.*root.directory = placeOf(root, environment);
     }
-    return std::nullopt;
+    return directories;
+}
+
+std::variant<Directories, std::string> Directories::prepare(const Environment& environment) {
+    Directories directories = find(environment);
+    for (const Root& root : kRoots) {
+        const std::string& path = directories.*root.directory;
+        if (path.empty()) {
+            return formatted(
+                "there is no place for the {} directory: set {} to a directory, or {} to its parent",
+                root.what, root.variable, root.userVariable);
+        }
+        if (const int failure = makeDirectories(path)) {
+            return formatted(
+                "cannot create the {} directory {}: {}; create it, or set {} to a directory that can be "
+                "used",
+                root.what, path, std::generic_category().message(failure), root.variable);
+        }
+    }
+    for (const std::string& path :
+         {directories.notifications(), directories.driverChannels(), directories.preferences()}) {
+        // Without it what it would hold is absent, as it is without a file in it.
+        static_cast<void>(makeDirectories(path));
+    }
+    return directories;
 }
 
 } // namespace tamblo::wire

@@ -1,43 +1,37 @@
 #pragma once
 
-#include <functional>
-#include <optional>
-#include <string>
-#include <string_view>
+#include "os/Environment.h"
 
-/// Where the service and its clients meet, worked out alike by both ends: each root comes from the variable
-/// that systemd sets for a unit, or, without it, from where such files are kept for the system or for one
-/// user. Nothing here touches the directories.
+#include <string>
+#include <variant>
+
 namespace tamblo::wire {
 
-/// What the places are worked out from.
-struct Environment {
-    /// The value of a variable, empty when it is unset.
-    std::function<std::string(std::string_view name)> variable;
-    bool isRoot = false;
-    /// The user's home directory, empty when there is none.
-    std::string home;
+/// Where the service, its clients and its tools meet: three roots, and what lies at fixed places below them.
+///
+/// The roots come from the variables that systemd sets for a unit, or, without them, from where such files
+/// are kept for the system or for one user. Found once, at the start; plain values from then on.
+struct Directories {
+    std::string runtime;
+    std::string configuration;
+    std::string logs;
 
-    static Environment ofThisProcess();
+    /// The service's socket; empty without a runtime directory.
+    [[nodiscard]] std::string socketFile() const;
+    [[nodiscard]] std::string notifications() const { return runtime + "/notifications"; }
+    [[nodiscard]] std::string driverChannels() const { return runtime + "/chanlog"; }
+    [[nodiscard]] std::string preferences() const { return configuration + "/preferences"; }
+    [[nodiscard]] std::string deviceProperties() const { return configuration + "/device-properties.json"; }
+
+    /// Without touching the file system. A root for which there is nothing to go by is empty.
+    [[nodiscard]] static Directories find(const Environment& environment);
+    [[nodiscard]] static Directories ofThisProcess() { return find(Environment::ofThisProcess()); }
+    /// For the service: finds the roots and creates them where they are missing, mode 0700, parents included;
+    /// the directories below them that others put files into are created too where that is possible. A root
+    /// that cannot be had is a failure, told in a line that says what to do; one that exists but cannot be
+    /// written is not.
+    [[nodiscard]] static std::variant<Directories, std::string>
+    prepare(const Environment& environment = Environment::ofThisProcess());
 };
-
-/// Where one root comes from.
-struct Root {
-    std::string_view what;
-    std::string_view variable;
-    std::string_view forRoot;
-    std::string_view userVariable;
-    /// Below the home directory; empty when there is no place for it there.
-    std::string_view belowHome;
-};
-
-inline constexpr Root kRuntimeRoot{"runtime", "RUNTIME_DIRECTORY", "/run/tamblo", "XDG_RUNTIME_DIR", ""};
-inline constexpr Root kConfigurationRoot{"configuration", "CONFIGURATION_DIRECTORY", "/etc/tamblo",
-                                         "XDG_CONFIG_HOME", ".config"};
-inline constexpr Root kLogsRoot{"logs", "LOGS_DIRECTORY", "/var/log/tamblo", "XDG_STATE_HOME",
-                                ".local/state"};
-
-/// Nothing when there is nothing to go by.
-[[nodiscard]] std::optional<std::string> placeOf(const Root& root, const Environment& environment);
 
 } // namespace tamblo::wire

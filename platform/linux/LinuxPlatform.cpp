@@ -103,7 +103,7 @@ private:
 };
 
 struct LinuxPlatform::Services {
-    explicit Services(const Directories& places) : directories(places) {}
+    explicit Services(const wire::Directories& places) : directories(places) {}
     ~Services() {
         bugCapture.endSessions();
         // What was posted is worked off while everything is there, and what the loop drives goes before it.
@@ -114,7 +114,7 @@ struct LinuxPlatform::Services {
     Services(const Services&) = delete;
     Services& operator=(const Services&) = delete;
 
-    const Directories directories;
+    const wire::Directories directories;
     Platform platform;
     // First, as it makes sure that standard error is open before anything else can take its number.
     LinuxStructuredLog& log = provide<LinuxStructuredLog>(platform.log);
@@ -166,11 +166,11 @@ struct LinuxPlatform::Services {
 
 std::variant<std::unique_ptr<LinuxPlatform>, std::string> LinuxPlatform::open() {
     raiseDescriptorLimit();
-    auto directories = Directories::prepare();
+    auto directories = wire::Directories::prepare();
     if (auto* problem = std::get_if<std::string>(&directories)) {
         return std::move(*problem);
     }
-    const auto& places = std::get<Directories>(directories);
+    const auto& places = std::get<wire::Directories>(directories);
     std::unique_ptr<LinuxPlatform> platform(new LinuxPlatform(places));
     if (!platform->services_->loop.isOpen()) {
         return "the kernel gives out no more file descriptors: raise the limit on open files";
@@ -181,7 +181,7 @@ std::variant<std::unique_ptr<LinuxPlatform>, std::string> LinuxPlatform::open() 
     return platform;
 }
 
-LinuxPlatform::LinuxPlatform(const Directories& directories)
+LinuxPlatform::LinuxPlatform(const wire::Directories& directories)
     : services_(std::make_unique<Services>(directories)) {}
 
 LinuxPlatform::~LinuxPlatform() = default;

@@ -1,7 +1,7 @@
 #pragma once
 
 #include "platform/Platform.h"
-#include "platform/linux/Directories.h"
+#include "wire/Directories.h"
 
 #include <functional>
 #include <memory>
@@ -35,7 +35,7 @@ private:
     class Changes;
     struct Services;
 
-    explicit LinuxPlatform(const Directories& directories);
+    explicit LinuxPlatform(const wire::Directories& directories);
 
     void flushSinks();
 

@@ -1,13 +1,10 @@
 #include "os/FileDescriptor.h"
-#include "platform/linux/Directories.h"
 #include "platform/linux/settings/LinuxDeviceProperties.h"
 #include "platform/linux/settings/LinuxPreferences.h"
 #include "tests/platform/LinuxServiceSupport.h"
 
 #include <gmock/gmock.h>
 
-#include <array>
-#include <map>
 #include <utility>
 
 #include <fcntl.h>
@@ -20,70 +17,6 @@ using testing::AllOf;
 using testing::ElementsAre;
 using testing::HasSubstr;
 using testing::IsEmpty;
-
-TEST(DirectoriesTest, ComeFromTheUnitOrFromTheirUsualPlaces) {
-    using Variables = std::map<std::string, std::string, std::less<>>;
-    const struct {
-        Variables variables;
-        bool isRoot;
-        std::string home, runtime, configuration, logs;
-    } cases[] = {
-        {{}, true, "/root", "/run/tamblo", "/etc/tamblo", "/var/log/tamblo"},
-        {{{"RUNTIME_DIRECTORY", "/a:/b"}, {"CONFIGURATION_DIRECTORY", "/c/"}, {"LOGS_DIRECTORY", "/l"}},
-         true,
-         "",
-         "/a",
-         "/c",
-         "/l"},
-        {{{"XDG_RUNTIME_DIR", "/run/user/7"}, {"LOGS_DIRECTORY", ""}},
-         false,
-         "/home/u",
-         "/run/user/7/tamblo",
-         "/home/u/.config/tamblo",
-         "/home/u/.local/state/tamblo"},
-        {{{"XDG_RUNTIME_DIR", "/r/"}, {"XDG_CONFIG_HOME", "relative"}, {"XDG_STATE_HOME", "/s"}},
-         false,
-         "/h",
-         "/r/tamblo",
-         "/h/.config/tamblo",
-         "/s/tamblo"},
-    };
-    for (const auto& [variables, isRoot, home, runtime, configuration, logs] : cases) {
-        const auto variable = [&variables](std::string_view name) {
-            const auto found = variables.find(name);
-            return found == variables.end() ? std::string() : found->second;
-        };
-        const auto found = Directories::find({variable, isRoot, home});
-        ASSERT_TRUE(std::holds_alternative<Directories>(found)) << std::get<std::string>(found);
-        const auto& directories = std::get<Directories>(found);
-        EXPECT_THAT((std::array{directories.runtime, directories.configuration, directories.logs}),
-                    ElementsAre(runtime, configuration, logs));
-    }
-    const auto nowhere = Directories::find({[](std::string_view) { return std::string(); }, false, "/h"});
-    EXPECT_THAT(std::get<std::string>(nowhere),
-                AllOf(HasSubstr("RUNTIME_DIRECTORY"), HasSubstr("XDG_RUNTIME_DIR")));
-}
-
-TEST(DirectoriesTest, AreCreatedForTheirOwnerAloneOrSayWhyNot) {
-    const TemporaryDirectory home;
-    const auto variable = [&home](std::string_view name) {
-        return name == "LOGS_DIRECTORY" ? home.path("logs/deep") : home.path("x") + "/" + std::string(name);
-    };
-    const auto made = Directories::prepare({variable, false, ""});
-    ASSERT_TRUE(std::holds_alternative<Directories>(made)) << std::get<std::string>(made);
-    const auto& directories = std::get<Directories>(made);
-    for (const std::string& path : {directories.logs, home.path("logs"), directories.notifications(),
-                                    directories.driverChannels(), directories.preferences()}) {
-        EXPECT_EQ(std::filesystem::status(path).permissions(), std::filesystem::perms::owner_all) << path;
-    }
-    EXPECT_TRUE(std::holds_alternative<Directories>(Directories::prepare({variable, false, ""})))
-        << "all exist";
-    std::filesystem::remove_all(home.path("logs"));
-    home.write("logs", "a file");
-    EXPECT_THAT(
-        std::get<std::string>(Directories::prepare({variable, false, ""})),
-        AllOf(HasSubstr(home.path("logs/deep")), HasSubstr("Not a directory"), HasSubstr("LOGS_DIRECTORY")));
-}
 
 class LinuxPreferencesTest : public testing::Test {
 protected:

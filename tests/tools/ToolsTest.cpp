@@ -1,7 +1,6 @@
 #include "base/Json.h"
 #include "tests/client/FakeService.h"
 #include "tests/platform/LinuxServiceSupport.h"
-#include "tools/Files.h"
 #include "tools/Payload.h"
 #include "tools/RecordFilter.h"
 #include "tools/ServiceConnection.h"
@@ -233,21 +232,6 @@ TEST(SinkFollower, ReadsWholeLinesThroughRotationsAndTornEnds) {
     append(path, "7\n");
     EXPECT_EQ(read(), "7 ");
     EXPECT_EQ(sinkPath(directory.path(""), path), path);
-}
-
-TEST(Files, ReplacesOrLeavesAlone) {
-    const TemporaryDirectory directory;
-    const std::string path = directory.path("a/b/file");
-    EXPECT_TRUE(replaceFile(path, path + ".new", "x"));
-    EXPECT_FALSE(createDirectories(directory.path("a/b")));
-    EXPECT_FALSE(replaceFile(path, path + ".new", "one"));
-    EXPECT_FALSE(replaceFile(path, path + ".new", "two"));
-    EXPECT_EQ(readFile(path), "two");
-    EXPECT_FALSE(fs::exists(path + ".new"));
-    fs::create_directory(directory.path("a/b/directory"));
-    EXPECT_TRUE(replaceFile(directory.path("a/b/directory"), path + ".new", "x"));
-    EXPECT_FALSE(fs::exists(path + ".new"));
-    EXPECT_FALSE(readFile(directory.path("none")));
 }
 
 } // namespace

@@ -1,5 +1,7 @@
 #include "platform/linux/connections/LinuxConnectionService.h"
 
+#include "os/Directory.h"
+#include "os/LocalAddress.h"
 #include "platform/linux/loop/LinuxSerialQueue.h"
 #include "wire/Protocol.h"
 
@@ -13,9 +15,7 @@
 
 #include <fcntl.h>
 #include <sys/epoll.h>
-#include <sys/file.h>
 #include <sys/socket.h>
-#include <sys/un.h>
 #include <unistd.h>
 
 namespace tamblo {
@@ -53,10 +53,9 @@ bool activatedSocketHas(int option, int wanted) {
 }
 
 /// Whether somebody answers on the socket at this address.
-bool isAnswered(const sockaddr_un& address) {
+bool isAnswered(const LocalAddress& address) {
     const FileDescriptor probe(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0));
-    const auto* generic = reinterpret_cast<const sockaddr*>(&address);
-    return ::connect(probe.get(), generic, sizeof address) == 0 || errno == EAGAIN;
+    return ::connect(probe.get(), address.get(), address.size()) == 0 || errno == EAGAIN;
 }
 
 } // namespace
@@ -89,22 +88,16 @@ std::optional<std::string> LinuxConnectionService::adoptActivatedSocket() {
 }
 
 std::optional<std::string> LinuxConnectionService::bindSocket(const std::string& path) {
-    sockaddr_un address{};
-    address.sun_family = AF_UNIX;
-    if (path.size() >= sizeof address.sun_path) {
+    const auto address = LocalAddress::of(path);
+    if (!address) {
         return "the socket's path is too long for the system (" + path +
                "): set RUNTIME_DIRECTORY to a shorter one";
     }
-    std::memcpy(address.sun_path, path.data(), path.size());
-    const auto* generic = reinterpret_cast<const sockaddr*>(&address);
-
     // Two services that start at the same time must not both take a left-over socket for theirs to replace.
-    const FileDescriptor directory(
-        ::open(path.substr(0, path.rfind('/')).c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
-    ::flock(directory.get(), LOCK_EX);
+    const FileDescriptor lock = lockDirectory(path.substr(0, path.rfind('/')));
 
     FileDescriptor socket(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0));
-    if (::bind(socket.get(), generic, sizeof address) != 0) {
+    if (::bind(socket.get(), address->get(), address->size()) != 0) {
         if (errno != EADDRINUSE) {
             return because("cannot make the socket " + path, errno);
         }
@@ -112,10 +105,10 @@ std::optional<std::string> LinuxConnectionService::bindSocket(const std::string&
         if (::lstat(path.c_str(), &there) == 0 && !S_ISSOCK(there.st_mode)) {
             return path + " is in the way and no socket: remove it, or set RUNTIME_DIRECTORY";
         }
-        if (isAnswered(address)) {
+        if (isAnswered(*address)) {
             return "another tamblod already answers at " + path + ": stop it first, or set RUNTIME_DIRECTORY";
         }
-        if (::unlink(path.c_str()) != 0 || ::bind(socket.get(), generic, sizeof address) != 0) {
+        if (::unlink(path.c_str()) != 0 || ::bind(socket.get(), address->get(), address->size()) != 0) {
             return because("cannot replace the left-over socket " + path, errno);
         }
     }

@@ -1,6 +1,6 @@
 #include "platform/linux/sinks/LinuxReportFiles.h"
 
-#include "os/FileDescriptor.h"
+#include "os/Directory.h"
 
 #include <cerrno>
 #include <system_error>
@@ -19,37 +19,6 @@ constexpr mode_t kFileMode = S_IRUSR | S_IWUSR | S_IRGRP | S_IROTH;
 
 std::string textOf(int error) {
     return std::generic_category().message(error);
-}
-
-/// Makes one directory, with its mode whatever the process's mask is. Returns 0 or an `errno`; 0 where there
-/// is one.
-int makeDirectory(const std::string& path) {
-    if (::mkdir(path.c_str(), kDirectoryMode) != 0) {
-        // On a read-only file system the error need not say that the directory is there.
-        const int failure = errno;
-        struct stat status {};
-        if (::stat(path.c_str(), &status) != 0) {
-            return failure;
-        }
-        return S_ISDIR(status.st_mode) ? 0 : ENOTDIR;
-    }
-    const FileDescriptor made(::open(path.c_str(), O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC));
-    return made.isOpen() && ::fchmod(made.get(), kDirectoryMode) == 0 ? 0 : errno;
-}
-
-/// Makes a directory and those on the way to it, up to `root`, which has to be there.
-int makeDirectories(const std::string& path, const std::string& root) {
-    const int failure = makeDirectory(path);
-    const std::size_t slash = path.find_last_of('/');
-    if (failure != ENOENT || slash == std::string::npos || slash == 0) {
-        return failure;
-    }
-    const std::string parent = path.substr(0, slash);
-    if (parent == root) {
-        return failure;
-    }
-    const int parentFailure = makeDirectories(parent, root);
-    return parentFailure != 0 ? parentFailure : makeDirectory(path);
 }
 
 class LinuxReportFile final : public ReportFile {
@@ -84,7 +53,7 @@ private:
 } // namespace
 
 std::optional<std::string> LinuxReportFiles::createDirectory(const std::string& path) {
-    const int failure = makeDirectories(path, logsDirectory_);
+    const int failure = makeDirectories(path, kDirectoryMode, logsDirectory_);
     return failure != 0 ? std::optional(textOf(failure)) : std::nullopt;
 }
 

@@ -1,0 +1,50 @@
+#include "os/Directory.h"
+
+#include <cerrno>
+
+#include <fcntl.h>
+#include <sys/file.h>
+
+namespace tamblo {
+
+int makeDirectory(const std::string& path, mode_t mode) {
+    if (::mkdir(path.c_str(), mode) != 0) {
+        // On a read-only file system the error need not say that the directory is there.
+        const int failure = errno;
+        struct stat status {};
+        if (::stat(path.c_str(), &status) != 0) {
+            return failure;
+        }
+        return S_ISDIR(status.st_mode) ? 0 : ENOTDIR;
+    }
+    const FileDescriptor made(::open(path.c_str(), O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC));
+    return made.isOpen() && ::fchmod(made.get(), mode) == 0 ? 0 : errno;
+}
+
+int makeDirectories(const std::string& path, mode_t mode, std::string_view root) {
+    const int failure = makeDirectory(path, mode);
+    const std::size_t slash = path.find_last_of('/');
+    if (failure != ENOENT || slash == std::string::npos || slash == 0) {
+        return failure;
+    }
+    const std::string parent = path.substr(0, slash);
+    if (parent == root) {
+        return failure;
+    }
+    const int parentFailure = makeDirectories(parent, mode, root);
+    return parentFailure != 0 ? parentFailure : makeDirectory(path, mode);
+}
+
+FileDescriptor lockDirectory(const std::string& path) {
+    FileDescriptor directory(::open(path.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+    while (directory.isOpen() && ::flock(directory.get(), LOCK_EX) != 0) {
+        if (errno != EINTR) {
+            const int failure = errno;
+            directory.reset();
+            errno = failure;
+        }
+    }
+    return directory;
+}
+
+} // namespace tamblo

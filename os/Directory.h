@@ -1,0 +1,22 @@
+#pragma once
+
+#include "os/FileDescriptor.h"
+
+#include <string>
+#include <string_view>
+
+#include <sys/stat.h>
+
+namespace tamblo {
+
+/// Makes a directory, with its mode whatever the process's mask is; one that is there stays as it is. Returns
+/// 0 or an `errno`.
+[[nodiscard]] int makeDirectory(const std::string& path, mode_t mode = S_IRWXU);
+/// Makes a directory and those on the way to it, up to `root`, which has to be there.
+[[nodiscard]] int makeDirectories(const std::string& path, mode_t mode = S_IRWXU, std::string_view root = {});
+
+/// Takes a directory's advisory lock (`flock`), waiting for whoever has it: it lasts as long as the
+/// descriptor. Not open, with the reason in `errno`, when it cannot be had.
+[[nodiscard]] FileDescriptor lockDirectory(const std::string& path);
+
+} // namespace tamblo
