@@ -35,6 +35,12 @@ void appendText(std::string& out, FixedPoint number) {
     out.append(digits, result.ptr);
 }
 
+void appendText(std::string& out, Hexadecimal number) {
+    for (unsigned digit = number.digits; digit-- > 0;) {
+        out += "0123456789abcdef"[number.value >> 4U * digit & 0xFU];
+    }
+}
+
 namespace format_detail {
 
 void appendUpToPlaceholder(std::string& out, std::string_view& format) {

@@ -22,10 +22,20 @@ struct FixedPoint {
     return {value, digits};
 }
 
+/// The last so many hexadecimal digits of a number, up to 16.
+struct Hexadecimal {
+    std::uint64_t value;
+    unsigned digits;
+};
+[[nodiscard]] inline Hexadecimal hexadecimal(std::uint64_t value, unsigned digits) {
+    return {value, digits};
+}
+
 void appendText(std::string& out, std::string_view text);
 void appendText(std::string& out, std::int64_t number);
 void appendText(std::string& out, std::uint64_t number);
 void appendText(std::string& out, FixedPoint number);
+void appendText(std::string& out, Hexadecimal number);
 
 namespace format_detail {
 

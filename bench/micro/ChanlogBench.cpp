@@ -59,6 +59,7 @@ std::string driverChannels(int driver, int round) {
 class NoEvents final : public AnalyticsEventService {
 public:
     [[nodiscard]] bool isEventInUse(std::string_view) override { return false; }
+    [[nodiscard]] std::uint64_t inUseGeneration() const noexcept override { return 1; }
     void sendEventLazy(std::string_view, const std::function<Dictionary()>&) override {}
 };
 

@@ -50,7 +50,8 @@ void eventsIntoFile(benchmark::State& state) {
     const LinuxClock clock;
     LinuxStructuredLog log;
     const LinuxPreferences preferences(directory.path(), log);
-    LinuxAnalyticsEventService events(directory.path(), clock, preferences, log);
+    SinkFiles sinks(directory.path(), log);
+    LinuxAnalyticsEventService events(sinks, clock, preferences, log);
     std::size_t i = 0;
     for (auto _ : state) {
         const Message& message = messages[i++ % kMessages];
@@ -60,7 +61,7 @@ void eventsIntoFile(benchmark::State& state) {
                                  [&] { return message.payload; });
         }
         if (i % 64 == 0) {
-            events.flush();
+            sinks.flush();
         }
     }
 }

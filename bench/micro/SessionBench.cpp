@@ -18,6 +18,7 @@ constexpr std::size_t kMessages = 1000;
 class NoEvents final : public AnalyticsEventService {
 public:
     [[nodiscard]] bool isEventInUse(std::string_view) override { return false; }
+    [[nodiscard]] std::uint64_t inUseGeneration() const noexcept override { return 1; }
     void sendEventLazy(std::string_view, const std::function<Dictionary()>&) override {}
 };
 

@@ -19,11 +19,9 @@
 #include "platform/linux/settings/LinuxDeviceProperties.h"
 #include "platform/linux/settings/LinuxNamedNotifications.h"
 #include "platform/linux/settings/LinuxPreferences.h"
+#include "platform/linux/sinks/LineSinks.h"
 #include "platform/linux/sinks/LinuxAnalyticsEventService.h"
-#include "platform/linux/sinks/LinuxBugReportDrafting.h"
 #include "platform/linux/sinks/LinuxCallQualityService.h"
-#include "platform/linux/sinks/LinuxDiagnosticsMetrics.h"
-#include "platform/linux/sinks/LinuxPowerEventLog.h"
 #include "platform/linux/sinks/LinuxReportFiles.h"
 
 #include <csignal>
@@ -115,6 +113,7 @@ struct LinuxPlatform::Services {
     Services& operator=(const Services&) = delete;
 
     const wire::Directories directories;
+    std::optional<SinkFiles> sinkFiles; ///< outlives the services that write them
     Platform platform;
     // First, as it makes sure that standard error is open before anything else can take its number.
     LinuxStructuredLog& log = provide<LinuxStructuredLog>(platform.log);
@@ -132,28 +131,27 @@ struct LinuxPlatform::Services {
         provide<LinuxDeviceProperties>(platform.deviceProperties, directories.deviceProperties(), log);
     LinuxPreferences& preferences =
         provide<LinuxPreferences>(platform.preferences, directories.preferences(), log);
-    LinuxAnalyticsEventService& analyticsEvents = provide<LinuxAnalyticsEventService>(
-        platform.analyticsEvents, directories.logs, clock, preferences, log);
-    LinuxPowerEventLog& powerEvents =
-        provide<LinuxPowerEventLog>(platform.powerEvents, directories.logs, clock, log);
+    SinkFiles& sinks = sinkFiles.emplace(directories.logs, log);
+    LinuxAnalyticsEventService& analyticsEvents =
+        provide<LinuxAnalyticsEventService>(platform.analyticsEvents, sinks, clock, preferences, log);
+    LinuxPowerEventLog& powerEvents = provide<LinuxPowerEventLog>(platform.powerEvents, sinks, clock);
     LinuxDiagnosticsMetrics& diagnosticsMetrics =
-        provide<LinuxDiagnosticsMetrics>(platform.diagnosticsMetrics, directories.logs, clock, log);
-    LinuxCallQualityService& callQuality = provide<LinuxCallQualityService>(
-        platform.callQuality, directories.logs, clock, preferences, workQueues, log);
+        provide<LinuxDiagnosticsMetrics>(platform.diagnosticsMetrics, sinks, clock);
+    LinuxCallQualityService& callQuality =
+        provide<LinuxCallQualityService>(platform.callQuality, sinks, clock, preferences, workQueues, log);
     LinuxReportFiles& reportFiles = provide<LinuxReportFiles>(platform.reportFiles, directories.logs);
-    LinuxBugCaptureService& bugCapture =
-        provide<LinuxBugCaptureService>(platform.bugCapture, directories.logs, clock, workQueues, log);
+    LinuxBugCaptureService& bugCapture = provide<LinuxBugCaptureService>(
+        platform.bugCapture, sinks, directories.logs + "/captures", clock, workQueues, log);
     LinuxBugReportDrafting& bugReportDrafting =
-        provide<LinuxBugReportDrafting>(platform.bugReportDrafting, directories.logs, clock, log);
-    LinuxMemoryLog& memoryLog =
-        provide<LinuxMemoryLog>(platform.memoryLog, directories.logs, clock, workQueues, log);
+        provide<LinuxBugReportDrafting>(platform.bugReportDrafting, sinks, clock);
+    LinuxMemoryLog& memoryLog = provide<LinuxMemoryLog>(platform.memoryLog, sinks, clock, workQueues, log);
     LinuxChanlogFacility& chanlog =
         provide<LinuxChanlogFacility>(platform.chanlog, directories.driverChannels(), log);
     LinuxProcessSampling& processSampling = provide<LinuxProcessSampling>(platform.processSampling);
     LinuxAccessories& accessories = provide<LinuxAccessories>(platform.accessories, log);
     LinuxConnectionService& connections = provide<LinuxConnectionService>(platform.connections, loop, log);
     LinuxDiagnosticCapture& diagnosticCapture = provide<LinuxDiagnosticCapture>(
-        platform.diagnosticCapture, directories.logs, clock, workQueues,
+        platform.diagnosticCapture, sinks, clock, workQueues,
         [this] { return connections.clientProcesses(); }, log);
 
     Changes notificationChanges{[this] {
@@ -190,22 +188,14 @@ const Platform& LinuxPlatform::services() const noexcept {
     return services_->platform;
 }
 
-void LinuxPlatform::flushSinks() {
-    services_->analyticsEvents.flush();
-    services_->powerEvents.flush();
-    services_->diagnosticsMetrics.flush();
-    services_->bugCapture.flush();
-    services_->bugReportDrafting.flush();
-}
-
 void LinuxPlatform::run(SerialQueue& requestQueue,
                         const std::function<void(std::function<void()> completion)>& shutDown) {
     Services& all = *services_;
-    requestQueue.setBatchEnd([this, &all] {
-        flushSinks();
+    requestQueue.setBatchEnd([&all] {
+        all.sinks.flush();
         all.connections.releaseReplies();
     });
-    all.workQueues.setTickEnd([this] { flushSinks(); });
+    all.workQueues.setTickEnd([&all] { all.sinks.flush(); });
     all.connections.setRequestQueue(requestQueue);
     all.loop.setBrackets([&all] { all.drain.emplace(); },
                          [&all] {
@@ -221,7 +211,7 @@ void LinuxPlatform::run(SerialQueue& requestQueue,
     });
     notifyServiceManager("READY=1");
     all.loop.run();
-    flushSinks();
+    all.sinks.flush();
 }
 
 } // namespace tamblo

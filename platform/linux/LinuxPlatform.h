@@ -37,8 +37,6 @@ private:
 
     explicit LinuxPlatform(const wire::Directories& directories);
 
-    void flushSinks();
-
     std::unique_ptr<Services> services_;
 };
 

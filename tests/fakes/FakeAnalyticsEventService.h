@@ -27,6 +27,7 @@ public:
         asked_.emplace_back(eventName);
         return isWanted(eventName);
     }
+    [[nodiscard]] std::uint64_t inUseGeneration() const noexcept override { return generation_; }
     void sendEventLazy(std::string_view eventName, const std::function<Dictionary()>& payload) override {
         const std::lock_guard held(mutex_);
         if (!failing_ && isWanted(eventName)) {
@@ -38,6 +39,7 @@ public:
     void setEventsInUse(std::optional<std::set<std::string, std::less<>>> names) {
         const std::lock_guard held(mutex_);
         inUse_ = std::move(names);
+        ++generation_;
     }
     void setFailing(bool failing) noexcept { failing_ = failing; }
     [[nodiscard]] std::vector<Event> events() const {
@@ -74,6 +76,7 @@ private:
 
     std::atomic<bool> failing_{false};
     std::atomic<int> payloadsTaken_{0};
+    std::atomic<std::uint64_t> generation_{1};
     mutable std::mutex mutex_;
     std::optional<std::set<std::string, std::less<>>> inUse_;
     std::vector<Event> events_;

@@ -4,8 +4,11 @@
 
 #include <gmock/gmock.h>
 
+#include <atomic>
+#include <future>
 #include <memory>
 #include <new>
+#include <optional>
 #include <thread>
 
 #include <sys/stat.h>
@@ -20,9 +23,9 @@ using testing::IsEmpty;
 
 class AppendOnlyFileTest : public testing::Test {
 protected:
-    [[nodiscard]] std::unique_ptr<AppendOnlyFile> open(AppendOnlyFile::Limits limits = {}) {
-        return std::make_unique<AppendOnlyFile>(directory_.path("sink.jsonl"), "zrrs", log_, operations_,
-                                                limits);
+    [[nodiscard]] std::unique_ptr<AppendOnlyFile> open(SinkFileLimits limits = {}) {
+        return std::make_unique<AppendOnlyFile>(sinks_, "sink.jsonl", "zrrs",
+                                                AppendOnlyFile::Flushed::beforeReplies, limits);
     }
     static void append(AppendOnlyFile& file, std::string_view line) {
         file.append([line](TextBuffer& out) { out.append(line); });
@@ -47,7 +50,55 @@ protected:
     TemporaryDirectory directory_;
     RecordingLog log_;
     FaultyOperations operations_;
+    SinkFiles sinks_{directory_.path(), log_, operations_};
 };
+
+TEST_F(AppendOnlyFileTest, IsWrittenWithTheOthersUnlessItsOwnerDoesIt) {
+    std::optional<AppendOnlyFile> first, second, own;
+    first.emplace(sinks_, "first", "zrrs");
+    second.emplace(sinks_, "second", "zrrs");
+    own.emplace(sinks_, "own", "zrrs", AppendOnlyFile::Flushed::byOwner);
+    sinks_.flush();
+    for (auto* file : {&first, &second, &own}) {
+        append(**file, "a");
+    }
+    sinks_.flush();
+    sinks_.flush();
+    EXPECT_EQ(directory_.read("first") + directory_.read("second") + directory_.read("own"), "a\na\n");
+    EXPECT_EQ(operations_.writes, 2) << "one for each, and none where nothing waits";
+    append(*first, "b");
+    first.reset();
+    sinks_.flush();
+    append(*second, "b");
+    sinks_.flush();
+    own.reset();
+    EXPECT_EQ(directory_.read("first") + directory_.read("second") + directory_.read("own"),
+              "a\nb\na\nb\na\n");
+}
+
+/// Who finds nothing waiting may let replies go: not before the lines of another thread are written.
+TEST_F(AppendOnlyFileTest, AFlushWaitsForTheOneThatIsWriting) {
+    const auto file = open();
+    std::promise<void> isWriting, mayGoOn;
+    operations_.beforeWrite = [&] {
+        isWriting.set_value();
+        mayGoOn.get_future().wait();
+    };
+    append(*file, "one");
+    std::thread writer([&file] { file->flush(); });
+    isWriting.get_future().wait();
+    std::atomic<bool> isFlushed{false};
+    std::thread other([&] {
+        sinks_.flush();
+        isFlushed = true;
+        EXPECT_EQ(directory_.read("sink.jsonl"), "one\n");
+    });
+    std::this_thread::sleep_for(std::chrono::milliseconds(20));
+    EXPECT_FALSE(isFlushed);
+    mayGoOn.set_value();
+    writer.join();
+    other.join();
+}
 
 TEST_F(AppendOnlyFileTest, WritesABatchWithOneCallAndALargeOneByItself) {
     const auto file = open({.waiting = 40});

@@ -220,7 +220,7 @@ protected:
     }
     /// The sink's lines without time and what is the same in all: "OP SESSION".
     [[nodiscard]] std::vector<std::string> lines() {
-        service->flush();
+        sinks.flush();
         std::vector<std::string> found;
         std::istringstream text(directory.read("logs/bug-captures.jsonl"));
         for (std::string line; std::getline(text, line);) {
@@ -230,7 +230,7 @@ protected:
         return found;
     }
     void makeService() {
-        service.emplace(directory.path("logs"), clock, queues, log, FileOperations::system(),
+        service.emplace(sinks, directory.path("logs/captures"), clock, queues, log,
                         CaptureContent(directory.path("proc"), directory.path("sys")));
         reporter = service->makeReporter(std::array<pid_t, 3>{12, 13, 12});
     }
@@ -243,6 +243,7 @@ protected:
     const bool isMade = fs::create_directory(directory.path("logs"));
     const FileDescriptor nowhere{::open("/dev/null", O_WRONLY)};
     LinuxStructuredLog log{nowhere.get(), "debug"};
+    SinkFiles sinks{directory.path("logs"), log};
     FakeClock clock;
     FakeWorkQueues queues;
     std::vector<Dictionary> replies;
@@ -355,7 +356,7 @@ TEST_F(BugCaptureServiceTest, SessionsThatEndWhileTheyAreCancelledDoOneOfTheTwo)
     std::vector<std::string> started;
     {
         LinuxWorkQueues real;
-        service.emplace(directory.path("logs"), clock, real, log, FileOperations::system(),
+        service.emplace(sinks, directory.path("logs/captures"), clock, real, log,
                         CaptureContent(directory.path("proc"), directory.path("sys")));
         std::vector<std::thread> clients;
         for (int client = 0; client < 4; ++client) {

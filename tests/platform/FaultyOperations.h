@@ -24,11 +24,13 @@ public:
     int closeError = 0;
     std::function<int(std::string_view from)> renameError = [](std::string_view) { return 0; };
     int writes = 0;
+    std::function<void()> beforeWrite = [] {};
 
     int open(const char* path, int flags, mode_t mode) noexcept override {
         return openError != 0 ? fail(openError) : FileOperations::open(path, flags, mode);
     }
     ssize_t write(int descriptor, const void* bytes, std::size_t count) noexcept override {
+        beforeWrite();
         ++writes;
         isInterrupted_ = interruptions > 0 && !isInterrupted_;
         if (isInterrupted_) {

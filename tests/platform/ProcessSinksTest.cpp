@@ -28,14 +28,10 @@ public:
 
 class ProcessSinksTest : public testing::Test {
 protected:
-    void write(const std::string& name, const std::string& text) const {
-        std::filesystem::create_directories(std::filesystem::path(root.path(name)).parent_path());
-        root.write(name, text);
-    }
     void writeThread(const std::string& process, const std::string& thread, const std::string& state) const {
-        write("proc/" + process + "/comm", "p" + process + "\n");
-        write("proc/" + process + "/task/" + thread + "/comm", "t" + thread + "\n");
-        write("proc/" + process + "/task/" + thread + "/status", "Name:\tt\nState:\t" + state + "\n");
+        root.write("proc/" + process + "/comm", "p" + process + "\n");
+        root.write("proc/" + process + "/task/" + thread + "/comm", "t" + thread + "\n");
+        root.write("proc/" + process + "/task/" + thread + "/status", "Name:\tt\nState:\t" + state + "\n");
     }
     void endProcess(const std::string& process) const {
         std::filesystem::remove_all(root.path("proc/" + process));
@@ -45,6 +41,7 @@ protected:
     TemporaryDirectory root;
     FakeWorkQueues workQueues;
     RecordingLog log;
+    SinkFiles sinks{root.path(), log};
     SamplingClock clock;
     std::vector<pid_t> clients;
 };
@@ -61,14 +58,14 @@ protected:
     std::size_t run() { return workQueues.run("com.vandra.tamblo.stackcaptures"); }
     [[nodiscard]] std::string lines() const { return root.read("stack-captures.jsonl"); }
 
-    LinuxDiagnosticCapture service{root.path(), clock, workQueues, [this] { return clients; }, log, files()};
+    LinuxDiagnosticCapture service{sinks, clock, workQueues, [this] { return clients; }, log, files()};
 };
 
 TEST_F(StackCaptureTest, ALineHoldsTheSamplesThatEachThreadHad) {
     clients = {8, 7, 7};
     writeThread("7", "7", "S (sleeping)");
-    write("proc/7/task/7/wchan", "pipe_read");
-    write("proc/7/task/7/stack", "[<0>] pipe_read+0x1/0x2\n[<0>] vfs_read+0x3/0x4\n");
+    root.write("proc/7/task/7/wchan", "pipe_read");
+    root.write("proc/7/task/7/stack", "[<0>] pipe_read+0x1/0x2\n[<0>] vfs_read+0x3/0x4\n");
     writeThread("8", "9", "R (running)");
     writeThread("6", "6", "S (sleeping)");
     clock.betweenSamples = [&](int sleep) {
@@ -138,17 +135,17 @@ TEST_F(StackCaptureTest, AProcessWithTooManyThreadsLeavesTheOthersTheirs) {
 }
 
 TEST_F(ProcessSinksTest, TheMemoryLogLeavesOutWhoIsGone) {
-    LinuxMemoryLog memory(root.path(), clock, workQueues, log, files());
+    LinuxMemoryLog memory(sinks, clock, workQueues, log, files());
     writeThread("7", "7", "S (sleeping)");
-    write("proc/7/status",
-          "Name:\tp7\nVmPeak:\t9 kB\nVmLck:\t1 kB\nVmHWM:\t3 kB\nVmRSS:\t2 kB\nRssAnon:\t1 kB\n"
-          "RssFile:\t1 kB\nVmPTE:\t4 kB\nThreads:\t5\n");
+    root.write("proc/7/status",
+               "Name:\tp7\nVmPeak:\t9 kB\nVmLck:\t1 kB\nVmHWM:\t3 kB\nVmRSS:\t2 kB\nRssAnon:\t1 kB\n"
+               "RssFile:\t1 kB\nVmPTE:\t4 kB\nThreads:\t5\n");
     writeThread("8", "8", "Z (zombie)");
     memory.logMemory(-5, {9});
     EXPECT_EQ(root.read("memory-log.jsonl"), "") << "nothing is read on the caller's thread";
     EXPECT_EQ(workQueues.run("com.vandra.tamblo.memorylog"), 1U);
     memory.logMemory(-5, {9, 8, 7});
-    write("proc/meminfo", "MemTotal: 9 kB\nSlab: 1 kB\n");
+    root.write("proc/meminfo", "MemTotal: 9 kB\nSlab: 1 kB\n");
     EXPECT_EQ(workQueues.run("com.vandra.tamblo.memorylog"), 1U);
     EXPECT_EQ(root.read("memory-log.jsonl"),
               R"({"time":4.0,"reporter":-5,"processes":[],"kernel":{}})"

@@ -1,6 +1,7 @@
 #include "platform/linux/captures/LinuxBugCaptureService.h"
 
 #include "base/Format.h"
+#include "os/RandomNumber.h"
 #include "platform/ProcessList.h"
 #include "platform/linux/sinks/SinkLine.h"
 
@@ -8,21 +9,12 @@
 #include <utility>
 #include <vector>
 
-#include <sys/random.h>
-
 namespace tamblo {
 
 namespace {
 
 /// Beside the folders.
 constexpr std::string_view kAllowanceFile = "allowance.json";
-
-std::uint64_t firstNumber(const Clock& clock) {
-    // The time will do early in the device's start, when there is no randomness yet.
-    auto number = static_cast<std::uint64_t>(clock.now().time_since_epoch().count());
-    std::uint64_t random = 0;
-    return ::getrandom(&random, sizeof random, GRND_NONBLOCK) == sizeof random ? random : number;
-}
 
 std::vector<pid_t> withoutRepeats(std::span<const pid_t> processes) {
     ProcessList list;
@@ -67,17 +59,17 @@ private:
     const std::vector<pid_t> processes_;
 };
 
-LinuxBugCaptureService::LinuxBugCaptureService(const std::string& logsDirectory, const Clock& clock,
-                                               WorkQueues& workQueues, LinuxStructuredLog& log,
-                                               FileOperations& operations, const CaptureContent& content)
+LinuxBugCaptureService::LinuxBugCaptureService(SinkFiles& sinks, const std::string& directory,
+                                               const Clock& clock, WorkQueues& workQueues,
+                                               LinuxStructuredLog& log, const CaptureContent& content)
     : content_(content),
       clock_(clock),
       workQueues_(workQueues),
       log_(log),
-      file_(logsDirectory + "/bug-captures.jsonl", "zrrb", log, operations),
-      folders_(logsDirectory + "/captures", log),
-      allowance_(formatted("{}/captures/{}", logsDirectory, kAllowanceFile), log),
-      lastNumber_(firstNumber(clock)) {}
+      file_(sinks, "bug-captures.jsonl", "zrrb"),
+      folders_(directory, log),
+      allowance_(formatted("{}/{}", directory, kAllowanceFile), log),
+      lastNumber_(randomNumber()) {}
 
 std::unique_ptr<GlarnReporter> LinuxBugCaptureService::makeReporter(std::span<const pid_t> processes) {
     return std::make_unique<Reporter>(*this, processes);

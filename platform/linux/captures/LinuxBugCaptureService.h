@@ -20,8 +20,8 @@
 
 namespace tamblo {
 
-/// The bug-capture service as a sink file, `bug-captures.jsonl`, and a folder for each capture, below
-/// `captures`:
+/// The bug-capture service as a sink file, `bug-captures.jsonl`, and a directory with a folder for each
+/// capture:
 ///
 ///     {"time":…,"op":"start","session":"20260301T…","signature":{…},"duration":60.0,"payload":{}}
 ///     {"time":…,"op":"end","session":"20260301T…"}
@@ -37,15 +37,14 @@ public:
 
     /// What is referred to must outlive the service, except the queues: before they go, `endSessions` is
     /// called.
-    LinuxBugCaptureService(const std::string& logsDirectory, const Clock& clock, WorkQueues& workQueues,
-                           LinuxStructuredLog& log, FileOperations& operations = FileOperations::system(),
+    LinuxBugCaptureService(SinkFiles& sinks, const std::string& directory, const Clock& clock,
+                           WorkQueues& workQueues, LinuxStructuredLog& log,
                            const CaptureContent& content = CaptureContent());
     ~LinuxBugCaptureService() override { endSessions(); }
 
     [[nodiscard]] std::unique_ptr<GlarnReporter> makeReporter(std::span<const pid_t> processes) override;
     /// Cancels the captures that run, and makes no others.
     void endSessions();
-    void flush() { file_.flush(); }
 
 private:
     class Reporter;

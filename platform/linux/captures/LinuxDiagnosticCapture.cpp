@@ -118,14 +118,13 @@ void appendProcess(TextBuffer& line, const ProcessStacks& process) {
 
 } // namespace
 
-LinuxDiagnosticCapture::LinuxDiagnosticCapture(const std::string& logsDirectory, Clock& clock,
-                                               WorkQueues& workQueues, ClientProcesses clientProcesses,
-                                               StructuredLog& log, ProcessFiles files,
-                                               FileOperations& operations)
+LinuxDiagnosticCapture::LinuxDiagnosticCapture(SinkFiles& sinks, Clock& clock, WorkQueues& workQueues,
+                                               ClientProcesses clientProcesses, StructuredLog& log,
+                                               ProcessFiles files)
     : clock_(clock),
       clientProcesses_(std::move(clientProcesses)),
       files_(std::move(files)),
-      file_(logsDirectory + "/stack-captures.jsonl", "zrrp", log, operations),
+      file_(sinks, "stack-captures.jsonl", "zrrp", AppendOnlyFile::Flushed::byOwner),
       queue_(workQueues, "com.vandra.tamblo.stackcaptures",
              {.waiting = kMaximumWaiting, .what = "stack captures", .categoryCode = "zrrp"}, log) {}
 

@@ -47,10 +47,9 @@ public:
 
     /// What is referred to must outlive the service, except the queues. The client processes are asked for on
     /// any thread.
-    LinuxDiagnosticCapture(const std::string& logsDirectory, Clock& clock, WorkQueues& workQueues,
+    LinuxDiagnosticCapture(SinkFiles& sinks, Clock& clock, WorkQueues& workQueues,
                            ClientProcesses clientProcesses, StructuredLog& log,
-                           ProcessFiles files = ProcessFiles(),
-                           FileOperations& operations = FileOperations::system());
+                           ProcessFiles files = ProcessFiles());
 
     void captureStacks(StackCaptureRequest request) override;
 

@@ -43,11 +43,11 @@ void fillKernel(JsonObject& object, const ProcessFiles::KernelMemory& memory) {
 
 } // namespace
 
-LinuxMemoryLog::LinuxMemoryLog(const std::string& logsDirectory, const Clock& clock, WorkQueues& workQueues,
-                               StructuredLog& log, ProcessFiles files, FileOperations& operations)
+LinuxMemoryLog::LinuxMemoryLog(SinkFiles& sinks, const Clock& clock, WorkQueues& workQueues,
+                               StructuredLog& log, ProcessFiles files)
     : clock_(clock),
       files_(std::move(files)),
-      file_(logsDirectory + "/memory-log.jsonl", "zrrs", log, operations),
+      file_(sinks, "memory-log.jsonl", "zrrs", AppendOnlyFile::Flushed::byOwner),
       queue_(workQueues, "com.vandra.tamblo.memorylog",
              {.waiting = kMaximumWaiting, .what = "memory records", .categoryCode = "zrrs"}, log) {}
 

@@ -24,9 +24,8 @@ public:
     static constexpr std::size_t kMaximumWaiting = 256;
 
     /// What is referred to must outlive the log, except the queues.
-    LinuxMemoryLog(const std::string& logsDirectory, const Clock& clock, WorkQueues& workQueues,
-                   StructuredLog& log, ProcessFiles files = ProcessFiles(),
-                   FileOperations& operations = FileOperations::system());
+    LinuxMemoryLog(SinkFiles& sinks, const Clock& clock, WorkQueues& workQueues, StructuredLog& log,
+                   ProcessFiles files = ProcessFiles());
 
     void logMemory(std::int64_t reporterID, std::vector<pid_t> processes) override;
 

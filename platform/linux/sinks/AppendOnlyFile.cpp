@@ -33,22 +33,22 @@ std::size_t wholeLines(std::string_view bytes, std::size_t length) noexcept {
 
 } // namespace
 
-AppendOnlyFile::AppendOnlyFile(std::string path, std::string_view categoryCode, StructuredLog& log,
-                               FileOperations& operations)
-    : AppendOnlyFile(std::move(path), categoryCode, log, operations, Limits()) {}
-
-AppendOnlyFile::AppendOnlyFile(std::string path, std::string_view categoryCode, StructuredLog& log,
-                               FileOperations& operations, Limits limits)
-    : path_(std::move(path)),
+AppendOnlyFile::AppendOnlyFile(SinkFiles& sinks, std::string_view name, std::string_view categoryCode,
+                               Flushed flushed, SinkFileLimits limits)
+    : sinks_(sinks),
+      operations_(sinks.operations_),
+      path_(formatted("{}/{}", sinks.directory_, name)),
       categoryCode_(categoryCode),
-      limits_(limits),
-      log_(log),
-      operations_(operations) {
+      limits_(limits) {
     // What fails here fails again with the first line, and is told then.
     static_cast<void>(openFile(0));
+    if (flushed == Flushed::beforeReplies) {
+        sinks_.add(*this);
+    }
 }
 
 AppendOnlyFile::~AppendOnlyFile() {
+    sinks_.remove(*this);
     flush();
     if (isOut_) {
         endOutage("the service ends");
@@ -57,9 +57,12 @@ AppendOnlyFile::~AppendOnlyFile() {
 }
 
 void AppendOnlyFile::flush() {
-    const std::lock_guard lock(mutex_);
-    if (!waiting_.empty()) {
-        writeOut();
+    // Stays set until the lines are written: who finds it unset has nothing to wait for.
+    if (isWaiting_.load(std::memory_order_acquire)) {
+        const MutexLock lock(mutex_);
+        if (!waiting_.empty()) {
+            writeOut();
+        }
     }
 }
 
@@ -72,7 +75,7 @@ void AppendOnlyFile::writeOut() {
         }
     } else {
         if (!std::exchange(isOut_, true)) {
-            log_.report(
+            sinks_.log_.report(
                 LogLevel::error, categoryCode_,
                 formatted("{}: {}; its records are lost until it can be written again", path_, fault_));
         }
@@ -82,12 +85,14 @@ void AppendOnlyFile::writeOut() {
         waiting_.reset();
     }
     waiting_.clear();
+    isWaiting_.store(false, std::memory_order_release);
 }
 
 void AppendOnlyFile::endOutage(std::string_view ending) {
     isOut_ = false;
-    log_.report(LogLevel::error, categoryCode_,
-                formatted("{}: {}; {} records were lost", path_, ending, std::exchange(lostLines_, 0)));
+    sinks_.log_.report(
+        LogLevel::error, categoryCode_,
+        formatted("{}: {}; {} records were lost", path_, ending, std::exchange(lostLines_, 0)));
 }
 
 /// Takes the lines that have been written off the front.
@@ -138,8 +143,8 @@ bool AppendOnlyFile::writeFully(std::string_view& lines, std::size_t length) {
     return true;
 }
 
-/// Takes back the part of a line that was written last. If that fails too, the line is cut off when the file
-/// is opened again, which is the next thing that happens to it.
+/// Takes back the part of a line that was written last. The next thing that happens to the file is that it is
+/// opened again.
 void AppendOnlyFile::cutTornLine(std::size_t tornBytes) noexcept {
     struct stat status {};
     if (tornBytes != 0 && operations_.status(descriptor_, status) == 0 &&
@@ -149,9 +154,7 @@ void AppendOnlyFile::cutTornLine(std::size_t tornBytes) noexcept {
     closeFile();
 }
 
-/// Whether the path still leads to the file that is open; takes in its size, in case somebody shortened it. A
-/// look costs half of what a small write does, so it is taken now and then: what is written to a file in the
-/// moments after somebody removed it goes with it.
+/// Whether the path still leads to the file that is open; takes in its size, in case somebody shortened it.
 bool AppendOnlyFile::isStillInPlace() noexcept {
     if (descriptor_ < 0) {
         return false;
@@ -176,14 +179,15 @@ bool AppendOnlyFile::openFile(int creationFlag) {
     if (descriptor < 0) {
         return failed("open");
     }
-    if (adopt(descriptor)) {
+    if (resumeFile(descriptor)) {
         return true;
     }
     operations_.close(descriptor);
     return false;
 }
 
-bool AppendOnlyFile::adopt(int descriptor) {
+/// Goes on behind the last whole line of a file.
+bool AppendOnlyFile::resumeFile(int descriptor) {
     struct stat status {};
     if (operations_.status(descriptor, status) != 0) {
         return failed("examine");
@@ -236,8 +240,7 @@ bool AppendOnlyFile::findEndOfLastLine(int descriptor, std::uint64_t& end) {
     return true;
 }
 
-/// Moves the file out of the way. Earlier files move up only as far as the first free number, so that a
-/// rotation that fails half-way and is tried again pushes none of them out.
+/// Moves the file out of the way.
 bool AppendOnlyFile::rotate() {
     const auto numbered = [this](int number) {
         return number == 0 ? path_ : formatted("{}.{}", path_, number);

@@ -1,57 +1,80 @@
 #pragma once
 
+#include "base/Mutex.h"
 #include "base/TextBuffer.h"
-#include "os/FileOperations.h"
-#include "platform/StructuredLog.h"
+#include "platform/linux/sinks/SinkFiles.h"
 
+#include <atomic>
 #include <chrono>
 #include <cstddef>
 #include <cstdint>
-#include <mutex>
 #include <string>
 #include <string_view>
 
 namespace tamblo {
 
-/// A sink: a file of lines that only grows.
+struct SinkFileLimits {
+    /// A line that would make the file larger begins a new file.
+    std::uint64_t fileSize = 64U << 20U;
+    /// Waiting bytes that are written without being asked for.
+    std::size_t waiting = 256U << 10U;
+};
+
+/// A sink: a file of lines that only grows, owned by the platform service whose records it keeps.
 ///
-/// Lines are formatted straight into a buffer and written out together by `flush`, with one system call as a
-/// rule, or by themselves once enough of them wait. Any thread may append and flush; both take a lock, and
-/// only writing blocks on the disk. Owned by the platform service whose records it keeps; what waits is
-/// written when it is destroyed.
+/// One write for many lines. A system call costs more than a line does, so lines are formatted straight into
+/// one buffer and handed to the kernel together. They are in its hands before the replies to what caused them
+/// leave: the end of each batch of requests flushes all files (`SinkFiles`), then lets the replies go, so
+/// that a service that is killed loses nothing that it has answered. Nothing is synced: a loss of power may
+/// cost what the kernel had not written yet. A file whose lines come from a queue of their own is flushed by
+/// its owner, there; no reply waits for it.
 ///
-/// What the file holds are whole lines, each once, whatever fails: a line that was torn (by a full disk now,
-/// or by a crash before) is cut off before anything follows it. Lines that cannot be written are lost and
-/// counted; an outage is one error line when it begins and one when it ends. Every flush tries again, from
-/// opening the file on. A file that others remove or rename is begun anew within a tenth of a second.
+/// Who may block. Any thread may append and flush. Both take the file's lock, which is held while the file is
+/// written; who flushes a file where nothing waits takes no lock.
+///
+/// Whole lines, each once, whatever fails. A full disk, or a crash, may tear the last line: its rest is cut
+/// off before anything follows it, at once where that works, else when the file is opened again. What a write
+/// has not brought into the file is lost and counted, as keeping it would take memory without end.
+///
+/// An outage is two lines in the log, one when it begins and one, with the count, when it ends, lest a full
+/// disk be filled with words about it. Every flush tries again, from opening the file on.
+///
+/// Rotation. A file that is full becomes NAME.1, the earlier ones move up, NAME.4 goes. They move only as far
+/// as the first free number: a rotation that fails half-way and is tried again pushes none of them out.
+///
+/// The path is looked up every tenth of a second, since a look costs half of what a small write does: a file
+/// that others remove or rename is begun anew, and what was written in between went with it.
 class AppendOnlyFile {
 public:
-    struct Limits {
-        /// A line that would make the file larger begins a new file.
-        std::uint64_t fileSize = 64U << 20U;
-        /// Waiting bytes that are written without being asked for.
-        std::size_t waiting = 256U << 10U;
-    };
-    /// How many earlier files are kept, as NAME.1 (the latest) to NAME.4.
+    enum class Flushed { beforeReplies, byOwner };
     static constexpr int kKeptFiles = 4;
 
-    /// Cuts off a torn last line if the file exists; creates it with the first line. Failures are reported in
-    /// the log, under the category code, which must be a constant. Log and operations must outlive the file.
-    AppendOnlyFile(std::string path, std::string_view categoryCode, StructuredLog& log,
-                   FileOperations& operations = FileOperations::system());
-    AppendOnlyFile(std::string path, std::string_view categoryCode, StructuredLog& log,
-                   FileOperations& operations, Limits limits);
+    /// The file's name has no directory; the category code, under which failures are logged, must be a
+    /// constant. What the file holds already has a torn last line cut off; it is created with the first line.
+    AppendOnlyFile(SinkFiles& sinks, std::string_view name, std::string_view categoryCode,
+                   Flushed flushed = Flushed::beforeReplies, SinkFileLimits limits = {});
+    /// Writes out what waits.
     ~AppendOnlyFile();
     AppendOnlyFile(const AppendOnlyFile&) = delete;
     AppendOnlyFile& operator=(const AppendOnlyFile&) = delete;
 
     /// Adds one line. `format` is called at once, with the lock held, and appends the line to the
-    /// `TextBuffer&` that it is given, without a line end, touching nothing of what stands there already.
+    /// `TextBuffer&` that it is given, without a line end. What stands there already are the lines that wait:
+    /// it may read them and changes none. A line that it throws out of is taken back.
     template <typename Format> void append(Format&& format) {
-        const std::lock_guard lock(mutex_);
-        OpenLine line(*this);
-        format(waiting_);
-        line.complete();
+        const MutexLock lock(mutex_);
+        const std::size_t start = waiting_.size();
+        try {
+            format(waiting_);
+            waiting_.append('\n');
+        } catch (...) {
+            waiting_.truncate(start);
+            throw;
+        }
+        isWaiting_.store(true, std::memory_order_release);
+        if (waiting_.size() >= limits_.waiting) {
+            writeOut();
+        }
     }
 
     /// Writes out what waits: afterwards it is in the kernel's hands, or lost and counted.
@@ -60,62 +83,40 @@ public:
     [[nodiscard]] const std::string& path() const noexcept { return path_; }
 
 private:
-    /// The line being appended; takes it back when it is not completed.
-    class OpenLine {
-    public:
-        explicit OpenLine(AppendOnlyFile& file) noexcept : file_(file), start_(file.waiting_.size()) {}
-        ~OpenLine() {
-            if (!complete_) {
-                file_.waiting_.truncate(start_);
-            }
-        }
-        OpenLine(const OpenLine&) = delete;
-        OpenLine& operator=(const OpenLine&) = delete;
-        void complete() {
-            file_.waiting_.append('\n');
-            complete_ = true;
-            if (file_.waiting_.size() >= file_.limits_.waiting) {
-                file_.writeOut();
-            }
-        }
-
-    private:
-        AppendOnlyFile& file_;
-        const std::size_t start_;
-        bool complete_ = false;
-    };
-
-    // All of these with the lock held. Those that answer a boolean leave the reason of a failure in `fault_`.
-    void writeOut();
-    [[nodiscard]] bool writeLines(std::string_view& lines);
-    [[nodiscard]] bool writeFully(std::string_view& lines, std::size_t length);
-    void cutTornLine(std::size_t tornBytes) noexcept;
-    [[nodiscard]] bool isStillInPlace() noexcept;
-    [[nodiscard]] bool openFile(int creationFlag);
-    [[nodiscard]] bool adopt(int descriptor);
+    // Those that answer a boolean leave the reason of a failure in `fault_`.
+    void writeOut() TAMBLO_REQUIRES(mutex_);
+    [[nodiscard]] bool writeLines(std::string_view& lines) TAMBLO_REQUIRES(mutex_);
+    [[nodiscard]] bool writeFully(std::string_view& lines, std::size_t length) TAMBLO_REQUIRES(mutex_);
+    void cutTornLine(std::size_t tornBytes) noexcept TAMBLO_REQUIRES(mutex_);
+    [[nodiscard]] bool isStillInPlace() noexcept TAMBLO_REQUIRES(mutex_);
+    [[nodiscard]] bool openFile(int creationFlag) TAMBLO_REQUIRES(mutex_);
+    [[nodiscard]] bool resumeFile(int descriptor) TAMBLO_REQUIRES(mutex_);
     [[nodiscard]] bool findEndOfLastLine(int descriptor, std::uint64_t& end);
-    [[nodiscard]] bool rotate();
-    [[nodiscard]] std::size_t linesThatFit(std::string_view lines) const noexcept;
-    void closeFile() noexcept;
-    [[nodiscard]] bool failed(std::string_view action);
-    void endOutage(std::string_view ending);
+    [[nodiscard]] bool rotate() TAMBLO_REQUIRES(mutex_);
+    [[nodiscard]] std::size_t linesThatFit(std::string_view lines) const noexcept TAMBLO_REQUIRES(mutex_);
+    void closeFile() noexcept TAMBLO_REQUIRES(mutex_);
+    [[nodiscard]] bool failed(std::string_view action) TAMBLO_REQUIRES(mutex_);
+    void endOutage(std::string_view ending) TAMBLO_REQUIRES(mutex_);
 
+    SinkFiles& sinks_;
+    FileOperations& operations_;
     const std::string path_;
     const std::string_view categoryCode_;
-    const Limits limits_;
-    StructuredLog& log_;
-    FileOperations& operations_;
+    const SinkFileLimits limits_;
 
-    std::mutex mutex_; ///< guards what follows
-    TextBuffer waiting_;
-    int descriptor_ = -1;
-    std::uint64_t size_ = 0;
-    dev_t device_ = 0;
-    ino_t inode_ = 0;
-    std::chrono::nanoseconds pathCheckedAt_{0}; ///< on the coarse clock
-    bool isOut_ = false;
-    std::uint64_t lostLines_ = 0;
-    std::string fault_;
+    /// Whether lines wait, or are being written.
+    std::atomic<bool> isWaiting_{false};
+    Mutex mutex_;
+    TextBuffer waiting_ TAMBLO_GUARDED_BY(mutex_);
+    int descriptor_ TAMBLO_GUARDED_BY(mutex_) = -1;
+    std::uint64_t size_ TAMBLO_GUARDED_BY(mutex_) = 0;
+    dev_t device_ TAMBLO_GUARDED_BY(mutex_) = 0;
+    ino_t inode_ TAMBLO_GUARDED_BY(mutex_) = 0;
+    /// On the coarse clock.
+    std::chrono::nanoseconds pathCheckedAt_ TAMBLO_GUARDED_BY(mutex_){0};
+    bool isOut_ TAMBLO_GUARDED_BY(mutex_) = false;
+    std::uint64_t lostLines_ TAMBLO_GUARDED_BY(mutex_) = 0;
+    std::string fault_ TAMBLO_GUARDED_BY(mutex_);
 };
 
 } // namespace tamblo

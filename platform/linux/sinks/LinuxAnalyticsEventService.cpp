@@ -2,59 +2,102 @@
 
 #include "base/Json.h"
 
+#include <algorithm>
+#include <cstring>
+#include <functional>
+#include <utility>
+
 namespace tamblo {
 
-LinuxAnalyticsEventService::LinuxAnalyticsEventService(const std::string& logsDirectory, const Clock& clock,
+namespace {
+
+/// Appends a piece of what stands in the buffer already.
+void appendAgain(TextBuffer& text, std::size_t begin, std::size_t end) {
+    char* const room = text.room(end - begin);
+    std::memcpy(room, text.data() + begin, end - begin);
+    text.commit(end - begin);
+}
+
+} // namespace
+
+LinuxAnalyticsEventService::LinuxAnalyticsEventService(SinkFiles& sinks, const Clock& clock,
                                                        const LinuxPreferences& preferences,
-                                                       StructuredLog& log, FileOperations& operations)
+                                                       StructuredLog& log)
     : clock_(clock),
-      eventsInUse_(preferences, log),
-      file_(logsDirectory + "/analytics-events.jsonl", "zrrs", log, operations) {}
+      preferences_(preferences),
+      preference_({.domain = "com.vandra.tamblo.analytics",
+                   .key = "events_in_use",
+                   .categoryCode = "zrrs",
+                   .whenAbsent = {"*"},
+                   .whenNoArray = {"*"},
+                   .noArrayMeans = "all analytics events are in use"},
+                  preferences, log),
+      file_(sinks, "analytics-events.jsonl", "zrrs") {}
 
 bool LinuxAnalyticsEventService::isEventInUse(std::string_view eventName) {
-    return eventsInUse_.contains(eventName);
+    const std::uint64_t generation = preferences_.generation();
+    if (allInUseIn_.load(std::memory_order_relaxed) == generation) {
+        return true;
+    }
+    const MutexLock lock(mutex_);
+    if (generation > generation_) {
+        readNamesInUse(generation);
+    }
+    return std::binary_search(names_.begin(), names_.end(), eventName, std::less<>()) ||
+           std::any_of(prefixes_.begin(), prefixes_.end(),
+                       [eventName](const std::string& prefix) { return eventName.starts_with(prefix); });
+}
+
+void LinuxAnalyticsEventService::readNamesInUse(std::uint64_t generation) {
+    generation_ = generation;
+    names_.clear();
+    prefixes_.clear();
+    for (std::string& pattern : preference_.read()) {
+        if (pattern.ends_with('*')) {
+            pattern.pop_back();
+            prefixes_.push_back(std::move(pattern));
+        } else {
+            names_.push_back(std::move(pattern));
+        }
+    }
+    std::sort(names_.begin(), names_.end());
+    if (std::find(prefixes_.begin(), prefixes_.end(), "") != prefixes_.end()) {
+        allInUseIn_.store(generation, std::memory_order_relaxed);
+    }
 }
 
 void LinuxAnalyticsEventService::sendEventLazy(std::string_view eventName,
                                                const std::function<Dictionary()>& payload) {
-    if (!eventsInUse_.contains(eventName)) {
+    if (!isEventInUse(eventName)) {
         return;
     }
-    // Before the lock: the provider is foreign code.
+    // Before the file's lock: the provider is foreign code.
     Dictionary values = payload();
-    const std::lock_guard lock(mutex_);
-    if (!hasLastPayload_ || !values.sharesStorageWith(lastPayload_)) {
-        hasLastPayload_ = false;
-        formatPayload(values);
-        lastPayload_ = std::move(values);
-        hasLastPayload_ = true;
-    }
-    file_.append([this, eventName](TextBuffer& line) {
-        const std::string_view text = lastText_.view();
-        line.append(text.substr(0, lastTextBeforeName_));
-        appendJsonString(line, eventName);
-        line.append(text.substr(lastTextBeforeName_));
-    });
+    file_.append([&](TextBuffer& lines) { format(lines, eventName, std::move(values)); });
 }
 
-void LinuxAnalyticsEventService::formatPayload(const Dictionary& payload) {
-    lastText_.clear();
-    lastText_.append("{\"time\":");
-    appendJsonNumber(lastText_, secondsSince1970(clock_.now()));
-    lastText_.append(",\"event\":");
-    lastTextBeforeName_ = lastText_.size();
-    lastText_.append(",\"payload\":");
-    appendJson(lastText_, payload);
-    lastText_.append('}');
-}
-
-void LinuxAnalyticsEventService::flush() {
-    {
-        const std::lock_guard lock(mutex_);
-        lastPayload_ = Dictionary();
-        hasLastPayload_ = false;
+void LinuxAnalyticsEventService::format(TextBuffer& lines, std::string_view eventName, Dictionary&& payload) {
+    // Of the lines that wait, if any, the last one is the one that was formatted last.
+    if (!lines.empty() && payload.sharesStorageWith(lastLine_.payload)) {
+        appendAgain(lines, lastLine_.begin, lastLine_.nameBegin);
+        appendJsonString(lines, eventName);
+        appendAgain(lines, lastLine_.nameEnd, lastLine_.end);
+        return;
     }
-    file_.flush();
+    LastLine line;
+    line.begin = lines.size();
+    lines.append("{\"time\":");
+    appendJsonNumber(lines, secondsSince1970(clock_.now()));
+    lines.append(",\"event\":");
+    line.nameBegin = lines.size();
+    appendJsonString(lines, eventName);
+    line.nameEnd = lines.size();
+    lines.append(",\"payload\":");
+    appendJson(lines, payload);
+    lines.append('}');
+    line.end = lines.size();
+    line.payload = std::move(payload);
+    lastLine_ = std::move(line);
 }
 
 } // namespace tamblo

@@ -1,18 +1,19 @@
 #pragma once
 
 #include "base/Dictionary.h"
-#include "base/TextBuffer.h"
+#include "base/Mutex.h"
 #include "platform/AnalyticsEventService.h"
 #include "platform/Clock.h"
-#include "platform/StructuredLog.h"
-#include "platform/linux/settings/LinuxPreferences.h"
 #include "platform/linux/sinks/AppendOnlyFile.h"
-#include "platform/linux/sinks/EventsInUse.h"
+#include "platform/linux/sinks/NamesPreference.h"
 
+#include <atomic>
+#include <cstddef>
+#include <cstdint>
 #include <functional>
-#include <mutex>
 #include <string>
 #include <string_view>
+#include <vector>
 
 namespace tamblo {
 
@@ -20,35 +21,49 @@ namespace tamblo {
 ///
 ///     {"time":1772366400.25,"event":"com.vandra.tamblo.Session_Generic.Summary","payload":{…}}
 ///
-/// Most messages are sent as two events with one payload. Its text is made once: the payload of the last
-/// event is kept until the next flush, and an event whose payload is that very one is given a copy of the
-/// text and the time.
+/// Which events are in use is a preference, domain `com.vandra.tamblo.analytics`, key `events_in_use`: an
+/// array of names, each exact or with one trailing `*`; without it all are.
+///
+/// Most messages are sent as two events with one payload, whose text is made once: where the line before
+/// waits in the file's buffer and has that very payload, its text and time are copied from there.
 class LinuxAnalyticsEventService final : public AnalyticsEventService {
 public:
     /// What is referred to must outlive the service.
-    LinuxAnalyticsEventService(const std::string& logsDirectory, const Clock& clock,
-                               const LinuxPreferences& preferences, StructuredLog& log,
-                               FileOperations& operations = FileOperations::system());
+    LinuxAnalyticsEventService(SinkFiles& sinks, const Clock& clock, const LinuxPreferences& preferences,
+                               StructuredLog& log);
 
     [[nodiscard]] bool isEventInUse(std::string_view eventName) override;
+    [[nodiscard]] std::uint64_t inUseGeneration() const noexcept override {
+        return preferences_.generation();
+    }
     void sendEventLazy(std::string_view eventName, const std::function<Dictionary()>& payload) override;
 
-    /// Writes out the events recorded so far. To be called after each batch of the server queue's work,
-    /// before its replies go.
-    void flush();
-
 private:
-    void formatPayload(const Dictionary& payload);
+    /// The line that was formatted last, in the file's buffer: its payload, and where it stands.
+    struct LastLine {
+        Dictionary payload;
+        std::size_t begin = 0;
+        std::size_t nameBegin = 0;
+        std::size_t nameEnd = 0;
+        std::size_t end = 0;
+    };
+
+    void format(TextBuffer& lines, std::string_view eventName, Dictionary&& payload);
+    void readNamesInUse(std::uint64_t generation) TAMBLO_REQUIRES(mutex_);
 
     const Clock& clock_;
-    EventsInUse eventsInUse_;
-    AppendOnlyFile file_;
+    const LinuxPreferences& preferences_;
 
-    std::mutex mutex_; ///< guards what follows
-    Dictionary lastPayload_;
-    bool hasLastPayload_ = false;
-    TextBuffer lastText_; ///< what stands before the event's name in the line, then what stands after it
-    std::size_t lastTextBeforeName_ = 0;
+    /// The generation of the preferences by which all events are in use: the usual case, without the lock.
+    std::atomic<std::uint64_t> allInUseIn_{0};
+    Mutex mutex_;
+    NamesPreference preference_ TAMBLO_GUARDED_BY(mutex_);
+    std::uint64_t generation_ TAMBLO_GUARDED_BY(mutex_) = 0;
+    std::vector<std::string> names_ TAMBLO_GUARDED_BY(mutex_); ///< sorted
+    std::vector<std::string> prefixes_ TAMBLO_GUARDED_BY(mutex_);
+
+    LastLine lastLine_; ///< guarded by the file's lock: touched only while a line is appended
+    AppendOnlyFile file_;
 };
 
 } // namespace tamblo

@@ -1,40 +1,13 @@
 #include "platform/linux/sinks/LinuxCallQualityService.h"
 
 #include "base/Format.h"
+#include "os/RandomNumber.h"
 #include "platform/linux/loop/LinuxSerialQueue.h"
 #include "platform/linux/sinks/SinkLine.h"
 
-#include <algorithm>
-#include <chrono>
 #include <utility>
 
-#include <sys/random.h>
-
 namespace tamblo {
-
-namespace {
-
-constexpr std::string_view kDomain = "com.vandra.tamblo.callquality";
-constexpr std::string_view kKey = "backends";
-constexpr const char* kSpool = "spool";
-
-/// Sixteen hexadecimal digits.
-std::string makeProcessName(const Clock& clock) {
-    // The time will do early in the device's start, when there is no randomness yet.
-    auto bits = static_cast<std::uint64_t>(clock.now().time_since_epoch().count());
-    std::uint64_t random = 0;
-    if (::getrandom(&random, sizeof random, GRND_NONBLOCK) == sizeof random) {
-        bits = random;
-    }
-    std::string name(16, '0');
-    for (auto digit = name.rbegin(); digit != name.rend(); ++digit) {
-        *digit = "0123456789abcdef"[bits % 16];
-        bits /= 16;
-    }
-    return name;
-}
-
-} // namespace
 
 class LinuxCallQualityService::SpoolSession final : public Session {
 public:
@@ -49,15 +22,20 @@ private:
     const std::string name_;
 };
 
-LinuxCallQualityService::LinuxCallQualityService(const std::string& logsDirectory, const Clock& clock,
+LinuxCallQualityService::LinuxCallQualityService(SinkFiles& sinks, const Clock& clock,
                                                  const LinuxPreferences& preferences, WorkQueues& workQueues,
-                                                 StructuredLog& log, FileOperations& operations)
-    : processName_(makeProcessName(clock)),
+                                                 StructuredLog& log)
+    : processName_(formatted("{}", hexadecimal(randomNumber(), 16))),
       clock_(clock),
-      preferences_(preferences),
       workQueues_(workQueues),
-      log_(log),
-      file_(logsDirectory + "/call-quality.jsonl", "zrri", log, operations) {}
+      file_(sinks, "call-quality.jsonl", "zrri", AppendOnlyFile::Flushed::byOwner),
+      backends_({.domain = "com.vandra.tamblo.callquality",
+                 .key = "backends",
+                 .categoryCode = "zrri",
+                 .whenAbsent = {"spool"},
+                 .whenNoArray = {},
+                 .noArrayMeans = "no back end is found"},
+                preferences, log) {}
 
 std::optional<std::string> LinuxCallQualityService::NewHierarchyToken(std::string_view parent) {
     return formatted("{}{}{}.t{}", parent, parent.empty() ? "" : "/", processName_, ++lastToken_);
@@ -79,36 +57,12 @@ CallQualityService::SessionRef LinuxCallQualityService::CreateLinkmeterSession(c
 void LinuxCallQualityService::StartConfiguration(const SessionRef&, Completion completion) {
     std::call_once(isQueueMade_,
                    [this] { queue_ = workQueues_.makeSerialQueue("com.vandra.tamblo.linkmeter.backends"); });
-    queue_->post([this, completion = std::move(completion)]() mutable { completion(findBackends()); },
-                 Pace::mayBlock);
-}
-
-std::optional<std::vector<std::string>> LinuxCallQualityService::findBackends() {
-    const std::optional<Value> value = preferences_.copyPreferenceValue(kKey, kDomain);
-    std::vector<std::string> names;
-    bool isMalformed = false;
-    if (!value) {
-        names.emplace_back(kSpool);
-    } else {
-        isMalformed = !value->isArray();
-        for (const Value& element : value->arrayValue()) {
-            if (element.stringValue().empty()) {
-                isMalformed = true;
-            } else {
-                names.emplace_back(element.stringValue());
-            }
-        }
-    }
-    // Told once, however many sessions ask.
-    if (!isMalformed) {
-        reported_.reset();
-    } else if (std::exchange(reported_, value) != value) {
-        log_.report(LogLevel::error, "zrri",
-                    formatted("{}: {} {}", preferences_.path(kDomain), kKey,
-                              value->isArray() ? "holds what is no name; that is ignored"
-                                               : "is no array; no back end is found"));
-    }
-    return names.empty() ? std::nullopt : std::optional(std::move(names));
+    queue_->post(
+        [this, completion = std::move(completion)]() mutable {
+            std::vector<std::string> names = backends_.read();
+            completion(names.empty() ? std::nullopt : std::optional(std::move(names)));
+        },
+        Pace::mayBlock);
 }
 
 std::optional<std::string> LinuxCallQualityService::SendLinkmeterMessage(const SessionRef& session,

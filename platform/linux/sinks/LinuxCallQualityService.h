@@ -2,10 +2,9 @@
 
 #include "platform/CallQualityService.h"
 #include "platform/Clock.h"
-#include "platform/StructuredLog.h"
 #include "platform/WorkQueue.h"
-#include "platform/linux/settings/LinuxPreferences.h"
 #include "platform/linux/sinks/AppendOnlyFile.h"
+#include "platform/linux/sinks/NamesPreference.h"
 
 #include <atomic>
 #include <cstdint>
@@ -29,9 +28,8 @@ class LinuxCallQualityService final : public CallQualityService {
 public:
     /// What is referred to must outlive the service, except the queues, which are used from the first session
     /// on and work off what was posted before the service goes.
-    LinuxCallQualityService(const std::string& logsDirectory, const Clock& clock,
-                            const LinuxPreferences& preferences, WorkQueues& workQueues, StructuredLog& log,
-                            FileOperations& operations = FileOperations::system());
+    LinuxCallQualityService(SinkFiles& sinks, const Clock& clock, const LinuxPreferences& preferences,
+                            WorkQueues& workQueues, StructuredLog& log);
 
     [[nodiscard]] std::optional<std::string> NewHierarchyToken(std::string_view parent) override;
     [[nodiscard]] SessionRef CreateLinkmeterSession(const Dictionary& sessionInfo,
@@ -49,20 +47,15 @@ public:
 private:
     class SpoolSession;
 
-    [[nodiscard]] std::optional<std::vector<std::string>> findBackends();
-
     const std::string processName_;
     const Clock& clock_;
-    const LinuxPreferences& preferences_;
     WorkQueues& workQueues_;
-    StructuredLog& log_;
     AppendOnlyFile file_;
     std::atomic<std::uint64_t> lastToken_{0};
     std::atomic<std::uint64_t> lastSession_{0};
     std::once_flag isQueueMade_;
     std::unique_ptr<SerialQueue> queue_;
-    /// The malformed value that the log knows of; the queue's.
-    std::optional<Value> reported_;
+    NamesPreference backends_; ///< the queue's
 };
 
 } // namespace tamblo

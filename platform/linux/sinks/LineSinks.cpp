@@ -1,8 +1,26 @@
-#include "platform/linux/sinks/LinuxBugReportDrafting.h"
+#include "platform/linux/sinks/LineSinks.h"
 
+#include "base/Base64.h"
 #include "platform/linux/sinks/SinkLine.h"
 
 namespace tamblo {
+
+void LinuxPowerEventLog::postRegisteredPowerEvent(std::uint32_t subsystem, std::string_view eventName,
+                                                  const Dictionary& payload) {
+    file_.append([&](TextBuffer& line) {
+        SinkLine(line, clock_.now())
+            .number("subsystem", subsystem)
+            .text("event", eventName)
+            .value("payload", payload);
+    });
+}
+
+void LinuxDiagnosticsMetrics::SubmitMetricRecord(std::uint32_t metric, std::span<const std::uint8_t> record) {
+    const std::string text = encodeBase64(record);
+    file_.append([&](TextBuffer& line) {
+        SinkLine(line, clock_.now()).number("metric", metric).text("record", text);
+    });
+}
 
 void LinuxBugReportDrafting::createDraft(const BugReportDraft& draft, const std::string& processName,
                                          const std::string& displayReason, Completion completion) {
@@ -24,7 +42,6 @@ void LinuxBugReportDrafting::createDraft(const BugReportDraft& draft, const std:
                     .texts("diagnosticExtensions", draft.diagnosticExtensions);
             });
     });
-    // A file that cannot be written is told of by itself, once.
     if (completion) {
         completion(std::nullopt);
     }
