@@ -1,5 +1,6 @@
 #include "base/Format.h"
 #include "tests/workers/WorkerTest.h"
+#include "util/Log.h"
 #include "workers/sinks/LinkmeterSummary.h"
 #include "workers/sinks/ZRReportingSessionRtcWorker.h"
 
