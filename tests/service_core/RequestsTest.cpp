@@ -45,66 +45,6 @@ TEST_F(RequestsTest, UnknownReportersAreAnsweredWithSuccess) {
     send(client, {99});
     EXPECT_THAT(takeReplies(), ElementsAre("send"));
     EXPECT_THAT(script.take(), IsEmpty());
-    EXPECT_EQ(device.log.count("stopping 0"), 0U);
-    EXPECT_EQ(device.log.count("destroying 0"), 0U);
-}
-
-TEST_F(RequestsTest, LinesOfAClient) {
-    device.log.clear();
-    Connection other = connect(11);
-    ZRReportingServiceProtocol& of11 = other->object();
-    of11.createReportingSession(7, {});
-    of11.setServiceType(2, 7, {});
-    of11.setConfiguration({}, 7, {});
-    of11.startReportingSessionForID(7, {});
-    of11.sendMessage({}, 1, 1, {7, 99}, {});
-    of11.getServiceNameForReporterID(7, {});
-    of11.reporterID(7, {});
-    of11.stopReportingSessionForID(7, {});
-    of11.stopReportingSessionForID(99, {});
-    of11.destroyReportingSession(7, {});
-    (void)run();
-    other->interrupt();
-    other->invalidate();
-    (void)run();
-    const std::vector<std::string> expected{
-        "s: newConnection: connection of 11",
-        "s: new client with pid 11",
-        "d: creating session for reporter 7",
-        "s: session created for reporter 7",
-        "d: setting service type 2 for reporter 7",
-        "s: service type 2 set for reporter  7",
-        "d: setting configuration",
-        "d: starting session for reporter 7",
-        "s: sessions for client 10 :",
-        "s: sessions for client 11 :",
-        "s: 1 active reporting session(s)",
-        "d: sending message for reporter",
-        "i: found reporting session 7 for client 11",
-        "e: failed to find reporting session 99",
-        "d: fetching seviceType",
-        "s: returning service type 2 for reporter  7",
-        "d: validating reporter 7",
-        "s: validating reporter 7",
-        "d: stopping session for reporter 7",
-        "s: sessions for client 10 :",
-        "s: sessions for client 11 :",
-        "s: 0 active reporting session(s)",
-        "s: stopping 7",
-        "d: stopping session for reporter 99",
-        "d: Stop called, but session==nil or session.started==false. reporterID=99 session=(null) "
-        "session.started=0",
-        "s: stopping 99",
-        "d: destroying session for reporter 7",
-        "s: destroying 7",
-        "s: sessions for client 10 :",
-        "s: sessions for client 11 :",
-        "s: 0 active reporting session(s)",
-        "s: interruptionHandler: connection exited",
-        "s: removing 11 from the server client list",
-        "s: invalidationHandler: connection exited process=app11 uptime_sec=0",
-        "s: dealloc 11 from the server client list"};
-    EXPECT_EQ(serviceLines(), expected);
 }
 
 TEST_F(RequestsTest, TheStartReplyIsHeldUntilTheStop) {
