@@ -19,34 +19,19 @@ namespace tamblo::test {
 
 namespace {
 
-constexpr std::chrono::seconds kPatience{20};
+constexpr std::chrono::duration<int, std::milli> kPatience{20'000};
 constexpr std::chrono::milliseconds kPause{2};
 
-/// A socket on which the service says that it is ready, as it would to a service manager.
-class ReadySocket {
-public:
-    explicit ReadySocket(const std::filesystem::path& path) {
-        std::filesystem::remove(path);
-        socket_ = boundSocket(SOCK_DGRAM, path);
-    }
-    ~ReadySocket() { ::close(socket_); }
-    ReadySocket(const ReadySocket&) = delete;
-    ReadySocket& operator=(const ReadySocket&) = delete;
-
-    [[nodiscard]] bool await() const {
-        pollfd descriptor{.fd = socket_, .events = POLLIN, .revents = 0};
-        return ::poll(&descriptor, 1, static_cast<int>(std::chrono::milliseconds(kPatience).count())) == 1;
-    }
-
-private:
-    int socket_ = -1;
-};
+void limit(__rlimit_resource resource, rlim_t soft, rlim_t hard, pid_t process = 0) {
+    const rlimit limits{soft, hard};
+    ::prlimit(process, resource, &limits, nullptr);
+}
 
 } // namespace
 
 CommandResult run(const std::string& command) {
     CommandResult done{};
-    std::FILE* pipe = ::popen(command.c_str(), "r");
+    std::FILE* pipe = ::popen((command + " 2>&1").c_str(), "r");
     for (int byte = std::fgetc(pipe); byte != EOF; byte = std::fgetc(pipe)) {
         done.output += static_cast<char>(byte);
     }
@@ -73,11 +58,9 @@ std::size_t countOf(std::string_view part, std::string_view text) {
     return count;
 }
 
-ServiceProcess::ServiceProcess() : ServiceProcess(Options()) {}
-
 ServiceProcess::ServiceProcess(Options options) : options_(std::move(options)) {
     if (options_.isInternalBuild) {
-        writeFile(directory() / "config/device-properties.json", R"({"InternalBuild": true})");
+        writeFile(directory_.path("config/device-properties.json"), R"({"InternalBuild": true})");
     }
     for (const auto& [domain, values] : options_.preferences) {
         writeFile(preferenceFile(domain), values);
@@ -91,7 +74,9 @@ ServiceProcess::~ServiceProcess() {
 }
 
 void ServiceProcess::start() {
-    const ReadySocket ready(directory() / "ready");
+    // On which the service says that it is ready, as it would to a service manager.
+    std::filesystem::remove(directory_.path("ready"));
+    pollfd ready{.fd = boundSocket(SOCK_DGRAM, directory_.path("ready")), .events = POLLIN, .revents = 0};
     pid_ = ::fork();
     if (pid_ == 0) {
         ::setenv("RUNTIME_DIRECTORY", runtimeDirectory().c_str(), 1);
@@ -103,13 +88,17 @@ void ServiceProcess::start() {
             ::setenv(name.c_str(), value.c_str(), 1);
         }
         ::dup2(::open(directory_.path("stderr").c_str(), O_WRONLY | O_CREAT | O_APPEND, 0600), STDERR_FILENO);
+        limit(RLIMIT_FSIZE, options_.fileSizeLimit, RLIM_INFINITY);
+        limit(RLIMIT_NOFILE, options_.descriptorLimit, options_.descriptorLimit);
         if (options_.beforeExec) {
             options_.beforeExec();
         }
         ::execl(TAMBLOD_PATH, "tamblod", nullptr);
         ::_exit(127);
     }
-    if (options_.awaitsReady && !ready.await()) {
+    const bool isReady = !options_.awaitsReady || ::poll(&ready, 1, kPatience.count()) == 1;
+    ::close(ready.fd);
+    if (!isReady) {
         throw std::runtime_error("tamblod does not get ready: " + errorOutput());
     }
 }
@@ -134,12 +123,16 @@ std::optional<int> ServiceProcess::stop() {
     return awaitEnd();
 }
 
+void ServiceProcess::liftFileSizeLimit() const {
+    limit(RLIMIT_FSIZE, RLIM_INFINITY, RLIM_INFINITY, pid_);
+}
+
 std::string ServiceProcess::socketPath() const {
     return runtimeDirectory() + "/com.vandra.tamblo.reporting";
 }
 
 std::filesystem::path ServiceProcess::preferenceFile(std::string_view domain) const {
-    return directory() / "config/preferences" / (std::string(domain) + ".json");
+    return directory_.path("config/preferences/" + std::string(domain) + ".json");
 }
 
 std::string ServiceProcess::tambloctlCommand(const std::string& arguments) const {
@@ -149,15 +142,7 @@ std::string ServiceProcess::tambloctlCommand(const std::string& arguments) const
 }
 
 CommandResult ServiceProcess::tambloctl(const std::string& arguments) const {
-    return run(tambloctlCommand(arguments) + " 2>&1");
-}
-
-std::string ServiceProcess::errorOutput() const {
-    return directory_.read("stderr");
-}
-
-bool ServiceProcess::awaitErrorOutput(std::string_view text) const {
-    return eventually([this, text] { return errorOutput().find(text) != std::string::npos; });
+    return run(tambloctlCommand(arguments));
 }
 
 std::size_t ServiceProcess::countEvents(std::string_view text) const {

@@ -33,9 +33,7 @@ TEST(Service, MessageOfAStartedSessionBecomesTwoEvents) {
     EXPECT_EQ(client.call(Method::getServiceNameForReporterID, 7)->result, Value(7));
     EXPECT_EQ(client.call(Method::getAllReporters)->result, Value(Array{7}));
 
-    wire::Request start = request(Method::startReportingSessionForID, 7);
-    start.id = 77;
-    client.send(start);
+    client.send(framesOf(request(Method::startReportingSessionForID, 7), 77));
     EXPECT_TRUE(client.staysSilent());
     const Dictionary payload{{"route name", "Speaker"}, {"level", 0.25F}, {"zrreporting_timestamp", 4e9}};
     const auto answered = client.call(message(payload, {7}, 0x08000004, 1));
@@ -65,15 +63,14 @@ TEST(Service, WhatIsAnsweredSurvivesAKill) {
     ServiceProcess service({.environment = {{"TAMBLO_LOG", "error"}}});
     std::string frames;
     for (int i = 0; i < 400; ++i) {
-        frames += framesOf(message({{"n", i}}), 1, 1);
+        frames += framesOf(message({{"n", i}}));
     }
     // One is answered, then ever more of those that follow at once, before the kill.
     for (const std::size_t awaited : {0, 1, 2, 3, 10, 30, 64, 100, 200, 400}) {
         const std::size_t before = service.countEvents("Playback.Start");
-        RawClient client(service.socketPath());
-        client.startSession();
+        Session client(service.socketPath());
         EXPECT_TRUE(client.call(message({{"n", 1}})));
-        client.sendBytes(frames);
+        client.send(frames);
         for (std::size_t i = 0; i < awaited; ++i) {
             ASSERT_TRUE(client.receive());
         }
@@ -88,9 +85,8 @@ TEST(Service, WhatIsAnsweredSurvivesAKill) {
 TEST(Service, EndsAsAskedTo) {
     ServiceProcess service;
     {
-        RawClient client(service.socketPath());
-        client.startSession();
-        client.send(message({{"last", true}}));
+        Session client(service.socketPath());
+        client.send(framesOf(message({{"last", true}})));
         EXPECT_EQ(service.stop(), 0);
         EXPECT_TRUE(client.isClosedByService());
     }
@@ -99,7 +95,7 @@ TEST(Service, EndsAsAskedTo) {
     EXPECT_EQ(service.countEvents("zrreportingclientuptime"), 1U);
 
     service.start();
-    RawClient(service.socketPath()).send(request(Method::killService));
+    RawClient(service.socketPath()).send(framesOf(request(Method::killService)));
     EXPECT_EQ(service.awaitEnd(), 2);
     EXPECT_THAT(service.errorOutput(), HasSubstr("DESTROYING SERVICE"));
     // The socket that the killed service left behind is replaced.
@@ -109,8 +105,7 @@ TEST(Service, EndsAsAskedTo) {
     // A second signal ends it at once, without a word about its clients.
     const auto leavers = [&service] { return service.countEvents("zrreportingclientuptime"); };
     EXPECT_TRUE(eventually([&] { return leavers() == 2; }));
-    RawClient client(service.socketPath());
-    client.startSession();
+    Session client(service.socketPath());
     for (const int signal : {SIGSTOP, SIGTERM, SIGINT, SIGCONT}) {
         service.signal(signal);
     }
@@ -120,32 +115,27 @@ TEST(Service, EndsAsAskedTo) {
 
 TEST(Service, WhatIsAnsweredAtItsEndIsInTheFile) {
     ServiceProcess service;
-    RawClient before(service.socketPath()), after(service.socketPath());
-    before.startSession(7);
-    after.startSession(8);
+    Session before(service.socketPath()), after(service.socketPath(), 8);
     ASSERT_TRUE(before.call(message({{"last", true}})));
+    constexpr std::uint64_t kLastID = 2'000'000;
     // Two more messages and the signal between them wait for the same wake-up.
     service.signal(SIGSTOP);
-    before.sendBytes(framesOf(message({{"last", true}, {"n", 2}}, {7}), 1, 2'000'000));
+    before.send(framesOf(message({{"last", true}, {"n", 2}}), kLastID));
     service.signal(SIGTERM);
-    after.sendBytes(framesOf(message({{"last", true}, {"n", 2}}, {8}), 1, 2'000'000));
+    after.send(framesOf(message({{"last", true}, {"n", 2}}, {8}), kLastID));
     service.signal(SIGCONT);
     EXPECT_EQ(service.awaitEnd(), 0);
-    const std::size_t answered = 1 + before.receiveAll(2'000'000) + after.receiveAll(2'000'000);
+    const std::size_t answered = 1 + before.receiveAll(kLastID) + after.receiveAll(kLastID);
     EXPECT_EQ(service.countEvents("\"last\":true"), 2 * answered);
 }
 
 TEST(Service, ClientThatLeavesIsReportedOnce) {
     ServiceProcess service;
     {
-        RawClient client(service.socketPath());
-        client.startSession();
-        client.send(message({{"n", 1}}));
+        Session client(service.socketPath());
         // What was sent before the end, within a frame, is answered to who still listens.
-        wire::Request reporters = request(Method::getAllReporters);
-        reporters.id = 5;
-        client.send(reporters);
-        client.sendBytes(std::string("\x40\x00\x00\x00\x84\x00\x05", 7));
+        EXPECT_TRUE(client.call(message({{"n", 1}})));
+        client.send(framesOf(request(Method::getAllReporters)) + std::string("\x40\0\0\0\x84\0\x05", 7));
         ::shutdown(client.descriptor(), SHUT_WR);
         EXPECT_EQ(client.receive()->result, Value(Array{7}));
         EXPECT_FALSE(client.receive());
@@ -261,13 +251,48 @@ TEST(Service, OfTwoThatStartAtOnceOneServes) {
     EXPECT_EQ(winner.stop(), 0);
 }
 
+TEST(Service, APreferenceThatCannotBeStoredLeavesItsFileWhole) {
+    constexpr rlim_t kRoom = 4096;
+    const std::string preferences =
+        R"({"TalvixInvalidXyBackOffSeconds":3600,"other":[")" + std::string(kRoom, 'x') + "\"]}\n";
+    ServiceProcess service({.isInternalBuild = true,
+                            .preferences = {{kCaptures, preferences}},
+                            .environment = {{"TAMBLO_LOG", "error"}},
+                            .fileSizeLimit = kRoom});
+    const auto file = service.preferenceFile(kCaptures);
+    /// How many drafts there are after five seconds of a fault.
+    const auto drafts = [&service] {
+        Session client(service.socketPath());
+        for (const double offset : {0.0, 5.1}) {
+            EXPECT_TRUE(client.call(
+                message({{"tvac_invalid_x", offset}, {"zrreporting_timestamp", 4e9 + offset}}, {7}, 14, 11)));
+        }
+        return linesOf(service.logs() / "bug-report-drafts.jsonl").size();
+    };
+    EXPECT_EQ(drafts(), 1U);
+    EXPECT_EQ(contentOf(file), preferences);
+    EXPECT_EQ(drafts(), 1U) << "the service itself knows";
+
+    // Once there is room, the time of a draft is the device's: another run of the service keeps to it.
+    service.stop();
+    service.start();
+    service.liftFileSizeLimit();
+    EXPECT_EQ(drafts(), 2U);
+    EXPECT_THAT(contentOf(file),
+                testing::ContainsRegex(R"(^\{"TalvixInvalidXyBackOffSeconds":3600,)"
+                                       R"("TalvixInvalidXyQLTlastRun":[0-9]{10}\.[0-9]+,"other":\[")"));
+    service.stop();
+    service.start();
+    EXPECT_EQ(drafts(), 2U);
+    EXPECT_EQ(entriesOf(file.parent_path()), 1) << "nothing is left over";
+}
+
 TEST(Service, SleepsWhenThereIsNothingToDo) {
     ServiceProcess service;
     {
-        RawClient client(service.socketPath());
-        client.startSession();
+        Session client(service.socketPath());
         client.call(message({{"n", 1}}));
-        EXPECT_TRUE(client.stopSession());
+        EXPECT_TRUE(client.stop());
     }
     const std::filesystem::path process = "/proc/" + std::to_string(service.pid());
     const auto wakeUps = [&process] {

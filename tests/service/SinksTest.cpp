@@ -1,8 +1,13 @@
+#include "base/Json.h"
 #include "tests/service/RawClient.h"
 #include "tests/service/ServiceProcess.h"
 
 #include <gmock/gmock.h>
+#include <nlohmann/json.hpp>
 
+#include <algorithm>
+#include <cstdio>
+#include <map>
 #include <string>
 #include <vector>
 
@@ -15,264 +20,274 @@
 namespace tamblo::test {
 namespace {
 
-using testing::ContainsRegex;
-
-enum class Due { withTheReply, soon, withTheStop, withTheEnd };
+enum class Due { withTheReply, soon, withTheStop, soonAfterTheStop, withTheEnd, withTheEndAfterSamples };
 
 struct Lines {
     /// A pattern of paths below the logs.
     std::string files;
     /// What they hold, as a regular expression; empty: nothing.
     std::string content;
-};
 
-struct Row {
-    const char* about;
-    /// 0: no session, so that the messages go to the single-message session.
-    std::uint16_t serviceType;
-    bool isInternalBuild;
-    std::vector<wire::Request> messages;
-    Due due;
-    std::vector<Lines> expected;
-    /// How long the session goes on: what is sampled takes its time.
-    useconds_t lasts = 0;
-};
-
-std::string contentOfAll(const std::filesystem::path& pattern) {
-    glob_t found{};
-    std::string content;
-    if (::glob(pattern.c_str(), 0, nullptr, &found) == 0) {
+    [[nodiscard]] bool areThere(const ServiceProcess& service) const {
+        const std::string found = contentIn(service);
+        return content.empty() ? found.empty() : testing::Matches(testing::ContainsRegex(content))(found);
+    }
+    [[nodiscard]] std::string contentIn(const ServiceProcess& service) const {
+        glob_t found{};
+        std::string text;
+        ::glob((service.logs() / files).c_str(), 0, nullptr, &found);
         for (std::size_t i = 0; i < found.gl_pathc; ++i) {
-            content += contentOf(found.gl_pathv[i]);
+            text += contentOf(found.gl_pathv[i]);
+        }
+        ::globfree(&found);
+        return text;
+    }
+};
+
+/// "CATEGORY/TYPE PAYLOAD"
+wire::Request parsed(const std::string& text, std::vector<std::int64_t> reporterIDs) {
+    unsigned category = 0;
+    unsigned short type = 0;
+    std::sscanf(text.c_str(), "%u/%hu", &category, &type);
+    const auto payload = readJson(std::string_view(text).substr(text.find(' ') + 1));
+    return message(std::get<Value>(payload).dictionaryValue(), std::move(reporterIDs), category, type);
+}
+
+/// The initials of the operations in the call-quality file, by session and, by "", of all.
+std::map<std::string, std::string> callQualityOf(const ServiceProcess& service) {
+    std::map<std::string, std::string> operations;
+    for (const std::string& text : linesOf(service.logs() / "call-quality.jsonl")) {
+        const auto line = nlohmann::json::parse(text);
+        for (const std::string& session : {line["session"].get<std::string>(), std::string()}) {
+            operations[session] += line["op"].get<std::string>().front();
         }
     }
-    ::globfree(&found);
-    return content;
+    return operations;
 }
 
-bool isThere(const ServiceProcess& service, const Lines& lines) {
-    const std::string content = contentOfAll(service.logs() / lines.files);
-    return lines.content.empty() ? content.empty() : testing::Matches(ContainsRegex(lines.content))(content);
-}
-
-void expect(const Row& row) {
-    SCOPED_TRACE(row.about);
-    ServiceProcess service(
-        {.isInternalBuild = row.isInternalBuild,
-         .preferences = {{kCaptures, R"({"enable_stackburst": true, "TalvixInvalidXyBackOffSeconds": 9})"}},
-         .environment = {{"TAMBLO_LOG", "info"}}});
-    RawClient client(service.socketPath());
-    if (row.serviceType != 0) {
-        client.startSession(7, row.serviceType);
+class Sinks : public testing::Test {
+protected:
+    /// That these lines come of the messages, no earlier than they are due. Without a service type the
+    /// messages go to no session.
+    static void expect(const std::string& build, std::uint16_t serviceType,
+                       const std::vector<std::string>& messages, Due due,
+                       const std::vector<Lines>& expected) {
+        SCOPED_TRACE(messages.back());
+        ServiceProcess service(
+            {.isInternalBuild = build == "internal",
+             .preferences = {{kCaptures,
+                              R"({"enable_stackburst": true, "TalvixInvalidXyBackOffSeconds": 9})"}},
+             .environment = {{"TAMBLO_LOG", "info"}}});
+        Session client(service.socketPath(), 7, serviceType);
+        if (serviceType == 0) {
+            client.stop();
+        }
         wire::Request configuration = request(Method::setConfiguration, 7);
         configuration.dictionary = {{"HostApplicationDisplayID", "../com.example/game"}};
         client.call(configuration);
-    }
-    const auto expectNothingYet = [&] {
-        for (const Lines& lines : row.expected) {
-            EXPECT_TRUE(lines.content.empty() || !isThere(service, lines)) << lines.files << " is too early";
+        const auto isEarly = [&service](const Lines& lines) {
+            return !lines.content.empty() && lines.areThere(service);
+        };
+        for (const std::string& text : messages) {
+            EXPECT_TRUE(std::ranges::none_of(expected, isEarly));
+            ASSERT_TRUE(client.call(parsed(text, std::vector<std::int64_t>(serviceType == 0 ? 0 : 1, 7))));
         }
-    };
-    for (wire::Request next : row.messages) {
-        expectNothingYet();
-        if (row.serviceType == 0) {
-            next.reporterIDs.clear();
+        if (due == Due::withTheEndAfterSamples) {
+            ::usleep(350'000);
         }
-        ASSERT_TRUE(client.call(next));
+        if (due != Due::withTheReply && due != Due::soon) {
+            EXPECT_TRUE(std::ranges::none_of(expected, isEarly));
+            EXPECT_TRUE(due < Due::withTheEnd ? client.stop() : service.stop() == 0);
+        }
+        const bool mayTakeAWhile = due == Due::soon || due == Due::soonAfterTheStop;
+        for (const Lines& lines : expected) {
+            const auto areThere = [&] { return lines.areThere(service); };
+            EXPECT_TRUE(mayTakeAWhile ? eventually(areThere) : areThere())
+                << lines.files << "\n"
+                << lines.contentIn(service) << service.errorOutput();
+        }
     }
-    ::usleep(row.lasts);
-    if (row.due == Due::withTheStop) {
-        expectNothingYet();
-        EXPECT_TRUE(client.stopSession());
-    } else if (row.due == Due::withTheEnd) {
-        expectNothingYet();
-        EXPECT_EQ(service.stop(), 0);
-    }
-    for (const Lines& lines : row.expected) {
-        EXPECT_TRUE(row.due == Due::soon ? eventually([&] { return isThere(service, lines); })
-                                         : isThere(service, lines))
-            << lines.files << "\n"
-            << contentOfAll(service.logs() / lines.files) << service.errorOutput();
-    }
-}
 
-TEST(Sinks, LinesComeOutOfTheService) {
     const std::string time = R"(\{"time":[0-9]{10}\.[0-9]+,)";
-    const std::string power = time + R"("subsystem":28,"event":)";
-    const std::string client = std::to_string(::getpid());
-    const std::string capture = R"("session":"[0-9]{8}T[0-9]{6}\.[0-9]{3}Z-[0-9a-f]{8}")";
-    const std::string reports = "DiagnosticLogs/Audio/Reporting/";
-    const auto draft = [](double offset) {
-        return message({{"tvac_invalid_x", offset}, {"zrreporting_timestamp", 4e9 + offset}}, {7}, 14, 11);
+    const std::string me = std::to_string(::getpid());
+    const std::string reports = "DiagnosticLogs/Audio/Reporting/*.json";
+    const std::string traces = "DiagnosticLogs/Audio/Performance/*.json";
+};
+
+TEST_F(Sinks, LinesStandInTheFilesWhenTheReplyIsThere) {
+    expect("", 2, {R"(4/8 {"EngineOnTime": 2.5, "EngineState": "EngineOn", "zrreporting_timestamp": 4e9,
+                    "Haptic_Active_Hardware_Time_Seconds": 90})"},
+           Due::withTheReply,
+           {{"power-events.jsonl",
+             "^" + time + R"("subsystem":28,"event":"Korvell_Haptics_EngineOnDuration","payload":)" +
+                 R"(\{"ApplicationName":"\.\./com\.example/game","EngineOnDuration":2\.5,)" +
+                 R"("TimestampEnd":4000000000\.0\}\})" + "\n.*ClientStatus.*\n.*LeakedHaptics.*\n$"}});
+    expect("", 0, {R"(4/8 {"EngineOnTime": 1})"}, Due::withTheReply,
+           {{"power-events.jsonl", R"("payload":\{"EngineOnDuration":1,"TimestampEnd":)"},
+            {"../stderr", "failed to get app name for joulery"}});
+    expect(
+        "", 2,
+        {R"(4/7 {"issue_type": 3, "node": "n", "rtaid_client": "com", "any_channel_silence_seconds": 2.9})"},
+        Due::withTheReply,
+        {{"diagnostics-metrics.jsonl",
+          "^" + time + R"("metric":5963779,"record":"EAIaATMiAW4qA2NvbQ=="\})" + "\n$"}});
+    expect("", 0, {R"(4/7 {"node": 1})"}, Due::withTheReply,
+           {{"diagnostics-metrics.jsonl", R"("record":"EAAaACIBMSoA"\})"},
+            {"../stderr", "Failed to get issue_type for AudioIssueDetected"}});
+    expect("internal", 2,
+           {R"(14/11 {"tvac_invalid_x": 0, "zrreporting_timestamp": 4000000000.0})",
+            R"(14/11 {"tvac_invalid_x": 5, "zrreporting_timestamp": 4000000005.0})",
+            R"(14/11 {"tvac_invalid_x": 6, "zrreporting_timestamp": 4000000005.1})"},
+           Due::withTheReply,
+           {{"bug-report-drafts.jsonl", "^" + time + R"("process":"tamblo_service_","reason":"a Talvix .*)" +
+                                            R"("reproducibility":6,.*\}\})" + "\n$"},
+            {"../stderr", "Successfully created draft"}});
+}
+
+TEST_F(Sinks, CapturesFollowAsSoonAsTheyAreGathered) {
+    const std::string name = R"("session":"[0-9]{8}T[0-9]{6}\.[0-9]{3}Z-[0-9a-f]{8}")";
+    expect("internal", 13, {R"(4/8 {"System_Sound_Stuck_Time_Seconds": 20})"}, Due::soon,
+           {{"bug-captures.jsonl", "^" + time + R"("op":"snapshot",)" + name +
+                                       R"(,"signature":\{"domain":"Tonmetry","type":"systemsounds",.*\})" +
+                                       "\n$"},
+            {"captures/*/capture.json", name},
+            {"captures/*/log.txt", "<6>zrrs "},
+            {"captures/*/system.txt", "MemTotal:"},
+            {"captures/*/process-" + me + ".txt", "== threads\n.*== status\n.*VmRSS:"}});
+    const std::vector<std::string> alarms{R"(11/7 {"issue_type": "LowRMS"})",
+                                          R"(11/7 {"issue_type": "LowRMS", "n": 1})",
+                                          R"(11/7 {"issue_type": "LowRMS", "n": 2})"};
+    expect("internal", 4, alarms, Due::withTheReply,
+           {{"bug-captures.jsonl", R"("op":"start",.*"duration":60\.0,"payload":\{\}\})"}});
+    expect("internal", 4, alarms, Due::withTheEnd,
+           {{"bug-captures.jsonl", "\n" + time + R"("op":"cancel",)" + name + "\\}\n$"}});
+    const std::string parent = std::to_string(::getppid());
+    expect("", 2, {R"(4/19 {"processIDs": [)" + parent + ", -1]}"}, Due::soon,
+           {{"memory-log.jsonl", "^" + time + R"("reporter":7,"processes":\[\{"process":)" + me +
+                                     R"(,.*\},\{"process":)" + parent +
+                                     R"(,.*"resident":[0-9]{6,}.*"kernel":\{.*"slab":[0-9]{6,})"}});
+    expect("internal", 2,
+           {R"(7/6 {"smallest_buffer_frame_size": 511})", R"(7/6 {"smallest_buffer_frame_size": 512})"},
+           Due::withTheEnd,
+           {{"stack-captures.jsonl",
+             "^" + time + R"("requester":"com\.vandra\.tamblo",.*"options":\[1,1,0,0,0\],"stacks":\[)" +
+                 R"(\{"process":)" + me + R"(,.*"threads":\[\{"thread":)" + me +
+                 R"(,.*"samples":\[\{.*"count":[1-5])"}});
+}
+
+TEST_F(Sinks, CallQualityIsWrittenByAQueueOfItsOwn) {
+    const std::string first = R"(14/65535 {"volume": 3, "zrreporting_timestamp": 4e9})";
+    const auto line = [this](const std::string& operation, const std::string& rest) {
+        return time + "\"op\":\"" + operation + R"(","session":"[0-9a-f]{16}\.1")" + rest + "\\}\n";
     };
-    const auto issue = [](Dictionary payload) { return message(std::move(payload), {7}, 11, 7); };
-    const Dictionary level{{"level", 0.1F}, {"list", Array{1, 2.0, false}}};
-    for (const Row& row : std::vector<Row>{
-             {"power",
-              2,
-              false,
-              {message({{"EngineOnTime", 2.5F},
-                        {"EngineState", "EngineOn"},
-                        {"Haptic_Active_Hardware_Time_Seconds", 90},
-                        {"zrreporting_timestamp", 4e9}},
-                       {7}, 4, 8)},
-              Due::withTheReply,
-              {{"power-events.jsonl",
-                "^" + power + R"("Korvell_Haptics_EngineOnDuration","payload":\{"ApplicationName":)" +
-                    R"("\.\./com\.example/game","EngineOnDuration":2\.5,"TimestampEnd":4000000000\.0\}\})" +
-                    "\n" + power + R"("Korvell_Haptics_ClientStatus".*)" + "\n" + power +
-                    R"("LeakedHapticsSessionInfo","payload":\{"Haptic_Active_Hardware_Time_Seconds":90\}\})" +
-                    "\n$"}}},
-             {"power of no session",
-              0,
-              false,
-              {message({{"EngineOnTime", 1}}, {}, 4, 8)},
-              Due::withTheReply,
-              {{"power-events.jsonl", R"("payload":\{"EngineOnDuration":1,"TimestampEnd":)"},
-               {"../stderr", "failed to get app name for joulery"}}},
-             {"metrics",
-              2,
-              false,
-              {issue({{"issue_type", 3},
-                      {"node", "n"},
-                      {"rtaid_client", "com"},
-                      {"any_channel_silence_seconds", 2.9}})},
-              Due::withTheReply,
-              {{"diagnostics-metrics.jsonl",
-                "^" + time + R"("metric":5963779,"record":"EAIaATMiAW4qA2NvbQ=="\})" + "\n$"}}},
-             {"metrics of no session",
-              0,
-              false,
-              {issue({{"node", 1}})},
-              Due::withTheReply,
-              {{"diagnostics-metrics.jsonl", R"("record":"EAAaACIBMSoA"\})"
-                                             "\n$"},
-               {"../stderr", "Failed to get issue_type for AudioIssueDetected"}}},
-             {"drafts",
-              2,
-              true,
-              {draft(0.0), draft(5.0), draft(5.1)},
-              Due::withTheReply,
-              {{"bug-report-drafts.jsonl",
-                "^" + time +
-                    R"("process":"tamblo_service_","reason":"a Talvix .*"reproducibility":6,.*\}\})" + "\n$"},
-               {"../stderr", "Successfully created draft"}}},
-             {"a system sound that is stuck",
-              13,
-              true,
-              {message({{"System_Sound_Stuck_Time_Seconds", 20}}, {7}, 4, 8)},
-              Due::soon,
-              {{"bug-captures.jsonl", "^" + time + R"("op":"snapshot",)" + capture +
-                                          R"(,"signature":\{"domain":"Tonmetry","type":"systemsounds",.*\})" +
-                                          "\n$"},
-               {"captures/*/capture.json", capture},
-               {"captures/*/log.txt", "<6>zrrs "},
-               {"captures/*/system.txt", "MemTotal:"},
-               {"captures/*/process-" + client + ".txt", "== threads\n.*== status\n.*VmRSS:"}}},
-             {"an alarm, and the session that goes on until the end",
-              4,
-              true,
-              {issue({{"issue_type", "LowRMS"}}), issue({{"issue_type", "LowRMS"}, {"n", 1}}),
-               issue({{"issue_type", "LowRMS"}, {"n", 2}})},
-              Due::withTheReply,
-              {{"bug-captures.jsonl", R"("op":"start",.*"duration":60\.0,"payload":\{\}\})"
-                                      "\n$"}}},
-             {"an alarm that ends with the service",
-              4,
-              true,
-              {issue({{"issue_type", "LowRMS"}}), issue({{"issue_type", "LowRMS"}, {"n", 1}}),
-               issue({{"issue_type", "LowRMS"}, {"n", 2}})},
-              Due::withTheEnd,
-              {{"bug-captures.jsonl", "\n" + time + R"("op":"cancel",)" + capture + "\\}\n$"}}},
-             {"memory of the client and of whom the payload names",
-              2,
-              false,
-              {message({{"processIDs", Array{::getppid(), -1}}}, {7}, 4, 19)},
-              Due::soon,
-              {{"memory-log.jsonl", "^" + time + R"("reporter":7,"processes":\[\{"process":)" + client +
-                                        R"(,.*\},\{"process":)" + std::to_string(::getppid()) +
-                                        R"(,.*"resident":[0-9]{6,}.*"kernel":\{.*"slab":[0-9]{6,})"}}},
-             {"stacks of the clients, and nothing of a small buffer",
-              2,
-              true,
-              {message({{"smallest_buffer_frame_size", 511}}, {7}, 7, 6),
-               message({{"smallest_buffer_frame_size", 512}}, {7}, 7, 6)},
-              Due::withTheEnd,
-              {{"stack-captures.jsonl",
-                "^" + time + R"("requester":"com\.vandra\.tamblo",.*"options":\[1,1,0,0,0\],"stacks":\[)" +
-                    R"(\{"process":)" + client + R"(,.*"threads":\[\{"thread":)" + client +
-                    R"(,.*"samples":\[\{.*"count":[1-5])"}}},
-             {"a summary of the session's values",
-              2,
-              false,
-              {message({{"volume", 3}}), message({{"volume", 5}})},
-              Due::withTheStop,
-              {{"analytics-events.jsonl",
-                R"("event":"com\.vandra\.telephony\.Session_Generic\.Summary",.*"num_messages":2,)"},
-               {reports + "*.json", ""}}},
-             {"a file of a session for tests",
-              11,
-              false,
-              {message(level), message(level), message({{"level", 1}})},
-              Due::withTheStop,
-              {{reports + "[0-9]*-[0-9]*-7-.._com.example_game-test.json",
-                R"(Setup_Start_1.*Playback_Start_2.*Session_Generic_Summary_1)"}}},
-             {"samples of the processes, of a session that ends with the service",
-              2,
-              true,
-              {message({{"session_output_running", true}})},
-              Due::withTheEnd,
-              {{"DiagnosticLogs/Audio/Performance/*.json",
-                R"("name":"session","pid":)" + client + R"(.*"name":"output","pid":)" + client + ","},
-               {"DiagnosticLogs/Audio/Performance/*.json", R"("name":"memory .bytes.","pid":)" + client},
-               {"DiagnosticLogs/Audio/Performance/*.json", R"("name":"processor time .% of a core.",)"}},
-              350'000},
-             {"a file of any session",
-              2,
-              true,
-              {message({{"n", 1}})},
-              Due::withTheStop,
-              {{reports + "*.json", "\"Playback_Start_1\""}}},
-         }) {
-        expect(row);
+    const std::string withFirst =
+        "^" +
+        line("open", R"(,"sessionInfo":\{"BatchEvent":false,"ClientType":19,"ClientVersion":2\.1,)"
+                     R"("ContainsRealtimeEvents":true,"HierarchyToken":"[^"]+","SessionID":7\},)"
+                     R"("userInfo":\{"ClientName":"com\.vandra\.tamblo",.*)"
+                     R"("ServiceName":"apiusage_session","ZRReportingSessionID":7\})") +
+        line("message", R"(,"category":14,"type":65535,"payload":\{.*"volume":3\})");
+    expect("", 12, {first}, Due::soon, {{"call-quality.jsonl", withFirst + "$"}});
+    // The summary is in the order of the messages' times.
+    expect(
+        "", 12, {first, R"(14/65535 {"volume": 5})"}, Due::soonAfterTheStop,
+        {{"call-quality.jsonl", withFirst + line("message", R"(,"category":14,.*"volume":5\})") +
+                                    line("message", R"(,"category":1,"type":11,.*)") +
+                                    line("message", R"(,"category":65535,"type":65535,.*"volume":"5,3".*)") +
+                                    line("flush", "") + "$"}});
+}
+
+TEST_F(Sinks, BackEndsOfCallQualityAreAPreference) {
+    const struct {
+        const char* preference;
+        std::string operations;
+        const char* error;
+    } cases[] = {
+        {R"({"backends": []})", "o", nullptr},
+        {R"({"backends": ["a", "b"]})", "ommmf", nullptr},
+        {R"({"backends": 5})", "o", "backends is no array; no back end is found"},
+        {R"({"backends": [5]})", "o", "backends holds what is no name; that is ignored"},
+        {"{}", "ommmf", nullptr},
+    };
+    ServiceProcess service;
+    std::string expected;
+    for (const auto& row : cases) {
+        writeFile(service.preferenceFile("com.vandra.tamblo.callquality"), row.preference);
+        // Two sessions: what is wrong is told once.
+        for (int i = 0; i < 2; ++i) {
+            Session client(service.socketPath());
+            client.call(message({{"n", 1}}));
+            EXPECT_TRUE(client.stop());
+            expected += row.operations;
+            EXPECT_TRUE(eventually([&] { return callQualityOf(service)[""] == expected; })) << row.preference;
+        }
+        EXPECT_TRUE(row.error == nullptr || countOf(row.error, service.errorOutput()) == 1U) << row.error;
     }
 }
 
-TEST(Sinks, ASessionIsToldWhatItsTimeHasAddedToTheDrivers) {
+TEST_F(Sinks, OfManySessionsNothingIsLostAtTheEndAndTheyShareFewThreads) {
+    ServiceProcess service({.environment = {{"TAMBLO_LOG", "error"}}});
+    constexpr std::size_t kSessions = 300;
+    Session client(service.socketPath(), kSessions);
+    for (std::size_t i = 1; i < kSessions; ++i) {
+        client.start(static_cast<std::int64_t>(i));
+    }
+    EXPECT_LE(entriesOf("/proc/" + std::to_string(service.pid()) + "/task"), 20);
+    // To every session; then the end, at once.
+    client.call(message({{"n", 1}}, {}));
+    client.call(message({{"n", 2}}, {}));
+    EXPECT_EQ(service.stop(), 0);
+    auto operations = callQualityOf(service);
+    operations.erase("");
+    EXPECT_EQ(operations.size(), kSessions);
+    EXPECT_THAT(operations, testing::Each(testing::Pair(testing::_, "ommmmf")));
+    // Another run draws other names.
+    service.start();
+    EXPECT_TRUE(Session(service.socketPath()).stop());
+    EXPECT_EQ(service.stop(), 0);
+    EXPECT_EQ(callQualityOf(service).size(), 1 + kSessions + 1);
+}
+
+TEST_F(Sinks, WhatASessionLeavesIsThereWhenItsStopIsAnswered) {
+    const std::string playback = R"(4/1 {"level": 0.5})";
+    expect("", 2, {playback, R"(4/1 {"level": 1})"}, Due::withTheStop,
+           {{"analytics-events.jsonl",
+             R"("event":"com\.vandra\.telephony\.Session_Generic\.Summary",.*"num_messages":2,)"},
+            {reports, ""},
+            {traces, ""}});
+    expect("", 11, {playback, playback, R"(4/1 {"level": 1})"}, Due::withTheStop,
+           {{"DiagnosticLogs/Audio/Reporting/[0-9]*-[0-9]*-7-.._com.example_game-test.json",
+             "Setup_Start_1.*Playback_Start_2.*Session_Generic_Summary_1"}});
+    expect("internal", 2, {playback}, Due::withTheStop, {{reports, "\"Playback_Start_1\""}});
+    expect("internal", 2, {R"(4/1 {"session_output_running": true})"}, Due::withTheEndAfterSamples,
+           {{traces, R"("name":"session","pid":)" + me + R"(.*"name":"output","pid":)" + me + ","},
+            {traces, R"("name":"memory .bytes.","pid":)" + me},
+            {traces, R"("name":"processor time .% of a core.",)"}});
+}
+
+TEST_F(Sinks, ASessionIsToldWhatItsTimeHasAddedToTheDrivers) {
     ServiceProcess service;
-    const std::filesystem::path directory = service.runtimeDirectory() + "/chanlog";
-    writeFile(directory / "broken.json", R"([{"driver": "HapticEngine", "gro)");
-    const auto publish = [&directory](int count) {
-        const std::string n = std::to_string(count);
-        const std::string names =
-            R"("driver": "Haptic_Engine<0>", "group": "Haptics", "subgroup": "Stats", )";
-        writeFile(directory / "haptics.json.new",
-                  "[{" + names + R"("name": "buffers played", "format": "simple", "value": )" + n + "}, {" +
-                      names + R"("name": "state", "format": "state", "states": [)" +
-                      R"({"name": "idle", "transitions": 1, "residency": )" + n + R"(},)" +
-                      R"({"name": "running", "transitions": 1, "residency": 7}]}, {)" + names +
-                      R"("name": "wake_up", "unit": "us", "format": "histogram", "min": 12, "max": 381,)" +
-                      R"("buckets": [{"lower": 0, "upper": 100, "hits": )" + n + "}]}]");
-        std::filesystem::rename(directory / "haptics.json.new", directory / "haptics.json");
+    const std::filesystem::path file = service.runtimeDirectory() + "/chanlog/haptics.json";
+    writeFile(file.parent_path() / "broken.json", R"([{"driver": "HapticEngine", "gro)");
+    const std::string channel = R"({"driver": "Haptic_Engine<0>", "group": "Haptics", "subgroup": "Stats", )";
+    const auto publish = [&](const std::string& n) {
+        writeFile(file.string() + ".new",
+                  "[" + channel + R"("name": "buffers played", "format": "simple", "value": )" + n + "}," +
+                      channel + R"("name": "state", "format": "state", "states": )" +
+                      R"([{"name": "idle", "transitions": 1, "residency": )" + n + "}]}]");
+        std::filesystem::rename(file.string() + ".new", file);
     };
-    publish(10);
-    for (const int later : {10, 15, 2}) { // nothing, something, a driver that begins anew
-        RawClient client(service.socketPath());
-        client.startSession();
+    publish("10");
+    for (const char* later : {"10", "15", "2"}) { // nothing, something, a driver that begins anew
+        Session client(service.socketPath());
         publish(later);
-        EXPECT_TRUE(client.stopSession());
+        EXPECT_TRUE(client.stop());
     }
-    for (const char* told : {R"("HapticEngine_Haptics_Stats_Simple_buffersplayed":5,)",
-                             R"("HapticEngine_Haptics_Stats_Histogram_wakeup":)"
-                             R"("count=1,lower=0,upper=100,min=12,max=381,unit=us::0-100:5",)",
-                             R"("HapticEngine_Haptics_Stats_State_state":)"
-                             R"("name:idle,transition:0,residency:5,duty_cycle:1.000000;",)"}) {
-        EXPECT_EQ(service.countEvents(told), 2U) << told;
-    }
-    EXPECT_EQ(service.countEvents("HapticEngine"), 6U) << "and nothing else";
-    for (const char* line :
-         {"broken.json: line 1, column ", "Haptic_Engine<0>/Haptics/Stats/state: a counter has run backwards",
-          "Haptic_Engine<0>/Haptics/Stats/wake_up: a counter has run backwards"}) {
+    EXPECT_EQ(service.countEvents(R"("HapticEngine_Haptics_Stats_Simple_buffersplayed":5,)"), 2U);
+    EXPECT_EQ(
+        service.countEvents(R"("HapticEngine_Haptics_Stats_State_state":"name:idle,transition:0,resid)"), 2U);
+    EXPECT_EQ(service.countEvents("HapticEngine"), 4U) << "and nothing else";
+    for (const char* line : {"broken.json: line 1, column ", "Stats/state: a counter has run backwards"}) {
         EXPECT_EQ(countOf(line, service.errorOutput()), 1U) << line;
     }
 }
