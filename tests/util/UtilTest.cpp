@@ -1,0 +1,200 @@
+#include "base/BoundedCache.h"
+#include "tests/fakes/FakePlatform.h"
+#include "util/AudioEvents.h"
+#include "util/ConditionWait.h"
+#include "util/DataSerialize.h"
+#include "util/Log.h"
+#include "util/NumberBuckets.h"
+#include "util/ReportingUtilities.h"
+
+#include <gmock/gmock.h>
+
+#include <limits>
+#include <thread>
+#include <vector>
+
+namespace tamblo {
+namespace {
+
+/// The names of the numbers from 0 on, and of some more.
+template <typename Number, typename Name>
+std::string named(Number count, std::initializer_list<Number> others, Name name) {
+    std::string names;
+    for (Number number = 0; number < count; ++number) {
+        names += std::string(name(number)) + " ";
+    }
+    for (const Number number : others) {
+        names += std::string(name(number)) + " ";
+    }
+    return names;
+}
+
+TEST(VocabularyTest, NamesOfNumbers) {
+    EXPECT_EQ(named<AudioEventCategory>(19,
+                                        {0xFFFF, 0xFFFFFFFF, 0x04000006, 0x08000004, 0x10000003, 0x2000000B,
+                                         0x40000010, 0x80000011, 0x00030001, 0x0C000001, 0x0800FFFF},
+                                        ZRReportingUtilityCategoryString),
+              "Undefined Generic Record Input Playback Output PlaybackAndRecord IO Setup ClientRequest "
+              "RouteChange Error Chanlog Performance Volume Kaleen HearingHealth Wirrels Undefined "
+              "Undefined Undefined MIDI_PlaybackAndRecord Session_Playback DSP_Input HAL_Error "
+              "Routing_HearingHealth Toolbox_Wirrels _Generic _Generic Session_Undefined ");
+    EXPECT_EQ(named<AudioEventType>(21, {65534, 65535}, ZRReportingUtilityTypeString),
+              "Generic Start Stop Activate Deactivate Setup Error IssueDetector Joulery AudioUnitUsage "
+              "MIDIDriver Summary HeadphoneAudioExposure AudioExposure Listeningenhancement Pulsedeck Simple "
+              "Histogram State MemoryLog Generic Generic Unknown ");
+    EXPECT_EQ(
+        named<AudioServiceType>(15, {65535}, ZRReportingUtilityGenerateServiceNameFromServiceType),
+        "generic velka telephony haptics alarms standalone soundautoconfig longformaudio nonlongformaudio "
+        "audiodeviceusage alerts test apiusage systemsounds unknown unknown ");
+}
+
+TEST(VocabularyTest, NumbersOfNames) {
+    for (AudioEventCategory kind = 1; kind <= 16; ++kind) {
+        EXPECT_EQ(ZRReportingUtilityCategoryFromString(ZRReportingUtilityCategoryString(kind)), kind);
+    }
+    for (const char* name : {"Unknown", "Wirrels", "Undefined", "Session_Playback", "volume", ""}) {
+        EXPECT_EQ(ZRReportingUtilityCategoryFromString(name), AudioEventCategoryUnknown) << name;
+    }
+    for (AudioEventType type = 0; type <= 18; ++type) {
+        EXPECT_EQ(ZRReportingUtilityTypeFromString(ZRReportingUtilityTypeString(type)), type);
+    }
+    EXPECT_EQ(ZRReportingUtilityTypeFromString("Unknown"), 65535);
+    EXPECT_EQ(ZRReportingUtilityTypeFromString("MemoryLog"), 0);
+    for (AudioServiceType type = 0; type < 14; ++type) {
+        const auto name = ZRReportingUtilityGenerateServiceNameFromServiceType(type);
+        EXPECT_EQ(ZRReportingUtilityGenerateServiceTypeFromServiceName(name), type);
+    }
+    EXPECT_EQ(ZRReportingUtilityGenerateServiceTypeFromServiceName("Telephony"), 65535);
+    EXPECT_EQ(ZRReportingUtilityRetrieveAppName({}).stringValue(), "Unknown");
+}
+
+struct Costly {
+    int* written;
+};
+void appendText(std::string& out, const Costly& costly) {
+    ++*costly.written;
+    out += "costly";
+}
+
+TEST(LogTest, LinesHaveAPrefixAndTextOnlyWhenOn) {
+    FakePlatform device(LogLevel::info);
+    int written = 0;
+    log::debug(ZRReportingJouleryCategory(), "{}", Costly{&written});
+    EXPECT_EQ(written, 0);
+    log::info(ZRReportingJouleryCategory(), "{} of {}: {} {}", Costly{&written}, Value("text"), Value(7),
+              true);
+    log::fault(ZRReportingQMXLogCategory(), "{}", Dictionary{{"a", Dictionary{{"b", 0.5}}}});
+    const auto lines = device.log.lines();
+    ASSERT_EQ(lines.size(), 2U);
+    EXPECT_THAT(lines[0].prefix, testing::MatchesRegex("                 UtilTest:[0-9]+ +"));
+    EXPECT_EQ(lines[0].prefix.size(), 32U);
+    EXPECT_EQ(lines[0].category + " " + lines[0].text, "zrrp costly of text: 7 1");
+    EXPECT_EQ(lines[1].category + " " + lines[1].text, "zrra {\"a\":{\"b\":0.5}}");
+    EXPECT_EQ(lines[1].level, LogLevel::fault);
+}
+
+TEST(UtilitiesTest, NearestBucket) {
+    const struct {
+        double value;
+        std::vector<double> buckets;
+        unsigned digits;
+        const char* text;
+    } cases[] = {
+        {3, {1, 2, 4, 8}, 0, "4"}, {2.9, {1, 2, 4, 8}, 0, "2"}, {-5, {10, 20}, 0, "10"},
+        {3, {3}, 2, "3.0"},        {3, {3.256}, 2, "3.26"},     {1, {5, 9, 1}, 0, "5"},
+        {0, {-2.25}, 1, "-2.2"},   {0, {1e6}, 1, "1000000.0"},
+    };
+    for (const auto& c : cases) {
+        EXPECT_EQ(ZRReportingUtilityBucketNumberToString(c.value, c.buckets, c.digits), c.text) << c.value;
+    }
+    EXPECT_EQ(ZRReportingUtilityBucketNumberToString(1, {}, 0), std::nullopt);
+}
+
+TEST(UtilitiesTest, ChangesRoundingAndDates) {
+    const Dictionary first{{"same", 1}, {"changed", 1}, {"gone", 1}};
+    const Dictionary second{{"same", 1.0}, {"changed", "1"}};
+    EXPECT_FALSE(ZRReportingUtilityKeyIsPresentAndHasChanged("same", &first, &second));
+    EXPECT_TRUE(ZRReportingUtilityKeyIsPresentAndHasChanged("changed", &first, &second));
+    EXPECT_FALSE(ZRReportingUtilityKeyIsPresentAndHasChanged("gone", &first, &second));
+    EXPECT_FALSE(ZRReportingUtilityKeyIsPresentAndHasChanged("changed", nullptr, &second));
+    EXPECT_EQ(ZRReportingUtilityRoundWithPlaces(-2.5, 0), -3);
+    EXPECT_EQ(ZRReportingUtilityRoundWithPlaces(1234, -2), 1200);
+    EXPECT_EQ(ZRReportingUtilityRoundWithPlaces(0.126, 2), 0.13);
+
+    FakePlatform device;
+    device.processInformation.uptime = std::chrono::duration<double>(1234.5);
+    device.processInformation.consumed = std::chrono::microseconds(123'456'789'012);
+    const Dictionary expected{{"a", 1},
+                              {"zrreporting_timestamp", device.clock.seconds()},
+                              {"systemuptime_sec", 1235},
+                              {"processuptime_ms", 123'456'792}}; // in single precision
+    EXPECT_EQ(ZRReportingUtilityAddDates({{"a", 1}, {"systemuptime_sec", "old"}}), expected);
+    device.processInformation.uptime = std::chrono::duration<double>(1e12);
+    EXPECT_EQ(ZRReportingUtilityAddDates({}).find("systemuptime_sec")->integerValue(), 2147483647);
+}
+
+TEST(BoundedCacheTest, KeysThatDifferInAnyBitsAreRememberedTogether) {
+    for (unsigned shift = 0; shift <= 56; shift += 4) {
+        BoundedCache<std::uint64_t> cache;
+        int built = 0;
+        for (int round = 0; round < 2; ++round) {
+            for (std::uint64_t key = 1; key <= 16; ++key) {
+                EXPECT_EQ(cache.get(key << shift, [&] { return ++built, key; }), key);
+            }
+        }
+        EXPECT_EQ(built, 16) << "shifted by " << shift;
+    }
+}
+
+TEST(ConditionWaitTest, SignalledAndTimedOut) {
+    FakePlatform device;
+    const LogCategory& category = ZRReportingSessionLinkmeterCategory();
+    ConditionLock lock;
+    bool flag = false;
+    EXPECT_FALSE(ZRReportingUtilityWait(lock, std::chrono::seconds(0), flag, "waiting", "timeout", category));
+    EXPECT_THAT(device.log.texts(), testing::ElementsAre("waiting", "timeout"));
+    std::thread signaller([&] {
+        while (device.log.count("waiting") < 3) {
+            std::this_thread::yield();
+            lock.condition.notify_one(); // a wake-up that means nothing
+        }
+        ZRReportingUtilitySignal(lock, flag);
+    });
+    EXPECT_TRUE(
+        ZRReportingUtilityWait(lock, std::chrono::hours(1'000'000), flag, "waiting", "timeout", category));
+    signaller.join();
+    EXPECT_EQ(device.log.texts().back(), "continuing");
+}
+
+TEST(DataSerializeTest, EveryKindOfValue) {
+    const std::uint8_t bytes[] = {0, 1, 255};
+    const Dictionary list{{"array", Array{true, false, Array{}, Dictionary{}}},
+                          {"data", Value::data(bytes)},
+                          {"date", Value::date(1772366400.75)},
+                          {"infinite", -std::numeric_limits<double>::infinity()},
+                          {"int", -5},
+                          {"k<&>", "a\r\n\"b\" é"},
+                          {"single", 0.1F},
+                          {"unsigned", std::numeric_limits<std::uint64_t>::max()}};
+    const std::string expected = "<?xml version=\"1.0\" encoding=\"UTF-8\"?>\n<!DOCTYPE plist>\n"
+                                 "<plist version=\"1.0\">\n<dict>\n"
+                                 "\t<key>array</key>\n\t<array>\n\t\t<true/>\n\t\t<false/>\n\t\t<array/>\n"
+                                 "\t\t<dict/>\n\t</array>\n"
+                                 "\t<key>data</key>\n\t<data>AAH/</data>\n"
+                                 "\t<key>date</key>\n\t<date>2026-03-01T12:00:00Z</date>\n"
+                                 "\t<key>infinite</key>\n\t<real>-infinity</real>\n"
+                                 "\t<key>int</key>\n\t<integer>-5</integer>\n"
+                                 "\t<key>k&lt;&amp;&gt;</key>\n\t<string>a&#13;\n\"b\" é</string>\n"
+                                 "\t<key>single</key>\n\t<real>0.1</real>\n"
+                                 "\t<key>unsigned</key>\n\t<integer>18446744073709551615</integer>\n"
+                                 "</dict>\n</plist>\n";
+    EXPECT_EQ(DataSerialize::getDataXMLInfo(list), expected);
+    EXPECT_EQ(DataSerialize::getXMLInfo(list), std::nullopt) << "not ASCII";
+    EXPECT_EQ(DataSerialize::getXMLInfo("x"), DataSerialize::getDataXMLInfo("x"));
+    EXPECT_THAT(*DataSerialize::getPlistBlob(list), testing::ElementsAreArray(expected));
+    EXPECT_TRUE(DataSerialize::getBase64XMLBlob(true)->starts_with("PD94bWwgdmVyc2lvbj0i"));
+    EXPECT_EQ(DataSerialize::getPlistBlob(Array{Dictionary{{"a", "\x01"}}}), std::nullopt);
+}
+
+} // namespace
+} // namespace tamblo
