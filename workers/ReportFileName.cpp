@@ -5,7 +5,9 @@
 #include "util/Log.h"
 
 #include <algorithm>
+#include <array>
 #include <chrono>
+#include <ctime>
 
 namespace tamblo {
 
@@ -14,31 +16,16 @@ namespace {
 /// What a file system takes as a name, in bytes.
 constexpr std::size_t kLongestFileName = 255;
 
-void appendDigits(std::string& out, std::int64_t number, std::size_t width) {
-    const std::string digits = std::to_string(number);
-    out.append(width - std::min(width, digits.size()), '0');
-    out += digits;
-}
-
 /// "yyyyMMdd-HHmmss" and the offset as hours and minutes.
 std::string timeInFileName(WallTime time, std::chrono::seconds utcOffset) {
     const auto local = std::chrono::floor<std::chrono::seconds>(time + utcOffset);
-    const auto day = std::chrono::floor<std::chrono::days>(local);
-    const std::chrono::year_month_day date(day);
-    const std::chrono::hh_mm_ss ofDay(local - day);
-    std::string text;
-    appendDigits(text, static_cast<int>(date.year()), 4);
-    appendDigits(text, static_cast<unsigned>(date.month()), 2);
-    appendDigits(text, static_cast<unsigned>(date.day()), 2);
-    text += '-';
-    appendDigits(text, ofDay.hours().count(), 2);
-    appendDigits(text, ofDay.minutes().count(), 2);
-    appendDigits(text, ofDay.seconds().count(), 2);
-    const std::int64_t minutes =
-        std::chrono::floor<std::chrono::minutes>(std::chrono::abs(utcOffset)).count();
-    text += utcOffset < std::chrono::seconds(0) ? '-' : '+';
-    appendDigits(text, minutes / 60 * 100 + minutes % 60, 4);
-    return text;
+    const std::time_t seconds = std::chrono::system_clock::to_time_t(local);
+    std::tm fields{};
+    gmtime_r(&seconds, &fields);
+    fields.tm_gmtoff = utcOffset.count();
+    std::array<char, 40> text{};
+    std::strftime(text.data(), text.size(), "%Y%m%d-%H%M%S%z", &fields);
+    return text.data();
 }
 
 /// What a client names so stays one part of one file name.

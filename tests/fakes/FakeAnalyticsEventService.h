@@ -13,8 +13,8 @@
 
 namespace tamblo {
 
-/// Records the events that are in use: all of them, or those that a test names. Can be made to fail, and then
-/// records nothing and takes no payload.
+/// Records every event that it is sent: those who send are to ask first which ones are in use. All are,
+/// unless a test names some.
 class FakeAnalyticsEventService final : public AnalyticsEventService {
 public:
     struct Event {
@@ -24,16 +24,12 @@ public:
 
     [[nodiscard]] bool isEventInUse(std::string_view eventName) override {
         const std::lock_guard held(mutex_);
-        asked_.emplace_back(eventName);
-        return isWanted(eventName);
+        return !inUse_ || inUse_->contains(eventName);
     }
     [[nodiscard]] std::uint64_t inUseGeneration() const noexcept override { return generation_; }
     void sendEventLazy(std::string_view eventName, const std::function<Dictionary()>& payload) override {
         const std::lock_guard held(mutex_);
-        if (!failing_ && isWanted(eventName)) {
-            ++payloadsTaken_;
-            events_.push_back({std::string(eventName), payload()});
-        }
+        events_.push_back({std::string(eventName), payload()});
     }
 
     void setEventsInUse(std::optional<std::set<std::string, std::less<>>> names) {
@@ -41,7 +37,6 @@ public:
         inUse_ = std::move(names);
         ++generation_;
     }
-    void setFailing(bool failing) noexcept { failing_ = failing; }
     [[nodiscard]] std::vector<Event> events() const {
         const std::lock_guard held(mutex_);
         return events_;
@@ -56,31 +51,16 @@ public:
         }
         return found;
     }
-    /// Every name that was asked about, in order.
-    [[nodiscard]] std::vector<std::string> asked() const {
-        const std::lock_guard held(mutex_);
-        return asked_;
-    }
-    [[nodiscard]] int payloadsTaken() const noexcept { return payloadsTaken_; }
     void clear() {
         const std::lock_guard held(mutex_);
         events_.clear();
-        asked_.clear();
-        payloadsTaken_ = 0;
     }
 
 private:
-    [[nodiscard]] bool isWanted(std::string_view eventName) const {
-        return !inUse_ || inUse_->contains(eventName);
-    }
-
-    std::atomic<bool> failing_{false};
-    std::atomic<int> payloadsTaken_{0};
     std::atomic<std::uint64_t> generation_{1};
     mutable std::mutex mutex_;
     std::optional<std::set<std::string, std::less<>>> inUse_;
     std::vector<Event> events_;
-    std::vector<std::string> asked_;
 };
 
 } // namespace tamblo

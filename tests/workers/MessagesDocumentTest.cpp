@@ -6,6 +6,7 @@
 #include "workers/producers/ZRReportingSessionKaleenMessagesWorker.h"
 #include "workers/producers/ZRReportingSessionVolumeMessagesWorker.h"
 
+#include <cmath>
 #include <fstream>
 #include <map>
 #include <sstream>
@@ -83,42 +84,37 @@ protected:
 TEST_F(MessagesDocumentTest, ExamplesAreWhatComesOfItsSession) {
     playTheSessionOfThePage();
     for (const std::string event :
-         {"com.vandra.tamblo.Volume.Summary", "com.vandra.tamblo.Kaleen.Summary",
-          "com.vandra.tamblo.Input.Summary", "com.vandra.tamblo.Session_Generic.Summary",
-          "com.vandra.tamblo.Setup.Setup"}) {
-        const std::vector<Dictionary> payloads = device.analyticsEvents.payloads(event);
-        ASSERT_EQ(page[event].json.size(), payloads.size()) << event;
+         {"Volume.Summary", "Kaleen.Summary", "Input.Summary", "Session_Generic.Summary", "Setup.Setup"}) {
+        const std::string name = "com.vandra.tamblo." + event;
+        const std::vector<Dictionary> payloads = device.analyticsEvents.payloads(name);
+        ASSERT_EQ(page[name].json.size(), payloads.size()) << name;
         for (std::size_t i = 0; i < payloads.size(); ++i) {
-            const auto line = readJson(page[event].json[i]);
-            Dictionary shown = std::get<Value>(line).dictionaryValue();
-            EXPECT_EQ(*shown.find("event"), Value(event));
-            shown = Dictionary(shown.find("payload")->dictionaryValue());
+            Dictionary line = std::get<Value>(readJson(page[name].json[i])).dictionaryValue();
+            EXPECT_EQ(*line.find("event"), Value(name));
+            line = Dictionary(line.find("payload")->dictionaryValue());
             // What a run measures stands for itself, lengths up to a hundredth of a second.
             for (const std::string_view measured :
                  {"zrreporting_timestamp", "last_updated", "vmInfo_phys_footprint_MiB", "load_avg_1_min",
                   "load_avg_5_min", "load_avg_15_min", "play_seconds", "inputrunning_seconds"}) {
-                const Value* derived = payloads[i].find(measured);
-                if (derived == nullptr || !shown.contains(measured)) {
+                if (!line.contains(measured) || !payloads[i].contains(measured)) {
                     continue;
                 }
-                if (measured.ends_with("_seconds")) {
-                    EXPECT_NEAR(shown.find(measured)->doubleValue(), derived->doubleValue(), 0.01);
-                }
-                shown.set(measured, *derived);
+                const Value& derived = *payloads[i].find(measured);
+                const double error = line.find(measured)->doubleValue() - derived.doubleValue();
+                EXPECT_TRUE(!measured.ends_with("_seconds") || std::abs(error) < 0.01);
+                line.set(measured, derived);
             }
-            EXPECT_EQ(jsonText(shown), jsonText(payloads[i]));
+            EXPECT_EQ(jsonText(line), jsonText(payloads[i]));
         }
     }
 }
 
 /// Every cell that says what a change of a key does, tried: all keys at first, one changed, then the end.
 TEST_F(MessagesDocumentTest, KeysDoWhatTheirTableSays) {
-    const auto valueOf = [](const Row& row, bool isChanged) -> Value {
-        if (row[1] == "string") {
-            return isChanged ? "b" : "a";
-        }
-        return row[1] == "boolean" ? Value(row[0].ends_with("_running") != isChanged)
-                                   : Value(isChanged ? 0.0 : 1.0);
+    const auto valueOf = [](const Row& row, bool isChanged) {
+        return row[1] == "string"    ? Value(isChanged ? "b" : "a")
+               : row[1] == "boolean" ? Value(row[0].ends_with("_running") != isChanged)
+                                     : Value(isChanged ? 0.0 : 1.0);
     };
     Dictionary first{{"zrreporting_timestamp", 1000}};
     for (const Row& row : page["What to send"].rows) {
@@ -162,11 +158,8 @@ TEST_F(MessagesDocumentTest, KeysDoWhatTheirTableSays) {
 }
 
 TEST_F(MessagesDocumentTest, ClassesAreListed) {
-    const auto listed = [this](std::string_view head) {
-        const std::string& text = page["Classes"].text;
-        const std::size_t start = text.find(head);
-        EXPECT_NE(start, std::string::npos);
-        std::istringstream numbers(text.substr(start + head.size()));
+    const auto listed = [&text = page["Classes"].text](const std::string& head) {
+        std::istringstream numbers(text.substr(text.find(head) + head.size()));
         std::vector<double> found;
         for (double number = 0; numbers >> number; numbers.ignore(1)) {
             found.push_back(number);

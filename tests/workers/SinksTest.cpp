@@ -17,7 +17,6 @@ namespace {
 
 using namespace std::chrono_literals;
 using testing::ElementsAre;
-using testing::ElementsAreArray;
 using testing::IsEmpty;
 using testing::SizeIs;
 using Lines = std::vector<std::string>;
@@ -95,6 +94,8 @@ TEST_F(SinksTest, AnalyticsEventsHaveAGeneralNameAndOneOfTheService) {
 
 TEST_F(SinksTest, EachPowerTriggerIsAnEventAndWhatIsMissingIsLeftOut) {
     const auto worker = make<ZRReportingSessionJouleryWorker>();
+    const std::string engineOn = "Korvell_Haptics_EngineOnDuration ",
+                      status = "Korvell_Haptics_ClientStatus ";
     const struct {
         Value appName;
         Dictionary payload;
@@ -104,60 +105,47 @@ TEST_F(SinksTest, EachPowerTriggerIsAnEventAndWhatIsMissingIsLeftOut) {
         {"com.a", {{"engineontime", 1}, {"Active_Clients", 2}, {"zrreporting_timestamp", 1.5}}, {}},
         {"com.a",
          {{"EngineOnTime", 2.5F}, {"zrreporting_timestamp", 1.5}},
-         {R"(Korvell_Haptics_EngineOnDuration {"ApplicationName":"com.a","EngineOnDuration":2.5,)"
-          R"("TimestampEnd":1.5})"}},
+         {engineOn + R"({"ApplicationName":"com.a","EngineOnDuration":2.5,"TimestampEnd":1.5})"}},
         {"Unknown",
          {{"EngineOnTime", "5 s"}, {"EngineState", "EngineOn"}},
-         {R"(Korvell_Haptics_EngineOnDuration {"EngineOnDuration":"5 s"})",
-          R"(Korvell_Haptics_ClientStatus {"ApplicationName":"Unknown","Status":1})"},
+         {engineOn + R"({"EngineOnDuration":"5 s"})", status + R"({"ApplicationName":"Unknown","Status":1})"},
          "ee"},
-        {"com.a",
+        {7,
          {{"EngineState", "engineOn"}, {"zrreporting_timestamp", "then"}},
-         {R"(Korvell_Haptics_ClientStatus {"ApplicationName":"com.a","Status":0,"TimestampEnd":"then"})"}},
-        {7, {{"EngineState", 1}}, {R"(Korvell_Haptics_ClientStatus {"ApplicationName":7,"Status":0})"}},
+         {status + R"({"ApplicationName":7,"Status":0,"TimestampEnd":"then"})"}},
         {"com.a",
-         {{"Haptic_Active_Hardware_Time_Seconds", 90}, {"Active_Clients", Array{"a", "b"}}},
-         {R"(LeakedHapticsSessionInfo {"Active_Clients":["a","b"],"Haptic_Active_Hardware_Time_Seconds":90})"}},
-        {"com.a",
-         {{"Haptic_Active_Hardware_Time_Seconds", 1}, {"EngineState", "EngineOn"}, {"EngineOnTime", 3}},
-         {R"(Korvell_Haptics_EngineOnDuration {"ApplicationName":"com.a","EngineOnDuration":3})",
-          R"(Korvell_Haptics_ClientStatus {"ApplicationName":"com.a","Status":1})",
-          R"(LeakedHapticsSessionInfo {"Haptic_Active_Hardware_Time_Seconds":1})"},
+         {{"Haptic_Active_Hardware_Time_Seconds", 90}, {"Active_Clients", Array{"a"}}, {"EngineOnTime", 3}},
+         {engineOn + R"({"ApplicationName":"com.a","EngineOnDuration":3})",
+          R"(LeakedHapticsSessionInfo {"Active_Clients":["a"],"Haptic_Active_Hardware_Time_Seconds":90})"},
          "e"},
     };
     for (const auto& row : cases) {
         session->updateConfigurationWithContentsOfConfiguration({{"HostApplicationDisplayID", row.appName}});
         worker->handleMessage(messageOf(row.payload, 4, AudioEventTypeJoulery));
-        EXPECT_EQ(powerEvents(), row.events) << jsonText(row.payload);
+        EXPECT_EQ(powerEvents(), row.events);
         EXPECT_EQ(loggedLevels(ZRReportingJouleryCategory()), row.logged) << jsonText(row.payload);
     }
     session.reset();
     worker->handleMessage(messageOf({{"EngineOnTime", 1}, {"EngineState", ""}}, 4, AudioEventTypeJoulery));
-    EXPECT_THAT(powerEvents(), ElementsAre(R"(Korvell_Haptics_EngineOnDuration {"EngineOnDuration":1})",
-                                           R"(Korvell_Haptics_ClientStatus {"Status":0})"));
+    EXPECT_THAT(powerEvents(),
+                ElementsAre(engineOn + R"({"EngineOnDuration":1})", status + R"({"Status":0})"));
 }
 
 TEST_F(SinksTest, EveryDetectedIssueIsAMetricRecordOfWhatThereIs) {
     const auto worker = make<ZRReportingSessionQMXWorker>();
+    constexpr const char* kSilence = "any_channel_silence_seconds";
     const struct {
         Dictionary payload;
         std::string record;
         std::string logged; ///< a line for each thing that is missing
     } cases[] = {
         {{}, "0 ||", "eeee"},
-        {{{"issue_type", 3}, {"any_channel_silence_seconds", 2.9}}, "2 3||", "ee"},
-        {{{"issue_type", "G\xC3\xA4"},
-          {"rtaid_client", ""},
-          {"node", 0.5F},
-          {"any_channel_silence_seconds", -2.9}},
-         "-2 G\xC3\xA4|0.5|",
-         ""},
-        {{{"node", Dictionary{{"b", true}}}, {"rtaid_client", Array{1, "x"}}},
-         R"(0 |{"b":true}|[1,"x"])",
-         "ee"},
-        {{{"node", "n"}, {"any_channel_silence_seconds", 0x1'8000'0007}}, "-2147483641 |n|", "ee"},
-        {{{"node", "n"}, {"any_channel_silence_seconds", " 12.7 s"}}, "12 |n|", "ee"},
-        {{{"node", "n"}, {"any_channel_silence_seconds", std::nan("")}}, "0 |n|", "ee"},
+        {{{"issue_type", 3}, {kSilence, 2.9}}, "2 3||", "ee"},
+        {{{"issue_type", ""}, {"rtaid_client", ""}, {"node", .5F}, {kSilence, -2.9}}, "-2 |0.5|", ""},
+        {{{"node", Array{true}}, {"rtaid_client", Array{1, "x"}}}, R"(0 |[true]|[1,"x"])", "ee"},
+        {{{"node", "n"}, {kSilence, 0x1'8000'0007}}, "-2147483641 |n|", "ee"},
+        {{{"node", "n"}, {kSilence, " 12.7 s"}}, "12 |n|", "ee"},
+        {{{"node", "n"}, {kSilence, std::nan("")}}, "0 |n|", "ee"},
     };
     for (const auto& row : cases) {
         worker->handleMessage(messageOf(row.payload, 0xFFFFFFFF, AudioEventTypeIssueDetector));
@@ -256,24 +244,21 @@ TEST(ProcessListTest, TakesWhatIsAProcessOnceAndUpToItsLimit) {
          {1, 2, 0x7FFF'FFFF}},
         {Array{"12", true, Dictionary{{"a", 3}}, Array{4}, Value::date(5), 6.0}, {1, 2, 6}},
         {"12", {1, 2}},
-        {Dictionary{{"a", 3}}, {1, 2}},
-        {Array{}, {1, 2}},
     };
-    constexpr pid_t own[] = {1, 2, 1, 0};
     for (const auto& [named, processes] : cases) {
         ProcessList list;
-        list.add(own);
+        list.add(std::vector<pid_t>{1, 2, 1, 0});
         list.addNamedBy({{"processIDs", named}});
-        EXPECT_THAT(std::move(list).take(), ElementsAreArray(processes));
+        EXPECT_EQ(std::move(list).take(), processes);
     }
-    for (const std::size_t count : {63U, 64U, 65U, 100'000U}) {
-        Array many(count);
+    for (const std::size_t count : {64U, 65U}) {
+        std::vector<pid_t> many(count);
         std::iota(many.begin(), many.end(), 100);
-        ProcessList list, larger(512);
-        list.addNamedBy({{"processIDs", Value(many)}});
-        larger.addNamedBy({{"processIDs", Value(many)}});
-        EXPECT_THAT(std::move(list).take(), SizeIs(std::min<std::size_t>(count, 64)));
-        EXPECT_THAT(std::move(larger).take(), SizeIs(std::min<std::size_t>(count, 64)));
+        ProcessList named(512), own;
+        named.addNamedBy({{"processIDs", Array(many.begin(), many.end())}});
+        own.add(many);
+        EXPECT_THAT(std::move(named).take(), SizeIs(64));
+        EXPECT_THAT(std::move(own).take(), SizeIs(64));
     }
 }
 

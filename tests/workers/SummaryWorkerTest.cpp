@@ -52,30 +52,24 @@ TEST_F(SummaryWorkerTest, CountsMessagesAndActivity) {
 
 TEST_F(SummaryWorkerTest, TellsWhoReportedAndHowTheDeviceIs) {
     session = makeSession(AudioServiceTypeTelephony);
-    session->setClientProcessName(std::nullopt);
-    session->start();
-    device.deviceConditions.lowPower = true;
-    EXPECT_EQ(summary({"summaryServiceName", "HostApplicationDisplayID", "clientProcessName",
-                       "singleMessageSession", "thermal_state", "low_power_enabled",
-                       "vmInfo_phys_footprint_MiB", "load_avg_1_min", "load_avg_5_min", "load_avg_15_min"}),
-              R"("telephony" "Unknown" false "Nominal" 1 3 0.5 0.25 0.125)");
-
-    session = makeSession(AudioServiceTypeTelephony, {{"HostApplicationDisplayID", "com.example.phone"}});
-    device.deviceConditions.lowPower = false;
     device.processInformation.footprint = (std::uint64_t{4} << 30U) + (std::uint64_t{3} << 20U) + 5;
-    const std::pair<int, const char*> states[] = {
-        {1, "Fair"}, {2, "Serious"}, {3, "Critical"}, {4, "Unknown"}, {-1, "Unknown"}};
+    const std::pair<int, const char*> states[] = {{0, "Nominal"},  {1, "Fair"},    {2, "Serious"},
+                                                  {3, "Critical"}, {4, "Unknown"}, {-1, "Unknown"}};
     for (const auto& [state, name] : states) {
         device.deviceConditions.thermal = state;
+        device.deviceConditions.lowPower = state == 1;
         session->start();
-        EXPECT_EQ(summary({"HostApplicationDisplayID", "clientProcessName", "low_power_enabled",
-                           "vmInfo_phys_footprint_MiB", "thermal_state"}),
-                  std::string(R"("com.example.phone" "caller" 0 3 ")") + name + "\"");
+        EXPECT_EQ(summary({"thermal_state", "low_power_enabled", "vmInfo_phys_footprint_MiB",
+                           "load_avg_1_min", "load_avg_5_min", "load_avg_15_min", "summaryServiceName",
+                           "HostApplicationDisplayID", "clientProcessName", "singleMessageSession"}),
+                  std::string("\"") + name + (state == 1 ? "\" 1" : "\" 0") +
+                      R"( 3 0.5 0.25 0.125 "telephony" "Unknown" "caller" false)");
     }
+    session->setClientProcessName(std::nullopt);
     device.processInformation.footprint = ProcessInformation::QueryError{2, "no such file"};
     (void)logged(ZRReportingSummaryLogCategory());
     session->start();
-    EXPECT_EQ(summary({"vmInfo_phys_footprint_MiB"}), "");
+    EXPECT_EQ(summary({"vmInfo_phys_footprint_MiB", "clientProcessName"}), "");
     EXPECT_EQ(loggedLevels(ZRReportingSummaryLogCategory()), "e");
 }
 

@@ -37,9 +37,12 @@ class TraceWorkerTest : public WorkerTest {
 protected:
     TraceWorkerTest() : WorkerTest(LogLevel::info, true) { session = makeSession(AudioServiceTypeVelka); }
 
+    /// A tick, after which the time of day has gone on by the step.
     void tick(std::chrono::milliseconds step = 100ms) {
         device.clock.advance(step);
-        device.workQueues.tick();
+        device.processInformation.uptime += 100ms;
+        device.workQueues.elapse(100ms);
+        device.workQueues.run("com.vandra.tamblo.trace.samples");
     }
     /// The performance files, whose names have the time of the stop; an internal build writes others, too.
     [[nodiscard]] std::map<std::string, std::string> written() {
@@ -66,7 +69,7 @@ TEST_F(TraceWorkerTest, WritesWhatASessionsProcessesDid) {
     session->start();
     const auto other = makeSession(); // of the same client: it changes nothing
     other->start();
-    ASSERT_EQ(device.workQueues.runningTimers(), 1U);
+    ASSERT_EQ(device.workQueues.delayedCalls(), 1U);
     const struct {
         std::optional<std::int64_t> clientsTime;
         std::uint64_t servicesFaults;
@@ -131,9 +134,9 @@ TEST_F(TraceWorkerTest, HoldsSoManyTracesAtATimeAndForgetsDroppedSessions) {
     }
     sessions.back()->stop();
     EXPECT_THAT(written(), SizeIs(2)) << "though nothing was sampled";
-    EXPECT_EQ(device.workQueues.runningTimers(), 1U);
+    EXPECT_EQ(device.workQueues.delayedCalls(), 1U);
     sessions.clear();
-    EXPECT_EQ(device.workQueues.runningTimers(), 0U);
+    EXPECT_EQ(device.workQueues.delayedCalls(), 0U);
 }
 
 TEST_F(TraceWorkerTest, EachFailureIsOneLine) {

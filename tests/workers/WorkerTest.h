@@ -2,6 +2,7 @@
 
 #include "tests/fakes/FakePlatform.h"
 #include "tests/fakes/Messages.h"
+#include "util/Log.h"
 #include "util/LogCategories.h"
 
 #include <gmock/gmock.h>

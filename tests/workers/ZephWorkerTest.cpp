@@ -3,13 +3,13 @@
 #include "workers/sinks/ZRReportingSessionZephWorker.h"
 
 #include <optional>
+#include <sstream>
 #include <thread>
 
 namespace tamblo {
 namespace {
 
 using testing::ElementsAre;
-using testing::IsEmpty;
 using namespace std::chrono_literals;
 
 constexpr const char* kHapticKey = "Haptic_Active_Hardware_Time_Seconds";
@@ -43,34 +43,48 @@ protected:
         session->setIsSingleMessageSession(isSingle);
         session->start();
     }
-    void sendLeak(const char* key, std::chrono::nanoseconds wait = 1ms) {
-        device.clock.advance(wait);
+    void sendLeak(const char* key) {
+        device.clock.advance(1ms);
         send({{key, 90}}, AudioEventKindPlayback, AudioEventTypeJoulery);
     }
-    void sendLow(int times = 3) {
-        for (int i = 0; i < times; ++i) {
-            device.clock.advance(1ms);
-            send(kLow, AudioEventKindError, AudioEventTypeIssueDetector);
+    void sendLow() {
+        device.clock.advance(1ms);
+        send(kLow, AudioEventKindError, AudioEventTypeIssueDetector);
+    }
+    /// Does what the words say; a number is a time in seconds.
+    void play(const std::string& script) {
+        std::istringstream words(script);
+        for (std::string word; words >> word;) {
+            if (word == "alarms" || word == "alerts") {
+                startSession(word == "alarms" ? AudioServiceTypeAlarms : AudioServiceTypeAlerts);
+            } else if (word == "low") {
+                sendLow();
+            } else if (word == "haptic" || word == "sound") {
+                sendLeak(word == "haptic" ? kHapticKey : kSoundKey);
+            } else if (word == "start") {
+                session->start();
+            } else if (word == "stop") {
+                session->stop();
+            } else if (word == "answered") {
+                device.bugCapture.answer(kOpened);
+            } else if (word == "failing") {
+                device.bugCapture.promptAnswer = Dictionary{{"reason", 1}};
+            } else if (word == "refused") {
+                device.bugCapture.accepts = false;
+            } else {
+                device.clock.advance(std::chrono::seconds(std::stoi(word)));
+            }
         }
     }
     /// What was asked of the capture service since the last call.
-    std::vector<std::string> asked() {
-        std::vector<std::string> found;
-        for (const auto& [operation, processes, filed, duration, payload, identifier] :
-             std::exchange(device.bugCapture.requests, {})) {
-            EXPECT_THAT(processes, ElementsAre(kClient, kOtherClient));
-            found.push_back(operation == "cancel"
-                                ? "cancel " + identifier
-                                : formatted("{} {}/{}/{}/{}/{} {} {}", operation, filed.domain, filed.type,
-                                            filed.subType, filed.subTypeContext, filed.detectedProcess,
-                                            duration.count(), jsonText(payload)));
+    std::string asked() {
+        std::string found;
+        for (const auto& request : std::exchange(device.bugCapture.requests, {})) {
+            EXPECT_THAT(request.processes, ElementsAre(kClient, kOtherClient));
+            found += request.operation + " " +
+                     (request.operation == "cancel" ? request.session : request.signature.type) + "; ";
         }
         return found;
-    }
-    std::string snapshotOf(const char* what) {
-        return formatted("snapshot Tonmetry/{}/Playback/Joulery/Unknown 0.000000 ", what) +
-               R"({"diagnostic_extension_parameters":)"
-               R"({"com.vandra.powerlog.systemlog.filterprocess":{"processIDs":[77,78]}}})";
     }
 };
 
@@ -81,8 +95,7 @@ TEST_F(ZephWorkerTest, DetectorsFireAtTheirThresholdsAndBeginAnew) {
         std::vector<std::pair<std::chrono::nanoseconds, int>> steps; ///< wait, number; 0: of no interest
         std::string calls;
         int fired;
-        bool once = false;
-        bool doesFire = true;
+        bool once = false, doesFire = true;
         AudioServiceType serviceType = AudioServiceTypeAlarms;
     } cases[] = {
         {3, {}, {{0s, 1}, {0s, 2}, {0s, 3}, {0s, 4}, {0s, 5}, {0s, 6}, {0s, 7}}, "...F...F.", 2},
@@ -144,7 +157,6 @@ TEST_F(ZephWorkerTest, EachDetectorLooksAtItsOwnMessages) {
         {4, 8, 4, {{kHapticKey, 1}, {kSoundKey, 1}}, "HapticLeaks SSSLeaks ", true},
         {2, 8, 0xFFFFFFFF, {{kSoundKey, 1}}, "SSSLeaks "},
         {4, 7, 11, {{kHapticKey, 1}, {kSoundKey, 1}}, ""},
-        {4, 8, 11, kLow, ""},
         {4, 7, 11, kLow, "AlarmLowRMS "},
         {11, 7, 11, kLow, "AlarmLowRMS "},
         {4, 7, 11, kLow, "", true},
@@ -167,82 +179,65 @@ TEST_F(ZephWorkerTest, EachDetectorLooksAtItsOwnMessages) {
     }
 }
 
-TEST_F(ZephWorkerTest, LeaksOfHapticsAreCountedOverSessionsAndRepeats) {
-    startSession(AudioServiceTypeAlerts);
-    sendLeak(kHapticKey); // counted by nobody
+TEST_F(ZephWorkerTest, DetectorsAskForCaptures) {
+    const struct {
+        const char* what;
+        const char* script;
+        const char* asked;
+    } cases[] = {
+        {"two leaks of haptics, over sessions", "alerts haptic alarms haptic", "snapshot haptics; "},
+        {"repeats count", "alerts haptic haptic haptic haptic", "snapshot haptics; snapshot haptics; "},
+        {"each stuck sound", "alerts sound", "snapshot systemsounds; "},
+        {"but none of 15 seconds", "alerts sound 14 alerts sound 0 sound", "snapshot systemsounds; "},
+        {"from the last capture on", "alerts sound 15 sound 10 sound 5 sound",
+         "snapshot systemsounds; snapshot systemsounds; snapshot systemsounds; "},
+        {"two low alarms are too few", "alarms low low stop", ""},
+        {"over a stop, and once; not answered, nothing is cancelled",
+         "alarms low low stop start low low stop", "start alarms; "},
+        {"every later stop cancels again", "alarms low low low answered stop start low low low stop",
+         "start alarms; cancel S-1; cancel S-1; "},
+        {"a capture that failed is cancelled, too", "alarms failing low low low stop",
+         "start alarms; cancel NONE_RETURNED; "},
+        {"one that was refused is not", "alarms refused low low low stop", "start alarms; "},
+    };
     device.deviceProperties.set("HapticLeakCapture", true);
-    startSession(AudioServiceTypeAlerts);
-    sendLeak(kHapticKey);
-    startSession(AudioServiceTypeTelephony);
-    EXPECT_THAT(asked(), IsEmpty());
-    sendLeak(kHapticKey);
-    EXPECT_THAT(asked(), ElementsAre(snapshotOf("haptics")));
-    (void)logged(ZRReportingZephLogCategory());
-    device.bugCapture.accepts = false;
-    sendLeak(kHapticKey);
-    sendLeak(kHapticKey);
-    EXPECT_THAT(asked(), ElementsAre(snapshotOf("haptics")));
-    EXPECT_EQ(loggedLevels(ZRReportingZephLogCategory()), "e");
-    EXPECT_EQ(session->acceptedMessageCount(), 1U); // the others repeated it
-}
-
-TEST_F(ZephWorkerTest, StuckSystemSoundsAreCapturedOnceInFifteenSeconds) {
-    const std::pair<std::chrono::nanoseconds, std::size_t> steps[] = {
-        {0s, 1}, {15s - 1ns, 0}, {1ns, 1}, {10s, 0}, {5s, 1}};
-    for (const auto& [wait, captures] : steps) {
-        startSession(AudioServiceTypeAlerts);
-        sendLeak(kSoundKey, wait);
-        EXPECT_EQ(asked(), std::vector<std::string>(captures, snapshotOf("systemsounds")));
+    for (const auto& row : cases) {
+        session.reset();
+        device.restart();
+        device.bugCapture.accepts = true;
+        device.bugCapture.promptAnswer.reset();
+        device.bugCapture.replies.clear();
+        play(row.script);
+        EXPECT_EQ(asked(), row.asked) << row.what;
     }
 }
 
-TEST_F(ZephWorkerTest, StopCancelsTheCaptureOfALowAlarm) {
-    const std::string start = "start Tonmetry/alarms/Error/IssueDetector/caller 60.000000 {}";
-    startSession(AudioServiceTypeAlarms);
-    sendLow(2);
-    session->stop();
-    session->start();
-    EXPECT_THAT(asked(), IsEmpty());
-    sendLow(4);      // once only
-    session->stop(); // not answered yet: nothing to cancel
-    device.bugCapture.answer(kOpened);
-    EXPECT_THAT(asked(), ElementsAre(start));
-    for (int round = 0; round < 2; ++round) {
-        session->start();
-        sendLow();
-        session->stop();
-        EXPECT_THAT(asked(), ElementsAre("cancel S-1"));
+TEST_F(ZephWorkerTest, CapturesSayWhatTheyAreOf) {
+    device.deviceProperties.set("HapticLeakCapture", true);
+    play("alarms haptic haptic low low low");
+    std::string found;
+    for (const auto& [operation, processes, filed, duration, payload, identifier] :
+         device.bugCapture.requests) {
+        found += formatted("{}/{}/{}/{}/{} {} {}\n", filed.domain, filed.type, filed.subType,
+                           filed.subTypeContext, filed.detectedProcess, duration.count(), jsonText(payload));
     }
-    startSession(AudioServiceTypeAlarms);
-    device.bugCapture.promptAnswer = Dictionary{{"reason", 1}};
-    sendLow();
-    session->stop();
-    EXPECT_THAT(asked(), ElementsAre(start, "cancel NONE_RETURNED"));
-    startSession(AudioServiceTypeAlarms);
-    (void)logged(ZRReportingZephLogCategory());
-    device.bugCapture.accepts = false;
-    sendLow();
-    session->stop();
-    EXPECT_THAT(asked(), ElementsAre(start));
-    EXPECT_EQ(loggedLevels(ZRReportingZephLogCategory()), "e");
+    EXPECT_EQ(found, "Tonmetry/haptics/Playback/Joulery/Unknown 0.000000 "
+                     R"({"diagnostic_extension_parameters":)"
+                     R"({"com.vandra.powerlog.systemlog.filterprocess":{"processIDs":[77,78]}}})"
+                     "\nTonmetry/alarms/Error/IssueDetector/caller 60.000000 {}\n");
 }
 
 TEST_F(ZephWorkerTest, AnswersComeOnAnyThreadAndWhenEverythingIsGone) {
-    startSession(AudioServiceTypeAlarms);
-    sendLow();
-    sendLeak(kSoundKey);
+    play("alarms low low low sound");
     session.reset();
     device.restart();
-    device.bugCapture.answer(kOpened);
-    device.bugCapture.answer(kOpened);
+    play("answered answered");
     EXPECT_EQ(device.log.count("Started Zeph session for"), 2U);
-    startSession(AudioServiceTypeAlarms);
-    sendLow();
+    play("alarms low low low");
     device.setThreshold(LogLevel::fault); // the log's lock would keep the threads apart
     std::thread answering([this] { device.bugCapture.answer(kOpened); });
     for (int i = 0; i < 20; ++i) {
-        session->stop();
-        session->start();
+        play("stop start");
     }
     answering.join();
     session->stop();
@@ -250,28 +245,23 @@ TEST_F(ZephWorkerTest, AnswersComeOnAnyThreadAndWhenEverythingIsGone) {
 }
 
 TEST_F(ZephWorkerTest, RepliesSayWhetherThereIsACapture) {
-    const std::string failed = "Failed starting zeph session. reason=";
     const struct {
         Dictionary response;
-        std::string line;
-        std::string identifier = "NONE_RETURNED";
+        const char* line;
+        const char* identifier = "NONE_RETURNED";
     } cases[] = {
-        {kOpened, "i Started Zeph session. sessionId=S-1", "S-1"},
         {{{"success", 1.0}, {"session_id", 17}}, "i Started Zeph session. sessionId=17", "17"},
         {{{"success", true}, {"reason", 3}}, "e Started Zeph session, but no sessionId found!"},
-        {{}, "e Failed starting zeph session. Unknown reason."},
         {{{"success", 2}, {"session_id", "S"}}, "e Failed starting zeph session. Unknown reason."},
-        {{{"success", "true"}, {"reason", "none"}}, "e " + failed + "kGlarnErrorNone"},
-        {{{"success", false}, {"reason", 0x1'0000'0000}}, "e " + failed + "kGlarnErrorNone"},
-        {{{"reason", 1.9}}, "i " + failed + "kGlarnErrorServiceNotReady"},
-        {{{"reason", 9}}, "i " + failed + "kGlarnErrorRequestThrottled"},
-        {{{"reason", 10}}, "i " + failed + "10"},
-        {{{"reason", 0xFFFF'FFFF}}, "i " + failed + "-1"},
+        {{{"reason", "none"}}, "e Failed starting zeph session. reason=kGlarnErrorNone"},
+        {{{"reason", 0x1'0000'0000}}, "e Failed starting zeph session. reason=kGlarnErrorNone"},
+        {{{"reason", 9}}, "i Failed starting zeph session. reason=kGlarnErrorRequestThrottled"},
+        {{{"reason", 10}}, "i Failed starting zeph session. reason=10"},
+        {{{"reason", 0xFFFF'FFFF}}, "i Failed starting zeph session. reason=-1"},
     };
-    for (const auto& row : cases) {
-        EXPECT_EQ(ZRReportingSessionZephWorker::getSessionIdentifierFromResponse(row.response),
-                  row.identifier);
-        EXPECT_THAT(logged(ZRReportingZephLogCategory()), ElementsAre(row.line));
+    for (const auto& [response, line, identifier] : cases) {
+        EXPECT_EQ(ZRReportingSessionZephWorker::getSessionIdentifierFromResponse(response), identifier);
+        EXPECT_THAT(logged(ZRReportingZephLogCategory()), ElementsAre(line));
     }
 }
 

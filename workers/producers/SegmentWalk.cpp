@@ -21,10 +21,6 @@ double secondsOf(const Value* timestamp) noexcept {
     return timestamp != nullptr ? timestamp->doubleValue() : 0.0;
 }
 
-void appendTimestamp(std::string& out, std::string_view name, const Value* timestamp) {
-    appendFormatted(out, "{}={}, {}_double={}", name, OptionalValue{timestamp}, name, secondsOf(timestamp));
-}
-
 } // namespace
 
 Seconds SegmentStart::until(const Value* timestamp) const noexcept {
@@ -42,14 +38,6 @@ bool differAsNumbers(const Value* left, const Value* right) noexcept {
     // Numbers are compared exactly, beyond what a double holds; anything else by the number that it reads as.
     return left->isNumber() && right->isNumber() ? !(*left == *right)
                                                  : left->doubleValue() != right->doubleValue();
-}
-
-bool differAsIntegers(const Value* left, const Value* right) noexcept {
-    return left != nullptr && right != nullptr && left->integerValue() != right->integerValue();
-}
-
-bool differAsBooleans(const Value* left, const Value* right) noexcept {
-    return left != nullptr && right != nullptr && left->boolValue() != right->boolValue();
 }
 
 Value singleSeconds(Seconds length) noexcept {
@@ -70,9 +58,30 @@ Value timeBucketText(Seconds length) {
     return bucketText(length.count(), kTimeBuckets, 0);
 }
 
+DerivedMessages::DerivedMessages(const SegmentWords& words) : words_(words) {
+    log::debug(ZRReportingSessionCategory(), "entering {} {}", words.function, words.function);
+}
+
+void DerivedMessages::logLength(const SegmentStart& start, const Value* timestamp) const {
+    log::debug(ZRReportingSessionCategory(),
+               "{} { func={}, {}={}, zrTimestamp={}, zrTimestamp_double={}, startZrTimestamp={}, "
+               "startZrTimestamp_double={} }",
+               words_.length, words_.function, words_.length, start.until(timestamp).count(),
+               OptionalValue{timestamp}, secondsOf(timestamp), OptionalValue{start.timestamp()},
+               secondsOf(start.timestamp()));
+}
+
 ZRReportingSessionMessage& DerivedMessages::add(Dictionary payload, AudioEventCategory category) {
-    return *messages_.emplace_back(
+    messages_.push_back(
         std::make_shared<ZRReportingSessionMessage>(std::move(payload), category, AudioEventTypeSummary));
+    log::debug(ZRReportingSessionCategory(), "added {} { func={}, action=add, count={} }", words_.added,
+               words_.function, count());
+    return *messages_.back();
+}
+
+void DerivedMessages::skip() const {
+    log::debug(ZRReportingSessionCategory(), "skipped {} { func={}, action=skip, count={} }", words_.skipped,
+               words_.function, count());
 }
 
 std::vector<MessageRef> DerivedMessages::take() {
@@ -98,13 +107,8 @@ void appendText(std::string& out, const OptionalValue& optional) {
     }
 }
 
-void appendText(std::string& out, const SegmentTimes& times) {
-    appendFormatted(out, "{} { func={}, {}={}, ", times.name, times.function, times.name,
-                    times.start.until(times.timestamp).count());
-    appendTimestamp(out, "zrTimestamp", times.timestamp);
-    out += ", ";
-    appendTimestamp(out, "startZrTimestamp", times.start.timestamp());
-    out += " }";
+Dictionary previousValuesOf(const std::shared_ptr<ZRReportingSession>& session) {
+    return session != nullptr ? session->previousValues() : Dictionary();
 }
 
 } // namespace tamblo

@@ -45,8 +45,6 @@ private:
 /// Wherever two values are compared, one that is absent is unchanged.
 [[nodiscard]] bool differAsTexts(const Value* left, const Value* right) noexcept;
 [[nodiscard]] bool differAsNumbers(const Value* left, const Value* right) noexcept;
-[[nodiscard]] bool differAsIntegers(const Value* left, const Value* right) noexcept;
-[[nodiscard]] bool differAsBooleans(const Value* left, const Value* right) noexcept;
 
 /// A length of time as summaries carry it, in single precision.
 [[nodiscard]] Value singleSeconds(Seconds length) noexcept;
@@ -54,26 +52,51 @@ private:
 [[nodiscard]] Value bucketText(double number, std::span<const double> buckets, unsigned fractionDigits);
 [[nodiscard]] Value timeBucketText(Seconds length);
 
-/// The messages of one walk, numbered as they are added.
+/// How the log lines of one producer's walks name things.
+struct SegmentWords {
+    std::string_view function;
+    std::string_view length;  ///< "playingTime"
+    std::string_view added;   ///< "volume message"
+    std::string_view skipped; ///< "volume message, too short"
+};
+
+/// The messages of one walk, numbered as they are added; tells the log what becomes of each segment.
 class DerivedMessages {
 public:
+    explicit DerivedMessages(const SegmentWords& words);
+
     /// The number of the next one, from 1.
     [[nodiscard]] std::int64_t nextIndex() const noexcept {
         return static_cast<std::int64_t>(messages_.size()) + 1;
     }
     [[nodiscard]] std::uint64_t count() const noexcept { return messages_.size(); }
+    void logLength(const SegmentStart& start, const Value* timestamp) const;
     /// A summary of this category.
     ZRReportingSessionMessage& add(Dictionary payload, AudioEventCategory category);
+    void skip() const;
     /// All of them, each now knowing how many there are.
     [[nodiscard]] std::vector<MessageRef> take();
 
 private:
+    const SegmentWords& words_;
     std::vector<MessageRef> messages_;
 };
 
 /// The messages with each burst of the two spatial-audio settings folded into one.
 [[nodiscard]] std::vector<ZRReportingSessionMessage*>
 combineSpatialAudioSettings(const std::vector<MessageRef>& messages, Seconds longestPause);
+
+/// What a walk begins with: what the session's earlier runs left, nothing once the session is gone.
+[[nodiscard]] Dictionary previousValuesOf(const std::shared_ptr<ZRReportingSession>& session);
+
+/// What a walk over these messages derives.
+template <typename Walk, typename Messages>
+[[nodiscard]] std::vector<MessageRef> derivedBy(Walk walk, const Messages& messages) {
+    for (const auto& message : messages) {
+        walk.take(message->payload());
+    }
+    return walk.finish();
+}
 
 /// What a producer does when its session stops: has `derive` make messages of what the session recorded,
 /// given the session and the least length of a segment, and sends them into it as a client would.
@@ -98,14 +121,5 @@ struct OptionalValue {
     const Value* value;
 };
 void appendText(std::string& out, const OptionalValue& optional);
-
-/// A segment's times in a log line: "playingTime { func=…, playingTime=…, … }".
-struct SegmentTimes {
-    std::string_view name; ///< of the length of time
-    std::string_view function;
-    const SegmentStart& start;
-    const Value* timestamp;
-};
-void appendText(std::string& out, const SegmentTimes& times);
 
 } // namespace tamblo

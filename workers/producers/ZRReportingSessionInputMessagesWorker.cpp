@@ -1,5 +1,6 @@
 #include "workers/producers/ZRReportingSessionInputMessagesWorker.h"
 
+#include "base/Format.h"
 #include "session/ZRReportingSession.h"
 #include "util/Log.h"
 #include "util/MessageKeys.h"
@@ -42,7 +43,10 @@ constexpr Fields::Keys kKeys{ZRReportingInternalEventEpochTime,
                              kOperationModeKey,
                              kInputPortKey};
 
-constexpr std::string_view kFunction = "createInputMessages";
+constexpr SegmentWords kWords{.function = "createInputMessages",
+                              .length = "runningTime",
+                              .added = "input message",
+                              .skipped = "input message, too short"};
 
 const Dictionary& defaults() {
     static const Dictionary values{{kActiveDevicesKey, kUnknownSetting},
@@ -53,32 +57,13 @@ const Dictionary& defaults() {
     return values;
 }
 
-/// The vocoders of a stretch, each with its sample rate: "NAME:RATE", in the order of their bytes.
-class Vocoders {
-public:
-    void add(const Value& name, const Value* rate) {
-        std::string rateText;
-        appendText(rateText, OptionalValue{rate});
-        // A rate that begins so stands for a vocoder that does not run.
-        if (!rateText.starts_with("0.")) {
-            std::string entry;
-            appendText(entry, name);
-            entries_.insert(entry + ":" + rateText);
-        }
+std::string joined(const std::set<std::string>& entries) {
+    std::string text;
+    for (const std::string& entry : entries) {
+        text += text.empty() ? entry : "," + entry;
     }
-    void clear() { entries_.clear(); }
-    [[nodiscard]] bool empty() const noexcept { return entries_.empty(); }
-    [[nodiscard]] std::string text() const {
-        std::string joined;
-        for (const std::string& entry : entries_) {
-            joined += joined.empty() ? entry : "," + entry;
-        }
-        return joined;
-    }
-
-private:
-    std::set<std::string> entries_;
-};
+    return text;
+}
 
 /// One walk over a session's messages. It always begins with input not running: what earlier runs of the
 /// session left opens no segment.
@@ -113,7 +98,7 @@ public:
 
     [[nodiscard]] std::vector<MessageRef> finish() {
         log::debug(ZRReportingSessionCategory(),
-                   "returning input messages { func={}, action=return, count={} }", kFunction,
+                   "returning input messages { func={}, action=return, count={} }", kWords.function,
                    derived_.count());
         return derived_.take();
     }
@@ -132,25 +117,25 @@ private:
     }
 
     void noteVocoder(const Fields& message) {
-        if (isPresentAndHasChanged(message[Field::vocoder], state_[Field::vocoder])) {
-            vocoders_.add(*message[Field::vocoder], message[Field::vocoderRate]);
+        if (!isPresentAndHasChanged(message[Field::vocoder], state_[Field::vocoder])) {
+            return;
+        }
+        const std::string rate = formatted("{}", OptionalValue{message[Field::vocoderRate]});
+        // A rate that begins so stands for a vocoder that does not run.
+        if (!rate.starts_with("0.")) {
+            vocoders_.insert(formatted("{}:{}", *message[Field::vocoder], rate));
         }
     }
 
     void endSegment(const Value* timestamp) {
         const Seconds runningTime = start_.until(timestamp);
-        log::debug(ZRReportingSessionCategory(), "{}",
-                   SegmentTimes{"runningTime", kFunction, start_, timestamp});
+        derived_.logLength(start_, timestamp);
         if (timestamp != nullptr && start_.isKnown() && process_ != nullptr && runningTime > minimum_) {
             derived_.add(summary(runningTime), AudioEventKindInput);
             vocoders_.clear();
-            log::debug(ZRReportingSessionCategory(), "added input message { func={}, action=add, count={} }",
-                       kFunction, derived_.count());
         } else {
             // The vocoders stay for the next segment.
-            log::debug(ZRReportingSessionCategory(),
-                       "skipped input message, too short { func={}, action=skip, count={} }", kFunction,
-                       derived_.count());
+            derived_.skip();
         }
         start_.begin(timestamp);
     }
@@ -164,7 +149,7 @@ private:
                            {kInputPortKey, *state_[Field::inputPort]},
                            {kActiveDevicesKey, *state_[Field::devices]}};
         if (!vocoders_.empty()) {
-            payload.set("vocoders", vocoders_.text());
+            payload.set("vocoders", joined(vocoders_));
         }
         return payload;
     }
@@ -177,8 +162,8 @@ private:
     Fields state_;
     bool isRunning_ = false;
     SegmentStart start_;
-    Vocoders vocoders_;
-    DerivedMessages derived_;
+    std::set<std::string> vocoders_; ///< of the stretch, each with its sample rate: "NAME:RATE"
+    DerivedMessages derived_{kWords};
 };
 
 } // namespace
@@ -192,14 +177,8 @@ void ZRReportingSessionInputMessagesWorker::stop() {
 
 std::vector<MessageRef> ZRReportingSessionInputMessagesWorker::createInputMessages(
     const std::vector<MessageRef>& messages, const Value* process, Seconds minimumRunningtime) const {
-    log::debug(ZRReportingSessionCategory(), "entering createInputMessages {}", kFunction);
-    const std::shared_ptr<ZRReportingSession> owner = session();
-    InputWalk walk(owner != nullptr ? owner->previousValues() : Dictionary(), process, minimumRunningtime);
-    for (const ZRReportingSessionMessage* message :
-         combineSpatialAudioSettings(messages, kLongestPauseInBurst)) {
-        walk.take(message->payload());
-    }
-    return walk.finish();
+    return derivedBy(InputWalk(previousValuesOf(session()), process, minimumRunningtime),
+                     combineSpatialAudioSettings(messages, kLongestPauseInBurst));
 }
 
 } // namespace tamblo

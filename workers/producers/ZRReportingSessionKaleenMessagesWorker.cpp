@@ -8,6 +8,7 @@
 #include "workers/producers/PayloadFields.h"
 #include "workers/producers/SegmentWalk.h"
 
+#include <functional>
 #include <memory>
 #include <string_view>
 #include <utility>
@@ -31,7 +32,10 @@ constexpr Fields::Keys kKeys{ZRReportingInternalEventEpochTime,
                              kActiveDevicesKey,
                              kSelectedFormatKey};
 
-constexpr std::string_view kFunction = "createKaleenMessages";
+constexpr SegmentWords kWords{.function = "createKaleenMessages",
+                              .length = "playingTime",
+                              .added = "kaleen message",
+                              .skipped = "kaleen message, too short or not actually an kaleen session"};
 
 const Dictionary& defaults() {
     static const Dictionary values{{kSelectedFormatKey, kUnknownSetting},
@@ -59,11 +63,13 @@ bool isInGroup(const Fields& fields) noexcept {
 
 /// Whether a setting that both hold differs.
 bool watchedFieldChangeInMessage(const Fields& message, const Fields& previous) noexcept {
-    return differAsBooleans(message[Field::running], previous[Field::running]) ||
-           differAsIntegers(message[Field::group], previous[Field::group]) ||
-           differAsIntegers(message[Field::channels], previous[Field::channels]) ||
-           differAsTexts(message[Field::formatID], previous[Field::formatID]) ||
-           differAsTexts(message[Field::devices], previous[Field::devices]);
+    const auto differ = [&](Field field, auto read) {
+        return message.holds(field) && previous.holds(field) &&
+               std::invoke(read, *message[field]) != std::invoke(read, *previous[field]);
+    };
+    return differ(Field::running, &Value::boolValue) || differ(Field::group, &Value::integerValue) ||
+           differ(Field::channels, &Value::integerValue) || differ(Field::formatID, &Value::stringValue) ||
+           differ(Field::devices, &Value::stringValue);
 }
 
 /// One walk over a session's messages.
@@ -111,20 +117,14 @@ private:
 
     void endSegment(const Value* timestamp) {
         const Seconds playingTime = start_.until(timestamp);
-        log::debug(ZRReportingSessionCategory(), "{}",
-                   SegmentTimes{"playingTime", kFunction, start_, timestamp});
+        derived_.logLength(start_, timestamp);
         if (playingTime > minimum_ && isInGroup(state_)) {
             ZRReportingSessionMessage& message = derived_.add(summary(playingTime), AudioEventKindKaleen);
             if (!ZRReportingUtilityIsInternalBuild()) {
                 message.setDestinationWorkers(destinations());
             }
-            log::debug(ZRReportingSessionCategory(), "added kaleen message { func={}, action=add, count={} }",
-                       kFunction, derived_.count());
         } else {
-            log::debug(ZRReportingSessionCategory(),
-                       "skipped kaleen message, too short or not actually an kaleen session { func={}, "
-                       "action=skip, count={} }",
-                       kFunction, derived_.count());
+            derived_.skip();
         }
         start_.begin(isPlaying_ && isInGroup_ ? timestamp : nullptr);
     }
@@ -152,7 +152,7 @@ private:
     bool isPlaying_ = false;
     bool isInGroup_ = false;
     SegmentStart start_;
-    DerivedMessages derived_;
+    DerivedMessages derived_{kWords};
 };
 
 } // namespace
@@ -166,13 +166,7 @@ void ZRReportingSessionKaleenMessagesWorker::stop() {
 std::vector<MessageRef>
 ZRReportingSessionKaleenMessagesWorker::createKaleenMessages(const std::vector<MessageRef>& messages,
                                                              Seconds minimumPlaytime) const {
-    log::debug(ZRReportingSessionCategory(), "entering createKaleenMessages {}", kFunction);
-    const std::shared_ptr<ZRReportingSession> owner = session();
-    KaleenWalk walk(owner != nullptr ? owner->previousValues() : Dictionary(), minimumPlaytime);
-    for (const MessageRef& message : messages) {
-        walk.take(message->payload());
-    }
-    return walk.finish();
+    return derivedBy(KaleenWalk(previousValuesOf(session()), minimumPlaytime), messages);
 }
 
 } // namespace tamblo

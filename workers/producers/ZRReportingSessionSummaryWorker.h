@@ -22,11 +22,6 @@ public:
     void handleMessage(const MessageRef& message) override;
     void stop() override;
 
-    /// Messages with a length of activity, and the sum of those lengths in seconds.
-    [[nodiscard]] std::uint32_t activeCount() const noexcept { return activeCount_; }
-    [[nodiscard]] double totalActiveTime() const noexcept { return totalActiveTime_; }
-    [[nodiscard]] std::uint32_t overloadCount() const noexcept { return overloadCount_; }
-
 private:
     struct Places;
 

@@ -46,7 +46,10 @@ constexpr Fields::Keys kKeys{ZRReportingInternalEventEpochTime,
                              kFormatIDKey,
                              kChannelsPerFrameKey};
 
-constexpr std::string_view kFunction = "createVolumeMessages";
+constexpr SegmentWords kWords{.function = "createVolumeMessages",
+                              .length = "playingTime",
+                              .added = "volume message",
+                              .skipped = "volume message, too short"};
 
 const Dictionary& defaults() {
     static const Dictionary values{{kSelectedFormatKey, kUnknownSetting},
@@ -115,17 +118,12 @@ private:
 
     void endSegment(const Value* timestamp) {
         const Seconds playingTime = start_.until(timestamp);
-        log::debug(ZRReportingSessionCategory(), "{}",
-                   SegmentTimes{"playingTime", kFunction, start_, timestamp});
+        derived_.logLength(start_, timestamp);
         if (timestamp != nullptr && start_.isKnown() && playingTime > minimum_ && process_ != nullptr &&
             state_.holds(Field::volume)) {
             derived_.add(summary(playingTime), AudioEventKindVolume);
-            log::debug(ZRReportingSessionCategory(), "added volume message { func={}, action=add, count={} }",
-                       kFunction, derived_.count());
         } else {
-            log::debug(ZRReportingSessionCategory(),
-                       "skipped volume message, too short { func={}, action=skip, count={} }", kFunction,
-                       derived_.count());
+            derived_.skip();
         }
         start_.begin(timestamp);
     }
@@ -155,7 +153,7 @@ private:
     Fields state_;
     bool isPlaying_ = false;
     SegmentStart start_;
-    DerivedMessages derived_;
+    DerivedMessages derived_{kWords};
 };
 
 } // namespace
@@ -169,14 +167,8 @@ void ZRReportingSessionVolumeMessagesWorker::stop() {
 
 std::vector<MessageRef> ZRReportingSessionVolumeMessagesWorker::createVolumeMessages(
     const std::vector<MessageRef>& messages, const Value* process, Seconds minimumPlaytime) const {
-    log::debug(ZRReportingSessionCategory(), "entering createVolumeMessages {}", kFunction);
-    const std::shared_ptr<ZRReportingSession> owner = session();
-    VolumeWalk walk(owner != nullptr ? owner->previousValues() : Dictionary(), process, minimumPlaytime);
-    for (const ZRReportingSessionMessage* message :
-         combineSpatialAudioSettings(messages, kLongestPauseInBurst)) {
-        walk.take(message->payload());
-    }
-    return walk.finish();
+    return derivedBy(VolumeWalk(previousValuesOf(session()), process, minimumPlaytime),
+                     combineSpatialAudioSettings(messages, kLongestPauseInBurst));
 }
 
 } // namespace tamblo

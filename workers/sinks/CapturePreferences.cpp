@@ -69,10 +69,10 @@ std::string_view kindOf(const Value& value) noexcept {
     }
 }
 
-std::optional<Value> checked(Reported& reported, const PreferencesSuite& suite, std::string_view key,
-                             const LogCategory& category, bool (&isRight)(const Value&) noexcept,
-                             std::string_view wanted) {
-    std::optional<Value> value = suite.value(key);
+std::optional<Value> checked(Context& context, std::string_view key, const LogCategory& category,
+                             bool (&isRight)(const Value&) noexcept, std::string_view wanted) {
+    auto& reported = context.shared<Reported>();
+    std::optional<Value> value = capturePreferences(context).value(key);
     if (!value || isRight(*value)) {
         reported.forget(key);
     } else if (reported.isNews(key, *value)) {
@@ -88,14 +88,12 @@ PreferencesSuite capturePreferences(const Context& context) {
     return PreferencesSuite(*context.platform().preferences, std::string(kCapturePreferencesDomain));
 }
 
-std::optional<Value> numberPreference(Context& context, const PreferencesSuite& suite, std::string_view key,
-                                      const LogCategory& category) {
-    return checked(context.shared<Reported>(), suite, key, category, isNumberOrItsText, "a number");
+std::optional<Value> numberPreference(Context& context, std::string_view key, const LogCategory& category) {
+    return checked(context, key, category, isNumberOrItsText, "a number");
 }
 
-std::optional<Value> flagPreference(Context& context, const PreferencesSuite& suite, std::string_view key,
-                                    const LogCategory& category) {
-    return checked(context.shared<Reported>(), suite, key, category, isFlagOrItsText, "true or false");
+std::optional<Value> flagPreference(Context& context, std::string_view key, const LogCategory& category) {
+    return checked(context, key, category, isFlagOrItsText, "true or false");
 }
 
 } // namespace tamblo

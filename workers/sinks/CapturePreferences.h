@@ -17,9 +17,9 @@ inline constexpr std::string_view kCapturePreferencesDomain = "com.vandra.tamblo
 /// A value that is to be read as a number, or as a flag, if it is set. One of another kind, such as an array,
 /// is answered as well, and reads as `Value` has it; the category gets one error line for it, and another
 /// only when the value has changed. Any thread.
-[[nodiscard]] std::optional<Value> numberPreference(Context& context, const PreferencesSuite& suite,
-                                                    std::string_view key, const LogCategory& category);
-[[nodiscard]] std::optional<Value> flagPreference(Context& context, const PreferencesSuite& suite,
-                                                  std::string_view key, const LogCategory& category);
+[[nodiscard]] std::optional<Value> numberPreference(Context& context, std::string_view key,
+                                                    const LogCategory& category);
+[[nodiscard]] std::optional<Value> flagPreference(Context& context, std::string_view key,
+                                                  const LogCategory& category);
 
 } // namespace tamblo

@@ -1,5 +1,6 @@
 #include "workers/sinks/LinkmeterAgent.h"
 
+#include "base/WhileAlive.h"
 #include "util/Log.h"
 #include "util/MessageKeys.h"
 #include "workers/sinks/LinkmeterSummary.h"
@@ -16,131 +17,102 @@ constexpr std::chrono::seconds kBackendPatience{9};
 /// A summary of more messages than this is no quick work.
 constexpr std::size_t kQuickSummary = 100;
 
-constexpr int kClientType = 19;
-constexpr float kClientVersion = 2.1F;
-constexpr std::string_view kClientName = "com.vandra.tamblo";
-constexpr std::string_view kSessionIDKey = "ZRReportingSessionID";
 constexpr AudioEventCategory kSummaryCategory = 0xFFFFFFFF;
 constexpr AudioEventType kSummaryType = 0xFFFF;
 
-Dictionary sessionInfo(const LinkmeterAgent::Identity& identity, const std::string& token) {
-    const bool shouldBatch =
-        ZRReportingSessionRtcWorker::shouldBatchLinkmeterEventsForServiceType(identity.serviceType);
-    Dictionary info{
-        {linkmeter::ClientType, kClientType},        {linkmeter::ClientVersion, kClientVersion},
-        {linkmeter::SessionID, identity.reporterID}, {linkmeter::BatchEvent, shouldBatch},
-        {linkmeter::HierarchyToken, token},          {linkmeter::ContainsRealtimeEvents, !shouldBatch},
-    };
-    if (const Value* name = identity.configuration.find(ZRReportingApplicationName)) {
-        info.set(linkmeter::ClientBundleID, *name);
-    }
-    return info;
-}
-
-Dictionary userInfo(const LinkmeterAgent::Identity& identity) {
-    Dictionary info{
-        {linkmeter::ClientName, kClientName},
-        {kSessionIDKey, identity.reporterID},
-        {linkmeter::ServiceName, identity.serviceName},
-    };
-    info.merge(identity.configuration);
-    return info;
-}
-
 } // namespace
 
-void LinkmeterAgent::start(Identity identity) {
-    post({[identity = std::move(identity)](LinkmeterAgent& agent) { agent.setUp(identity); }});
-}
-
-void LinkmeterAgent::send(Message message) {
-    post({[message = std::move(message)](LinkmeterAgent& agent) mutable {
-        agent.handle(std::move(message));
-    }});
-}
-
-void LinkmeterAgent::stop(std::vector<MessageRef> messages, AudioServiceType serviceType,
-                          ReporterID reporterID) {
-    const Pace pace = messages.size() > kQuickSummary ? Pace::mayBlock : Pace::quick;
-    post({[messages = std::move(messages), serviceType, reporterID](LinkmeterAgent& agent) {
-              agent.finish(messages, serviceType, reporterID);
-          },
-          pace, true});
-}
-
-void LinkmeterAgent::post(Piece piece) {
+template <typename Piece> void LinkmeterAgent::post(Piece piece, Pace pace) {
     if (linkmeterQueue_ == nullptr) {
         linkmeterQueue_ =
             context_.platform().workQueues->makeSerialQueue("com.vandra.tamblo.session.linkmeter");
         linkmeterQueue_->setBatchEnd([&service = *context_.platform().callQuality] { service.commit(); });
     }
-    const std::lock_guard held(mutex_);
-    if (piece.isStop) {
-        ++stopsPosted_;
-        if (wait_ == Wait::waiting) {
-            self_ = shared_from_this();
+    linkmeterQueue_->post(
+        [self = shared_from_this(), piece = std::move(piece)]() mutable {
+            self->settle();
+            if (!self->isDropped_) {
+                piece(*self);
+            }
+        },
+        pace);
+}
+
+void LinkmeterAgent::start(Dictionary sessionInfo, Dictionary userInfo) {
+    post([sessionInfo = std::move(sessionInfo), userInfo = std::move(userInfo)](
+             LinkmeterAgent& agent) mutable { agent.setUp(std::move(sessionInfo), userInfo); });
+}
+
+void LinkmeterAgent::send(Message message) {
+    post([message = std::move(message)](LinkmeterAgent& agent) mutable {
+        if (agent.linkmeterSessionStarted_) {
+            agent.sendMessage(std::move(message));
+        } else {
+            log::standard(ZRReportingSessionLinkmeterCategory(), "Session never started. {}",
+                          "handleMessage");
         }
+    });
+}
+
+void LinkmeterAgent::stop(std::vector<MessageRef> messages, AudioServiceType serviceType,
+                          ReporterID reporterID) {
+    {
+        const MutexLock held(mutex_);
+        ++stopsToCome_;
     }
-    const Pace pace = piece.pace;
-    posted_.push_back(std::move(piece));
-    if (!std::exchange(isQueued_, true)) {
-        handToQueue(pace);
+    const Pace pace = messages.size() > kQuickSummary ? Pace::mayBlock : Pace::quick;
+    post([messages = std::move(messages), serviceType,
+          reporterID](LinkmeterAgent& agent) { agent.finish(messages, serviceType, reporterID); },
+         pace);
+}
+
+void LinkmeterAgent::abandon() {
+    const MutexLock held(mutex_);
+    isAbandoned_ = true;
+    if (wait_ == Wait::waiting && stopsToCome_ == 0) {
+        isDropped_ = true;
+        timeOut_.reset();
+        linkmeterQueue_->resume();
     }
 }
 
-void LinkmeterAgent::handToQueue(Pace pace) {
-    linkmeterQueue_->post([self = shared_from_this(), pace] { self->run(pace); }, pace);
-}
-
-void LinkmeterAgent::run(Pace pace) {
-    while (mayGoOn(pace)) {
-        Piece piece = std::move(taken_[nextTaken_]);
-        ++nextTaken_;
-        piece.work(*this);
-    }
-}
-
-bool LinkmeterAgent::mayGoOn(Pace pace) {
-    if (isWaiting_ || (nextTaken_ == taken_.size() && !takePieces())) {
-        return false;
-    }
-    if (pace == Pace::quick && taken_[nextTaken_].pace == Pace::mayBlock) {
-        const std::lock_guard held(mutex_);
-        handToQueue(Pace::mayBlock);
-        return false;
-    }
-    return true;
-}
-
-bool LinkmeterAgent::takePieces() {
-    // What the last ones took is given back: a session is idle most of the time.
-    std::vector<Piece>().swap(taken_);
-    nextTaken_ = 0;
-    const std::lock_guard held(mutex_);
-    isQueued_ = !posted_.empty();
-    taken_.swap(posted_);
-    return isQueued_;
-}
-
-void LinkmeterAgent::setUp(const Identity& identity) {
+void LinkmeterAgent::setUp(Dictionary sessionInfo, const Dictionary& userInfo) {
     const LogCategory& category = ZRReportingSessionLinkmeterCategory();
     CallQualityService& service = *context_.platform().callQuality;
     log::debug(category, "entering linkmeter {}", "start");
-    linkmeterAgentToken_ = service.NewHierarchyToken({});
-    if (!linkmeterAgentToken_) {
+    const std::optional<std::string> token = service.NewHierarchyToken({});
+    if (!token) {
         log::error(category,
                    "newHierarchyTokenFromParentToken returned nil. Will skip rtc for this session. {}",
                    "start");
         return;
     }
-    linkmeterSession_ =
-        service.CreateLinkmeterSession(sessionInfo(identity, *linkmeterAgentToken_), userInfo(identity));
-    service.StartConfiguration(linkmeterSession_, [weak = weak_from_this()](const auto& backends) {
-        if (const auto agent = weak.lock()) {
-            agent->backendsFound(backends);
-        }
-    });
+    sessionInfo.set(linkmeter::HierarchyToken, *token);
+    linkmeterSession_ = service.CreateLinkmeterSession(sessionInfo, userInfo);
+    service.StartConfiguration(linkmeterSession_,
+                               whileAlive(weak_from_this(), [](LinkmeterAgent& agent, const auto& backends) {
+                                   agent.backendsFound(backends);
+                               }));
     waitForBackends();
+    settle();
+}
+
+void LinkmeterAgent::waitForBackends() {
+    log::standard(ZRReportingSessionLinkmeterCategory(), "waiting to find backends");
+    const MutexLock held(mutex_);
+    if (signals_ != 0) {
+        --signals_;
+        wait_ = Wait::found;
+    } else if (isAbandoned_ && stopsToCome_ == 0) {
+        isDropped_ = true;
+    } else {
+        wait_ = Wait::waiting;
+        timeOut_ = context_.platform().workQueues->callAfter(
+            kBackendPatience, whileAlive(weak_from_this(), [number = ++waitNumber_](LinkmeterAgent& agent) {
+                agent.timeOut(number);
+            }));
+        linkmeterQueue_->suspend();
+    }
 }
 
 void LinkmeterAgent::backendsFound(const std::optional<std::vector<std::string>>& backends) {
@@ -153,43 +125,16 @@ void LinkmeterAgent::backendsFound(const std::optional<std::vector<std::string>>
     // The session has marked the worker itself started when it started it. To mark it here, which may be
     // after its stop, would keep the session's next start from setting up anew.
     linkmeterSessionStarted_ = backends.has_value();
-    signal();
-}
-
-void LinkmeterAgent::waitForBackends() {
-    log::standard(ZRReportingSessionLinkmeterCategory(), "waiting to find backends");
-    std::unique_lock held(mutex_);
-    if (signals_ != 0) {
-        --signals_;
-        held.unlock();
-        finishSetUp(false);
-        return;
-    }
-    wait_ = Wait::waiting;
-    const std::uint64_t number = ++waitNumber_;
-    if (stopsPosted_ != 0) {
-        self_ = shared_from_this();
-    }
-    held.unlock();
-    isWaiting_ = true;
-    timeOut_ = context_.platform().workQueues->callAfter(kBackendPatience, [weak = weak_from_this(), number] {
-        if (const auto agent = weak.lock()) {
-            agent->timeOut(number);
-        }
-    });
-}
-
-void LinkmeterAgent::signal() {
-    const std::lock_guard held(mutex_);
+    const MutexLock held(mutex_);
     if (wait_ == Wait::waiting) {
-        endWait(Wait::signalled);
+        endWait(Wait::found);
     } else {
         ++signals_;
     }
 }
 
 void LinkmeterAgent::timeOut(std::uint64_t waitNumber) {
-    const std::lock_guard held(mutex_);
+    const MutexLock held(mutex_);
     if (wait_ == Wait::waiting && waitNumber_ == waitNumber) {
         endWait(Wait::timedOut);
     }
@@ -197,41 +142,29 @@ void LinkmeterAgent::timeOut(std::uint64_t waitNumber) {
 
 void LinkmeterAgent::endWait(Wait outcome) {
     wait_ = outcome;
-    linkmeterQueue_->post([self = shared_from_this()] { self->resume(); }, Pace::mayBlock);
-    self_.reset();
+    linkmeterQueue_->resume();
+    linkmeterQueue_->post([self = shared_from_this()] { self->settle(); });
 }
 
-void LinkmeterAgent::resume() {
-    std::unique_lock held(mutex_);
+void LinkmeterAgent::settle() {
+    MutexLock held(mutex_);
+    if (wait_ == Wait::none || wait_ == Wait::waiting) {
+        return;
+    }
     const bool isTimedOut = std::exchange(wait_, Wait::none) == Wait::timedOut;
-    held.unlock();
-    isWaiting_ = false;
     timeOut_.reset();
-    finishSetUp(isTimedOut);
-    run(Pace::mayBlock);
-}
-
-void LinkmeterAgent::finishSetUp(bool isTimedOut) {
+    held.unlock();
     const LogCategory& category = ZRReportingSessionLinkmeterCategory();
     if (isTimedOut) {
         // Back ends that are found later still turn the worker on. It then has no session to send to, and
         // what it sends is lost quietly; this is meant.
         log::standard(category, "timed out waiting for backends");
         linkmeterSession_.reset();
-        linkmeterAgentToken_.reset();
     } else if (linkmeterSessionStarted_) {
         log::standard(category, "continuing with backends!");
     } else {
         log::standard(category, "failed to find backend");
     }
-}
-
-void LinkmeterAgent::handle(Message message) {
-    if (!linkmeterSessionStarted_) {
-        log::standard(ZRReportingSessionLinkmeterCategory(), "Session never started. {}", "handleMessage");
-        return;
-    }
-    sendMessage(std::move(message));
 }
 
 void LinkmeterAgent::sendMessage(Message message) {
@@ -260,8 +193,8 @@ void LinkmeterAgent::finish(const std::vector<MessageRef>& messages, AudioServic
                             ReporterID reporterID) {
     const LogCategory& category = ZRReportingSessionLinkmeterCategory();
     {
-        const std::lock_guard held(mutex_);
-        --stopsPosted_;
+        const MutexLock held(mutex_);
+        --stopsToCome_;
     }
     if (!linkmeterSessionStarted_) {
         log::standard(category, "Session never started. {}", "stop");
@@ -275,7 +208,6 @@ void LinkmeterAgent::finish(const std::vector<MessageRef>& messages, AudioServic
         context_.platform().callQuality->FlushMessages(linkmeterSession_);
     }
     linkmeterSession_.reset();
-    linkmeterAgentToken_.reset();
     linkmeterSessionStarted_ = false;
     log::debug(category, "stopping and setting session to nil");
 }

@@ -1,8 +1,7 @@
 #pragma once
 
-#include "base/UniqueFunction.h"
+#include "base/Mutex.h"
 #include "platform/CallQualityService.h"
-#include "platform/WorkQueue.h"
 #include "platform/ZRReportingServiceProtocol.h"
 #include "session/ZRReportingSessionMessage.h"
 #include "util/AudioEvents.h"
@@ -12,33 +11,20 @@
 #include <cstddef>
 #include <cstdint>
 #include <memory>
-#include <mutex>
 #include <optional>
 #include <string>
-#include <string_view>
 #include <vector>
 
 namespace tamblo {
 
-/// What of one session is done on the call-quality worker's own queue: setting up, sending, stopping.
+/// What of one session is done on the call-quality worker's own queue: setting up, sending, stopping. Setting
+/// up waits, at most nine seconds, until the service has found its back ends. No thread does: the queue is
+/// suspended, and the completion, or a delayed call, has it go on.
 ///
-/// Setting up waits, at most nine seconds, until the service has found its back ends, and everything behind
-/// it waits along. No thread does: while the agent waits its pieces stay in its list, and the completion, or
-/// a delayed call, has them run. The list is also what keeps ten thousand sessions small; the serial queue is
-/// given one piece whenever the list gets its first.
-///
-/// Owned by the worker. Pieces that may run hold the agent, so they run after the worker has gone. An agent
-/// that waits is held by nobody else, unless a stop waits with it: a session that was dropped leaves nothing
-/// behind, one that was stopped gets its summary, at the latest when the wait is over.
+/// What is posted holds the agent, and runs after the worker has gone; the agent of a session that was
+/// dropped without a stop waits for nothing, and what is left to do for it is nothing.
 class LinkmeterAgent : public std::enable_shared_from_this<LinkmeterAgent> {
 public:
-    /// What the service is told of the session.
-    struct Identity {
-        ReporterID reporterID;
-        AudioServiceType serviceType;
-        std::string serviceName;
-        Dictionary configuration;
-    };
     struct Message {
         Dictionary payload;
         AudioEventCategory category;
@@ -49,43 +35,30 @@ public:
     LinkmeterAgent(const LinkmeterAgent&) = delete;
     LinkmeterAgent& operator=(const LinkmeterAgent&) = delete;
 
-    // Each posts its piece, without blocking. One thread at a time.
-    void start(Identity identity);
+    // Each posts its work, without blocking. One thread at a time.
+    /// With what the service is told of the session.
+    void start(Dictionary sessionInfo, Dictionary userInfo);
     void send(Message message);
     /// The messages are nobody else's.
     void stop(std::vector<MessageRef> messages, AudioServiceType serviceType, ReporterID reporterID);
-
-    /// Whether there is a session with back ends. Any thread.
-    [[nodiscard]] bool getLinkmeterStartedState() const noexcept { return linkmeterSessionStarted_; }
+    /// The worker goes.
+    void abandon();
 
 private:
-    struct Piece {
-        /// As small as a message: nine seconds of them may wait.
-        UniqueFunction<void(LinkmeterAgent&), sizeof(Message)> work;
-        Pace pace = Pace::quick;
-        bool isStop = false;
-    };
-    enum class Wait : std::uint8_t { none, waiting, signalled, timedOut };
+    enum class Wait : std::uint8_t { none, waiting, found, timedOut };
+
+    template <typename Piece> void post(Piece piece, Pace pace = Pace::quick);
 
     // Any thread.
-    void post(Piece piece);
     void backendsFound(const std::optional<std::vector<std::string>>& backends);
-    void signal();
     void timeOut(std::uint64_t waitNumber);
-
-    // With the lock held.
-    void handToQueue(Pace pace);
-    void endWait(Wait outcome);
+    void endWait(Wait outcome) TAMBLO_REQUIRES(mutex_);
 
     // On the queue.
-    void run(Pace pace);
-    [[nodiscard]] bool mayGoOn(Pace pace);
-    [[nodiscard]] bool takePieces();
-    void setUp(const Identity& identity);
+    void setUp(Dictionary sessionInfo, const Dictionary& userInfo);
     void waitForBackends();
-    void resume();
-    void finishSetUp(bool isTimedOut);
-    void handle(Message message);
+    /// Before whatever comes after a wait: what the wait has come to.
+    void settle();
     void sendMessage(Message message);
     void finish(const std::vector<MessageRef>& messages, AudioServiceType serviceType, ReporterID reporterID);
     void sendSummary(const std::vector<MessageRef>& messages, AudioServiceType serviceType,
@@ -94,25 +67,19 @@ private:
     const Context& context_;
     std::unique_ptr<SerialQueue> linkmeterQueue_; ///< made by the first post
     std::atomic<bool> linkmeterSessionStarted_{false};
+    std::atomic<bool> isDropped_{false}; ///< nobody will hear of the session any more
 
-    // Touched by the queue's pieces alone.
-    CallQualityService::SessionRef linkmeterSession_;
-    std::optional<std::string> linkmeterAgentToken_;
-    std::unique_ptr<DelayedCall> timeOut_;
-    std::vector<Piece> taken_;
-    std::size_t nextTaken_ = 0;
-    bool isWaiting_ = false;
+    CallQualityService::SessionRef linkmeterSession_; ///< touched on the queue alone
 
-    std::mutex mutex_; ///< guards what follows
-    std::vector<Piece> posted_;
-    bool isQueued_ = false;       ///< the queue has a piece, or a wait will give it one
-    std::size_t stopsPosted_ = 0; ///< that have not run
-    Wait wait_ = Wait::none;
-    std::uint64_t waitNumber_ = 0;
+    Mutex mutex_;
+    bool isAbandoned_ TAMBLO_GUARDED_BY(mutex_) = false;
+    std::size_t stopsToCome_ TAMBLO_GUARDED_BY(mutex_) = 0;
+    Wait wait_ TAMBLO_GUARDED_BY(mutex_) = Wait::none;
+    std::uint64_t waitNumber_ TAMBLO_GUARDED_BY(mutex_) = 0;
+    std::unique_ptr<DelayedCall> timeOut_ TAMBLO_GUARDED_BY(mutex_);
     /// The count of the semaphore that the wait is for. It lasts: back ends that come too late for one run
     /// of the session are there at once for the next.
-    unsigned signals_ = 0;
-    std::shared_ptr<LinkmeterAgent> self_; ///< while a stop waits
+    unsigned signals_ TAMBLO_GUARDED_BY(mutex_) = 0;
 };
 
 } // namespace tamblo

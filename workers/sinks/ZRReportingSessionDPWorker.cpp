@@ -148,25 +148,18 @@ void ZRReportingSessionDPWorker::capture(ZRReportingSessionMessage& message, dou
 }
 
 bool ZRReportingSessionDPWorker::getEnableFlag(Context& context, std::string_view key) {
-    const auto value =
-        told(key, flagPreference(context, getUserDefaults(context), key, ZRReportingDPLogCategory()));
+    const auto value = told(key, flagPreference(context, key, ZRReportingDPLogCategory()));
     return value && value->boolValue();
 }
 
 std::int32_t ZRReportingSessionDPWorker::getRunTimeDefaults(Context& context, std::string_view key) {
-    const auto value =
-        told(key, numberPreference(context, getUserDefaults(context), key, ZRReportingDPLogCategory()));
+    const auto value = told(key, numberPreference(context, key, ZRReportingDPLogCategory()));
     return integerOf(value ? &*value : nullptr);
 }
 
 double ZRReportingSessionDPWorker::getDoubleRunTimeDefaults(Context& context, std::string_view key) {
-    const auto value =
-        told(key, numberPreference(context, getUserDefaults(context), key, ZRReportingDPLogCategory()));
+    const auto value = told(key, numberPreference(context, key, ZRReportingDPLogCategory()));
     return value ? value->doubleValue() : 0.0;
-}
-
-PreferencesSuite ZRReportingSessionDPWorker::getUserDefaults(const Context& context) {
-    return capturePreferences(context);
 }
 
 } // namespace tamblo

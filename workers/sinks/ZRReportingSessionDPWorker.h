@@ -1,6 +1,5 @@
 #pragma once
 
-#include "platform/Preferences.h"
 #include "session/ZRReportingSessionWorkerProtocol.h"
 
 #include <cstdint>
@@ -32,7 +31,6 @@ public:
     [[nodiscard]] static bool getEnableFlag(Context& context, std::string_view key);
     [[nodiscard]] static std::int32_t getRunTimeDefaults(Context& context, std::string_view key);
     [[nodiscard]] static double getDoubleRunTimeDefaults(Context& context, std::string_view key);
-    [[nodiscard]] static PreferencesSuite getUserDefaults(const Context& context);
 
 private:
     struct RunTimeValues;

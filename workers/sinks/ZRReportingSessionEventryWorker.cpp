@@ -6,62 +6,74 @@
 #include "util/AudioEvents.h"
 
 #include <cstdint>
+#include <string>
 #include <utility>
 
 namespace tamblo {
 
 namespace {
 
-struct EventNames {
-    std::string general;
-    std::string ofService;
+struct Event {
+    std::string name;
+    bool isInUse = false;
 };
 
-EventNames makeEventNames(AudioServiceType serviceType, AudioEventCategory category, AudioEventType type) {
+/// What a message of one kind becomes, in sessions of one service type.
+struct Events {
+    Event general;
+    Event ofService;
+    std::uint64_t generation = 0; ///< of the service's answers to which of them are in use
+};
+
+Events makeEvents(AnalyticsEventService& service, AudioServiceType serviceType, AudioEventCategory category,
+                  AudioEventType type) {
+    const std::uint64_t generation = service.inUseGeneration();
     const std::string categoryName = ZRReportingUtilityCategoryString(category);
     const std::string_view typeName = ZRReportingUtilityTypeString(type);
     const std::string_view serviceName = ZRReportingUtilityGenerateServiceNameFromServiceType(serviceType);
-    return {formatted("com.vandra.tamblo.{}.{}", categoryName, typeName),
-            formatted("com.vandra.{}.{}.{}", serviceName, categoryName, typeName)};
+    const std::string general = formatted("com.vandra.tamblo.{}.{}", categoryName, typeName);
+    const std::string ofService = formatted("com.vandra.{}.{}.{}", serviceName, categoryName, typeName);
+    return {
+        {general, service.isEventInUse(general)}, {ofService, service.isEventInUse(ofService)}, generation};
 }
 
 } // namespace
 
-/// The names of the events that sessions have of late; the names of a device's events are few.
-class ZRReportingSessionEventryWorker::EventNameCache {
+/// The events that sessions have of late, with the answers to whether they are in use.
+class ZRReportingSessionEventryWorker::EventCache {
 public:
-    const EventNames& get(AudioServiceType serviceType, AudioEventCategory category, AudioEventType type) {
+    const Events& get(AnalyticsEventService& service, AudioServiceType serviceType,
+                      AudioEventCategory category, AudioEventType type) {
         // Service types without a name are one; the key is then 54 bits, and never 0.
         constexpr std::uint64_t kNoName = 31;
-        const std::uint64_t service = serviceType <= AudioServiceTypeSystemSounds ? serviceType : kNoName;
-        const std::uint64_t key = ((service + 1) << 48U) | (std::uint64_t{category} << 16U) | type;
-        return names_.get(key, [&] { return makeEventNames(serviceType, category, type); });
+        const std::uint64_t number = serviceType <= AudioServiceTypeSystemSounds ? serviceType : kNoName;
+        const std::uint64_t key = ((number + 1) << 48U) | (std::uint64_t{category} << 16U) | type;
+        const std::uint64_t generation = service.inUseGeneration();
+        const Events* known =
+            events_.find(key, [generation](const Events& events) { return events.generation == generation; });
+        return known != nullptr ? *known : events_.put(key, makeEvents(service, serviceType, category, type));
     }
 
 private:
-    BoundedCache<EventNames> names_;
+    BoundedCache<Events> events_;
 };
 
 ZRReportingSessionEventryWorker::ZRReportingSessionEventryWorker(Context& context,
                                                                  std::weak_ptr<ZRReportingSession> session)
     : ZRReportingSessionWorkerConsumerProtocol(context, std::move(session)),
-      names_(context.shared<EventNameCache>()) {}
+      cache_(context.shared<EventCache>()) {}
 
 void ZRReportingSessionEventryWorker::handleMessage(const MessageRef& message) {
     const std::shared_ptr<ZRReportingSession> owner = session();
     if (owner == nullptr) {
         return;
     }
-    const EventNames& names = names_.get(owner->serviceType(), message->category(), message->type());
-    offer(names.general, *message);
-    offer(names.ofService, *message);
-}
-
-void ZRReportingSessionEventryWorker::offer(const std::string& eventName,
-                                            const ZRReportingSessionMessage& message) const {
     AnalyticsEventService& service = *platform().analyticsEvents;
-    if (service.isEventInUse(eventName)) {
-        service.sendEventLazy(eventName, [&message] { return message.payload(); });
+    const Events& events = cache_.get(service, owner->serviceType(), message->category(), message->type());
+    for (const Event* event : {&events.general, &events.ofService}) {
+        if (event->isInUse) {
+            service.sendEventLazy(event->name, [&message] { return message->payload(); });
+        }
     }
 }
 

@@ -3,7 +3,6 @@
 #include "session/ZRReportingSessionWorkerProtocol.h"
 
 #include <memory>
-#include <string>
 
 namespace tamblo {
 
@@ -17,11 +16,9 @@ public:
     void handleMessage(const MessageRef& message) override;
 
 private:
-    class EventNameCache;
+    class EventCache;
 
-    void offer(const std::string& eventName, const ZRReportingSessionMessage& message) const;
-
-    EventNameCache& names_;
+    EventCache& cache_;
 };
 
 } // namespace tamblo

@@ -30,6 +30,15 @@ std::optional<Value> appNameOf(const std::shared_ptr<ZRReportingSession>& sessio
                               : std::optional(ZRReportingUtilityRetrieveAppName(session->configuration()));
 }
 
+/// Whether the payload has the key; the event then has its value.
+bool copyValue(Dictionary& event, std::string_view name, const Dictionary& payload, std::string_view key) {
+    const Value* value = payload.find(key);
+    if (value != nullptr) {
+        event.set(name, *value);
+    }
+    return value != nullptr;
+}
+
 } // namespace
 
 void ZRReportingSessionJouleryWorker::handleMessage(const MessageRef& message) {
@@ -43,20 +52,17 @@ void ZRReportingSessionJouleryWorker::handleMessage(const MessageRef& message) {
 }
 
 void ZRReportingSessionJouleryWorker::handleEngineOnDurationMessage(const Dictionary& payload) const {
-    const Value* duration = payload.find(kEngineOnTime);
-    if (duration == nullptr) {
+    Dictionary event;
+    if (!copyValue(event, "EngineOnDuration", payload, kEngineOnTime)) {
         return;
     }
-    Dictionary event{{"EngineOnDuration", *duration}};
     const auto appName = appNameOf(session());
     if (appName && !(*appName == Value("Unknown"))) {
         event.set(kEventApplicationName, *appName);
     } else {
         log::error(ZRReportingJouleryCategory(), "failed to get app name for joulery");
     }
-    if (const Value* timestamp = payload.find(ZRReportingInternalEventEpochTime)) {
-        event.set(kEventTimestampEnd, *timestamp);
-    } else {
+    if (!copyValue(event, kEventTimestampEnd, payload, ZRReportingInternalEventEpochTime)) {
         log::error(ZRReportingJouleryCategory(), "failed to get ZRReporting timestamp for joulery");
     }
     post(platform(), "Korvell_Haptics_EngineOnDuration", event);
@@ -73,22 +79,16 @@ void ZRReportingSessionJouleryWorker::handleEngineStateMessage(const Dictionary&
     if (const auto appName = appNameOf(session())) {
         event.set(kEventApplicationName, *appName);
     }
-    if (const Value* timestamp = payload.find(ZRReportingInternalEventEpochTime)) {
-        event.set(kEventTimestampEnd, *timestamp);
-    }
+    (void)copyValue(event, kEventTimestampEnd, payload, ZRReportingInternalEventEpochTime);
     post(platform(), "Korvell_Haptics_ClientStatus", event);
 }
 
 void ZRReportingSessionJouleryWorker::handleLongRunningMessage(const Dictionary& payload) const {
-    const Value* seconds = payload.find(kActiveHardwareTime);
-    if (seconds == nullptr) {
-        return;
+    Dictionary event;
+    if (copyValue(event, kActiveHardwareTime, payload, kActiveHardwareTime)) {
+        (void)copyValue(event, kActiveClients, payload, kActiveClients);
+        post(platform(), "LeakedHapticsSessionInfo", event);
     }
-    Dictionary event{{kActiveHardwareTime, *seconds}};
-    if (const Value* clients = payload.find(kActiveClients)) {
-        event.set(kActiveClients, *clients);
-    }
-    post(platform(), "LeakedHapticsSessionInfo", event);
 }
 
 } // namespace tamblo

@@ -4,9 +4,17 @@
 #include "session/ZRReportingSession.h"
 #include "util/AudioEvents.h"
 
+#include <chrono>
 #include <utility>
 
 namespace tamblo {
+
+namespace {
+
+/// Messages that come sooner after a recorded one are left out.
+constexpr std::chrono::seconds kLeastInterval{1};
+
+} // namespace
 
 void ZRReportingSessionMemoryLogWorker::handleMessage(const MessageRef& message) {
     if (message == nullptr || message->type() != AudioEventTypeMemoryLog) {
@@ -14,7 +22,9 @@ void ZRReportingSessionMemoryLogWorker::handleMessage(const MessageRef& message)
     }
     const WallTime now = platform().clock->now();
     const auto ownSession = session();
-    if (ownSession == nullptr || !isDue(now)) {
+    // A clock that was set back holds nothing up.
+    const bool isSoon = lastLogged_ && now >= *lastLogged_ && now - *lastLogged_ < kLeastInterval;
+    if (ownSession == nullptr || isSoon) {
         return;
     }
     lastLogged_ = now;
@@ -22,10 +32,6 @@ void ZRReportingSessionMemoryLogWorker::handleMessage(const MessageRef& message)
     processes.add(ownSession->processIdentifiers());
     processes.addNamedBy(message->payload());
     platform().memoryLog->logMemory(ownSession->reporterID(), std::move(processes).take());
-}
-
-bool ZRReportingSessionMemoryLogWorker::isDue(WallTime now) const noexcept {
-    return !lastLogged_ || now < *lastLogged_ || now - *lastLogged_ >= kLeastInterval;
 }
 
 } // namespace tamblo

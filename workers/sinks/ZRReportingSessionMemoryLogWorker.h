@@ -3,7 +3,6 @@
 #include "platform/Clock.h"
 #include "session/ZRReportingSessionWorkerProtocol.h"
 
-#include <chrono>
 #include <optional>
 
 namespace tamblo {
@@ -14,16 +13,10 @@ class ZRReportingSessionMemoryLogWorker final : public ZRReportingSessionWorkerC
 public:
     using ZRReportingSessionWorkerConsumerProtocol::ZRReportingSessionWorkerConsumerProtocol;
 
-    /// Messages that come sooner after a recorded one are left out.
-    static constexpr std::chrono::seconds kLeastInterval{1};
-
     void handleMessage(const MessageRef& message) override;
     [[nodiscard]] bool handleRedundantMessages() const override { return true; }
 
 private:
-    /// Whether enough time has passed. A clock that was set back counts as that.
-    [[nodiscard]] bool isDue(WallTime now) const noexcept;
-
     std::optional<WallTime> lastLogged_;
 };
 

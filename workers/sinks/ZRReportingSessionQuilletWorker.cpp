@@ -44,24 +44,20 @@ ZRReportingSessionQuilletWorker::initWithSession(Context& context,
     if (!context.isInternalBuild()) {
         return nullptr;
     }
-    PreferencesSuite defaults = capturePreferences(context);
-    const auto backOff = numberPreference(context, defaults, kBackOffKey, ZRReportingSessionCategory());
+    const auto backOff = numberPreference(context, kBackOffKey, ZRReportingSessionCategory());
     if (!backOff) {
         log::debug(ZRReportingSessionCategory(), "{} default not set. Skipping worker. reporterID={}",
                    kBackOffKey, session->reporterID());
         return nullptr;
     }
     return std::make_shared<ZRReportingSessionQuilletWorker>(
-        context, session, std::move(defaults), std::chrono::duration<double>(backOff->doubleValue()));
+        context, session, std::chrono::duration<double>(backOff->doubleValue()));
 }
 
 ZRReportingSessionQuilletWorker::ZRReportingSessionQuilletWorker(Context& context,
                                                                  std::weak_ptr<ZRReportingSession> session,
-                                                                 PreferencesSuite defaults,
                                                                  std::chrono::duration<double> backOffTime)
-    : ZRReportingSessionWorkerConsumerProtocol(context, std::move(session)),
-      defaults_(std::move(defaults)),
-      backOffTime_(backOffTime) {}
+    : ZRReportingSessionWorkerConsumerProtocol(context, std::move(session)), backOffTime_(backOffTime) {}
 
 void ZRReportingSessionQuilletWorker::handleMessage(const MessageRef& message) {
     if (message == nullptr || !interestedInMessage(*message)) {
@@ -105,14 +101,14 @@ bool ZRReportingSessionQuilletWorker::interestedInMessage(const ZRReportingSessi
 bool ZRReportingSessionQuilletWorker::hasRunInTimeframe(std::chrono::duration<double> backOff,
                                                         std::string_view defaultsKey) {
     const double now = secondsSince1970(platform().clock->now());
-    const auto lastRun = numberPreference(context(), defaults_, defaultsKey, ZRReportingSessionCategory());
+    const auto lastRun = numberPreference(context(), defaultsKey, ZRReportingSessionCategory());
     if (lastRun && lastRun->doubleValue() > now - backOff.count()) {
         log::debug(ZRReportingSessionCategory(), "Quillet has run. key={} lastRun={}", defaultsKey, *lastRun);
         return true;
     }
     log::debug(ZRReportingSessionCategory(), "Quillet has not run. key={} backoffSeconds={}", defaultsKey,
                backOff.count());
-    const std::optional<std::string> failure = defaults_.setValue(defaultsKey, now);
+    const std::optional<std::string> failure = capturePreferences(context()).setValue(defaultsKey, now);
     if (failure && !cannotStore_) {
         log::error(ZRReportingSessionCategory(),
                    "preference {} {}: {}; the time of the draft is forgotten when the service ends",

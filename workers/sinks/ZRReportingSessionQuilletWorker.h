@@ -1,7 +1,6 @@
 #pragma once
 
 #include "platform/BugReportDraftingService.h"
-#include "platform/Preferences.h"
 #include "session/ZRReportingSessionWorkerProtocol.h"
 
 #include <chrono>
@@ -20,7 +19,7 @@ namespace tamblo {
 class ZRReportingSessionQuilletWorker final : public ZRReportingSessionWorkerConsumerProtocol {
 public:
     ZRReportingSessionQuilletWorker(Context& context, std::weak_ptr<ZRReportingSession> session,
-                                    PreferencesSuite defaults, std::chrono::duration<double> backOffTime);
+                                    std::chrono::duration<double> backOffTime);
     /// Null where no drafts are wanted.
     [[nodiscard]] static std::shared_ptr<ZRReportingSessionWorkerProtocol>
     initWithSession(Context& context, const std::shared_ptr<ZRReportingSession>& session);
@@ -36,7 +35,6 @@ public:
     [[nodiscard]] static BugReportDraft tikletDraftForTalvixXYerror();
 
 private:
-    PreferencesSuite defaults_;
     const std::chrono::duration<double> backOffTime_;
     double minimumMessageTime_ = -1.0; ///< seconds since 1970; armed when above 0
     bool hasRun_ = false;

@@ -1,6 +1,7 @@
 #include "workers/sinks/ZRReportingSessionRtcWorker.h"
 
 #include "session/ZRReportingSession.h"
+#include "util/MessageKeys.h"
 
 #include <algorithm>
 #include <iterator>
@@ -9,6 +10,40 @@
 #include <vector>
 
 namespace tamblo {
+
+namespace {
+
+constexpr int kClientType = 19;
+constexpr float kClientVersion = 2.1F;
+constexpr std::string_view kClientName = "com.vandra.tamblo";
+constexpr std::string_view kSessionIDKey = "ZRReportingSessionID";
+
+/// But for the token.
+Dictionary sessionInfo(const ZRReportingSession& session) {
+    const bool shouldBatch =
+        ZRReportingSessionRtcWorker::shouldBatchLinkmeterEventsForServiceType(session.serviceType());
+    Dictionary info{{linkmeter::ClientType, kClientType},
+                    {linkmeter::ClientVersion, kClientVersion},
+                    {linkmeter::SessionID, session.reporterID()},
+                    {linkmeter::BatchEvent, shouldBatch},
+                    {linkmeter::ContainsRealtimeEvents, !shouldBatch}};
+    if (const Value* name = session.configuration().find(ZRReportingApplicationName)) {
+        info.set(linkmeter::ClientBundleID, *name);
+    }
+    return info;
+}
+
+Dictionary userInfo(const ZRReportingSession& session) {
+    const std::string serviceName(session.serviceName());
+    Dictionary info{
+        {linkmeter::ClientName, kClientName},
+        {kSessionIDKey, session.reporterID()},
+        {linkmeter::ServiceName, session.isSingleMessageSession() ? serviceName : serviceName + "_session"}};
+    info.merge(session.configuration());
+    return info;
+}
+
+} // namespace
 
 std::shared_ptr<ZRReportingSessionWorkerProtocol>
 ZRReportingSessionRtcWorker::initWithSession(Context& context,
@@ -24,12 +59,7 @@ std::optional<bool> ZRReportingSessionRtcWorker::start() {
     if (owner == nullptr || owner->serviceType() == AudioServiceTypeTest) {
         return false;
     }
-    std::string serviceName(owner->serviceName());
-    if (!owner->isSingleMessageSession()) {
-        serviceName += "_session";
-    }
-    agent_->start(
-        {owner->reporterID(), owner->serviceType(), std::move(serviceName), owner->configuration()});
+    agent_->start(sessionInfo(*owner), userInfo(*owner));
     return true;
 }
 

@@ -21,6 +21,7 @@ public:
     [[nodiscard]] static std::shared_ptr<ZRReportingSessionWorkerProtocol>
     initWithSession(Context& context, const std::shared_ptr<ZRReportingSession>& session);
     using ZRReportingSessionWorkerConsumerProtocol::ZRReportingSessionWorkerConsumerProtocol;
+    ~ZRReportingSessionRtcWorker() override { agent_->abandon(); }
 
     /// The category's kind.
     [[nodiscard]] static constexpr std::uint16_t
@@ -31,11 +32,6 @@ public:
     shouldBatchLinkmeterEventsForServiceType(AudioServiceType serviceType) noexcept {
         return serviceType != AudioServiceTypeAPIUsage;
     }
-    /// Whether the service has a session with back ends. Any thread.
-    [[nodiscard]] bool getLinkmeterStartedState() const noexcept {
-        return agent_->getLinkmeterStartedState();
-    }
-
     std::optional<bool> start() override;
     void handleMessage(const MessageRef& message) override;
     void stop() override;

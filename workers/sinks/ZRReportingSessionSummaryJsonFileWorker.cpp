@@ -1,5 +1,6 @@
 #include "workers/sinks/ZRReportingSessionSummaryJsonFileWorker.h"
 
+#include "base/BoundedCache.h"
 #include "base/Format.h"
 #include "base/Json.h"
 #include "session/ZRReportingSession.h"
@@ -8,7 +9,6 @@
 #include "workers/ReportFileName.h"
 
 #include <map>
-#include <unordered_map>
 #include <utility>
 #include <variant>
 
@@ -25,35 +25,20 @@ constexpr std::size_t kBytesPerWrite = 256U << 10U;
 /// The names of one file's messages: the category's and the type's, and the number among those of that name.
 class ZRReportingSessionSummaryJsonFileWorker::MessageNames {
 public:
-    /// Holds until the next call.
-    [[nodiscard]] std::string_view next(const ZRReportingSessionMessage& message) {
-        Count& count = countOf(message.category(), message.type());
-        name_.assign(count.prefix);
-        appendText(name_, ++count.messages);
-        return name_;
+    [[nodiscard]] std::string next(const ZRReportingSessionMessage& message) {
+        // Several categories and types may have one name, and are then counted together.
+        const std::uint64_t key =
+            std::uint64_t{1} << 48U | std::uint64_t{message.category()} << 16U | message.type();
+        const std::string& prefix = prefixes_.get(key, [&message] {
+            return formatted("{}_{}_", ZRReportingUtilityCategoryString(message.category()),
+                             ZRReportingUtilityTypeString(message.type()));
+        });
+        return prefix + std::to_string(++counts_[prefix]);
     }
 
 private:
-    struct Count {
-        std::string prefix; ///< both names and a "_"
-        std::uint64_t messages = 0;
-    };
-
-    /// Several values may have one name, and are then counted together.
-    Count& countOf(AudioEventCategory category, AudioEventType type) {
-        Count*& known = byNumber_[std::uint64_t{category} << 16U | type];
-        if (known == nullptr) {
-            std::string prefix = formatted("{}_{}_", ZRReportingUtilityCategoryString(category),
-                                           ZRReportingUtilityTypeString(type));
-            known = &byName_[prefix];
-            known->prefix = std::move(prefix);
-        }
-        return *known;
-    }
-
-    std::map<std::string, Count> byName_;
-    std::unordered_map<std::uint64_t, Count*> byNumber_;
-    std::string name_;
+    BoundedCache<std::string> prefixes_;
+    std::map<std::string, std::uint64_t, std::less<>> counts_;
 };
 
 std::shared_ptr<ZRReportingSessionWorkerProtocol>

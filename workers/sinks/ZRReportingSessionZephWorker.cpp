@@ -2,7 +2,6 @@
 
 #include "session/ZRReportingSession.h"
 #include "util/Log.h"
-#include "workers/sinks/zeph/ZRReportingZephWorkerInstanceSSSLeaks.h"
 
 #include <array>
 #include <utility>

@@ -7,6 +7,8 @@
 
 #include <chrono>
 #include <cmath>
+#include <initializer_list>
+#include <utility>
 
 namespace tamblo {
 
@@ -80,8 +82,10 @@ private:
         return trace_.recorded.processes.empty() ? 0 : trace_.recorded.processes.front().pid;
     }
 
-    /// Begins an event with what all of them have; it goes on with its own members and `}`.
-    void event(char phase, std::string_view name, std::int64_t pid, std::int64_t track) {
+    /// One event: its numbers behind what all have, then a scope for an instant, then its arguments, if any.
+    void event(char phase, std::string_view name, std::int64_t pid, std::int64_t track,
+               std::initializer_list<std::pair<std::string_view, std::int64_t>> numbers,
+               const Dictionary& arguments = {}) {
         text_.append(isFirst_ ? "\n{\"ph\":\"" : ",\n{\"ph\":\"");
         isFirst_ = false;
         text_.append(phase);
@@ -89,6 +93,15 @@ private:
         appendJsonString(text_, name);
         number("pid", pid);
         number("tid", track);
+        for (const auto& [member, value] : numbers) {
+            number(member, value);
+        }
+        text_.append(phase == 'i' ? ",\"s\":\"p\"" : "");
+        if (!arguments.empty()) {
+            text_.append(",\"args\":");
+            appendJson(text_, arguments);
+        }
+        text_.append('}');
     }
     void number(std::string_view name, std::int64_t value) {
         text_.append(",\"");
@@ -96,26 +109,18 @@ private:
         text_.append("\":");
         text_.append(std::to_string(value));
     }
-    void arguments(const Dictionary& values) {
-        text_.append(",\"args\":");
-        appendJson(text_, values);
-    }
 
-    void name(std::string_view what, std::int64_t pid, std::int64_t track, std::string_view name) {
-        event('M', what, pid, track);
-        arguments({{"name", name}});
-        text_.append('}');
-    }
     void names() {
         const auto& processes = trace_.recorded.processes;
         for (std::size_t i = 0; i < processes.size() && i < trace_.processNames.size(); ++i) {
             if (!trace_.processNames[i].empty()) {
-                name("process_name", processes[i].pid, processes[i].pid, trace_.processNames[i]);
+                event('M', "process_name", processes[i].pid, processes[i].pid, {},
+                      {{"name", trace_.processNames[i]}});
             }
         }
         for (const Track track : {Track::session, Track::output, Track::input}) {
-            name("thread_name", clientPid(), numberOf(track),
-                 formatted("{} {}", nameOf(track), trace_.reporterID));
+            event('M', "thread_name", clientPid(), numberOf(track), {},
+                  {{"name", formatted("{} {}", nameOf(track), trace_.reporterID)}});
         }
     }
 
@@ -128,38 +133,28 @@ private:
     static std::string_view nameOf(Track track) noexcept {
         return track == Track::session ? "session" : track == Track::output ? "output" : "input";
     }
-    void slice(Track track, WallTime begin, WallTime end) {
-        event('X', nameOf(track), clientPid(), numberOf(track));
-        number("ts", microseconds(begin));
-        number("dur", microseconds(end) - microseconds(begin));
+    void slice(Track track, WallTime begin, WallTime end, const Dictionary& arguments = {}) {
+        event('X', nameOf(track), clientPid(), numberOf(track),
+              {{"ts", microseconds(begin)}, {"dur", microseconds(end) - microseconds(begin)}}, arguments);
     }
     void marks() {
-        slice(Track::session, trace_.recorded.begin, trace_.recorded.end);
-        arguments({{"reporterID", trace_.reporterID}, {"serviceName", trace_.serviceName}});
-        text_.append('}');
+        slice(Track::session, trace_.recorded.begin, trace_.recorded.end,
+              {{"reporterID", trace_.reporterID}, {"serviceName", trace_.serviceName}});
         for (const SessionTrace::Stretch& stretch : trace_.output) {
             slice(Track::output, stretch.begin, stretch.end);
-            text_.append('}');
         }
         for (const SessionTrace::Stretch& stretch : trace_.input) {
             slice(Track::input, stretch.begin, stretch.end);
-            text_.append('}');
         }
         for (const SessionTrace::Issue& issue : trace_.issues) {
-            event('i', issueName(issue), clientPid(), clientPid());
-            number("ts", microseconds(issue.time));
-            text_.append(",\"s\":\"p\"");
-            arguments({{"category", ZRReportingUtilityCategoryString(issue.category)},
-                       {"type", ZRReportingUtilityTypeString(issue.type)}});
-            text_.append('}');
+            event('i', issueName(issue), clientPid(), clientPid(), {{"ts", microseconds(issue.time)}},
+                  {{"category", ZRReportingUtilityCategoryString(issue.category)},
+                   {"type", ZRReportingUtilityTypeString(issue.type)}});
         }
     }
 
     void counter(std::string_view name, pid_t pid, const TimedSample& sample, const Dictionary& values) {
-        event('C', name, pid, pid);
-        number("ts", microseconds(sample.time));
-        arguments(values);
-        text_.append('}');
+        event('C', name, pid, pid, {{"ts", microseconds(sample.time)}}, values);
     }
     /// Totals become rates, for which there has to be a sample before.
     void counters(pid_t pid, const TimedSample* before, const TimedSample& sample) {

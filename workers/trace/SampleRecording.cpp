@@ -6,10 +6,10 @@
 namespace tamblo {
 
 SampleRecording::SampleRecording(std::span<const pid_t> processes, WallTime begin,
-                                 std::shared_ptr<const void> place)
+                                 std::shared_ptr<const void> hold)
     : last_(begin) {
     recorded_.begin = begin;
-    recorded_.place = std::move(place);
+    recorded_.hold = std::move(hold);
     for (const pid_t pid : processes) {
         recorded_.processes.emplace_back().pid = pid;
     }

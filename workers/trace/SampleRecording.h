@@ -31,7 +31,7 @@ struct RecordedSamples {
     WallTime begin;
     WallTime end;
     std::vector<Process> processes;
-    std::shared_ptr<const void> place; ///< goes when these are let go: so many may be held at a time
+    std::shared_ptr<const void> hold; ///< goes with these: so many may be held at a time
 };
 
 /// The samples of one session's processes while it is traced. The sampler fills it on its thread, tick by
@@ -49,7 +49,7 @@ public:
     static constexpr std::size_t kMostSamples = 4096;
 
     SampleRecording(std::span<const pid_t> processes, WallTime begin,
-                    std::shared_ptr<const void> place = nullptr);
+                    std::shared_ptr<const void> hold = nullptr);
 
     /// Begins a tick: the processes to look at now, none when it is left out.
     [[nodiscard]] std::vector<pid_t> nextTick();

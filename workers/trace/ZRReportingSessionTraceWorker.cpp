@@ -70,7 +70,7 @@ std::optional<bool> ZRReportingSessionTraceWorker::start() {
     if (!clients.empty() && clients.front() != processes.front()) {
         processes.insert(processes.begin(), clients.front());
     }
-    recording_ = ProcessSampler::record(context(), processes);
+    recording_ = context().shared<ProcessSampler>(platform()).record(processes);
     return recording_ != nullptr;
 }
 

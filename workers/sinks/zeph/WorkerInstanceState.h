@@ -1,6 +1,7 @@
 #pragma once
 
 #include "base/Dictionary.h"
+#include "base/Mutex.h"
 #include "platform/BugCaptureService.h"
 #include "platform/Clock.h"
 
@@ -9,10 +10,10 @@
 #include <limits>
 #include <map>
 #include <memory>
-#include <mutex>
 #include <optional>
 #include <string>
 #include <string_view>
+#include <utility>
 
 namespace tamblo {
 
@@ -24,13 +25,28 @@ namespace tamblo {
 class WorkerInstanceState {
 public:
     /// Whether a detector that has seen an interesting message now is to fire.
-    [[nodiscard]] bool isDue(WallTime now) const noexcept;
+    [[nodiscard]] bool isDue(WallTime now) const noexcept {
+        const bool isLongEnough = interestThresholdCount != 0 ||
+                                  now - interestFirstSeen.value_or(now) > interestThresholdDurationSeconds;
+        return interestedCount >= interestThresholdCount && isLongEnough &&
+               (firedCount == 0 || !oncePerSession);
+    }
     /// Begins to count anew. What was fired stays.
-    void resetInterest() noexcept;
+    void resetInterest() noexcept {
+        lastMessage.reset();
+        interestFirstSeen.reset();
+        interestedCount = 0;
+    }
 
     // Any thread.
-    [[nodiscard]] std::optional<std::string> currentZephSessionIdentifier() const;
-    void setCurrentZephSessionIdentifier(std::string identifier);
+    [[nodiscard]] std::optional<std::string> currentZephSessionIdentifier() const {
+        const MutexLock lock(mutex_);
+        return currentZephSessionIdentifier_;
+    }
+    void setCurrentZephSessionIdentifier(std::string identifier) {
+        const MutexLock lock(mutex_);
+        currentZephSessionIdentifier_ = std::move(identifier);
+    }
 
     /// At most once in the life of the state.
     bool oncePerSession = false;
@@ -47,8 +63,8 @@ public:
     std::unique_ptr<GlarnReporter> symptomReporter; ///< of the latest firing
 
 private:
-    mutable std::mutex mutex_; ///< guards what follows
-    std::optional<std::string> currentZephSessionIdentifier_;
+    mutable Mutex mutex_;
+    std::optional<std::string> currentZephSessionIdentifier_ TAMBLO_GUARDED_BY(mutex_);
 };
 
 /// The states that the detectors of a class share, in all sessions. On the thread that does their work.

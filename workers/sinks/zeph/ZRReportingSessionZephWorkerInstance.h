@@ -35,7 +35,6 @@ public:
 
     /// Null once the session is gone.
     [[nodiscard]] std::shared_ptr<ZRReportingSession> session() const noexcept { return session_.lock(); }
-    void setSession(std::weak_ptr<ZRReportingSession> session) noexcept { session_ = std::move(session); }
     /// Null for a detector that counts nothing, which then is never interested.
     [[nodiscard]] const std::shared_ptr<WorkerInstanceState>& workerState() const noexcept {
         return workerState_;
