@@ -125,7 +125,6 @@ private:
     [[nodiscard]] bool takeShortText(std::string_view& text) noexcept;
     [[nodiscard]] bool takeDouble(Value& value) noexcept;
     bool readItem(Value& value, int depth);
-    bool readFloatingPoint(const Head& head, Value& value) noexcept;
     bool readSimple(const Head& head, Value& value) noexcept;
     bool readString(const Head& head, Value& value);
     bool readKey(std::string_view& key);

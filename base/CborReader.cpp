@@ -2,9 +2,9 @@
 
 #include "base/Utf8.h"
 
+#include <array>
 #include <bit>
 #include <cmath>
-#include <cstring>
 #include <limits>
 
 namespace tamblo {
@@ -15,16 +15,12 @@ constexpr std::uint8_t kBreak = 0xFF;
 constexpr unsigned kShortText = 0x60; ///< to 0x77: a text whose length is in its first byte
 constexpr std::uint64_t kDateTag = 1;
 
-template <typename Unsigned> std::uint64_t loadBigEndian(const std::uint8_t* from) noexcept {
-    Unsigned value;
-    std::memcpy(&value, from, sizeof value);
-    if constexpr (sizeof value == 2) {
-        return __builtin_bswap16(value);
-    } else if constexpr (sizeof value == 4) {
-        return __builtin_bswap32(value);
-    } else {
-        return __builtin_bswap64(value);
+std::uint64_t loadBigEndian(const std::uint8_t* from, unsigned count) noexcept {
+    std::uint64_t value = 0;
+    for (unsigned i = 0; i < count; ++i) {
+        value = value << 8 | from[i];
     }
+    return value;
 }
 
 /// An IEEE 754 half-precision number, exactly.
@@ -46,31 +42,21 @@ float halfToSingle(std::uint16_t half) noexcept {
 } // namespace
 
 std::string_view describe(CborError error) noexcept {
-    switch (error) {
-    case CborError::none:
-        return "no error";
-    case CborError::truncated:
-        return "the item ends too early";
-    case CborError::malformed:
-        return "not well-formed";
-    case CborError::tooDeep:
-        return "nested deeper than 32";
-    case CborError::nullValue:
-        return "null or undefined is no value here";
-    case CborError::unsupportedTag:
-        return "a tag other than 1 (a date), or a date that is no number";
-    case CborError::unsupportedSimple:
-        return "a simple value other than true and false";
-    case CborError::keyNotText:
-        return "a key of a map is not text";
-    case CborError::duplicateKey:
-        return "a map holds a key twice";
-    case CborError::notUtf8:
-        return "text that is not UTF-8";
-    case CborError::integerOutOfRange:
-        return "an integer below -2^63";
-    }
-    return "unknown error";
+    constexpr std::array<std::string_view, 11> texts{
+        "no error",
+        "the item ends too early",
+        "not well-formed",
+        "nested deeper than 32",
+        "null or undefined is no value here",
+        "a tag other than 1 (a date), or a date that is no number",
+        "a simple value other than true and false",
+        "a key of a map is not text",
+        "a map holds a key twice",
+        "text that is not UTF-8",
+        "an integer below -2^63",
+    };
+    static_assert(texts.size() == static_cast<std::size_t>(CborError::integerOutOfRange) + 1);
+    return texts[static_cast<std::size_t>(error)];
 }
 
 bool CborReader::fail(CborError error) noexcept {
@@ -111,20 +97,7 @@ bool CborReader::readLongHead(Head& head) noexcept {
     if (static_cast<std::size_t>(end_ - position_) < length) {
         return fail(CborError::truncated);
     }
-    switch (length) {
-    case 1:
-        head.argument = *position_;
-        break;
-    case 2:
-        head.argument = loadBigEndian<std::uint16_t>(position_);
-        break;
-    case 4:
-        head.argument = loadBigEndian<std::uint32_t>(position_);
-        break;
-    default:
-        head.argument = loadBigEndian<std::uint64_t>(position_);
-        break;
-    }
+    head.argument = loadBigEndian(position_, length);
     position_ += length;
     const bool isReservedSimple = head.major == Type::simple && length == 1 && head.argument < 32;
     return !isReservedSimple || fail(CborError::malformed);
@@ -264,35 +237,25 @@ bool CborReader::readItem(Value& value, int depth) {
 }
 
 bool CborReader::readSimple(const Head& head, Value& value) noexcept {
-    if (head.info >= 25) {
-        return readFloatingPoint(head, value);
-    }
-    switch (head.argument) {
+    switch (head.info) {
     case 20:
-        value = Value(false);
-        return true;
     case 21:
-        value = Value(true);
+        value = Value(head.info == 21);
         return true;
     case 22:
     case 23:
         return fail(CborError::nullValue);
-    default:
-        return fail(CborError::unsupportedSimple);
-    }
-}
-
-bool CborReader::readFloatingPoint(const Head& head, Value& value) noexcept {
-    switch (head.info) {
     case 25:
         value = Value(halfToSingle(static_cast<std::uint16_t>(head.argument)));
         return true;
     case 26:
         value = Value(std::bit_cast<float>(static_cast<std::uint32_t>(head.argument)));
         return true;
-    default:
+    case 27:
         value = Value(std::bit_cast<double>(head.argument));
         return true;
+    default:
+        return fail(CborError::unsupportedSimple);
     }
 }
 
@@ -459,7 +422,7 @@ bool CborReader::takeDouble(Value& value) noexcept {
     if (end_ - position_ < 9 || *position_ != doubleHead) {
         return false;
     }
-    value = Value(std::bit_cast<double>(loadBigEndian<std::uint64_t>(position_ + 1)));
+    value = Value(std::bit_cast<double>(loadBigEndian(position_ + 1, 8)));
     position_ += 9;
     return true;
 }

@@ -19,23 +19,14 @@ char* storeBigEndian(char* to, std::uint64_t value, unsigned count) noexcept {
 
 void CborWriter::head(unsigned major, std::uint64_t argument) {
     char* const start = out_.room(9);
-    char* end = start;
-    const auto initial = [major](unsigned info) { return static_cast<char>(major << 5 | info); };
-    if (argument < 24) {
-        *end++ = initial(static_cast<unsigned>(argument));
-    } else if (argument <= 0xFF) {
-        *end++ = initial(24);
-        end = storeBigEndian(end, argument, 1);
-    } else if (argument <= 0xFFFF) {
-        *end++ = initial(25);
-        end = storeBigEndian(end, argument, 2);
-    } else if (argument <= 0xFFFFFFFF) {
-        *end++ = initial(26);
-        end = storeBigEndian(end, argument, 4);
-    } else {
-        *end++ = initial(27);
-        end = storeBigEndian(end, argument, 8);
+    char* end = start + 1;
+    unsigned info = static_cast<unsigned>(argument);
+    if (argument >= 24) {
+        const unsigned power = argument <= 0xFF ? 0 : argument <= 0xFFFF ? 1 : argument <= 0xFFFFFFFF ? 2 : 3;
+        info = 24 + power;
+        end = storeBigEndian(end, argument, 1U << power);
     }
+    *start = static_cast<char>(major << 5 | info);
     out_.commit(static_cast<std::size_t>(end - start));
 }
 

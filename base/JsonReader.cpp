@@ -181,6 +181,7 @@ bool JsonReader::readObject(std::size_t object, int depth) {
     return requireDistinctKeys(items_[object]);
 }
 
+/// Its keys one beside another, equal ones in the order of the text.
 bool JsonReader::requireDistinctKeys(const JsonItem& object) {
     members_.clear();
     for (const JsonItem* member = object.first(); member != object.end(); member = member->next()) {

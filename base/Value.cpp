@@ -103,14 +103,10 @@ template <typename Integer> Integer leadingInteger(std::string_view text, double
     }
 }
 
-bool equalsInteger(double number, std::int64_t integer) noexcept {
-    return number >= -kTwoTo63 && number < kTwoTo63 && static_cast<std::int64_t>(number) == integer &&
-           static_cast<double>(static_cast<std::int64_t>(number)) == number;
-}
-
-bool equalsUnsigned(double number, std::uint64_t integer) noexcept {
-    return number >= 0.0 && number < kTwoTo64 && static_cast<std::uint64_t>(number) == integer &&
-           static_cast<double>(static_cast<std::uint64_t>(number)) == number;
+/// `behindLast` is the power of two that follows the integer's range.
+template <typename Integer> bool equalsWhole(double number, Integer integer, double behindLast) noexcept {
+    return number >= static_cast<double>(std::numeric_limits<Integer>::min()) && number < behindLast &&
+           static_cast<Integer>(number) == integer && static_cast<double>(integer) == number;
 }
 
 bool beginsWithYes(std::string_view text) noexcept {
@@ -331,8 +327,8 @@ bool Value::numberEquals(const Value& other) const noexcept {
         return mine == theirs || (std::isnan(mine) && std::isnan(theirs));
     }
     if (isDouble(kind())) {
-        return isUnsigned(other.kind()) ? equalsUnsigned(doubleValue(), other.rawUnsigned())
-                                        : equalsInteger(doubleValue(), other.rawInteger());
+        return isUnsigned(other.kind()) ? equalsWhole(doubleValue(), other.rawUnsigned(), kTwoTo64)
+                                        : equalsWhole(doubleValue(), other.rawInteger(), kTwoTo63);
     }
     if (isDouble(other.kind())) {
         return other.numberEquals(*this);

@@ -87,27 +87,15 @@ void expectReadsAs(const std::string& hex, const Value& expected) {
 }
 
 TEST(Cbor, ReadsTheExamplesOfTheStandard) {
-    // RFC 8949, appendix A: bytes and their value in JSON, `f` behind a number of half or single precision.
+    // RFC 8949, appendix A, without what an independent implementation writes in the same way (see below):
+    // bytes and their value in JSON, `f` behind a number of half or single precision.
     constexpr std::string_view table = R"(
-        00 0  01 1  0a 10  17 23  1818 24  1819 25  1864 100  1903e8 1000  1a000f4240 1000000
-        1b000000e8d4a51000 1000000000000  1bffffffffffffffff 18446744073709551615
-        20 -1  29 -10  3863 -100  3903e7 -1000  f4 false  f5 true
-        f90000 0.0f  f98000 -0.0f  f93c00 1.0f  fb3ff199999999999a 1.1  f93e00 1.5f  f97bff 65504.0f
-        fa47c35000 100000.0f  fa7f7fffff 3.4028234663852886e+38f  fb7e37e43c8800759c 1.0e+300
-        f90001 5.960464477539063e-8f  f90400 0.00006103515625f  f9c400 -4.0f  fbc010666666666666 -4.1
-        60 ""  6161 "a"  6449455446 "IETF"  62225c "\"\\"  62c3bc "\u00fc"  63e6b0b4 "\u6c34"
-        64f0908591 "\ud800\udd51"  80 []  83010203 [1,2,3]  8301820203820405 [1,[2,3],[4,5]]
-        98190102030405060708090a0b0c0d0e0f101112131415161718181819
-            [1,2,3,4,5,6,7,8,9,10,11,12,13,14,15,16,17,18,19,20,21,22,23,24,25]
-        a0 {}  a26161016162820203 {"a":1,"b":[2,3]}  826161a161626163 ["a",{"b":"c"}]
-        a56161614161626142616361436164614461656145 {"a":"A","b":"B","c":"C","d":"D","e":"E"}
-        7f657374726561646d696e67ff "streaming"  9fff []  9f018202039f0405ffff [1,[2,3],[4,5]]
-        9f01820203820405ff [1,[2,3],[4,5]]  83018202039f0405ff [1,[2,3],[4,5]]
-        83019f0203ff820405 [1,[2,3],[4,5]]
-        9f0102030405060708090a0b0c0d0e0f101112131415161718181819ff
-            [1,2,3,4,5,6,7,8,9,10,11,12,13,14,15,16,17,18,19,20,21,22,23,24,25]
+        f90000 0.0f  f98000 -0.0f  f93c00 1.0f  f93e00 1.5f  f97bff 65504.0f  f9c400 -4.0f
+        fa47c35000 100000.0f  fa7f7fffff 3.4028234663852886e+38f  f90001 5.960464477539063e-8f
+        f90400 0.00006103515625f  64f0908591 "\ud800\udd51"  7f657374726561646d696e67ff "streaming"
+        9fff []  9f018202039f0405ffff [1,[2,3],[4,5]]  83019f0203ff820405 [1,[2,3],[4,5]]
         bf61610161629f0203ffff {"a":1,"b":[2,3]}  826161bf61626163ff ["a",{"b":"c"}]
-        bf6346756ef563416d7421ff {"Fun":true,"Amt":-2})";
+        bf6346756ef563416d7421ff {"Fun":true,"Amt":-2}  1800 0  190000 0  1a00000000 0  3800 -1)";
     const auto words = wordsOf(table);
     for (std::size_t i = 0; i + 1 < words.size(); i += 2) {
         expectReadsAs(words[i], ofJson(words[i + 1]));
@@ -234,7 +222,7 @@ TEST(Cbor, NestsToItsDepth) {
 TEST(Cbor, AgreesWithAnIndependentImplementation) {
     test::RandomValues random(7);
     for (int i = 0; i < 3000; ++i) {
-        const Value value = random.value(4, false);
+        const Value value = i == 0 ? test::integersAroundPowersOfTwo() : random.value(4, false);
         const Bytes bytes = written(value);
         EXPECT_EQ(nlohmann::json::from_cbor(bytes), test::toNlohmann(value));
         EXPECT_EQ(read(bytes), Outcome(value));
@@ -254,34 +242,23 @@ TEST(KeySetCache, SharesTheKeySetsOfOneShape) {
     KeySetCache cache;
     const auto readMap = [&cache](std::string_view hex) {
         const Bytes bytes = fromHex(hex);
-        auto map = CborReader(bytes, &cache).readDictionary(2);
-        EXPECT_TRUE(map) << hex;
-        return map.value_or(Dictionary{});
+        return CborReader(bytes, &cache).readDictionary(2).value_or(Dictionary{});
     };
     const Dictionary first = readMap("a3616101616202616303");
-    const Dictionary same = readMap("a3616105616206616307");
-    EXPECT_EQ(&first.keys(), &same.keys());
-    EXPECT_EQ(same, (Dictionary{{"a", 5}, {"b", 6}, {"c", 7}}));
-
-    const Dictionary reordered = readMap("a3616303616101616202");
-    EXPECT_EQ(reordered, first);
-    EXPECT_EQ(reordered.keys(), first.keys());
-    EXPECT_EQ(readMap("a3616309616107616208"), (Dictionary{{"a", 7}, {"b", 8}, {"c", 9}}));
-
-    // Shapes that begin like a remembered one and then differ, end early or go on.
+    EXPECT_EQ(first, (Dictionary{{"a", 1}, {"b", 2}, {"c", 3}}));
+    // Shapes that begin like a remembered one and then differ, come in another order, end early or go on.
+    EXPECT_EQ(readMap("a3616303616101616202"), first);
     EXPECT_EQ(readMap("a3616101616202616403"), (Dictionary{{"a", 1}, {"b", 2}, {"d", 3}}));
     EXPECT_EQ(readMap("a3616101616402616303"), (Dictionary{{"a", 1}, {"c", 3}, {"d", 2}}));
     EXPECT_EQ(readMap("a2616101616202"), (Dictionary{{"a", 1}, {"b", 2}}));
     EXPECT_EQ(readMap("bf616101616202616303616404ff"), (Dictionary{{"a", 1}, {"b", 2}, {"c", 3}, {"d", 4}}));
-    EXPECT_EQ(readMap("bf616101616202ff"), (Dictionary{{"a", 1}, {"b", 2}}));
-
+    EXPECT_EQ(readMap("a0"), Dictionary{});
     for (const char* twice : {"a3616101616202616203", "a3616101616202616103", "a3616101616101616303"}) {
-        const Bytes bytes = fromHex(twice);
-        CborReader reader(bytes, &cache);
-        EXPECT_EQ(reader.readDictionary(), std::nullopt);
-        EXPECT_EQ(reader.error(), CborError::duplicateKey) << twice;
+        EXPECT_EQ(read(fromHex(twice)), Outcome(CborError::duplicateKey)) << twice;
     }
-    EXPECT_EQ(&readMap("a3616105616206616307").keys(), &first.keys());
+    const Dictionary same = readMap("a3616105616206616307");
+    EXPECT_EQ(same, (Dictionary{{"a", 5}, {"b", 6}, {"c", 7}}));
+    EXPECT_EQ(&same.keys(), &first.keys());
 }
 
 TEST(KeySetCache, ReadsRightWhenItIsFull) {

@@ -3,6 +3,7 @@
 
 #include <gtest/gtest.h>
 
+#include <algorithm>
 #include <array>
 #include <charconv>
 #include <cmath>
@@ -13,6 +14,8 @@
 
 namespace tamblo {
 namespace {
+
+constexpr double kInfinity = std::numeric_limits<double>::infinity();
 
 std::string repeated(std::string_view piece, int count) {
     std::string text;
@@ -29,6 +32,9 @@ Value valueOf(const JsonItem& item) {
         if (inner->kind != JsonItem::Kind::null) {
             elements.push_back(valueOf(*inner));
             members.set(inner->key, elements.back());
+        }
+        if (item.kind == JsonItem::Kind::object) {
+            EXPECT_EQ(item.find(inner->key), inner->kind != JsonItem::Kind::null ? inner : nullptr);
         }
     }
     switch (item.kind) {
@@ -47,29 +53,46 @@ Value valueOf(const JsonItem& item) {
 void expectSameByElements(const std::string& element) {
     const std::string text = "[" + element + "]";
     const auto whole = readJson(text);
-    JsonReader elements(text);
+    JsonReader reader(text);
     Array found;
-    while (const JsonItem* item = elements.readElement()) {
+    while (const JsonItem* item = reader.readElement()) {
         if (item->kind != JsonItem::Kind::null) {
             found.push_back(valueOf(*item));
         }
     }
-    ASSERT_EQ(elements.error().has_value(), std::holds_alternative<JsonError>(whole)) << text;
-    if (elements.error()) {
-        EXPECT_EQ(elements.error()->message, std::get<JsonError>(whole).message) << text;
-        EXPECT_EQ(elements.error()->column, std::get<JsonError>(whole).column) << text;
+    EXPECT_EQ(reader.readElement(), nullptr);
+    ASSERT_EQ(reader.error().has_value(), std::holds_alternative<JsonError>(whole)) << text;
+    if (reader.error()) {
+        EXPECT_EQ(reader.error()->message, std::get<JsonError>(whole).message) << text;
+        EXPECT_EQ(reader.error()->column, std::get<JsonError>(whole).column) << text;
     } else {
         EXPECT_EQ(Value(found), std::get<Value>(whole)) << text;
     }
 }
 
-TEST(JsonWriter, WritesEveryKind) {
-    constexpr double infinity = std::numeric_limits<double>::infinity();
+std::string prettyText(std::string_view key, const Dictionary& dictionary) {
+    TextBuffer out;
+    out.append("before");
+    const auto failure = appendPrettyJson(out, key, dictionary);
+    EXPECT_EQ(out.view() == "before", failure.has_value());
+    return failure ? *failure : std::string(out.view().substr(6));
+}
+
+bool hasFloat(const nlohmann::json& json) {
+    return json.is_structured() ? std::any_of(json.begin(), json.end(), hasFloat) : json.is_number_float();
+}
+
+Value nestedArrays(int depth) {
+    Value value = Array{};
+    for (int level = 1; level < depth; ++level) {
+        value = Value(Array{std::move(value)});
+    }
+    return value;
+}
+
+TEST(JsonWriter, GivesEveryKindItsForm) {
     const std::vector<std::uint8_t> bytes{0, 0xFF, 0x10, 0x80};
     const std::vector<std::pair<Value, std::string>> rows{
-        {false, "false"},
-        {std::numeric_limits<std::int64_t>::min(), "-9223372036854775808"},
-        {std::numeric_limits<std::uint64_t>::max(), "18446744073709551615"},
         {0.0, "0.0"},
         {-0.0, "-0.0"},
         {1.0, "1.0"},
@@ -80,45 +103,24 @@ TEST(JsonWriter, WritesEveryKind) {
         {0.1F, "0.1"},
         {16777216.0F, "16777216.0"},
         {3.4028235e38F, "3.4028235e+38"},
-        {infinity, "null"},
+        {kInfinity, "null"},
         {-std::numeric_limits<float>::infinity(), "null"},
         {std::numeric_limits<double>::quiet_NaN(), "null"},
         {Value::date(1772366400.25), "\"2026-03-01T12:00:00.250Z\""},
-        {Value::date(infinity), "null"},
-        {Value::data(bytes), "\"AP8QgA==\""},
-        {"\"\\/\b\f\n\r\t", R"("\"\\/\b\f\n\r\t")"},
-        {std::string("\0\x01\x1f\x7f", 4), "\"\\u0000\\u0001\\u001f\x7f\""},
-        {"12345678\"", R"("12345678\"")"},
-        {Array{1, Array{"a"}, 2.0}, R"([1,["a"],2.0])"},
-        {Dictionary{}, "{}"},
-        {Dictionary{{"b", 1}, {"a\n", Dictionary{{"", "x"}}}}, R"({"a\n":{"":"x"},"b":1})"}};
+        {Value::date(kInfinity), "null"},
+        {Value::data(bytes), "\"AP8QgA==\""}};
     for (const auto& [value, text] : rows) {
         EXPECT_EQ(jsonText(value), text);
     }
-    EXPECT_EQ(jsonText(Dictionary{{"a", true}}), R"({"a":true})");
-    TextBuffer out;
-    appendJsonNumber(out, 2.0);
-    EXPECT_EQ(out.view(), "2.0");
-}
-
-TEST(JsonWriter, EscapesAtEveryPlaceOfABlock) {
-    for (int code = 0; code < 0x80; ++code) {
-        for (std::size_t place = 0; place < 19; ++place) {
-            std::string text(19, '\xC3');
-            text[place] = static_cast<char>(code);
-            const std::string json = jsonText(Value(text));
-            const bool escaped = code < 0x20 || code == '"' || code == '\\';
-            const std::string_view middle = std::string_view(json).substr(1 + place, json.size() - 2 - 18);
-            EXPECT_EQ(middle.front() == '\\', escaped) << code << " at " << place;
-            EXPECT_EQ(middle.size() == 1, !escaped) << code << " at " << place;
-            EXPECT_EQ(json.substr(0, place + 1), "\"" + text.substr(0, place));
-            EXPECT_EQ(json.substr(json.size() - 19 + place), text.substr(place + 1) + "\"");
-        }
+    std::string everyByte;
+    for (char byte = 0; byte < 0x7F; ++byte) {
+        everyByte += byte;
+        EXPECT_EQ(jsonText(Value(everyByte)), nlohmann::json(everyByte).dump());
     }
 }
 
 TEST(JsonWriter, FloatsReadBackTheSame) {
-    std::mt19937_64 random(11);
+    std::mt19937_64 random(11); // NOLINT: the same numbers at every run
     for (int i = 0; i < 20000; ++i) {
         const auto bits = static_cast<std::uint32_t>(random());
         for (const float number : {std::bit_cast<float>(bits), static_cast<float>(bits >> (bits % 32))}) {
@@ -148,13 +150,26 @@ TEST(JsonWriter, FloatsReadBackTheSame) {
     }
 }
 
+TEST(JsonWriter, SaysForPeopleWhatHasNoFormAndWhere) {
+    const std::vector<std::uint8_t> bytes{1};
+    const std::pair<Dictionary, const char*> rows[] = {
+        {{{"a", Value::data(bytes)}}, "a byte string has no JSON form, at /K_1/a"},
+        {{{"n", std::numeric_limits<double>::quiet_NaN()}},
+         "a number that is not finite has no JSON form, at /K_1/n"},
+        {{{"list", Array{1, Dictionary{{"a/b~", -std::numeric_limits<float>::infinity()}}}}},
+         "a number that is not finite has no JSON form, at /K_1/list/1/a~1b~0"},
+        {{{"", Dictionary{{"d", Array{Array{Value::date(1)}}}}}}, "a date has no JSON form, at /K_1//d/0/0"},
+    };
+    for (const auto& [payload, says] : rows) {
+        EXPECT_EQ(prettyText("K_1", payload), says);
+    }
+}
+
 TEST(JsonReader, ReadsWhatIsJson) {
     const std::vector<std::pair<std::string, Value>> rows{
         {"-0", 0},
         {" \t\r\n1 \n", 1},
         {"9223372036854775808", 9223372036854775808U},
-        {"-9223372036854775808", std::numeric_limits<std::int64_t>::min()},
-        {"18446744073709551615", 18446744073709551615U},
         {"18446744073709551616", 0x1p64},
         {"-9223372036854775809", -0x1p63},
         {"-0.0", -0.0},
@@ -163,21 +178,16 @@ TEST(JsonReader, ReadsWhatIsJson) {
         {"1e-400", 0.0},
         {"-1e-999999999999999999999", -0.0},
         {"0.000" + std::string(400, '0') + "1", 0.0},
+        {"1" + std::string(400, '0') + "e-400", 1.0},
+        {"0." + std::string(400, '0') + "1e401", 1.0},
         {"4.9e-324", 5e-324},
         {"123456789012345678901234567890", 123456789012345678901234567890.0},
         {R"("\"\\\/\b\f\n\r\t")", "\"\\/\b\f\n\r\t"},
         {R"("\u0041\u00e9\u6C34\ud800\udd51")", "A\xC3\xA9\xE6\xB0\xB4\xF0\x90\x85\x91"},
         {R"("\u0000")", std::string(1, '\0')},
         {"[ null , 1,null ]", Array{1}},
-        {"{ }", Dictionary{}},
         {R"({"b":1,"a":[{}],"n":null})", Dictionary{{"a", Array{Dictionary{}}}, {"b", 1}}},
-        {repeated("[", 32) + repeated("]", 32), [] {
-             Value value = Array{};
-             for (int i = 1; i < 32; ++i) {
-                 value = Value(Array{value});
-             }
-             return value;
-         }()}};
+        {repeated("[", 32) + repeated("]", 32), nestedArrays(32)}};
     for (const auto& [text, expected] : rows) {
         const auto outcome = readJson(text);
         ASSERT_TRUE(std::holds_alternative<Value>(outcome))
@@ -188,34 +198,26 @@ TEST(JsonReader, ReadsWhatIsJson) {
 }
 
 TEST(JsonReader, SaysWhatIsWrongAndWhere) {
-    struct Row {
+    const struct {
         std::string text;
         std::size_t line;
         std::size_t column;
         const char* says;
-    };
-    const std::vector<Row> rows{
+    } rows[] = {
         {"", 1, 1, "the end of the text"},
         {"null", 1, 1, "null"},
-        {"nul", 1, 1, "null"},
         {"\xEF\xBB\xBF{}", 1, 1, "the byte 239"},
         {"1 2", 1, 3, "behind the end"},
         {"01", 1, 2, "begin with 0"},
         {"-", 1, 2, "digit"},
-        {"+1", 1, 1, "'+'"},
-        {"1.", 1, 3, "digit"},
         {"1e+", 1, 4, "digit"},
         {"[1e309]", 1, 2, "too large"},
-        {"1" + std::string(400, '0'), 1, 1, "too large"},
-        {"[1", 1, 3, "']'"},
+        {"-1e99999999999999999999", 1, 1, "too large"},
         {"[1,]", 1, 4, "']'"},
-        {"[1 2]", 1, 4, "comma"},
         {"{\"a\"}", 1, 5, "colon"},
         {"{\"a\":1,}", 1, 8, "key in quotes"},
-        {"{a:1}", 1, 2, "key in quotes"},
         {"{\"a\":1,\n \"\xC3\xA9\":2, \"a\":3}", 2, 9, "\"a\" stands here a second time"},
-        {R"({"1":0,"2":0,"3":0,"4":0,"5":0,"6":0,"7":0,"8":0,"9":0,"a":0,"b":0,"c":0,"d":0,"e":0,"f":0,"g":0,"1":0})",
-         1, 98, "\"1\" stands here a second time"},
+        {R"({"b":0,"\u0061":0,"c":{"a":null,"\u0061":1},"a":0})", 1, 33, "\"a\" stands here a second time"},
         {"\"abc", 1, 1, "does not end"},
         {"\"abc\\", 1, 6, "escape"},
         {"\"a\nb\"", 1, 3, "escaped"},
@@ -224,15 +226,14 @@ TEST(JsonReader, SaysWhatIsWrongAndWhere) {
         {R"("\u12g4")", 1, 4, "hexadecimal"},
         {R"("\u12)", 1, 4, "hexadecimal"},
         {R"("\ud800")", 1, 2, "surrogate"},
-        {R"("\udc00\udc00")", 1, 2, "surrogate"},
         {R"("\ud800\ud800")", 1, 2, "surrogate"},
         {R"("\ud800\u0041")", 1, 2, "surrogate"},
         {"[\"\xC0\x80\"]", 1, 2, "UTF-8"},
         {"{\"\xFF\":1}", 1, 2, "UTF-8"},
         {repeated("[", 33) + repeated("]", 33), 1, 33, "deeper than 32"},
         {repeated("{\"\":", 200'000), 1, 129, "deeper than 32"},
-        {"// c\n1", 1, 1, "'/'"}};
-    for (const Row& row : rows) {
+    };
+    for (const auto& row : rows) {
         const auto outcome = readJson(row.text);
         ASSERT_TRUE(std::holds_alternative<JsonError>(outcome)) << row.text;
         const auto& error = std::get<JsonError>(outcome);
@@ -245,22 +246,44 @@ TEST(JsonReader, SaysWhatIsWrongAndWhere) {
     ASSERT_TRUE(std::holds_alternative<JsonError>(refused));
     EXPECT_EQ(std::get<JsonError>(refused).line, 2U);
     EXPECT_EQ(std::get<JsonError>(refused).column, 5U);
+    for (const auto& [text, says] :
+         {std::pair("{\"a\":1}", "not an array"), std::pair("{\"a\":1", "a comma or '}'"),
+          std::pair("[1] 2", "behind the end")}) {
+        JsonReader reader(text);
+        while (reader.readElement() != nullptr) {
+        }
+        ASSERT_TRUE(reader.error()) << text;
+        EXPECT_NE(reader.error()->message.find(says), std::string::npos) << reader.error()->message;
+    }
 }
 
 TEST(Json, AgreesWithAnIndependentImplementation) {
     test::RandomValues random(5);
+    EXPECT_EQ(prettyText("deep", {{"", nestedArrays(40)}}),
+              (nlohmann::json{{"deep", {{"", test::toNlohmann(nestedArrays(40))}}}}.dump(2)));
+    int laidOutAlike = 0;
     for (int i = 0; i < 2000; ++i) {
-        const Value value = random.value(4, true);
-        const std::string text = jsonText(value);
-        EXPECT_EQ(nlohmann::json::parse(text), test::toNlohmann(value)) << text;
-
-        const nlohmann::json theirs = test::toNlohmann(random.value(4, true));
+        const Value value = i == 0 ? test::integersAroundPowersOfTwo() : random.value(4, true);
+        const nlohmann::json theirs = test::toNlohmann(value);
+        EXPECT_EQ(nlohmann::json::parse(jsonText(value)), theirs) << jsonText(value);
         for (const int indent : {-1, 2}) {
             const auto ours = readJson(theirs.dump(indent, ' ', indent > 0));
             ASSERT_TRUE(std::holds_alternative<Value>(ours)) << theirs;
             EXPECT_EQ(test::toNlohmann(std::get<Value>(ours)), theirs);
         }
+
+        const std::string key = random.text();
+        const Dictionary dictionary = random.dictionary(3, true);
+        const std::string pretty = prettyText(key, dictionary);
+        const nlohmann::json expected{{key, test::toNlohmann(Value(dictionary))}};
+        ASSERT_EQ(nlohmann::json::parse(pretty, nullptr, false), expected) << pretty;
+        if (!hasFloat(expected)) {
+            ++laidOutAlike;
+            EXPECT_EQ(pretty, expected.dump(2));
+            EXPECT_EQ(jsonText(Value(dictionary)), expected[key].dump());
+        }
     }
+    EXPECT_GT(laidOutAlike, 200);
 }
 
 TEST(Json, AcceptsNoMoreThanAnIndependentImplementation) {
@@ -277,15 +300,14 @@ TEST(Json, AcceptsNoMoreThanAnIndependentImplementation) {
             }
         }
         expectSameByElements(text);
-        // Theirs lets a null, a key that stands twice and a number that is too large pass; ours does not.
-        const bool ours = std::holds_alternative<Value>(readJson(text));
-        const auto theirs = nlohmann::json::parse(text, nullptr, false);
-        EXPECT_TRUE(!ours || !theirs.is_discarded()) << text;
-        if (!ours && !theirs.is_discarded()) {
-            const std::string message = std::get<JsonError>(readJson(text)).message;
-            EXPECT_TRUE(message.find("second time") != std::string::npos ||
-                        message.find("null") != std::string::npos)
-                << text << ": " << message;
+        // Theirs lets a null and a key that stands twice pass; ours does not.
+        const auto ours = readJson(text);
+        const bool isTheirs = nlohmann::json::accept(text);
+        EXPECT_TRUE(isTheirs || std::holds_alternative<JsonError>(ours)) << text;
+        if (const auto* error = std::get_if<JsonError>(&ours); error != nullptr && isTheirs) {
+            EXPECT_TRUE(error->message.find("second time") != std::string::npos ||
+                        error->message.find("null") != std::string::npos)
+                << text << ": " << error->message;
         }
     }
 }

@@ -92,6 +92,18 @@ private:
     std::mt19937_64 random_;
 };
 
+/// Every power of two, its neighbours, and as many negative integers.
+inline Value integersAroundPowersOfTwo() {
+    Array integers;
+    for (unsigned power = 0; power < 64; ++power) {
+        for (std::uint64_t number = (1ULL << power) - 1, i = 0; i < 3; ++number, ++i) {
+            integers.emplace_back(number);
+            integers.emplace_back(static_cast<std::int64_t>(~(number & ~(1ULL << 63U))));
+        }
+    }
+    return integers;
+}
+
 /// The same document for the independent implementation that the codecs are held against.
 inline nlohmann::json toNlohmann(const Value& value) {
     switch (value.kind()) {

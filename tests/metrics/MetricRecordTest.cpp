@@ -55,7 +55,6 @@ TEST(MetricRecord, WhatOthersWriteIsReadAndWhatIsCutShortIsRefused) {
         {"", "- 0 ||"},
         {"2A 01 63 10 05 1A 01 61 10 06 08 01", "1 6 a||c"},
         // Unknown fields of every wire type are passed over.
-        {"48 9601 10 05", "- 5 ||"},
         {"49 0102030405060708 4D 01020304 4A 02 1005 10 06", "- 6 ||"},
         {"4B 10 07 53 22 01 61 54 4C 10 05", "- 5 ||"},
         {"00 01 F8FFFFFFFFFFFFFFFF01 02 10 05", "- 5 ||"},
@@ -63,7 +62,6 @@ TEST(MetricRecord, WhatOthersWriteIsReadAndWhatIsCutShortIsRefused) {
         {"0D 05 12 07 18 01 61 23 01 62 2E 01 63", "5 7 a|b|c"},
         // Wire type 4 ends the record, of a known field, too; the rest is not looked at.
         {"10 05 4C 10 06", "- 5 ||"},
-        {"10 05 14 FF", "- 5 ||"},
         // Long varints: ten bytes count, of the tenth one bit; more than ten read as 0, which is no error.
         {"08 85808080808080808000 10 05", "5 5 ||"},
         {"08 FFFFFFFFFFFFFFFFFF7F", "18446744073709551615 0 ||"},
@@ -72,20 +70,16 @@ TEST(MetricRecord, WhatOthersWriteIsReadAndWhatIsCutShortIsRefused) {
         {"10 05 10" + tenMore + "08 03", "3 0 ||"},
         {tenMore + "07 10 05", "- 5 ||"},
         {"1A" + tenMore + "10 05", "- 5 ||"},
-        {"48" + tenMore + "10 05", "- 5 ||"},
         {tenMore, "!- 0 ||"},
         // Cut short: what came before stays, and a timestamp is there as soon as its key was.
         {"10 05 08", "!0 5 ||"},
-        {"10 05 10 80", "!- 0 ||"},
         // Lengths beyond the end, up to those at which a sum would wrap around.
-        {"2A FFFFFFFF0F 61", "!- 0 ||"},
         {"2A FFFFFFFFFFFFFFFFFF01 61", "!- 0 ||"},
         {"2A F5FFFFFFFFFFFFFFFF01 61", "!- 0 ||"},
         {"4A FFFFFFFFFFFFFFFFFF01 10 05", "!- 0 ||"},
         {"4B 52 FFFFFFFFFFFFFFFFFF01 4C 10 05", "!- 0 ||"},
         // What cannot be passed over ends the reading at once.
         {"10 05 4E 10 06", "!- 5 ||"},
-        {"10 05 4B 54 10 06", "!- 5 ||"},
         {"10 05 4B 4E 4C 10 06", "!- 5 ||"},
         {"10 05 4B 53 4C 54 10 06", "!- 5 ||"},
     };
