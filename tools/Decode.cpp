@@ -5,7 +5,6 @@
 #include "base/Json.h"
 #include "base/Rfc3339.h"
 #include "base/SplitText.h"
-#include "tools/DecodeFrames.h"
 #include "tools/MetricRecord.h"
 #include "tools/Payload.h"
 #include "tools/SinkFile.h"

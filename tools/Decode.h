@@ -30,4 +30,9 @@ struct Decoded {
 };
 [[nodiscard]] Decoded decode(std::string_view input, EncodedKind kind);
 
+/// The same for frames, of which each becomes a line that is a JSON object.
+[[nodiscard]] Decoded decodeFrames(std::string_view input);
+/// Whether the text is hexadecimal digits, two for each byte, with white space anywhere.
+[[nodiscard]] bool isHex(std::string_view text);
+
 } // namespace tamblo::tools

@@ -1,8 +1,9 @@
-#include "tools/DecodeFrames.h"
+#include "tools/Decode.h"
 
 #include "base/Cbor.h"
 #include "base/Format.h"
 #include "base/JsonObject.h"
+#include "base/NumberText.h"
 #include "client/Vocabulary.h"
 #include "wire/FrameSplitter.h"
 #include "wire/Reply.h"
@@ -17,67 +18,64 @@ namespace {
 
 using Bytes = std::span<const std::uint8_t>;
 
-std::optional<unsigned> digitOf(char character) noexcept {
-    if (character >= '0' && character <= '9') {
-        return static_cast<unsigned>(character - '0');
-    }
-    const char lower = static_cast<char>(character | 0x20);
-    return lower >= 'a' && lower <= 'f' ? std::optional(static_cast<unsigned>(lower - 'a') + 10)
-                                        : std::nullopt;
-}
-
 /// Nothing when it is another text, or the number of digits is odd.
 std::optional<std::vector<std::uint8_t>> bytesOfHex(std::string_view text) {
     std::vector<std::uint8_t> bytes;
     bytes.reserve(text.size() / 2);
-    bool isHalf = false; // the last byte has its high digit only
+    std::string pair;
     for (const char character : text) {
         if (std::string_view(" \t\r\n").find(character) != std::string_view::npos) {
             continue;
         }
-        const auto digit = digitOf(character);
-        if (!digit) {
+        if (pair.append(1, character).size() < 2) {
+            continue;
+        }
+        const auto byte = parseNumber<std::uint8_t>(pair, 16);
+        if (!byte) {
             return std::nullopt;
         }
-        if (isHalf) {
-            bytes.back() = static_cast<std::uint8_t>(bytes.back() | *digit);
-        } else {
-            bytes.push_back(static_cast<std::uint8_t>(*digit << 4U));
-        }
-        isHalf = !isHalf;
+        bytes.push_back(*byte);
+        pair.clear();
     }
-    return isHalf ? std::nullopt : std::optional(std::move(bytes));
+    return pair.empty() ? std::optional(std::move(bytes)) : std::nullopt;
 }
 
-void addParameters(JsonObject& object, const wire::Request& request) {
-    switch (request.method) {
-    case wire::Method::sendMessage: {
-        object.value("payload", request.dictionary).value("category", request.category);
-        if (const auto name = client::categoryName(client::EventCategory{request.category}); !name.empty()) {
-            object.value("categoryName", name);
-        }
-        object.value("type", unsigned{request.type});
-        if (const auto name = client::typeName(client::EventType{request.type}); !name.empty()) {
-            object.value("typeName", name);
-        }
-        Array reporters(request.reporterIDs.begin(), request.reporterIDs.end());
-        object.value("reporterIDs", reporters);
-        return;
+/// Nothing for what has no name.
+void addName(JsonObject& object, std::string_view member, std::string_view name) {
+    if (!name.empty()) {
+        object.value(member, name);
     }
-    case wire::Method::setServiceType:
-        object.value("type", unsigned{request.serviceType})
-            .value("typeName", client::serviceTypeName(client::ServiceType{request.serviceType}));
+}
+
+void addParameter(JsonObject& object, wire::Parameter parameter, const wire::Request& request) {
+    switch (parameter) {
+    case wire::Parameter::none:
         break;
-    case wire::Method::setConfiguration:
+    case wire::Parameter::payload:
+        object.value("payload", request.dictionary);
+        break;
+    case wire::Parameter::configuration:
         object.value("configuration", request.dictionary);
         break;
-    case wire::Method::getAllReporters:
-    case wire::Method::killService:
-        return;
-    default:
+    case wire::Parameter::category:
+        object.value("category", request.category);
+        addName(object, "categoryName", client::categoryName(client::EventCategory{request.category}));
+        break;
+    case wire::Parameter::type:
+        object.value("type", unsigned{request.type});
+        addName(object, "typeName", client::typeName(client::EventType{request.type}));
+        break;
+    case wire::Parameter::serviceType:
+        object.value("type", unsigned{request.serviceType});
+        addName(object, "typeName", client::serviceTypeName(client::ServiceType{request.serviceType}));
+        break;
+    case wire::Parameter::reporterID:
+        object.value("reporterID", request.reporterID);
+        break;
+    case wire::Parameter::reporterIDs:
+        object.value("reporterIDs", Array(request.reporterIDs.begin(), request.reporterIDs.end()));
         break;
     }
-    object.value("reporterID", request.reporterID);
 }
 
 void appendObject(TextBuffer& out, const wire::Request& request) {
@@ -87,7 +85,9 @@ void appendObject(TextBuffer& out, const wire::Request& request) {
         object.value("id", *request.id);
     }
     object.value("method", wire::rowOf(request.method).name);
-    addParameters(object, request);
+    for (const wire::Parameter parameter : wire::parametersOf(request.method)) {
+        addParameter(object, parameter, request);
+    }
 }
 
 void appendObject(TextBuffer& out, const wire::Reply& reply) {

@@ -39,6 +39,36 @@ std::optional<Error> errorFrom(const Dictionary& dictionary) {
     return error;
 }
 
+/// Nearly every reply is `[1, id, null, null]` or has a boolean as its result: `84 01 (id) f6 (f4 to f6)`,
+/// which is read without a reader's steps. Nothing for any other.
+std::optional<Reply> decodePlainReply(std::span<const std::uint8_t> item) noexcept {
+    constexpr std::size_t shortest = 5;
+    constexpr std::uint8_t falseItem = 0xF4;
+    constexpr std::uint8_t nullItem = 0xF6;
+    if (item.size() < shortest || item[0] != 0x84 || item[1] != 0x01 || item[item.size() - 2] != nullItem ||
+        item.back() < falseItem || item.back() > nullItem) {
+        return std::nullopt;
+    }
+    const auto idBytes = item.subspan(3, item.size() - shortest);
+    std::uint64_t id = item[2];
+    const std::size_t wanted = id < 24 ? 0 : std::size_t{1} << ((id - 24) % 8);
+    if (id > 27 || idBytes.size() != wanted) {
+        return std::nullopt;
+    }
+    if (wanted != 0) {
+        id = 0;
+        for (const std::uint8_t byte : idBytes) {
+            id = id << 8 | byte;
+        }
+    }
+    std::optional<Reply> reply(std::in_place);
+    reply->id = id;
+    if (item.back() != nullItem) {
+        reply->result.emplace(item.back() != falseItem);
+    }
+    return reply;
+}
+
 } // namespace
 
 void appendNullReply(TextBuffer& out, std::uint64_t id) {
@@ -84,6 +114,9 @@ void appendErrorReply(TextBuffer& out, std::uint64_t id, const Error& error) {
 }
 
 std::optional<Reply> decodeReply(std::span<const std::uint8_t> item) {
+    if (auto plain = decodePlainReply(item)) [[likely]] {
+        return plain;
+    }
     CborReader reader(item);
     auto array = reader.readArrayHead();
     const auto hasNext = [&] { return array && reader.moreElements(*array); };

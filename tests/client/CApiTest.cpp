@@ -1,10 +1,11 @@
-#include "tests/client/CProgram.h"
 #include "tests/client/FakeService.h"
 
 #include <cstdint>
 #include <limits>
 
 #include <gtest/gtest.h>
+
+extern "C" int runCProgram(const char* socketPath, int hasOwnThread);
 
 namespace tamblo::client {
 namespace {

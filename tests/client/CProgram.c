@@ -1,5 +1,3 @@
-#include "tests/client/CProgram.h"
-
 #include "client/tamblo.h"
 
 #include <string.h>
@@ -56,6 +54,8 @@ static bool run_session(tamblo_client* client, const tamblo_payload* payload, Se
            tamblo_client_get_service_type(client, 7, on_reply, seen);
 }
 
+/* Does everything that the C header offers, on its own thread or the library's. 0, or the line of the first
+   step that failed. */
 int runCProgram(const char* socket_path, int has_own_thread) {
     Seen seen = {0};
     tamblo_options options = {0};

@@ -1,51 +1,133 @@
 #pragma once
 
 #include "tests/Files.h"
+#include "tests/Sockets.h"
+#include "wire/FrameSplitter.h"
 #include "wire/Reply.h"
 #include "wire/Request.h"
 
 #include <atomic>
+#include <chrono>
 #include <functional>
 #include <mutex>
 #include <string>
 #include <thread>
 #include <vector>
 
+#include <poll.h>
+#include <unistd.h>
+
 namespace tamblo::test {
 
-/// Answers clients on a socket in a directory of its own, in this process, on a thread of its own, as a test
-/// tells it to: in full, not at all, twice. It can go away and come back at the same path.
+/// Answers a client on a socket in a directory of its own, in this process, on a thread of its own, as a test
+/// tells it to: in full, not at all, twice. It can go away and come back at the same path. One connection at
+/// a time.
 class FakeService {
 public:
     /// Appends the frames that answer a request. Runs on the service's thread.
     using Handler = std::function<void(const wire::Request& request, TextBuffer& replies)>;
 
-    explicit FakeService(Handler handler = answer);
-    ~FakeService();
+    explicit FakeService(Handler handler = answer) : handler_(std::move(handler)) { start(); }
+    ~FakeService() { stop(); }
 
-    void start();
-    /// Ends every connection and removes the socket.
-    void stop();
+    void start() {
+        listener_ = boundSocket(SOCK_STREAM, path_);
+        isStopping_ = false;
+        thread_ = std::thread([this] { run(); });
+    }
+    /// Ends the connection and removes the socket.
+    void stop() {
+        if (thread_.joinable()) {
+            isStopping_ = true;
+            thread_.join();
+            ::close(listener_);
+            ::unlink(path_.c_str());
+        }
+    }
 
     [[nodiscard]] const std::string& path() const noexcept { return path_; }
-    [[nodiscard]] std::vector<wire::Request> requests();
+    [[nodiscard]] std::vector<wire::Request> requests() {
+        const std::lock_guard lock(mutex_);
+        return requests_;
+    }
     /// Waits until this many requests have come, for at most five seconds.
-    [[nodiscard]] bool waitForRequests(std::size_t count);
+    [[nodiscard]] bool waitForRequests(std::size_t count) {
+        for (int i = 0; i < 5000 && requests().size() < count; ++i) {
+            std::this_thread::sleep_for(std::chrono::milliseconds(1));
+        }
+        return requests().size() >= count;
+    }
     /// Frames that were no requests.
     [[nodiscard]] int refusals() const noexcept { return refusals_; }
     /// While true nothing is read.
     std::atomic<bool> isDeaf{false};
 
     /// What the real service answers, but for a start, which it holds.
-    static void answer(const wire::Request& request, TextBuffer& replies);
+    static void answer(const wire::Request& request, TextBuffer& replies) {
+        if (!request.id || request.method == wire::Method::startReportingSessionForID) {
+            return;
+        }
+        switch (wire::rowOf(request.method).result) {
+        case wire::ResultKind::never:
+            return;
+        case wire::ResultKind::null:
+            return wire::appendNullReply(replies, *request.id);
+        case wire::ResultKind::boolean:
+            return wire::appendBooleanReply(replies, *request.id, true);
+        case wire::ResultKind::serviceType:
+            return wire::appendUnsignedReply(replies, *request.id, 7);
+        case wire::ResultKind::dictionary:
+            return wire::appendDictionaryReply(replies, *request.id,
+                                               {{"reporterID", request.reporterID}, {"serviceType", 7}});
+        case wire::ResultKind::reporterIDs:
+            return wire::appendIntegersReply(replies, *request.id, std::vector<std::int64_t>{7, -8});
+        }
+    }
 
 private:
-    struct Connection {
-        int socket;
+    void run() {
+        int connection = -1;
         TextBuffer received;
-    };
-    void run();
-    [[nodiscard]] bool serve(Connection& connection);
+        while (!isStopping_) {
+            pollfd watched[2] = {{.fd = listener_, .events = POLLIN, .revents = 0},
+                                 {.fd = isDeaf ? -1 : connection, .events = POLLIN, .revents = 0}};
+            ::poll(watched, 2, 2);
+            if (watched[1].revents != 0 && !serve(connection, received)) {
+                ::close(connection);
+                connection = -1;
+            }
+            if (connection < 0 && watched[0].revents != 0) {
+                connection = ::accept4(listener_, nullptr, nullptr, SOCK_CLOEXEC);
+                received.clear();
+            }
+        }
+        ::close(connection);
+    }
+    /// False at the end of the connection.
+    bool serve(int connection, TextBuffer& received) {
+        constexpr std::size_t readBytes = 256 * 1024;
+        const ssize_t count = ::recv(connection, received.room(readBytes), readBytes, 0);
+        if (count <= 0) {
+            return false;
+        }
+        received.commit(static_cast<std::size_t>(count));
+        wire::FrameSplitter frames(received.bytes());
+        TextBuffer replies;
+        KeySetCache keySets;
+        while (const auto item = frames.next()) {
+            wire::Request request;
+            if (wire::decodeRequest(*item, keySets, request)) {
+                ++refusals_;
+                continue;
+            }
+            handler_(request, replies);
+            const std::lock_guard lock(mutex_);
+            requests_.push_back(std::move(request));
+        }
+        received.dropFront(received.size() - frames.rest().size());
+        return replies.empty() || ::send(connection, replies.data(), replies.size(), MSG_NOSIGNAL) ==
+                                      static_cast<ssize_t>(replies.size());
+    }
 
     Handler handler_;
     TemporaryDirectory directory_;

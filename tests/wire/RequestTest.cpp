@@ -1,5 +1,5 @@
 #include "wire/Request.h"
-#include "base/Cbor.h"
+
 #include "tests/base/Hex.h"
 #include "wire/FrameSplitter.h"
 #include "wire/Reply.h"
@@ -17,33 +17,24 @@ namespace {
 using test::fromHex;
 using Bytes = std::vector<std::uint8_t>;
 
-Request everyParameter(Method method) {
-    Request request;
-    request.method = method;
-    request.id = 4'000'000'000'000U;
-    request.reporterID = -7;
-    request.serviceType = 65535;
-    request.dictionary = {{"a key", 1}, {"name", "a text that lies outside of its value"}, {"ratio", 0.5F}};
-    request.category = 0xFFFFFFFF;
-    request.type = 19;
-    request.reporterIDs = {7, 0, 7, std::numeric_limits<std::int64_t>::min()};
-    return request;
-}
-
 TEST(Request, EveryMethodIsReadAsItWasWritten) {
+    Request written;
+    written.reporterID = -7;
+    written.serviceType = 65535;
+    written.dictionary = {{"a key", 1}, {"name", "a text that lies outside of its value"}, {"ratio", 0.5F}};
+    written.category = 0xFFFFFFFF;
+    written.type = 19;
+    written.reporterIDs = {7, 0, 7, std::numeric_limits<std::int64_t>::min()};
     KeySetCache keySets;
     for (std::size_t i = 0; i < kMethods.size(); ++i) {
-        for (const bool wantsReply : {true, false}) {
-            Request written = everyParameter(static_cast<Method>(i));
-            if (!wantsReply) {
-                written.id.reset();
-            }
+        written.method = static_cast<Method>(i);
+        for (const std::optional<std::uint64_t> id : {std::optional(4'000'000'000'000U), {}}) {
+            written.id = id;
             TextBuffer out;
             ASSERT_TRUE(appendRequestFrame(out, written));
             FrameSplitter frames(out.bytes());
             const auto frame = frames.next();
-            ASSERT_TRUE(frame);
-            EXPECT_TRUE(frames.rest().empty());
+            ASSERT_TRUE(frame && frames.rest().empty());
 
             Request read;
             const auto refusal = decodeRequest(*frame, keySets, read);
@@ -55,6 +46,12 @@ TEST(Request, EveryMethodIsReadAsItWasWritten) {
             EXPECT_EQ(again.view(), out.view()) << "every parameter";
         }
     }
+    written.method = Method::setConfiguration;
+    written.dictionary = {{"k", std::string(kMaximumFrameBytes, 'x')}};
+    TextBuffer out;
+    out.append("before");
+    EXPECT_FALSE(appendRequestFrame(out, written)) << "beyond the limit";
+    EXPECT_EQ(out.view(), "before");
 }
 
 TEST(Request, IndefiniteLengthsAndAbsentValuesAreAccepted) {
@@ -70,62 +67,44 @@ TEST(Request, IndefiniteLengthsAndAbsentValuesAreAccepted) {
     // [2, "sendMessage", [null, 1, 2, null]]
     const Bytes nothing = fromHex("83 02 6b 73656e644d657373616765 84 f6 01 02 f6");
     ASSERT_FALSE(decodeRequest(nothing, keySets, request));
-    EXPECT_TRUE(request.dictionary.empty());
-    EXPECT_TRUE(request.reporterIDs.empty());
+    EXPECT_TRUE(request.dictionary.empty() && request.reporterIDs.empty());
     EXPECT_FALSE(request.id);
 }
 
 TEST(Request, WhatIsRefusedNamesItsReason) {
-    struct Case {
-        std::string_view name;
+    // Requests with id 5, up to their parameters.
+    const std::string send = "84 00 05 6b 73656e644d657373616765 84";
+    const std::string create = "00 05 76 6372656174655265706f7274696e6753657373696f6e";
+    const struct {
         std::int64_t code;
         std::uint64_t id;
         std::string_view mentions;
         std::string hex;
-    };
-    // sendMessage with id 5 begins 84 00 05 6b "sendMessage" 84.
-    const std::string send = "84 00 05 6b 73656e644d657373616765 84";
-    const std::string create = "84 00 05 76 6372656174655265706f7274696e6753657373696f6e";
-    std::string nestedDeep = "a1 61 6b";
-    for (int i = 0; i < 32; ++i) {
-        nestedDeep += "81";
-    }
-    nestedDeep += "00";
-    const std::vector<Case> cases = {
-        {"nothing", kNotWellFormed, 0, "early", ""},
-        {"cut short", kNotWellFormed, 0, "early", "84 00 05"},
-        {"two items", kNotWellFormed, 0, "follow", create + "81 07 00"},
-        {"not an array", kNotARequest, 0, "array", "a0"},
-        {"a reply", kNotARequest, 0, "neither", "84 01 05 f6 f6"},
-        {"negative id", kNotARequest, 0, "id", "84 00 20 60 80"},
-        {"method no text", kNotARequest, 5, "method", "84 00 05 07 80"},
-        {"unknown method, no reply wanted", kUnknownMethod, 0, "fly", "83 02 63 666c79 80"},
-        {"unknown method", kUnknownMethod, 5, "fly", "84 00 05 63 666c79 80"},
-        {"params missing", kWrongParameters, 5, "params",
-         "83 00 05 76 6372656174655265706f7274696e6753657373696f6e"},
-        {"too few", kWrongParameters, 5, "reporter ID is missing", create + "80"},
-        {"too many", kWrongParameters, 5, "too many", create + "82 07 07"},
-        {"reporter no integer", kWrongParameters, 5, "reporter ID", create + "81 61 37"},
-        {"reporter too large", kWrongParameters, 5, "reporter ID", create + "81 1b ffffffffffffffff"},
-        {"fifth element", kNotARequest, 5, "too many",
-         "85 00 05 76 6372656174655265706f7274696e6753657373696f6e 81 07 00"},
-        {"payload no map", kWrongParameters, 5, "payload", send + "80 01 02 80"},
-        {"null inside", kWrongParameters, 5, "null", send + "a1 61 6b f6 01 02 80"},
-        {"other tag", kWrongParameters, 5, "tag", send + "a1 61 6b c2 41 00 01 02 80"},
-        {"key no text", kWrongParameters, 5, "key", send + "a1 01 02 01 02 80"},
-        {"key twice", kWrongParameters, 5, "twice", send + "a2 61 6b 01 61 6b 02 01 02 80"},
-        {"not UTF-8", kWrongParameters, 5, "UTF-8", send + "a1 61 6b 61 ff 01 02 80"},
-        {"too deep", kWrongParameters, 5, "deeper", send + nestedDeep + "01 02 80"},
-        {"category too large", kWrongParameters, 5, "category", send + "a0 1b 0000000100000000 02 80"},
-        {"type too large", kWrongParameters, 5, "type", send + "a0 01 1a 00010000 80"},
-        {"IDs no array", kWrongParameters, 5, "reporter IDs", send + "a0 01 02 07"},
-        {"an ID no integer", kWrongParameters, 5, "reporter IDs", send + "a0 01 02 82 07 f4"},
-        {"bad value, then cut short", kNotWellFormed, 0, "early", send + "a1 61 6b f6 01 02"},
+    } cases[] = {
+        {kNotWellFormed, 0, "early", ""},
+        {kNotWellFormed, 0, "follow", "84" + create + "81 07 00"},
+        {kNotWellFormed, 0, "early", send + "a1 61 6b f6 01 02"}, // a bad value, then cut short
+        {kNotARequest, 0, "array", "a0"},
+        {kNotARequest, 0, "neither", "84 01 05 f6 f6"},
+        {kNotARequest, 0, "id", "84 00 20 60 80"},
+        {kNotARequest, 5, "method", "84 00 05 07 80"},
+        {kNotARequest, 5, "too many", "85" + create + "81 07 00"},
+        {kUnknownMethod, 0, "fly", "83 02 63 666c79 80"}, // without reply
+        {kWrongParameters, 5, "params", "83" + create},
+        {kWrongParameters, 5, "reporter ID is missing", "84" + create + "80"},
+        {kWrongParameters, 5, "too many", "84" + create + "82 07 07"},
+        {kWrongParameters, 5, "reporter ID", "84" + create + "81 1b ffffffffffffffff"},
+        {kWrongParameters, 5, "payload", send + "80 01 02 80"},
+        {kWrongParameters, 5, "twice", send + "a2 61 6b 01 61 6b 02 01 02 80"},
+        {kWrongParameters, 5, "category", send + "a0 1b 0000000100000000 02 80"},
+        {kWrongParameters, 5, "type", send + "a0 01 1a 00010000 80"},
+        {kWrongParameters, 5, "reporter IDs", send + "a0 01 02 07"},
+        {kWrongParameters, 5, "reporter IDs", send + "a0 01 02 82 07 f4"},
     };
     KeySetCache keySets;
-    for (const Case& expected : cases) {
-        SCOPED_TRACE(expected.name);
-        Request request;
+    Request request;
+    for (const auto& expected : cases) {
+        SCOPED_TRACE(expected.hex);
         const auto refusal = decodeRequest(fromHex(expected.hex), keySets, request);
         ASSERT_TRUE(refusal);
         EXPECT_EQ(refusal->error.domain, kProtocolErrorDomain);
@@ -136,22 +115,11 @@ TEST(Request, WhatIsRefusedNamesItsReason) {
             << refusal->error.message;
     }
     // What was refused leaves nothing behind that the next request could trip over.
-    Request request;
-    EXPECT_FALSE(decodeRequest(fromHex(create + "81 07"), keySets, request));
+    EXPECT_FALSE(decodeRequest(fromHex("84" + create + "81 07"), keySets, request));
     EXPECT_EQ(request.reporterID, 7);
 }
 
-TEST(Request, FrameBeyondTheLimitIsNotWritten) {
-    Request request;
-    request.method = Method::sendMessage;
-    request.dictionary = {{"k", std::string(kMaximumFrameBytes, 'x')}};
-    TextBuffer out;
-    out.append("before");
-    EXPECT_FALSE(appendRequestFrame(out, request));
-    EXPECT_EQ(out.view(), "before");
-}
-
-TEST(FrameSplitter, TakesWholeFramesOfAnyCut) {
+TEST(FrameSplitter, TakesWholeFramesOfAnyCutUpToTheLimit) {
     Bytes stream;
     for (const std::size_t length : {0U, 1U, 300U}) {
         stream.insert(stream.end(),
@@ -168,14 +136,11 @@ TEST(FrameSplitter, TakesWholeFramesOfAnyCut) {
         EXPECT_FALSE(frames.tooLong());
         EXPECT_GT(frames.wanted(), frames.rest().size());
     }
-}
-
-TEST(FrameSplitter, LongestFrameIsTheLimit) {
-    Bytes stream(kLengthBytes + kMaximumFrameBytes);
-    stream[2] = 0x10;
-    EXPECT_TRUE(FrameSplitter(stream).next());
-    stream[0] = 1;
-    FrameSplitter frames(stream);
+    Bytes longest(kLengthBytes + kMaximumFrameBytes);
+    longest[2] = 0x10;
+    EXPECT_TRUE(FrameSplitter(longest).next());
+    longest[0] = 1;
+    FrameSplitter frames(longest);
     EXPECT_FALSE(frames.next());
     EXPECT_TRUE(frames.tooLong());
 }
@@ -191,6 +156,7 @@ TEST(Reply, EveryResultIsReadAsItWasWritten) {
     appendIntegersReply(out, 5, numbers);
     appendErrorReply(out, 6, {"a.domain", -32601, "why"});
     appendErrorReply(out, 7, {"b.domain", 1, ""});
+    appendDictionaryReply(out, 8, {{"k", std::string(kMaximumFrameBytes, 'x')}});
 
     FrameSplitter frames(out.bytes());
     std::vector<Reply> replies;
@@ -198,11 +164,12 @@ TEST(Reply, EveryResultIsReadAsItWasWritten) {
         const auto reply = decodeReply(*frame);
         ASSERT_TRUE(reply);
         replies.push_back(*reply);
+        EXPECT_EQ(reply->id, replies.size());
         for (std::size_t cut = 0; cut < frame->size(); ++cut) {
             EXPECT_FALSE(decodeReply(frame->first(cut)));
         }
     }
-    ASSERT_EQ(replies.size(), 7U);
+    ASSERT_EQ(replies.size(), 8U);
     EXPECT_FALSE(replies[0].result);
     EXPECT_EQ(*replies[1].result, Value(true));
     EXPECT_EQ(*replies[2].result, Value(65535));
@@ -211,9 +178,7 @@ TEST(Reply, EveryResultIsReadAsItWasWritten) {
     EXPECT_EQ(replies[5].error->code, -32601);
     EXPECT_EQ(replies[5].error->message, "why");
     EXPECT_EQ(replies[6].error->domain, "b.domain");
-    for (std::size_t i = 0; i < replies.size(); ++i) {
-        EXPECT_EQ(replies[i].id, i + 1);
-    }
+    EXPECT_EQ(replies[7].error->code, kNotARequest) << "a result that is too long";
 }
 
 } // namespace
