@@ -88,18 +88,14 @@ std::optional<ExitStatus> begin(ServiceConnection& service, const Plan& plan,
                                 const std::shared_ptr<bool>& isStartAnswered) {
     client::Client& client = service.client();
     const std::int64_t reporter = plan.player.reporterID;
-    bool answer = false;
-    auto created = client.createReportingSession(reporter);
-    if (const auto failure = service.await(created, answer)) {
+    if (const auto failure = service.await(client.createReportingSession(reporter))) {
         return failure;
     }
-    auto typed = client.setServiceType(plan.serviceType, reporter);
-    if (const auto failure = service.await(typed, answer)) {
+    if (const auto failure = service.await(client.setServiceType(plan.serviceType, reporter))) {
         return failure;
     }
     if (plan.configuration) {
-        auto configured = client.setConfiguration(*plan.configuration, reporter);
-        if (const auto failure = service.await(configured, answer)) {
+        if (const auto failure = service.await(client.setConfiguration(*plan.configuration, reporter))) {
             return failure;
         }
     }
@@ -163,9 +159,7 @@ ExitStatus playAndStop(ServiceConnection& service, const Arguments& arguments, c
         wrong = player.play(*lines, plan.file);
     }
     SummaryReader reader(wire::Directories::ofThisProcess().logs);
-    auto stopped = service.client().stopReportingSessionForID(plan.player.reporterID);
-    bool answer = false;
-    const auto failure = service.await(stopped, answer);
+    const auto failure = service.await(service.client().stopReportingSessionForID(plan.player.reporterID));
     const Summaries summaries = failure ? Summaries("no summaries: the session was not stopped")
                                         : reader.read(describe(plan, player.report()));
     printReport(arguments, player.report(), *isStartAnswered, summaries);

@@ -41,17 +41,11 @@ std::optional<std::string> appendRecord(std::string& out, std::string_view base6
     return std::nullopt;
 }
 
-/// As in JSON, without the quotes.
-std::string escaped(std::string_view text) {
-    const std::string quoted = jsonText(Value(text));
-    return quoted.substr(1, quoted.size() - 2);
-}
-
 /// One entry a line, dictionaries indented below their key.
 void appendEntries(std::string& out, const Dictionary& entries, std::size_t depth) {
     for (std::size_t i = 0; i < entries.size(); ++i) {
         const Value& value = entries.valueAt(i);
-        out.append(2 * depth, ' ').append(escaped(entries.keyAt(i))).append(":");
+        out.append(2 * depth, ' ').append(plainText(Value(entries.keyAt(i)))).append(":");
         if (value.isDictionary() && !value.dictionaryValue().empty()) {
             out += '\n';
             appendEntries(out, value.dictionaryValue(), depth + 1);
@@ -71,8 +65,8 @@ std::optional<std::string> appendLine(std::string& out, std::string_view line) {
     if (time == nullptr || !time->isNumber()) {
         return std::string("not a line of a report sink: those have a \"time\"");
     }
-    out +=
-        formatted("{} {}\n", formatRfc3339(time->doubleValue()).value_or("-"), escaped(nameOfRecord(fields)));
+    out += formatted("{} {}\n", formatRfc3339(time->doubleValue()).value_or("-"),
+                     plainText(Value(nameOfRecord(fields))));
     appendEntries(out, fields, 1);
     if (std::holds_alternative<std::string>(parseJsonObject(line, kForService))) {
         out += "# a null is left out: a number that is not finite\n";

@@ -49,4 +49,9 @@ std::variant<Dictionary, std::string> parsePayload(std::span<const std::string_v
     return payload;
 }
 
+std::string plainText(const Value& value) {
+    std::string text = jsonText(value);
+    return value.isString() ? text.substr(1, text.size() - 2) : text;
+}
+
 } // namespace tamblo::tools

@@ -24,4 +24,7 @@ inline constexpr JsonReadOptions kForService{.refuseNull = true};
 /// `five` texts.
 [[nodiscard]] Value parseScalar(std::string_view text);
 
+/// As JSON, without the quotes of a text, so that no text can play tricks with the terminal.
+[[nodiscard]] std::string plainText(const Value& value);
+
 } // namespace tamblo::tools

@@ -46,9 +46,8 @@ ExitStatus send(const Arguments& arguments) {
     if (const auto failure = service.connect()) {
         return *failure;
     }
-    auto future = service.client().sendMessage(std::get<Dictionary>(payload), *category, *type, reporters);
-    client::Nothing nothing;
-    if (const auto failure = service.await(future, nothing)) {
+    if (const auto failure = service.await(
+            service.client().sendMessage(std::get<Dictionary>(payload), *category, *type, reporters))) {
         return *failure;
     }
     printLine(arguments.has("--json") ? "{\"sent\":true}" : "sent");
@@ -65,16 +64,15 @@ ExitStatus reporters(const Arguments& arguments) {
     if (const auto failure = service.connect()) {
         return *failure;
     }
-    auto future = service.client().getAllReporters();
     std::vector<std::int64_t> reporters;
-    if (const auto failure = service.await(future, reporters)) {
+    if (const auto failure = service.await(service.client().getAllReporters(), &reporters)) {
         return *failure;
     }
     Array lines;
     for (const std::int64_t reporter : reporters) {
-        auto typeFuture = service.client().getServiceNameForReporterID(reporter);
         client::ServiceType type{};
-        if (const auto failure = service.await(typeFuture, type)) {
+        if (const auto failure =
+                service.await(service.client().getServiceNameForReporterID(reporter), &type)) {
             return *failure;
         }
         const std::string_view name = client::serviceTypeName(type);
@@ -106,9 +104,8 @@ ExitStatus validate(const Arguments& arguments) {
     if (const auto failure = service.connect()) {
         return *failure;
     }
-    auto future = service.client().reporterID(*reporter);
     Dictionary answer;
-    if (const auto failure = service.await(future, answer)) {
+    if (const auto failure = service.await(service.client().reporterID(*reporter), &answer)) {
         return *failure;
     }
     const Value* found = answer.find("reporterID");

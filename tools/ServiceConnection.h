@@ -28,7 +28,8 @@ public:
     [[nodiscard]] std::chrono::milliseconds timeout() const noexcept { return *timeout_; }
 
     /// Waits for the answer; without a good one, complains and answers the status to exit with.
-    template <typename T> std::optional<ExitStatus> await(std::future<client::Result<T>>& future, T& value) {
+    template <typename T>
+    [[nodiscard]] std::optional<ExitStatus> await(std::future<client::Result<T>> future, T* value = nullptr) {
         if (!client_.wait(future, timeout())) {
             return complain(ExitStatus::failed, "the service did not answer in time");
         }
@@ -36,7 +37,9 @@ public:
         if (result.error) {
             return complainAbout(*result.error);
         }
-        value = std::move(result.value);
+        if (value != nullptr) {
+            *value = std::move(result.value);
+        }
         return std::nullopt;
     }
     [[nodiscard]] static ExitStatus complainAbout(const client::Error& error);

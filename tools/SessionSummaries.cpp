@@ -1,7 +1,6 @@
 #include "tools/SessionSummaries.h"
 
 #include "base/Format.h"
-#include "base/Json.h"
 #include "base/Utf8.h"
 #include "tools/Payload.h"
 
@@ -115,12 +114,6 @@ const Value& valueOf(const Dictionary& payload, std::string_view key) {
     static const Value nothing(kNothing);
     const Value* value = payload.find(key);
     return value != nullptr ? *value : nothing;
-}
-
-/// As JSON, so that no text can play tricks with the terminal.
-std::string plainText(const Value& value) {
-    std::string text = jsonText(value);
-    return value.isString() ? text.substr(1, text.size() - 2) : text;
 }
 
 std::size_t widthOf(std::string_view text) noexcept {

@@ -20,17 +20,17 @@ Decoded guessed(std::string_view input) {
 }
 
 constexpr std::string_view kRecord = "EAIaATMiAW4qA2NvbQ=="; // duration 2, "3", "n", "com"
-constexpr std::string_view kRecordText = "AudioIssueDetected {\n"
-                                         "  duration: 2\n"
-                                         "  issuetype: \"3\"\n"
-                                         "  node: \"n\"\n"
-                                         "  rtaidclient: \"com\"\n"
-                                         "}\n"
-                                         "# timestamp is not set\n";
+
+/// A record up to its timestamp.
+std::string shown(const std::string& duration, const std::string& type, const std::string& node,
+                  const std::string& client) {
+    return "AudioIssueDetected {\n  duration: " + duration + "\n  issuetype: \"" + type + "\"\n  node: \"" +
+           node + "\"\n  rtaidclient: \"" + client + "\"\n";
+}
 
 TEST(Decode, RecordsAndLinesAreLaidOutAndWhatIsWrongIsNamed) {
     const std::string record(kRecord);
-    const std::string recordText(kRecordText);
+    const std::string recordText = shown("2", "3", "n", "com") + "}\n# timestamp is not set\n";
     const std::string metric = R"({"time":0,"metric":5963779,"record":")";
     const std::string metricText = "1970-01-01T00:00:00.000Z 5963779\n  metric: 5963779\n  record: \"";
     const struct {
@@ -39,10 +39,11 @@ TEST(Decode, RecordsAndLinesAreLaidOutAndWhatIsWrongIsNamed) {
         std::string problem;
     } cases[] = {
         {"\n " + record + "\r\n", recordText, ""},
-        {"CAA=", "AudioIssueDetected {\n  timestamp: 0\n}\n", ""},
-        {"CAAi", "AudioIssueDetected {\n  timestamp: 0\n}\n",
-         "line 1: not a whole metric record: byte 3 of 3 is the last that could be read"},
-        {"CAAE", "AudioIssueDetected {\n  timestamp: 0\n}\n", "line 1: 1 bytes follow the end of the record"},
+        {"CAA=", shown("0", "", "", "") + "  timestamp: 0\n}\n", ""},
+        {"EAIaATMiAW4qA2Nv", shown("2", "3", "n", "") + "}\n# timestamp is not set\n",
+         "line 1: not a whole metric record: byte 10 of 12 is the last that could be read"},
+        {"EAUMEAY=", shown("5", "", "", "") + "}\n# timestamp is not set\n",
+         "line 1: 2 bytes follow the end of the record"},
         {"!\n" + record, recordText, "line 1: not Base64"},
         {" \n", "", "there is nothing to decode"},
         {R"({"time":1772366400.25,"event":"a.b","payload":{"x y":1.0,"l":[1,"a"],"n":{"b":true},"e":{}}})",
