@@ -54,8 +54,6 @@ public:
                                                                           const Dictionary& payload) = 0;
     /// Sends what the service has held back.
     virtual void FlushMessages(const SessionRef& session) = 0;
-    /// Ends a run of calls on one thread: the service need not wait for more before it stores them.
-    virtual void commit() = 0;
 };
 
 } // namespace tamblo

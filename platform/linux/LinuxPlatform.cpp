@@ -14,7 +14,6 @@
 #include "platform/linux/log/LinuxStructuredLog.h"
 #include "platform/linux/log/LinuxTracePoints.h"
 #include "platform/linux/loop/EventLoop.h"
-#include "platform/linux/loop/LinuxSerialQueue.h"
 #include "platform/linux/loop/LinuxWorkQueues.h"
 #include "platform/linux/settings/LinuxDeviceProperties.h"
 #include "platform/linux/settings/LinuxNamedNotifications.h"
@@ -26,7 +25,6 @@
 
 #include <csignal>
 #include <cstdlib>
-#include <optional>
 #include <utility>
 
 #include <sys/epoll.h>
@@ -62,10 +60,8 @@ public:
         descriptor_ = FileDescriptor(::signalfd(-1, &signals, SFD_CLOEXEC | SFD_NONBLOCK));
     }
 
-    void watch(EventLoop& loop, UniqueFunction<void()> endWanted) {
-        endWanted_ = std::move(endWanted);
-        loop.add(descriptor_.get(), EPOLLIN, *this);
-    }
+    [[nodiscard]] bool watch(EventLoop& loop) { return loop.add(descriptor_.get(), EPOLLIN, *this); }
+    void setEndWanted(UniqueFunction<void()> endWanted) { endWanted_ = std::move(endWanted); }
 
     void ready(std::uint32_t) override {
         signalfd_siginfo signal{};
@@ -88,10 +84,8 @@ public:
     explicit Changes(UniqueFunction<void()> read) : read_(std::move(read)) {}
 
     /// Nothing is watched where the kernel gave no descriptor for it.
-    void watch(EventLoop& loop, int descriptor) {
-        if (descriptor >= 0) {
-            loop.add(descriptor, EPOLLIN, *this);
-        }
+    [[nodiscard]] bool watch(EventLoop& loop, int descriptor) {
+        return descriptor < 0 || loop.add(descriptor, EPOLLIN, *this);
     }
     void ready(std::uint32_t) override { read_(); }
     [[nodiscard]] bool comesFirst() const noexcept override { return true; }
@@ -108,6 +102,10 @@ struct LinuxPlatform::Services {
         platform.workQueues.reset();
         platform.diagnosticCapture.reset();
         platform.connections.reset();
+    }
+    [[nodiscard]] bool watch() {
+        return loop.isOpen() && preferenceChanges.watch(loop, preferences.fileDescriptor()) &&
+               notificationChanges.watch(loop, namedNotifications.fileDescriptor()) && signals.watch(loop);
     }
     Services(const Services&) = delete;
     Services& operator=(const Services&) = delete;
@@ -159,7 +157,6 @@ struct LinuxPlatform::Services {
         namedNotifications.deliverPosts([this] { preferences.readChanges(); });
     }};
     Changes preferenceChanges{[this] { preferences.readChanges(); }};
-    std::optional<InlineDrain> drain;
 };
 
 std::variant<std::unique_ptr<LinuxPlatform>, std::string> LinuxPlatform::open() {
@@ -170,7 +167,7 @@ std::variant<std::unique_ptr<LinuxPlatform>, std::string> LinuxPlatform::open() 
     }
     const auto& places = std::get<wire::Directories>(directories);
     std::unique_ptr<LinuxPlatform> platform(new LinuxPlatform(places));
-    if (!platform->services_->loop.isOpen()) {
+    if (!platform->services_->watch()) {
         return "the kernel gives out no more file descriptors: raise the limit on open files";
     }
     if (auto problem = platform->services_->connections.open(places.runtime)) {
@@ -196,21 +193,15 @@ void LinuxPlatform::run(SerialQueue& requestQueue,
         all.connections.releaseReplies();
     });
     all.workQueues.setTickEnd([&all] { all.sinks.flush(); });
-    all.connections.setRequestQueue(requestQueue);
-    all.loop.setBrackets([&all] { all.drain.emplace(); },
-                         [&all] {
-                             all.drain.reset();
-                             all.callQuality.flush();
-                         });
-    all.preferenceChanges.watch(all.loop, all.preferences.fileDescriptor());
-    all.notificationChanges.watch(all.loop, all.namedNotifications.fileDescriptor());
-    all.signals.watch(all.loop, [&all, &shutDown] {
+    all.workQueues.threads().setRunEnd([&all] { all.callQuality.flush(); });
+    all.connections.setRequestQueue(requestQueue, all.workQueues.threads());
+    all.signals.setEndWanted([&all, &shutDown] {
         notifyServiceManager("STOPPING=1");
         all.connections.stop();
         shutDown([&all] { all.loop.post([&all] { all.loop.stop(); }); });
     });
     notifyServiceManager("READY=1");
-    all.loop.run();
+    all.loop.run(all.workQueues.threads());
     all.sinks.flush();
 }
 

@@ -50,7 +50,6 @@ public:
         return std::nullopt;
     }
     void FlushMessages(const SessionRef& session) override { ++static_cast<FakeSession&>(*session).flushes; }
-    void commit() override { ++commits; }
 
     /// Answers the oldest configuration that waits.
     void findBackends(const std::optional<std::vector<std::string>>& backends) {
@@ -63,7 +62,6 @@ public:
     std::optional<std::string> sendFailure;
     std::vector<std::shared_ptr<FakeSession>> sessions;
     std::vector<Completion> completions;
-    int commits = 0;
 };
 
 } // namespace tamblo

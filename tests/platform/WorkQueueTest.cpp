@@ -11,7 +11,6 @@
 #include <latch>
 #include <memory>
 #include <mutex>
-#include <optional>
 #include <string>
 #include <thread>
 #include <utility>
@@ -61,7 +60,8 @@ TEST(SerialQueue, QuickWorkIsDrainedByThePosterInOneBatch) {
     const std::thread::id me = std::this_thread::get_id();
     bool allHere = true;
     queue->setBatchEnd([&] { trace += "|"; });
-    InlineDrain drain;
+    queues.threads().setRunEnd([&] { trace += "."; });
+    queues.threads().beginWakeUp();
     for (const char letter : {'a', 'b', 'c'}) {
         queue->post([&, letter] {
             trace += letter;
@@ -72,8 +72,8 @@ TEST(SerialQueue, QuickWorkIsDrainedByThePosterInOneBatch) {
         });
     }
     EXPECT_EQ(trace, "");
-    drain.drain();
-    EXPECT_EQ(trace, "abc|d|");
+    queues.threads().endWakeUp();
+    EXPECT_EQ(trace, "abc|d|.");
     EXPECT_TRUE(allHere);
 }
 
@@ -92,7 +92,7 @@ TEST(SerialQueue, WorkThatMayBlockLeavesThePosterAndTakesWhatFollowsAlong) {
             };
         };
         {
-            InlineDrain drain;
+            queues.threads().beginWakeUp();
             queue->post([&] {
                 step('a')();
                 queue->setMayBlock(mayAllBlock); // even what is posted already
@@ -104,7 +104,7 @@ TEST(SerialQueue, WorkThatMayBlockLeavesThePosterAndTakesWhatFollowsAlong) {
                 },
                 mayAllBlock ? Pace::quick : Pace::mayBlock);
             queue->post(step('c'));
-            drain.drain(); // returns although b has not run
+            queues.threads().endWakeUp(); // returns although b has not run
             mayGoOn.set_value();
         }
         settle(*queue);
@@ -159,13 +159,13 @@ TEST(SerialQueue, WhatWasPostedRunsAfterItIsDestroyed) {
 
         // In its own work, and on the thread that is to drain it.
         queue = queues.makeSerialQueue("suicide");
-        InlineDrain drain;
+        queues.threads().beginWakeUp();
         queue->post([&] { queue.reset(); });
         queue->post([&ran] { ++ran; });
         auto other = queues.makeSerialQueue("abandoned");
         other->post([&ran] { ++ran; });
         other.reset();
-        drain.drain();
+        queues.threads().endWakeUp();
         EXPECT_EQ(queue, nullptr);
     }
     EXPECT_EQ(ran, 1002);
@@ -188,9 +188,8 @@ TEST(SerialQueue, RunsNothingWhileItIsSuspendedAndAllOfItAfterwards) {
             return trace;
         };
         std::promise<void> suspended;
-        std::optional<InlineDrain> drain;
         if (isInline) {
-            drain.emplace();
+            queues.threads().beginWakeUp();
         }
         queue->setBatchEnd([&, isFirst = true]() mutable {
             if (std::exchange(isFirst, false)) {
@@ -203,7 +202,7 @@ TEST(SerialQueue, RunsNothingWhileItIsSuspendedAndAllOfItAfterwards) {
             append('a')();
         });
         queue->post(append('b')); // as a rule of the same batch
-        drain.reset();
+        queues.threads().endWakeUp();
         ASSERT_EQ(suspended.get_future().wait_for(kPatience), std::future_status::ready);
         queue->post(append('c'), Pace::mayBlock);
         queue->post(append('d'));

@@ -158,10 +158,8 @@ TEST_F(RtcWorkerTest, TheSummaryJoinsWhatWasSentOnceWhileStarted) {
     const auto& sessions = device.callQuality.sessions;
     sendNumber(0, {{"early", true}});
     play("start run found");
-    const int commits = device.callQuality.commits;
     sendNumber(1, {{"volume", 3}, {"zrreporting_timestamp", 4e9}});
     run();
-    EXPECT_EQ(device.callQuality.commits, commits + 1);
     EXPECT_EQ(sessions[0]->messages[0].category, 4) << "the kind";
     sendNumber(1, {{"volume", 3}, {"zrreporting_timestamp", 4e9}});
     const MessageRef elsewhere = messageOf({{"volume", 5}, {"n", 2}, {"zrreporting_timestamp", 5e9}}, 4, 1);

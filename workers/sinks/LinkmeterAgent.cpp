@@ -26,7 +26,6 @@ template <typename Piece> void LinkmeterAgent::post(Piece piece, Pace pace) {
     if (linkmeterQueue_ == nullptr) {
         linkmeterQueue_ =
             context_.platform().workQueues->makeSerialQueue("com.vandra.tamblo.session.linkmeter");
-        linkmeterQueue_->setBatchEnd([&service = *context_.platform().callQuality] { service.commit(); });
     }
     linkmeterQueue_->post(
         [self = shared_from_this(), piece = std::move(piece)]() mutable {

@@ -1,6 +1,6 @@
 #include "platform/linux/connections/LinuxConnection.h"
 
-#include "platform/linux/connections/LinuxConnectionService.h"
+#include "base/Format.h"
 #include "platform/linux/connections/RequestDispatch.h"
 #include "wire/FrameSplitter.h"
 #include "wire/Reply.h"
@@ -8,6 +8,7 @@
 #include <algorithm>
 #include <cerrno>
 #include <cstring>
+#include <system_error>
 #include <utility>
 
 #include <sys/epoll.h>
@@ -29,8 +30,8 @@ void giveBackIfLarge(TextBuffer& buffer) noexcept {
 
 } // namespace
 
-LinuxConnection::LinuxConnection(LinuxConnectionService& service, FileDescriptor socket, pid_t peer)
-    : service_(service), peer_(peer), socket_(std::move(socket)) {}
+LinuxConnection::LinuxConnection(Shared& shared, FileDescriptor socket, pid_t peer, Ended ended)
+    : shared_(shared), peer_(peer), ended_(std::move(ended)), socket_(std::move(socket)) {}
 
 void LinuxConnection::setExportedObject(std::shared_ptr<ZRReportingServiceProtocol> object) {
     exportedObject_ = std::move(object);
@@ -45,9 +46,9 @@ void LinuxConnection::setInvalidationHandler(UniqueFunction<void()> handler) {
 }
 
 void LinuxConnection::resume() {
-    const std::lock_guard lock(mutex_);
+    const MutexLock lock(mutex_);
     wantsInput_ = true;
-    watchLocked();
+    watch();
 }
 
 std::string LinuxConnection::description() const {
@@ -55,43 +56,42 @@ std::string LinuxConnection::description() const {
 }
 
 void LinuxConnection::ready(std::uint32_t events) {
-    bool mayRead = false;
+    int socket = -1;
     {
-        const std::lock_guard lock(mutex_);
+        const MutexLock lock(mutex_);
         if ((events & EPOLLOUT) != 0) {
-            sendLocked();
+            send();
         }
         // Another source of this wake-up, a signal, may have ended the reading.
-        mayRead = wantsInput_;
+        if (wantsInput_ && (events & ~static_cast<std::uint32_t>(EPOLLOUT)) != 0) {
+            socket = socket_.get();
+        }
     }
-    if ((events & ~static_cast<std::uint32_t>(EPOLLOUT)) != 0 && mayRead) {
-        read();
-    }
-}
-
-void LinuxConnection::read() {
-    std::span<const std::uint8_t> received;
-    const Ending ending = receive(received);
-    if (ending != Ending::none) {
-        beginEnd(ending);
+    if (socket < 0) {
         return;
     }
-    takeFrames(received);
+    std::span<const std::uint8_t> received;
+    const Ending ending = receive(socket, received);
+    if (ending != Ending::none) {
+        beginEnd(ending);
+    } else if (!received.empty()) {
+        takeFrames(received);
+    }
 }
 
-LinuxConnection::Ending LinuxConnection::receive(std::span<const std::uint8_t>& received) {
+LinuxConnection::Ending LinuxConnection::receive(int socket, std::span<const std::uint8_t>& received) {
     // A long frame grows in its own buffer; otherwise what is left of the last read goes before the new
     // bytes.
     const bool collects = unfinished_.size() > kSmallRest;
     std::uint8_t* const start =
         collects ? reinterpret_cast<std::uint8_t*>(unfinished_.room(kBytesPerRead)) - unfinished_.size()
-                 : service_.readBuffer_.get();
+                 : shared_.intake.buffer();
     if (!collects && !unfinished_.empty()) {
         std::memcpy(start, unfinished_.data(), unfinished_.size());
     }
     const std::size_t kept = unfinished_.size();
     const std::size_t room = collects ? std::min(unfinishedWants_ - kept, kBytesPerRead) : kBytesPerRead;
-    const ssize_t count = ::recv(socket_.get(), start + kept, room, MSG_DONTWAIT);
+    const ssize_t count = ::recv(socket, start + kept, room, MSG_DONTWAIT);
     if (count == 0) {
         return Ending::orderly;
     }
@@ -111,9 +111,6 @@ LinuxConnection::Ending LinuxConnection::receive(std::span<const std::uint8_t>& 
 }
 
 void LinuxConnection::takeFrames(std::span<const std::uint8_t> received) {
-    if (received.empty()) {
-        return;
-    }
     wire::FrameSplitter frames(received);
     std::size_t requests = 0;
     for (auto item = frames.next(); item && ending_ == Ending::none; item = frames.next()) {
@@ -127,19 +124,18 @@ void LinuxConnection::takeFrames(std::span<const std::uint8_t> received) {
     }
     const std::size_t bytes = received.size() - frames.rest().size();
     keepRest(frames.rest(), frames.wanted());
-    if (requests == 0 || service_.requests_ == nullptr) {
+    if (requests == 0) {
         return;
     }
     const std::size_t allRequests = waitingRequests_.fetch_add(requests) + requests;
     const std::size_t allBytes = waitingBytes_.fetch_add(bytes) + bytes;
     if (allRequests > kMaximumWaitingRequests || allBytes > kMaximumWaitingBytes) {
-        const std::lock_guard lock(mutex_);
+        const MutexLock lock(mutex_);
         isFlooded_ = true;
-        watchLocked();
+        watch();
     }
-    service_.requests_->post(
-        [self = shared_from_this(), requests, bytes] { self->workedOff(requests, bytes); });
-    service_.posted(requests);
+    shared_.intake.endRead(
+        requests, [self = shared_from_this(), requests, bytes] { self->carriedOut(requests, bytes); });
 }
 
 void LinuxConnection::keepRest(std::span<const std::uint8_t> rest, std::size_t wanted) {
@@ -151,19 +147,18 @@ void LinuxConnection::keepRest(std::span<const std::uint8_t> rest, std::size_t w
 }
 
 void LinuxConnection::carryOut(std::span<const std::uint8_t> item) {
-    wire::Request& request = service_.request_;
-    if (const auto refusal = wire::decodeRequest(item, service_.keySets_, request)) {
+    if (const auto refusal = shared_.intake.decode(item)) {
         refuse(*refusal);
-        return;
+    } else {
+        dispatchRequest(*exportedObject_, shared_.intake.request(), shared_from_this());
     }
-    dispatchRequest(*exportedObject_, request, shared_from_this());
 }
 
 void LinuxConnection::refuse(const wire::Refusal& refusal) {
     {
-        const std::lock_guard lock(mutex_);
+        const MutexLock lock(mutex_);
         wire::appendErrorReply(outgoing_, refusal.id, refusal.error);
-        sendLocked();
+        send();
     }
     if (refusal.endsConnection) {
         beginEnd(Ending::interrupted);
@@ -172,25 +167,25 @@ void LinuxConnection::refuse(const wire::Refusal& refusal) {
 
 void LinuxConnection::replied() {
     if (!std::exchange(hasHeldReplies_, true)) {
-        service_.hasReplies(shared_from_this());
+        shared_.heldReplies.add(shared_from_this());
     }
     if (held_.size() > kMaximumWaitingReplies) {
-        giveUpLocked();
+        giveUp();
     }
 }
 
-void LinuxConnection::workedOff(std::size_t requests, std::size_t bytes) {
+void LinuxConnection::carriedOut(std::size_t requests, std::size_t bytes) {
     const std::size_t requestsLeft = waitingRequests_.fetch_sub(requests) - requests;
     const std::size_t bytesLeft = waitingBytes_.fetch_sub(bytes) - bytes;
-    const std::lock_guard lock(mutex_);
+    const MutexLock lock(mutex_);
     if (isFlooded_ && requestsLeft <= kMaximumWaitingRequests && bytesLeft <= kMaximumWaitingBytes) {
         isFlooded_ = false;
-        watchLocked();
+        watch();
     }
 }
 
 void LinuxConnection::releaseReplies() {
-    const std::lock_guard lock(mutex_);
+    const MutexLock lock(mutex_);
     hasHeldReplies_ = false;
     if (outgoing_.empty()) {
         std::swap(outgoing_, held_);
@@ -198,10 +193,10 @@ void LinuxConnection::releaseReplies() {
         outgoing_.append(held_.view());
         giveBackIfLarge(held_);
     }
-    sendLocked();
+    send();
 }
 
-void LinuxConnection::sendLocked() {
+void LinuxConnection::send() {
     if (!socket_.isOpen() || isUnwritable_) {
         outgoing_.clear();
         sent_ = 0;
@@ -224,22 +219,22 @@ void LinuxConnection::sendLocked() {
         giveBackIfLarge(outgoing_);
         sent_ = 0;
     } else if (outgoing_.size() - sent_ > kMaximumWaitingReplies) {
-        giveUpLocked();
+        giveUp();
     } else if (sent_ > kKeptCapacity) {
         outgoing_.dropFront(sent_);
         sent_ = 0;
     }
-    watchLocked();
+    watch();
 }
 
-/// Keeps nothing more for a client that does not read, and ends the connection.
-void LinuxConnection::giveUpLocked() {
+/// Keeps nothing more for the client, and ends the connection.
+void LinuxConnection::giveUp() {
     isUnwritable_ = true;
     held_.reset();
-    service_.loop_.post([self = shared_from_this()] { self->beginEnd(Ending::interrupted); });
+    shared_.loop.post([self = shared_from_this()] { self->beginEnd(Ending::interrupted); });
 }
 
-void LinuxConnection::watchLocked() {
+void LinuxConnection::watch() {
     if (!socket_.isOpen()) {
         return;
     }
@@ -252,19 +247,25 @@ void LinuxConnection::watchLocked() {
     }
     // A socket from which nothing is wanted leaves the loop: a hang-up would be reported over and over.
     if (events == 0) {
-        service_.loop_.remove(socket_.get());
-    } else if (watched_ == 0) {
-        service_.loop_.add(socket_.get(), events, *this);
-    } else {
-        service_.loop_.modify(socket_.get(), events, *this);
+        shared_.loop.remove(socket_.get());
+    } else if (watched_ != 0) {
+        shared_.loop.modify(socket_.get(), events, *this);
+    } else if (!shared_.loop.add(socket_.get(), events, *this)) {
+        shared_.log.report(
+            LogLevel::error, "zrrs",
+            formatted("a client is turned away, since its socket cannot be watched: {}. pid={}",
+                      std::generic_category().message(errno), peer_));
+        wantsInput_ = false;
+        giveUp();
+        return;
     }
     watched_ = events;
 }
 
 void LinuxConnection::stopReading() {
-    const std::lock_guard lock(mutex_);
+    const MutexLock lock(mutex_);
     wantsInput_ = false;
-    watchLocked();
+    watch();
 }
 
 void LinuxConnection::beginEnd(Ending ending) {
@@ -275,18 +276,13 @@ void LinuxConnection::beginEnd(Ending ending) {
     stopReading();
     // What was read before is carried out, and answered, first. Replies go at the end of a batch, so the end
     // of the connection waits for the batch after the one that carries out the last request.
-    auto endLater = [self = shared_from_this()] { self->service_.loop_.post([self] { self->end(); }); };
-    if (service_.requests_ != nullptr) {
-        service_.requests_->post([&requests = *service_.requests_, endLater] { requests.post(endLater); });
-    } else {
-        endLater();
-    }
+    SerialQueue& queue = shared_.intake.queue();
+    queue.post([&queue, self = shared_from_this()]() mutable {
+        queue.post([self = std::move(self)] { self->shared_.loop.post([self] { self->end(); }); });
+    });
 }
 
 void LinuxConnection::end() {
-    if (!exportedObject_) {
-        return;
-    }
     if (ending_ == Ending::interrupted && interruptionHandler_) {
         interruptionHandler_();
     }
@@ -298,15 +294,15 @@ void LinuxConnection::end() {
     invalidationHandler_.reset();
     exportedObject_.reset();
     {
-        const std::lock_guard lock(mutex_);
+        const MutexLock lock(mutex_);
         wantsInput_ = false;
         isUnwritable_ = true;
         outgoing_.reset();
         held_.reset();
-        watchLocked();
+        watch();
         socket_.reset();
     }
-    service_.ended(*this);
+    ended_(shared_from_this());
 }
 
 } // namespace tamblo

@@ -2,7 +2,6 @@
 
 #include "os/Directory.h"
 #include "os/LocalAddress.h"
-#include "platform/linux/loop/LinuxSerialQueue.h"
 #include "wire/Protocol.h"
 
 #include <cerrno>
@@ -10,6 +9,7 @@
 #include <chrono>
 #include <cstdlib>
 #include <cstring>
+#include <set>
 #include <string_view>
 #include <utility>
 
@@ -59,9 +59,6 @@ bool isAnswered(const LocalAddress& address) {
 }
 
 } // namespace
-
-LinuxConnectionService::LinuxConnectionService(EventLoop& loop, StructuredLog& log)
-    : loop_(loop), log_(log), readBuffer_(new std::uint8_t[kBytesPerRead + kSmallRest]) {}
 
 LinuxConnectionService::~LinuxConnectionService() {
     removeSocketFile();
@@ -136,7 +133,10 @@ ConnectionListener& LinuxConnectionService::listenerForServiceName(std::string_v
 }
 
 void LinuxConnectionService::resume() {
-    loop_.add(socket_.get(), EPOLLIN, *this);
+    isWatched_ = shared_.loop.add(socket_.get(), EPOLLIN, *this);
+    if (!isWatched_) {
+        pauseAccepting(errno);
+    }
 }
 
 void LinuxConnectionService::ready(std::uint32_t) {
@@ -144,7 +144,7 @@ void LinuxConnectionService::ready(std::uint32_t) {
         FileDescriptor socket(::accept4(socket_.get(), nullptr, nullptr, SOCK_CLOEXEC | SOCK_NONBLOCK));
         if (socket.isOpen()) {
             if (std::exchange(isPaused_, false)) {
-                log_.report(LogLevel::error, kLogCategory, "accepting connections again");
+                shared_.log.report(LogLevel::error, kLogCategory, "accepting connections again");
             }
             accept(std::move(socket));
             continue;
@@ -161,82 +161,52 @@ void LinuxConnectionService::ready(std::uint32_t) {
 
 void LinuxConnectionService::pauseAccepting(int error) {
     if (!std::exchange(isPaused_, true)) {
-        log_.report(LogLevel::error, kLogCategory, because("accepting connections rests", error));
+        shared_.log.report(LogLevel::error, kLogCategory, because("accepting connections rests", error));
     }
-    loop_.remove(socket_.get());
-    loop_.callAfter(kAcceptPause, [this] {
+    stopWatching();
+    shared_.loop.callAfter(kAcceptPause, [this] {
         if (socket_.isOpen()) {
             resume();
         }
     });
 }
 
+void LinuxConnectionService::stopWatching() {
+    if (std::exchange(isWatched_, false)) {
+        shared_.loop.remove(socket_.get());
+    }
+}
+
 void LinuxConnectionService::accept(FileDescriptor socket) {
     ucred credentials{};
     socklen_t length = sizeof credentials;
     ::getsockopt(socket.get(), SOL_SOCKET, SO_PEERCRED, &credentials, &length);
-    auto connection = std::make_shared<LinuxConnection>(*this, std::move(socket), credentials.pid);
-    connections_.emplace(connection.get(), connection);
-    if (!delegate_->shouldAcceptNewConnection(*connection)) {
-        connections_.erase(connection.get());
-        return;
+    auto connection = std::make_shared<LinuxConnection>(shared_, std::move(socket), credentials.pid,
+                                                        [this](const auto& ended) {
+                                                            const MutexLock lock(mutex_);
+                                                            connections_.erase(ended);
+                                                        });
+    if (delegate_->shouldAcceptNewConnection(*connection)) {
+        const MutexLock lock(mutex_);
+        connections_.insert(std::move(connection));
     }
-    const std::lock_guard lock(mutex_);
-    ++connectionsByProcess_[credentials.pid];
 }
 
 std::vector<pid_t> LinuxConnectionService::clientProcesses() {
-    const std::lock_guard lock(mutex_);
-    std::vector<pid_t> processes;
-    processes.reserve(connectionsByProcess_.size());
-    for (const auto& [process, connections] : connectionsByProcess_) {
-        processes.push_back(process);
+    std::set<pid_t> processes;
+    const MutexLock lock(mutex_);
+    for (const auto& connection : connections_) {
+        processes.insert(connection->peerProcessIdentifier());
     }
-    return processes;
-}
-
-void LinuxConnectionService::hasReplies(std::shared_ptr<LinuxConnection> connection) {
-    const std::lock_guard lock(mutex_);
-    replied_.push_back(std::move(connection));
-}
-
-void LinuxConnectionService::releaseReplies() {
-    std::vector<std::shared_ptr<LinuxConnection>> replied;
-    {
-        const std::lock_guard lock(mutex_);
-        replied.swap(replied_);
-    }
-    for (const std::shared_ptr<LinuxConnection>& connection : replied) {
-        connection->releaseReplies();
-    }
-}
-
-void LinuxConnectionService::posted(std::size_t requests) {
-    InlineDrain* const drain = InlineDrain::current();
-    if (drain != nullptr && drain->add(requests) >= kRequestsPerBatch) {
-        drain->drain();
-    }
-}
-
-void LinuxConnectionService::ended(LinuxConnection& connection) {
-    // Sources of the same wake-up may still name it, so it is let go after them.
-    const auto found = connections_.find(&connection);
-    if (found != connections_.end()) {
-        loop_.post([kept = std::move(found->second)] {});
-        connections_.erase(found);
-        const std::lock_guard lock(mutex_);
-        const auto process = connectionsByProcess_.find(connection.peerProcessIdentifier());
-        if (process != connectionsByProcess_.end() && --process->second == 0) {
-            connectionsByProcess_.erase(process);
-        }
-    }
+    return {processes.begin(), processes.end()};
 }
 
 void LinuxConnectionService::stop() {
-    loop_.remove(socket_.get());
+    stopWatching();
     removeSocketFile();
     socket_.reset();
-    for (const auto& [pointer, connection] : connections_) {
+    const MutexLock lock(mutex_);
+    for (const auto& connection : connections_) {
         connection->stopReading();
     }
 }

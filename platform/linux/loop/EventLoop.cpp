@@ -1,7 +1,10 @@
 #include "platform/linux/loop/EventLoop.h"
 
+#include "platform/linux/loop/LinuxSerialQueue.h"
+
 #include <algorithm>
 #include <array>
+#include <cassert>
 #include <span>
 #include <utility>
 
@@ -17,43 +20,43 @@ constexpr int kEventsPerWakeUp = 64;
 
 } // namespace
 
-EventLoop::EventLoop()
-    : epoll_(::epoll_create1(EPOLL_CLOEXEC)), wakeUp_(::eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK)) {
-    epoll_event event{};
-    event.events = EPOLLIN;
-    event.data.ptr = nullptr;
-    ::epoll_ctl(epoll_.get(), EPOLL_CTL_ADD, wakeUp_.get(), &event);
+EventLoop::EventLoop() : EventLoop(::epoll_ctl) {}
+
+EventLoop::EventLoop(Control calls)
+    : control_(calls),
+      epoll_(::epoll_create1(EPOLL_CLOEXEC)),
+      wakeUp_(::eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK)) {
+    isOpen_ = control(EPOLL_CTL_ADD, wakeUp_.get(), EPOLLIN, nullptr);
 }
 
 EventLoop::~EventLoop() = default;
 
-void EventLoop::add(int descriptor, std::uint32_t events, EventSource& source) {
+bool EventLoop::control(int operation, int descriptor, std::uint32_t events, EventSource* source) {
     epoll_event event{};
     event.events = events;
-    event.data.ptr = &source;
-    ::epoll_ctl(epoll_.get(), EPOLL_CTL_ADD, descriptor, &event);
+    event.data.ptr = source;
+    return control_(epoll_.get(), operation, descriptor, &event) == 0;
+}
+
+bool EventLoop::add(int descriptor, std::uint32_t events, EventSource& source) {
+    return control(EPOLL_CTL_ADD, descriptor, events, &source);
 }
 
 void EventLoop::modify(int descriptor, std::uint32_t events, EventSource& source) {
-    epoll_event event{};
-    event.events = events;
-    event.data.ptr = &source;
-    ::epoll_ctl(epoll_.get(), EPOLL_CTL_MOD, descriptor, &event);
+    [[maybe_unused]] const bool isModified = control(EPOLL_CTL_MOD, descriptor, events, &source);
+    assert(isModified);
 }
 
 void EventLoop::remove(int descriptor) {
-    ::epoll_ctl(epoll_.get(), EPOLL_CTL_DEL, descriptor, nullptr);
+    [[maybe_unused]] const bool isRemoved = control(EPOLL_CTL_DEL, descriptor, 0, nullptr);
+    assert(isRemoved);
 }
 
 void EventLoop::post(Task task) {
     {
-        const std::lock_guard lock(mutex_);
+        const MutexLock lock(mutex_);
         tasks_.push_back(std::move(task));
     }
-    wake();
-}
-
-void EventLoop::wake() noexcept {
     const std::uint64_t one = 1;
     [[maybe_unused]] const ssize_t written = ::write(wakeUp_.get(), &one, sizeof one);
 }
@@ -61,11 +64,6 @@ void EventLoop::wake() noexcept {
 void EventLoop::callAfter(std::chrono::milliseconds delay, Task task) {
     deadline_ = std::chrono::steady_clock::now() + delay;
     delayed_ = std::move(task);
-}
-
-void EventLoop::setBrackets(Task before, Task after) {
-    before_ = std::move(before);
-    after_ = std::move(after);
 }
 
 int EventLoop::timeout() const noexcept {
@@ -80,7 +78,7 @@ int EventLoop::timeout() const noexcept {
 void EventLoop::runTasks() {
     std::vector<Task> tasks;
     {
-        const std::lock_guard lock(mutex_);
+        const MutexLock lock(mutex_);
         tasks.swap(tasks_);
     }
     for (Task& task : tasks) {
@@ -96,15 +94,13 @@ void EventLoop::runDelayed() {
     }
 }
 
-void EventLoop::run() {
+void EventLoop::run(StrandThreads& strands) {
     std::array<epoll_event, kEventsPerWakeUp> events;
     while (!isStopped_) {
         const int count = ::epoll_wait(epoll_.get(), events.data(), kEventsPerWakeUp, timeout());
         const auto up = std::span(events).first(static_cast<std::size_t>(std::max(count, 0)));
         bool hasTasks = false;
-        if (before_) {
-            before_();
-        }
+        strands.beginWakeUp();
         for (const bool first : {true, false}) {
             for (const epoll_event& event : up) {
                 auto* source = static_cast<EventSource*>(event.data.ptr);
@@ -114,9 +110,7 @@ void EventLoop::run() {
                 hasTasks = hasTasks || source == nullptr;
             }
         }
-        if (after_) {
-            after_();
-        }
+        strands.endWakeUp();
         if (hasTasks) {
             std::uint64_t ignored;
             [[maybe_unused]] const ssize_t bytes = ::read(wakeUp_.get(), &ignored, sizeof ignored);

@@ -7,25 +7,21 @@
 namespace tamblo {
 
 void LimitedQueue::post(Work work) {
-    if (!admit()) {
-        return;
-    }
-    std::call_once(isQueueMade_, [this] { queue_ = workQueues_.makeSerialQueue(label_); });
-    queue_->post(
-        [this, work = std::move(work)]() mutable {
-            begin();
-            work();
-        },
-        Pace::mayBlock);
-}
-
-bool LimitedQueue::admit() {
     std::uint64_t dropped = 0;
     {
-        const std::lock_guard lock(mutex_);
+        const MutexLock lock(mutex_);
         if (waiting_ < limit_.waiting) {
             ++waiting_;
-            return true;
+            if (queue_ == nullptr) {
+                queue_ = workQueues_.makeSerialQueue(label_);
+            }
+            queue_->post(
+                [this, work = std::move(work)]() mutable {
+                    begin();
+                    work();
+                },
+                Pace::mayBlock);
+            return;
         }
         dropped = ++dropped_;
     }
@@ -33,13 +29,12 @@ bool LimitedQueue::admit() {
         log_.report(LogLevel::error, limit_.categoryCode,
                     formatted("{} {} wait; further ones are dropped", limit_.waiting, limit_.what));
     }
-    return false;
 }
 
 void LimitedQueue::begin() {
     std::uint64_t dropped = 0;
     {
-        const std::lock_guard lock(mutex_);
+        const MutexLock lock(mutex_);
         if (--waiting_ == 0) {
             dropped = std::exchange(dropped_, 0);
         }

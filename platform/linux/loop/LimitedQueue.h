@@ -1,12 +1,12 @@
 #pragma once
 
+#include "base/Mutex.h"
 #include "platform/StructuredLog.h"
 #include "platform/WorkQueue.h"
 
 #include <cstddef>
 #include <cstdint>
 #include <memory>
-#include <mutex>
 #include <string>
 #include <string_view>
 
@@ -27,24 +27,20 @@ public:
     LimitedQueue(WorkQueues& workQueues, std::string label, Limit limit, StructuredLog& log)
         : limit_(limit), label_(std::move(label)), workQueues_(workQueues), log_(log) {}
 
-    void post(Work work);
+    void post(Work work) TAMBLO_EXCLUDES(mutex_);
 
 private:
-    /// Whether the piece may wait.
-    [[nodiscard]] bool admit();
-    void begin();
+    void begin() TAMBLO_EXCLUDES(mutex_);
 
     const Limit limit_;
     const std::string label_;
     WorkQueues& workQueues_;
     StructuredLog& log_;
 
-    std::mutex mutex_; ///< guards the two that follow
-    std::size_t waiting_ = 0;
-    std::uint64_t dropped_ = 0; ///< since none waited
-
-    std::once_flag isQueueMade_;
-    std::unique_ptr<SerialQueue> queue_;
+    Mutex mutex_;
+    std::size_t waiting_ TAMBLO_GUARDED_BY(mutex_) = 0;
+    std::uint64_t dropped_ TAMBLO_GUARDED_BY(mutex_) = 0; ///< since none waited
+    std::unique_ptr<SerialQueue> queue_ TAMBLO_GUARDED_BY(mutex_);
 };
 
 } // namespace tamblo

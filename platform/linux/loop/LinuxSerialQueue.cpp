@@ -6,73 +6,76 @@ namespace tamblo {
 
 namespace {
 
-thread_local InlineDrain* currentDrain = nullptr;
-
 /// A batch that takes longer than this ran into something slow (a disk that stalls, most likely). For this
 /// many times as long the queue is then left to the pool, so that the responsive thread is held up for a
 /// small share of the time, and so that a short hold-up, when other programs had the processor, has no
 /// lasting effect.
 constexpr std::chrono::milliseconds kSlowBatch{25};
-constexpr int kInlineBanFactor = 4;
+constexpr int kSlowBatchFactor = 4;
 
 } // namespace
 
-InlineDrain::InlineDrain() {
-    currentDrain = this;
-}
-
-InlineDrain::~InlineDrain() {
+void StrandThreads::endWakeUp() {
     drain();
-    currentDrain = nullptr;
+    collector_ = std::thread::id();
 }
 
-InlineDrain* InlineDrain::current() noexcept {
-    return currentDrain;
-}
-
-void InlineDrain::drain() {
-    // Draining one queue may post to others, which then join the list.
-    for (std::size_t i = 0; i < strands_.size(); ++i) {
-        const std::shared_ptr<Strand> strand = std::move(strands_[i]);
-        strand->drainInline();
-    }
-    strands_.clear();
+void StrandThreads::drain() {
     posted_ = 0;
+    if (collected_.empty()) {
+        return;
+    }
+    // Draining one strand may post to others, which then join the list.
+    for (std::size_t i = 0; i < collected_.size(); ++i) {
+        const std::shared_ptr<Strand> strand = std::move(collected_[i]);
+        strand->drainQuickly();
+    }
+    collected_.clear();
+    endRun();
+}
+
+void StrandThreads::schedule(std::shared_ptr<Strand> strand) {
+    if (collector_.load(std::memory_order_relaxed) == std::this_thread::get_id()) {
+        collected_.push_back(std::move(strand));
+    } else {
+        scheduleOnPool(std::move(strand));
+    }
+}
+
+void StrandThreads::scheduleOnPool(std::shared_ptr<Strand> strand) {
+    pool_.post([this, strand = std::move(strand)] {
+        strand->drain();
+        endRun();
+    });
+}
+
+void StrandThreads::endRun() {
+    if (runEnd_) {
+        runEnd_();
+    }
 }
 
 void Strand::post(Work work, Pace pace) {
     {
-        const std::lock_guard lock(mutex_);
+        const MutexLock lock(mutex_);
         pending_.push_back({std::move(work), pace});
         if (std::exchange(isScheduled_, true)) {
             return;
         }
     }
-    schedule();
+    threads_.schedule(shared_from_this());
 }
 
 void Strand::resume() {
     {
-        const std::lock_guard lock(mutex_);
-        // The rest of a batch is nobody's while none drains.
+        const MutexLock lock(mutex_);
+        // The rest of a batch may be looked at here while nobody drains.
         if (!isSuspended_.exchange(false) || isScheduled_ || (next_ == batch_.size() && pending_.empty())) {
             return;
         }
         isScheduled_ = true;
     }
-    schedule();
-}
-
-void Strand::schedule() {
-    if (currentDrain != nullptr) {
-        currentDrain->strands_.push_back(shared_from_this());
-    } else {
-        handToPool();
-    }
-}
-
-void Strand::handToPool() {
-    pool_.post([strand = shared_from_this()] { strand->drainOnPool(); });
+    threads_.schedule(shared_from_this());
 }
 
 bool Strand::hasBatch() {
@@ -81,7 +84,7 @@ bool Strand::hasBatch() {
         batch_.clear();
         next_ = 0;
     }
-    const std::lock_guard lock(mutex_);
+    const MutexLock lock(mutex_);
     if (isSuspended_ || (!hasRest && pending_.empty())) {
         isScheduled_ = false;
         return false;
@@ -108,32 +111,27 @@ void Strand::runBatch(bool stopAtBlocking) {
     }
 }
 
-void Strand::drainOnPool() {
+void Strand::drain() {
     while (hasBatch()) {
         runBatch(false);
     }
 }
 
-void Strand::drainInline() {
+void Strand::drainQuickly() {
     Time started = std::chrono::steady_clock::now();
-    if (started < inlineAllowedFrom_) {
-        handToPool();
-        return;
-    }
-    while (hasBatch()) {
+    bool isForPool = started < quickAllowedFrom_;
+    while (!isForPool && hasBatch()) {
         runBatch(true);
         const Time ended = std::chrono::steady_clock::now();
         if (ended - started > kSlowBatch) {
-            inlineAllowedFrom_ = ended + kInlineBanFactor * (ended - started);
+            quickAllowedFrom_ = ended + kSlowBatchFactor * (ended - started);
         }
-        if (isSuspended_) {
-            continue;
-        }
-        if (next_ != batch_.size() || ended < inlineAllowedFrom_) {
-            handToPool();
-            return;
-        }
+        const bool isAtBlocking = next_ != batch_.size() && !isSuspended_;
+        isForPool = isAtBlocking || ended < quickAllowedFrom_;
         started = ended;
+    }
+    if (isForPool) {
+        threads_.scheduleOnPool(shared_from_this());
     }
 }
 

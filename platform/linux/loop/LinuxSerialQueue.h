@@ -1,5 +1,6 @@
 #pragma once
 
+#include "base/Mutex.h"
 #include "platform/WorkQueue.h"
 #include "platform/linux/loop/ThreadPool.h"
 
@@ -7,44 +8,77 @@
 #include <chrono>
 #include <cstddef>
 #include <memory>
-#include <mutex>
 #include <string>
 #include <string_view>
+#include <thread>
 #include <utility>
 #include <vector>
 
 namespace tamblo {
 
+// Why a queue has no thread. Thousands of sessions have a queue each, so a queue is a strand: a list of work
+// that is drained by one thread at a time. Whoever posts to a strand that nobody drains sees to it that
+// somebody does; from then on it is that thread's until it is found empty, or suspended.
+//
+// Which thread that is. Waking another thread costs more than a message does, so the event loop's thread runs
+// the quick work that it posts itself. It does not run it at once: during a wake-up the strands are
+// collected, and drained together at its end, so that one write of the sinks and one send of the replies
+// serve all that was read. Everything else runs on the pool.
+//
+// Who may block. Nobody on the event loop's thread. A piece that may block goes to the pool, and takes what
+// stands behind it along, as the order is kept. Quick work that turns out slow (a disk that stalls) sends its
+// strand to the pool for a while.
+//
+// A batch is what was posted when it begins. At its end the queue's user is called, on the same thread and
+// before anything else of the queue runs: that is where the sinks are written and then the replies let go.
+// After that, once a thread has done what there was, it calls the end of the run, for what any queue's work
+// may have left to be written and no reply waits for.
+//
+// Who owns what. The user owns the queue, and may let it go at any time, in its own work too. The strand is
+// shared by the queue and by whoever drains it, so that what was posted still runs.
+
 class Strand;
 
-/// Lets the thread that holds it run, itself, the quick work that it posts: waking another thread costs more
-/// than a message does. Work is posted as ever, collected, and run in one batch at `drain`, so that a batch
-/// of requests shares one write of the sinks and one send of the replies. Work that may block goes to the
-/// pool, and so does everything behind it. One per thread at a time.
-class InlineDrain {
+/// The threads that the strands of a process run on: the event loop's during its wake-ups, and a pool's. The
+/// destructor works off what was posted.
+class StrandThreads {
 public:
-    InlineDrain();
-    ~InlineDrain();
-    InlineDrain(const InlineDrain&) = delete;
-    InlineDrain& operator=(const InlineDrain&) = delete;
+    StrandThreads() = default;
+    ~StrandThreads() = default;
+    StrandThreads(const StrandThreads&) = delete;
+    StrandThreads& operator=(const StrandThreads&) = delete;
 
-    /// Counts posted work towards a batch; answers how much there is since the last drain.
-    std::size_t add(std::size_t posted) noexcept { return posted_ += posted; }
+    /// What the calling thread posts from now until `endWakeUp` is collected for it. One thread at a time.
+    void beginWakeUp() noexcept { collector_ = std::this_thread::get_id(); }
+    void endWakeUp();
+    /// Runs what was collected. On the collecting thread.
     void drain();
-    /// The calling thread's, or null.
-    [[nodiscard]] static InlineDrain* current() noexcept;
+    /// Counts what was posted towards a batch; answers how much there is since the last drain.
+    std::size_t count(std::size_t posted) noexcept { return posted_ += posted; }
+    /// Called at the end of each run of work, on the thread that ran it. Set before the first post.
+    void setRunEnd(UniqueFunction<void()> runEnd) { runEnd_ = std::move(runEnd); }
+
+    /// Collects the strand, or has the pool drain it. From any thread.
+    void schedule(std::shared_ptr<Strand> strand);
+    void scheduleOnPool(std::shared_ptr<Strand> strand);
+    [[nodiscard]] ThreadPool& pool() noexcept { return pool_; }
 
 private:
-    friend class Strand;
-    std::vector<std::shared_ptr<Strand>> strands_;
+    void endRun();
+
+    std::atomic<std::thread::id> collector_;
+    // The collecting thread's.
+    std::vector<std::shared_ptr<Strand>> collected_;
     std::size_t posted_ = 0;
+
+    UniqueFunction<void()> runEnd_;
+    ThreadPool pool_; ///< goes first, as it works off what was posted
 };
 
-/// What a serial queue is made of: no thread of its own; whoever drains it, the pool or an `InlineDrain`, is
-/// the only one to do so at that time, and keeps it until it is empty.
+/// What a serial queue is made of; see above.
 class Strand final : public std::enable_shared_from_this<Strand> {
 public:
-    explicit Strand(ThreadPool& pool) : pool_(pool) {}
+    explicit Strand(StrandThreads& threads) : threads_(threads) {}
 
     void post(Work work, Pace pace);
     void setBatchEnd(Work batchEnd) { batchEnd_ = std::move(batchEnd); }
@@ -52,43 +86,43 @@ public:
     void suspend() noexcept { isSuspended_ = true; }
     void resume();
 
-private:
-    friend class InlineDrain;
+    /// Runs what there is, and what that posts. By whom it was scheduled for.
+    void drain();
+    /// The same, up to a piece that may block or until it takes long: the rest goes to the pool.
+    void drainQuickly();
 
+private:
     struct Item {
         Work work;
         Pace pace;
     };
     using Time = std::chrono::steady_clock::time_point;
 
-    void drainOnPool();
-    void drainInline();
     /// Whether there is something to run: the rest of a batch, or a new one. Otherwise the draining is over.
     bool hasBatch();
     void runBatch(bool stopAtBlocking);
-    void schedule();
-    void handToPool();
 
-    ThreadPool& pool_;
+    StrandThreads& threads_;
     Work batchEnd_;
 
     // Touched only by whoever drains.
     std::vector<Item> batch_;
     std::size_t next_ = 0;
-    Time inlineAllowedFrom_{};
+    Time quickAllowedFrom_{};
     bool mayBlock_ = false;
 
     std::atomic<bool> isSuspended_{false};
-    std::mutex mutex_; ///< guards what follows
-    std::vector<Item> pending_;
-    bool isScheduled_ = false; ///< somebody drains, or is about to
+    Mutex mutex_;
+    std::vector<Item> pending_ TAMBLO_GUARDED_BY(mutex_);
+    bool isScheduled_ TAMBLO_GUARDED_BY(mutex_) = false; ///< somebody drains, or is about to
 };
 
 /// A serial queue: its user's hold on a strand, which lives on until it has run what was posted.
 class LinuxSerialQueue final : public SerialQueue {
 public:
-    LinuxSerialQueue(ThreadPool& pool, std::string_view label)
-        : label_(label), strand_(std::make_shared<Strand>(pool)) {}
+    /// The threads must outlive the queue's work.
+    LinuxSerialQueue(StrandThreads& threads, std::string_view label)
+        : label_(label), strand_(std::make_shared<Strand>(threads)) {}
     ~LinuxSerialQueue() override { strand_->resume(); }
     LinuxSerialQueue(const LinuxSerialQueue&) = delete;
     LinuxSerialQueue& operator=(const LinuxSerialQueue&) = delete;

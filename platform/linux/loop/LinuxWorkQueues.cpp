@@ -1,6 +1,5 @@
 #include "platform/linux/loop/LinuxWorkQueues.h"
 
-#include "platform/linux/loop/LinuxSerialQueue.h"
 #include "platform/linux/loop/RetiredThreads.h"
 
 #include <utility>
@@ -38,7 +37,7 @@ void LinuxWorkQueues::setTickEnd(UniqueFunction<void()> tickEnd) {
 }
 
 std::unique_ptr<SerialQueue> LinuxWorkQueues::makeSerialQueue(std::string_view label) {
-    return std::make_unique<LinuxSerialQueue>(pool_, label);
+    return std::make_unique<LinuxSerialQueue>(threads_, label);
 }
 
 std::unique_ptr<RepeatingTimer> LinuxWorkQueues::makeRepeatingTimer(std::chrono::milliseconds interval,
@@ -57,7 +56,7 @@ std::unique_ptr<RepeatingTimer> LinuxWorkQueues::makeRepeatingTimer(std::chrono:
 
 std::unique_ptr<DelayedCall> LinuxWorkQueues::callAfter(std::chrono::milliseconds delay,
                                                         UniqueFunction<void()> call) {
-    return std::make_unique<PooledCall>(pool_, delay, std::move(call));
+    return std::make_unique<PooledCall>(threads_.pool(), delay, std::move(call));
 }
 
 } // namespace tamblo

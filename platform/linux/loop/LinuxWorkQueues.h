@@ -2,14 +2,14 @@
 
 #include "platform/WorkQueue.h"
 #include "platform/linux/loop/LinuxRepeatingTimer.h"
-#include "platform/linux/loop/ThreadPool.h"
+#include "platform/linux/loop/LinuxSerialQueue.h"
 
 #include <memory>
 
 namespace tamblo {
 
-/// Serial queues as strands over one pool, which also makes the delayed calls, and timers. Works off what was
-/// posted before it goes. A queue may be let go after that, but not posted to; a delayed call may not.
+/// Serial queues as strands, delayed calls on the strands' pool, and timers. Works off what was posted before
+/// it goes. A queue may be let go after that, but not posted to; a delayed call may not.
 class LinuxWorkQueues final : public WorkQueues {
 public:
     LinuxWorkQueues();
@@ -20,16 +20,18 @@ public:
                                                                      UniqueFunction<void()> tick) override;
     [[nodiscard]] std::unique_ptr<DelayedCall> callAfter(std::chrono::milliseconds delay,
                                                          UniqueFunction<void()> call) override;
-    void workOff() override { pool_.workOff(); }
+    void workOff() override { threads_.pool().workOff(); }
     /// Called after each tick of any timer, on its thread: what a tick recorded is written out.
     void setTickEnd(UniqueFunction<void()> tickEnd);
+    /// For the event loop, which lends its thread.
+    [[nodiscard]] StrandThreads& threads() noexcept { return threads_; }
 
 private:
     struct TickEnd;
 
     std::shared_ptr<TickEnd> tickEnd_;
     std::shared_ptr<LinuxRepeatingTimer::Retired> retired_;
-    ThreadPool pool_;
+    StrandThreads threads_;
 };
 
 } // namespace tamblo

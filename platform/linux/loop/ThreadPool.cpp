@@ -15,7 +15,7 @@ constexpr std::chrono::seconds kIdleLife{5};
 ThreadPool::~ThreadPool() {
     std::vector<std::thread> threads;
     {
-        const std::lock_guard lock(mutex_);
+        const MutexLock lock(mutex_);
         isEnding_ = true;
         threads.swap(threads_);
     }
@@ -26,13 +26,13 @@ ThreadPool::~ThreadPool() {
 }
 
 void ThreadPool::post(UniqueFunction<void()> work) {
-    const std::lock_guard lock(mutex_);
+    const MutexLock lock(mutex_);
     work_.push_back(std::move(work));
     callThread();
 }
 
 ThreadPool::DelayedKey ThreadPool::postAfter(std::chrono::milliseconds delay, UniqueFunction<void()> work) {
-    const std::lock_guard lock(mutex_);
+    const MutexLock lock(mutex_);
     const DelayedKey key{std::chrono::steady_clock::now() + delay, ++lastDelayed_};
     delayed_.emplace(key, std::move(work));
     if (delayed_.begin()->first != key) {
@@ -49,7 +49,7 @@ ThreadPool::DelayedKey ThreadPool::postAfter(std::chrono::milliseconds delay, Un
 
 void ThreadPool::cancel(const DelayedKey& key) {
     UniqueFunction<void()> dropped;
-    const std::lock_guard lock(mutex_);
+    const MutexLock lock(mutex_);
     const auto found = delayed_.find(key);
     if (found != delayed_.end()) {
         dropped = std::move(found->second);
@@ -58,13 +58,15 @@ void ThreadPool::cancel(const DelayedKey& key) {
 }
 
 void ThreadPool::workOff() {
-    std::unique_lock lock(mutex_);
+    MutexLock lock(mutex_);
     while (!delayed_.empty() || !work_.empty() || busy_ != 0) {
         auto dropped = std::exchange(delayed_, {});
         lock.unlock();
         dropped.clear();
         lock.lock();
-        isWorkedOff_.wait(lock, [this] { return work_.empty() && busy_ == 0; });
+        while (!work_.empty() || busy_ != 0) {
+            isWorkedOff_.wait(lock.forWaiting());
+        }
     }
 }
 
@@ -106,7 +108,7 @@ void ThreadPool::takeDueCalls() {
     }
 }
 
-bool ThreadPool::waitForWork(std::unique_lock<std::mutex>& lock) {
+bool ThreadPool::waitForWork(MutexLock& lock) {
     const Time idleSince = std::chrono::steady_clock::now();
     for (;;) {
         takeDueCalls();
@@ -124,13 +126,13 @@ bool ThreadPool::waitForWork(std::unique_lock<std::mutex>& lock) {
             until = std::min(until, delayed_.begin()->first.first);
         }
         ++idle_;
-        hasWork_.wait_until(lock, until);
+        hasWork_.wait_until(lock.forWaiting(), until);
         --idle_;
     }
 }
 
 void ThreadPool::run() {
-    std::unique_lock lock(mutex_);
+    MutexLock lock(mutex_);
     while (waitForWork(lock)) {
         UniqueFunction<void()> work = std::move(work_.front());
         work_.pop_front();

@@ -1,6 +1,7 @@
 #pragma once
 
-#include "platform/WorkQueue.h"
+#include "base/Mutex.h"
+#include "base/UniqueFunction.h"
 
 #include <chrono>
 #include <condition_variable>
@@ -8,7 +9,6 @@
 #include <cstdint>
 #include <deque>
 #include <map>
-#include <mutex>
 #include <thread>
 #include <utility>
 #include <vector>
@@ -31,32 +31,33 @@ public:
     ThreadPool(const ThreadPool&) = delete;
     ThreadPool& operator=(const ThreadPool&) = delete;
 
-    void post(UniqueFunction<void()> work);
-    [[nodiscard]] DelayedKey postAfter(std::chrono::milliseconds delay, UniqueFunction<void()> work);
+    void post(UniqueFunction<void()> work) TAMBLO_EXCLUDES(mutex_);
+    [[nodiscard]] DelayedKey postAfter(std::chrono::milliseconds delay, UniqueFunction<void()> work)
+        TAMBLO_EXCLUDES(mutex_);
     /// Nothing when the call has begun.
-    void cancel(const DelayedKey& key);
+    void cancel(const DelayedKey& key) TAMBLO_EXCLUDES(mutex_);
     /// Returns when there is no work left; delayed calls that have not begun are dropped. Not from work.
-    void workOff();
+    void workOff() TAMBLO_EXCLUDES(mutex_);
 
 private:
-    void run();
-    /// With the lock held: sees to it that somebody will take the work.
-    void callThread();
-    void takeDueCalls();
-    [[nodiscard]] bool waitForWork(std::unique_lock<std::mutex>& lock);
-    void joinFinished();
+    void run() TAMBLO_EXCLUDES(mutex_);
+    /// Sees to it that somebody will take the work.
+    void callThread() TAMBLO_REQUIRES(mutex_);
+    void takeDueCalls() TAMBLO_REQUIRES(mutex_);
+    [[nodiscard]] bool waitForWork(MutexLock& lock) TAMBLO_REQUIRES(mutex_);
+    void joinFinished() TAMBLO_REQUIRES(mutex_);
 
-    std::mutex mutex_; ///< guards what follows
+    Mutex mutex_;
     std::condition_variable hasWork_;
-    std::deque<UniqueFunction<void()>> work_;
-    std::map<DelayedKey, UniqueFunction<void()>> delayed_;
-    std::uint64_t lastDelayed_ = 0;
-    std::vector<std::thread> threads_;
-    std::vector<std::thread::id> finished_;
-    std::size_t idle_ = 0;
-    std::size_t busy_ = 0;
+    std::deque<UniqueFunction<void()>> work_ TAMBLO_GUARDED_BY(mutex_);
+    std::map<DelayedKey, UniqueFunction<void()>> delayed_ TAMBLO_GUARDED_BY(mutex_);
+    std::uint64_t lastDelayed_ TAMBLO_GUARDED_BY(mutex_) = 0;
+    std::vector<std::thread> threads_ TAMBLO_GUARDED_BY(mutex_);
+    std::vector<std::thread::id> finished_ TAMBLO_GUARDED_BY(mutex_);
+    std::size_t idle_ TAMBLO_GUARDED_BY(mutex_) = 0;
+    std::size_t busy_ TAMBLO_GUARDED_BY(mutex_) = 0;
     std::condition_variable isWorkedOff_;
-    bool isEnding_ = false;
+    bool isEnding_ TAMBLO_GUARDED_BY(mutex_) = false;
 };
 
 } // namespace tamblo

@@ -2,7 +2,6 @@
 
 #include "base/Format.h"
 #include "os/RandomNumber.h"
-#include "platform/linux/loop/LinuxSerialQueue.h"
 #include "platform/linux/sinks/SinkLine.h"
 
 #include <utility>
@@ -87,13 +86,6 @@ void LinuxCallQualityService::FlushMessages(const SessionRef& session) {
     file_.append([&](TextBuffer& line) {
         SinkLine(line, clock_.now()).text("op", "flush").text("session", SpoolSession::nameOf(session));
     });
-}
-
-void LinuxCallQualityService::commit() {
-    // What the event loop's thread has recorded for one session after the other is written once, by the loop.
-    if (InlineDrain::current() == nullptr) {
-        flush();
-    }
 }
 
 } // namespace tamblo

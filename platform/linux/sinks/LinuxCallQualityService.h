@@ -39,9 +39,9 @@ public:
                                                                   std::uint16_t category, std::uint16_t type,
                                                                   const Dictionary& payload) override;
     void FlushMessages(const SessionRef& session) override;
-    void commit() override;
 
-    /// What was recorded goes to the file.
+    /// What was recorded goes to the file: at the end of each run of queues' work, since the sessions' queues
+    /// are many, and no reply waits for what they record.
     void flush() { file_.flush(); }
 
 private:

@@ -1,0 +1,62 @@
+#pragma once
+
+#include "base/KeySetCache.h"
+#include "platform/WorkQueue.h"
+#include "platform/linux/loop/LinuxSerialQueue.h"
+#include "wire/Request.h"
+
+#include <cstddef>
+#include <cstdint>
+#include <memory>
+#include <optional>
+#include <span>
+#include <utility>
+
+namespace tamblo {
+
+/// What one read takes at most: some hundred messages, so that a batch costs few system calls and no
+/// connection holds up the others for long.
+inline constexpr std::size_t kBytesPerRead = 128 * 1024;
+/// An unfinished frame up to this size is put in front of the next read; a longer one is collected where it
+/// is.
+inline constexpr std::size_t kSmallRest = 16 * 1024;
+/// Requests read in one wake-up are carried out in batches of about this many.
+inline constexpr std::size_t kRequestsPerBatch = 256;
+
+/// What the connections of a service share to take requests in, one at a time, on the I/O thread: the buffer
+/// that they receive into, the decoder with the key sets that it has met, and the way to the request queue.
+class RequestIntake {
+public:
+    RequestIntake() : buffer_(new std::uint8_t[kSmallRest + kBytesPerRead]) {}
+
+    /// The queue that carries requests out, and the threads that it runs on. Before the first read.
+    void setQueue(SerialQueue& queue, StrandThreads& threads) noexcept {
+        queue_ = &queue;
+        threads_ = &threads;
+    }
+    [[nodiscard]] SerialQueue& queue() noexcept { return *queue_; }
+
+    /// Room for a small rest and a read.
+    [[nodiscard]] std::uint8_t* buffer() noexcept { return buffer_.get(); }
+    /// Reads a frame's item into `request`, whose parts the next one replaces.
+    [[nodiscard]] std::optional<wire::Refusal> decode(std::span<const std::uint8_t> item) {
+        return wire::decodeRequest(item, keySets_, request_);
+    }
+    [[nodiscard]] wire::Request& request() noexcept { return request_; }
+    /// Ends a read of so many requests; `carriedOut` runs behind the last of them.
+    void endRead(std::size_t requests, Work carriedOut) {
+        queue_->post(std::move(carriedOut));
+        if (threads_->count(requests) >= kRequestsPerBatch) {
+            threads_->drain();
+        }
+    }
+
+private:
+    const std::unique_ptr<std::uint8_t[]> buffer_;
+    KeySetCache keySets_;
+    wire::Request request_;
+    SerialQueue* queue_ = nullptr;
+    StrandThreads* threads_ = nullptr;
+};
+
+} // namespace tamblo

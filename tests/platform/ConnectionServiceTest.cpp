@@ -1,0 +1,104 @@
+#include "platform/linux/connections/LinuxConnectionService.h"
+#include "platform/linux/loop/LinuxWorkQueues.h"
+#include "tests/platform/LinuxServiceSupport.h"
+#include "wire/Protocol.h"
+
+#include <gmock/gmock.h>
+
+#include <atomic>
+#include <cerrno>
+#include <chrono>
+#include <string>
+#include <thread>
+
+#include <sys/epoll.h>
+#include <sys/socket.h>
+#include <sys/un.h>
+
+namespace tamblo {
+namespace {
+
+using testing::ElementsAre;
+
+std::atomic<int> additionsToRefuse{0};
+
+/// The kernel, but for additions that it refuses as if the user had no watches left.
+int refusingControl(int epoll, int operation, int descriptor, epoll_event* event) {
+    if (operation == EPOLL_CTL_ADD && additionsToRefuse > 0) {
+        --additionsToRefuse;
+        errno = ENOSPC;
+        return -1;
+    }
+    return ::epoll_ctl(epoll, operation, descriptor, event);
+}
+
+/// Accepts everybody and notes what becomes of them, on the loop's thread.
+class Delegate final : public ListenerDelegate {
+public:
+    bool shouldAcceptNewConnection(ClientConnection& connection) override {
+        connection.setInterruptionHandler([this] { trace += "interrupted "; });
+        connection.setInvalidationHandler([this] { trace += "invalidated "; });
+        connection.resume();
+        return true;
+    }
+    std::string trace;
+};
+
+/// A connected client, which sees the end of its connection as an end of what it reads.
+FileDescriptor connectTo(const std::string& path) {
+    sockaddr_un address{};
+    address.sun_family = AF_UNIX;
+    path.copy(address.sun_path, sizeof address.sun_path - 1);
+    FileDescriptor client(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
+    EXPECT_EQ(::connect(client.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address), 0);
+    return client;
+}
+
+TEST(ConnectionService, EndsAClientWhoseSocketCannotBeWatchedAndServesTheOthers) {
+    const TemporaryDirectory directory;
+    const std::string path = wire::socketPath(directory.path());
+    RecordingLog log;
+    EventLoop loop(refusingControl);
+    LinuxConnectionService service(loop, log);
+    LinuxWorkQueues queues;
+    const auto requests = queues.makeSerialQueue("requests");
+    Delegate delegate;
+    service.setRequestQueue(*requests, queues.threads());
+    service.setDelegate(delegate);
+    ASSERT_EQ(service.open(directory.path()), std::nullopt);
+
+    // Nor can the listener's own socket, for a moment.
+    additionsToRefuse = 1;
+    service.resume();
+    EXPECT_THAT(log.take(), ElementsAre("3 zrrs accepting connections rests: No space left on device"));
+    std::thread thread([&] { loop.run(queues.threads()); });
+
+    additionsToRefuse = 0;
+    const FileDescriptor early = connectTo(path);
+    for (int i = 0; i < 2000 && service.clientProcesses().empty(); ++i) {
+        std::this_thread::sleep_for(std::chrono::milliseconds(10));
+    }
+    additionsToRefuse = 1;
+    const FileDescriptor unwatched = connectTo(path);
+    ASSERT_TRUE(isReadable(unwatched.get(), 20'000));
+    char byte = 0;
+    EXPECT_EQ(::recv(unwatched.get(), &byte, 1, 0), 0);
+    const FileDescriptor late = connectTo(path);
+    EXPECT_FALSE(isReadable(late.get(), 20));
+    EXPECT_FALSE(isReadable(early.get(), 0));
+    EXPECT_THAT(service.clientProcesses(), ElementsAre(::getpid()));
+
+    loop.post([&] {
+        service.stop();
+        loop.stop();
+    });
+    thread.join();
+    EXPECT_EQ(delegate.trace, "interrupted invalidated ");
+    EXPECT_THAT(log.take(), ElementsAre("3 zrrs accepting connections again",
+                                        "3 zrrs a client is turned away, since its socket cannot be watched: "
+                                        "No space left on device. pid=" +
+                                            std::to_string(::getpid())));
+}
+
+} // namespace
+} // namespace tamblo
