@@ -16,4 +16,15 @@ std::string_view takeUpTo(char separator, std::string_view& text) noexcept {
     return taken;
 }
 
+std::optional<std::string_view> fieldOf(std::string_view text, std::string_view name) noexcept {
+    while (!text.empty()) {
+        std::string_view line = takeUpTo('\n', text);
+        if (line.starts_with(name) && line.find(':') != std::string_view::npos &&
+            trimmed(takeUpTo(':', line)) == name) {
+            return trimmed(line);
+        }
+    }
+    return std::nullopt;
+}
+
 } // namespace tamblo

@@ -9,7 +9,6 @@
 #include "platform/linux/device/LinuxClock.h"
 #include "platform/linux/device/LinuxDeviceConditions.h"
 #include "platform/linux/device/LinuxProcessInformation.h"
-#include "platform/linux/device/LinuxProcessSampling.h"
 #include "platform/linux/drivers/LinuxChanlogFacility.h"
 #include "platform/linux/log/LinuxStructuredLog.h"
 #include "platform/linux/log/LinuxTracePoints.h"

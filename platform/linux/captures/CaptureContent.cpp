@@ -1,10 +1,11 @@
 #include "platform/linux/captures/CaptureContent.h"
 
 #include "base/Format.h"
+#include "base/Utf8.h"
+#include "os/DirectoryEntries.h"
 #include "os/SmallFile.h"
 
 #include <algorithm>
-#include <filesystem>
 #include <system_error>
 #include <utility>
 
@@ -14,8 +15,8 @@ namespace {
 
 /// The kernel's files have a page or two. `smaps_rollup` and `status` are no longer with many mappings.
 constexpr std::size_t kMaximumFile = 64UL << 10U;
-/// Thermal zones, of which a machine has some ten or twenty; each is two files to read.
-constexpr std::size_t kMaximumZones = 64;
+/// Thermal zones and cooling devices, of which a machine has some ten or twenty; each is two files to read.
+constexpr std::size_t kMaximumZones = 256;
 
 /// A file of the kernel's under a heading, or why there is none.
 void appendFile(std::string& text, std::string_view heading, const std::string& path) {
@@ -30,18 +31,10 @@ void appendFile(std::string& text, std::string_view heading, const std::string& 
 
 /// What a process calls itself must neither make lines of its own here nor reach a terminal.
 std::string withoutControls(std::string text, std::string_view kept = {}) {
-    std::ranges::replace_if(
-        text,
-        [kept](char character) {
-            const bool isControl = static_cast<unsigned char>(character) < 0x20 || character == 0x7F;
-            return isControl && kept.find(character) == kept.npos;
-        },
-        '?');
-    // The second set that terminals obey, U+0080 to U+009F.
-    for (std::size_t at = 1; at < text.size(); ++at) {
-        const auto byte = static_cast<unsigned char>(text[at]);
-        if (text[at - 1] == '\xC2' && byte >= 0x80 && byte <= 0x9F) {
-            text.replace(at - 1, 2, "??");
+    for (std::size_t at = 0; at < text.size(); ++at) {
+        if (kept.find(text[at]) == kept.npos) {
+            const std::size_t length = controlLength(text, at);
+            text.replace(at, length, length, '?');
         }
     }
     return text;
@@ -136,15 +129,8 @@ std::string CaptureContent::systemText() const {
 void CaptureContent::appendTemperatures(std::string& text) const {
     text += "== temperatures\n";
     const std::string directory = systemRoot_ + "/class/thermal";
-    std::vector<std::string> zones;
-    std::error_code error;
-    for (std::filesystem::directory_iterator entry(directory, error), end;
-         !error && entry != end && zones.size() < kMaximumZones; entry.increment(error)) {
-        std::string name = entry->path().filename().string();
-        if (name.starts_with("thermal_zone")) {
-            zones.push_back(std::move(name));
-        }
-    }
+    std::vector<std::string> zones = DirectoryEntries::read(directory, kMaximumZones).names;
+    std::erase_if(zones, [](const std::string& name) { return !name.starts_with("thermal_zone"); });
     std::ranges::sort(zones);
     for (const std::string& zone : zones) {
         const SmallFile type = SmallFile::read(formatted("{}/{}/type", directory, zone), kMaximumFile);

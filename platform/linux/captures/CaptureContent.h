@@ -20,12 +20,12 @@ namespace tamblo {
 /// One capture that was asked for.
 struct CaptureRequest {
     std::string_view operation; ///< "snapshot" or "start"
-    std::string identifier;
-    WallTime time; ///< when it was asked for
     BugCaptureSignature signature;
     std::chrono::duration<double> duration{0};
     Dictionary payload;
     std::vector<pid_t> processes;
+    std::string identifier = {};
+    WallTime time = {}; ///< when it was asked for
 };
 
 /// Gathers what a capture's folder holds about the device, as the kernel's files show it:

@@ -2,6 +2,7 @@
 
 #include "base/Format.h"
 #include "base/Rfc3339.h"
+#include "os/DirectoryEntries.h"
 #include "os/ReplaceFile.h"
 
 #include <algorithm>
@@ -25,7 +26,6 @@ namespace fs = std::filesystem;
 constexpr std::string_view kUnfinished = ".new-";
 /// An identifier with every digit as 0; those behind the time are hexadecimal.
 constexpr std::string_view kPattern = "00000000T000000.000Z-00000000";
-constexpr std::size_t kTimeLength = kPattern.find('-');
 
 /// How many entries are looked at, of the directory and of a folder. Thirty days bring 600 folders of less
 /// than 100 files.
@@ -49,39 +49,25 @@ std::string timeText(WallTime time) {
     return text;
 }
 
-/// Calls the visitor with each entry, up to a number of them; a directory that cannot be read has none.
-template <typename Iterator, typename Visitor>
-void forEachEntry(const std::string& directory, const Visitor& visitor) {
-    std::error_code error;
-    std::size_t seen = 0;
-    for (Iterator entry(directory, error), end; !error && entry != end && seen < kMaximumEntries; ++seen) {
-        visitor(*entry);
-        entry.increment(error);
-    }
-}
-
 std::uint64_t sizeOf(const std::string& folder) {
     std::uint64_t size = 0;
-    forEachEntry<fs::recursive_directory_iterator>(folder, [&size](const fs::directory_entry& entry) {
-        std::error_code error;
-        if (entry.symlink_status(error).type() == fs::file_type::regular) {
-            const std::uintmax_t length = entry.file_size(error);
-            size += error ? 0 : length;
+    std::size_t seen = 0;
+    std::error_code error;
+    for (fs::recursive_directory_iterator entry(folder, error), end;
+         !error && entry != end && seen < kMaximumEntries; ++seen, entry.increment(error)) {
+        std::error_code ignored;
+        if (entry->symlink_status(ignored).type() == fs::file_type::regular) {
+            const std::uintmax_t length = entry->file_size(ignored);
+            size += ignored ? 0 : length;
         }
-    });
+    }
     return size;
 }
 
 } // namespace
 
 std::string CaptureFolders::identifier(WallTime time, std::uint64_t number) {
-    constexpr std::string_view kDigits = "0123456789abcdef";
-    std::string text = timeText(time) + std::string(kPattern.substr(kTimeLength));
-    for (auto digit = text.rbegin(); *digit != '-'; ++digit) {
-        *digit = kDigits[number % kDigits.size()];
-        number /= kDigits.size();
-    }
-    return text;
+    return formatted("{}-{}", timeText(time), hexadecimal(number, 8));
 }
 
 void CaptureFolders::store(std::string_view identifier, std::span<const CaptureFile> files, WallTime now) {
@@ -146,11 +132,11 @@ std::string CaptureFolders::write(std::string_view identifier, std::span<const C
 void CaptureFolders::removeOld(WallTime now, std::string_view latest) {
     std::vector<std::string> removed;
     std::vector<std::string> folders;
-    forEachEntry<fs::directory_iterator>(directory_, [&](const fs::directory_entry& entry) {
+    for (std::string& name : DirectoryEntries::read(directory_, kMaximumEntries).names) {
         std::error_code error;
-        std::string name = entry.path().filename().string();
-        if (entry.symlink_status(error).type() != fs::file_type::directory) {
-            return;
+        const fs::file_status status = fs::symlink_status(formatted("{}/{}", directory_, name), error);
+        if (status.type() != fs::file_type::directory) {
+            continue;
         }
         if (name.starts_with(kUnfinished) &&
             isIdentifier(std::string_view(name).substr(kUnfinished.size()))) {
@@ -158,7 +144,7 @@ void CaptureFolders::removeOld(WallTime now, std::string_view latest) {
         } else if (isIdentifier(name)) {
             folders.push_back(std::move(name));
         }
-    });
+    }
     const std::string oldest = timeText(now - kMaximumAge);
     const std::string present = timeText(now);
     const auto rank = [&](const std::string& name) {
@@ -175,16 +161,13 @@ void CaptureFolders::removeOld(WallTime now, std::string_view latest) {
     }
     std::string problem;
     for (const std::string& name : removed) {
-        const std::string single = remove(name);
-        problem = problem.empty() ? single : problem;
+        std::error_code error;
+        fs::remove_all(formatted("{}/{}", directory_, name), error);
+        if (error && problem.empty()) {
+            problem = failure("remove", name, error.value());
+        }
     }
     tell(isRemovingOut_, problem, "it takes room until it can be removed");
-}
-
-std::string CaptureFolders::remove(const std::string& name) const {
-    std::error_code error;
-    fs::remove_all(formatted("{}/{}", directory_, name), error);
-    return error ? failure("remove", name, error.value()) : "";
 }
 
 void CaptureFolders::tell(bool& isOut, std::string_view problem, std::string_view consequence) {

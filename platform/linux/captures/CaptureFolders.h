@@ -60,7 +60,6 @@ private:
     [[nodiscard]] std::string makeDirectory() const;
     [[nodiscard]] std::string write(std::string_view identifier, std::span<const CaptureFile> files) const;
     void removeOld(WallTime now, std::string_view latest);
-    [[nodiscard]] std::string remove(const std::string& name) const;
     void tell(bool& isOut, std::string_view problem, std::string_view consequence);
 
     const std::string directory_;

@@ -35,7 +35,7 @@ DailyAllowance::DailyAllowance(const std::string& path, StructuredLog& log) {
 
 bool DailyAllowance::take(WallTime now) {
     std::string day = formatRfc3339Date(secondsSince1970(now)).value_or("");
-    const std::lock_guard lock(mutex_);
+    const MutexLock lock(mutex_);
     if (day != day_) {
         day_ = std::move(day);
         taken_ = 0;
@@ -48,7 +48,7 @@ bool DailyAllowance::take(WallTime now) {
 }
 
 std::string DailyAllowance::text() const {
-    const std::lock_guard lock(mutex_);
+    const MutexLock lock(mutex_);
     return jsonText(Dictionary{{kDay, day_}, {kCaptures, taken_}}) + '\n';
 }
 

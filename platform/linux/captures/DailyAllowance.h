@@ -1,10 +1,10 @@
 #pragma once
 
+#include "base/Mutex.h"
 #include "platform/Clock.h"
 #include "platform/StructuredLog.h"
 
 #include <cstdint>
-#include <mutex>
 #include <string>
 
 namespace tamblo {
@@ -30,9 +30,9 @@ public:
     [[nodiscard]] std::string text() const;
 
 private:
-    mutable std::mutex mutex_; ///< guards what follows
-    std::string day_;          ///< as "2026-03-01"; empty before the first capture ever
-    std::uint64_t taken_ = 0;
+    mutable Mutex mutex_;
+    std::string day_ TAMBLO_GUARDED_BY(mutex_); ///< as "2026-03-01"; empty before the first capture ever
+    std::uint64_t taken_ TAMBLO_GUARDED_BY(mutex_) = 0;
 };
 
 } // namespace tamblo

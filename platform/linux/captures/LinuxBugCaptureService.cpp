@@ -31,30 +31,17 @@ public:
 
     [[nodiscard]] bool snapshot(const BugCaptureSignature& signature, std::chrono::duration<double> duration,
                                 const Dictionary& payload, Reply reply) override {
-        return request("snapshot", signature, duration, payload, reply);
+        return service_.request({"snapshot", signature, duration, payload, processes_}, reply);
     }
     [[nodiscard]] bool startSession(const BugCaptureSignature& signature,
                                     std::chrono::duration<double> duration, Reply reply) override {
-        return request("start", signature, duration, {}, reply);
+        return service_.request({"start", signature, duration, {}, processes_}, reply);
     }
     void cancelSession(std::string_view sessionIdentifier) override {
         service_.cancel(std::string(sessionIdentifier));
     }
 
 private:
-    [[nodiscard]] bool request(std::string_view operation, const BugCaptureSignature& signature,
-                               std::chrono::duration<double> duration, const Dictionary& payload,
-                               const Reply& reply) {
-        CaptureRequest request{.operation = operation,
-                               .identifier = {},
-                               .time = {},
-                               .signature = signature,
-                               .duration = duration,
-                               .payload = payload,
-                               .processes = processes_};
-        return service_.request(std::move(request), reply);
-    }
-
     LinuxBugCaptureService& service_;
     const std::vector<pid_t> processes_;
 };
@@ -69,7 +56,9 @@ LinuxBugCaptureService::LinuxBugCaptureService(SinkFiles& sinks, const std::stri
       file_(sinks, "bug-captures.jsonl", "zrrb"),
       folders_(directory, log),
       allowance_(formatted("{}/{}", directory, kAllowanceFile), log),
-      lastNumber_(randomNumber()) {}
+      lastNumber_(randomNumber()),
+      queue_(workQueues, "com.vandra.tamblo.bugcaptures",
+             {.waiting = kMaximumWaiting, .what = "pieces of bug captures", .categoryCode = "zrrb"}, log) {}
 
 std::unique_ptr<GlarnReporter> LinuxBugCaptureService::makeReporter(std::span<const pid_t> processes) {
     return std::make_unique<Reporter>(*this, processes);
@@ -88,7 +77,7 @@ bool LinuxBugCaptureService::request(CaptureRequest request, const GlarnReporter
     }
     request.identifier = CaptureFolders::identifier(request.time, ++lastNumber_);
     const auto kept = std::make_shared<const CaptureRequest>(std::move(request));
-    queue().post([this] { folders_.keep(kAllowanceFile, allowance_.text()); }, Pace::mayBlock);
+    queue_.post([this] { folders_.keep(kAllowanceFile, allowance_.text()); });
     if (kept->duration.count() == 0) {
         gatherLater(kept);
     } else {
@@ -101,7 +90,7 @@ bool LinuxBugCaptureService::request(CaptureRequest request, const GlarnReporter
 
 GlarnError LinuxBugCaptureService::admit(WallTime time) {
     {
-        const std::lock_guard lock(mutex_);
+        const MutexLock lock(mutex_);
         if (isEnded_) {
             return kGlarnErrorServiceUnavailable;
         }
@@ -113,7 +102,7 @@ void LinuxBugCaptureService::run(const RequestRef& request) {
     const auto delay = std::chrono::ceil<std::chrono::milliseconds>(request->duration);
     {
         // A call that comes at once waits here until it can be found.
-        const std::lock_guard lock(mutex_);
+        const MutexLock lock(mutex_);
         if (!isEnded_) {
             running_.try_emplace(
                 request->identifier,
@@ -128,7 +117,7 @@ void LinuxBugCaptureService::run(const RequestRef& request) {
 
 LinuxBugCaptureService::RequestRef LinuxBugCaptureService::takeRunning(const std::string& identifier) {
     Running taken;
-    const std::lock_guard lock(mutex_);
+    const MutexLock lock(mutex_);
     const auto found = running_.find(identifier);
     if (found == running_.end()) {
         return nullptr;
@@ -153,7 +142,7 @@ void LinuxBugCaptureService::finish(const std::string& identifier) {
 void LinuxBugCaptureService::endSessions() {
     std::map<std::string, Running, std::less<>> running;
     {
-        const std::lock_guard lock(mutex_);
+        const MutexLock lock(mutex_);
         isEnded_ = true;
         running.swap(running_);
     }
@@ -163,7 +152,7 @@ void LinuxBugCaptureService::endSessions() {
 }
 
 void LinuxBugCaptureService::gatherLater(const RequestRef& request) {
-    queue().post([this, request] { gather(*request); }, Pace::mayBlock);
+    queue_.post([this, request] { gather(*request); });
 }
 
 void LinuxBugCaptureService::gather(const CaptureRequest& request) {
@@ -190,12 +179,6 @@ void LinuxBugCaptureService::append(std::string_view operation, std::string_view
     file_.append([&](TextBuffer& line) {
         SinkLine(line, clock_.now()).text("op", operation).text("session", identifier);
     });
-}
-
-SerialQueue& LinuxBugCaptureService::queue() {
-    std::call_once(isQueueMade_,
-                   [this] { queue_ = workQueues_.makeSerialQueue("com.vandra.tamblo.bugcaptures"); });
-    return *queue_;
 }
 
 } // namespace tamblo

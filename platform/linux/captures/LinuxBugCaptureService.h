@@ -1,5 +1,6 @@
 #pragma once
 
+#include "base/Mutex.h"
 #include "platform/BugCaptureService.h"
 #include "platform/Clock.h"
 #include "platform/WorkQueue.h"
@@ -7,6 +8,7 @@
 #include "platform/linux/captures/CaptureFolders.h"
 #include "platform/linux/captures/DailyAllowance.h"
 #include "platform/linux/log/LinuxStructuredLog.h"
+#include "platform/linux/loop/LimitedQueue.h"
 #include "platform/linux/sinks/AppendOnlyFile.h"
 
 #include <atomic>
@@ -14,7 +16,6 @@
 #include <cstdint>
 #include <map>
 #include <memory>
-#include <mutex>
 #include <string>
 #include <string_view>
 
@@ -34,6 +35,8 @@ class LinuxBugCaptureService final : public BugCaptureService {
 public:
     /// A capture that runs longer tells nothing about what it was begun for; requests for one are refused.
     static constexpr std::chrono::hours kMaximumDuration{1};
+    /// Pieces of work, two for each capture: those of two days, which may meet at midnight.
+    static constexpr std::size_t kMaximumWaiting = 4 * DailyAllowance::kCapturesADay;
 
     /// What is referred to must outlive the service, except the queues: before they go, `endSessions` is
     /// called.
@@ -64,7 +67,6 @@ private:
     void gather(const CaptureRequest& request);
     void appendRequest(const CaptureRequest& request);
     void append(std::string_view operation, std::string_view identifier);
-    [[nodiscard]] SerialQueue& queue();
 
     const CaptureContent content_;
     const Clock& clock_;
@@ -76,12 +78,11 @@ private:
     /// Begins at random, so that captures of one millisecond differ across the service's starts, too.
     std::atomic<std::uint64_t> lastNumber_;
 
-    std::mutex mutex_; ///< guards what follows
-    std::map<std::string, Running, std::less<>> running_;
-    bool isEnded_ = false;
+    Mutex mutex_;
+    std::map<std::string, Running, std::less<>> running_ TAMBLO_GUARDED_BY(mutex_);
+    bool isEnded_ TAMBLO_GUARDED_BY(mutex_) = false;
 
-    std::once_flag isQueueMade_;
-    std::unique_ptr<SerialQueue> queue_;
+    LimitedQueue queue_;
 };
 
 } // namespace tamblo

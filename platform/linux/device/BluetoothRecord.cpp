@@ -1,11 +1,10 @@
 #include "platform/linux/device/BluetoothRecord.h"
 
+#include "base/Format.h"
 #include "base/SplitText.h"
 
 #include <array>
-#include <charconv>
-#include <cstdio>
-#include <system_error>
+#include <utility>
 
 namespace tamblo {
 
@@ -22,20 +21,8 @@ std::optional<std::uint32_t> numberFrom(std::string_view text, std::uint32_t mos
     if (isHexadecimal) {
         text.remove_prefix(2);
     }
-    std::uint32_t number = 0;
-    const auto [end, error] =
-        std::from_chars(text.data(), text.data() + text.size(), number, isHexadecimal ? 16 : 10);
-    const bool isWhole = error == std::errc() && end == text.data() + text.size();
-    return isWhole && number <= most ? std::optional(number) : std::nullopt;
-}
-
-/// The line without its end, which may be of either kind.
-std::string_view takeLine(std::string_view& text) noexcept {
-    std::string_view line = takeUpTo('\n', text);
-    if (line.ends_with('\r')) {
-        line.remove_suffix(1);
-    }
-    return line;
+    const auto number = takeNumber<std::uint32_t>(text, isHexadecimal ? 16 : 10);
+    return text.empty() && number <= most ? number : std::nullopt;
 }
 
 /// The sections that hold a key of a paired device: of classic Bluetooth, and of Low Energy in either role.
@@ -62,7 +49,8 @@ BluetoothRecord BluetoothRecord::parse(std::string_view text) {
     BluetoothRecord record;
     std::string_view section;
     while (!text.empty()) {
-        const std::string_view line = takeLine(text);
+        std::string_view line = takeUpTo('\n', text);
+        line.remove_suffix(line.ends_with('\r') ? 1 : 0);
         if (line.starts_with('[') && line.ends_with(']')) {
             section = line.substr(1, line.size() - 2);
             record.isPaired = record.isPaired || isKeySection(section);
@@ -105,10 +93,8 @@ std::string BluetoothRecord::model() const {
         return {};
     }
     const char* source = identity->source == 1 ? "bluetooth" : identity->source == 2 ? "usb" : "unknown";
-    std::array<char, 32> text{};
-    std::snprintf(text.data(), text.size(), "%s:%04x:%04x:%04x", source, identity->vendor, identity->product,
-                  identity->version);
-    return text.data();
+    return formatted("{}:{}:{}:{}", source, hexadecimal(identity->vendor, 4),
+                     hexadecimal(identity->product, 4), hexadecimal(identity->version, 4));
 }
 
 } // namespace tamblo

@@ -1,17 +1,17 @@
 #include "platform/linux/device/LinuxAccessories.h"
 
 #include "base/Format.h"
+#include "os/DirectoryEntries.h"
 #include "os/SmallFile.h"
 #include "platform/linux/device/BluetoothRecord.h"
 
 #include <algorithm>
 #include <array>
 #include <bit>
+#include <cerrno>
 #include <charconv>
 #include <cstddef>
 #include <cstdint>
-#include <cstdio>
-#include <filesystem>
 #include <set>
 #include <system_error>
 
@@ -99,13 +99,6 @@ HashKey machineKey(const std::string& path) {
     return key;
 }
 
-std::string identifierOf(const HashKey& key, std::string_view address) {
-    std::array<char, 17> text{};
-    std::snprintf(text.data(), text.size(), "%016llx",
-                  static_cast<unsigned long long>(keyedHash(key, address)));
-    return text.data();
-}
-
 } // namespace
 
 std::vector<Accessory> LinuxAccessories::connectedEarbuds() {
@@ -122,7 +115,7 @@ std::vector<Accessory> LinuxAccessories::connectedEarbuds() {
             const BluetoothRecord record = BluetoothRecord::parse(file.text);
             // A device that is paired with two adapters is still one.
             if (record.isPaired && record.isEarbud() && seen.insert(device).second) {
-                earbuds.push_back({identifierOf(key, device), record.model()});
+                earbuds.push_back({formatted("{}", hexadecimal(keyedHash(key, device), 16)), record.model()});
             }
         }
     }
@@ -130,19 +123,12 @@ std::vector<Accessory> LinuxAccessories::connectedEarbuds() {
 }
 
 std::vector<std::string> LinuxAccessories::addressesIn(const std::string& directory, std::size_t most) {
-    std::vector<std::string> addresses;
-    std::error_code error;
-    std::size_t entries = 0;
-    for (std::filesystem::directory_iterator entry(directory, error), end;
-         !error && entry != end && entries < kMostEntries; entry.increment(error), ++entries) {
-        std::string name = entry->path().filename().string();
-        if (isAddress(name)) {
-            addresses.push_back(std::move(name));
-        }
-    }
-    if (error == std::errc::permission_denied && !isRefusalTold_.exchange(true)) {
+    auto [error, isCut, addresses] = DirectoryEntries::read(directory, kMostEntries);
+    std::erase_if(addresses, [](const std::string& name) { return !isAddress(name); });
+    if (error == EACCES && !isRefusalTold_.exchange(true)) {
         log_.report(LogLevel::info, "zrrz",
-                    formatted("{}: {}; accessories are not known", directory, error.message()));
+                    formatted("{}: {}; accessories are not known", directory,
+                              std::generic_category().message(error)));
     }
     std::sort(addresses.begin(), addresses.end());
     addresses.resize(std::min(addresses.size(), most));

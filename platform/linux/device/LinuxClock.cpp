@@ -11,7 +11,7 @@ WallTime LinuxClock::now() const noexcept {
 
 std::chrono::seconds LinuxClock::utcOffset(WallTime time) const {
     const std::time_t seconds = std::chrono::floor<std::chrono::seconds>(time.time_since_epoch()).count();
-    const std::lock_guard lock(zone_);
+    const MutexLock lock(zone_);
     ::tzset(); // `localtime_r` alone stays in the zone that the process began in
     std::tm local{};
     return std::chrono::seconds(::localtime_r(&seconds, &local) != nullptr ? local.tm_gmtoff : 0);

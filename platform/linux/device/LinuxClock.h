@@ -1,8 +1,7 @@
 #pragma once
 
+#include "base/Mutex.h"
 #include "platform/Clock.h"
-
-#include <mutex>
 
 namespace tamblo {
 
@@ -15,7 +14,7 @@ public:
     void sleepFor(std::chrono::microseconds time) override;
 
 private:
-    mutable std::mutex zone_; ///< held while the C library's zone, which is the whole process's, is read
+    mutable Mutex zone_; ///< held while the C library's zone, which is the whole process's, is read
 };
 
 } // namespace tamblo

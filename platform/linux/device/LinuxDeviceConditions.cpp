@@ -1,14 +1,13 @@
 #include "platform/linux/device/LinuxDeviceConditions.h"
 
+#include "base/SplitText.h"
+#include "os/DirectoryEntries.h"
 #include "os/SmallFile.h"
 
 #include <algorithm>
-#include <charconv>
 #include <cstdint>
-#include <filesystem>
 #include <optional>
 #include <string_view>
-#include <system_error>
 #include <utility>
 
 namespace tamblo {
@@ -17,6 +16,8 @@ namespace {
 
 /// A page: no file of this kind is longer.
 constexpr std::size_t kMaximumFile = 4096;
+/// Of one of the directories: a zone has some ten files, and a few for each trip point.
+constexpr std::size_t kMaximumEntries = 4096;
 
 constexpr struct {
     std::string_view type;
@@ -25,24 +26,13 @@ constexpr struct {
 
 std::optional<std::int64_t> readNumber(const std::string& path) {
     const SmallFile file = SmallFile::read(path, kMaximumFile);
-    const std::string_view text = file.trimmed();
-    std::int64_t number = 0;
-    const auto [end, error] = std::from_chars(text.data(), text.data() + text.size(), number);
-    const bool isNumber = error == std::errc() && end == text.data() + text.size();
-    return isNumber ? std::optional(number) : std::nullopt;
+    std::string_view text = file.trimmed();
+    const auto number = takeNumber<std::int64_t>(text);
+    return text.empty() ? number : std::nullopt;
 }
 
 bool holds(const std::string& path, std::string_view word) {
     return SmallFile::read(path, kMaximumFile).trimmed() == word;
-}
-
-/// Calls the visitor with the name of each entry; a directory that cannot be read has none.
-template <typename Visitor> void forEachEntry(const std::string& directory, const Visitor& visitor) {
-    std::error_code error;
-    for (std::filesystem::directory_iterator entry(directory, error), end; !error && entry != end;
-         entry.increment(error)) {
-        visitor(entry->path().filename().string());
-    }
 }
 
 int stateOfTripPoint(const std::string& type) {
@@ -62,9 +52,9 @@ int stateOfZone(const std::string& zone) {
         return 0;
     }
     int state = 0;
-    forEachEntry(zone, [&](std::string name) {
+    for (std::string& name : DirectoryEntries::read(zone, kMaximumEntries).names) {
         if (!name.starts_with("trip_point_") || !name.ends_with(kTypeSuffix)) {
-            return;
+            continue;
         }
         const int reachedState = stateOfTripPoint(zone + '/' + name);
         name.replace(name.size() - kTypeSuffix.size(), kTypeSuffix.size(), "_temp");
@@ -73,7 +63,7 @@ int stateOfZone(const std::string& zone) {
         if (threshold && *threshold > 0 && *temperature >= *threshold) {
             state = reachedState;
         }
-    });
+    }
     return state;
 }
 
@@ -86,11 +76,11 @@ int LinuxDeviceConditions::thermalState() const {
     return thermalState_.get([this] {
         const std::string zones = root_ + "/class/thermal";
         int state = 0;
-        forEachEntry(zones, [&](const std::string& name) {
+        for (const std::string& name : DirectoryEntries::read(zones, kMaximumEntries).names) {
             if (name.starts_with("thermal_zone")) {
                 state = std::max(state, stateOfZone(zones + '/' + name));
             }
-        });
+        }
         return state;
     });
 }

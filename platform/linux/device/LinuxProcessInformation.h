@@ -1,6 +1,7 @@
 #pragma once
 
 #include "platform/ProcessInformation.h"
+#include "platform/ProcessSampling.h"
 #include "platform/linux/device/ProcessFiles.h"
 #include "platform/linux/device/RecentReading.h"
 
@@ -31,6 +32,15 @@ public:
 private:
     const ProcessFiles files_;
     mutable RecentReading<std::variant<std::uint64_t, QueryError>> footprint_;
+};
+
+/// What processes have used, from `/proc`.
+class LinuxProcessSampling final : public ProcessSampling {
+public:
+    [[nodiscard]] std::optional<ProcessSample> sample(pid_t pid) const override { return files_.sample(pid); }
+
+private:
+    const ProcessFiles files_;
 };
 
 } // namespace tamblo

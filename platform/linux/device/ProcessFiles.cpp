@@ -3,17 +3,13 @@
 #include "base/Format.h"
 #include "base/SplitText.h"
 #include "base/Utf8.h"
+#include "os/DirectoryEntries.h"
 #include "os/SmallFile.h"
 
-#include <algorithm>
 #include <array>
 #include <cerrno>
-#include <charconv>
-#include <memory>
-#include <system_error>
 #include <utility>
 
-#include <dirent.h>
 #include <unistd.h>
 
 namespace tamblo {
@@ -30,10 +26,6 @@ constexpr std::size_t kMaximumStatus = 64UL * 1024;
 constexpr std::size_t kMaximumStack = 64UL * 1024;
 /// `meminfo` is about two kilobytes.
 constexpr std::size_t kMaximumMemoryInformation = 64UL * 1024;
-
-struct CloseDirectory {
-    void operator()(DIR* directory) const noexcept { ::closedir(directory); }
-};
 
 /// The kernel cuts names at 15 bytes, through the middle of a character if need be, and takes any bytes for a
 /// name.
@@ -68,26 +60,9 @@ std::optional<std::string> readName(const std::string& path) {
     return asUtf8(std::move(name));
 }
 
-template <typename Number> std::optional<Number> leadingNumber(std::string_view text) {
-    Number number{};
-    const auto result = std::from_chars(text.data(), text.data() + text.size(), number);
-    return result.ec == std::errc() ? std::optional(number) : std::nullopt;
-}
-
-/// What stands behind "NAME:" in a line behind the first.
-std::optional<std::string_view> fieldOf(std::string_view text, std::string_view name) {
-    const std::size_t at = text.find(formatted("\n{}:", name));
-    if (at == std::string_view::npos) {
-        return std::nullopt;
-    }
-    text.remove_prefix(at + name.size() + 2);
-    text.remove_prefix(std::min(text.find_first_not_of(" \t"), text.size()));
-    return takeUpTo('\n', text);
-}
-
 std::optional<std::uint64_t> numberOfField(std::string_view text, std::string_view name) {
-    const auto field = fieldOf(text, name);
-    return field ? leadingNumber<std::uint64_t>(*field) : std::nullopt;
+    auto field = fieldOf(text, name);
+    return field ? takeNumber<std::uint64_t>(*field) : std::nullopt;
 }
 
 /// The bytes of a line such as "RssAnon:      1234 kB".
@@ -149,7 +124,8 @@ public:
     [[nodiscard]] bool isComplete() const noexcept { return !fields_.back().empty(); }
     /// By its number in the kernel's documents; 0 for what is no number.
     [[nodiscard]] std::uint64_t number(std::size_t field) const {
-        return leadingNumber<std::uint64_t>(fields_[field - 3]).value_or(0);
+        std::string_view text = fields_[field - 3];
+        return takeNumber<std::uint64_t>(text).value_or(0);
     }
     [[nodiscard]] std::chrono::microseconds time(std::size_t field) const {
         static const auto ticksPerSecond = static_cast<std::uint64_t>(::sysconf(_SC_CLK_TCK));
@@ -183,13 +159,9 @@ std::optional<std::string> ProcessFiles::name(pid_t pid) const {
 
 std::vector<pid_t> ProcessFiles::threads(pid_t pid, std::size_t limit) const {
     std::vector<pid_t> threads;
-    const std::unique_ptr<DIR, CloseDirectory> directory(::opendir(pathOf(pid, "task").c_str()));
-    while (directory != nullptr && threads.size() < limit) {
-        const dirent* const entry = ::readdir(directory.get());
-        if (entry == nullptr) {
-            break;
-        }
-        if (const auto thread = leadingNumber<pid_t>(entry->d_name); thread && *thread > 0) {
+    for (std::string_view name : DirectoryEntries::read(pathOf(pid, "task"), kMaximumThreads).names) {
+        const auto thread = takeNumber<pid_t>(name);
+        if (thread.value_or(0) > 0 && threads.size() < limit) {
             threads.push_back(*thread);
         }
     }

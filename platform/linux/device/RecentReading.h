@@ -1,8 +1,9 @@
 #pragma once
 
+#include "base/Mutex.h"
+
 #include <chrono>
 #include <functional>
-#include <mutex>
 #include <optional>
 #include <utility>
 
@@ -21,7 +22,7 @@ public:
 
     /// The last reading, or a new one by calling `read` when there is none that is recent enough.
     template <typename Read> [[nodiscard]] T get(const Read& read) {
-        const std::lock_guard lock(mutex_);
+        const MutexLock lock(mutex_);
         if (!reading_ || now_() - readAt_ >= validity_) {
             reading_ = read();
             readAt_ = now_();
@@ -32,9 +33,9 @@ public:
 private:
     const std::chrono::milliseconds validity_;
     const SteadyNow now_;
-    std::mutex mutex_; ///< guards what follows
-    std::optional<T> reading_;
-    std::chrono::steady_clock::time_point readAt_;
+    Mutex mutex_;
+    std::optional<T> reading_ TAMBLO_GUARDED_BY(mutex_);
+    std::chrono::steady_clock::time_point readAt_ TAMBLO_GUARDED_BY(mutex_);
 };
 
 } // namespace tamblo

@@ -1,21 +1,17 @@
 #include "platform/linux/drivers/ChanlogFiles.h"
 
 #include "base/Format.h"
-#include "os/FileDescriptor.h"
+#include "os/DirectoryEntries.h"
 #include "platform/linux/drivers/ChanlogChannelJson.h"
 
 #include <algorithm>
 #include <cerrno>
 #include <cstdint>
 #include <ctime>
-#include <memory>
-#include <optional>
 #include <system_error>
 #include <utility>
 #include <variant>
 
-#include <dirent.h>
-#include <fcntl.h>
 #include <sys/stat.h>
 
 namespace tamblo {
@@ -23,26 +19,12 @@ namespace tamblo {
 namespace {
 
 constexpr std::string_view kLogCategory = "zrrd";
+/// "." and "..".
+constexpr std::size_t kOwnEntries = 2;
 
 /// Publishers that replace a file write the new one under a name of another kind, or a hidden one.
 bool isChannelFile(std::string_view name) noexcept {
     return name.ends_with(".json") && !name.starts_with('.');
-}
-
-/// Sorted. Nothing when the directory has too many entries to look through.
-std::optional<std::vector<std::string>> channelFilesIn(DIR* directory) {
-    std::vector<std::string> names;
-    std::size_t count = 0;
-    while (const dirent* entry = ::readdir(directory)) {
-        if (++count > ChanlogFiles::kMaximumEntries) {
-            return std::nullopt;
-        }
-        if (isChannelFile(entry->d_name)) {
-            names.emplace_back(entry->d_name);
-        }
-    }
-    std::sort(names.begin(), names.end());
-    return names;
 }
 
 timespec coarseNow() noexcept {
@@ -65,47 +47,44 @@ bool wasOld(const FileState& state, const timespec& moment) noexcept {
 } // namespace
 
 bool ChanlogFiles::read(StructuredLog& log) {
-    const std::unique_ptr<DIR, int (*)(DIR*)> directory(::opendir(directory_.c_str()), ::closedir);
-    const int failure = directory == nullptr ? errno : 0;
-    const auto names = directory != nullptr ? channelFilesIn(directory.get()) : std::nullopt;
-    if (names) {
-        return readFiles(::dirfd(directory.get()), *names, log);
+    DirectoryEntries entries = DirectoryEntries::read(directory_, kMaximumEntries - kOwnEntries);
+    if (entries.error == 0 && !entries.isCut) {
+        std::erase_if(entries.names, [](const std::string& name) { return !isChannelFile(name); });
+        std::sort(entries.names.begin(), entries.names.end());
+        return readFiles(entries.names, log);
     }
-    const bool isMissing = failure == ENOENT || failure == ENOTDIR;
-    const std::string fault = failure != 0 ? std::generic_category().message(failure)
-                                           : formatted("more than {} entries", kMaximumEntries);
+    const bool isMissing = entries.error == ENOENT || entries.error == ENOTDIR;
+    const std::string fault = entries.isCut ? formatted("more than {} entries", kMaximumEntries)
+                                            : std::generic_category().message(entries.error);
     report(log, isMissing ? std::string()
                           : formatted("{}: {}; no driver statistics are had from there", directory_, fault));
     return !std::exchange(files_, {}).empty();
 }
 
-bool ChanlogFiles::readFiles(int directory, const std::vector<std::string>& names, StructuredLog& log) {
+bool ChanlogFiles::readFiles(const std::vector<std::string>& names, StructuredLog& log) {
     bool isChanged = false;
     Files earlier = std::exchange(files_, {});
     std::string fault;
     std::size_t room = kMaximumTotalSize;
     for (const std::string& name : names) {
+        const std::string path = formatted("{}/{}", directory_, name);
         struct stat status {};
-        if (::fstatat(directory, name.c_str(), &status, 0) != 0) {
+        if (::stat(path.c_str(), &status) != 0) {
             continue; // it went meanwhile
         }
         const auto size = std::min(static_cast<std::size_t>(status.st_size), kMaximumFileSize);
         if (files_.size() == kMaximumFiles || size > room) {
-            fault = formatted("{}/{}: more than {} files or {} bytes in all; it and those behind it in the "
+            fault = formatted("{}: more than {} files or {} bytes in all; it and those behind it in the "
                               "order of names are left out",
-                              directory_, name, kMaximumFiles, kMaximumTotalSize);
+                              path, kMaximumFiles, kMaximumTotalSize);
             break;
         }
         room -= size;
         auto known = earlier.extract(name);
-        if (known.empty()) {
-            const auto made =
-                files_.emplace(name, File{JsonFile(directory_ + "/" + name, kMaximumFileSize)}).first;
-            isChanged = readFile(made->second, FileState::of(status), log) || isChanged;
-        } else {
-            isChanged = readFile(known.mapped(), FileState::of(status), log) || isChanged;
-            files_.insert(std::move(known));
-        }
+        File& file = known.empty()
+                         ? files_.emplace(name, File{JsonFile(path, kMaximumFileSize)}).first->second
+                         : files_.insert(std::move(known)).position->second;
+        isChanged = readFile(file, FileState::of(status), log) || isChanged;
     }
     report(log, std::move(fault));
     return isChanged || !earlier.empty();

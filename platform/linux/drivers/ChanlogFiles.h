@@ -50,7 +50,7 @@ private:
     };
     using Files = std::map<std::string, File, std::less<>>;
 
-    [[nodiscard]] bool readFiles(int directory, const std::vector<std::string>& names, StructuredLog& log);
+    [[nodiscard]] bool readFiles(const std::vector<std::string>& names, StructuredLog& log);
     [[nodiscard]] bool readFile(File& file, const FileState& state, StructuredLog& log);
     static void readChannels(File& file, StructuredLog& log);
     /// Once for as long as the same is said.

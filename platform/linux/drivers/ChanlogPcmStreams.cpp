@@ -1,11 +1,10 @@
 #include "platform/linux/drivers/ChanlogPcmStreams.h"
 
 #include "base/Format.h"
+#include "base/SplitText.h"
 #include "os/SmallFile.h"
 
-#include <algorithm>
 #include <cerrno>
-#include <charconv>
 #include <cstdint>
 #include <memory>
 #include <optional>
@@ -18,52 +17,20 @@ namespace {
 constexpr std::string_view kLogCategory = "zrrd";
 constexpr std::string_view kClosed = "closed";
 
-/// A number at the beginning of a text, which is left behind it.
-std::optional<std::int64_t> takeNumber(std::string_view& text) {
-    std::int64_t number = 0;
-    const auto result = std::from_chars(text.data(), text.data() + text.size(), number);
-    if (result.ec != std::errc()) {
-        return std::nullopt;
-    }
-    text.remove_prefix(static_cast<std::size_t>(result.ptr - text.data()));
-    return number;
-}
-
-std::string_view takeLine(std::string_view& text) {
-    const std::string_view line = text.substr(0, text.find('\n'));
-    text.remove_prefix(std::min(text.size(), line.size() + 1));
-    return line;
-}
-
-/// The value of a line "name   : value" of a status.
-std::string_view valueOf(std::string_view name, std::string_view status) {
-    while (!status.empty()) {
-        const std::string_view line = takeLine(status);
-        const std::size_t colon = line.find(':');
-        if (colon == std::string_view::npos || !line.starts_with(name) ||
-            line.substr(name.size(), colon - name.size()).find_first_not_of(' ') != std::string_view::npos) {
-            continue;
-        }
-        const std::size_t value = line.find_first_not_of(' ', colon + 1);
-        return value == std::string_view::npos ? std::string_view() : line.substr(value);
-    }
-    return {};
-}
-
 /// Nothing when the status does not have it.
 std::optional<std::int64_t> numberIn(std::string_view status, std::string_view name) {
     if (status == kClosed) {
         return 0;
     }
-    std::string_view value = valueOf(name, status);
-    return takeNumber(value);
+    std::string_view value = fieldOf(status, name).value_or("");
+    return takeNumber<std::int64_t>(value);
 }
 
 std::optional<std::int64_t> isOverrun(std::string_view status) {
     if (status == kClosed) {
         return 0;
     }
-    const std::string_view state = valueOf("state", status);
+    const std::string_view state = fieldOf(status, "state").value_or("");
     return state.empty() ? std::nullopt : std::optional<std::int64_t>(state == "XRUN" ? 1 : 0);
 }
 
@@ -75,7 +42,7 @@ std::int64_t countIn(std::string_view line, std::string_view kind) {
         return 0;
     }
     std::string_view rest = line.substr(at + kind.size());
-    const auto count = takeNumber(rest);
+    const auto count = takeNumber<std::int64_t>(rest);
     return count && (rest.empty() || rest.starts_with(" : capture ")) ? *count : 0;
 }
 
@@ -107,7 +74,7 @@ void ChanlogPcmStreams::list(StructuredLog& log) {
     }
     streams_.clear();
     for (std::string_view rest = devices.text; !rest.empty();) {
-        addStreams(takeLine(rest));
+        addStreams(takeUpTo('\n', rest));
     }
     if (streams_.size() > kMaximumStreams) {
         log.report(LogLevel::error, kLogCategory,
@@ -121,13 +88,10 @@ void ChanlogPcmStreams::list(StructuredLog& log) {
 /// "00-03: name : description : playback 1 : capture 1", of card 0, device 3.
 void ChanlogPcmStreams::addStreams(std::string_view line) {
     std::string_view rest = line;
-    const auto card = takeNumber(rest);
-    if (!card || !rest.starts_with('-')) {
-        return;
-    }
-    rest.remove_prefix(1);
-    const auto device = takeNumber(rest);
-    if (!device || !rest.starts_with(':')) {
+    const auto card = takeNumber<unsigned>(rest);
+    const bool isDash = takeUpTo('-', rest).empty();
+    const auto device = takeNumber<unsigned>(rest);
+    if (!card || !isDash || !device || !rest.starts_with(':')) {
         return;
     }
     const std::string directory = formatted("{}/card{}", soundDirectory_, *card);

@@ -114,12 +114,12 @@ std::variant<ChanlogChannels, int> LinuxChanlogFacility::difference(const Chanlo
     if (earlier == nullptr || later == nullptr) {
         return ENOENT;
     }
-    const std::lock_guard held(mutex_);
+    const MutexLock held(mutex_);
     return difference_.between(earlier, later);
 }
 
 ChanlogChannels LinuxChanlogFacility::readAll() {
-    const std::lock_guard held(mutex_);
+    const MutexLock held(mutex_);
     const bool filesChanged = files_.read(log_);
     const bool streamsChanged = streams_.read(log_);
     if (all_ == nullptr || filesChanged || streamsChanged) {

@@ -1,5 +1,6 @@
 #pragma once
 
+#include "base/Mutex.h"
 #include "platform/ChanlogFacility.h"
 #include "platform/StructuredLog.h"
 #include "platform/linux/drivers/ChanlogDifference.h"
@@ -7,7 +8,6 @@
 #include "platform/linux/drivers/ChanlogPcmStreams.h"
 
 #include <cstddef>
-#include <mutex>
 #include <string>
 
 namespace tamblo {
@@ -40,15 +40,15 @@ public:
     [[nodiscard]] ChanlogChannels readAll();
 
 private:
-    [[nodiscard]] ChanlogChannels gather();
+    [[nodiscard]] ChanlogChannels gather() TAMBLO_REQUIRES(mutex_);
 
     StructuredLog& log_;
-    std::mutex mutex_; ///< guards what follows
-    ChanlogFiles files_;
-    ChanlogPcmStreams streams_;
-    ChanlogDifference difference_;
-    ChanlogChannels all_; ///< as read last; null before
-    bool isOverLimit_ = false;
+    Mutex mutex_;
+    ChanlogFiles files_ TAMBLO_GUARDED_BY(mutex_);
+    ChanlogPcmStreams streams_ TAMBLO_GUARDED_BY(mutex_);
+    ChanlogDifference difference_ TAMBLO_GUARDED_BY(mutex_);
+    ChanlogChannels all_ TAMBLO_GUARDED_BY(mutex_); ///< as read last; null before
+    bool isOverLimit_ TAMBLO_GUARDED_BY(mutex_) = false;
 };
 
 } // namespace tamblo

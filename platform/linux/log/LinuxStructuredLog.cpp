@@ -25,35 +25,8 @@ namespace {
 constexpr std::string_view kOwnCategory = "zrrs";
 constexpr std::string_view kCut = "…";
 constexpr std::string_view kHexDigits = "0123456789abcdef";
-
-char priorityOf(LogLevel level) noexcept {
-    switch (level) {
-    case LogLevel::fault:
-        return '2';
-    case LogLevel::error:
-        return '3';
-    case LogLevel::standard:
-        return '5';
-    case LogLevel::info:
-        return '6';
-    case LogLevel::debug:
-        break;
-    }
-    return '7';
-}
-
-/// How many bytes of the text, from an index on, are a control character: of ASCII, or of the second set that
-/// terminals obey, U+0080 to U+009F.
-std::size_t controlLength(std::string_view text, std::size_t at) noexcept {
-    const auto byte = static_cast<unsigned char>(text[at]);
-    if (byte < 0x20 || byte == 0x7F) {
-        return 1;
-    }
-    const bool isSecondSet = byte == 0xC2 && at + 1 < text.size() &&
-                             static_cast<unsigned char>(text[at + 1]) >= 0x80 &&
-                             static_cast<unsigned char>(text[at + 1]) <= 0x9F;
-    return isSecondSet ? 2 : 0;
-}
+/// Of the levels, from debug on.
+constexpr std::string_view kPriorities = "76532";
 
 /// One line on the stack: what does not fit is cut off, at a character's end, and leaves a mark.
 class LineBuffer {
@@ -140,8 +113,7 @@ LinuxStructuredLog::LinuxStructuredLog(int descriptor, std::string_view filter)
     for (const std::string& word : filter_.unknownWords()) {
         report(LogLevel::error, kOwnCategory,
                formatted("TAMBLO_LOG: \"{}\" is neither a level (debug, info, default, error, fault) nor "
-                         "CODE=level; it "
-                         "is ignored",
+                         "CODE=level; it is ignored",
                          word));
     }
 }
@@ -181,8 +153,8 @@ LogLevel LinuxStructuredLog::threshold(std::string_view categoryCode) const noex
 void LinuxStructuredLog::write(LogLevel level, std::string_view categoryCode,
                                std::string_view line) noexcept {
     LineBuffer buffer;
-    const char prefix[] = {'<', priorityOf(level), '>'};
-    buffer.append({prefix, sizeof prefix});
+    const std::array<char, 3> prefix{'<', kPriorities[static_cast<std::size_t>(level)], '>'};
+    buffer.append({prefix.data(), prefix.size()});
     buffer.appendHarmless(categoryCode);
     buffer.append(" ");
     buffer.appendHarmless(line);

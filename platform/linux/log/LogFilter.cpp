@@ -20,12 +20,8 @@ constexpr std::array<std::pair<std::string_view, LogLevel>, 5> kLevels{{
 }};
 
 std::optional<LogLevel> levelNamed(std::string_view name) noexcept {
-    for (const auto& [levelName, level] : kLevels) {
-        if (levelName == name) {
-            return level;
-        }
-    }
-    return std::nullopt;
+    const auto found = std::ranges::find(kLevels, name, [](const auto& row) { return row.first; });
+    return found != kLevels.end() ? std::optional(found->second) : std::nullopt;
 }
 
 } // namespace
@@ -52,9 +48,7 @@ LogFilter::LogFilter(std::string_view words) {
 }
 
 LogLevel LogFilter::threshold(std::string_view categoryCode) const noexcept {
-    const auto found =
-        std::find_if(categories_.begin(), categories_.end(),
-                     [categoryCode](const Category& category) { return category.code == categoryCode; });
+    const auto found = std::ranges::find(categories_, categoryCode, &Category::code);
     return found != categories_.end() ? found->level : level_;
 }
 

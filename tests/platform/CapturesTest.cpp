@@ -1,0 +1,455 @@
+#include "platform/linux/captures/LinuxBugCaptureService.h"
+#include "platform/linux/captures/LinuxDiagnosticCapture.h"
+#include "platform/linux/captures/LinuxMemoryLog.h"
+#include "platform/linux/loop/LinuxWorkQueues.h"
+#include "tests/fakes/FakeClock.h"
+#include "tests/fakes/FakeWorkQueues.h"
+#include "tests/platform/LinuxServiceSupport.h"
+
+#include <gmock/gmock.h>
+#include <nlohmann/json.hpp>
+
+#include <array>
+#include <cmath>
+#include <limits>
+#include <map>
+#include <thread>
+
+#include <fcntl.h>
+
+namespace tamblo {
+namespace {
+
+namespace fs = std::filesystem;
+using namespace std::chrono_literals;
+using testing::AllOf;
+using testing::ElementsAre;
+using testing::HasSubstr;
+using testing::IsEmpty;
+using testing::SizeIs;
+using testing::UnorderedElementsAre;
+
+TEST(DailyAllowanceTest, LastsForADayOfUtcAndOutlivesTheProcess) {
+    const TemporaryDirectory directory;
+    RecordingLog log;
+    const std::string path = directory.path("allowance.json");
+    const WallTime midnight = std::chrono::sys_days(std::chrono::year(2026) / 3 / 2);
+    std::size_t taken = 0;
+    for (std::size_t day = 0; day < 2; ++day) {
+        for (std::uint64_t attempt = 0; attempt < DailyAllowance::kCapturesADay + 2; ++attempt) {
+            DailyAllowance allowance(path, log);
+            taken += allowance.take(midnight + (day == 0 ? -1ms : 0ms)) ? 1 : 0;
+            directory.write("allowance.json", allowance.text());
+        }
+        EXPECT_EQ(taken, DailyAllowance::kCapturesADay * (day + 1));
+    }
+    EXPECT_TRUE(DailyAllowance(path, log).take(midnight - 1ms)) << "the clock was set back";
+    EXPECT_THAT(log.take(), IsEmpty());
+    for (const char* rubbish :
+         {"[]", R"({"day":"2026-03-02"})", R"({"day":1,"captures":20})",
+          R"({"day":"2026-03-02","captures":"20"})", R"({"day":"2026-03-02","captures":-1})"}) {
+        directory.write("allowance.json", rubbish);
+        EXPECT_TRUE(DailyAllowance(path, log).take(midnight)) << rubbish;
+        EXPECT_THAT(log.take(), ElementsAre(HasSubstr(path + ": "))) << rubbish;
+    }
+}
+
+class CaptureFoldersTest : public testing::Test {
+protected:
+    [[nodiscard]] std::vector<std::string> names() const {
+        std::vector<std::string> found;
+        for (const auto& entry : fs::directory_iterator(directory.path("captures"))) {
+            found.push_back(entry.path().filename());
+        }
+        return found;
+    }
+    /// Of a capture asked for so much after the present.
+    [[nodiscard]] std::string identifier(std::chrono::nanoseconds later, std::uint64_t number = 1) const {
+        return CaptureFolders::identifier(clock.now() + later, number);
+    }
+    std::string store(const std::string& identifier, std::size_t size = 1) {
+        const CaptureFile files[] = {{"log.txt", std::string(size, 'x')}};
+        folders.store(identifier, files, clock.now());
+        return identifier;
+    }
+
+    TemporaryDirectory directory;
+    RecordingLog log;
+    FakeClock clock;
+    CaptureFolders folders{directory.path("captures"), log, CaptureFolders::Limits{1000}};
+};
+
+TEST_F(CaptureFoldersTest, OldFoldersAndLeftoversGoWithTheNextCaptureAndNothingElse) {
+    EXPECT_EQ(identifier(250ms, 0xA9F86D081), "20260301T120000.250Z-9f86d081");
+    const std::string justOld = identifier(-CaptureFolders::kMaximumAge - 1ms);
+    const std::string notYet = identifier(-CaptureFolders::kMaximumAge);
+    const std::string link = identifier(-CaptureFolders::kMaximumAge * 2);
+    const std::string strange = "20200101T000000.000Z-note";
+    for (const std::string& folder : {".new-" + justOld, justOld + "/deeper", notYet, strange}) {
+        fs::create_directories(directory.path("captures/" + folder));
+    }
+    directory.write("elsewhere/kept", "");
+    fs::create_directory_symlink(directory.path("elsewhere"), directory.path("captures/" + link));
+    fs::create_directory_symlink(directory.path("elsewhere"),
+                                 directory.path("captures/" + justOld + "/link"));
+    const std::string fresh = store(identifier(0s));
+    EXPECT_THAT(names(), UnorderedElementsAre(notYet, fresh, strange, link));
+    EXPECT_TRUE(fs::exists(directory.path("elsewhere/kept")));
+    EXPECT_EQ(directory.read("captures/" + fresh + "/log.txt"), "x");
+    EXPECT_EQ(static_cast<unsigned>(fs::status(directory.path("captures/" + fresh)).permissions()), 0700U);
+    EXPECT_THAT(log.take(), IsEmpty());
+}
+
+TEST_F(CaptureFoldersTest, TheOldestGoWhenThereIsNoRoomForAll) {
+    store(identifier(1s), 10);
+    const std::string second = store(identifier(2s), 600);
+    clock.advance(3s);
+    const std::string third = store(identifier(0s), 400);
+    EXPECT_THAT(names(), UnorderedElementsAre(second, third));
+    const std::string fourth = store(identifier(0s, 2));
+    EXPECT_THAT(names(), UnorderedElementsAre(third, fourth));
+}
+
+TEST_F(CaptureFoldersTest, AClockThatIsSetLosesNoCaptureThatWasJustMade) {
+    const std::string ahead = identifier(24h);
+    directory.write("captures/" + ahead + "/log.txt", std::string(600, 'x'));
+    const std::string first = store(identifier(0s), 400);
+    EXPECT_THAT(names(), UnorderedElementsAre(ahead, first));
+    const std::string second = store(identifier(0s, 2));
+    EXPECT_THAT(names(), UnorderedElementsAre(first, second)) << "of a time that is still to come";
+    const std::string asked = identifier(0s, 3);
+    clock.advance(24h * 365);
+    store(asked);
+    EXPECT_THAT(names(), ElementsAre(asked));
+}
+
+TEST_F(CaptureFoldersTest, AnOutageIsOneLineAndLeavesNoHalfFolder) {
+    directory.write("captures", "in the way");
+    store(identifier(0s, 1));
+    folders.keep("allowance.json", "{}");
+    store(identifier(0s, 2));
+    EXPECT_THAT(log.take(), ElementsAre("3 zrrb " + directory.path("captures") +
+                                        ": cannot make it: Not a directory; captures have no folders until "
+                                        "it can be written again"));
+    fs::remove(directory.path("captures"));
+    const std::string stored = store(identifier(0s, 3));
+    const CaptureFile impossible[] = {{"a", "b"}, {"no/such/place", ""}};
+    folders.store(identifier(0s, 4), impossible, clock.now());
+    EXPECT_THAT(names(), ElementsAre(stored));
+    EXPECT_THAT(log.take(), ElementsAre(HasSubstr("cannot write no/such/place: No such file or directory;")));
+    fs::create_directory(directory.path("captures/allowance.json"));
+    for (const std::uint64_t number : {5U, 6U}) {
+        folders.keep("allowance.json", "{}");
+        store(identifier(0s, number));
+    }
+    EXPECT_THAT(log.take(),
+                ElementsAre(HasSubstr("cannot write allowance.json: Is a directory; the service")));
+}
+
+/// A directory for logs and, as `proc` and `sys`, what the kernel shows: written by each test.
+class CapturesTest : public testing::Test {
+protected:
+    void writeThread(const std::string& process, const std::string& thread, const std::string& state) const {
+        root.write("proc/" + process + "/comm", "p" + process + "\n");
+        root.write("proc/" + process + "/task/" + thread + "/comm", "t" + thread + "\n");
+        root.write("proc/" + process + "/task/" + thread + "/status",
+                   "Name:\tState: X\\n\nState:\t" + state + "\n");
+    }
+    [[nodiscard]] ProcessFiles files() const { return ProcessFiles(root.path("proc")); }
+
+    TemporaryDirectory root;
+    RecordingLog log;
+    SinkFiles sinks{root.path(), log};
+    FakeWorkQueues workQueues;
+};
+
+class BugCaptureServiceTest : public CapturesTest {
+protected:
+    /// For a process 12 that there is, and a process 13 that there is not.
+    void makeService(WorkQueues& queues) {
+        service.emplace(sinks, root.path("captures"), clock, queues, stderrLog,
+                        CaptureContent(root.path("proc"), root.path("sys")));
+        reporter = service->makeReporter(std::array<pid_t, 3>{12, 13, 12});
+    }
+    void makeService() { makeService(workQueues); }
+    [[nodiscard]] GlarnReporter::Reply keepReply() {
+        return [this](const Dictionary& reply) { replies.push_back(reply); };
+    }
+    [[nodiscard]] std::string identifier(std::size_t reply) const {
+        const Value* found = replies.at(reply).find(glarn::kReplySessionID);
+        return found != nullptr ? std::string(found->stringValue()) : "";
+    }
+    /// The sink's lines without time and what is the same in all: "OP SESSION".
+    [[nodiscard]] std::vector<std::string> lines() {
+        sinks.flush();
+        std::vector<std::string> found;
+        std::istringstream text(root.read("bug-captures.jsonl"));
+        for (std::string line; std::getline(text, line);) {
+            const auto object = nlohmann::json::parse(line);
+            found.push_back(object["op"].get<std::string>() + " " + object["session"].get<std::string>());
+        }
+        return found;
+    }
+    [[nodiscard]] std::string file(std::size_t reply, const std::string& name) const {
+        return root.read("captures/" + identifier(reply) + "/" + name);
+    }
+    std::size_t gather() { return workQueues.run("com.vandra.tamblo.bugcaptures"); }
+
+    const FileDescriptor nowhere{::open("/dev/null", O_WRONLY)};
+    LinuxStructuredLog stderrLog{nowhere.get(), "debug"};
+    FakeClock clock;
+    std::vector<Dictionary> replies;
+    const BugCaptureSignature signature{"Tonmetry", "haptics", "Playback", "Joulery", "Unknown"};
+    std::optional<LinuxBugCaptureService> service;
+    std::unique_ptr<GlarnReporter> reporter;
+};
+
+TEST_F(BugCaptureServiceTest, ASnapshotIsALineOnceItsFolderIsComplete) {
+    writeThread("12", "12", "S (sleeping)");
+    root.write("proc/12/comm", "mu\x1bs\xC2\x9Bic\n");
+    root.write("proc/12/status", "Name:\tmu\x1bsic\nVmRSS:\t  64 kB\n");
+    root.write("proc/12/task/12/wchan", "futex_wait");
+    root.write("proc/12/task/12/stack", "[<0>] futex_wait+0x66/0x120\n");
+    fs::create_directory(root.path("proc/12/task/14"));
+    root.write("proc/loadavg", "0.10 0.20 0.30 1/99 12\n");
+    root.write("sys/class/thermal/thermal_zone0/type", "soc\n");
+    root.write("sys/class/thermal/thermal_zone0/temp", "48500\n");
+    root.write("sys/class/thermal/cooling_device0/type", "fan\n");
+    makeService();
+    EXPECT_EQ(workQueues.made("com.vandra.tamblo.bugcaptures"), 0U);
+    ASSERT_TRUE(reporter->snapshot(signature, 0s, {{"processIDs", 12}}, keepReply()));
+    const std::string request =
+        R"({"time":1772366400.0,"op":"snapshot","session":")" + identifier(0) +
+        R"(","signature":{"domain":"Tonmetry","type":"haptics","subType":"Playback","subTypeContext":"Joulery",)"
+        R"("detectedProcess":"Unknown"},"duration":0.0,"payload":{"processIDs":12})";
+    EXPECT_THAT(lines(), IsEmpty());
+    EXPECT_FALSE(fs::exists(root.path("captures")));
+
+    stderrLog.write(LogLevel::error, "zrrr", "the last line");
+    clock.advance(500ms);
+    gather();
+    EXPECT_EQ(root.read("bug-captures.jsonl"), request + "}\n");
+    EXPECT_EQ(file(0, "capture.json"), request + ",\"gathered\":1772366400.5}\n");
+    EXPECT_EQ(file(0, "log.txt"), "<3>zrrr the last line\n");
+    EXPECT_EQ(file(0, "process-12.txt"),
+              "process 12: mu?s??ic\n\n== threads\n12  t12  S (sleeping)  futex_wait\n"
+              "        futex_wait+0x66/0x120\n14  gone\n\n== status\nName:\tmu?sic\nVmRSS:\t  64 kB\n\n"
+              "== memory\n(No such file or directory)\n\n");
+    EXPECT_EQ(file(0, "process-13.txt"), "process 13: gone\n");
+    EXPECT_THAT(file(0, "system.txt"), AllOf(HasSubstr("== loadavg\n0.10 0.20 0.30 1/99 12\n\n"),
+                                             HasSubstr("== temperatures\nthermal_zone0  soc  48500\n")));
+}
+
+TEST_F(BugCaptureServiceTest, ATimedSessionIsKeptUnlessItIsCancelledBeforeItsEnd) {
+    makeService();
+    for (int session = 0; session < 4; ++session) {
+        ASSERT_TRUE(reporter->startSession(signature, session == 3 ? 2min : 1min, keepReply()));
+    }
+    reporter->cancelSession(identifier(1));
+    reporter->cancelSession(identifier(1));
+    reporter->cancelSession("20200101T000000.000Z-00000000");
+    workQueues.elapse(59'999ms);
+    reporter->cancelSession(identifier(2));
+    gather();
+    EXPECT_THAT(lines(), SizeIs(6)) << "nothing has ended by itself";
+    workQueues.elapse(1ms);
+    gather();
+    reporter->cancelSession(identifier(0));
+    service.reset();
+    EXPECT_THAT(lines(),
+                ElementsAre("start " + identifier(0), "start " + identifier(1), "start " + identifier(2),
+                            "start " + identifier(3), "cancel " + identifier(1), "cancel " + identifier(2),
+                            "end " + identifier(0), "cancel " + identifier(3)));
+    EXPECT_THAT(file(0, "capture.json"), HasSubstr(R"("duration":60.0,"payload":{})"));
+    EXPECT_EQ(file(1, "capture.json") + file(2, "capture.json") + file(3, "capture.json"), "");
+    EXPECT_EQ(workQueues.delayedCalls(), 0U);
+}
+
+TEST_F(BugCaptureServiceTest, RequestsOutsideTheLimitsMakeNoLine) {
+    const auto refusal = [](GlarnError reason) {
+        return Dictionary{{glarn::kReplySuccess, false}, {glarn::kReplyReason, int{reason}}};
+    };
+    makeService();
+    for (const double seconds : {-0.001, std::nan(""), std::numeric_limits<double>::infinity(), 3600.001}) {
+        const std::chrono::duration<double> duration(seconds);
+        EXPECT_FALSE(reporter->snapshot(signature, duration, {}, keepReply())) << seconds;
+        EXPECT_FALSE(reporter->startSession(signature, duration, keepReply())) << seconds;
+    }
+    EXPECT_THAT(replies, IsEmpty());
+    EXPECT_TRUE(reporter->startSession(signature, 3600s, keepReply()));
+    for (std::uint64_t more = 1; more < DailyAllowance::kCapturesADay; ++more) {
+        EXPECT_TRUE(reporter->snapshot(signature, 0s, {}, keepReply()));
+    }
+    gather();
+    makeService(); // a restart begins no new day
+    EXPECT_TRUE(reporter->snapshot(signature, 0s, {}, keepReply()));
+    EXPECT_EQ(replies.back(), refusal(kGlarnErrorDailyLimitExceeded));
+    gather();
+    EXPECT_THAT(lines(), SizeIs(21)) << "one of them for the session that the service's end has cancelled";
+    service->endSessions();
+    clock.advance(12h);
+    EXPECT_TRUE(reporter->startSession(signature, 1s, keepReply()));
+    EXPECT_EQ(replies.back(), refusal(kGlarnErrorServiceUnavailable));
+}
+
+TEST_F(BugCaptureServiceTest, SessionsThatEndWhileTheyAreCancelledDoOneOfTheTwo) {
+    {
+        LinuxWorkQueues real;
+        makeService(real);
+        std::vector<std::thread> clients;
+        for (int client = 0; client < 4; ++client) {
+            clients.emplace_back([&] {
+                const auto own = service->makeReporter({});
+                for (int session = 0; session < 5; ++session) {
+                    std::string identifier;
+                    EXPECT_TRUE(own->startSession(signature, 1ms, [&identifier](const Dictionary& reply) {
+                        identifier = reply.find(glarn::kReplySessionID)->stringValue();
+                    }));
+                    own->cancelSession(session % 2 == 0 ? identifier : "");
+                }
+            });
+        }
+        for (std::thread& client : clients) {
+            client.join();
+        }
+        service->endSessions();
+    }
+    std::map<std::string, std::string> operations;
+    for (const std::string& line : lines()) {
+        const std::size_t blank = line.find(' ');
+        operations[line.substr(blank)] += line.substr(0, blank) + ",";
+    }
+    EXPECT_THAT(operations, SizeIs(20));
+    for (const auto& [identifier, ofSession] : operations) {
+        EXPECT_THAT(ofSession, testing::AnyOf("start,end,", "start,cancel,")) << identifier;
+    }
+}
+
+/// Time stands still but for what the test does while a capture waits for its next sample.
+class SamplingClock final : public Clock {
+public:
+    [[nodiscard]] WallTime now() const noexcept override { return WallTime(4s); }
+    [[nodiscard]] std::chrono::seconds utcOffset(WallTime) const override { return {}; }
+    void sleepFor(std::chrono::microseconds) override { betweenSamples(++sleeps); }
+
+    int sleeps = 0;
+    std::function<void(int)> betweenSamples = [](int) {};
+};
+
+class StackCaptureTest : public CapturesTest {
+protected:
+    void capture(const Dictionary& payload = {}) {
+        service.captureStacks({.requester = "r",
+                               .captureType = "AudioOverloads",
+                               .reason = "\"x\"",
+                               .payload = payload,
+                               .options = {1, 1, 0, 0, -1}});
+    }
+    std::size_t run() { return workQueues.run("com.vandra.tamblo.stackcaptures"); }
+    [[nodiscard]] std::string lines() const { return root.read("stack-captures.jsonl"); }
+
+    SamplingClock clock;
+    std::vector<pid_t> clients;
+    LinuxDiagnosticCapture service{sinks, clock, workQueues, [this] { return clients; }, log, files()};
+};
+
+TEST_F(StackCaptureTest, ALineHoldsTheSamplesThatEachThreadHad) {
+    clients = {8, 7, 7};
+    writeThread("7", "7", "S (sleeping)");
+    root.write("proc/7/task/7/wchan", "pipe_read");
+    root.write("proc/7/task/7/stack", "[<0>] pipe_read+0x1/0x2\n[<ffffffff8>] f [mod]\ntorn\xFF");
+    writeThread("8", "9", "R (running)");
+    writeThread("6", "6", "S (sleeping)");
+    root.write("proc/6/task/6/wchan", "0");
+    root.write("proc/6/task/6/stack", ""); // it may be looked at, and is in no call
+    clock.betweenSamples = [&](int sleep) {
+        if (sleep == 1) {
+            writeThread("8", "9", "D (disk sleep)");
+            writeThread("8", "10", "R (running)");
+        } else if (sleep == 3) {
+            fs::remove_all(root.path("proc/8"));
+        }
+    };
+    capture({{"processIDs", Array{6, 5}}});
+    EXPECT_EQ(lines(), "") << "nothing is read on the caller's thread";
+    // Who leaves while the capture waits is looked at all the same.
+    clients.clear();
+    EXPECT_EQ(run(), 1U);
+    EXPECT_EQ(clock.sleeps, 4);
+    EXPECT_EQ(lines(), R"({"time":4.0,"requester":"r","captureType":"AudioOverloads","reason":"\"x\"",)"
+                       R"("payload":{"processIDs":[6,5]},"options":[1,1,0,0,-1],"stacks":[)"
+                       R"({"process":6,"name":"p6","threads":[{"thread":6,"name":"t6","samples":[)"
+                       R"-({"count":5,"state":"S (sleeping)","kernelStack":[]}]}]},)-"
+                       R"({"process":8,"name":"p8","threads":[{"thread":9,"name":"t9","samples":[)"
+                       R"-({"count":1,"state":"R (running)"},{"count":2,"state":"D (disk sleep)"}]}]},)-"
+                       R"({"process":7,"name":"p7","threads":[{"thread":7,"name":"t7","samples":[)"
+                       R"-({"count":5,"state":"S (sleeping)","waitChannel":"pipe_read",)-"
+                       R"("kernelStack":["pipe_read+0x1/0x2","f [mod]","torn"]}]}]}]})"
+                       "\n");
+    EXPECT_THAT(log.take(), IsEmpty());
+}
+
+TEST_F(StackCaptureTest, ThoseBeyondTheFourThatWaitAreDroppedAndCounted) {
+    for (int i = 0; i < 6; ++i) {
+        EXPECT_THAT(log.take(), i == 5 ? SizeIs(1) : SizeIs(0));
+        capture();
+    }
+    EXPECT_EQ(run(), 4U);
+    EXPECT_THAT(log.take(), ElementsAre("3 zrrp no stack captures wait any more; 2 were dropped"));
+    capture();
+    EXPECT_EQ(run(), 1U);
+    EXPECT_THAT(log.take(), IsEmpty());
+    const std::string all = lines();
+    EXPECT_EQ(std::count(all.begin(), all.end(), '\n'), 5);
+}
+
+TEST_F(StackCaptureTest, AProcessWithTooManyThreadsLeavesTheOthersTheirs) {
+    writeThread("7", "5000", "S (sleeping)");
+    for (std::size_t i = 1; i < LinuxDiagnosticCapture::kMaximumThreads; ++i) {
+        fs::create_directory_symlink("5000", root.path("proc/7/task/" + std::to_string(i)));
+    }
+    clients = {7};
+    for (pid_t client = 6000; client < 6070; ++client) {
+        clients.push_back(client);
+        writeThread(std::to_string(client), std::to_string(client), "R (running)");
+    }
+    capture();
+    run();
+    std::map<std::size_t, int> processesByThreads;
+    for (const auto& process : nlohmann::json::parse(lines())["stacks"]) {
+        ++processesByThreads[process["threads"].size()];
+    }
+    EXPECT_EQ(processesByThreads,
+              (std::map<std::size_t, int>{{1, 70}, {LinuxDiagnosticCapture::kMaximumThreads - 70, 1}}));
+}
+
+TEST_F(CapturesTest, TheMemoryLogLeavesOutWhoIsGone) {
+    const SamplingClock clock;
+    LinuxMemoryLog memory(sinks, clock, workQueues, log, files());
+    writeThread("7", "7", "S (sleeping)");
+    root.write(
+        "proc/7/status",
+        "Name:\tVmRSS: 9\nVmPeak:\t9 kB\nVmLck:\t7 kB\nVmHWM:\t  20 kB\nVmRSS:\t 10 kB\nRssAnon:\t5 kB\n"
+        "RssFile:\t3 kB\nRssShmem:\t2 kB\nVmPTE:\t6 kB\nVmSwap:\t8 kB\nThreads:\t4\n");
+    writeThread("8", "8", "Z (zombie)");
+    memory.logMemory(-5, {9});
+    EXPECT_EQ(root.read("memory-log.jsonl"), "") << "nothing is read on the caller's thread";
+    EXPECT_EQ(workQueues.run("com.vandra.tamblo.memorylog"), 1U);
+    memory.logMemory(-5, {9, 8, 7});
+    root.write("proc/meminfo",
+               "MemTotal: 9 kB\nUnevictable: 1 kB\nMlocked: 2 kB\nSlab: 3 kB\nSReclaimable: 4 kB\n"
+               "SUnreclaim: much\nKernelStack: 6 kB\nSecPageTables: 8 kB\nPageTables: 7 kB\n");
+    EXPECT_EQ(workQueues.run("com.vandra.tamblo.memorylog"), 1U);
+    EXPECT_EQ(root.read("memory-log.jsonl"),
+              R"({"time":4.0,"reporter":-5,"processes":[],"kernel":{}})"
+              "\n"
+              R"({"time":4.0,"reporter":-5,"processes":[{"process":7,"name":"p7","resident":10240,)"
+              R"("peakResident":20480,"anonymous":5120,"file":3072,"shared":2048,"swapped":8192,)"
+              R"("locked":7168,"pageTables":6144,"threads":4}],"kernel":{"unevictable":1024,"locked":2048,)"
+              R"("slab":3072,"slabReclaimable":4096,"slabUnreclaimable":0,"pageTables":7168,)"
+              R"("kernelStack":6144}})"
+              "\n");
+}
+
+} // namespace
+} // namespace tamblo

@@ -1,0 +1,299 @@
+#include "platform/linux/device/BluetoothRecord.h"
+#include "platform/linux/device/LinuxAccessories.h"
+#include "platform/linux/device/LinuxClock.h"
+#include "platform/linux/device/LinuxDeviceConditions.h"
+#include "platform/linux/device/LinuxProcessInformation.h"
+#include "tests/platform/LinuxServiceSupport.h"
+
+#include <gmock/gmock.h>
+
+#include <cerrno>
+#include <chrono>
+#include <cstdlib>
+#include <cstring>
+#include <set>
+
+#include <sys/fsuid.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+// What is known of the device, from files such as the kernel and other daemons have them.
+
+namespace tamblo {
+namespace {
+
+using namespace std::chrono_literals;
+using testing::ElementsAre;
+using testing::IsEmpty;
+using testing::SizeIs;
+
+TEST(LinuxClockTest, TheOffsetIsThatOfTheZoneOfTheMoment) {
+    const char* before = ::getenv("TZ");
+    const std::string zone = before != nullptr ? before : "";
+    for (const auto& [name, offset] : {std::pair("ABC-5:45", 20'700), {"ABC3:30", -12'600}}) {
+        ::setenv("TZ", name, 1);
+        EXPECT_EQ(LinuxClock().utcOffset(WallTime()).count(), offset) << name;
+    }
+    before != nullptr ? ::setenv("TZ", zone.c_str(), 1) : ::unsetenv("TZ");
+    ::tzset();
+}
+
+const std::string kKey = "\n[LinkKey]\nKey=00112233445566778899AABBCCDDEEFF\nType=4\n";
+const std::string kIdentity = "[DeviceID]\nSource=1\nVendor=65535\nProduct=257\nVersion=515\n";
+const std::string kEarbud = "[General]\nName=Class=1\nAppearance=0x0941\n" + kIdentity + kKey;
+
+TEST(BluetoothRecordTest, TellsEarbudsAndTheirModel) {
+    for (const std::string general : {"Class=0x240404", "Class=0x240418\r", "Class=2360344",
+                                      "Appearance=0x0941", "Appearance=0x0941\nClass=0x000100",
+                                      "Appearance=0x0000\nClass=0x240418", "Appearance=-1\nClass=0x240418"}) {
+        EXPECT_TRUE(BluetoothRecord::parse("[General]\n" + general).isEarbud()) << general;
+    }
+    for (const std::string general : {"Class=0x24041c", "Class=0x240518", "Class=0x1240418", "Class=0x24041g",
+                                      "Appearance=0x0942\nClass=0x240418", "[Other]\nClass=0x240418"}) {
+        EXPECT_FALSE(BluetoothRecord::parse("[General]\n" + general).isEarbud()) << general;
+    }
+    const std::pair<std::string, std::string> models[] = {
+        {kIdentity, "bluetooth:ffff:0101:0203"},
+        {"[DeviceID]\nVersion=x\nProduct=0xFFFF\nVendor=1\nSource=2", "usb:0001:ffff:0000"},
+        {"[DeviceID]\nSource=9\nVendor=65536\nProduct=1", "unknown:0000:0001:0000"},
+        {"[DeviceID]\nSource=1\nVendor=0\nProduct=0", ""},
+        {"Vendor=7\n[DeviceID\nVendor=7\n=\n[]\n[", ""},
+    };
+    for (const auto& [text, model] : models) {
+        EXPECT_EQ(BluetoothRecord::parse(text).model(), model) << text;
+    }
+    for (const std::string section : {"LinkKey", "LongTermKey", "PeripheralLongTermKey", "Other"}) {
+        EXPECT_EQ(BluetoothRecord::parse("[" + section + "]\nKey=1").isPaired, section != "Other");
+    }
+}
+
+class LinuxAccessoriesTest : public testing::Test {
+protected:
+    LinuxAccessoriesTest() { directory.write("machine-id", "00112233445566778899aabbccddeeff\n"); }
+    void addDevice(const std::string& adapter, const std::string& device,
+                   const std::string& record = kEarbud) {
+        directory.write("bt/" + adapter + "/" + device + "/info", record);
+    }
+    static std::string address(int number) {
+        char text[18];
+        std::snprintf(text, sizeof text, "00:1B:66:AA:%02X:%02X", number / 256, number % 256);
+        return text;
+    }
+    [[nodiscard]] std::vector<Accessory> earbuds(const std::string& machine = "machine-id") {
+        return LinuxAccessories(log, directory.path("bt"), directory.path(machine)).connectedEarbuds();
+    }
+
+    TemporaryDirectory directory;
+    RecordingLog log;
+};
+
+TEST_F(LinuxAccessoriesTest, FindsPairedEarbudsEachOnce) {
+    EXPECT_THAT(earbuds(), IsEmpty());
+    addDevice(address(1), address(2));
+    addDevice(address(1), address(3), "[General]\nClass=0x240418\n" + kKey);
+    addDevice(address(1), address(4), "[General]\nAppearance=0x0941\n"); // was seen, never paired
+    addDevice(address(1), address(5), kEarbud + std::string(300'000, '\n'));
+    addDevice(address(9), address(2));
+    addDevice("cache", address(6));
+    addDevice(address(9), "cache");
+    directory.write("bt/" + address(8), "no directory");
+    const std::vector<Accessory> found = earbuds();
+    ASSERT_THAT(found, SizeIs(2));
+    EXPECT_EQ(found[0].model, "bluetooth:ffff:0101:0203");
+    EXPECT_EQ(found[1].model, "");
+    // SipHash-2-4 of the address: the same at every start, another on another machine, and on none.
+    EXPECT_EQ(found[0].identifier, "6880d6789892f418");
+    directory.write("other", "10112233445566778899aabbccddeeff");
+    EXPECT_THAT((std::set{found[0].identifier, found[1].identifier, earbuds("other")[0].identifier,
+                          earbuds("none")[0].identifier}),
+                SizeIs(4));
+    EXPECT_THAT(log.take(), IsEmpty());
+}
+
+TEST_F(LinuxAccessoriesTest, LooksAtSoManyAdaptersAndDevices) {
+    for (int i = 0; i < 260; ++i) {
+        addDevice(address(1), address(i));
+    }
+    EXPECT_THAT(earbuds(), SizeIs(256));
+    std::filesystem::remove_all(directory.path("bt"));
+    for (int i = 0; i < 10; ++i) {
+        addDevice(address(i), address(100 + i));
+    }
+    EXPECT_THAT(earbuds(), SizeIs(8));
+}
+
+TEST_F(LinuxAccessoriesTest, AClosedDirectoryIsToldOnce) {
+    addDevice(address(1), address(2));
+    ::chmod(directory.path("bt").c_str(), 0);
+    LinuxAccessories closed(log, directory.path("bt"), directory.path("machine-id"));
+    // The superuser, who may look everywhere, looks as nobody.
+    const int user = ::setfsuid(65534);
+    EXPECT_THAT(closed.connectedEarbuds(), IsEmpty());
+    EXPECT_THAT(closed.connectedEarbuds(), IsEmpty());
+    ::setfsuid(static_cast<uid_t>(user));
+    EXPECT_THAT(log.take(), ElementsAre("1 zrrz " + directory.path("bt") +
+                                        ": Permission denied; accessories are not known"));
+    ::chmod(directory.path("bt").c_str(), 0700);
+}
+
+/// Thermal zones in a directory in place of `/sys`. Words: `/NAME` begins a zone, `FILE=TEXT` is a file of
+/// it, `N:TYPE@TEMPERATURE` its trip point of that number.
+void makeZones(const TemporaryDirectory& root, const std::string& description) {
+    std::istringstream words(description);
+    std::string zone;
+    for (std::string word; words >> word;) {
+        if (word.front() == '/') {
+            zone = "class/thermal" + word + "/";
+        } else if (const std::size_t at = word.find('@'); at != std::string::npos) {
+            const std::size_t colon = word.find(':');
+            const std::string trip = zone + "trip_point_" + word.substr(0, colon);
+            root.write(trip + "_type", word.substr(colon + 1, at - colon - 1) + "\n");
+            root.write(trip + "_temp", word.substr(at + 1) + "\n");
+        } else {
+            const std::size_t equals = word.find('=');
+            root.write(zone + word.substr(0, equals), word.substr(equals + 1) + "\n");
+        }
+    }
+}
+
+TEST(LinuxDeviceConditionsTest, TheWorstTripPointReachedIsTheThermalState) {
+    const std::pair<const char*, int> cases[] = {
+        {"", 0},
+        {"/thermal_zone0 temp=59999 0:active@60000", 0},
+        {"/thermal_zone0 temp=60000 0:active@60000", 1},
+        {"/thermal_zone0 temp=60000 0:passive@60000", 2},
+        {"/thermal_zone0 temp=60000 0:hot@60000", 3},
+        {"/thermal_zone0 temp=60000 0:critical@60000", 3},
+        {"/thermal_zone0 temp=60000 0:other@50000", 0},
+        {"/thermal_zone0 temp=80000 0:critical@105000 1:passive@80000 2:active@50000", 2},
+        {"/thermal_zone0 temp=80000 0:active@50000 13:hot@80000", 3},
+        {"/thermal_zone0 temp=50 0:active@50 /thermal_zone1 temp=60 0:passive@60 /thermal_zone2 temp=1", 2},
+        {"/thermal_zone0 mode=disabled temp=60000 0:hot@60000", 0},
+        {"/thermal_zone0 temp=60000 0:hot@0 1:critical@-274000 2:passive@ 3:hot@5x 4:active@1", 1},
+        {"/thermal_zone0 0:hot@1 /thermal_zone1 temp= 0:hot@1 /thermal_zone2 temp=9x 0:hot@1", 0},
+        {"/cooling_device0 temp=60000 0:hot@60000", 0},
+    };
+    for (const auto& [zones, expected] : cases) {
+        const TemporaryDirectory root;
+        makeZones(root, zones);
+        EXPECT_EQ(LinuxDeviceConditions(root.path()).thermalState(), expected) << zones;
+    }
+}
+
+TEST(LinuxDeviceConditionsTest, OnlyTheSavingProfileIsLowPowerAndAReadingStandsForASecond) {
+    const TemporaryDirectory root;
+    std::chrono::steady_clock::time_point now{};
+    makeZones(root, "/thermal_zone0 temp=10 0:passive@50");
+    const LinuxDeviceConditions conditions(root.path(), [&now] { return now; });
+    bool isLow = false;
+    for (const std::string profile : {"", "low-power\n", "balanced\n", "low-power", "low-power-max\n"}) {
+        EXPECT_EQ(conditions.thermalState(), 0);
+        EXPECT_EQ(conditions.isLowPowerModeEnabled(), isLow) << profile;
+        root.write("firmware/acpi/platform_profile", profile);
+        now += 999ms;
+        EXPECT_EQ(conditions.isLowPowerModeEnabled(), isLow) << profile;
+        now += 1ms;
+        isLow = profile == "low-power\n" || profile == "low-power";
+        EXPECT_EQ(conditions.isLowPowerModeEnabled(), isLow) << profile;
+    }
+    root.write("class/thermal/thermal_zone0/temp", "50");
+    EXPECT_EQ(conditions.thermalState(), 0);
+    now += 1s;
+    EXPECT_EQ(conditions.thermalState(), 2);
+}
+
+/// The footprint, or minus the error's code.
+std::int64_t footprint(const LinuxProcessInformation& information) {
+    const auto result = information.physicalFootprint();
+    if (const auto* bytes = std::get_if<std::uint64_t>(&result)) {
+        return static_cast<std::int64_t>(*bytes);
+    }
+    const auto& error = std::get<ProcessInformation::QueryError>(result);
+    EXPECT_EQ(error.text, std::strerror(error.code));
+    return -error.code;
+}
+
+TEST(LinuxProcessInformationTest, TheFootprintIsWhatFilesCannotGiveBack) {
+    const std::pair<const char*, std::int64_t> cases[] = {
+        {"Name:\tx\nVmRSS:\t 99 kB\nRssAnon:\t   5 kB\nRssFile:\t 70 kB\nRssShmem:\t 2 kB\nVmSwap:\t 3 kB\n",
+         10 * 1024},
+        {"Name:\tx\nVmRSS:\t8388608 kB\nRssAnon:\t8388608 kB\n", 8LL << 30},
+        {"Name:\tRssAnon: 5 kB\nVmRSS:\t99 kB\n", -ENODATA},
+        {"Name:\tx\nVmRSS:\t99 kB\nRssAnon:", -ENODATA},
+        {"", -ENODATA},
+    };
+    const TemporaryDirectory root;
+    std::chrono::steady_clock::time_point now{};
+    const LinuxProcessInformation information(root.path(), [&now] { return now; });
+    EXPECT_EQ(footprint(information), -ENOENT);
+    for (const auto& [status, expected] : cases) {
+        root.write("self/status", status);
+        const std::int64_t before = footprint(information);
+        now += 99ms;
+        EXPECT_EQ(footprint(information), before) << status;
+        now += 1ms;
+        EXPECT_EQ(footprint(information), expected) << status;
+    }
+}
+
+class ProcessFilesTest : public testing::Test {
+protected:
+    TemporaryDirectory root;
+    const ProcessFiles files{root.path()};
+};
+
+/// Fields 3 to 24, each with its number in place of a value.
+const std::string kFields = "S 4 5 6 7 -8 9 10 11 12 13 140 15 16 17 18 19 20 21 22 23 24";
+
+TEST_F(ProcessFilesTest, UseIsReadBehindWhateverTheProcessCallsItself) {
+    const std::pair<std::string, bool> cases[] = {
+        {"7 (a) " + kFields + " 25\n", true},
+        {"7 (a b) S 1 (c)\n(d) " + kFields, true},
+        {"7 (a) " + kFields.substr(0, kFields.size() - 3), false},
+        {"7 " + kFields + " 25\n", false},
+        {"", false},
+        {") ", false},
+    };
+    const auto page = static_cast<std::uint64_t>(::sysconf(_SC_PAGESIZE));
+    const auto tick = std::chrono::microseconds(1'000'000 / ::sysconf(_SC_CLK_TCK));
+    root.write("7/task/7/status", "Name:\ta\nvoluntary_ctxt_switches:\t3\nnonvoluntary_ctxt_switches:\t5\n");
+    root.write("7/task/8/status", "Name:\tb\nvoluntary_ctxt_switches:\t30\nnonvoluntary_ctxt_switches:\t50");
+    root.write("7/task/9/status", "Name:\tc");
+    for (const auto& [stat, isRead] : cases) {
+        root.write("7/stat", stat);
+        const auto sample = files.sample(7);
+        ASSERT_EQ(sample.has_value(), isRead) << stat;
+        if (sample) {
+            EXPECT_EQ(sample->userTime, 140 * tick);
+            EXPECT_EQ(sample->systemTime, 15 * tick);
+            EXPECT_THAT(
+                (std::vector{sample->minorFaults, sample->majorFaults, sample->threads, sample->residentBytes,
+                             sample->voluntarySwitches, sample->involuntarySwitches}),
+                ElementsAre(10U, 12U, 20U, 24 * page, 33U, 55U));
+        }
+    }
+    EXPECT_FALSE(files.sample(6) || files.sample(0) || files.sample(-1));
+    EXPECT_TRUE(LinuxProcessSampling().sample(::getpid())) << "the kernel's own file is as those above";
+}
+
+TEST_F(ProcessFilesTest, NamesAreUtf8AndThreadsNumbersUpToTheLimit) {
+    for (const char* name : {"7", "12", "13", "self", "-3", "99999999999"}) {
+        root.write(std::string("7/task/") + name + "/comm", std::string("t") + name + "\n");
+    }
+    EXPECT_THAT(files.threads(7), testing::UnorderedElementsAre(7, 12, 13));
+    EXPECT_THAT(files.threads(7, 3), SizeIs(3));
+    EXPECT_THAT(files.threads(7, 2), SizeIs(2));
+    EXPECT_THAT(files.threads(8), IsEmpty());
+    EXPECT_EQ(files.threadName(7, 12), "t12");
+    EXPECT_EQ(files.threadName(7, 14), std::nullopt);
+    for (const auto& [comm, name] : {std::pair("0123456789abc\xE2\x82\n", "0123456789abc"),
+                                     {"a\xFF\x62\xC3\n", "a?b?"},
+                                     {"caf\xC3\xA9", "caf\xC3\xA9"}}) {
+        root.write("7/comm", comm);
+        EXPECT_EQ(files.name(7), name) << "cut within its last character, or no text at all";
+    }
+    EXPECT_FALSE(files.name(0) || files.name(8));
+}
+
+} // namespace
+} // namespace tamblo
