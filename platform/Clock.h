@@ -11,12 +11,16 @@ using WallTime = std::chrono::time_point<std::chrono::system_clock, std::chrono:
     return std::chrono::duration<double>(time.time_since_epoch()).count();
 }
 
-/// The time of day, on any thread. It may step backwards.
+/// The time, on any thread.
 class Clock {
 public:
     virtual ~Clock() = default;
-    /// Without blocking. Read once per message and passed down.
+    /// The time of day, which may step backwards. Without blocking. Read once per message and passed down.
     [[nodiscard]] virtual WallTime now() const noexcept = 0;
+    /// Time that only ever goes on, for how long something took.
+    [[nodiscard]] virtual std::chrono::steady_clock::time_point steadyNow() const noexcept {
+        return std::chrono::steady_clock::now();
+    }
     /// How far the device's local time is ahead of UTC at that time. May read the zone from the disk.
     [[nodiscard]] virtual std::chrono::seconds utcOffset(WallTime time) const = 0;
     /// Holds up the calling thread for that long.

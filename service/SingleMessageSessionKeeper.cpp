@@ -1,5 +1,6 @@
 #include "service/SingleMessageSessionKeeper.h"
 
+#include "base/WhileAlive.h"
 #include "session/ZRReportingSession.h"
 #include "util/AudioEvents.h"
 #include "util/Log.h"
@@ -11,21 +12,11 @@ namespace tamblo {
 
 namespace {
 
+constexpr std::chrono::milliseconds kReaperInterval{500};
+constexpr std::chrono::duration<double> kTimeout{5.0};
 constexpr ReporterID kSingleMessageReporterID = 1;
 
 } // namespace
-
-SingleMessageSessionKeeper::~SingleMessageSessionKeeper() {
-    std::unique_ptr<RepeatingTimer> reaper;
-    {
-        const std::lock_guard held(mutex_);
-        reaper = std::move(singleMessageSessionReaper_);
-    }
-    // Waits for a tick that has not taken the session; a tick that has is waited for below.
-    reaper.reset();
-    std::unique_lock held(mutex_);
-    reapEnded_.wait(held, [this] { return runningReaps_ == 0; });
-}
 
 SessionRef SingleMessageSessionKeeper::create() {
     log::standard(ZRReportingServiceDelegateCategory(), "Creating singleMessageSession");
@@ -38,74 +29,47 @@ SessionRef SingleMessageSessionKeeper::create() {
     return session;
 }
 
-SessionRef SingleMessageSessionKeeper::retrieve() {
-    const std::lock_guard held(mutex_);
+const SessionRef& SingleMessageSessionKeeper::retrieve() {
     if (singleMessageSession_ == nullptr) {
         singleMessageSession_ = create();
+        tickLater();
     }
-    if (singleMessageSessionReaper_ == nullptr) {
-        singleMessageSessionReaper_ = context_.platform().workQueues->makeRepeatingTimer(
-            kReaperInterval, [this] { reapSingleMessageSession(); });
-        singleMessageSessionReaper_->start();
-    }
-    singleMessageSessionLastRetrieved_ = context_.platform().clock->now();
+    singleMessageSessionLastRetrieved_ = context_.platform().clock->steadyNow();
     return singleMessageSession_;
 }
 
-void SingleMessageSessionKeeper::reapSingleMessageSession() {
-    // The reaper ends with this tick, from within, when it has done its work.
-    std::unique_ptr<RepeatingTimer> reaper;
-    const SessionRef session = takeIdleSession(reaper);
-    if (session == nullptr) {
-        return;
-    }
-    session->stop();
-    const std::lock_guard held(mutex_);
-    --runningReaps_;
-    reapEnded_.notify_all();
+void SingleMessageSessionKeeper::tickLater() {
+    singleMessageSessionReaper_ = context_.platform().workQueues->callAfter(
+        kReaperInterval, [&queue = context_.serverQueue(), keeper = weak_from_this()] {
+            queue.post(whileAlive(keeper, [](auto& alive) { alive.reapSingleMessageSession(); }),
+                       Pace::mayBlock);
+        });
 }
 
-SessionRef SingleMessageSessionKeeper::takeIdleSession(std::unique_ptr<RepeatingTimer>& reaper) {
-    const std::lock_guard held(mutex_);
-    if (singleMessageSession_ == nullptr || !singleMessageSessionLastRetrieved_) {
-        return nullptr;
+void SingleMessageSessionKeeper::reapSingleMessageSession() {
+    if (singleMessageSession_ == nullptr) {
+        return;
     }
+    // By the steady clock: a time of day that is set back does not keep the session.
     const std::chrono::duration<double> elapsed =
-        context_.platform().clock->now() - *singleMessageSessionLastRetrieved_;
+        context_.platform().clock->steadyNow() - singleMessageSessionLastRetrieved_;
     if (!(kTimeout < elapsed)) {
         log::debug(ZRReportingServiceDelegateCategory(),
                    "Not stopping singleMessageSession. elapsed={} timeout={}", elapsed.count(),
                    kTimeout.count());
-        return nullptr;
+        tickLater();
+        return;
     }
     log::info(ZRReportingServiceDelegateCategory(), "Stopping singleMessageSession after timeout={}",
               kTimeout.count());
-    if (singleMessageSessionReaper_ != nullptr) {
-        singleMessageSessionReaper_->invalidate();
-    }
-    reaper = std::move(singleMessageSessionReaper_);
-    ++runningReaps_;
-    return std::exchange(singleMessageSession_, nullptr);
+    stop();
 }
 
 void SingleMessageSessionKeeper::stop() {
-    SessionRef session;
-    std::unique_ptr<RepeatingTimer> reaper;
-    {
-        std::unique_lock held(mutex_);
-        session = std::exchange(singleMessageSession_, nullptr);
-        reaper = std::move(singleMessageSessionReaper_);
-        reapEnded_.wait(held, [this] { return runningReaps_ == 0; });
-    }
-    reaper.reset();
-    if (session != nullptr) {
+    singleMessageSessionReaper_.reset();
+    if (const SessionRef session = std::exchange(singleMessageSession_, nullptr)) {
         session->stop();
     }
-}
-
-SessionRef SingleMessageSessionKeeper::singleMessageSession() const {
-    const std::lock_guard held(mutex_);
-    return singleMessageSession_;
 }
 
 } // namespace tamblo

@@ -12,7 +12,10 @@
 namespace tamblo {
 
 ZRReportingService::ZRReportingService(Context& context, ExitProcess exit)
-    : context_(context), exitProcess_(exit), self_(this, [](ZRReportingService*) {}) {
+    : context_(context),
+      exitProcess_(exit),
+      singleMessages_(std::make_shared<SingleMessageSessionKeeper>(context)),
+      self_(this, [](ZRReportingService*) {}) {
     ZRReportingSystemMonitor::initializeWithQueue(context, context.serverQueue());
 }
 
@@ -172,7 +175,7 @@ void ZRReportingService::findReportingSessionsForIDs(std::span<const ReporterID>
     std::vector<SessionRef> active = getAllActiveReportingSessions();
     logReportingSessions();
     if (active.empty()) {
-        found.push_back(singleMessages_.retrieve());
+        found.push_back(singleMessages_->retrieve());
     } else {
         found.insert(found.end(), active.begin(), active.end());
     }
@@ -183,7 +186,7 @@ void ZRReportingService::shutDown(UniqueFunction<void()> completed) {
         [service = std::weak_ptr(self_), completed = std::move(completed)]() mutable {
             if (const auto held = service.lock()) {
                 held->endAllClients();
-                held->singleMessages_.stop();
+                held->singleMessages_->stop();
             }
             completed();
         },

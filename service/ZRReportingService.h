@@ -43,7 +43,7 @@ public:
     /// While it is off, lookups find nothing and messages are refused. No request changes it. Any thread.
     void setReportingEnabled(bool enabled) noexcept { reportingEnabled_ = enabled; }
     /// Null when there is none now.
-    [[nodiscard]] SessionRef singleMessageSession() const { return singleMessages_.singleMessageSession(); }
+    [[nodiscard]] SessionRef singleMessageSession() const { return singleMessages_->singleMessageSession(); }
 
     [[nodiscard]] const std::vector<ClientRef>& getAllClients() const override { return clients_; }
     [[nodiscard]] bool isReportingEnabled() const noexcept override { return reportingEnabled_; }
@@ -73,7 +73,7 @@ private:
     SessionRegistry sessions_;
     LeavingClients leaving_;
     bool areStopsQueued_ = false;
-    SingleMessageSessionKeeper singleMessages_{context_};
+    const std::shared_ptr<SingleMessageSessionKeeper> singleMessages_;
     /// Clients and queued work hold the service weakly, through this; it owns nothing.
     std::shared_ptr<ZRReportingService> self_;
 };

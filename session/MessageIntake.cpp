@@ -1,6 +1,5 @@
 #include "session/MessageIntake.h"
 
-#include "base/BoundedCache.h"
 #include "util/MessageKeys.h"
 
 #include <algorithm>
@@ -27,18 +26,16 @@ constexpr std::array<std::string_view, 3> kKeysOfTimes{ZRReportingInternalEventP
                                                        ZRReportingInternalEventSystemUptimeSec,
                                                        ZRReportingInternalEventEpochTime};
 
-const Value& audioTag(AudioEventCategory category, AudioEventType type) {
-    // One for each thread that does session work: the tags of a device's messages are few.
-    static thread_local BoundedCache<Value> tags;
+} // namespace
+
+const Value& AudioTags::of(AudioEventCategory category, AudioEventType type) {
     const std::uint64_t key = (std::uint64_t{1} << 48U) | (std::uint64_t{category} << 16U) | type;
-    return tags.get(key, [&] {
+    return tags_.get(key, [&] {
         std::string tag = ZRReportingUtilityCategoryString(category);
         tag += ZRReportingUtilityTypeString(type);
         return Value(tag);
     });
 }
-
-} // namespace
 
 void addMissingDates(Dictionary& payload, WallTime now) {
     const double seconds = secondsSince1970(now);
@@ -80,8 +77,8 @@ void removeWhiteSpaceFromKeys(Dictionary& payload) {
     payload = Dictionary::fromKeySet(KeySet::make(keys), values, places, kKeysAddedAfterwards);
 }
 
-void addAudioMessageTag(Dictionary& payload, AudioEventCategory category, AudioEventType type) {
-    payload.set(kAudioTagKey, audioTag(category, type));
+void addAudioMessageTag(Dictionary& payload, const Value& tag) {
+    payload.set(kAudioTagKey, tag);
 }
 
 void addAppName(Dictionary& payload, const Value& appName) {

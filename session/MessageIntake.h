@@ -1,5 +1,6 @@
 #pragma once
 
+#include "base/BoundedCache.h"
 #include "base/Dictionary.h"
 #include "platform/Clock.h"
 #include "util/AudioEvents.h"
@@ -16,8 +17,18 @@ void addMissingDates(Dictionary& payload, WallTime now);
 /// one that already has the underscore.
 void removeWhiteSpaceFromKeys(Dictionary& payload);
 
-/// Sets "audiotag" to the category's name followed by the type's.
-void addAudioMessageTag(Dictionary& payload, AudioEventCategory category, AudioEventType type);
+/// The tags that messages had of late, which are few: the category's name followed by the type's. One for all
+/// sessions, on the reporting server queue.
+class AudioTags {
+public:
+    [[nodiscard]] const Value& of(AudioEventCategory category, AudioEventType type);
+
+private:
+    BoundedCache<Value> tags_;
+};
+
+/// Sets "audiotag".
+void addAudioMessageTag(Dictionary& payload, const Value& tag);
 
 /// Sets the application's name where there is none, or "Unknown".
 void addAppName(Dictionary& payload, const Value& appName);

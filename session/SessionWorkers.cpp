@@ -21,18 +21,25 @@ void ZRReportingSession::startWorkersFromClasses(std::span<const WorkerClass* co
             makeWorker(*workerClass);
         }
     }
-    for (const Worker& worker :
-         inOrder(consumingMessageWorkers_, producingMessageWorkers_, messageWorkers_)) {
-        startWorker(worker);
-    }
+    forEachWorker(&WorkerRole::consumer, &WorkerRole::producer, [this](const Worker& worker) {
+        if (worker.instance->started()) {
+            return;
+        }
+        const std::optional<bool> answer = worker.instance->start();
+        worker.instance->setStarted(answer.value_or(true));
+        if (answer) {
+            log::debug(ZRReportingSessionCategory(),
+                       "ZRReportingSessionWorker action=start worker={} started={} reporterID={}",
+                       *worker.workerClass, yesOrNo(*answer), reporterID_);
+        }
+    });
 }
 
 void ZRReportingSession::makeWorker(const WorkerClass& workerClass) {
     log::debug(ZRReportingSessionCategory(),
                "Initializing ZRReportingSessionWorker. action=init worker={} reporterID={}", workerClass,
                reporterID_);
-    std::shared_ptr<ZRReportingSessionWorkerProtocol> instance =
-        workerClass.initWithSession(context_, shared_from_this());
+    auto instance = workerClass.initWithSession(context_, shared_from_this());
     if (instance == nullptr) {
         // Not remembered, so that the next start tries again.
         log::debug(ZRReportingSessionCategory(),
@@ -40,15 +47,7 @@ void ZRReportingSession::makeWorker(const WorkerClass& workerClass) {
                    workerClass, reporterID_);
         return;
     }
-    Worker worker{&workerClass, std::move(instance), nullptr};
-    worker.consumer = dynamic_cast<ZRReportingSessionWorkerConsumerProtocol*>(worker.instance.get());
-    if (workerClass.role.consumer && worker.consumer != nullptr) {
-        consumingMessageWorkers_.push_back(worker);
-    }
-    if (workerClass.role.producer) {
-        producingMessageWorkers_.push_back(worker);
-    }
-    messageWorkers_.push_back(std::move(worker));
+    messageWorkers_.push_back({&workerClass, std::move(instance)});
     log::debug(ZRReportingSessionCategory(), "ZRReportingSessionWorker action=added worker={} reporterID={}",
                workerClass, reporterID_);
 }
@@ -58,31 +57,30 @@ bool ZRReportingSession::hasWorkerOf(const WorkerClass& workerClass) const noexc
                        [&](const Worker& worker) { return worker.workerClass == &workerClass; });
 }
 
-void ZRReportingSession::startWorker(const Worker& worker) {
-    if (worker.instance->started()) {
-        return;
-    }
-    const std::optional<bool> answer = worker.instance->start();
-    worker.instance->setStarted(answer.value_or(true));
-    if (answer) {
-        log::debug(ZRReportingSessionCategory(),
-                   "ZRReportingSessionWorker action=start worker={} started={} reporterID={}",
-                   *worker.workerClass, yesOrNo(*answer), reporterID_);
-    }
+void ZRReportingSession::stopWorkers() {
+    forEachWorker(&WorkerRole::producer, &WorkerRole::consumer, [this](const Worker& worker) {
+        if (worker.instance->started()) {
+            worker.instance->stop();
+            worker.instance->setStarted(false);
+            log::debug(ZRReportingSessionCategory(),
+                       "ZRReportingSessionWorker action=stop worker={} reporterID={}", *worker.workerClass,
+                       reporterID_);
+        }
+    });
 }
 
-ZRReportingSession::Workers ZRReportingSession::inOrder(const Workers& first, const Workers& second,
-                                                        const Workers& third) {
-    Workers ordered;
-    for (const Workers* list : {&first, &second, &third}) {
-        for (const Worker& worker : *list) {
-            const auto isSame = [&](const Worker& other) { return other.instance == worker.instance; };
-            if (std::none_of(ordered.begin(), ordered.end(), isSame)) {
-                ordered.push_back(worker);
-            }
+void ZRReportingSession::deliver(const MessageRef& message) {
+    for (const Worker& worker : messageWorkers_) {
+        if (!worker.workerClass->role.consumer || !worker.instance->started() ||
+            (message->isRedundant && !worker.instance->handleRedundantMessages()) ||
+            !message->isFor(*worker.workerClass)) {
+            continue;
         }
+        worker.instance->handleMessage(message);
+        log::debug(ZRReportingSessionCategory(),
+                   "ZRReportingSessionWorker action=handleMessage worker={} reporterID={}",
+                   *worker.workerClass, reporterID_);
     }
-    return ordered;
 }
 
 } // namespace tamblo

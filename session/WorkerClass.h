@@ -17,8 +17,7 @@ struct WorkerRole {
 
 /// Describes one worker class. Its address is the class's identity: messages name their destinations by it.
 struct WorkerClass {
-    /// A worker for the session, or null when it refuses. A consumer's factory makes a
-    /// `ZRReportingSessionWorkerConsumerProtocol`.
+    /// A worker for the session, or null when it refuses.
     using Factory = std::shared_ptr<ZRReportingSessionWorkerProtocol> (*)(
         Context&, const std::shared_ptr<ZRReportingSession>&);
 

@@ -1,6 +1,5 @@
 #include "session/ZRReportingSession.h"
 
-#include "session/MessageIntake.h"
 #include "util/Log.h"
 #include "util/MessageKeys.h"
 #include "util/TraceEvents.h"
@@ -25,6 +24,7 @@ std::shared_ptr<ZRReportingSession> ZRReportingSession::initWithID(Context& cont
 ZRReportingSession::ZRReportingSession(Created, Context& context, ReporterID reporterID,
                                        std::vector<pid_t> processIdentifiers)
     : context_(context),
+      audioTags_(context.shared<intake::AudioTags>()),
       reporterID_(reporterID),
       processIdentifiers_(std::move(processIdentifiers)),
       appName_(ZRReportingUtilityRetrieveAppName(configuration_)) {}
@@ -48,12 +48,7 @@ void ZRReportingSession::updateConfigurationWithContentsOfConfiguration(const Di
     appName_ = ZRReportingUtilityRetrieveAppName(configuration_);
 }
 
-std::unique_lock<std::recursive_mutex> ZRReportingSession::monitor() {
-    return isSingleMessageSession_ ? std::unique_lock(mutex_) : std::unique_lock<std::recursive_mutex>();
-}
-
 void ZRReportingSession::start() {
-    const auto held = monitor();
     recordOwnMessage(AudioEventTypeStart, "start");
     log::info(ZRReportingSessionCategory(), "start called. reporterID={}", reporterID_);
     if (started_) {
@@ -67,7 +62,6 @@ void ZRReportingSession::start() {
 }
 
 void ZRReportingSession::stop() {
-    const auto held = monitor();
     recordOwnMessage(AudioEventTypeStop, "stop");
     log::debug(ZRReportingSessionCategory(), "stop called. reporterID={}", reporterID_);
     if (!started_) {
@@ -78,16 +72,7 @@ void ZRReportingSession::stop() {
     if (ZRReportingSessionMessage::sortMessages(messages_)) {
         lastMessages_.rebuild(messages_);
     }
-    for (const Worker& worker :
-         inOrder(producingMessageWorkers_, consumingMessageWorkers_, messageWorkers_)) {
-        if (worker.instance->started()) {
-            worker.instance->stop();
-            worker.instance->setStarted(false);
-            log::debug(ZRReportingSessionCategory(),
-                       "ZRReportingSessionWorker action=stop worker={} reporterID={}", *worker.workerClass,
-                       reporterID_);
-        }
-    }
+    stopWorkers();
     lastMessages_.clear();
     std::vector<MessageRef>().swap(messages_);
     totalMessageCount_ = 0;
@@ -118,7 +103,6 @@ void ZRReportingSession::record(MessageRef message) {
 }
 
 void ZRReportingSession::sendMessage(const MessageRef& message, ErrorReply reply) {
-    const auto held = monitor();
     ++totalMessageCount_;
     normalise(*message);
     emitTracePoint(context_, TraceEvent::sessionMessage);
@@ -142,23 +126,9 @@ void ZRReportingSession::normalise(ZRReportingSessionMessage& message) const {
     message.editPayload([&](Dictionary& payload) {
         intake::addMissingDates(payload, now);
         intake::removeWhiteSpaceFromKeys(payload);
-        intake::addAudioMessageTag(payload, message.category(), message.type());
+        intake::addAudioMessageTag(payload, audioTags_.of(message.category(), message.type()));
         intake::addAppName(payload, appName_);
     });
-}
-
-void ZRReportingSession::deliver(const MessageRef& message) {
-    for (const Worker& worker : consumingMessageWorkers_) {
-        if (!worker.consumer->started() ||
-            (message->isRedundant && !worker.consumer->handleRedundantMessages()) ||
-            !message->isFor(*worker.workerClass)) {
-            continue;
-        }
-        worker.consumer->handleMessage(message);
-        log::debug(ZRReportingSessionCategory(),
-                   "ZRReportingSessionWorker action=handleMessage worker={} reporterID={}",
-                   *worker.workerClass, reporterID_);
-    }
 }
 
 std::string ZRReportingSession::description() const {
@@ -177,7 +147,8 @@ void ZRReportingSession::removeWhiteSpaceFromKeys(ZRReportingSessionMessage& mes
 
 void ZRReportingSession::addAudioMessageTag(ZRReportingSessionMessage& message) {
     message.editPayload([&message](Dictionary& payload) {
-        intake::addAudioMessageTag(payload, message.category(), message.type());
+        auto& tags = Context::current().shared<intake::AudioTags>();
+        intake::addAudioMessageTag(payload, tags.of(message.category(), message.type()));
     });
 }
 

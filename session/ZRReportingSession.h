@@ -4,6 +4,7 @@
 #include "platform/Clock.h"
 #include "platform/ZRReportingServiceProtocol.h"
 #include "session/LastMessageIndex.h"
+#include "session/MessageIntake.h"
 #include "session/WorkerClass.h"
 #include "session/ZRReportingSessionMessage.h"
 #include "session/ZRReportingSessionWorkerProtocol.h"
@@ -11,7 +12,6 @@
 
 #include <cstdint>
 #include <memory>
-#include <mutex>
 #include <optional>
 #include <span>
 #include <string>
@@ -27,8 +27,7 @@ namespace tamblo {
 ///
 /// Owned by a client instance, the single-message session by the service. Created (the start-on-init workers
 /// run) → started (all workers run) → stopped (messages emptied, workers kept) → started again …; letting it
-/// go stops nothing. Used on the reporting server queue alone, except the single-message session, which the
-/// reaper's thread stops: that one locks itself, recursively, as producers send from its stop.
+/// go stops nothing. Used on the reporting server queue alone.
 class ZRReportingSession : public std::enable_shared_from_this<ZRReportingSession> {
     struct Created {
         explicit Created() = default;
@@ -47,7 +46,6 @@ public:
     [[nodiscard]] static std::span<const WorkerClass> getAllWorkerClasses() { return workerClassList(); }
 
     void setServiceType(AudioServiceType serviceType);
-    /// Before the session is shared with another thread.
     void setIsSingleMessageSession(bool isSingle) noexcept { isSingleMessageSession_ = isSingle; }
     void setClientProcessName(std::optional<std::string> name) { clientProcessName_ = std::move(name); }
     /// Adds the entries to the configuration, which is never replaced.
@@ -102,19 +100,24 @@ private:
     struct Worker {
         const WorkerClass* workerClass;
         std::shared_ptr<ZRReportingSessionWorkerProtocol> instance;
-        /// The same worker, for the consumers among them.
-        ZRReportingSessionWorkerConsumerProtocol* consumer;
     };
-    using Workers = std::vector<Worker>;
 
-    /// Held by the single-message session's operations; nothing for any other session.
-    [[nodiscard]] std::unique_lock<std::recursive_mutex> monitor();
     void startWorkersFromClasses(std::span<const WorkerClass* const> classes);
     void makeWorker(const WorkerClass& workerClass);
     [[nodiscard]] bool hasWorkerOf(const WorkerClass& workerClass) const noexcept;
-    void startWorker(const Worker& worker);
-    /// The workers of three lists, each worker once.
-    [[nodiscard]] static Workers inOrder(const Workers& first, const Workers& second, const Workers& third);
+    void stopWorkers();
+    /// Calls `act` with each worker once: those of the first role, then those of the second, then all others.
+    template <typename Act>
+    void forEachWorker(bool WorkerRole::*first, bool WorkerRole::*second, Act act) const {
+        for (const int turn : {0, 1, 2}) {
+            for (const Worker& worker : messageWorkers_) {
+                const WorkerRole& role = worker.workerClass->role;
+                if (turn == (role.*first ? 0 : role.*second ? 1 : 2)) {
+                    act(worker);
+                }
+            }
+        }
+    }
     /// Records a message of the session's own, which no worker is offered.
     void recordOwnMessage(AudioEventType type, std::string_view method);
     void record(MessageRef message);
@@ -122,6 +125,7 @@ private:
     void deliver(const MessageRef& message);
 
     Context& context_;
+    intake::AudioTags& audioTags_;
     const ReporterID reporterID_;
     const std::vector<pid_t> processIdentifiers_;
     bool started_ = false;
@@ -140,11 +144,7 @@ private:
     std::int64_t totalMessageCount_ = 0;
     std::size_t ownRecordCount_ = 0; ///< among the messages
 
-    Workers messageWorkers_;
-    Workers consumingMessageWorkers_;
-    Workers producingMessageWorkers_;
-
-    std::recursive_mutex mutex_;
+    std::vector<Worker> messageWorkers_; ///< as they were made
 };
 
 void appendText(std::string& out, const ZRReportingSession& session);

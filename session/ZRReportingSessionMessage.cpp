@@ -36,29 +36,13 @@ std::vector<double> sortTimes(const std::vector<MessageRef>& messages) {
 
 } // namespace
 
-Dictionary ZRReportingSessionMessage::message() const noexcept {
-    const std::lock_guard held(lock_);
-    return message_;
-}
-
-void ZRReportingSessionMessage::setMessage(Dictionary message) noexcept {
-    const std::lock_guard held(lock_);
-    // The old payload leaves with the argument, after the lock.
-    std::swap(message_, message);
-}
-
 DestinationWorkers ZRReportingSessionMessage::destinationWorkers() const {
-    const std::lock_guard held(lock_);
     return destinationWorkers_ != nullptr ? *destinationWorkers_ : DestinationWorkers{};
 }
 
 void ZRReportingSessionMessage::setDestinationWorkers(DestinationWorkers workers) {
-    std::unique_ptr<const DestinationWorkers> replacement;
-    if (!workers.empty()) {
-        replacement = std::make_unique<const DestinationWorkers>(std::move(workers));
-    }
-    const std::lock_guard held(lock_);
-    std::swap(destinationWorkers_, replacement);
+    destinationWorkers_ =
+        workers.empty() ? nullptr : std::make_unique<const DestinationWorkers>(std::move(workers));
 }
 
 bool ZRReportingSessionMessage::namesDestination(const WorkerClass& workerClass) const noexcept {

@@ -2,10 +2,8 @@
 
 #include "base/Dictionary.h"
 #include "util/AudioEvents.h"
-#include "util/SpinLock.h"
 
 #include <memory>
-#include <mutex>
 #include <string>
 #include <utility>
 #include <vector>
@@ -23,8 +21,8 @@ using DestinationWorkers = std::vector<const WorkerClass*>;
 /// message; the session's list and its workers share it, so it lives as long as one of them holds it. A
 /// session retains up to millions of them: keep it small.
 ///
-/// Changed only by the thread that does the session's work, under the record's lock. That thread may read the
-/// payload in place; any other takes a copy, which later changes do not reach.
+/// Used on the reporting server queue. What another thread is to work with is copied there first: the copy of
+/// a payload, or a copied record.
 class ZRReportingSessionMessage {
 public:
     ZRReportingSessionMessage(Dictionary message, AudioEventCategory category, AudioEventType type) noexcept
@@ -35,21 +33,18 @@ public:
     [[nodiscard]] AudioEventCategory category() const noexcept { return category_; }
     [[nodiscard]] AudioEventType type() const noexcept { return type_; }
 
-    /// The payload as it is now. Any thread.
-    [[nodiscard]] Dictionary message() const noexcept;
-    void setMessage(Dictionary message) noexcept;
-    /// The payload in place, for the thread that does the session's work.
+    /// A copy of the payload, which later changes do not reach.
+    [[nodiscard]] Dictionary message() const noexcept { return message_; }
+    void setMessage(Dictionary message) noexcept { message_ = std::move(message); }
+    /// The payload in place.
     [[nodiscard]] const Dictionary& payload() const noexcept { return message_; }
     /// Changes the payload in place; `edit` is given the dictionary.
-    template <typename Edit> void editPayload(Edit&& edit) {
-        const std::lock_guard held(lock_);
-        edit(message_);
-    }
+    template <typename Edit> void editPayload(Edit&& edit) { edit(message_); }
 
-    /// The only consumer workers that are to see the message; empty for all of them. Any thread.
+    /// The only consumer workers that are to see the message; empty for all of them.
     [[nodiscard]] DestinationWorkers destinationWorkers() const;
     void setDestinationWorkers(DestinationWorkers workers);
-    /// Whether a consumer worker of this class is to see it; for the thread that does the session's work.
+    /// Whether a consumer worker of this class is to see it.
     [[nodiscard]] bool isFor(const WorkerClass& workerClass) const noexcept {
         return destinationWorkers_ == nullptr || namesDestination(workerClass);
     }
@@ -75,9 +70,6 @@ public:
     bool isRedundant : 1 = false;
     /// The session had been started when the message came.
     bool isSessionStarted : 1 = false;
-
-private:
-    mutable SpinLock lock_;
 };
 
 static_assert(sizeof(ZRReportingSessionMessage) == 24, "a million of them are retained");

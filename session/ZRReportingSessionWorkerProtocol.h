@@ -11,9 +11,8 @@ namespace tamblo {
 
 class ZRReportingSession;
 
-/// One worker of one session. Made by its class's factory, owned by the session, and called on the thread
-/// that does the session's work (the reporting server queue, or the reaper's thread for the single-message
-/// session's stop). It holds its session weakly; a session may go without having been stopped, so whatever a
+/// One worker of one session. Made by its class's factory, owned by the session, and called on the reporting
+/// server queue. It holds its session weakly; a session may go without having been stopped, so whatever a
 /// worker registers elsewhere ends with the worker.
 class ZRReportingSessionWorkerProtocol {
 public:
@@ -36,6 +35,12 @@ public:
     /// Called only while started. A producer sends its derived messages from here, through the session.
     virtual void stop() {}
 
+    /// For consumers. One message, which other workers share; what goes wrong with it is the worker's own to
+    /// log.
+    virtual void handleMessage(const MessageRef&) {}
+    /// Whether messages that repeat the last one are offered, too.
+    [[nodiscard]] virtual bool handleRedundantMessages() const { return false; }
+
 protected:
     [[nodiscard]] Context& context() const noexcept { return context_; }
     [[nodiscard]] const Platform& platform() const noexcept { return context_.platform(); }
@@ -46,19 +51,9 @@ private:
     bool started_ = false;
 };
 
-/// A producer derives messages and sends them through its session; that is a matter of its class's role
-/// alone.
+/// A producer derives messages and sends them through its session, a consumer is offered the session's
+/// messages; which of these a worker is, its class's role says, and nothing else.
 using ZRReportingSessionWorkerProducerProtocol = ZRReportingSessionWorkerProtocol;
-
-/// A worker that is offered the session's messages.
-class ZRReportingSessionWorkerConsumerProtocol : public ZRReportingSessionWorkerProtocol {
-public:
-    using ZRReportingSessionWorkerProtocol::ZRReportingSessionWorkerProtocol;
-
-    /// One message, which other workers share. What goes wrong with it is the worker's own to log.
-    virtual void handleMessage(const MessageRef& message) = 0;
-    /// Whether messages that repeat the last one are offered, too.
-    [[nodiscard]] virtual bool handleRedundantMessages() const { return false; }
-};
+using ZRReportingSessionWorkerConsumerProtocol = ZRReportingSessionWorkerProtocol;
 
 } // namespace tamblo

@@ -130,52 +130,38 @@ TEST_F(ServiceTest, TheSingleMessageSessionLivesUntilItIsIdleForMoreThanFiveSeco
               "HostApplicationDisplayID=Unknown,started=1,singleMessageSession=1");
     EXPECT_EQ(session->messages().back()->payload().find("a")->integerValue(), 1);
     EXPECT_EQ(find(1), nullptr) << "it cannot be had by its ID";
-    ASSERT_EQ(device.workQueues.timers().size(), 1U);
-    EXPECT_EQ(device.workQueues.timers().front()->interval, milliseconds(500));
 
     device.clock.advance(milliseconds(4000));
     send(client, {});
     EXPECT_EQ(service->singleMessageSession(), session);
     device.clock.advance(milliseconds(5000));
+    device.clock.set(device.clock.now() - std::chrono::hours(24)); // it is the steady time that counts
+    haveStopsSendSummaries("Late");
     (void)serviceLines();
-    device.workQueues.tick();
+    (void)device.serverQueue().takePaces();
+    device.workQueues.elapse(milliseconds(499));
+    EXPECT_EQ(run(), 0U);
+    device.workQueues.elapse(milliseconds(1));
+    EXPECT_THAT(device.serverQueue().takePaces(), ElementsAre(Pace::mayBlock)) << "a stop waits for sinks";
+    (void)run();
     EXPECT_TRUE(session->started()) << "exactly 5 seconds";
     device.clock.advance(milliseconds(1));
-    device.workQueues.tick();
+    device.workQueues.elapse(milliseconds(500));
+    EXPECT_TRUE(session->started()) << "on the server queue";
+    (void)run();
     EXPECT_FALSE(session->started());
+    EXPECT_EQ(script.count("message Late 1/11"), 1U) << "workers stop as they do in any session";
     EXPECT_THAT(serviceLines(),
                 ElementsAre("d: Not stopping singleMessageSession. elapsed=5.000000 timeout=5.000000",
                             "i: Stopping singleMessageSession after timeout=5.000000"));
     EXPECT_EQ(service->singleMessageSession(), nullptr);
-    EXPECT_EQ(device.workQueues.runningTimers(), 0U) << "an idle service makes no wake-ups";
+    EXPECT_EQ(device.workQueues.delayedCalls(), 0U) << "an idle service makes no wake-ups";
 
     send(client, {});
     EXPECT_NE(service->singleMessageSession(), session);
     EXPECT_THAT(serviceLines(), testing::Contains("s: Creating singleMessageSession"));
-    EXPECT_EQ(device.workQueues.runningTimers(), 1U);
-}
-
-TEST_F(ServiceTest, TheReaperStopsWhileMessagesComeIn) {
-    const Connection client = connect(10);
-    haveStopsSendSummaries("Late");
-    std::atomic<bool> isDone{false};
-    std::thread reaper([&] {
-        while (!isDone) {
-            device.clock.advance(milliseconds(1200));
-            device.workQueues.tick();
-            std::this_thread::yield();
-        }
-    });
-    for (int i = 0; i < 2000; ++i) {
-        send(client, {}, {{"n", i}});
-    }
-    isDone = true;
-    reaper.join();
-    service->shutDown([] {});
-    (void)run();
-    EXPECT_EQ(script.count("stop Init"), device.log.count("Creating singleMessageSession"));
-    EXPECT_LE(script.count("message Init 14/11"), 2000U);
-    EXPECT_GE(script.count("message Init 14/11"), 1000U);
+    send(client, {});
+    EXPECT_EQ(device.workQueues.delayedCalls(), 1U);
 }
 
 TEST_F(ServiceTest, ALostClientIsRemovedOnceAndReportedOnce) {
@@ -243,7 +229,7 @@ TEST_F(ServiceTest, ShutDownWorksOffWhatIsQueuedThenStopsEverything) {
     EXPECT_THAT(service->getAllClients(), IsEmpty());
     EXPECT_FALSE(single->started());
     EXPECT_EQ(service->singleMessageSession(), nullptr);
-    EXPECT_EQ(device.workQueues.runningTimers(), 0U);
+    EXPECT_EQ(device.workQueues.delayedCalls(), 0U);
     first->invalidate();
     (void)run();
     EXPECT_EQ(device.log.count("removing 10 from the server client list"), 1U);
@@ -256,9 +242,14 @@ TEST_F(ServiceTest, ShutDownWorksOffWhatIsQueuedThenStopsEverything) {
 TEST_F(ServiceTest, DestroyingTheServiceEndsTheReaper) {
     const Connection client = connect(10);
     send(client, {});
-    EXPECT_EQ(device.workQueues.runningTimers(), 1U);
+    const SessionRef session = service->singleMessageSession();
+    EXPECT_EQ(device.workQueues.delayedCalls(), 1U);
+    device.clock.advance(milliseconds(5001));
+    device.workQueues.elapse(milliseconds(500)); // its work is on its way
     service.reset();
-    EXPECT_EQ(device.workQueues.runningTimers(), 0U);
+    (void)run();
+    EXPECT_TRUE(session->started()) << "dropped unstopped";
+    EXPECT_EQ(device.workQueues.delayedCalls(), 0U);
     const auto lines = device.log.lines();
     EXPECT_THAT(lines,
                 testing::Contains(testing::AllOf(testing::Field(&FakeLog::Line::text, "destroying service"),
