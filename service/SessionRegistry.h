@@ -42,17 +42,9 @@ private:
         }
         std::uint64_t seed;
     };
-    /// Almost always one client; more are in order of acceptance.
-    struct Holders {
-        Entry first;
-        std::vector<Entry> others;
-    };
 
-    static void put(Holders& holders, Entry entry);
-    /// Whether nobody is left.
-    static bool takeOut(Holders& holders, std::uint64_t clientOrder);
-
-    std::unordered_map<ReporterID, Holders, Hash> holders_;
+    /// Almost always one client holds an ID; more are in order of acceptance.
+    std::unordered_map<ReporterID, std::vector<Entry>, Hash> holders_;
     std::map<std::pair<std::uint64_t, ReporterID>, SessionRef> started_;
 };
 

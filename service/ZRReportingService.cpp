@@ -1,15 +1,65 @@
 #include "service/ZRReportingService.h"
 
-#include "service/ClientUptime.h"
+#include "base/WhileAlive.h"
 #include "service/ZRReportingClientServerInstance.h"
 #include "session/ZRReportingSession.h"
 #include "system/ZRReportingSystemMonitor.h"
 #include "util/Log.h"
 
 #include <algorithm>
+#include <chrono>
+#include <optional>
+#include <string>
 #include <utility>
 
 namespace tamblo {
+
+namespace {
+
+/// Seconds from the start to the end, either way round; −1 without a start.
+Value uptimeBetween(const std::optional<WallTime>& start, WallTime end, pid_t processIdentifier,
+                    const std::string& name) {
+    if (!start) {
+        log::standard(ZRReportingServiceDelegateCategory(),
+                      "clientStartDate is nil. clientpid={} clientprocessname={}", processIdentifier, name);
+        return -1;
+    }
+    if (*start > end) {
+        // The text says "past" for a start in the future; those who search the log know it so.
+        log::standard(ZRReportingServiceDelegateCategory(),
+                      "clientStartDate is in the past. clientpid={} clientprocessname={}", processIdentifier,
+                      name);
+    }
+    return std::chrono::duration<double>(std::chrono::abs(end - *start)).count();
+}
+
+/// Reports how long a client was connected, once its connection has ended for good, which was at `end`;
+/// `client` is null when it is gone already. Once for each client: its connection may end while the service
+/// shuts down. On the reporting server queue.
+void reportClientUptime(const Context& context, const ClientRef& client, pid_t processIdentifier,
+                        WallTime end) {
+    if (client != nullptr && !client->claimUptimeReport()) {
+        return;
+    }
+    const std::optional<std::string> knownName =
+        client != nullptr ? client->clientProcessName() : std::nullopt;
+    const std::string name = knownName.value_or("unknown");
+    const std::optional<WallTime> start = client != nullptr ? client->clientStartDate() : std::nullopt;
+    const Value uptime = uptimeBetween(start, end, processIdentifier, name);
+    log::standard(ZRReportingServiceDelegateCategory(),
+                  "invalidationHandler: connection exited process={} uptime_sec={}", name,
+                  uptime.integerValue());
+    if (!knownName) {
+        log::standard(ZRReportingServiceDelegateCategory(), "clientProcessName is nil. clientpid={}",
+                      processIdentifier);
+        return;
+    }
+    context.platform().analyticsEvents->sendEventLazy("com.vandra.tamblo.zrreportingclientuptime", [&] {
+        return Dictionary{{"processName", name}, {"seconds", uptime}};
+    });
+}
+
+} // namespace
 
 ZRReportingService::ZRReportingService(Context& context, ExitProcess exit)
     : context_(context),
@@ -31,13 +81,9 @@ bool ZRReportingService::shouldAcceptNewConnection(ClientConnection& connection)
     }
     const auto client = std::make_shared<ZRReportingClientServerInstance>(context_, processIdentifier, self_);
     connection.setExportedObject(client);
-    const auto addClientPiece = [service = std::weak_ptr(self_), client] {
-        if (const auto held = service.lock()) {
-            held->addClient(client);
-        }
-    };
     // The process's name is read from a file of the kernel's, which is memory.
-    context_.serverQueue().post(addClientPiece);
+    context_.serverQueue().post(
+        whileAlive(std::weak_ptr(self_), [client](auto& service) { service.addClient(client); }));
     setHandlers(connection, client);
     connection.resume();
     return true;
@@ -96,15 +142,13 @@ void ZRReportingService::queueFurtherStops() {
     if (leaving_.isEmpty() || std::exchange(areStopsQueued_, true)) {
         return;
     }
-    context_.serverQueue().post(
-        [service = std::weak_ptr(self_)] {
-            if (const auto held = service.lock()) {
-                held->leaving_.stopSome();
-                held->areStopsQueued_ = false;
-                held->queueFurtherStops();
-            }
-        },
-        Pace::mayBlock);
+    context_.serverQueue().post(whileAlive(std::weak_ptr(self_),
+                                           [](auto& service) {
+                                               service.leaving_.stopSome();
+                                               service.areStopsQueued_ = false;
+                                               service.queueFurtherStops();
+                                           }),
+                                Pace::mayBlock);
 }
 
 void ZRReportingService::sessionChanged(const ZRReportingClientServerInstance& client, ReporterID reporterID,

@@ -2,18 +2,68 @@
 
 #include "base/Value.h"
 #include "platform/ChanlogFacility.h"
-#include "system/ZRReportingIOChannelSubscription.h"
 
 #include <functional>
 #include <map>
 #include <memory>
+#include <optional>
 #include <string>
 #include <string_view>
+#include <utility>
 #include <vector>
 
 namespace tamblo {
 
 class ZRReportingSession;
+
+/// Names the channels of an audio driver: their group, their subgroup or both. Immutable, so any thread.
+class ZRReportingDriver {
+public:
+    using Name = std::optional<std::string>;
+
+    [[nodiscard]] static ZRReportingDriver driverWithGroupName(Name groupName, Name subGroupName) {
+        return {std::move(groupName), std::move(subGroupName)};
+    }
+
+    [[nodiscard]] const Name& groupName() const noexcept { return groupName_; }
+    [[nodiscard]] const Name& subGroupName() const noexcept { return subGroupName_; }
+    /// "group-subgroup", with "(null)" for a name that is missing. The driver's key in a snapshot.
+    [[nodiscard]] std::string description() const {
+        return groupName_.value_or("(null)") + "-" + subGroupName_.value_or("(null)");
+    }
+
+private:
+    ZRReportingDriver(Name groupName, Name subGroupName)
+        : groupName_(std::move(groupName)), subGroupName_(std::move(subGroupName)) {}
+
+    Name groupName_;
+    Name subGroupName_;
+};
+
+inline void appendText(std::string& out, const ZRReportingDriver& driver) {
+    out += driver.description();
+}
+
+/// The subscription to one driver's channels. Owned by the driver utility, for the life of the process.
+class ZRReportingIOChannelSubscription {
+public:
+    explicit ZRReportingIOChannelSubscription(ZRReportingDriver driver) : driver_(std::move(driver)) {}
+
+    void setSubscription(std::unique_ptr<ChanlogSubscription> subscription) noexcept {
+        subscription_ = std::move(subscription);
+    }
+
+    [[nodiscard]] const ZRReportingDriver& driver() const noexcept { return driver_; }
+    /// Both only once a subscription was set.
+    [[nodiscard]] ChanlogSubscription& subscription() const noexcept { return *subscription_; }
+    [[nodiscard]] const ChanlogChannels& subscribedChannels() const {
+        return subscription_->subscribedChannels();
+    }
+
+private:
+    ZRReportingDriver driver_;
+    std::unique_ptr<ChanlogSubscription> subscription_;
+};
 
 /// Samples the statistics channels of a fixed set of audio drivers, and turns what a session's time has added
 /// to them into messages of that session.

@@ -1,6 +1,7 @@
 #include "system/ZRReportingSystemMonitor.h"
 
 #include "base/Mutex.h"
+#include "base/WhileAlive.h"
 #include "util/Log.h"
 #include "util/MessageKeys.h"
 #include "util/ReportingUtilities.h"
@@ -161,11 +162,10 @@ void ZRReportingSystemMonitor::listenForFeatureStateChanges() {
     const auto held = systemMonitorDictionary_->lock();
     for (auto& [name, feature] : features_) {
         const auto registration = platform_.namedNotifications->RegisterNamedNotification(
-            feature.notification, queue_, [monitor = weak_from_this(), featureName = name](int token) {
-                if (const auto listening = monitor.lock()) {
-                    listening->featureChanged(featureName, token);
-                }
-            });
+            feature.notification, queue_,
+            whileAlive(weak_from_this(), [featureName = name](auto& monitor, int token) {
+                monitor.featureChanged(featureName, token);
+            }));
         feature.notifyToken = registration.token;
         log::standard(ZRReportingServiceDelegateCategory(), "notify setup result {} token {}",
                       registration.status, registration.token);
