@@ -33,7 +33,7 @@ LinuxDeviceProperties::LinuxDeviceProperties(std::string path, StructuredLog& lo
     : log_(log), file_(std::move(path)) {}
 
 std::optional<bool> LinuxDeviceProperties::booleanProperty(std::string_view name) const {
-    const std::lock_guard lock(mutex_);
+    const MutexLock lock(mutex_);
     struct stat status {};
     const bool exists = ::stat(file_.path().c_str(), &status) == 0;
     if (!exists || !isCurrent_ || !isSameState(status, status_)) {

@@ -1,10 +1,10 @@
 #pragma once
 
+#include "base/Mutex.h"
 #include "platform/DeviceProperties.h"
 #include "platform/StructuredLog.h"
 #include "platform/linux/settings/JsonFile.h"
 
-#include <mutex>
 #include <optional>
 #include <string>
 #include <string_view>
@@ -26,15 +26,16 @@ public:
     [[nodiscard]] std::optional<bool> booleanProperty(std::string_view name) const override;
 
 private:
-    void report(std::string_view name) const;
+    void report(std::string_view name) const TAMBLO_REQUIRES(mutex_);
 
     StructuredLog& log_;
-    mutable std::mutex mutex_; ///< guards what follows
-    mutable JsonFile file_;
-    mutable bool isCurrent_ = false;
-    mutable struct stat status_ {};
-    mutable std::optional<Dictionary> properties_;
-    mutable std::vector<std::string> reported_; ///< properties of this state of the file that are no booleans
+    mutable Mutex mutex_;
+    mutable JsonFile file_ TAMBLO_GUARDED_BY(mutex_);
+    mutable bool isCurrent_ TAMBLO_GUARDED_BY(mutex_) = false;
+    mutable struct stat status_ TAMBLO_GUARDED_BY(mutex_) {};
+    mutable std::optional<Dictionary> properties_ TAMBLO_GUARDED_BY(mutex_);
+    /// Properties of this state of the file that are no booleans.
+    mutable std::vector<std::string> reported_ TAMBLO_GUARDED_BY(mutex_);
 };
 
 } // namespace tamblo

@@ -81,7 +81,7 @@ NamedNotifications::Registration LinuxNamedNotifications::RegisterNamedNotificat
     if (const int status = checkName(name)) {
         return {status, 0};
     }
-    const std::lock_guard lock(mutex_);
+    const MutexLock lock(mutex_);
     do {
         lastToken_ = lastToken_ == std::numeric_limits<int>::max() ? 1 : lastToken_ + 1;
     } while (byToken_.contains(lastToken_));
@@ -93,7 +93,7 @@ NamedNotifications::Registration LinuxNamedNotifications::RegisterNamedNotificat
 NamedNotifications::State LinuxNamedNotifications::GetNamedNotificationState(int token) {
     std::string name;
     {
-        const std::lock_guard lock(mutex_);
+        const MutexLock lock(mutex_);
         const auto found = byToken_.find(token);
         if (found == byToken_.end()) {
             return {EBADF, 0};
@@ -110,7 +110,7 @@ NamedNotifications::State LinuxNamedNotifications::GetNamedNotificationState(int
 void LinuxNamedNotifications::reportUnreadable(const std::string& name, const std::string& content,
                                                std::string_view fault) {
     {
-        const std::lock_guard lock(mutex_);
+        const MutexLock lock(mutex_);
         if (fault.empty()) {
             reported_.erase(name);
             return;
@@ -142,7 +142,7 @@ int LinuxNamedNotifications::PostNamedNotification(std::string_view name) {
 
 void LinuxNamedNotifications::reportNotPosted(std::string_view name, int status) {
     {
-        const std::lock_guard lock(mutex_);
+        const MutexLock lock(mutex_);
         const auto known = notPosted_.find(name);
         if (status == 0) {
             if (known != notPosted_.end()) {
@@ -163,7 +163,7 @@ void LinuxNamedNotifications::reportNotPosted(std::string_view name, int status)
 void LinuxNamedNotifications::CancelNamedNotification(int token) {
     // Let go after the lock: what the handler holds may cancel another registration when it ends.
     std::shared_ptr<Registered> registered;
-    const std::lock_guard lock(mutex_);
+    const MutexLock lock(mutex_);
     const auto found = byToken_.find(token);
     if (found == byToken_.end()) {
         return;
@@ -193,7 +193,7 @@ void LinuxNamedNotifications::post(const std::shared_ptr<Registered>& registered
 void LinuxNamedNotifications::deliverPosts(const std::function<void()>& beforeDelivery) {
     watcher_.read([this, &beforeDelivery](std::optional<std::string_view> name) {
         beforeDelivery();
-        const std::lock_guard lock(mutex_);
+        const MutexLock lock(mutex_);
         auto [first, last] = name ? byName_.equal_range(*name) : std::pair(byName_.begin(), byName_.end());
         for (; first != last; ++first) {
             post(first->second);

@@ -1,5 +1,6 @@
 #pragma once
 
+#include "base/Mutex.h"
 #include "os/DirectoryWatcher.h"
 #include "platform/NamedNotifications.h"
 #include "platform/StructuredLog.h"
@@ -7,7 +8,6 @@
 #include <functional>
 #include <map>
 #include <memory>
-#include <mutex>
 #include <set>
 #include <string>
 #include <string_view>
@@ -66,14 +66,14 @@ private:
     /// Used by `deliverPosts` alone.
     DirectoryWatcher watcher_;
     int reportedError_ = 0;
-    std::mutex mutex_; ///< guards what follows
-    ByName byName_;
-    std::unordered_map<int, ByName::iterator> byToken_;
-    int lastToken_ = 0;
+    Mutex mutex_;
+    ByName byName_ TAMBLO_GUARDED_BY(mutex_);
+    std::unordered_map<int, ByName::iterator> byToken_ TAMBLO_GUARDED_BY(mutex_);
+    int lastToken_ TAMBLO_GUARDED_BY(mutex_) = 0;
     /// By name: the content and its fault as reported last.
-    std::map<std::string, std::string> reported_;
+    std::map<std::string, std::string> reported_ TAMBLO_GUARDED_BY(mutex_);
     /// The names whose last post failed.
-    std::set<std::string, std::less<>> notPosted_;
+    std::set<std::string, std::less<>> notPosted_ TAMBLO_GUARDED_BY(mutex_);
 };
 
 } // namespace tamblo

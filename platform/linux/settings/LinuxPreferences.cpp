@@ -82,7 +82,7 @@ std::optional<Value> LinuxPreferences::copyPreferenceValue(std::string_view key,
     if (!isDomainName(domain)) {
         return std::nullopt;
     }
-    const std::lock_guard lock(mutex_);
+    const MutexLock lock(mutex_);
     Domain& entry = domainNamed(domain);
     if (const Value* value = entry.unstored.find(key)) {
         return *value;
@@ -110,7 +110,7 @@ std::optional<std::string> LinuxPreferences::setPreferenceValue(std::string_view
     std::optional<std::string> failure;
     {
         // From before the file is read, so that no value stored meanwhile is lost.
-        const std::lock_guard lock(mutex_);
+        const MutexLock lock(mutex_);
         failure = store(path(domain), key, value);
         Domain& entry = domainNamed(domain);
         if (failure) {
@@ -130,7 +130,7 @@ void LinuxPreferences::readChanges() {
             return;
         }
         changed = true;
-        const std::lock_guard lock(mutex_);
+        const MutexLock lock(mutex_);
         if (!fileName) {
             for (auto& [name, domain] : domains_) {
                 domain.forgetFile();

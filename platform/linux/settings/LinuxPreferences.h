@@ -1,6 +1,7 @@
 #pragma once
 
 #include "base/Dictionary.h"
+#include "base/Mutex.h"
 #include "os/DirectoryWatcher.h"
 #include "platform/Preferences.h"
 #include "platform/StructuredLog.h"
@@ -9,7 +10,6 @@
 #include <atomic>
 #include <cstdint>
 #include <map>
-#include <mutex>
 #include <optional>
 #include <string>
 #include <string_view>
@@ -64,7 +64,7 @@ private:
     };
 
     void reportUnwatched();
-    [[nodiscard]] Domain& domainNamed(std::string_view name) const;
+    [[nodiscard]] Domain& domainNamed(std::string_view name) const TAMBLO_REQUIRES(mutex_);
 
     StructuredLog& log_;
     std::atomic<std::uint64_t> generation_{1};
@@ -72,8 +72,8 @@ private:
     /// Used by `readChanges` alone.
     DirectoryWatcher watcher_;
     int reportedError_ = 0;
-    mutable std::mutex mutex_;
-    mutable std::map<std::string, Domain, std::less<>> domains_; ///< guarded by `mutex_`
+    mutable Mutex mutex_;
+    mutable std::map<std::string, Domain, std::less<>> domains_ TAMBLO_GUARDED_BY(mutex_);
 };
 
 } // namespace tamblo

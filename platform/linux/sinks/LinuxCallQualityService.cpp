@@ -54,8 +54,10 @@ CallQualityService::SessionRef LinuxCallQualityService::CreateLinkmeterSession(c
 }
 
 void LinuxCallQualityService::StartConfiguration(const SessionRef&, Completion completion) {
-    std::call_once(isQueueMade_,
-                   [this] { queue_ = workQueues_.makeSerialQueue("com.vandra.tamblo.linkmeter.backends"); });
+    const MutexLock lock(mutex_);
+    if (queue_ == nullptr) {
+        queue_ = workQueues_.makeSerialQueue("com.vandra.tamblo.linkmeter.backends");
+    }
     queue_->post(
         [this, completion = std::move(completion)]() mutable {
             std::vector<std::string> names = backends_.read();

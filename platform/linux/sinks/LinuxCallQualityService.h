@@ -1,5 +1,6 @@
 #pragma once
 
+#include "base/Mutex.h"
 #include "platform/CallQualityService.h"
 #include "platform/Clock.h"
 #include "platform/WorkQueue.h"
@@ -9,7 +10,6 @@
 #include <atomic>
 #include <cstdint>
 #include <memory>
-#include <mutex>
 #include <optional>
 #include <string>
 
@@ -53,8 +53,8 @@ private:
     AppendOnlyFile file_;
     std::atomic<std::uint64_t> lastToken_{0};
     std::atomic<std::uint64_t> lastSession_{0};
-    std::once_flag isQueueMade_;
-    std::unique_ptr<SerialQueue> queue_;
+    Mutex mutex_;
+    std::unique_ptr<SerialQueue> queue_ TAMBLO_GUARDED_BY(mutex_);
     NamesPreference backends_; ///< the queue's
 };
 
