@@ -1,5 +1,6 @@
 #include "platform/linux/connections/LinuxConnectionService.h"
 #include "platform/linux/loop/LinuxWorkQueues.h"
+#include "tests/Sockets.h"
 #include "tests/platform/LinuxServiceSupport.h"
 #include "wire/Protocol.h"
 
@@ -13,7 +14,6 @@
 
 #include <sys/epoll.h>
 #include <sys/socket.h>
-#include <sys/un.h>
 
 namespace tamblo {
 namespace {
@@ -46,9 +46,7 @@ public:
 
 /// A connected client, which sees the end of its connection as an end of what it reads.
 FileDescriptor connectTo(const std::string& path) {
-    sockaddr_un address{};
-    address.sun_family = AF_UNIX;
-    path.copy(address.sun_path, sizeof address.sun_path - 1);
+    const sockaddr_un address = test::addressOf(path);
     FileDescriptor client(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
     EXPECT_EQ(::connect(client.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address), 0);
     return client;

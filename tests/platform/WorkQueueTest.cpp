@@ -5,6 +5,7 @@
 
 #include <algorithm>
 #include <atomic>
+#include <cctype>
 #include <chrono>
 #include <filesystem>
 #include <future>
@@ -27,6 +28,27 @@ void settle(SerialQueue& queue) {
     queue.post([&done] { done.set_value(); });
     ASSERT_EQ(done.get_future().wait_for(kPatience), std::future_status::ready);
 }
+
+/// The letters of the pieces that ran: as they are on the test's own thread, else as capitals.
+class Trace {
+public:
+    void add(char letter) {
+        const std::lock_guard lock(mutex_);
+        text_ += static_cast<char>(std::this_thread::get_id() == me_ ? letter : std::toupper(letter));
+    }
+    [[nodiscard]] auto step(char letter) {
+        return [this, letter] { add(letter); };
+    }
+    [[nodiscard]] std::string text() const {
+        const std::lock_guard lock(mutex_);
+        return text_;
+    }
+
+private:
+    const std::thread::id me_ = std::this_thread::get_id();
+    mutable std::mutex mutex_;
+    std::string text_;
+};
 
 TEST(SerialQueue, RunsWorkOfManyThreadsOneAtATimeInTheirOrderHoweverOftenItIsSuspended) {
     LinuxWorkQueues queues;
@@ -57,65 +79,44 @@ TEST(SerialQueue, RunsWorkOfManyThreadsOneAtATimeInTheirOrderHoweverOftenItIsSus
 }
 
 TEST(SerialQueue, QuickWorkIsDrainedByThePosterInOneBatch) {
+    Trace trace;
     LinuxWorkQueues queues;
     const auto queue = queues.makeSerialQueue("inline");
-    std::string trace;
-    const std::thread::id me = std::this_thread::get_id();
-    bool allHere = true;
-    queue->setBatchEnd([&] { trace += "|"; });
-    queues.threads().setRunEnd([&] { trace += "."; });
+    queue->setBatchEnd(trace.step('|'));
+    queues.threads().setRunEnd(trace.step('.'));
     queues.threads().beginWakeUp();
-    for (const char letter : {'a', 'b', 'c'}) {
-        queue->post([&, letter] {
-            trace += letter;
-            allHere = allHere && std::this_thread::get_id() == me;
-            if (letter == 'a') {
-                queue->post([&] { trace += 'd'; });
-            }
-        });
-    }
-    EXPECT_EQ(trace, "");
+    queue->post([&] {
+        trace.add('a');
+        queue->post(trace.step('c'));
+    });
+    queue->post(trace.step('b'));
+    EXPECT_EQ(trace.text(), "");
     queues.threads().endWakeUp();
-    EXPECT_EQ(trace, "abc|d|.");
-    EXPECT_TRUE(allHere);
+    EXPECT_EQ(trace.text(), "ab|c|.");
 }
 
 TEST(SerialQueue, WorkThatMayBlockLeavesThePosterAndTakesWhatFollowsAlong) {
     LinuxWorkQueues queues;
     for (const bool mayAllBlock : {false, true}) {
         const auto queue = queues.makeSerialQueue("hand over");
-        std::string trace;
-        std::vector<std::thread::id> threads;
-        std::promise<void> mayGoOn;
-        const std::future<void> goingOn = mayGoOn.get_future();
-        const auto step = [&](char letter) {
-            return [&, letter] {
-                trace += letter;
-                threads.push_back(std::this_thread::get_id());
-            };
-        };
-        {
-            queues.threads().beginWakeUp();
-            queue->post([&] {
-                step('a')();
-                queue->setMayBlock(mayAllBlock); // even what is posted already
-            });
-            queue->post(
-                [&] {
-                    (void)goingOn.wait_for(kPatience);
-                    step('b')();
-                },
-                mayAllBlock ? Pace::quick : Pace::mayBlock);
-            queue->post(step('c'));
-            queues.threads().endWakeUp(); // returns although b has not run
-            mayGoOn.set_value();
-        }
+        Trace trace;
+        std::latch mayGoOn(1);
+        queues.threads().beginWakeUp();
+        queue->post([&] {
+            trace.add('a');
+            queue->setMayBlock(mayAllBlock); // even what is posted already
+        });
+        queue->post(
+            [&] {
+                mayGoOn.wait();
+                trace.add('b');
+            },
+            mayAllBlock ? Pace::quick : Pace::mayBlock);
+        queue->post(trace.step('c'));
+        queues.threads().endWakeUp(); // returns although b has not run
+        mayGoOn.count_down();
         settle(*queue);
-        EXPECT_EQ(trace, "abc");
-        const std::thread::id me = std::this_thread::get_id();
-        EXPECT_EQ(threads[0], me);
-        EXPECT_NE(threads[1], me);
-        EXPECT_NE(threads[2], me);
+        EXPECT_EQ(trace.text(), "aBC");
     }
 }
 
@@ -173,18 +174,7 @@ TEST(SerialQueue, RunsNothingWhileItIsSuspendedAndAllOfItAfterwards) {
     LinuxWorkQueues queues;
     for (const bool isInline : {true, false}) {
         auto queue = queues.makeSerialQueue("suspended");
-        std::mutex mutex;
-        std::string trace;
-        const auto append = [&](char letter) {
-            return [&, letter] {
-                const std::lock_guard lock(mutex);
-                trace += letter;
-            };
-        };
-        const auto traced = [&] {
-            const std::lock_guard lock(mutex);
-            return trace;
-        };
+        Trace trace;
         std::promise<void> suspended;
         queue->setBatchEnd([&, isFirst = true]() mutable {
             if (std::exchange(isFirst, false)) {
@@ -197,19 +187,19 @@ TEST(SerialQueue, RunsNothingWhileItIsSuspendedAndAllOfItAfterwards) {
         queue->post([&] {
             queue->suspend();
             queue->suspend();
-            append('a')();
+            trace.add('a');
         });
-        queue->post(append('b')); // as a rule of the same batch
+        queue->post(trace.step('b')); // as a rule of the same batch
         queues.threads().endWakeUp();
         ASSERT_EQ(suspended.get_future().wait_for(kPatience), std::future_status::ready);
-        queue->post(append('c'), Pace::mayBlock);
+        queue->post(trace.step('c'), Pace::mayBlock);
         auto other = queues.makeSerialQueue("other");
         settle(*other);
-        EXPECT_EQ(traced(), "a");
+        EXPECT_EQ(trace.text(), isInline ? "a" : "A");
         other->post([&] { queue->resume(); });
         settle(*other);
         settle(*queue);
-        EXPECT_EQ(traced(), "abc");
+        EXPECT_EQ(trace.text(), isInline ? "aBC" : "ABC");
 
         queue->resume(); // of a queue that runs
         queue->suspend();
