@@ -17,7 +17,7 @@ SampleRecording::SampleRecording(std::span<const pid_t> processes, WallTime begi
 
 std::vector<pid_t> SampleRecording::nextTick() {
     std::vector<pid_t> wanted;
-    const std::lock_guard lock(mutex_);
+    const MutexLock lock(mutex_);
     if (std::any_of(recorded_.processes.begin(), recorded_.processes.end(),
                     [](const auto& process) { return process.samples.size() >= kMostSamples; })) {
         dropEveryOther();
@@ -34,7 +34,7 @@ std::vector<pid_t> SampleRecording::nextTick() {
 }
 
 void SampleRecording::add(pid_t pid, WallTime now, const std::optional<ProcessSample>& figures) {
-    const std::lock_guard lock(mutex_);
+    const MutexLock lock(mutex_);
     const auto process = std::find_if(recorded_.processes.begin(), recorded_.processes.end(),
                                       [pid](const auto& known) { return known.pid == pid; });
     if (process == recorded_.processes.end()) {
@@ -48,7 +48,7 @@ void SampleRecording::add(pid_t pid, WallTime now, const std::optional<ProcessSa
 }
 
 RecordedSamples SampleRecording::take(WallTime now) {
-    const std::lock_guard lock(mutex_);
+    const MutexLock lock(mutex_);
     recorded_.end = withoutStepsBack(now);
     RecordedSamples taken;
     std::swap(taken, recorded_);

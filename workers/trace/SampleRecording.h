@@ -1,12 +1,12 @@
 #pragma once
 
+#include "base/Mutex.h"
 #include "platform/Clock.h"
 #include "platform/ProcessSampling.h"
 
 #include <cstddef>
 #include <cstdint>
 #include <memory>
-#include <mutex>
 #include <optional>
 #include <span>
 #include <vector>
@@ -60,15 +60,15 @@ public:
     [[nodiscard]] RecordedSamples take(WallTime now);
 
 private:
-    [[nodiscard]] WallTime withoutStepsBack(WallTime now) noexcept;
-    void dropEveryOther();
+    [[nodiscard]] WallTime withoutStepsBack(WallTime now) noexcept TAMBLO_REQUIRES(mutex_);
+    void dropEveryOther() TAMBLO_REQUIRES(mutex_);
 
-    std::mutex mutex_; ///< guards what follows
-    RecordedSamples recorded_;
-    WallTime last_;
-    WallTime::duration stepsBack_{0}; ///< of the clock, altogether
-    std::uint64_t tick_ = 0;
-    std::uint64_t ticksPerSample_ = 1;
+    Mutex mutex_;
+    RecordedSamples recorded_ TAMBLO_GUARDED_BY(mutex_);
+    WallTime last_ TAMBLO_GUARDED_BY(mutex_);
+    WallTime::duration stepsBack_ TAMBLO_GUARDED_BY(mutex_){0}; ///< of the clock, altogether
+    std::uint64_t tick_ TAMBLO_GUARDED_BY(mutex_) = 0;
+    std::uint64_t ticksPerSample_ TAMBLO_GUARDED_BY(mutex_) = 1;
 };
 
 } // namespace tamblo
