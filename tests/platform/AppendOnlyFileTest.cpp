@@ -4,11 +4,9 @@
 
 #include <gmock/gmock.h>
 
-#include <atomic>
 #include <future>
 #include <memory>
 #include <new>
-#include <optional>
 #include <thread>
 
 #include <sys/stat.h>
@@ -54,26 +52,22 @@ protected:
 };
 
 TEST_F(AppendOnlyFileTest, IsWrittenWithTheOthersUnlessItsOwnerDoesIt) {
-    std::optional<AppendOnlyFile> first, second, own;
-    first.emplace(sinks_, "first", "zrrs");
-    second.emplace(sinks_, "second", "zrrs");
-    own.emplace(sinks_, "own", "zrrs", AppendOnlyFile::Flushed::byOwner);
-    sinks_.flush();
-    for (auto* file : {&first, &second, &own}) {
-        append(**file, "a");
+    AppendOnlyFile first(sinks_, "first", "zrrs");
+    AppendOnlyFile own(sinks_, "own", "zrrs", AppendOnlyFile::Flushed::byOwner);
+    {
+        AppendOnlyFile second(sinks_, "second", "zrrs");
+        for (AppendOnlyFile* file : {&first, &own, &second}) {
+            append(*file, "a");
+        }
+        sinks_.flush();
+        sinks_.flush();
+        EXPECT_EQ(operations_.writes, 2) << "one for each, and none where nothing waits";
+        EXPECT_EQ(directory_.read("first") + directory_.read("own") + directory_.read("second"), "a\na\n");
+        append(second, "b");
     }
+    append(first, "b");
     sinks_.flush();
-    sinks_.flush();
-    EXPECT_EQ(directory_.read("first") + directory_.read("second") + directory_.read("own"), "a\na\n");
-    EXPECT_EQ(operations_.writes, 2) << "one for each, and none where nothing waits";
-    append(*first, "b");
-    first.reset();
-    sinks_.flush();
-    append(*second, "b");
-    sinks_.flush();
-    own.reset();
-    EXPECT_EQ(directory_.read("first") + directory_.read("second") + directory_.read("own"),
-              "a\nb\na\nb\na\n");
+    EXPECT_EQ(directory_.read("first") + directory_.read("own") + directory_.read("second"), "a\nb\na\nb\n");
 }
 
 /// Who finds nothing waiting may let replies go: not before the lines of another thread are written.
@@ -85,19 +79,15 @@ TEST_F(AppendOnlyFileTest, AFlushWaitsForTheOneThatIsWriting) {
         mayGoOn.get_future().wait();
     };
     append(*file, "one");
-    std::thread writer([&file] { file->flush(); });
+    const auto writer = std::async(std::launch::async, [&file] { file->flush(); });
     isWriting.get_future().wait();
-    std::atomic<bool> isFlushed{false};
-    std::thread other([&] {
+    auto other = std::async(std::launch::async, [this] {
         sinks_.flush();
-        isFlushed = true;
-        EXPECT_EQ(directory_.read("sink.jsonl"), "one\n");
+        return directory_.read("sink.jsonl");
     });
-    std::this_thread::sleep_for(std::chrono::milliseconds(20));
-    EXPECT_FALSE(isFlushed);
+    EXPECT_EQ(other.wait_for(std::chrono::milliseconds(20)), std::future_status::timeout);
     mayGoOn.set_value();
-    writer.join();
-    other.join();
+    EXPECT_EQ(other.get(), "one\n");
 }
 
 TEST_F(AppendOnlyFileTest, WritesABatchWithOneCallAndALargeOneByItself) {

@@ -416,7 +416,8 @@ TEST_F(StackCaptureTest, AProcessWithTooManyThreadsLeavesTheOthersTheirs) {
     capture();
     run();
     std::map<std::size_t, int> processesByThreads;
-    for (const auto& process : nlohmann::json::parse(lines())["stacks"]) {
+    const auto line = nlohmann::json::parse(lines());
+    for (const auto& process : line["stacks"]) {
         ++processesByThreads[process["threads"].size()];
     }
     EXPECT_EQ(processesByThreads,

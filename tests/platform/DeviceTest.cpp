@@ -196,9 +196,11 @@ TEST(LinuxDeviceConditionsTest, OnlyTheSavingProfileIsLowPowerAndAReadingStandsF
         isLow = profile == "low-power\n" || profile == "low-power";
         EXPECT_EQ(conditions.isLowPowerModeEnabled(), isLow) << profile;
     }
-    root.write("class/thermal/thermal_zone0/temp", "50");
     EXPECT_EQ(conditions.thermalState(), 0);
-    now += 1s;
+    root.write("class/thermal/thermal_zone0/temp", "50");
+    now += 999ms;
+    EXPECT_EQ(conditions.thermalState(), 0);
+    now += 1ms;
     EXPECT_EQ(conditions.thermalState(), 2);
 }
 
