@@ -7,16 +7,12 @@
 
 #include <algorithm>
 #include <cstddef>
-#include <filesystem>
-#include <fstream>
 #include <mutex>
-#include <sstream>
 #include <string>
 #include <utility>
 #include <vector>
 
 #include <poll.h>
-#include <stdlib.h>
 
 namespace tamblo {
 
