@@ -112,7 +112,7 @@ TEST_F(RtcWorkerTest, SetsUpThenSendsInOrderWhateverComesOfIt) {
         {"what is handed in meanwhile follows", "start 1 run 2 run", "+/1", "s"},
         {"back ends at the last moment", "start 1 run 2 run stop run 8999ms found 9000ms run", "12s[1,2]f/0",
          "ssss"},
-        {"no back ends", "start 1 run 2 run stop run none run", "/0", "sesssss"},
+        {"no back ends", "start 1 run 2 run stop run none run", "+/0", "sesssss"},
         {"none, and too late", "start 1 run 2 run stop run 9000ms none run", "/0", "sesssss"},
         {"found too late, but before what waited has run", "start 1 run stop run 9000ms found run", "/0",
          "ssss"},
