@@ -1,10 +1,10 @@
 #include "workers/accessories/ZRReportingSessionAudioRegistrationWorker.h"
 
 #include "base/Dictionary.h"
-#include "base/Mutex.h"
 #include "util/Log.h"
 #include "workers/accessories/AccessoryRegistry.h"
 
+#include <atomic>
 #include <chrono>
 #include <memory>
 #include <optional>
@@ -24,29 +24,9 @@ constexpr std::string_view kKey = "registered";
 constexpr std::chrono::minutes kLookupInterval{1};
 
 /// The lookups of all sessions, of which there is one at a time.
-class Lookups {
-public:
-    /// False when it is not the time for one.
-    [[nodiscard]] bool begin(WallTime now) {
-        const MutexLock lock(mutex_);
-        // A clock that was set back does not put the next lookup off.
-        const bool isRecent = last_ && *last_ <= now && now - *last_ < kLookupInterval;
-        if (isRecent || isUnderWay_) {
-            return false;
-        }
-        last_ = now;
-        isUnderWay_ = true;
-        return true;
-    }
-    void end() {
-        const MutexLock lock(mutex_);
-        isUnderWay_ = false;
-    }
-
-private:
-    Mutex mutex_;
-    std::optional<WallTime> last_ TAMBLO_GUARDED_BY(mutex_);
-    bool isUnderWay_ TAMBLO_GUARDED_BY(mutex_) = false;
+struct Lookups {
+    std::optional<WallTime> last; ///< when it began; for the thread that does the sessions' work
+    std::atomic<bool> isUnderWay{false};
 };
 
 void send(Context& context, std::vector<Dictionary> reports) {
@@ -90,13 +70,17 @@ std::optional<bool> ZRReportingSessionAudioRegistrationWorker::start() {
         return true;
     }
     auto& lookups = context().shared<Lookups>();
-    if (lookups.begin(device.clock->now())) {
+    const WallTime now = device.clock->now();
+    // A clock that was set back does not put the next lookup off.
+    const bool isRecent = lookups.last && *lookups.last <= now && now - *lookups.last < kLookupInterval;
+    if (!isRecent && !lookups.isUnderWay.exchange(true)) {
+        lookups.last = now;
         // A queue for one piece, which runs after the queue is gone: at most once a minute, none is kept.
         device.workQueues->makeSerialQueue("com.vandra.tamblo.accessories")
             ->post(
                 [&context = context(), &lookups] {
                     lookUp(context);
-                    lookups.end();
+                    lookups.isUnderWay = false;
                 },
                 Pace::mayBlock);
     }
