@@ -12,6 +12,7 @@
 
 #include <fcntl.h>
 #include <poll.h>
+#include <sys/prctl.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -79,6 +80,7 @@ void ServiceProcess::start() {
     pollfd ready{.fd = boundSocket(SOCK_DGRAM, directory_.path("ready")), .events = POLLIN, .revents = 0};
     pid_ = ::fork();
     if (pid_ == 0) {
+        ::prctl(PR_SET_PDEATHSIG, SIGKILL);
         ::setenv("RUNTIME_DIRECTORY", runtimeDirectory().c_str(), 1);
         ::setenv("CONFIGURATION_DIRECTORY", directory_.path("config").c_str(), 1);
         ::setenv("LOGS_DIRECTORY", logs().c_str(), 1);
