@@ -5,7 +5,6 @@
 #include "os/FileDescriptor.h"
 #include "tools/Command.h"
 #include "tools/Payload.h"
-#include "tools/RecordFilter.h"
 #include "tools/ServiceConnection.h"
 #include "tools/SinkFile.h"
 #include "wire/Directories.h"

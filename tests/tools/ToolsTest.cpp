@@ -2,7 +2,6 @@
 #include "tests/client/FakeService.h"
 #include "tests/platform/LinuxServiceSupport.h"
 #include "tools/Payload.h"
-#include "tools/RecordFilter.h"
 #include "tools/ServiceConnection.h"
 #include "tools/SessionPlayer.h"
 #include "tools/SinkFile.h"
