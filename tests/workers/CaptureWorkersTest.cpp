@@ -1,4 +1,3 @@
-#include "tests/base/AllocationCount.h"
 #include "tests/workers/WorkerTest.h"
 #include "workers/sinks/ZRReportingSessionDPWorker.h"
 #include "workers/sinks/ZRReportingSessionQuilletWorker.h"
@@ -11,9 +10,7 @@ namespace tamblo {
 namespace {
 
 using namespace std::chrono_literals;
-using testing::ElementsAre;
-using testing::IsEmpty;
-using testing::SizeIs;
+using testing::ElementsAreArray;
 
 constexpr const char* kLastRun = "TalvixInvalidXyQLTlastRun";
 constexpr const char* kSize = "smallest_buffer_frame_size";
@@ -29,10 +26,7 @@ protected:
 
 class QuilletWorkerTest : public CaptureTest {
 protected:
-    QuilletWorkerTest() {
-        prefer("TalvixInvalidXyBackOffSeconds", "60.5 s");
-        device.clock.advance(500ms);
-    }
+    QuilletWorkerTest() { prefer("TalvixInvalidXyBackOffSeconds", "60.5 s"); }
     /// How many drafts a message now makes, by its time after the first one's.
     std::size_t draftsOf(double offset, const std::string& key = "tvac_invalid_x") {
         const std::size_t before = device.bugReportDrafting.requests.size();
@@ -42,39 +36,28 @@ protected:
     void arm() {
         worker = tryToMake<ZRReportingSessionQuilletWorker>();
         EXPECT_EQ(draftsOf(0.0), 0U);
-        device.log.clear();
     }
-    Value lastRun() {
-        return device.preferences.copyPreferenceValue(kLastRun, "com.vandra.tamblo.zrreporting")
-            .value_or("none");
+    bool isTimeKept() {
+        return device.preferences.copyPreferenceValue(kLastRun, "com.vandra.tamblo.zrreporting") ==
+               Value(device.clock.seconds());
     }
 
     std::shared_ptr<ZRReportingSessionQuilletWorker> worker;
 };
 
-TEST_F(QuilletWorkerTest, LooksAtMessagesFiveSecondsAfterTheFirst) {
-    for (const double offset : {5.0, 5.1}) {
-        for (const char* key : {"tvac_invalid_x", "Tvac_invalid_x"}) {
-            device.preferences.remove(kLastRun, "com.vandra.tamblo.zrreporting");
-            arm();
-            const bool isDrafted = offset > 5 && *key == 't';
-            EXPECT_EQ(draftsOf(offset, key), isDrafted ? 1U : 0U) << offset << key;
-            EXPECT_EQ(lastRun(), isDrafted ? Value(1772366400.5) : Value("none"));
-        }
-    }
-}
-
-TEST_F(QuilletWorkerTest, DraftsOnceInARunAndOnceInABackOffPeriod) {
+TEST_F(QuilletWorkerTest, DraftsFiveSecondsAfterTheFirstMessageOnceInARunAndInABackOffPeriod) {
     arm();
-    EXPECT_EQ(draftsOf(6.0), 1U);
+    EXPECT_EQ(draftsOf(5.0), 0U);
+    EXPECT_EQ(draftsOf(5.1, "Tvac_invalid_x"), 0U);
+    EXPECT_FALSE(isTimeKept());
+    EXPECT_EQ(draftsOf(5.1), 1U);
+    EXPECT_TRUE(isTimeKept());
     EXPECT_EQ(draftsOf(7.0), 0U);
-    const auto& [draft, process, reason, completion] = device.bugReportDrafting.requests.front();
-    EXPECT_EQ(process, "caller");
-    completion("no disk");
+    EXPECT_EQ(device.bugReportDrafting.requests.front().processName, "caller");
+    (void)logged(ZRReportingSessionCategory());
+    device.bugReportDrafting.requests.front().completion("no disk");
+    EXPECT_EQ(loggedLevels(ZRReportingSessionCategory()), "e");
     worker->stop();
-    EXPECT_THAT(logged(ZRReportingSessionCategory()),
-                ElementsAre("s Starting quillet for TalvixXYerrorMessage reporterID=5",
-                            "e Error creating draft - no disk"));
     device.clock.advance(60'499ms);
     EXPECT_EQ(draftsOf(70.0), 0U);
     device.clock.advance(1ms);
@@ -87,15 +70,15 @@ TEST_F(QuilletWorkerTest, DraftsEvenWhenTheTimeCannotBeStoredOrTheSessionIsGone)
     device.preferences.writeFailure = "disk full";
     arm();
     session.reset();
+    (void)logged(ZRReportingSessionCategory());
     // Without a period, a run still has one draft; each message of interest moves the time on.
     for (const std::size_t drafts : {1U, 0U}) {
         device.clock.advance(1s);
         EXPECT_EQ(draftsOf(6.0), drafts);
-        EXPECT_EQ(lastRun(), Value(device.clock.seconds()));
+        EXPECT_TRUE(isTimeKept());
     }
     EXPECT_EQ(device.bugReportDrafting.requests.front().processName, "");
-    EXPECT_EQ(loggedLevels(ZRReportingSessionCategory()), "iees")
-        << "the session's end, the rubbish, the disk, the draft";
+    EXPECT_EQ(loggedLevels(ZRReportingSessionCategory()), "ees") << "the rubbish, the disk, the draft";
 }
 
 class DPWorkerTest : public CaptureTest {
@@ -129,11 +112,9 @@ TEST_F(DPWorkerTest, CapturesOverloadsOfLargeBuffersAndCycles) {
         {"64", 0, {{kSize, "64"}}, true},
         {-1, 0, {}, true},
         {1, 0, {}, false},
-        {std::int64_t{1} << 40, 0, {{kSize, INT32_MAX}}, true},
-        {1, 0, {{kSize, std::int64_t{1} << 32}}, true},
+        {std::int64_t{1} << 40, 0, {{kSize, std::int64_t{1} << 32}}, true},
         {1, 3, {{kSize, 1}, {kCycle, 2}}, false},
         {1, 3, {{kSize, 1}, {kCycle, 3}}, true},
-        {1, 3, {{kSize, 1}}, false},
         {1, -1, {{kSize, 1}, {kCycle, -2}}, false},
     };
     for (const auto& [leastSize, leastCycle, payload, isToBeCaptured] : cases) {
@@ -144,7 +125,7 @@ TEST_F(DPWorkerTest, CapturesOverloadsOfLargeBuffersAndCycles) {
     }
 }
 
-TEST_F(DPWorkerTest, RequestsTheCapturePostsItAndTheNextMoreThanTenSecondsLater) {
+TEST_F(DPWorkerTest, NamesTheApplicationAndWaitsForMoreThanTenSeconds) {
     const auto worker = tryToMake<Worker>();
     Dictionary payload = overload;
     payload.set("HostApplicationDisplayID", "com.a");
@@ -155,26 +136,11 @@ TEST_F(DPWorkerTest, RequestsTheCapturePostsItAndTheNextMoreThanTenSecondsLater)
     device.clock.advance(500ms);
     EXPECT_TRUE(isCaptured(*worker, overload));
     const auto& requests = device.diagnosticCapture.requests;
-    EXPECT_EQ(requests[0].requester, "com.vandra.tamblo");
-    EXPECT_EQ(requests[0].captureType, "AudioOverloads");
     EXPECT_EQ(requests[0].payload, payload);
-    EXPECT_THAT(requests[0].options, ElementsAre(1, 1, 0, 0, 0));
     EXPECT_EQ(requests[0].reason, "com.a");
     EXPECT_EQ(requests[1].reason, "(null)");
-    EXPECT_THAT(device.namedNotifications.posted, SizeIs(3));
-    EXPECT_EQ(device.namedNotifications.posted.front(), "com.vandra.tamblo.dropped-stackburst");
-}
-
-TEST_F(DPWorkerTest, TellsOfEveryOtherMessageWhenDebuggingAndElseCostsNothing) {
-    const auto worker = tryToMake<Worker>();
-    const auto message = messageOf({{kSize, 7.9}, {kCycle, std::int64_t{1} << 33}});
-    const std::string told = "Did not drop stackburst, right conditions not met: buffer size : 7, time diff";
-    worker->handleMessage(message);
-    EXPECT_THAT(device.log.texts(told), SizeIs(1));
-    device.setThreshold(LogLevel::info);
-    worker->handleMessage(message);
-    EXPECT_EQ(test::allocationsOf([&] { worker->handleMessage(message); }).blocks, 0U);
-    EXPECT_THAT(device.log.texts(told), SizeIs(1));
+    EXPECT_THAT(device.namedNotifications.posted,
+                ElementsAreArray(std::vector<std::string>(3, "com.vandra.tamblo.dropped-stackburst")));
 }
 
 TEST_F(DPWorkerTest, WaitsAsLongAsWantedAndTheServerQueueMayThenBlock) {
@@ -193,8 +159,8 @@ TEST_F(DPWorkerTest, WaitsAsLongAsWantedAndTheServerQueueMayThenBlock) {
 TEST_F(DPWorkerTest, AValueOfTheWrongKindIsOneErrorLineUntilItChanges) {
     const std::pair<Value, const char*> cases[] = {
         // one line: it is no number; two: nor is it a flag
-        {" -.5", ""}, {"NO", "e"}, {"true", "e"}, {"", "ee"},   {Array{1}, "ee"},      {1.5, ""},
-        {"7 x", ""},  {"NO", "e"}, {"-", "ee"},   {".x", "ee"}, {Value::date(1), "ee"}};
+        {" -.5", ""}, {"NO", "e"}, {"true", "e"}, {"", "ee"}, {Array{1}, "ee"},
+        {"7 x", ""},  {"NO", "e"}, {"-", "ee"},   {1.5, ""},  {Value::date(1), "ee"}};
     for (const auto& [value, levels] : cases) {
         prefer("io_cycle", value);
         prefer("enable_stackburst", value);
