@@ -116,8 +116,9 @@ TEST_F(CaptureFoldersTest, AClockThatIsSetLosesNoCaptureThatWasJustMade) {
     EXPECT_THAT(names(), UnorderedElementsAre(first, second)) << "of a time that is still to come";
     const std::string asked = identifier(0s, 3);
     clock.advance(24h * 365);
-    store(asked);
-    EXPECT_THAT(names(), ElementsAre(asked));
+    store(identifier(0s), 600);
+    store(asked, 600);
+    EXPECT_THAT(names(), ElementsAre(asked)) << "the one that was just made comes first";
 }
 
 TEST_F(CaptureFoldersTest, AnOutageIsOneLineAndLeavesNoHalfFolder) {
