@@ -3,33 +3,21 @@
 #include <cstdlib>
 #include <new>
 
-namespace tamblo::test {
-
-namespace {
-thread_local AllocationCount count;
-} // namespace
-
-AllocationCount allocationCount() noexcept {
-    return count;
-}
-
 static void* allocate(std::size_t size) noexcept {
-    ++count.blocks;
-    count.bytes += size;
+    ++tamblo::test::allocationCount.blocks;
+    tamblo::test::allocationCount.bytes += size;
     return std::malloc(size == 0 ? 1 : size);
 }
 
-} // namespace tamblo::test
-
 // Weak, as the runtime of a sanitizer may bring its own; nothing is counted then.
 [[gnu::weak]] void* operator new(std::size_t size) {
-    if (void* const block = tamblo::test::allocate(size)) {
+    if (void* const block = allocate(size)) {
         return block;
     }
     throw std::bad_alloc();
 }
 [[gnu::weak]] void* operator new(std::size_t size, const std::nothrow_t&) noexcept {
-    return tamblo::test::allocate(size);
+    return allocate(size);
 }
 [[gnu::weak]] void operator delete(void* block) noexcept {
     std::free(block);

@@ -4,19 +4,19 @@
 
 namespace tamblo::test {
 
-/// How many blocks, and how many bytes, the calling thread has asked of `operator new` since it began.
+/// Blocks, and bytes, asked of `operator new`.
 struct AllocationCount {
     std::size_t blocks = 0;
     std::size_t bytes = 0;
 };
-[[nodiscard]] AllocationCount allocationCount() noexcept;
+/// Of the thread, since it began.
+inline thread_local AllocationCount allocationCount;
 
 /// The allocations of the calling thread while `run` runs.
 template <typename Run> AllocationCount allocationsOf(const Run& run) {
-    const AllocationCount before = allocationCount();
+    const AllocationCount before = allocationCount;
     run();
-    const AllocationCount after = allocationCount();
-    return {after.blocks - before.blocks, after.bytes - before.bytes};
+    return {allocationCount.blocks - before.blocks, allocationCount.bytes - before.bytes};
 }
 
 } // namespace tamblo::test

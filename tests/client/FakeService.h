@@ -19,9 +19,8 @@
 
 namespace tamblo::test {
 
-/// Answers a client on a socket in a directory of its own, in this process, on a thread of its own, as a test
-/// tells it to: in full, not at all, twice. It can go away and come back at the same path. One connection at
-/// a time.
+/// Answers one client at a time on a thread of its own, as a test tells it to: in full, not at all, twice. It
+/// can go away and come back at the same path.
 class FakeService {
 public:
     /// Appends the frames that answer a request. Runs on the service's thread.
@@ -67,20 +66,18 @@ public:
         if (!request.id || request.method == wire::Method::startReportingSessionForID) {
             return;
         }
-        switch (wire::rowOf(request.method).result) {
-        case wire::ResultKind::never:
-            return;
-        case wire::ResultKind::null:
-            return wire::appendNullReply(replies, *request.id);
-        case wire::ResultKind::boolean:
-            return wire::appendBooleanReply(replies, *request.id, true);
-        case wire::ResultKind::serviceType:
-            return wire::appendUnsignedReply(replies, *request.id, 7);
-        case wire::ResultKind::dictionary:
-            return wire::appendDictionaryReply(replies, *request.id,
-                                               {{"reporterID", request.reporterID}, {"serviceType", 7}});
-        case wire::ResultKind::reporterIDs:
-            return wire::appendIntegersReply(replies, *request.id, std::vector<std::int64_t>{7, -8});
+        const auto result = wire::rowOf(request.method).result;
+        if (result == wire::ResultKind::null) {
+            wire::appendNullReply(replies, *request.id);
+        } else if (result == wire::ResultKind::boolean) {
+            wire::appendBooleanReply(replies, *request.id, true);
+        } else if (result == wire::ResultKind::serviceType) {
+            wire::appendUnsignedReply(replies, *request.id, 7);
+        } else if (result == wire::ResultKind::dictionary) {
+            const Dictionary state{{"reporterID", request.reporterID}, {"serviceType", 7}};
+            wire::appendDictionaryReply(replies, *request.id, state);
+        } else if (result == wire::ResultKind::reporterIDs) {
+            wire::appendIntegersReply(replies, *request.id, std::vector<std::int64_t>{7, -8});
         }
     }
 

@@ -47,21 +47,11 @@ TEST(Decode, RecordsAndLinesAreLaidOutAndWhatIsWrongIsNamed) {
         {"!\n" + record, recordText, "line 1: not Base64"},
         {" \n", "", "there is nothing to decode"},
         {R"({"time":1772366400.25,"event":"a.b","payload":{"x y":1.0,"l":[1,"a"],"n":{"b":true},"e":{}}})",
-         "2026-03-01T12:00:00.250Z a.b\n"
-         "  event: \"a.b\"\n"
-         "  payload:\n"
-         "    e: {}\n"
-         "    l: [1,\"a\"]\n"
-         "    n:\n"
-         "      b: true\n"
-         "    x y: 1.0\n"
-         "  time: 1772366400.25\n",
+         "2026-03-01T12:00:00.250Z a.b\n  event: \"a.b\"\n  payload:\n    e: {}\n    l: [1,\"a\"]\n"
+         "    n:\n      b: true\n    x y: 1.0\n  time: 1772366400.25\n",
          ""},
         {R"({"time":0.5,"op":"\u001b[2J","gone":null,"new\nline":"\n"})",
-         "1970-01-01T00:00:00.500Z \\u001b[2J\n"
-         "  new\\nline: \"\\n\"\n"
-         "  op: \"\\u001b[2J\"\n"
-         "  time: 0.5\n"
+         "1970-01-01T00:00:00.500Z \\u001b[2J\n  new\\nline: \"\\n\"\n  op: \"\\u001b[2J\"\n  time: 0.5\n"
          "# a null is left out: a number that is not finite\n",
          ""},
         {metric + record + "\"}", metricText + record + "\"\n  time: 0\n" + recordText, ""},
@@ -80,40 +70,35 @@ TEST(Decode, RecordsAndLinesAreLaidOutAndWhatIsWrongIsNamed) {
 TEST(Decode, FramesAreShownAsJson) {
     TextBuffer out;
     wire::Request request;
-    const auto append = [&](wire::Method method, std::optional<std::uint64_t> id) {
-        request.method = method;
-        request.id = id;
-        EXPECT_TRUE(wire::appendRequestFrame(out, request));
-    };
+    request.id = 7;
+    request.method = wire::Method::sendMessage;
     request.dictionary = {{"at", Value::date(1772366400.25)}, {"level", 0.1F}};
     request.category = 0x08000004;
     request.type = 1;
     request.reporterIDs = {7, -8};
-    append(wire::Method::sendMessage, 7);
+    EXPECT_TRUE(wire::appendRequestFrame(out, request));
     request = {};
     request.category = 0x00050063;
     request.type = 60;
-    append(wire::Method::sendMessage, std::nullopt);
+    request.method = wire::Method::sendMessage;
+    EXPECT_TRUE(wire::appendRequestFrame(out, request));
+    request.id = ~0ULL;
     request.reporterID = -5;
     request.serviceType = 3;
-    append(wire::Method::setServiceType, ~0ULL);
+    request.method = wire::Method::setServiceType;
+    EXPECT_TRUE(wire::appendRequestFrame(out, request));
     request.dictionary = {{"a", 1}};
-    append(wire::Method::setConfiguration, 0);
-    append(wire::Method::killService, 2);
-    wire::appendNullReply(out, 3);
+    request.method = wire::Method::setConfiguration;
+    EXPECT_TRUE(wire::appendRequestFrame(out, request));
     wire::appendDictionaryReply(out, 4, {{"b", true}});
     wire::appendErrorReply(out, 0, {"d", -32601, "unknown \"method\""});
-    wire::appendErrorReply(out, 5, {"d", 2, ""});
     const std::string expected =
         R"({"frame":"request","id":7,"method":"sendMessage","payload":{"at":"2026-03-01T12:00:00.250Z","level":0.1},"category":134217732,"categoryName":"Session_Playback","type":1,"typeName":"Start","reporterIDs":[7,-8]}
 {"frame":"request without reply","method":"sendMessage","payload":{},"category":327779,"type":60,"reporterIDs":[]}
 {"frame":"request","id":18446744073709551615,"method":"setServiceType","type":3,"typeName":"haptics","reporterID":-5}
-{"frame":"request","id":0,"method":"setConfiguration","configuration":{"a":1},"reporterID":-5}
-{"frame":"request","id":2,"method":"killService"}
-{"frame":"reply","id":3,"error":null,"result":null}
+{"frame":"request","id":18446744073709551615,"method":"setConfiguration","configuration":{"a":1},"reporterID":-5}
 {"frame":"reply","id":4,"error":null,"result":{"b":true}}
 {"frame":"reply","id":0,"error":{"code":-32601,"domain":"d","message":"unknown \"method\""},"result":null}
-{"frame":"reply","id":5,"error":{"code":2,"domain":"d"},"result":null}
 )";
     std::string hex;
     for (const std::uint8_t byte : out.bytes()) {
@@ -128,23 +113,18 @@ TEST(Decode, FramesAreShownAsJson) {
 }
 
 TEST(Decode, FramesThatAreNoneAreNamed) {
-    const std::string good("\x05\0\0\0\x84\x01\x03\xF6\xF5", 9); // [1, 3, null, true]
-    const struct {
-        std::string bytes;
-        std::string problem;
-    } cases[] = {
-        {{"\x01\0\0\0\xA0", 5},
-         "not a request that the service would accept (-32600): the frame is not an array"},
-        {{"\x01\0\0\0\x84", 5}, "not CBOR: the item ends too early"},
-        {{"\x04\0\0\0\x83\x01\x03\xF6", 8}, "not a reply as the protocol has them"},
-        {{"\x05\0\0\0\x84\x01", 6}, "cut short: 6 of 9 bytes are there"},
-        {{"\x05\0", 2}, "cut short: 2 of 4 bytes are there"},
-        {{"\x01\x00\x10\x00\x80", 5}, "its length, 1048577, is beyond the longest, 1048576"},
+    const std::pair<std::string, std::string> cases[] = {
+        {"01000000A0", "not a request that the service would accept (-32600): the frame is not an array"},
+        {"0100000084", "not CBOR: the item ends too early"},
+        {"04000000830103F6", "not a reply as the protocol has them"},
+        {"050000008401", "cut short: 6 of 9 bytes are there"},
+        {"0500", "cut short: 2 of 4 bytes are there"},
+        {"0100100080", "its length, 1048577, is beyond the longest, 1048576"},
     };
-    for (const auto& row : cases) {
-        const Decoded decoded = guessed(good + row.bytes);
+    for (const auto& [hex, problem] : cases) {
+        const Decoded decoded = guessed("05000000 840103F6F5" + hex); // behind [1, 3, null, true]
         EXPECT_EQ(decoded.text, "{\"frame\":\"reply\",\"id\":3,\"error\":null,\"result\":true}\n");
-        EXPECT_THAT(decoded.problems, ElementsAre("frame 2: " + row.problem));
+        EXPECT_THAT(decoded.problems, ElementsAre("frame 2: " + problem));
     }
 }
 

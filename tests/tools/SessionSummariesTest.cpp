@@ -2,6 +2,8 @@
 
 #include <gtest/gtest.h>
 
+#include <algorithm>
+#include <span>
 #include <sstream>
 #include <string>
 #include <vector>
@@ -17,12 +19,9 @@ constexpr std::pair<char, std::string_view> kEvents[] = {{'V', "com.vandra.tambl
 /// "V2" is the second output stretch, "Smusic:9" the summary of a session of that application with 9
 /// messages.
 SessionSummary summaryFrom(const std::string& word) {
-    SessionSummary summary;
-    for (const auto& [letter, event] : kEvents) {
-        summary.event = letter == word[0] ? std::string(event) : summary.event;
-    }
-    if (word[0] == 'S') {
-        const std::size_t colon = word.find(':');
+    const auto kind = std::ranges::find(kEvents, word[0], &std::pair<char, std::string_view>::first);
+    SessionSummary summary{std::string(kind->second), {}};
+    if (const std::size_t colon = word.find(':'); colon != word.npos) {
         summary.payload = {{"HostApplicationDisplayID", word.substr(1, colon - 1)},
                            {"summaryServiceName", "haptics"},
                            {"num_messages", std::stoi(word.substr(colon + 1))}};
@@ -54,11 +53,9 @@ TEST(SessionSummaries, ThoseOfOneStopAreTakenOut) {
             written.push_back(summaryFrom(word));
         }
         const auto found = summariesOf({"a", "haptics", 5}, written);
-        ASSERT_EQ(found.size(), row.count);
-        for (std::size_t i = 0; i < found.size(); ++i) {
-            EXPECT_EQ(found[i].event, written[row.first + i].event);
-            EXPECT_EQ(found[i].payload, written[row.first + i].payload);
-        }
+        EXPECT_TRUE(std::ranges::equal(
+            found, std::span(written).subspan(row.first, row.count),
+            [](const auto& a, const auto& b) { return a.event == b.event && a.payload == b.payload; }));
     }
     EXPECT_EQ(
         summariesOf({"a", "alarms", 5}, std::vector{summaryFrom("Sa:9"), summaryFrom("Sb:9")})[0].payload,

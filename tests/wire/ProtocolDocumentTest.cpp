@@ -1,5 +1,5 @@
 #include "base/Cbor.h"
-#include "tests/base/Hex.h"
+#include "tests/base/Samples.h"
 #include "wire/FrameSplitter.h"
 #include "wire/Reply.h"
 #include "wire/Request.h"
@@ -7,6 +7,7 @@
 #include <gtest/gtest.h>
 #include <nlohmann/json.hpp>
 
+#include <algorithm>
 #include <cstdint>
 #include <fstream>
 #include <set>
@@ -41,11 +42,6 @@ struct Example {
     }
 };
 
-std::string withoutCodeMarks(std::string_view cell) {
-    const std::size_t start = cell.find('`') + 1;
-    return std::string(cell.substr(start, cell.rfind('`') - start));
-}
-
 std::vector<Example> examplesOfThePage() {
     std::ifstream page(EXAMPLES_DIR "/../docs/protocol.md");
     EXPECT_TRUE(page);
@@ -59,9 +55,9 @@ std::vector<Example> examplesOfThePage() {
         } else if (text.starts_with("#")) {
             heading = text.substr(text.find(' ') + 1);
         } else if (heading == "Values" && text.starts_with("| ") && text.find('`') != text.npos) {
-            const std::size_t hexCell = text.rfind('|', text.size() - 2);
-            examples.push_back({heading, 'V', withoutCodeMarks(text.substr(0, hexCell)),
-                                withoutCodeMarks(text.substr(hexCell))});
+            const std::size_t hexEnd = line.rfind('`');
+            const std::size_t hexStart = line.rfind('`', hexEnd - 1) + 1;
+            examples.push_back({heading, 'V', line, line.substr(hexStart, hexEnd - hexStart)});
         } else if (isInBlock && (text.starts_with("C: ") || text.starts_with("S: "))) {
             examples.push_back({heading, text[0], std::string(text.substr(3)), {}});
         } else if (isInBlock) {
@@ -73,17 +69,28 @@ std::vector<Example> examplesOfThePage() {
     return examples;
 }
 
-TEST(ProtocolDocument, RequestsAreOfTheMethodTheyStandUnderAndRefusalsTheOnesShown) {
+TEST(ProtocolDocument, EveryExampleIsReadAsThePageSays) {
     KeySetCache keySets;
     const std::vector<Example> examples = examplesOfThePage();
     std::set<Method> shown;
     int refusals = 0;
+    int replies = 0;
+    int values = 0;
     for (std::size_t i = 0; i < examples.size(); ++i) {
         const Example& example = examples[i];
-        if (example.sender != 'C') {
+        SCOPED_TRACE(example.notation);
+        if (example.sender == 'S') {
+            EXPECT_TRUE(decodeReply(example.item()));
+            ++replies;
             continue;
         }
-        SCOPED_TRACE(example.notation);
+        if (example.sender == 'V') {
+            const Bytes item = example.bytes();
+            CborReader reader(item);
+            EXPECT_TRUE(reader.readValue() && reader.atEnd());
+            ++values;
+            continue;
+        }
         Request request;
         const auto refusal = decodeRequest(example.item(), keySets, request);
         if (const auto method = methodNamed(example.heading)) {
@@ -94,30 +101,13 @@ TEST(ProtocolDocument, RequestsAreOfTheMethodTheyStandUnderAndRefusalsTheOnesSho
             ASSERT_TRUE(refusal);
             TextBuffer answer;
             appendErrorReply(answer, refusal->id, refusal->error);
-            const Bytes answered(answer.bytes().begin(), answer.bytes().end());
-            EXPECT_EQ(answered, examples.at(i + 1).bytes()) << refusal->error.message;
+            EXPECT_TRUE(std::ranges::equal(answer.bytes(), examples.at(i + 1).bytes()))
+                << refusal->error.message;
             ++refusals;
         }
     }
     EXPECT_EQ(shown.size(), kMethods.size()) << "a method without an example";
     EXPECT_GE(refusals, 5);
-}
-
-TEST(ProtocolDocument, RepliesAndValuesAreRead) {
-    int replies = 0;
-    int values = 0;
-    for (const Example& example : examplesOfThePage()) {
-        SCOPED_TRACE(example.notation);
-        if (example.sender == 'S') {
-            EXPECT_TRUE(decodeReply(example.item()));
-            ++replies;
-        } else if (example.sender == 'V') {
-            const Bytes item = example.bytes();
-            CborReader reader(item);
-            EXPECT_TRUE(reader.readValue() && reader.atEnd());
-            ++values;
-        }
-    }
     EXPECT_GE(replies, 11);
     EXPECT_GE(values, 11);
 }

@@ -1,6 +1,6 @@
 #include "wire/Request.h"
 
-#include "tests/base/Hex.h"
+#include "tests/base/Samples.h"
 #include "wire/FrameSplitter.h"
 #include "wire/Reply.h"
 
@@ -9,6 +9,7 @@
 #include <limits>
 #include <string>
 #include <string_view>
+#include <tuple>
 #include <vector>
 
 namespace tamblo::wire {
@@ -138,37 +139,38 @@ TEST(FrameSplitter, TakesWholeFramesOfAnyCutUpToTheLimit) {
 TEST(Reply, EveryResultIsReadAsItWasWritten) {
     const std::vector<std::int64_t> numbers{1, -5, std::numeric_limits<std::int64_t>::max()};
     const Dictionary dictionary{{"reporterID", 7}, {"serviceType", 2}};
+    const std::optional<Value> results[] = {std::nullopt, true, 65535, dictionary,
+                                            Array(numbers.begin(), numbers.end())};
+    const Error errors[] = {{"a.domain", -32601, "why"}, {"b.domain", 1, ""}};
     TextBuffer out;
-    appendNullReply(out, 1);
-    appendBooleanReply(out, 2, true);
-    appendUnsignedReply(out, 3, 65535);
-    appendDictionaryReply(out, 4, dictionary);
-    appendIntegersReply(out, 5, numbers);
-    appendErrorReply(out, 6, {"a.domain", -32601, "why"});
-    appendErrorReply(out, 7, {"b.domain", 1, ""});
-    appendDictionaryReply(out, 8, {{"k", std::string(kMaximumFrameBytes, 'x')}});
-
+    appendNullReply(out, 0);
+    appendBooleanReply(out, 1, true);
+    appendUnsignedReply(out, 2, 65535);
+    appendDictionaryReply(out, 3, dictionary);
+    appendIntegersReply(out, 4, numbers);
+    appendErrorReply(out, 5, errors[0]);
+    appendErrorReply(out, 6, errors[1]);
+    appendDictionaryReply(out, 7, {{"k", std::string(kMaximumFrameBytes, 'x')}});
     FrameSplitter frames(out.bytes());
-    std::vector<Reply> replies;
-    while (const auto frame = frames.next()) {
+    std::uint64_t id = 0;
+    for (; const auto frame = frames.next(); ++id) {
         const auto reply = decodeReply(*frame);
         ASSERT_TRUE(reply);
-        replies.push_back(*reply);
-        EXPECT_EQ(reply->id, replies.size());
+        EXPECT_EQ(reply->id, id);
+        EXPECT_EQ(reply->result, id < 5 ? results[id] : std::nullopt);
+        ASSERT_EQ(reply->error.has_value(), id >= 5);
+        if (id == 7) {
+            EXPECT_EQ(reply->error->code, kNotARequest) << "a result that is too long";
+        } else if (id >= 5) {
+            const auto& [domain, code, message] = errors[id - 5];
+            EXPECT_EQ(std::tie(reply->error->domain, reply->error->code, reply->error->message),
+                      std::tie(domain, code, message));
+        }
         for (std::size_t cut = 0; cut < frame->size(); ++cut) {
             EXPECT_FALSE(decodeReply(frame->first(cut)));
         }
     }
-    ASSERT_EQ(replies.size(), 8U);
-    EXPECT_FALSE(replies[0].result);
-    EXPECT_EQ(*replies[1].result, Value(true));
-    EXPECT_EQ(*replies[2].result, Value(65535));
-    EXPECT_EQ(*replies[3].result, Value(dictionary));
-    EXPECT_EQ(*replies[4].result, Value(Array(numbers.begin(), numbers.end())));
-    EXPECT_EQ(replies[5].error->code, -32601);
-    EXPECT_EQ(replies[5].error->message, "why");
-    EXPECT_EQ(replies[6].error->domain, "b.domain");
-    EXPECT_EQ(replies[7].error->code, kNotARequest) << "a result that is too long";
+    EXPECT_EQ(id, 8U);
 }
 
 } // namespace

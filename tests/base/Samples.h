@@ -9,9 +9,31 @@
 #include <cstdint>
 #include <random>
 #include <string>
+#include <string_view>
+#include <utility>
 #include <vector>
 
 namespace tamblo::test {
+
+/// The bytes of hexadecimal digits, two each; blanks between them do not count.
+inline std::vector<std::uint8_t> fromHex(std::string_view hex) {
+    std::vector<std::uint8_t> bytes;
+    std::string pair;
+    for (const char digit : hex) {
+        if (digit != ' ' && (pair += digit).size() == 2) {
+            bytes.push_back(static_cast<std::uint8_t>(std::stoi(std::exchange(pair, ""), nullptr, 16)));
+        }
+    }
+    return bytes;
+}
+
+inline std::string repeated(std::string_view piece, int count) {
+    std::string text;
+    for (int i = 0; i < count; ++i) {
+        text += piece;
+    }
+    return text;
+}
 
 /// Values at random from a seed: every kind, every length around the limits of what is stored in place,
 /// numbers of every magnitude.
@@ -25,7 +47,7 @@ public:
         case 0:
             return Value(below(2) == 0);
         case 1:
-            return Value(static_cast<std::int64_t>(bits()));
+            return Value(static_cast<std::int64_t>(below(2) == 0 ? bits() : ~bits()));
         case 2:
             return Value(bits());
         case 3:
@@ -76,8 +98,12 @@ public:
     std::size_t below(std::size_t limit) { return random_() % limit; }
 
 private:
-    /// Magnitudes are spread evenly over the lengths in bits.
-    std::uint64_t bits() { return random_() >> below(64); }
+    /// Magnitudes are spread evenly over the lengths in bits; every second number is a power of two or stands
+    /// beside one.
+    std::uint64_t bits() {
+        const std::uint64_t power = 1ULL << below(64);
+        return below(2) == 0 ? power + below(3) - 1 : random_() % power;
+    }
     std::int64_t small() { return static_cast<std::int64_t>(below(2000)) - 1000; }
 
     Value real(bool onlyJson) {
@@ -91,18 +117,6 @@ private:
 
     std::mt19937_64 random_;
 };
-
-/// Every power of two, its neighbours, and as many negative integers.
-inline Value integersAroundPowersOfTwo() {
-    Array integers;
-    for (unsigned power = 0; power < 64; ++power) {
-        for (std::uint64_t number = (1ULL << power) - 1, i = 0; i < 3; ++number, ++i) {
-            integers.emplace_back(number);
-            integers.emplace_back(static_cast<std::int64_t>(~(number & ~(1ULL << 63U))));
-        }
-    }
-    return integers;
-}
 
 /// The same document for the independent implementation that the codecs are held against.
 inline nlohmann::json toNlohmann(const Value& value) {
