@@ -91,14 +91,15 @@ TEST_P(ClientInBothModes, AllRequestsReachTheServiceAndTheirRepliesComeBackTyped
 }
 
 TEST_P(ClientInBothModes, PendingRequestsFailWhenTheServiceGoesAndSessionsAreRemadeBeforeWhatWaits) {
-    std::array<std::atomic<int>, 3> announced{};
-    const auto countOf = [&](ConnectionState state) {
-        return announced[static_cast<std::size_t>(state)].load();
-    };
+    std::atomic<int> connected = 0;
+    std::atomic<int> lost = 0;
+    std::atomic<int> reconnecting = 0;
     Client* sender = nullptr;
     std::atomic<bool> isArmed{false};
     Client client(options([&](ConnectionState state) {
-        ++announced[static_cast<std::size_t>(state)];
+        connected += state == ConnectionState::connected ? 1 : 0;
+        lost += state == ConnectionState::lost ? 1 : 0;
+        reconnecting += state == ConnectionState::reconnecting ? 1 : 0;
         if (state == ConnectionState::connected && isArmed) {
             sender->createReportingSession(7, nullptr);
             sender->startReportingSessionForID(7, nullptr);
@@ -122,9 +123,7 @@ TEST_P(ClientInBothModes, PendingRequestsFailWhenTheServiceGoesAndSessionsAreRem
                            Method::createReportingSession, Method::startReportingSessionForID,
                            Method::sendMessage};
     EXPECT_TRUE(std::ranges::equal(service.requests(), sent, {}, &wire::Request::method));
-    EXPECT_EQ(countOf(ConnectionState::connected), 2);
-    EXPECT_EQ(countOf(ConnectionState::lost), 1);
-    EXPECT_GE(countOf(ConnectionState::reconnecting), 1);
+    EXPECT_TRUE(connected == 2 && lost == 1 && reconnecting >= 1);
 }
 
 TEST_P(ClientInBothModes, AFullQueueRefusesAndCountsWithoutBlocking) {
@@ -168,31 +167,25 @@ TEST_P(ClientInBothModes, FramesOfEverySizeArriveAndOnesOverTheLimitAreRefusedHe
     EXPECT_EQ(requests[4].dictionary.find("text")->stringValue().size(), 300000U);
 }
 
-TEST_P(ClientInBothModes, TheEndSendsWhatIsQueuedAndAnswersWhatWaits) {
+TEST_P(ClientInBothModes, SendingAllocatesNothingAndTheEndSendsWhatIsQueuedAndAnswersWhatWaits) {
+    const Dictionary payload{{"name", std::string(300, 'x')}, {"volume", 0.5}};
+    std::atomic<int> replies = 0;
     std::future<Result<bool>> held;
     {
         Client client(options());
         auto ready = client.createReportingSession(7);
         ASSERT_TRUE(client.wait(ready, 5s));
         held = client.startReportingSessionForID(7);
-        client.post({}, kVolume, EventType::generic);
+        const auto spent = test::allocationsOf([&] {
+            client.post(payload, kVolume, EventType::generic, kSeven);
+            client.sendMessage(payload, kVolume, EventType::generic, kSeven, [&](auto&&) { ++replies; });
+            client.message().set("name", "text").set("volume", 0.5).send(kVolume, EventType::generic, kSeven);
+        });
+        EXPECT_EQ(spent.blocks, 0U) << "on the calling thread";
     }
+    EXPECT_EQ(replies, 1);
     EXPECT_EQ(held.get().error->code, static_cast<std::int64_t>(ErrorCode::closed));
-    EXPECT_TRUE(service.waitForRequests(3));
-}
-
-TEST_P(ClientInBothModes, SendingAllocatesNothingOnTheCallingThread) {
-    Client client(options());
-    const Dictionary payload{{"name", std::string(300, 'x')}, {"volume", 0.5}};
-    std::atomic<int> replies = 0;
-    const auto allocations = test::allocationsOf([&] {
-        client.post(payload, kVolume, EventType::generic, kSeven);
-        client.sendMessage(payload, kVolume, EventType::generic, kSeven, [&replies](auto&&) { ++replies; });
-        client.message().set("name", "text").set("volume", 0.5).send(kVolume, EventType::generic, kSeven);
-    });
-    EXPECT_EQ(allocations.blocks, 0U);
-    EXPECT_TRUE(client.flush(5s));
-    EXPECT_TRUE(service.waitForRequests(3));
+    EXPECT_TRUE(service.waitForRequests(5));
 }
 
 TEST(Client, SecondRepliesAreDroppedUnlessAskedForAndStrangeOnesHarmNothing) {
@@ -239,9 +232,8 @@ TEST(Client, AReplyOfAnotherKindAndAnErrorReplyAreErrors) {
     auto disabled = client.sendMessage({}, kVolume, EventType::generic, {});
     ASSERT_TRUE(client.wait(disabled, 5s));
     const auto error = disabled.get().error;
-    EXPECT_EQ(error->domain, "com.vandra.audio.reporting");
-    EXPECT_EQ(error->code, 1);
-    EXPECT_EQ(error->message, "off");
+    EXPECT_EQ(error->domain + " " + std::to_string(error->code) + " " + error->message,
+              "com.vandra.audio.reporting 1 off");
 }
 
 TEST(Client, WithoutReconnectionWhatCannotBeSentIsAnsweredAtOnce) {
@@ -274,7 +266,7 @@ TEST(Client, MessagesOfOneThreadKeepTheirOrderAndManyThreadsLoseNone) {
     constexpr int kThreads = 4;
     constexpr int kMessages = 2000;
     Client client({.socketPath = service.path(), .queueCapacity = 256});
-    std::vector<std::thread> threads;
+    std::vector<std::jthread> threads;
     for (int thread = 0; thread < kThreads; ++thread) {
         threads.emplace_back([&client, thread] {
             const std::int64_t reporters[] = {thread};
@@ -287,9 +279,7 @@ TEST(Client, MessagesOfOneThreadKeepTheirOrderAndManyThreadsLoseNone) {
             }
         });
     }
-    for (std::thread& thread : threads) {
-        thread.join();
-    }
+    threads.clear();
     ASSERT_TRUE(client.flush(5s));
     ASSERT_TRUE(service.waitForRequests(kThreads * kMessages));
     std::vector<std::int64_t> next(kThreads, 0);

@@ -86,8 +86,7 @@ TEST(SessionFile, LinesAreReadAndWrongOnesRefused) {
 
 TEST(SessionSpacing, OffsetsWinOverTimestampsAndNeitherKeepsTheTime) {
     const struct {
-        std::optional<double> offset;
-        std::optional<double> timestamp;
+        std::optional<double> offset, timestamp;
         double due;
     } lines[] = {{{}, {}, 0},       {{}, 1000.0, 0},  {{}, 1002.5, 2.5}, {{}, {}, 2.5},
                  {{}, 1001.0, 2.5}, {4.0, 1001.0, 4}, {{}, 1005.0, 5}};
