@@ -18,73 +18,28 @@ constexpr const char* kCycle = "io_cycle";
 
 class CaptureTest : public WorkerTest {
 protected:
-    CaptureTest() : WorkerTest(LogLevel::debug, true) {}
+    using Worker = ZRReportingSessionDPWorker;
+    CaptureTest() : WorkerTest(LogLevel::debug, true) {
+        prefer("TalvixInvalidXyBackOffSeconds", "60.5 s");
+        prefer("enable_stackburst", "YES");
+    }
     void prefer(const std::string& key, Value value) {
         device.preferences.set(key, "com.vandra.tamblo.zrreporting", std::move(value));
     }
-};
-
-class QuilletWorkerTest : public CaptureTest {
-protected:
-    QuilletWorkerTest() { prefer("TalvixInvalidXyBackOffSeconds", "60.5 s"); }
     /// How many drafts a message now makes, by its time after the first one's.
     std::size_t draftsOf(double offset, const std::string& key = "tvac_invalid_x") {
         const std::size_t before = device.bugReportDrafting.requests.size();
-        worker->handleMessage(messageOf({{key, 1}, {"zrreporting_timestamp", 1e9 + offset}}));
+        quillet->handleMessage(messageOf({{key, 1}, {"zrreporting_timestamp", 1e9 + offset}}));
         return device.bugReportDrafting.requests.size() - before;
     }
     void arm() {
-        worker = tryToMake<ZRReportingSessionQuilletWorker>();
+        quillet = tryToMake<ZRReportingSessionQuilletWorker>();
         EXPECT_EQ(draftsOf(0.0), 0U);
     }
     bool isTimeKept() {
         return device.preferences.copyPreferenceValue(kLastRun, "com.vandra.tamblo.zrreporting") ==
                Value(device.clock.seconds());
     }
-
-    std::shared_ptr<ZRReportingSessionQuilletWorker> worker;
-};
-
-TEST_F(QuilletWorkerTest, DraftsFiveSecondsAfterTheFirstMessageOnceInARunAndInABackOffPeriod) {
-    arm();
-    EXPECT_EQ(draftsOf(5.0), 0U);
-    EXPECT_EQ(draftsOf(5.1, "Tvac_invalid_x"), 0U);
-    EXPECT_FALSE(isTimeKept());
-    EXPECT_EQ(draftsOf(5.1), 1U);
-    EXPECT_TRUE(isTimeKept());
-    EXPECT_EQ(draftsOf(7.0), 0U);
-    EXPECT_EQ(device.bugReportDrafting.requests.front().processName, "caller");
-    (void)logged(ZRReportingSessionCategory());
-    device.bugReportDrafting.requests.front().completion("no disk");
-    EXPECT_EQ(loggedLevels(ZRReportingSessionCategory()), "e");
-    worker->stop();
-    device.clock.advance(60'499ms);
-    EXPECT_EQ(draftsOf(70.0), 0U);
-    device.clock.advance(1ms);
-    EXPECT_EQ(draftsOf(70.0), 1U);
-}
-
-TEST_F(QuilletWorkerTest, DraftsEvenWhenTheTimeCannotBeStoredOrTheSessionIsGone) {
-    prefer("TalvixInvalidXyBackOffSeconds", 0);
-    prefer(kLastRun, Array{1});
-    device.preferences.writeFailure = "disk full";
-    arm();
-    session.reset();
-    (void)logged(ZRReportingSessionCategory());
-    // Without a period, a run still has one draft; each message of interest moves the time on.
-    for (const std::size_t drafts : {1U, 0U}) {
-        device.clock.advance(1s);
-        EXPECT_EQ(draftsOf(6.0), drafts);
-        EXPECT_TRUE(isTimeKept());
-    }
-    EXPECT_EQ(device.bugReportDrafting.requests.front().processName, "");
-    EXPECT_EQ(loggedLevels(ZRReportingSessionCategory()), "ees") << "the rubbish, the disk, the draft";
-}
-
-class DPWorkerTest : public CaptureTest {
-protected:
-    DPWorkerTest() { prefer("enable_stackburst", "YES"); }
-    using Worker = ZRReportingSessionDPWorker;
 
     /// Whether an overload with these is captured.
     bool isCaptured(Worker& worker, const Dictionary& payload, AudioEventType type = 6,
@@ -95,9 +50,46 @@ protected:
     }
 
     const Dictionary overload{{kSize, 512}, {kCycle, 3}};
+    std::shared_ptr<ZRReportingSessionQuilletWorker> quillet;
 };
 
-TEST_F(DPWorkerTest, CapturesOverloadsOfLargeBuffersAndCycles) {
+TEST_F(CaptureTest, DraftsFiveSecondsAfterTheFirstMessageOnceInARunAndInABackOffPeriod) {
+    arm();
+    EXPECT_EQ(draftsOf(5.0), 0U);
+    EXPECT_EQ(draftsOf(5.1, "Tvac_invalid_x"), 0U);
+    EXPECT_FALSE(isTimeKept());
+    EXPECT_EQ(draftsOf(5.1), 1U);
+    EXPECT_TRUE(isTimeKept());
+    EXPECT_EQ(draftsOf(7.0), 0U);
+    EXPECT_EQ(device.bugReportDrafting.requests.front().processName, "caller");
+    (void)loggedLevels(ZRReportingSessionCategory());
+    device.bugReportDrafting.requests.front().completion("no disk");
+    EXPECT_EQ(loggedLevels(ZRReportingSessionCategory()), "e");
+    quillet->stop();
+    device.clock.advance(60'499ms);
+    EXPECT_EQ(draftsOf(70.0), 0U);
+    device.clock.advance(1ms);
+    EXPECT_EQ(draftsOf(70.0), 1U);
+}
+
+TEST_F(CaptureTest, DraftsEvenWhenTheTimeCannotBeStoredOrTheSessionIsGone) {
+    prefer("TalvixInvalidXyBackOffSeconds", 0);
+    prefer(kLastRun, Array{1});
+    device.preferences.writeFailure = "disk full";
+    arm();
+    session.reset();
+    (void)loggedLevels(ZRReportingSessionCategory());
+    // Without a period, a run still has one draft; each message of interest moves the time on.
+    for (const std::size_t drafts : {1U, 0U}) {
+        device.clock.advance(1s);
+        EXPECT_EQ(draftsOf(6.0), drafts);
+        EXPECT_TRUE(isTimeKept());
+    }
+    EXPECT_EQ(device.bugReportDrafting.requests.front().processName, "");
+    EXPECT_EQ(loggedLevels(ZRReportingSessionCategory()), "ees") << "the rubbish, the disk, the draft";
+}
+
+TEST_F(CaptureTest, CapturesOverloadsOfLargeBuffersAndCycles) {
     EXPECT_FALSE(isCaptured(*tryToMake<Worker>(), overload, 6, 0x08000007));
     EXPECT_FALSE(isCaptured(*tryToMake<Worker>(), overload, 5, 7));
     const struct {
@@ -125,7 +117,7 @@ TEST_F(DPWorkerTest, CapturesOverloadsOfLargeBuffersAndCycles) {
     }
 }
 
-TEST_F(DPWorkerTest, NamesTheApplicationAndWaitsForMoreThanTenSeconds) {
+TEST_F(CaptureTest, NamesTheApplicationAndWaitsForMoreThanTenSeconds) {
     const auto worker = tryToMake<Worker>();
     Dictionary payload = overload;
     payload.set("HostApplicationDisplayID", "com.a");
@@ -143,7 +135,7 @@ TEST_F(DPWorkerTest, NamesTheApplicationAndWaitsForMoreThanTenSeconds) {
                 ElementsAreArray(std::vector<std::string>(3, "com.vandra.tamblo.dropped-stackburst")));
 }
 
-TEST_F(DPWorkerTest, WaitsAsLongAsWantedAndTheServerQueueMayThenBlock) {
+TEST_F(CaptureTest, WaitsAsLongAsWantedAndTheServerQueueMayThenBlock) {
     const std::pair<Value, std::int64_t> cases[] = {
         {0.9, 0}, {1'500'000.9, 1'500'000}, {-1, 0}, {4'294'967'296.0, 4'294'967'295}, {std::nan(""), 0}};
     for (const auto& [preference, microseconds] : cases) {
@@ -156,7 +148,7 @@ TEST_F(DPWorkerTest, WaitsAsLongAsWantedAndTheServerQueueMayThenBlock) {
     }
 }
 
-TEST_F(DPWorkerTest, AValueOfTheWrongKindIsOneErrorLineUntilItChanges) {
+TEST_F(CaptureTest, AValueOfTheWrongKindIsOneErrorLineUntilItChanges) {
     const std::pair<Value, const char*> cases[] = {
         // one line: it is no number; two: nor is it a flag
         {" -.5", ""}, {"NO", "e"}, {"true", "e"}, {"", "ee"}, {Array{1}, "ee"},
@@ -164,7 +156,7 @@ TEST_F(DPWorkerTest, AValueOfTheWrongKindIsOneErrorLineUntilItChanges) {
     for (const auto& [value, levels] : cases) {
         prefer("io_cycle", value);
         prefer("enable_stackburst", value);
-        (void)logged(ZRReportingDPLogCategory());
+        (void)loggedLevels(ZRReportingDPLogCategory());
         for (int reading = 0; reading < 2; ++reading) {
             EXPECT_EQ(Worker::getRunTimeDefaults(device.context(), "io_cycle"), value.integerValue());
             EXPECT_EQ(Worker::getEnableFlag(device.context(), "enable_stackburst"), value.boolValue());

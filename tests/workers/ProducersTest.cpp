@@ -1,8 +1,11 @@
 #include "tests/workers/WorkerTest.h"
+#include "workers/ZRReportingSessionWorkerUtility.h"
 #include "workers/producers/ZRReportingSessionInputMessagesWorker.h"
 #include "workers/producers/ZRReportingSessionKaleenMessagesWorker.h"
 #include "workers/producers/ZRReportingSessionVolumeMessagesWorker.h"
 
+#include <algorithm>
+#include <array>
 #include <cmath>
 #include <map>
 #include <sstream>
@@ -28,8 +31,7 @@ const std::map<std::string, std::string_view, std::less<>> kKeys{
     {"feature", "spatial-audio-accessory-feature"},
     {"vocoder", "vp_config_primary_vocoder"},
     {"rate", "vp_config_primary_vocoderFs"},
-    {"port", "vp_config_input_port"},
-};
+    {"port", "vp_config_input_port"}};
 
 /// "10 out volume=0.5": a timestamp after the start, "-" for none, and keys by the names above, each with its
 /// value in JSON, or a word; without one it is true.
@@ -122,7 +124,6 @@ TEST_F(ProducersTest, VolumeSegments) {
             {"a length with output still said to run ends one segment and begins another",
              "0 out volume=0.5; 10 length=10 out; 30 out=false",
              "10.0 0.5 unknown false 1 2; 20.0 0.5 unknown false 2 2"},
-            {"a format change while nothing plays", "0 format=A volume=1; 9 format=B; 20 length=20", ""},
             {"each watched setting ends one; carried settings alone do not, nor what is said again",
              "0 out volume=0.5; 10 formatID=x channels=2; 15 ringer=0 spatial=0 format=unknown; 20 ringer;"
              "30 spatial; 40 devices=D; 50 devices=E; 60 feature; 70 format=S; 76 out=false",
@@ -177,8 +178,6 @@ TEST_F(ProducersTest, GroupSessionSegments) {
         &ProducersTest::group,
         {"play_seconds", "mFormatID", "mChannelsPerFrame", "session_selected_format", "msgidx", "msgcnt"},
         {
-            {"a format change and the end", "0 out group=1 formatID=F1; 30 formatID=F2; 40 length=40",
-             "30.0 F1 -1 unknown 1 2; 10.0 F2 -1 unknown 2 2"},
             {"never in a group, or in none that counts", "0 out group=0; 10 group=2; 40 length=40", ""},
             {"the selected format is reported and not watched; a key that only one has is no change",
              "0 out group=1 formatID=F1; 10 format=S; 20 channels=2; 30 channels=6; 40 out=false",
@@ -193,33 +192,6 @@ TEST_F(ProducersTest, GroupSessionSegments) {
             {"what was before counts from its own time", "10 formatID=F2; 17 length=1",
              "8.0 F1 -1 unknown 1 2; 7.0 F2 -1 unknown 2 2", "2 out group=1 formatID=F1"},
         });
-}
-
-TEST_F(ProducersTest, SummariesHaveExactlyTheseKeys) {
-    session->addPreviousValues({{"vp_config_input_port", "Mic"}});
-    const Messages messages = messagesOf("0 out in volume=0.5 group=1; 10 length=75");
-    EXPECT_THAT(volume(messages, {}, nullptr), IsEmpty());
-    EXPECT_THAT(input(messages, {}, nullptr), IsEmpty());
-    std::string text;
-    for (const Messages& derived :
-         {volume(messages, {}, &process), input(messages, {}, &process), group(messages, {})}) {
-        ASSERT_EQ(derived.size(), 1U);
-        EXPECT_EQ(derived[0]->type(), AudioEventTypeSummary);
-        text += std::to_string(derived[0]->category()) + " " + jsonText(derived[0]->payload()) + "\n";
-    }
-    EXPECT_EQ(
-        text,
-        R"(14 {"HostApplicationDisplayID":"com.example.player","QVSessionVolume":0.5,"QVSessionVolumeBucketed":"0.5","active_devices":"unknown","mChannelsPerFrame":-1,"mFormatID":"unknown","msgcnt":1,"msgidx":1,"play_seconds":10.0,"play_secondsBucketed":"10","ringerstate":false,"session_selected_format":"unknown","spatial-audio-accessory-feature":false,"spatializationEnabled":false}
-3 {"HostApplicationDisplayID":"com.example.player","active_devices":"unknown","inputrunning_seconds":10.0,"inputrunning_secondsBucketed":"10","msgcnt":1,"msgidx":1,"vp_config_input_port":"Mic","vp_config_operation_mode":"unknown"}
-15 {"active_devices":"unknown","mChannelsPerFrame":-1,"mFormatID":"unknown","msgcnt":1,"msgidx":1,"play_seconds":10.0,"play_secondsBucketed":"10","session_selected_format":"unknown"}
-)");
-    EXPECT_EQ(volume(messages, {}, &process)[0]->payload().find("play_seconds")->kind(),
-              Value::Kind::singleFloat);
-    EXPECT_EQ(group(messages, {})[0]->destinationWorkers(),
-              (DestinationWorkers{workerClassNamed("ZRReportingSessionEventryWorker"),
-                                  workerClassNamed("ZRReportingSessionSummaryJsonFileWorker")}));
-    setInternalBuild(true);
-    EXPECT_EQ(group(messages, {})[0]->destinationWorkers(), DestinationWorkers{});
 }
 
 TEST_F(ProducersTest, SummariesGoThroughTheSessionInOrderAndAreCounted) {
@@ -239,29 +211,30 @@ TEST_F(ProducersTest, SummariesGoThroughTheSessionInOrderAndAreCounted) {
     EXPECT_EQ(names, "Volume.Summary 1 Volume.Summary 2 Kaleen.Summary 1 Kaleen.Summary 2 "
                      "Session_Generic.Summary 8 Input.Summary 1 Input.Summary 2 ")
         << "four messages of the client's and four summaries are eight";
+
+    session = makeSession();
+    const Messages messages = messagesOf("0 out in volume=0.5 group=1; 10 length=75");
+    EXPECT_THAT(volume(messages, {}, nullptr), IsEmpty());
+    EXPECT_THAT(input(messages, {}, nullptr), IsEmpty());
+    EXPECT_EQ(shown(input(messages, {}, &process)[0]->payload(), {"vp_config_operation_mode"}),
+              "\"unknown\"");
+    EXPECT_EQ(volume(messages, {}, &process)[0]->payload().find("play_seconds")->kind(),
+              Value::Kind::singleFloat);
+    EXPECT_EQ(group(messages, {})[0]->destinationWorkers(),
+              (DestinationWorkers{workerClassNamed("ZRReportingSessionEventryWorker"),
+                                  workerClassNamed("ZRReportingSessionSummaryJsonFileWorker")}));
+    setInternalBuild(true);
+    EXPECT_EQ(group(messages, {})[0]->destinationWorkers(), DestinationWorkers{});
 }
 
 /// Every key that a producer reads, with every value that does not belong there, in a stretch that is open:
 /// whatever it is, the summaries are few and numbered.
 TEST_F(ProducersTest, ValuesOfTheWrongKind) {
-    const Value wrongValues[] = {"text",
-                                 "12.5 apples",
-                                 "",
-                                 Dictionary{{"a", 1}},
-                                 Array{1, "b"},
-                                 1e300,
-                                 -1e300,
-                                 NAN,
-                                 INFINITY,
-                                 -INFINITY,
-                                 INT64_MIN,
-                                 UINT64_MAX,
-                                 true,
-                                 Value::date(1e9),
-                                 Value::data({})};
+    const Array wrongValues{
+        "text",    "12.5 apples", "",   Dictionary{{"a", 1}}, Array{1, "b"},  -1e300, NAN, INFINITY,
+        INT64_MIN, UINT64_MAX,    true, Value::date(1e9),     Value::data({})};
     for (const auto& [name, key] : kKeys) {
         for (const Value& wrong : wrongValues) {
-            SCOPED_TRACE(name + " " + jsonText(wrong));
             auto messages = messagesOf(std::string(kAllRunning) +
                                        " channels=1 formatID=1 format=1 spatial=1 ringer=1 feature=1 "
                                        "vocoder=1 rate=1; 10; 20; 30 length=1");
@@ -270,7 +243,7 @@ TEST_F(ProducersTest, ValuesOfTheWrongKind) {
             }
             for (const auto& derived :
                  {volume(messages, {}, &wrong), input(messages, {}, &process), group(messages, {})}) {
-                EXPECT_LE(derived.size(), 3U);
+                EXPECT_LE(derived.size(), 3U) << name << " " << jsonText(wrong);
                 for (const MessageRef& message : derived) {
                     EXPECT_EQ(*message->payload().find("msgcnt"), Value(derived.size()));
                 }
@@ -289,15 +262,136 @@ TEST_F(ProducersTest, WrongKindsFollowTheReadingRules) {
              "20.0 0.5 0.5 15; 10.0 0.75loud 0.75 10"},
             {"a volume that is no number repeats as itself, and beyond the table falls into the nearest "
              "class",
-             "0 out=1 volume=nan; 10 volume=nan; 20 volume=7; 30 out="
-             "",
-             "20.0 null 1.0 15; 10.0 7 1.0 10"},
+             "0 out=1 volume=nan; 10 volume=nan; 20 volume=7; 30 out=", "20.0 null 1.0 15; 10.0 7 1.0 10"},
             {"a timestamp that is no number ends a segment of no length; the next begins there, at 0",
              "0 out volume=0.5; soon ringer; 7 out=false", "7.0 0.5 0.5 5"},
             {"a day that never ends, and a length beyond single precision",
              "0 out volume=0.5; 1e300 out=false", "null 0.5 0.5 86400"},
             {"one that is not a number makes no summary", "0 out volume=0.5; nan out=false", ""},
         });
+}
+
+constexpr std::array<std::string_view, 3> kLetters{"s", "e", "r"};
+
+/// `e3s1@1.5` for the keys with the values 3 and 1, and this time.
+std::string textOf(const Dictionary& payload) {
+    std::string text;
+    for (const char* key : {"s", "e", "r", "x"}) {
+        text += payload.contains(key) ? key + shown(payload, {key}) : "";
+    }
+    return text + "@" + shown(payload, {"zrreporting_timestamp"});
+}
+
+TEST(WorkerUtilityTest, CombinesBurstsInPlace) {
+    /// The letters of a message's keys, each with the number of the message as its value; and its time.
+    using Sent = std::pair<const char*, Value>;
+    const struct {
+        const char* what;
+        std::vector<Sent> sent;
+        double pause;
+        const char* left; ///< `NUMBER:TEXT` of the messages that are left, as they are in the end
+    } cases[] = {
+        {"another message between", {{"s", 0.0}, {"x", 0.5}, {"e", 1.0}}, 5, "1:s1e3@1.0 2:x2@0.5 "},
+        {"a repeat begins anew", {{"s", 0.0}, {"s", 1.0}, {"e", 1.5}}, 5, "1:s1@0.0 2:s2e3@1.5 "},
+        {"one with both keys counts under the first", {{"se", 0.0}, {"e", 1.0}}, 5, "1:s1e2@1.0 "},
+        {"just below the pause", {{"e", 0.0}, {"s", 1.999}}, 2, "1:s2e1@1.999 "},
+        {"the pause since the message before", {{"e", 0.0}, {"r", 1.5}, {"s", 3.0}}, 2, "1:s3e1r2@3.0 "},
+        // At the pause; the old anchor stays, and a repeat of the late one's key begins anew.
+        {"pause",
+         {{"e", 0.0}, {"s", 2.0}, {"r", 3.0}, {"s", 3.1}},
+         2,
+         "1:e1@0.0 2:s2@2.0 3:r3@3.0 4:s4@3.1 "},
+        {"one earlier than the anchor", {{"e", 0.0}, {"s", 2.0}, {"r", -3.0}}, 2, "1:e1r3@-3.0 2:s2@2.0 "},
+        // No time is 0, and a pause that is no number is long.
+        {"no times", {{"e", ""}, {"s", NAN}, {"s", 1.0}, {"e", ""}}, 2, "1:e1@ 2:s2@null 3:s3e4@1.0 "},
+    };
+    for (const auto& row : cases) {
+        std::vector<MessageRef> messages;
+        for (const auto& [keys, time] : row.sent) {
+            Dictionary payload;
+            for (const char key : std::string_view(keys)) {
+                payload.set(std::string(1, key), messages.size() + 1);
+            }
+            if (time.isNumber()) {
+                payload.set("zrreporting_timestamp", time);
+            }
+            messages.push_back(messageOf(payload));
+        }
+        std::string left;
+        for (const ZRReportingSessionMessage* message : ZRReportingSessionWorkerUtility::combineRapidMessages(
+                 messages, kLetters, std::chrono::duration<double>(row.pause))) {
+            const auto place = std::find_if(messages.begin(), messages.end(),
+                                            [message](const auto& sent) { return sent.get() == message; });
+            left += std::to_string(place - messages.begin() + 1) + ":" + textOf(message->payload()) + " ";
+        }
+        EXPECT_EQ(left, row.left) << row.what;
+    }
+}
+
+class SummaryWorkerTest : public WorkerTest {
+protected:
+    void sendIO(Dictionary payload, AudioEventType type = AudioEventTypeGeneric) {
+        send(std::move(payload), AudioEventKindIO, type);
+    }
+    /// Stops the session; these values of its summary.
+    std::string summary(std::initializer_list<std::string_view> keys) {
+        device.analyticsEvents.clear();
+        session->stop();
+        const auto payloads = device.analyticsEvents.payloads("com.vandra.tamblo.Session_Generic.Summary");
+        EXPECT_EQ(payloads.size(), 1U);
+        return payloads.empty() ? "" : shown(payloads[0], keys);
+    }
+};
+
+TEST_F(SummaryWorkerTest, CountsMessagesAndActivity) {
+    const auto counts = [this] {
+        return summary({"num_messages", "num_unique_messages", "num_redundant_messages", "active_count",
+                        "total_active_time", "average_active_time", "overload_count"});
+    };
+    // Without a message, the session's own start and stop records are none; a stop that stops nothing leaves
+    // one more of them in the list.
+    session->stop();
+    session->start();
+    EXPECT_EQ(counts(), "0 0 0 0 0.0 0.0 0");
+
+    // What a session is sent before its start counts to the run that follows.
+    sendIO({{"n", 0}});
+    session->start();
+    session->start();
+    for (const int n : {1, 2, 2, 2, 3}) {
+        sendIO({{"n", n}});
+    }
+    sendIO({{"session_duration", 2.5}, {"issue_type", "overload"}});
+    sendIO({{"session_duration", "4 seconds"}});
+    sendIO({{"issue_type", "overload"}});
+    sendIO({{"issue_type", "overload"}});
+    EXPECT_EQ(counts(), "10 7 3 2 6.5 3.25 1");
+
+    // Messages are counted by the run, activity over all of them.
+    session->start();
+    sendIO({{"issue_type", "underrun"}});
+    sendIO({{"issue_type", "overload"}}, AudioEventTypeError);
+    sendIO({{"issue_type", "overload"}}, AudioEventTypeError);
+    EXPECT_EQ(counts(), "3 3 0 2 6.5 3.25 3");
+}
+
+TEST_F(SummaryWorkerTest, TellsWhoReportedAndHowTheDeviceIs) {
+    device.processInformation.footprint = (std::uint64_t{4} << 30U) + (std::uint64_t{3} << 20U) + 5;
+    const std::pair<int, const char*> states[] = {{0, "Nominal"},  {1, "Fair"},    {2, "Serious"},
+                                                  {3, "Critical"}, {4, "Unknown"}, {-1, "Unknown"}};
+    for (const auto& [state, name] : states) {
+        device.deviceConditions.thermal = state;
+        device.deviceConditions.lowPower = state == 1;
+        session->start();
+        EXPECT_EQ(summary({"thermal_state", "low_power_enabled", "vmInfo_phys_footprint_MiB"}),
+                  std::string("\"") + name + (state == 1 ? "\" 1 3" : "\" 0 3"));
+    }
+    session->setClientProcessName(std::nullopt);
+    device.processInformation.footprint = ProcessInformation::QueryError{2, "no such file"};
+    (void)loggedLevels(ZRReportingSummaryLogCategory());
+    session->start();
+    EXPECT_EQ(summary({"vmInfo_phys_footprint_MiB", "clientProcessName"}), "");
+    EXPECT_EQ(loggedLevels(ZRReportingSummaryLogCategory()), "e");
 }
 
 } // namespace

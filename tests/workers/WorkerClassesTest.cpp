@@ -32,7 +32,6 @@ TEST_F(WorkerClassesTest, RefuseSessionsOnBuildsAndDevicesThatDoNotWantThem) {
         AudioServiceType type;
         const char* refusing;
     } cases[] = {
-        {false, false, 10, "Trace Zeph DP SummaryJsonFile Quillet "},
         {false, true, 12, "Trace Zeph DP SummaryJsonFile Quillet "},
         {false, true, AudioServiceTypeTest, "Trace Zeph DP Rtc Quillet "},
         {true, false, 65535, "DP Quillet "},

@@ -11,7 +11,6 @@
 #include <string>
 #include <string_view>
 #include <utility>
-#include <vector>
 
 #include <sys/types.h>
 
@@ -57,23 +56,15 @@ protected:
         device.setInternalBuild(isInternal);
         session = makeSession();
     }
-    /// `L TEXT` of the category's lines above debug since the last call, `L` for the level's first letter.
-    std::vector<std::string> logged(const LogCategory& category) {
-        std::vector<std::string> texts;
+    /// The first letters of the levels of the category's lines above debug since the last call.
+    std::string loggedLevels(const LogCategory& category) {
+        std::string levels;
         for (const FakeLog::Line& line : device.log.lines()) {
             if (line.category == category.code() && line.level != LogLevel::debug) {
-                texts.push_back("disef"[static_cast<std::size_t>(line.level)] + (" " + line.text));
+                levels += "disef"[static_cast<std::size_t>(line.level)];
             }
         }
         device.log.clear();
-        return texts;
-    }
-    /// The first letters of those lines alone.
-    std::string loggedLevels(const LogCategory& category) {
-        std::string levels;
-        for (const std::string& line : logged(category)) {
-            levels += line.front();
-        }
         return levels;
     }
 

@@ -1,7 +1,10 @@
 #include "base/Format.h"
 #include "tests/workers/WorkerTest.h"
 #include "workers/sinks/ZRReportingSessionZephWorker.h"
+#include "workers/sinks/zeph/WorkerInstanceState.h"
 
+#include <functional>
+#include <map>
 #include <optional>
 #include <sstream>
 #include <thread>
@@ -17,60 +20,48 @@ constexpr const char* kSoundKey = "System_Sound_Stuck_Time_Seconds";
 const Dictionary kLow{{"issue_type", "LowRMS"}};
 const Dictionary kOpened{{"success", true}, {"session_id", "S-1"}};
 
-/// Interested in whatever has a number; keeps what happens to it.
-class ScriptedDetector final : public ZRReportingSessionZephWorkerInstance {
-public:
-    using ZRReportingSessionZephWorkerInstance::ZRReportingSessionZephWorkerInstance;
-    [[nodiscard]] bool interestedInMessage(const ZRReportingSessionMessage& message) const override {
-        return message.payload().contains("n");
-    }
-    void start() override { calls += 's'; }
-    [[nodiscard]] bool canFire() const noexcept override { return doesFire; }
-    void fire(const ZRReportingSessionMessage&) override { calls += 'F'; }
-    void handleMessage(const ZRReportingSessionMessage&) override { calls += '.'; }
-    void stop() override { calls += 'e'; }
-
-    static inline bool doesFire = true;
-    static inline std::string calls;
-};
-
 class ZephWorkerTest : public WorkerTest {
 protected:
-    ZephWorkerTest() : WorkerTest(LogLevel::debug, true) {}
+    ZephWorkerTest() : WorkerTest(LogLevel::debug, true) {
+        device.deviceProperties.set("HapticLeakCapture", true);
+    }
 
     void startSession(AudioServiceType type, bool isSingle = false) {
         session = makeSession(type);
         session->setIsSingleMessageSession(isSingle);
         session->start();
     }
-    void sendLeak(const char* key) {
+    void sendNow(const Dictionary& payload, AudioEventCategory category, AudioEventType type) {
         device.clock.advance(1ms);
-        send({{key, 90}}, AudioEventKindPlayback, AudioEventTypeJoulery);
-    }
-    void sendLow() {
-        device.clock.advance(1ms);
-        send(kLow, AudioEventKindError, AudioEventTypeIssueDetector);
+        send(payload, category, type);
     }
     /// Does what the words say; a number is a time in seconds.
     void play(const std::string& script) {
+        const std::map<std::string, std::function<void()>, std::less<>> acts{
+            {"alarms", [this] { startSession(AudioServiceTypeAlarms); }},
+            {"alerts", [this] { startSession(AudioServiceTypeAlerts); }},
+            {"test", [this] { startSession(AudioServiceTypeTest); }},
+            {"low", [this] { sendNow(kLow, AudioEventKindError, AudioEventTypeIssueDetector); }},
+            {"haptic",
+             [this] {
+                 sendNow({{kHapticKey, 90}}, 4, AudioEventTypeJoulery);
+             }},
+            {"sound",
+             [this] {
+                 sendNow({{kSoundKey, 90}}, 4, AudioEventTypeJoulery);
+             }},
+            {"start", [this] { session->start(); }},
+            {"stop", [this] { session->stop(); }},
+            {"answered", [this] { device.bugCapture.answer(kOpened); }},
+            {"failing",
+             [this] {
+                 device.bugCapture.promptAnswer = Dictionary{{"reason", 1}};
+             }},
+            {"refused", [this] { device.bugCapture.accepts = false; }}};
         std::istringstream words(script);
         for (std::string word; words >> word;) {
-            if (word == "alarms" || word == "alerts") {
-                startSession(word == "alarms" ? AudioServiceTypeAlarms : AudioServiceTypeAlerts);
-            } else if (word == "low") {
-                sendLow();
-            } else if (word == "haptic" || word == "sound") {
-                sendLeak(word == "haptic" ? kHapticKey : kSoundKey);
-            } else if (word == "start") {
-                session->start();
-            } else if (word == "stop") {
-                session->stop();
-            } else if (word == "answered") {
-                device.bugCapture.answer(kOpened);
-            } else if (word == "failing") {
-                device.bugCapture.promptAnswer = Dictionary{{"reason", 1}};
-            } else if (word == "refused") {
-                device.bugCapture.accepts = false;
+            if (const auto act = acts.find(word); act != acts.end()) {
+                act->second();
             } else {
                 device.clock.advance(std::chrono::seconds(std::stoi(word)));
             }
@@ -88,63 +79,27 @@ protected:
     }
 };
 
-TEST_F(ZephWorkerTest, DetectorsFireAtTheirThresholdsAndBeginAnew) {
+TEST(WorkerInstanceStateTest, IsDueAtTheCountOrElseAfterTheTime) {
     const struct {
-        std::optional<std::uint64_t> count; ///< without one, the state's own
+        std::optional<std::uint64_t> count;
         std::optional<std::chrono::duration<double>> duration;
-        std::vector<std::pair<std::chrono::nanoseconds, int>> steps; ///< wait, number; 0: of no interest
-        std::string calls;
-        int fired;
-        bool once = false, doesFire = true;
-        AudioServiceType serviceType = AudioServiceTypeAlarms;
-    } cases[] = {
-        {3, {}, {{0s, 1}, {0s, 2}, {0s, 3}, {0s, 4}, {0s, 5}, {0s, 6}, {0s, 7}}, "...F...F.", 2},
-        {2, {}, {{0s, 1}, {9s, 1}, {0s, 0}, {0s, 2}, {0s, 2}, {0s, 1}}, "..F..F", 2}, // repeats
-        {0, 10s, {{0s, 1}, {10s, 2}, {1ns, 3}, {9s, 4}, {11s, 5}}, "...F..F", 2},
-        {0, 10s, {{0s, 1}, {-99s, 2}, {109s, 3}, {1ns, 4}}, "....F", 1}, // the clock steps back
-        {0, {}, {{0s, 1}, {9999h, 2}}, "..", 0},
-        {{}, 1s, {{0s, 1}, {99s, 2}}, "..", 0},
-        {1, 1s, {{0s, 1}, {0s, 2}, {0s, 2}, {0s, 3}}, ".F..", 1, true},
-        {1, {}, {{0s, 1}, {0s, 2}}, "..", 0, false, false},
-        {1, {}, {{0s, 1}, {0s, 2}}, "..", 2, false, true, AudioServiceTypeTest},
-    };
-    static std::shared_ptr<WorkerInstanceState> state;
-    constexpr ZephWorkerInstanceClass scripted{
-        .name = "Scripted",
-        .messageType = AudioEventTypeState,
-        .initWithSession = [](Context& context,
-                              const auto& owner) -> std::unique_ptr<ZRReportingSessionZephWorkerInstance> {
-            auto detector = std::make_unique<ScriptedDetector>(context, owner);
-            detector->setWorkerState(state);
-            return detector;
-        }};
-    for (const auto& row : cases) {
-        state = std::make_shared<WorkerInstanceState>();
-        state->interestThresholdCount = row.count.value_or(state->interestThresholdCount);
-        state->interestThresholdDurationSeconds =
-            row.duration.value_or(state->interestThresholdDurationSeconds);
-        state->oncePerSession = row.once;
-        ScriptedDetector::doesFire = row.doesFire;
-        ScriptedDetector::calls.clear();
-        device.bugCapture.reportersMade = 0;
-        startSession(row.serviceType);
-        const auto worker = make<ZRReportingSessionZephWorker>();
-        worker->addInstance(scripted);
-        EXPECT_EQ(worker->start(), true);
-        for (const auto& [wait, number] : row.steps) {
-            device.clock.advance(wait);
-            worker->handleMessage(messageOf({{number != 0 ? "n" : "m", number}}, 4, AudioEventTypeState));
-            worker->handleMessage(messageOf({{"n", -number}}, 4, AudioEventTypeHistogram));
-        }
-        worker->stop();
-        EXPECT_EQ(ScriptedDetector::calls, "s" + row.calls + "e");
-        EXPECT_EQ(device.bugCapture.reportersMade, row.fired) << row.calls;
+        std::uint64_t seen;
+        std::chrono::nanoseconds since;
+        bool isDue;
+    } cases[] = {{3, {}, 2, 0s, false},    {3, {}, 3, 0s, true},         {1, 10s, 1, -1s, true},
+                 {0, 10s, 9, 10s, false},  {0, 10s, 1, 10s + 1ns, true}, {0, 10s, 9, -99s, false},
+                 {0, {}, 9, 9999h, false}, {{}, 1s, 9, 99s, false}};
+    for (const auto& [count, duration, seen, since, isDue] : cases) {
+        WorkerInstanceState state;
+        state.interestThresholdCount = count.value_or(state.interestThresholdCount);
+        state.interestThresholdDurationSeconds = duration.value_or(state.interestThresholdDurationSeconds);
+        state.interestedCount = seen;
+        state.interestFirstSeen = WallTime(1h);
+        EXPECT_EQ(state.isDue(WallTime(1h + since)), isDue) << seen << " " << since.count();
     }
-    state.reset();
 }
 
 TEST_F(ZephWorkerTest, EachDetectorLooksAtItsOwnMessages) {
-    device.deviceProperties.set("HapticLeakCapture", true);
     const struct {
         AudioServiceType service;
         AudioEventType type;
@@ -154,11 +109,9 @@ TEST_F(ZephWorkerTest, EachDetectorLooksAtItsOwnMessages) {
         bool isSingle = false;
     } cases[] = {
         {4, 8, 4, {{kHapticKey, "x"}, {kSoundKey, false}}, "HapticLeaks SSSLeaks "},
-        {4, 8, 4, {{kHapticKey, 1}, {kSoundKey, 1}}, "HapticLeaks SSSLeaks ", true},
-        {2, 8, 0xFFFFFFFF, {{kSoundKey, 1}}, "SSSLeaks "},
+        {2, 8, 0xFFFFFFFF, {{kHapticKey, 1}, {kSoundKey, 1}}, "HapticLeaks SSSLeaks ", true},
         {4, 7, 11, {{kHapticKey, 1}, {kSoundKey, 1}}, ""},
         {4, 7, 11, kLow, "AlarmLowRMS "},
-        {11, 7, 11, kLow, "AlarmLowRMS "},
         {4, 7, 11, kLow, "", true},
         {2, 7, 11, kLow, ""},
         {4, 7, 0x0800000B, kLow, ""},
@@ -199,27 +152,29 @@ TEST_F(ZephWorkerTest, DetectorsAskForCaptures) {
         {"a capture that failed is cancelled, too", "alarms failing low low low stop",
          "start alarms; cancel NONE_RETURNED; "},
         {"one that was refused is not", "alarms refused low low low stop", "start alarms; "},
+        {"a test goes as far as to make a reporter", "test low low low sound stop", ""},
     };
-    device.deviceProperties.set("HapticLeakCapture", true);
     for (const auto& row : cases) {
         session.reset();
         device.restart();
         device.bugCapture.accepts = true;
         device.bugCapture.promptAnswer.reset();
         device.bugCapture.replies.clear();
+        device.bugCapture.reportersMade = 0;
         play(row.script);
         EXPECT_EQ(asked(), row.asked) << row.what;
     }
+    EXPECT_EQ(device.bugCapture.reportersMade, 2);
 }
 
 TEST_F(ZephWorkerTest, CapturesSayWhatTheyAreOf) {
-    device.deviceProperties.set("HapticLeakCapture", true);
     play("alarms haptic haptic low low low");
     std::string found;
-    for (const auto& [operation, processes, filed, duration, payload, identifier] :
-         device.bugCapture.requests) {
-        found += formatted("{}/{}/{}/{}/{} {} {}\n", filed.domain, filed.type, filed.subType,
-                           filed.subTypeContext, filed.detectedProcess, duration.count(), jsonText(payload));
+    for (const auto& request : device.bugCapture.requests) {
+        const BugCaptureSignature& filed = request.signature;
+        found +=
+            formatted("{}/{}/{}/{}/{} {} {}\n", filed.domain, filed.type, filed.subType, filed.subTypeContext,
+                      filed.detectedProcess, request.duration.count(), jsonText(request.payload));
     }
     EXPECT_EQ(found, "Tonmetry/haptics/Playback/Joulery/Unknown 0.000000 "
                      R"({"diagnostic_extension_parameters":)"
@@ -247,21 +202,21 @@ TEST_F(ZephWorkerTest, AnswersComeOnAnyThreadAndWhenEverythingIsGone) {
 TEST_F(ZephWorkerTest, RepliesSayWhetherThereIsACapture) {
     const struct {
         Dictionary response;
-        const char* line;
+        const char* levels;
         const char* identifier = "NONE_RETURNED";
     } cases[] = {
-        {{{"success", 1.0}, {"session_id", 17}}, "i Started Zeph session. sessionId=17", "17"},
-        {{{"success", true}, {"reason", 3}}, "e Started Zeph session, but no sessionId found!"},
-        {{{"success", 2}, {"session_id", "S"}}, "e Failed starting zeph session. Unknown reason."},
-        {{{"reason", "none"}}, "e Failed starting zeph session. reason=kGlarnErrorNone"},
-        {{{"reason", 0x1'0000'0000}}, "e Failed starting zeph session. reason=kGlarnErrorNone"},
-        {{{"reason", 9}}, "i Failed starting zeph session. reason=kGlarnErrorRequestThrottled"},
-        {{{"reason", 10}}, "i Failed starting zeph session. reason=10"},
-        {{{"reason", 0xFFFF'FFFF}}, "i Failed starting zeph session. reason=-1"},
+        {{{"success", 1.0}, {"session_id", 17}}, "i", "17"},
+        {{{"success", true}, {"reason", 3}}, "e"},
+        {{{"success", 2}, {"session_id", "S"}}, "e"},
+        {{{"reason", "none"}}, "e"},
+        {{{"reason", 0x1'0000'0000}}, "e"},
+        {{{"reason", 9}}, "i"},
+        {{{"reason", 10}}, "i"},
+        {{{"reason", 0xFFFF'FFFF}}, "i"},
     };
-    for (const auto& [response, line, identifier] : cases) {
+    for (const auto& [response, levels, identifier] : cases) {
         EXPECT_EQ(ZRReportingSessionZephWorker::getSessionIdentifierFromResponse(response), identifier);
-        EXPECT_THAT(logged(ZRReportingZephLogCategory()), ElementsAre(line));
+        EXPECT_EQ(loggedLevels(ZRReportingZephLogCategory()), levels);
     }
 }
 
