@@ -117,6 +117,7 @@ TEST(Decode, FramesThatAreNoneAreNamed) {
         {"01000000A0", "not a request that the service would accept (-32600): the frame is not an array"},
         {"0100000084", "not CBOR: the item ends too early"},
         {"04000000830103F6", "not a reply as the protocol has them"},
+        {"05000000840103F5F5", "not a reply as the protocol has them"},
         {"050000008401", "cut short: 6 of 9 bytes are there"},
         {"0500", "cut short: 2 of 4 bytes are there"},
         {"0100100080", "its length, 1048577, is beyond the longest, 1048576"},
@@ -126,6 +127,8 @@ TEST(Decode, FramesThatAreNoneAreNamed) {
         EXPECT_EQ(decoded.text, "{\"frame\":\"reply\",\"id\":3,\"error\":null,\"result\":true}\n");
         EXPECT_THAT(decoded.problems, ElementsAre("frame 2: " + problem));
     }
+    EXPECT_THAT(decode("0", EncodedKind::frame).problems,
+                ElementsAre("frame 1: cut short: 1 of 4 bytes are there"));
 }
 
 } // namespace
