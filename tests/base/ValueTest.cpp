@@ -1,5 +1,5 @@
 #include "base/Value.h"
-#include "base/Dictionary.h"
+#include "base/Json.h"
 
 #include <gtest/gtest.h>
 
@@ -40,11 +40,11 @@ TEST(Value, NumbersAreEqualByValueAcrossKinds) {
         {Value(Array{1, "a"}), Value(Array{1.0, "a"})},
         {Value(Dictionary{{"a", 1}}), Value(Dictionary{{"a", true}})},
         {Value(Dictionary{{"b", 1}})}};
-    for (std::size_t i = 0; i < classes.size(); ++i) {
-        for (std::size_t j = 0; j < classes.size(); ++j) {
-            for (const Value& a : classes[i]) {
-                for (const Value& b : classes[j]) {
-                    EXPECT_EQ(a == b, i == j) << "classes " << i << " and " << j;
+    for (const auto& some : classes) {
+        for (const auto& others : classes) {
+            for (const Value& a : some) {
+                for (const Value& b : others) {
+                    EXPECT_EQ(a == b, &some == &others) << jsonText(a) << " and " << jsonText(b);
                 }
             }
         }

@@ -110,16 +110,6 @@ TEST(MetricRecord, APrefixIsAcceptedExactlyWhereAFieldEnds) {
     EXPECT_EQ(readAs(bytes), "128 -1 abc||de");
 }
 
-TEST(MetricRecord, IsShownAsText) {
-    EXPECT_EQ(written({128, -1, "a", {}, {}}),
-              bytesOf("08 8001 10 FFFFFFFFFFFFFFFFFF01 1A 01 61 22 00 2A 00"));
-    std::string text;
-    tools::appendRecordText(text, {~0ULL, -5, "Ger\xC3\xA4t\n\t\r", "\"'\\\x01\x7F", "\xC3\xA4\xFF"});
-    EXPECT_EQ(text, "AudioIssueDetected {\n  duration: -5\n  issuetype: \"Ger\xC3\xA4t\\n\\t\\r\"\n"
-                    "  node: \"\\\"\\'\\\\\\001\\177\"\n  rtaidclient: \"\\303\\244\\377\"\n"
-                    "  timestamp: 18446744073709551615\n}\n");
-}
-
 /// What the Protocol Buffers compiler makes of the input by the published description; `act` is `encode`
 /// (from text) or `decode` (to text).
 std::string protoc(const std::string& act, const std::string& input) {
@@ -169,6 +159,13 @@ TEST(MetricRecord, AgreesWithAnIndependentImplementation) {
             EXPECT_EQ(protoc("encode", text.substr(start, text.rfind('}') - start)), bytes);
         }
     }
+    EXPECT_EQ(written({128, -1, "a", {}, {}}),
+              bytesOf("08 8001 10 FFFFFFFFFFFFFFFFFF01 1A 01 61 22 00 2A 00"));
+    std::string text;
+    tools::appendRecordText(text, {~0ULL, -5, "Ger\xC3\xA4t\n\t\r", "\"'\\\x01\x7F", "\xC3\xA4\xFF"});
+    EXPECT_EQ(text, "AudioIssueDetected {\n  duration: -5\n  issuetype: \"Ger\xC3\xA4t\\n\\t\\r\"\n"
+                    "  node: \"\\\"\\'\\\\\\001\\177\"\n  rtaidclient: \"\\303\\244\\377\"\n"
+                    "  timestamp: 18446744073709551615\n}\n");
     if (!hasProtoc) {
         GTEST_SKIP() << "protoc is not installed (Debian: protobuf-compiler)";
     }
