@@ -1,8 +1,11 @@
 #include "os/DirectoryWatcher.h"
 
+#include "base/Format.h"
+
 #include <array>
 #include <cerrno>
 #include <cstring>
+#include <system_error>
 #include <utility>
 
 #include <sys/inotify.h>
@@ -56,6 +59,10 @@ void DirectoryWatcher::watch() {
         error_ = watch < 0 ? errno : 0;
     }
     replaceWatch(directoryWatch_, watch);
+}
+
+std::string DirectoryWatcher::fault() const {
+    return error_ == 0 ? "" : formatted("{}: {}", directory_, std::generic_category().message(error_));
 }
 
 int DirectoryWatcher::watchNearestParent() {

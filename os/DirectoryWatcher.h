@@ -31,8 +31,8 @@ public:
     [[nodiscard]] int fileDescriptor() const noexcept { return inotify_.get(); }
     /// Hands over everything that has happened up to now, in order, without waiting.
     void read(const Handler& handler);
-    /// The `errno` that keeps the directory, or the return of a missing one, from being watched; or 0.
-    [[nodiscard]] int error() const noexcept { return error_; }
+    /// What keeps the directory, or the return of a missing one, from being watched, with its path; or empty.
+    [[nodiscard]] std::string fault() const;
     [[nodiscard]] const std::string& directory() const noexcept { return directory_; }
 
 private:

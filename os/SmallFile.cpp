@@ -21,6 +21,8 @@ SmallFile SmallFile::read(const std::string& path, std::size_t limit, Links link
     }
     // The kernel's own files have no size.
     const auto size = static_cast<std::size_t>(status.st_size);
+    const FileState state = FileState::of(status);
+    const bool isStateOld = state.isOld();
     SmallFile content;
     if (!S_ISREG(status.st_mode)) {
         content.error = S_ISDIR(status.st_mode) ? EISDIR : EINVAL;
@@ -29,7 +31,8 @@ SmallFile SmallFile::read(const std::string& path, std::size_t limit, Links link
     } else {
         content = read(file.get(), limit, size);
     }
-    content.state = FileState::of(status);
+    content.state = state;
+    content.isStateOld = isStateOld;
     return content;
 }
 

@@ -28,8 +28,9 @@ struct SmallFile {
     [[nodiscard]] std::string_view trimmed() const noexcept;
 
     int error = 0;
-    std::string text = {}; ///< empty after an error
-    FileState state = {};  ///< just before it was read; that of no file when it could not be opened
+    std::string text = {};   ///< empty after an error
+    FileState state = {};    ///< just before it was read; that of no file when it could not be opened
+    bool isStateOld = false; ///< so that the state stands for this content for certain
 };
 
 } // namespace tamblo

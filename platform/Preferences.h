@@ -1,6 +1,7 @@
 #pragma once
 
 #include "base/Value.h"
+#include "platform/WorkQueue.h"
 
 #include <optional>
 #include <string>
@@ -16,10 +17,11 @@ public:
     /// The value that is stored now, or nothing.
     [[nodiscard]] virtual std::optional<Value> copyPreferenceValue(std::string_view key,
                                                                    std::string_view domain) const = 0;
-    /// Stores a value beside the others of the domain: other processes read it, and it outlives this one,
-    /// from now on. Answers what went wrong, or nothing. This process reads the new value in either case.
-    [[nodiscard]] virtual std::optional<std::string>
-    setPreferenceValue(std::string_view key, std::string_view domain, const Value& value) = 0;
+    /// Sets a value beside the others of the domain. This process reads it from now on; it is stored, for
+    /// other processes and those to come, on a thread that may wait for the disk, and then `afterwards` is
+    /// called there, if there is one. What cannot be stored is told in the log. Does not block.
+    virtual void setPreferenceValue(std::string_view key, std::string_view domain, const Value& value,
+                                    Work afterwards) = 0;
 };
 
 /// The values of one domain, read as what the caller takes them for. Every call asks the store.
@@ -42,8 +44,8 @@ public:
         const std::optional<Value> value = store_.copyPreferenceValue(key, domain_);
         return value && value->boolValue();
     }
-    [[nodiscard]] std::optional<std::string> setValue(std::string_view key, const Value& value) {
-        return store_.setPreferenceValue(key, domain_, value);
+    void setValue(std::string_view key, const Value& value, Work afterwards = {}) {
+        store_.setPreferenceValue(key, domain_, value, std::move(afterwards));
     }
 
 private:

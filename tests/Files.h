@@ -48,8 +48,9 @@ namespace tamblo {
 /// A directory that goes away with its owner.
 class TemporaryDirectory {
 public:
-    TemporaryDirectory() {
-        std::string pattern = (std::filesystem::temp_directory_path() / "tamblo-test-XXXXXX").string();
+    explicit TemporaryDirectory(
+        const std::filesystem::path& parent = std::filesystem::temp_directory_path()) {
+        std::string pattern = (parent / "tamblo-test-XXXXXX").string();
         if (::mkdtemp(pattern.data()) == nullptr) {
             throw std::runtime_error("no temporary directory");
         }

@@ -23,7 +23,7 @@ namespace {
 constexpr int kDrivers = 10;
 constexpr int kChannelsOfDriver = 20;
 /// Long enough for the kept content of a file to be certain.
-constexpr std::chrono::milliseconds kUntilCertain = 3 * ChanlogFiles::kCertainAge;
+constexpr std::chrono::milliseconds kUntilCertain = 3 * FileState::kCertainAge;
 
 constexpr std::array<const char*, 9> kGroups{
     R"("group": "VandraAE2MCA")", R"("group": "Speaker")",

@@ -5,6 +5,7 @@
 #include "base/TextBuffer.h"
 #include "platform/linux/device/LinuxClock.h"
 #include "platform/linux/log/LinuxStructuredLog.h"
+#include "platform/linux/loop/LinuxWorkQueues.h"
 #include "platform/linux/settings/LinuxPreferences.h"
 #include "platform/linux/sinks/LinuxAnalyticsEventService.h"
 
@@ -49,7 +50,8 @@ void eventsIntoFile(benchmark::State& state) {
     const TemporaryDirectory directory;
     const LinuxClock clock;
     LinuxStructuredLog log;
-    const LinuxPreferences preferences(directory.path(), log);
+    LinuxWorkQueues workQueues;
+    const LinuxPreferences preferences(directory.path(), workQueues, log);
     SinkFiles sinks(directory.path(), log);
     LinuxAnalyticsEventService events(sinks, clock, preferences, log);
     std::size_t i = 0;

@@ -127,7 +127,7 @@ struct LinuxPlatform::Services {
     LinuxDeviceProperties& deviceProperties =
         provide<LinuxDeviceProperties>(platform.deviceProperties, directories.deviceProperties(), log);
     LinuxPreferences& preferences =
-        provide<LinuxPreferences>(platform.preferences, directories.preferences(), log);
+        provide<LinuxPreferences>(platform.preferences, directories.preferences(), workQueues, log);
     SinkFiles& sinks = sinkFiles.emplace(directories.logs, log);
     LinuxAnalyticsEventService& analyticsEvents =
         provide<LinuxAnalyticsEventService>(platform.analyticsEvents, sinks, clock, preferences, log);

@@ -136,7 +136,7 @@ TEST_F(LinuxChanlogTest, ASampleIsOneReadingAndSeesEveryChange) {
         EXPECT_EQ(textOf(std::get<ChanlogChannels>(moment->sample(*subscription))), formatted("a={}", i));
     }
     EXPECT_EQ(textOf(subscription->subscribedChannels()), "a=0");
-    std::this_thread::sleep_for(2 * ChanlogFiles::kCertainAge);
+    std::this_thread::sleep_for(2 * FileState::kCertainAge);
     (void)sample();
     const ChanlogChannels old = facility.readAll();
     EXPECT_EQ(facility.readAll(), old) << "a file that is certainly the same is not read again";

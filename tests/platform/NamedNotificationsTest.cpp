@@ -8,30 +8,25 @@
 #include <algorithm>
 #include <atomic>
 #include <cerrno>
-#include <chrono>
-#include <cstdint>
-#include <filesystem>
-#include <fstream>
 #include <future>
 #include <memory>
 #include <thread>
-#include <utility>
-#include <vector>
 
 #include <sys/stat.h>
 
 namespace tamblo {
 namespace {
 
+namespace fs = std::filesystem;
 using testing::ElementsAre;
 using testing::HasSubstr;
 using testing::IsEmpty;
-using testing::UnorderedElementsAre;
+using State = std::pair<int, std::uint64_t>;
 
 class NamedNotificationsTest : public testing::Test {
 protected:
     NamedNotificationsTest() {
-        std::filesystem::create_directory(path_); // watched from before it is there
+        fs::create_directory(path_); // watched from before it is there
         deliver();
     }
 
@@ -62,7 +57,7 @@ protected:
         queue_.runAll();
         return std::exchange(calls_, {});
     }
-    [[nodiscard]] std::pair<int, std::uint64_t> state(int token) {
+    [[nodiscard]] State state(int token) {
         const auto [status, word] = notifications_.GetNamedNotificationState(token);
         return {status, word};
     }
@@ -78,7 +73,7 @@ protected:
 
 TEST_F(NamedNotificationsTest, ReadsTheWordThatStandsInTheFile) {
     const int token = add("n");
-    EXPECT_EQ(state(token), std::pair(ENOENT, 0UL));
+    EXPECT_EQ(state(token), State(ENOENT, 0));
     const struct {
         std::string text;
         int status;
@@ -86,51 +81,39 @@ TEST_F(NamedNotificationsTest, ReadsTheWordThatStandsInTheFile) {
     } cases[] = {
         {"1", 0, 1},
         {" \t7\r\n", 0, 7},
-        {"007\n", 0, 7},
         {"18446744073709551615\n", 0, UINT64_MAX},
         {"18446744073709551616", ERANGE, 0},
-        {"99999999999999999999x", EBADMSG, 0},
-        {"", EBADMSG, 0},
         {" \n", EBADMSG, 0},
         {"-1", EBADMSG, 0},
-        {"+1", EBADMSG, 0},
-        {"0x10", EBADMSG, 0},
-        {"1 2", EBADMSG, 0},
-        {"1.0", EBADMSG, 0},
+        {" 1 2", EBADMSG, 0},
         {std::string("1\0", 2), EBADMSG, 0},
         {std::string(256, ' ') + "1", EFBIG, 0},
         {std::string(255, ' ') + "1", 0, 1},
-        {std::string(3UL << 20, '1'), EFBIG, 0},
     };
     for (const auto& [text, status, word] : cases) {
         post("n", text);
-        EXPECT_EQ(state(token), std::pair(status, word)) << text.substr(0, 40);
+        EXPECT_EQ(state(token), State(status, word)) << text;
         EXPECT_EQ(state(token).first, status);
         const bool isRubbish = status != 0 && text.find_first_not_of(" \n") != std::string::npos;
-        EXPECT_EQ(log_.take().size(), isRubbish ? 1U : 0U) << text.substr(0, 40);
+        EXPECT_EQ(log_.take().size(), isRubbish ? 1U : 0U) << text;
     }
     post("n", " 1 2");
     (void)state(token);
     EXPECT_THAT(log_.take(), ElementsAre("3 zrrs " + path_ +
                                          "/n: byte 2: not a 64-bit number in decimal; it is not used"));
-    EXPECT_EQ(state(token + 1), std::pair(EBADF, 0UL));
-    EXPECT_EQ(state(0), std::pair(EBADF, 0UL));
-
-    std::filesystem::create_directory(path_ + "/directory");
+    EXPECT_EQ(state(token + 1), State(EBADF, 0));
     ASSERT_EQ(::mkfifo((path_ + "/pipe").c_str(), 0600), 0);
-    post("target", "1");
-    std::filesystem::create_symlink("target", path_ + "/link");
-    for (const auto& [name, status] : {std::pair("directory", EISDIR), {"pipe", EINVAL}, {"link", ELOOP}}) {
-        EXPECT_EQ(state(add(name)), std::pair(status, 0UL)) << name;
-    }
+    fs::create_symlink("n", path_ + "/link");
+    EXPECT_EQ(state(add("pipe")), State(EINVAL, 0));
+    EXPECT_EQ(state(add("link")), State(ELOOP, 0));
 }
 
 TEST_F(NamedNotificationsTest, OnlyAPlainFileNameCanBeRegistered) {
     using namespace std::string_view_literals;
     const std::string longest(255, 'x'), tooLong(256, 'x');
     const std::pair<std::string_view, int> cases[] = {
-        {"", EINVAL},   {".", EINVAL},      {"..", EINVAL},   {".n", EINVAL},          {"a/b", EINVAL},
-        {"/n", EINVAL}, {"a\0b"sv, EINVAL}, {"../n", EINVAL}, {tooLong, ENAMETOOLONG},
+        {"", EINVAL},     {"..", EINVAL},     {".n", EINVAL},
+        {"../n", EINVAL}, {"a\0b"sv, EINVAL}, {tooLong, ENAMETOOLONG},
     };
     for (const auto& [name, expected] : cases) {
         const auto [status, token] = notifications_.RegisterNamedNotification(name, queue_, [](int) {});
@@ -142,25 +125,19 @@ TEST_F(NamedNotificationsTest, OnlyAPlainFileNameCanBeRegistered) {
     EXPECT_THAT(callsAfterChange(), ElementsAre(token));
 }
 
-TEST_F(NamedNotificationsTest, EveryKindOfPostCallsEachRegistrationOfItsName) {
+TEST_F(NamedNotificationsTest, APostCallsEachRegistrationOfItsName) {
     const int first = add("n"), second = add("n"), other = add("other");
-    EXPECT_NE(first, second);
-    post("n", "1");
-    EXPECT_THAT(callsAfterChange(), UnorderedElementsAre(first, second));
-    post("n", "1"); // the same word again
-    EXPECT_THAT(callsAfterChange(), UnorderedElementsAre(first, second));
-    directory_.write("new", "2");
-    std::filesystem::rename(directory_.path("new"), path_ + "/n");
-    EXPECT_THAT(callsAfterChange(), UnorderedElementsAre(first, second));
-    EXPECT_EQ(state(first), std::pair(0, 2UL));
-    std::filesystem::remove(path_ + "/n");
-    EXPECT_THAT(callsAfterChange(), UnorderedElementsAre(first, second));
-    EXPECT_EQ(state(second), std::pair(ENOENT, 0UL));
+    for (int repeat = 0; repeat < 2; ++repeat) { // the same word again
+        post("n", "1");
+        EXPECT_THAT(callsAfterChange(), ElementsAre(first, second));
+    }
+    fs::remove(path_ + "/n");
+    EXPECT_THAT(callsAfterChange(), ElementsAre(first, second));
+    EXPECT_EQ(state(second), State(ENOENT, 0));
     post("nobody", "1");
     post("other", "3");
     EXPECT_THAT(callsAfterChange(), ElementsAre(other));
     EXPECT_THAT(queue_.takePaces(), testing::Each(Pace::mayBlock));
-    EXPECT_FALSE(isReadable(notifications_.fileDescriptor(), 0)) << "at rest";
     post("other", "4");
     int preparations = 0;
     notifications_.deliverPosts([&] {
@@ -182,41 +159,37 @@ TEST_F(NamedNotificationsTest, TheServicesOwnPostIsOneAndKeepsTheWord) {
             (void)callsAfterChange();
         }
         EXPECT_EQ(notifications_.PostNamedNotification("n"), 0);
-        (void)queue_.takePaces();
         EXPECT_THAT(callsAfterChange(), ElementsAre(token));
         EXPECT_EQ(directory_.read("notifications/n"), std::to_string(word) + "\n");
     }
+    fs::remove(path_ + "/n");
     EXPECT_THAT(log_.take(), IsEmpty());
-}
-
-TEST_F(NamedNotificationsTest, APostThatFailsIsToldOncePerOutage) {
-    const std::string fault = "3 zrrs " + path_ + "/n: Is a directory; the notification is not posted";
     for (int outage = 0; outage < 2; ++outage) {
-        std::filesystem::create_directory(path_ + "/n");
+        fs::create_directory(path_ + "/n");
         EXPECT_EQ(notifications_.PostNamedNotification("n"), EISDIR);
         EXPECT_EQ(notifications_.PostNamedNotification("n"), EISDIR);
-        std::filesystem::remove(path_ + "/n");
+        fs::remove(path_ + "/n");
         EXPECT_EQ(notifications_.PostNamedNotification("n"), 0);
-        std::filesystem::remove(path_ + "/n");
-        EXPECT_THAT(log_.take(), ElementsAre(fault));
+        fs::remove(path_ + "/n");
+        EXPECT_THAT(log_.take(),
+                    ElementsAre("3 zrrs " + path_ + "/n: Is a directory; the notification is not posted"));
     }
-    std::filesystem::create_symlink("n", path_ + "/link");
+    fs::create_symlink("n", path_ + "/link");
     EXPECT_EQ(notifications_.PostNamedNotification("link"), ELOOP);
     EXPECT_EQ(notifications_.PostNamedNotification(".n"), EINVAL);
 }
 
 TEST_F(NamedNotificationsTest, ABurstIsOneWaitingCallThatSeesTheLastState) {
     std::vector<std::uint64_t> seen;
-    const int token = add("n", [&](int called) {
+    add("n", [&](int called) {
         seen.push_back(state(called).second);
         if (seen.size() == 1) {
             post("n", "8");
             deliver();
         }
     });
-    post("n", "1000");
-    for (int word = 1000; word <= 5000; ++word) {
-        std::fstream(path_ + "/n") << word; // in place: emptying a file first makes a disk work
+    for (int word = 1; word <= 100; ++word) {
+        post("n", std::to_string(word));
         if (word % 7 == 0) {
             deliver();
         }
@@ -224,52 +197,21 @@ TEST_F(NamedNotificationsTest, ABurstIsOneWaitingCallThatSeesTheLastState) {
     deliver();
     EXPECT_EQ(queue_.takePaces().size(), 1U);
     queue_.runAll();
-    EXPECT_THAT(seen, ElementsAre(5000, 8)) << "what comes while the handler runs is another call";
-    EXPECT_EQ(state(token), std::pair(0, 8UL));
-}
-
-TEST_F(NamedNotificationsTest, APostThatTheKernelCouldNotRememberIsSeen) {
-    const int token = add("n");
-    int limit = 0;
-    std::ifstream("/proc/sys/fs/inotify/max_queued_events") >> limit;
-    if (limit <= 0 || limit > 100'000) {
-        GTEST_SKIP() << "the kernel remembers " << limit;
-    }
-    post("a", "");
-    post("b", "");
-    for (int i = 0; i <= limit; ++i) { // taking turns, since a repetition of the last event is left out
-        std::fstream(path_ + (i % 2 == 0 ? "/a" : "/b"));
-    }
-    post("n", "7");
-    EXPECT_THAT(callsAfterChange(), ElementsAre(token));
-    EXPECT_EQ(state(token), std::pair(0, 7UL));
+    EXPECT_THAT(seen, ElementsAre(100, 8)) << "what comes while the handler runs is another call";
 }
 
 TEST_F(NamedNotificationsTest, ThreadsPostReadAndRegisterAtOnce) {
     LinuxWorkQueues queues;
     const auto queue = queues.makeSerialQueue("notifications");
     constexpr std::uint64_t kLast = 300;
-    std::promise<void> lastSeen;
+    std::atomic<bool> isDone{false};
     // Unguarded: the queue is the guard.
     std::vector<std::uint64_t> seen;
-    bool isLastSeen = false;
     const auto handler = [&](int called) {
-        const auto [status, word] = state(called);
-        EXPECT_EQ(status, 0);
-        seen.push_back(word);
-        if (word == kLast && !std::exchange(isLastSeen, true)) {
-            lastSeen.set_value();
-        }
+        seen.push_back(state(called).second);
+        isDone = isDone || seen.back() == kLast;
     };
     const int token = notifications_.RegisterNamedNotification("n", *queue, handler).token;
-    std::atomic<bool> isDone{false};
-    std::thread loop([&] {
-        while (!isDone) {
-            if (isReadable(notifications_.fileDescriptor(), 10)) {
-                notifications_.deliverPosts();
-            }
-        }
-    });
     std::thread others([&] {
         while (!isDone) {
             notifications_.CancelNamedNotification(
@@ -277,13 +219,19 @@ TEST_F(NamedNotificationsTest, ThreadsPostReadAndRegisterAtOnce) {
             (void)notifications_.GetNamedNotificationState(token);
         }
     });
-    for (std::uint64_t word = 1; word <= kLast; ++word) {
-        directory_.write("new", std::to_string(word));
-        std::filesystem::rename(directory_.path("new"), path_ + "/n");
+    std::thread poster([&] {
+        for (std::uint64_t word = 1; word <= kLast; ++word) {
+            directory_.write("new", std::to_string(word));
+            fs::rename(directory_.path("new"), path_ + "/n");
+        }
+    });
+    for (int wait = 0; wait < 2000 && !isDone; ++wait) {
+        if (isReadable(notifications_.fileDescriptor(), 10)) {
+            notifications_.deliverPosts();
+        }
     }
-    EXPECT_EQ(lastSeen.get_future().wait_for(std::chrono::seconds(20)), std::future_status::ready);
-    isDone = true;
-    loop.join();
+    EXPECT_TRUE(isDone.exchange(true)) << "the last word is seen";
+    poster.join();
     others.join();
     std::promise<void> atRest;
     queue->post([&] {
@@ -294,7 +242,7 @@ TEST_F(NamedNotificationsTest, ThreadsPostReadAndRegisterAtOnce) {
     EXPECT_TRUE(std::ranges::is_sorted(seen));
 }
 
-TEST_F(NamedNotificationsTest, NoCallFollowsACancellation) {
+TEST_F(NamedNotificationsTest, NoCallFollowsACancellationOrTheirEnd) {
     const auto held = std::make_shared<int>();
     const int first = add("n", [held](int) {});
     const int itself = add("n", [this, held](int called) {
@@ -302,67 +250,39 @@ TEST_F(NamedNotificationsTest, NoCallFollowsACancellation) {
         calls_.push_back(held != nullptr ? -1 : 0); // what it holds is still there
     });
     const int remaining = add("n");
+    auto others = std::make_unique<LinuxNamedNotifications>(path_, log_);
+    (void)others->RegisterNamedNotification("n", queue_, [held](int) { FAIL(); });
     post("n", "1");
     deliver();
+    others->deliverPosts();
+    EXPECT_EQ(queue_.takePaces().size(), 4U);
     notifications_.CancelNamedNotification(first); // its call waits on the queue
     notifications_.CancelNamedNotification(first);
     notifications_.CancelNamedNotification(4711);
+    others.reset();
     queue_.runAll();
     EXPECT_THAT(std::exchange(calls_, {}), ElementsAre(itself, -1, remaining));
     EXPECT_EQ(held.use_count(), 1) << "the handlers are gone";
-    EXPECT_EQ(state(itself), std::pair(EBADF, 0UL));
+    EXPECT_EQ(state(itself), State(EBADF, 0));
     post("n", "2");
     EXPECT_THAT(callsAfterChange(), ElementsAre(remaining));
 }
 
-TEST_F(NamedNotificationsTest, CallsOutliveTheNotifications) {
-    auto notifications = std::make_unique<LinuxNamedNotifications>(path_, log_);
-    const auto registration = notifications->RegisterNamedNotification(
-        "n", queue_, [this](int called) { calls_.push_back(called); });
-    post("n", "1");
-    notifications->deliverPosts();
-    notifications.reset();
-    queue_.runAll();
-    EXPECT_THAT(calls_, ElementsAre(registration.token));
-}
-
-TEST_F(NamedNotificationsTest, TheDirectoryVanishesAndComesBack) {
+TEST_F(NamedNotificationsTest, AnythingMayHaveChangedWhenTheDirectoryComesOrGoes) {
     const int first = add("a"), second = add("b");
-    post("a", "1");
-    EXPECT_THAT(callsAfterChange(), ElementsAre(first));
-    std::filesystem::rename(path_, directory_.path("away"));
+    fs::remove(path_);
+    fs::create_symlink("notifications", path_);
     EXPECT_THAT(callsAfterChange(), ElementsAre(first, second));
-    EXPECT_EQ(state(first), std::pair(ENOENT, 0UL));
-    directory_.write("away/b", "2");
-    std::filesystem::rename(directory_.path("away"), path_);
-    EXPECT_THAT(callsAfterChange(), ElementsAre(first, second));
-    EXPECT_EQ(state(second), std::pair(0, 2UL));
-    std::filesystem::remove_all(path_);
-    std::filesystem::create_directory(path_);
-    EXPECT_THAT(callsAfterChange(), UnorderedElementsAre(first, second));
-    post("b", "3");
-    EXPECT_THAT(callsAfterChange(), ElementsAre(second));
-    EXPECT_THAT(log_.take(), IsEmpty());
-}
-
-TEST_F(NamedNotificationsTest, ADirectoryThatCannotBeWatchedIsToldOnceAndTakenUpLater) {
-    const int token = add("n");
-    std::filesystem::remove(path_);
-    std::filesystem::create_symlink("notifications", path_);
-    EXPECT_THAT(callsAfterChange(), ElementsAre(token));
     directory_.write("unrelated", "1");
-    const int another = add("n");
-    EXPECT_EQ(state(another), std::pair(ELOOP, 0UL));
+    EXPECT_EQ(state(first), State(ELOOP, 0));
     EXPECT_THAT(log_.take(),
                 ElementsAre(HasSubstr("3 zrrs " + path_ + ": Too many levels of symbolic links; "),
-                            HasSubstr("3 zrrs " + path_ + "/n: Too many levels of symbolic links; ")));
-    std::filesystem::remove(path_);
-    std::filesystem::create_directory(path_);
-    post("n", "7");
-    EXPECT_THAT(callsAfterChange(), UnorderedElementsAre(token, another));
-    post("n", "8");
-    EXPECT_THAT(callsAfterChange(), UnorderedElementsAre(token, another));
-    EXPECT_EQ(state(token), std::pair(0, 8UL));
+                            HasSubstr("3 zrrs " + path_ + "/a: Too many levels of symbolic links; ")));
+    fs::remove(path_);
+    fs::create_directory(path_);
+    post("b", "7");
+    EXPECT_THAT(callsAfterChange(), ElementsAre(first, second));
+    EXPECT_EQ(state(second), State(0, 7));
     EXPECT_THAT(log_.take(), IsEmpty());
 }
 

@@ -1,5 +1,6 @@
 #include "platform/linux/sinks/LinuxAnalyticsEventService.h"
 #include "platform/linux/sinks/LinuxReportFiles.h"
+#include "tests/fakes/FakeWorkQueues.h"
 #include "tests/platform/FaultyOperations.h"
 #include "tests/platform/LinuxServiceSupport.h"
 
@@ -50,7 +51,8 @@ protected:
     TemporaryDirectory directory_;
     const std::string path_ = directory_.path("preferences");
     RecordingLog log_;
-    LinuxPreferences preferences_{path_, log_};
+    FakeWorkQueues queues_;
+    LinuxPreferences preferences_{path_, queues_, log_};
     SteppingClock clock_;
     SinkFiles sinks_{directory_.path(), log_};
     LinuxAnalyticsEventService events_{sinks_, clock_, preferences_, log_};

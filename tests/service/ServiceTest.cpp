@@ -267,18 +267,18 @@ TEST(Service, APreferenceThatCannotBeStoredLeavesItsFileWhole) {
         return linesOf(service.logs() / "bug-report-drafts.jsonl").size();
     };
     EXPECT_EQ(drafts(), 1U);
-    EXPECT_EQ(contentOf(file), preferences);
     EXPECT_EQ(drafts(), 1U) << "the service itself knows";
+    service.stop(); // which waits for what is still to be stored
+    EXPECT_EQ(contentOf(file), preferences);
 
     // Once there is room, the time of a draft is the device's: another run of the service keeps to it.
-    service.stop();
     service.start();
     service.liftFileSizeLimit();
     EXPECT_EQ(drafts(), 2U);
+    service.stop();
     EXPECT_THAT(contentOf(file),
                 testing::ContainsRegex(R"(^\{"TalvixInvalidXyBackOffSeconds":3600,)"
                                        R"("TalvixInvalidXyQLTlastRun":[0-9]{10}\.[0-9]+,"other":\[")"));
-    service.stop();
     service.start();
     EXPECT_EQ(drafts(), 2U);
     EXPECT_EQ(entriesOf(file.parent_path()), 1) << "nothing is left over";

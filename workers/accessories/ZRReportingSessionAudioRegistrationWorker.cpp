@@ -47,18 +47,16 @@ void lookUp(Context& context) {
         log::error(ZRReportingAudioRegistrationCategory(),
                    "{}: {} holds what is no accessory; that is ignored", kDomain, kKey);
     }
-    // Kept first: after a crash an accessory is rather not reported than twice.
-    const bool isChanged = kept ? !(*kept == Value(update.registered)) : !update.registered.empty();
-    if (isChanged) {
-        if (const auto failure = store.setValue(kKey, update.registered)) {
-            log::error(ZRReportingAudioRegistrationCategory(), "{}: {} cannot be stored: {}", kDomain, kKey,
-                       *failure);
-        }
-    }
     log::debug(ZRReportingAudioRegistrationCategory(), "looked up accessories. seen={} reported={}",
                seen.size(), update.reports.size());
-    if (!update.reports.empty()) {
-        send(context, std::move(update.reports));
+    const bool isChanged = kept ? !(*kept == Value(update.registered)) : !update.registered.empty();
+    if (isChanged) {
+        // Stored first: after a crash an accessory is rather not reported than twice.
+        store.setValue(kKey, update.registered, [&context, reports = std::move(update.reports)]() mutable {
+            if (!reports.empty()) {
+                send(context, std::move(reports));
+            }
+        });
     }
 }
 

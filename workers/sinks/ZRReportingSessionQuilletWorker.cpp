@@ -108,13 +108,7 @@ bool ZRReportingSessionQuilletWorker::hasRunInTimeframe(std::chrono::duration<do
     }
     log::debug(ZRReportingSessionCategory(), "Quillet has not run. key={} backoffSeconds={}", defaultsKey,
                backOff.count());
-    const std::optional<std::string> failure = capturePreferences(context()).setValue(defaultsKey, now);
-    if (failure && !cannotStore_) {
-        log::error(ZRReportingSessionCategory(),
-                   "preference {} {}: {}; the time of the draft is forgotten when the service ends",
-                   kCapturePreferencesDomain, defaultsKey, *failure);
-    }
-    cannotStore_ = failure.has_value();
+    capturePreferences(context()).setValue(defaultsKey, now);
     return false;
 }
 

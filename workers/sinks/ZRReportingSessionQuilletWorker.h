@@ -38,7 +38,6 @@ private:
     const std::chrono::duration<double> backOffTime_;
     double minimumMessageTime_ = -1.0; ///< seconds since 1970; armed when above 0
     bool hasRun_ = false;
-    bool cannotStore_ = false; ///< and the log says so
 };
 
 } // namespace tamblo

@@ -6,8 +6,6 @@
 
 #include <algorithm>
 #include <cerrno>
-#include <cstdint>
-#include <ctime>
 #include <system_error>
 #include <utility>
 #include <variant>
@@ -25,23 +23,6 @@ constexpr std::size_t kOwnEntries = 2;
 /// Publishers that replace a file write the new one under a name of another kind, or a hidden one.
 bool isChannelFile(std::string_view name) noexcept {
     return name.ends_with(".json") && !name.starts_with('.');
-}
-
-timespec coarseNow() noexcept {
-    timespec now{};
-    ::clock_gettime(CLOCK_REALTIME_COARSE, &now);
-    return now;
-}
-
-/// Whether a state was so old that no change from that moment on can bear the same times.
-bool wasOld(const FileState& state, const timespec& moment) noexcept {
-    const std::int64_t seconds = moment.tv_sec - state.changedSeconds;
-    if (seconds < 0 || seconds > 1) {
-        return seconds > 0;
-    }
-    const std::chrono::nanoseconds age =
-        std::chrono::seconds(seconds) + std::chrono::nanoseconds(moment.tv_nsec - state.changedNanoseconds);
-    return age >= ChanlogFiles::kCertainAge;
 }
 
 } // namespace
@@ -86,19 +67,17 @@ bool ChanlogFiles::readFiles(const std::vector<std::string>& names, StructuredLo
                          : files_.insert(std::move(known)).position->second;
         isChanged = readFile(file, FileState::of(status), log) || isChanged;
     }
-    report(log, std::move(fault));
+    report(log, fault);
     return isChanged || !earlier.empty();
 }
 
 bool ChanlogFiles::readFile(File& file, const FileState& state, StructuredLog& log) {
-    if (file.isCertain && state == file.json.state()) {
+    if (file.json.isCurrent(state)) {
         return false;
     }
     const bool hadChannels = !file.channels.empty();
     file.channels.clear();
-    const timespec beforeReading = coarseNow();
     readChannels(file, log);
-    file.isCertain = wasOld(file.json.state(), beforeReading);
     return hadChannels || !file.channels.empty();
 }
 
@@ -139,11 +118,10 @@ void ChanlogFiles::appendTo(std::vector<ChanlogChannelRef>& channels) const {
     }
 }
 
-void ChanlogFiles::report(StructuredLog& log, std::string fault) {
-    if (!fault.empty() && fault != reported_) {
+void ChanlogFiles::report(StructuredLog& log, std::string_view fault) {
+    if (told_.isNews(fault)) {
         log.report(LogLevel::error, kLogCategory, fault);
     }
-    reported_ = std::move(fault);
 }
 
 } // namespace tamblo

@@ -4,7 +4,6 @@
 #include "platform/StructuredLog.h"
 #include "platform/linux/settings/JsonFile.h"
 
-#include <chrono>
 #include <cstddef>
 #include <map>
 #include <string>
@@ -31,8 +30,6 @@ public:
     static constexpr std::size_t kMaximumEntries = 4096;
     /// Lines about channels of one file; the others are counted in one more.
     static constexpr std::size_t kMaximumFaultsTold = 8;
-    /// A change time older than this does not come again: ticks of the kernel's clock are 10 ms at most.
-    static constexpr std::chrono::milliseconds kCertainAge{20};
 
     explicit ChanlogFiles(std::string directory) : directory_(std::move(directory)) {}
 
@@ -44,7 +41,6 @@ public:
 private:
     struct File {
         JsonFile json;
-        bool isCertain = false; ///< that the channels are those of the file's state
         std::vector<ChanlogChannelRef> channels = {};
         std::vector<std::string> reportedFaults = {};
     };
@@ -54,11 +50,11 @@ private:
     [[nodiscard]] bool readFile(File& file, const FileState& state, StructuredLog& log);
     static void readChannels(File& file, StructuredLog& log);
     /// Once for as long as the same is said.
-    void report(StructuredLog& log, std::string fault);
+    void report(StructuredLog& log, std::string_view fault);
 
     const std::string directory_;
     Files files_;
-    std::string reported_;
+    ToldOnce told_;
 };
 
 } // namespace tamblo

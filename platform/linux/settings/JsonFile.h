@@ -4,12 +4,14 @@
 #include "base/JsonReader.h"
 #include "os/FileState.h"
 #include "platform/StructuredLog.h"
+#include "platform/linux/settings/ToldOnce.h"
 
 #include <cstddef>
 #include <functional>
 #include <optional>
 #include <string>
 #include <string_view>
+#include <utility>
 
 namespace tamblo {
 
@@ -33,19 +35,25 @@ public:
     [[nodiscard]] bool readArray(const std::function<void(const JsonItem&)>& take, StructuredLog& log);
     /// The file's state as it was just before it was read last; that of no file when there was none.
     [[nodiscard]] const FileState& state() const noexcept { return state_; }
+    /// Whether what was read last is certain to be the content of a file of this state, or of the file as it
+    /// is now.
+    [[nodiscard]] bool isCurrent(const FileState& state) const noexcept {
+        return isCertain_ && state == state_;
+    }
+    [[nodiscard]] bool isCurrent() const noexcept;
     [[nodiscard]] const std::string& path() const noexcept { return path_; }
 
 private:
     [[nodiscard]] std::optional<std::string> readText(StructuredLog& log);
+    /// An empty fault is none.
     void report(StructuredLog& log, std::string_view fault);
     void report(StructuredLog& log, const JsonError& error);
 
     std::string path_;
     std::size_t maximumSize_;
     FileState state_;
-    /// The state of the file and its fault as reported last; no fault when it was well.
-    FileState reportedState_;
-    std::string reportedFault_;
+    bool isCertain_ = false;
+    ToldOnce told_;
 };
 
 } // namespace tamblo

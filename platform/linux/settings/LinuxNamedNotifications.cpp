@@ -1,6 +1,7 @@
 #include "platform/linux/settings/LinuxNamedNotifications.h"
 
 #include "base/Format.h"
+#include "base/WhileAlive.h"
 #include "os/ReplaceFile.h"
 #include "os/SmallFile.h"
 
@@ -9,7 +10,6 @@
 #include <charconv>
 #include <climits>
 #include <cstdint>
-#include <limits>
 #include <system_error>
 #include <utility>
 
@@ -29,9 +29,13 @@ int checkName(std::string_view name) noexcept {
     return name.size() > NAME_MAX ? ENAMETOOLONG : 0;
 }
 
-NamedNotifications::State parseState(std::string_view text) noexcept {
+NamedNotifications::State stateIn(const SmallFile& file) noexcept {
+    const std::string_view text = file.trimmed();
     std::uint64_t word = 0;
     const auto [end, error] = std::from_chars(text.data(), text.data() + text.size(), word);
+    if (file.error != 0) {
+        return {file.error, 0};
+    }
     if (end != text.data() + text.size() || error == std::errc::invalid_argument) {
         return {EBADMSG, 0};
     }
@@ -42,23 +46,23 @@ NamedNotifications::State parseState(std::string_view text) noexcept {
 /// since its next writer may just have opened it.
 std::string faultOf(const SmallFile& file, int status) {
     const std::string_view word = file.trimmed();
-    if (status == 0 || status == ENOENT || status == ENOTDIR || (file.error == 0 && word.empty())) {
+    if (status == 0 || file.isMissing() || (file.error == 0 && word.empty())) {
         return {};
     }
     return file.error != 0
-               ? std::generic_category().message(file.error)
+               ? file.reason()
                : formatted("byte {}: not a 64-bit number in decimal", word.data() - file.text.data() + 1);
 }
 
 } // namespace
 
-/// Shared with the calls that wait on the queue, which may outlast the registration.
+/// Gone once it is cancelled, unless its handler is running.
 struct LinuxNamedNotifications::Registered {
     const int token;
+    const std::string name;
     SerialQueue& queue;
     const Handler handler;
     std::atomic<bool> isCallWaiting{false};
-    std::atomic<bool> isCancelled{false};
 };
 
 LinuxNamedNotifications::LinuxNamedNotifications(std::string directory, StructuredLog& log)
@@ -67,12 +71,16 @@ LinuxNamedNotifications::LinuxNamedNotifications(std::string directory, Structur
 }
 
 void LinuxNamedNotifications::reportUnwatched() {
-    const int error = watcher_.error();
-    if (error != std::exchange(reportedError_, error) && error != 0) {
+    const std::string fault = watcher_.fault();
+    if (unwatched_.isNews(fault)) {
         log_.report(LogLevel::error, "zrrs",
-                    formatted("{}: {}; notifications posted there are not noticed", watcher_.directory(),
-                              std::generic_category().message(error)));
+                    formatted("{}; notifications posted there are not noticed", fault));
     }
+}
+
+bool LinuxNamedNotifications::isNews(ToldOnce Told::*of, std::string_view name, std::string_view fault) {
+    const MutexLock lock(mutex_);
+    return (told_[std::string(name)].*of).isNews(fault);
 }
 
 NamedNotifications::Registration LinuxNamedNotifications::RegisterNamedNotification(std::string_view name,
@@ -82,96 +90,57 @@ NamedNotifications::Registration LinuxNamedNotifications::RegisterNamedNotificat
         return {status, 0};
     }
     const MutexLock lock(mutex_);
-    do {
-        lastToken_ = lastToken_ == std::numeric_limits<int>::max() ? 1 : lastToken_ + 1;
-    } while (byToken_.contains(lastToken_));
-    auto registered = std::make_shared<Registered>(lastToken_, queue, std::move(handler));
-    byToken_.emplace(lastToken_, byName_.emplace(name, std::move(registered)));
-    return {0, lastToken_};
+    const int token = ++lastToken_;
+    registered_.emplace(token,
+                        std::make_shared<Registered>(token, std::string(name), queue, std::move(handler)));
+    return {0, token};
 }
 
 NamedNotifications::State LinuxNamedNotifications::GetNamedNotificationState(int token) {
     std::string name;
     {
         const MutexLock lock(mutex_);
-        const auto found = byToken_.find(token);
-        if (found == byToken_.end()) {
+        const auto found = registered_.find(token);
+        if (found == registered_.end()) {
             return {EBADF, 0};
         }
-        name = found->second->first;
+        name = found->second->name;
     }
-    const SmallFile file = SmallFile::read(formatted("{}/{}", watcher_.directory(), name), kMaximumFile,
-                                           SmallFile::Links::refused);
-    const State state = file.error != 0 ? State{file.error, 0} : parseState(file.trimmed());
-    reportUnreadable(name, file.text, faultOf(file, state.status));
+    const std::string path = formatted("{}/{}", watcher_.directory(), name);
+    const SmallFile file = SmallFile::read(path, kMaximumFile, SmallFile::Links::refused);
+    const State state = stateIn(file);
+    const std::string fault = faultOf(file, state.status);
+    if (isNews(&Told::unreadable, name, fault.empty() ? fault : formatted("{}: {}", fault, file.text))) {
+        log_.report(LogLevel::error, "zrrs", formatted("{}: {}; it is not used", path, fault));
+    }
     return state;
 }
 
-void LinuxNamedNotifications::reportUnreadable(const std::string& name, const std::string& content,
-                                               std::string_view fault) {
-    {
-        const MutexLock lock(mutex_);
-        if (fault.empty()) {
-            reported_.erase(name);
-            return;
-        }
-        std::string state = formatted("{}: {}", fault, content);
-        if (std::string& reported = reported_[name]; reported != state) {
-            reported = std::move(state);
-        } else {
-            return;
-        }
-    }
-    log_.report(LogLevel::error, "zrrs",
-                formatted("{}/{}: {}; it is not used", watcher_.directory(), name, fault));
-}
-
 int LinuxNamedNotifications::PostNamedNotification(std::string_view name) {
+    const std::string path = formatted("{}/{}", watcher_.directory(), name);
     int status = checkName(name);
     if (status == 0) {
-        const std::string path = formatted("{}/{}", watcher_.directory(), name);
         const SmallFile file = SmallFile::read(path, kMaximumFile, SmallFile::Links::refused);
         // Content that is no word cannot be lost.
         const bool mayWrite = file.error == 0 || file.error == ENOENT || file.error == EFBIG;
-        status = mayWrite ? replaceFileAtomically(path, formatted("{}\n", parseState(file.trimmed()).word))
-                          : file.error;
+        status = mayWrite ? replaceFileAtomically(path, formatted("{}\n", stateIn(file).word)) : file.error;
     }
-    reportNotPosted(name, status);
+    const std::string fault = status != 0 ? std::generic_category().message(status) : "";
+    if (isNews(&Told::notPosted, name, fault)) {
+        log_.report(LogLevel::error, "zrrs",
+                    formatted("{}: {}; the notification is not posted", path, fault));
+    }
     return status;
-}
-
-void LinuxNamedNotifications::reportNotPosted(std::string_view name, int status) {
-    {
-        const MutexLock lock(mutex_);
-        const auto known = notPosted_.find(name);
-        if (status == 0) {
-            if (known != notPosted_.end()) {
-                notPosted_.erase(known);
-            }
-            return;
-        }
-        if (known != notPosted_.end()) {
-            return;
-        }
-        notPosted_.emplace(name);
-    }
-    log_.report(LogLevel::error, "zrrs",
-                formatted("{}/{}: {}; the notification is not posted", watcher_.directory(), name,
-                          std::generic_category().message(status)));
 }
 
 void LinuxNamedNotifications::CancelNamedNotification(int token) {
     // Let go after the lock: what the handler holds may cancel another registration when it ends.
-    std::shared_ptr<Registered> registered;
+    std::shared_ptr<Registered> ended;
     const MutexLock lock(mutex_);
-    const auto found = byToken_.find(token);
-    if (found == byToken_.end()) {
-        return;
+    if (const auto found = registered_.find(token); found != registered_.end()) {
+        ended = std::move(found->second);
+        registered_.erase(found);
     }
-    registered = std::move(found->second->second);
-    registered->isCancelled = true;
-    byName_.erase(found->second);
-    byToken_.erase(found);
 }
 
 /// The queue is alive: its registration has not been cancelled, and cannot be while the lock is held.
@@ -179,24 +148,22 @@ void LinuxNamedNotifications::post(const std::shared_ptr<Registered>& registered
     if (registered->isCallWaiting.exchange(true)) {
         return;
     }
-    registered->queue.post(
-        [registered] {
-            // Taken back first: a post that comes while the handler runs is another call.
-            registered->isCallWaiting.exchange(false);
-            if (!registered->isCancelled) {
-                registered->handler(registered->token);
-            }
-        },
-        Pace::mayBlock);
+    const auto call = [](Registered& called) {
+        // Taken back first: a post that comes while the handler runs is another call.
+        called.isCallWaiting.exchange(false);
+        called.handler(called.token);
+    };
+    registered->queue.post(whileAlive(std::weak_ptr(registered), call), Pace::mayBlock);
 }
 
 void LinuxNamedNotifications::deliverPosts(const std::function<void()>& beforeDelivery) {
     watcher_.read([this, &beforeDelivery](std::optional<std::string_view> name) {
         beforeDelivery();
         const MutexLock lock(mutex_);
-        auto [first, last] = name ? byName_.equal_range(*name) : std::pair(byName_.begin(), byName_.end());
-        for (; first != last; ++first) {
-            post(first->second);
+        for (const auto& [token, registered] : registered_) {
+            if (!name || registered->name == *name) {
+                post(registered);
+            }
         }
     });
     reportUnwatched();

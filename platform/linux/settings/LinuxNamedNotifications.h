@@ -4,14 +4,13 @@
 #include "os/DirectoryWatcher.h"
 #include "platform/NamedNotifications.h"
 #include "platform/StructuredLog.h"
+#include "platform/linux/settings/ToldOnce.h"
 
 #include <functional>
 #include <map>
 #include <memory>
-#include <set>
 #include <string>
 #include <string_view>
-#include <unordered_map>
 
 namespace tamblo {
 
@@ -23,7 +22,8 @@ namespace tamblo {
 /// the state when it runs, so that the last one is always seen. A post just before a registration may be told
 /// to it. When the directory comes or goes, any word may have changed, and every handler is called.
 ///
-/// Statuses are `errno` values. Any thread may register, ask and cancel.
+/// Statuses are `errno` values. Any thread may register, ask and cancel; no handler is called once this
+/// object is gone.
 class LinuxNamedNotifications final : public NamedNotifications {
 public:
     /// The log must outlive the notifications.
@@ -53,27 +53,24 @@ public:
 
 private:
     struct Registered;
-    using ByName = std::multimap<std::string, std::shared_ptr<Registered>, std::less<>>;
+    /// Of one name.
+    struct Told {
+        ToldOnce unreadable;
+        ToldOnce notPosted;
+    };
 
     static void post(const std::shared_ptr<Registered>& registered);
     void reportUnwatched();
-    /// An empty fault is none.
-    void reportUnreadable(const std::string& name, const std::string& content, std::string_view fault);
-    /// 0 is no failure.
-    void reportNotPosted(std::string_view name, int status);
+    [[nodiscard]] bool isNews(ToldOnce Told::*of, std::string_view name, std::string_view fault);
 
     StructuredLog& log_;
     /// Used by `deliverPosts` alone.
     DirectoryWatcher watcher_;
-    int reportedError_ = 0;
+    ToldOnce unwatched_;
     Mutex mutex_;
-    ByName byName_ TAMBLO_GUARDED_BY(mutex_);
-    std::unordered_map<int, ByName::iterator> byToken_ TAMBLO_GUARDED_BY(mutex_);
+    std::map<int, std::shared_ptr<Registered>> registered_ TAMBLO_GUARDED_BY(mutex_); ///< by token, a few
     int lastToken_ TAMBLO_GUARDED_BY(mutex_) = 0;
-    /// By name: the content and its fault as reported last.
-    std::map<std::string, std::string> reported_ TAMBLO_GUARDED_BY(mutex_);
-    /// The names whose last post failed.
-    std::set<std::string, std::less<>> notPosted_ TAMBLO_GUARDED_BY(mutex_);
+    std::map<std::string, Told, std::less<>> told_ TAMBLO_GUARDED_BY(mutex_);
 };
 
 } // namespace tamblo

@@ -3,6 +3,7 @@
 #include "base/Dictionary.h"
 #include "base/Mutex.h"
 #include "os/DirectoryWatcher.h"
+#include "os/PreferenceFile.h"
 #include "platform/Preferences.h"
 #include "platform/StructuredLog.h"
 #include "platform/linux/settings/JsonFile.h"
@@ -10,31 +11,33 @@
 #include <atomic>
 #include <cstdint>
 #include <map>
+#include <memory>
 #include <optional>
 #include <string>
 #include <string_view>
 
 namespace tamblo {
 
-/// Preferences as files: `<directory>/<domain>.json` holds one object, the domain's values by key.
-///
-/// A value is stored by reading the file anew and replacing it with one that differs in that value; the disk
-/// is not waited for. A file that is there and cannot be read as an object is somebody's mistake and is left
-/// as it is. What could not be stored is read back by this process all the same, until the file changes.
+/// Preferences as files (`PreferenceFile`), one for each domain.
 ///
 /// A file is read when its domain is first asked for and kept until it changes. Changes are told by the
 /// kernel: the event loop calls `readChanges` when the descriptor is readable, before it handles the sockets
 /// of the same wake-up, so that a preference is in force for every message sent after it was written. Any
 /// thread may ask.
+///
+/// A value that is set is in force at once and stored on a queue of its own, since that waits for other
+/// programs that edit the file, and for the disk; values set meanwhile are stored together. What could not be
+/// stored is one error line for as long as that lasts, and is read back by this process all the same, until
+/// the file changes.
 class LinuxPreferences final : public Preferences {
 public:
-    /// The log must outlive the preferences.
-    LinuxPreferences(std::string directory, StructuredLog& log);
+    /// The log must outlive the preferences; the queues work off what was posted before the preferences go.
+    LinuxPreferences(std::string directory, WorkQueues& workQueues, StructuredLog& log);
 
     [[nodiscard]] std::optional<Value> copyPreferenceValue(std::string_view key,
                                                            std::string_view domain) const override;
-    [[nodiscard]] std::optional<std::string> setPreferenceValue(std::string_view key, std::string_view domain,
-                                                                const Value& value) override;
+    void setPreferenceValue(std::string_view key, std::string_view domain, const Value& value,
+                            Work afterwards) override;
 
     /// The file of a domain, whether it is there or not.
     [[nodiscard]] std::string path(std::string_view domain) const;
@@ -51,27 +54,34 @@ public:
 
 private:
     struct Domain {
+        PreferenceFile editable;
         JsonFile file;
         bool isCurrent = false;
         std::optional<Dictionary> values = std::nullopt;
         /// Set here and not in the file.
         Dictionary unstored = {};
+        /// Those of them that are still to be stored, by a piece that waits on the queue or runs.
+        Dictionary pending = {};
+        ToldOnce told = {};
 
         void forgetFile() {
             isCurrent = false;
-            unstored = {};
+            unstored = pending;
         }
     };
 
     void reportUnwatched();
-    [[nodiscard]] Domain& domainNamed(std::string_view name) const TAMBLO_REQUIRES(mutex_);
+    /// Null for a name that no domain can have.
+    [[nodiscard]] Domain* domainNamed(std::string_view name) const TAMBLO_REQUIRES(mutex_);
+    void store(Domain& domain);
 
     StructuredLog& log_;
+    const std::unique_ptr<SerialQueue> queue_;
     std::atomic<std::uint64_t> generation_{1};
     std::atomic<bool> isWatched_{false};
     /// Used by `readChanges` alone.
     DirectoryWatcher watcher_;
-    int reportedError_ = 0;
+    ToldOnce unwatched_;
     mutable Mutex mutex_;
     mutable std::map<std::string, Domain, std::less<>> domains_ TAMBLO_GUARDED_BY(mutex_);
 };
