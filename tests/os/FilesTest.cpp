@@ -1,6 +1,5 @@
 #include "os/DirectoryWatcher.h"
 #include "os/LocalAddress.h"
-#include "os/ReplaceFile.h"
 #include "os/SmallFile.h"
 #include "tests/platform/LinuxServiceSupport.h"
 
@@ -46,18 +45,6 @@ TEST(SmallFile, IsReadUpToItsLimitAndOnlyWhenItIsRegular) {
     EXPECT_EQ((SmallFile{.text = " a b\r\n"}).trimmed(), "a b");
 }
 
-TEST(ReplaceFile, LeavesAFileOrWhatIsInTheWay) {
-    const TemporaryDirectory directory;
-    EXPECT_EQ(replaceFileAtomically(directory.path("gone/f"), "x"), ENOENT);
-    for (const char* content : {"one", "two"}) {
-        EXPECT_EQ(replaceFileAtomically(directory.path("f"), content), 0);
-        EXPECT_EQ(directory.read("f"), content);
-    }
-    fs::create_directory(directory.path("d"));
-    EXPECT_EQ(replaceFileAtomically(directory.path("d"), "x", Durability::power), EISDIR);
-    EXPECT_EQ(test::entriesOf(directory.path()), 2);
-}
-
 TEST(LocalAddress, HoldsWhatTheSystemTakes) {
     EXPECT_FALSE(LocalAddress::of(""));
     EXPECT_TRUE(LocalAddress::of(std::string(107, 'x')));
@@ -83,8 +70,7 @@ protected:
 };
 
 TEST_F(DirectoryWatcherTest, TellsOfFilesThatAreFinishedOrGo) {
-    // From before the directory and those on the way to it are there.
-    for (const char* step : {"a", "a/b", "a/b/watched"}) {
+    for (const char* step : {"a", "a/b", "a/b/watched"}) { // watched from before they are there
         fs::create_directory(directory_.path(step));
         EXPECT_THAT(changes(), Contains("*")) << step;
     }

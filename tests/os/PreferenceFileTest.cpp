@@ -135,8 +135,8 @@ TEST_F(PreferenceFileTest, WhatIsNoObjectIsLeftAsItIs) {
     directory_.write("d.json", R"({"a": 1})");
     EXPECT_EQ(file_.edit([](Dictionary& values) { return !values.contains("a"); }), std::nullopt);
     EXPECT_EQ(directory_.read("d.json"), R"({"a": 1})") << "nothing was to be changed";
-    EXPECT_THAT(open(directory_.path("gone")).edit([](Dictionary&) { return true; }).value_or(""),
-                HasSubstr("gone: No such file"));
+    const auto nothing = [](Dictionary&) { return true; };
+    EXPECT_THAT(open(directory_.path("gone")).edit(nothing).value_or(""), HasSubstr("gone: No such file"));
 }
 
 TEST_F(PreferenceFileTest, ADomainIsTheNameOfAFileOfItsOwn) {

@@ -61,7 +61,7 @@ protected:
         }
         EXPECT_NE(preferences_.generation(), before);
     }
-    /// The integer that is in force, or -1.
+    /// What is in force, or -1.
     [[nodiscard]] std::int64_t value(std::string_view key = "k", std::string_view domain = "d") const {
         const std::optional<Value> value = preferences_.copyPreferenceValue(key, domain);
         return value ? value->integerValue() : -1;
