@@ -42,30 +42,17 @@ public:
     [[nodiscard]] virtual std::string_view label() const noexcept = 0;
 };
 
-/// Ticks at an interval on a thread of its own from `start` on. Destroying or invalidating it ends that:
-/// after `invalidate`, which may be called from the tick itself, no further tick begins; the destructor also
-/// waits for a running tick, unless it is called from that tick.
-class RepeatingTimer {
-public:
-    virtual ~RepeatingTimer() = default;
-    virtual void start() = 0;
-    virtual void invalidate() = 0;
-};
-
 /// One call that is to come. Destroying it calls it off; a call that has begun is not waited for.
 class DelayedCall {
 public:
     virtual ~DelayedCall() = default;
 };
 
-/// Makes queues, timers and delayed calls, which their users own and let go before the process ends. Any
-/// thread.
+/// Makes queues and delayed calls, which their users own and let go before the process ends. Any thread.
 class WorkQueues {
 public:
     virtual ~WorkQueues() = default;
     [[nodiscard]] virtual std::unique_ptr<SerialQueue> makeSerialQueue(std::string_view label) = 0;
-    [[nodiscard]] virtual std::unique_ptr<RepeatingTimer>
-    makeRepeatingTimer(std::chrono::milliseconds interval, UniqueFunction<void()> tick) = 0;
     /// Makes the call once, after the delay, on some thread; it must not block.
     [[nodiscard]] virtual std::unique_ptr<DelayedCall> callAfter(std::chrono::milliseconds delay,
                                                                  UniqueFunction<void()> call) = 0;

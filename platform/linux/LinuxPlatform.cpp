@@ -191,7 +191,6 @@ void LinuxPlatform::run(SerialQueue& requestQueue,
         all.sinks.flush();
         all.connections.releaseReplies();
     });
-    all.workQueues.setTickEnd([&all] { all.sinks.flush(); });
     all.workQueues.threads().setRunEnd([&all] { all.callQuality.flush(); });
     all.connections.setRequestQueue(requestQueue, all.workQueues.threads());
     all.signals.setEndWanted([&all, &shutDown] {

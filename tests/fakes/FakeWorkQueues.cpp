@@ -47,16 +47,6 @@ void FakeWorkQueues::workOff() {
     }
 }
 
-std::unique_ptr<RepeatingTimer> FakeWorkQueues::makeRepeatingTimer(std::chrono::milliseconds interval,
-                                                                   UniqueFunction<void()> tick) {
-    auto state = std::make_shared<FakeRepeatingTimer::State>();
-    state->interval = interval;
-    state->tick = std::move(tick);
-    const std::lock_guard held(mutex_);
-    timers_.push_back(state);
-    return std::make_unique<FakeRepeatingTimer>(std::move(state));
-}
-
 std::unique_ptr<DelayedCall> FakeWorkQueues::callAfter(std::chrono::milliseconds delay,
                                                        UniqueFunction<void()> call) {
     const std::lock_guard held(mutex_);
@@ -86,25 +76,6 @@ std::size_t FakeWorkQueues::delayedCalls() const {
     const std::lock_guard held(mutex_);
     return static_cast<std::size_t>(
         std::count_if(delayed_.begin(), delayed_.end(), [](const auto& entry) { return bool(entry->call); }));
-}
-
-std::vector<std::shared_ptr<FakeRepeatingTimer::State>> FakeWorkQueues::timers() const {
-    const std::lock_guard held(mutex_);
-    return timers_;
-}
-
-std::size_t FakeWorkQueues::runningTimers() const {
-    const auto all = timers();
-    return static_cast<std::size_t>(
-        std::count_if(all.begin(), all.end(), [](const auto& timer) { return timer->isRunning.load(); }));
-}
-
-void FakeWorkQueues::tick() {
-    for (const auto& timer : timers()) {
-        if (timer->isRunning) {
-            timer->tick();
-        }
-    }
 }
 
 } // namespace tamblo

@@ -1,6 +1,5 @@
 #pragma once
 
-#include "tests/fakes/FakeRepeatingTimer.h"
 #include "tests/fakes/FakeSerialQueue.h"
 
 #include <chrono>
@@ -14,12 +13,10 @@
 
 namespace tamblo {
 
-/// Makes queues and timers that a test runs by hand, and finds them again.
+/// Makes queues and delayed calls that a test runs by hand, and finds them again.
 class FakeWorkQueues final : public WorkQueues {
 public:
     [[nodiscard]] std::unique_ptr<SerialQueue> makeSerialQueue(std::string_view label) override;
-    [[nodiscard]] std::unique_ptr<RepeatingTimer> makeRepeatingTimer(std::chrono::milliseconds interval,
-                                                                     UniqueFunction<void()> tick) override;
     [[nodiscard]] std::unique_ptr<DelayedCall> callAfter(std::chrono::milliseconds delay,
                                                          UniqueFunction<void()> call) override;
 
@@ -35,12 +32,6 @@ public:
     /// Turns the time of the delayed calls, and makes those that are due.
     void elapse(std::chrono::milliseconds time);
     [[nodiscard]] std::size_t delayedCalls() const;
-
-    /// Every timer that was made, the latest last; they outlive their timers.
-    [[nodiscard]] std::vector<std::shared_ptr<FakeRepeatingTimer::State>> timers() const;
-    [[nodiscard]] std::size_t runningTimers() const;
-    /// Ticks each running timer once.
-    void tick();
 
 private:
     struct Delayed {
@@ -64,7 +55,6 @@ private:
 
     mutable std::mutex mutex_;
     std::vector<Queue> queues_;
-    std::vector<std::shared_ptr<FakeRepeatingTimer::State>> timers_;
     std::chrono::milliseconds elapsed_{0};
     std::vector<std::shared_ptr<Delayed>> delayed_;
 };

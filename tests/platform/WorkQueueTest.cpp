@@ -246,38 +246,5 @@ TEST(DelayedCall, IsMadeOnceItsTimeHasComeUnlessItIsCalledOff) {
     EXPECT_EQ(allMade.get_future().wait_for(kPatience), std::future_status::ready);
 }
 
-TEST(RepeatingTimer, TicksUntilItIsInvalidatedEvenByItsOwnTick) {
-    LinuxWorkQueues queues;
-    std::atomic<int> tickEnds{0};
-    queues.setTickEnd([&tickEnds] { ++tickEnds; });
-    std::promise<void> dropped;
-    std::unique_ptr<RepeatingTimer> timer;
-    int ticks = 0;
-    timer = queues.makeRepeatingTimer(std::chrono::milliseconds(1), [&] {
-        if (++ticks == 3) {
-            timer.reset();
-            dropped.set_value();
-        }
-    });
-    timer->start();
-    ASSERT_EQ(dropped.get_future().wait_for(kPatience), std::future_status::ready);
-
-    std::atomic<bool> isTicking{false};
-    std::atomic<bool> hasEnded{false};
-    auto other = queues.makeRepeatingTimer(std::chrono::milliseconds(1), [&] {
-        isTicking = true;
-        std::this_thread::sleep_for(std::chrono::milliseconds(20));
-        hasEnded = true;
-    });
-    other->start();
-    while (!isTicking) {
-        std::this_thread::yield();
-    }
-    other.reset();
-    EXPECT_TRUE(hasEnded);
-    EXPECT_EQ(ticks, 3);
-    EXPECT_GE(tickEnds, 3);
-}
-
 } // namespace
 } // namespace tamblo
