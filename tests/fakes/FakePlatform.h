@@ -1,21 +1,16 @@
 #pragma once
 
 #include "session/ZRReportingSession.h"
-#include "tests/fakes/FakeAnalyticsEventService.h"
-#include "tests/fakes/FakeBugCaptureService.h"
-#include "tests/fakes/FakeCallQualityService.h"
-#include "tests/fakes/FakeChanlogFacility.h"
 #include "tests/fakes/FakeClock.h"
-#include "tests/fakes/FakeConnectionService.h"
 #include "tests/fakes/FakeDevice.h"
-#include "tests/fakes/FakeLog.h"
-#include "tests/fakes/FakeNamedNotifications.h"
 #include "tests/fakes/FakeSinks.h"
 #include "tests/fakes/FakeWorkQueues.h"
 #include "util/Context.h"
+#include "util/LogCategories.h"
 
 #include <memory>
 #include <optional>
+#include <utility>
 #include <vector>
 
 namespace tamblo {
@@ -27,22 +22,40 @@ class FakePlatform {
 
 public:
     /// Lines from this level on are written; without an internal build unless it is asked for.
-    explicit FakePlatform(LogLevel threshold = LogLevel::debug, bool isInternalBuild = false);
+    explicit FakePlatform(LogLevel threshold = LogLevel::debug, bool isInternalBuild = false) {
+        log.setThreshold(threshold);
+        setInternalBuild(isInternalBuild);
+    }
     FakePlatform(const FakePlatform&) = delete;
     FakePlatform& operator=(const FakePlatform&) = delete;
 
     [[nodiscard]] Context& context() noexcept { return *context_; }
     /// The server queue, which runs when told.
-    [[nodiscard]] FakeSerialQueue& serverQueue();
+    [[nodiscard]] FakeSerialQueue& serverQueue() {
+        return static_cast<FakeSerialQueue&>(context().serverQueue());
+    }
     [[nodiscard]] std::shared_ptr<ZRReportingSession>
-    makeSession(ReporterID reporterID = 5, std::vector<pid_t> processIdentifiers = {1});
+    makeSession(ReporterID reporterID = 5, std::vector<pid_t> processIdentifiers = {1}) {
+        return ZRReportingSession::initWithID(context(), reporterID, std::move(processIdentifiers));
+    }
 
     /// From now on, lines from this level on are written.
-    void setThreshold(LogLevel threshold);
+    void setThreshold(LogLevel threshold) {
+        log.setThreshold(threshold);
+        for (const LogCategory& category : log_categories::all) {
+            category.turnOn(threshold);
+        }
+    }
     /// Restarts the process on another build.
-    void setInternalBuild(bool isInternalBuild);
+    void setInternalBuild(bool isInternalBuild) {
+        deviceProperties.set("InternalBuild", isInternalBuild);
+        restart();
+    }
     /// As if the process were started anew: posted work is done, and nothing that sessions share is left.
-    void restart();
+    void restart() {
+        context_.reset();
+        context_.emplace(services_);
+    }
     /// For a service of a test's own, before it is used; the fake's own is then gone.
     [[nodiscard]] Platform& services() noexcept { return services_; }
 

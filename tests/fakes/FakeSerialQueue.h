@@ -2,7 +2,6 @@
 
 #include "platform/WorkQueue.h"
 
-#include <cstddef>
 #include <deque>
 #include <memory>
 #include <mutex>
@@ -17,15 +16,49 @@ namespace tamblo {
 /// as somebody runs it.
 class FakeStrand {
 public:
-    void post(Work work, Pace pace);
+    void post(Work work, Pace pace) {
+        const std::lock_guard held(mutex_);
+        pieces_.push_back(std::move(work));
+        paces_.push_back(pace);
+    }
     void setBatchEnd(Work batchEnd) { batchEnd_ = std::move(batchEnd); }
     /// Runs what is posted, and what that posts, then the batch's end; the number of pieces. Does nothing
     /// inside a piece of its own.
-    std::size_t runAll();
+    std::size_t runAll() {
+        std::size_t count = 0;
+        while (!isRunning_ && runOne()) {
+            ++count;
+        }
+        if (count != 0 && batchEnd_) {
+            batchEnd_();
+        }
+        return count;
+    }
     /// Runs one piece, without the batch's end; false when there is none, or the queue is suspended.
-    bool runOne();
-    [[nodiscard]] std::vector<Pace> takePaces();
-    void setSuspended(bool isSuspended);
+    bool runOne() {
+        Work piece;
+        {
+            const std::lock_guard held(mutex_);
+            if (isSuspended_ || pieces_.empty()) {
+                return false;
+            }
+            piece = std::move(pieces_.front());
+            pieces_.pop_front();
+        }
+        const bool wasRunning = std::exchange(isRunning_, true);
+        piece();
+        piece.reset();
+        isRunning_ = wasRunning;
+        return true;
+    }
+    [[nodiscard]] std::vector<Pace> takePaces() {
+        const std::lock_guard held(mutex_);
+        return std::exchange(paces_, {});
+    }
+    void setSuspended(bool isSuspended) {
+        const std::lock_guard held(mutex_);
+        isSuspended_ = isSuspended;
+    }
 
 private:
     Work batchEnd_;

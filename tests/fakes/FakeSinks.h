@@ -1,16 +1,16 @@
 #pragma once
 
+#include "platform/AnalyticsEventService.h"
+#include "platform/BugCaptureService.h"
 #include "platform/BugReportDraftingService.h"
+#include "platform/CallQualityService.h"
 #include "platform/DiagnosticCaptureService.h"
 #include "platform/DiagnosticsMetricsService.h"
 #include "platform/MemoryLog.h"
 #include "platform/PowerEventLog.h"
 #include "platform/ReportFiles.h"
 
-#include <cstddef>
-#include <cstdint>
 #include <map>
-#include <memory>
 #include <optional>
 #include <set>
 #include <string>
@@ -21,17 +21,171 @@
 /// Where reports go: each keeps what it is given.
 namespace tamblo {
 
-/// Keeps what is submitted: the metric's number and the bytes of the record.
+/// Records every event that it is sent: those who send are to ask first which ones are in use. All are,
+/// unless a test names some.
+class FakeAnalyticsEventService final : public AnalyticsEventService {
+public:
+    struct Event {
+        std::string name;
+        Dictionary payload;
+    };
+
+    [[nodiscard]] bool isEventInUse(std::string_view eventName) override {
+        return !inUse_ || inUse_->contains(eventName);
+    }
+    [[nodiscard]] std::uint64_t inUseGeneration() const noexcept override { return generation_; }
+    void sendEventLazy(std::string_view eventName, const std::function<Dictionary()>& payload) override {
+        events_.push_back({std::string(eventName), payload()});
+    }
+
+    void setEventsInUse(std::optional<std::set<std::string, std::less<>>> names) {
+        inUse_ = std::move(names);
+        ++generation_;
+    }
+    [[nodiscard]] const std::vector<Event>& events() const noexcept { return events_; }
+    /// The payloads of the events of this name.
+    [[nodiscard]] std::vector<Dictionary> payloads(std::string_view eventName) const {
+        std::vector<Dictionary> found;
+        for (const Event& event : events_) {
+            if (event.name == eventName) {
+                found.push_back(event.payload);
+            }
+        }
+        return found;
+    }
+    void clear() noexcept { events_.clear(); }
+
+private:
+    std::uint64_t generation_ = 1;
+    std::optional<std::set<std::string, std::less<>>> inUse_;
+    std::vector<Event> events_;
+};
+
+/// Keeps what its reporters ask for; accepts and answers as a test says.
+class FakeBugCaptureService final : public BugCaptureService {
+public:
+    struct Request {
+        std::string operation; ///< "snapshot", "start" or "cancel"
+        std::vector<pid_t> processes;
+        BugCaptureSignature signature;
+        std::chrono::duration<double> duration{0};
+        Dictionary payload;
+        std::string session; ///< of a "cancel"
+    };
+
+    [[nodiscard]] std::unique_ptr<GlarnReporter> makeReporter(std::span<const pid_t> processes) override {
+        ++reportersMade;
+        return std::make_unique<Reporter>(*this, std::vector(processes.begin(), processes.end()));
+    }
+    /// Answers the oldest request that waits.
+    void answer(const Dictionary& response) {
+        GlarnReporter::Reply reply = std::move(replies.front());
+        replies.erase(replies.begin());
+        reply(response);
+    }
+
+    bool accepts = true;
+    /// Given to every request before it returns; without one, replies wait for `answer`.
+    std::optional<Dictionary> promptAnswer;
+    int reportersMade = 0;
+    std::vector<Request> requests;
+    std::vector<GlarnReporter::Reply> replies;
+
+private:
+    class Reporter final : public GlarnReporter {
+    public:
+        Reporter(FakeBugCaptureService& owner, std::vector<pid_t> processes)
+            : owner_(owner), processes_(std::move(processes)) {}
+        [[nodiscard]] bool snapshot(const BugCaptureSignature& signature,
+                                    std::chrono::duration<double> duration, const Dictionary& payload,
+                                    Reply reply) override {
+            return owner_.take({"snapshot", processes_, signature, duration, payload, {}}, std::move(reply));
+        }
+        [[nodiscard]] bool startSession(const BugCaptureSignature& signature,
+                                        std::chrono::duration<double> duration, Reply reply) override {
+            return owner_.take({"start", processes_, signature, duration, {}, {}}, std::move(reply));
+        }
+        void cancelSession(std::string_view sessionIdentifier) override {
+            owner_.requests.push_back({"cancel", processes_, {}, {}, {}, std::string(sessionIdentifier)});
+        }
+
+    private:
+        FakeBugCaptureService& owner_;
+        const std::vector<pid_t> processes_;
+    };
+
+    bool take(Request request, GlarnReporter::Reply reply) {
+        requests.push_back(std::move(request));
+        if (accepts && promptAnswer) {
+            reply(*promptAnswer);
+        } else if (accepts) {
+            replies.push_back(std::move(reply));
+        }
+        return accepts;
+    }
+};
+
+/// Keeps what its sessions are given; finds back ends when a test says so.
+class FakeCallQualityService final : public CallQualityService {
+public:
+    struct Message {
+        std::uint16_t category;
+        std::uint16_t type;
+        Dictionary payload;
+    };
+    struct FakeSession final : Session {
+        [[nodiscard]] std::string description() const override { return "fake session"; }
+
+        Dictionary sessionInfo, userInfo;
+        std::vector<Message> messages;
+        int flushes = 0;
+    };
+
+    [[nodiscard]] std::optional<std::string> NewHierarchyToken(std::string_view) override { return token; }
+    [[nodiscard]] SessionRef CreateLinkmeterSession(const Dictionary& sessionInfo,
+                                                    const Dictionary& userInfo) override {
+        auto session = std::make_shared<FakeSession>();
+        session->sessionInfo = sessionInfo;
+        session->userInfo = userInfo;
+        sessions.push_back(session);
+        return session;
+    }
+    void StartConfiguration(const SessionRef&, Completion completion) override {
+        completions.push_back(std::move(completion));
+    }
+    [[nodiscard]] std::optional<std::string> SendLinkmeterMessage(const SessionRef& session,
+                                                                  std::uint16_t category, std::uint16_t type,
+                                                                  const Dictionary& payload) override {
+        if (sendFailure || session == nullptr) {
+            return sendFailure;
+        }
+        static_cast<FakeSession&>(*session).messages.push_back({category, type, payload});
+        return std::nullopt;
+    }
+    void FlushMessages(const SessionRef& session) override { ++static_cast<FakeSession&>(*session).flushes; }
+
+    /// Answers the oldest configuration that waits.
+    void findBackends(const std::optional<std::vector<std::string>>& backends) {
+        Completion completion = std::move(completions.front());
+        completions.erase(completions.begin());
+        completion(backends);
+    }
+
+    std::optional<std::string> token = "token";
+    std::optional<std::string> sendFailure;
+    std::vector<std::shared_ptr<FakeSession>> sessions;
+    std::vector<Completion> completions;
+};
+
 class FakeDiagnosticsMetricsService final : public DiagnosticsMetricsService {
 public:
     void SubmitMetricRecord(std::uint32_t metric, std::span<const std::uint8_t> record) override {
         records.emplace_back(metric, std::vector<std::uint8_t>(record.begin(), record.end()));
     }
 
-    std::vector<std::pair<std::uint32_t, std::vector<std::uint8_t>>> records;
+    std::vector<std::pair<std::uint32_t, std::vector<std::uint8_t>>> records; ///< metric and bytes
 };
 
-/// Keeps what is posted.
 class FakePowerEventLog final : public PowerEventLog {
 public:
     struct Event {
@@ -64,7 +218,6 @@ public:
     std::vector<Request> requests;
 };
 
-/// Keeps the requests.
 class FakeDiagnosticCaptureService final : public DiagnosticCaptureService {
 public:
     void captureStacks(StackCaptureRequest request) override { requests.push_back(std::move(request)); }
@@ -72,7 +225,6 @@ public:
     std::vector<StackCaptureRequest> requests;
 };
 
-/// Keeps the requests.
 class FakeMemoryLog final : public MemoryLog {
 public:
     struct Request {

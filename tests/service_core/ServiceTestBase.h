@@ -1,5 +1,6 @@
 #pragma once
 
+#include "base/Json.h"
 #include "service/ZRReportingClientServerInstance.h"
 #include "service/ZRReportingService.h"
 #include "tests/fakes/FakePlatform.h"
@@ -10,6 +11,7 @@
 
 #include <memory>
 #include <string>
+#include <type_traits>
 #include <vector>
 
 namespace tamblo {
@@ -18,6 +20,7 @@ namespace tamblo {
 class ServiceTestBase : public testing::Test {
 protected:
     using Connection = std::unique_ptr<FakeClientConnection>;
+    static constexpr const char* kUptimeEvent = "com.vandra.tamblo.zrreportingclientuptime";
 
     explicit ServiceTestBase(bool isInternalBuild = false) : device(LogLevel::debug, isInternalBuild) {
         script.reset();
@@ -46,30 +49,29 @@ protected:
         client->object().startReportingSessionForID(reporterID, {});
         (void)run();
     }
-    void send(const Connection& client, std::vector<ReporterID> reporterIDs,
-              Dictionary payload = {{"a", 1}}) {
-        client->object().sendMessage(std::move(payload), 14, 11, std::move(reporterIDs), note("send"));
-        (void)run();
-    }
-    /// A session that is stopped sends a summary first.
-    void haveStopsSendSummaries(const char* worker = "Producer") {
-        script.atStop[worker] = [](ZRReportingSession& owner) {
-            owner.sendMessage(messageOf({{"summary", 1}}, 1, 11));
-        };
+    template <typename Result> static std::string textOf(const Result& result) {
+        if constexpr (std::is_same_v<Result, Dictionary>) {
+            return jsonText(result);
+        } else {
+            return testing::PrintToString(result);
+        }
     }
     /// A reply that notes the name and what it is called with.
-    template <typename... Result> auto noteWith(std::string name) {
+    template <typename... Result> auto note(std::string name) {
         return [this, name = std::move(name)](const ReplyError* error, const Result&... result) {
             std::string text = name;
             if (error != nullptr) {
                 text += " " + error->domain + " " + std::to_string(error->code);
             }
-            ((text += " " + std::to_string(result)), ...);
+            ((text += " " + textOf(result)), ...);
             replies.push_back(std::move(text));
         };
     }
-    ErrorReply note(std::string name) { return noteWith<>(std::move(name)); }
-    BooleanReply noteBoolean(std::string name) { return noteWith<bool>(std::move(name)); }
+    void send(const Connection& client, std::vector<ReporterID> reporterIDs,
+              Dictionary payload = {{"a", 1}}) {
+        client->object().sendMessage(std::move(payload), 14, 11, std::move(reporterIDs), note<>("send"));
+        (void)run();
+    }
     /// What was answered since the last call.
     std::vector<std::string> takeReplies() { return std::exchange(replies, {}); }
 
@@ -82,18 +84,6 @@ protected:
             ids.push_back(session->reporterID());
         }
         return ids;
-    }
-    /// The lines of the service's category, each with its level's first letter, up to a list in it.
-    std::vector<std::string> serviceLines() {
-        std::vector<std::string> found;
-        for (const FakeLog::Line& line : device.log.lines()) {
-            if (line.category == "zrrs") {
-                const char level = "disef"[static_cast<std::size_t>(line.level)];
-                found.push_back(level + (": " + line.text.substr(0, line.text.find(" ["))));
-            }
-        }
-        device.log.clear();
-        return found;
     }
     static int& exitStatus() {
         static int status = 0;

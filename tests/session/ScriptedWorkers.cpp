@@ -2,13 +2,15 @@
 
 #include "base/Format.h"
 
-#include <algorithm>
 #include <array>
 #include <utility>
 
 namespace tamblo {
-
 namespace {
+
+WorkerScript& script() {
+    return WorkerScript::current();
+}
 
 class ScriptedWorker final : public ZRReportingSessionWorkerConsumerProtocol {
 public:
@@ -19,19 +21,17 @@ public:
         if (name_ == "Only" || name_ == "Redundant") {
             return std::nullopt;
         }
-        WorkerScript::current().saw("start " + name_);
-        return !WorkerScript::current().notStarting.contains(name_);
+        script().saw("start " + name_);
+        return !script().notStarting.contains(name_);
     }
     void stop() override {
-        WorkerScript& script = WorkerScript::current();
-        script.saw("stop " + name_);
-        if (const auto act = script.atStop.find(name_); act != script.atStop.end()) {
+        script().saw("stop " + name_);
+        if (const auto act = script().atStop.find(name_); act != script().atStop.end()) {
             act->second(*session());
         }
     }
     void handleMessage(const MessageRef& message) override {
-        WorkerScript::current().saw(
-            formatted("message {} {}/{}", name_, message->category(), message->type()));
+        script().saw(formatted("message {} {}/{}", name_, message->category(), message->type()));
     }
     [[nodiscard]] bool handleRedundantMessages() const override { return name_ == "Redundant"; }
 
@@ -39,26 +39,22 @@ private:
     const std::string name_;
 };
 
-constexpr std::array<std::string_view, 7> kNames{"Only",      "Producer", "Both", "Init",
-                                                 "Redundant", "Absent",   "Late"};
-
 template <std::size_t Row>
 std::shared_ptr<ZRReportingSessionWorkerProtocol> make(Context& context,
                                                        const std::shared_ptr<ZRReportingSession>& session) {
-    if (WorkerScript::current().refusing.contains(kNames[Row])) {
-        return nullptr;
-    }
-    return std::make_shared<ScriptedWorker>(context, session, std::string(kNames[Row]));
+    const std::string name(workerClassList()[Row].name);
+    return script().refusing.contains(name) ? nullptr
+                                            : std::make_shared<ScriptedWorker>(context, session, name);
 }
 
 constexpr std::array<WorkerClass, 7> kClasses{{
-    {kNames[0], {false, false}, false, false, make<0>},
-    {kNames[1], {true, false}, false, false, make<1>},
-    {kNames[2], {true, true}, false, false, make<2>},
-    {kNames[3], {false, true}, true, true, make<3>},
-    {kNames[4], {false, true}, true, false, make<4>},
-    {kNames[5], {false, true}, true, true, nullptr},
-    {kNames[6], {false, true}, false, true, make<6>},
+    {"Only", {false, false}, false, false, make<0>},
+    {"Producer", {true, false}, false, false, make<1>},
+    {"Both", {true, true}, false, false, make<2>},
+    {"Init", {false, true}, true, true, make<3>},
+    {"Redundant", {false, true}, true, false, make<4>},
+    {"Absent", {false, true}, true, true, nullptr},
+    {"Late", {false, true}, false, true, make<6>},
 }};
 
 } // namespace
@@ -70,28 +66,6 @@ std::span<const WorkerClass> workerClassList() {
 WorkerScript& WorkerScript::current() {
     static WorkerScript script;
     return script;
-}
-
-void WorkerScript::reset() {
-    refusing.clear();
-    notStarting.clear();
-    atStop.clear();
-    (void)take();
-}
-
-void WorkerScript::saw(std::string event) {
-    const std::lock_guard held(mutex_);
-    events_.push_back(std::move(event));
-}
-
-std::vector<std::string> WorkerScript::take() {
-    const std::lock_guard held(mutex_);
-    return std::exchange(events_, {});
-}
-
-std::size_t WorkerScript::count(std::string_view event) const {
-    const std::lock_guard held(mutex_);
-    return static_cast<std::size_t>(std::count(events_.begin(), events_.end(), event));
 }
 
 } // namespace tamblo
