@@ -297,10 +297,7 @@ TEST(WorkerUtilityTest, CombinesBurstsInPlace) {
         {"just below the pause", {{"e", 0.0}, {"s", 1.999}}, 2, "1:s2e1@1.999 "},
         {"the pause since the message before", {{"e", 0.0}, {"r", 1.5}, {"s", 3.0}}, 2, "1:s3e1r2@3.0 "},
         // At the pause; the old anchor stays, and a repeat of the late one's key begins anew.
-        {"pause",
-         {{"e", 0.0}, {"s", 2.0}, {"r", 3.0}, {"s", 3.1}},
-         2,
-         "1:e1@0.0 2:s2@2.0 3:r3@3.0 4:s4@3.1 "},
+        {"pause", {{"e", 0.}, {"s", 2.}, {"r", 3.}, {"s", 3.}}, 2, "1:e1@0.0 2:s2@2.0 3:r3@3.0 4:s4@3.0 "},
         {"one earlier than the anchor", {{"e", 0.0}, {"s", 2.0}, {"r", -3.0}}, 2, "1:e1r3@-3.0 2:s2@2.0 "},
         // No time is 0, and a pause that is no number is long.
         {"no times", {{"e", ""}, {"s", NAN}, {"s", 1.0}, {"e", ""}}, 2, "1:e1@ 2:s2@null 3:s3e4@1.0 "},
@@ -375,7 +372,7 @@ TEST_F(SummaryWorkerTest, CountsMessagesAndActivity) {
     EXPECT_EQ(counts(), "3 3 0 2 6.5 3.25 3");
 }
 
-TEST_F(SummaryWorkerTest, TellsWhoReportedAndHowTheDeviceIs) {
+TEST_F(SummaryWorkerTest, TellsHowTheDeviceIs) {
     device.processInformation.footprint = (std::uint64_t{4} << 30U) + (std::uint64_t{3} << 20U) + 5;
     const std::pair<int, const char*> states[] = {{0, "Nominal"},  {1, "Fair"},    {2, "Serious"},
                                                   {3, "Critical"}, {4, "Unknown"}, {-1, "Unknown"}};
@@ -383,8 +380,9 @@ TEST_F(SummaryWorkerTest, TellsWhoReportedAndHowTheDeviceIs) {
         device.deviceConditions.thermal = state;
         device.deviceConditions.lowPower = state == 1;
         session->start();
-        EXPECT_EQ(summary({"thermal_state", "low_power_enabled", "vmInfo_phys_footprint_MiB"}),
-                  std::string("\"") + name + (state == 1 ? "\" 1 3" : "\" 0 3"));
+        EXPECT_EQ(summary({"thermal_state", "low_power_enabled", "vmInfo_phys_footprint_MiB",
+                           "load_avg_1_min", "load_avg_5_min", "load_avg_15_min"}),
+                  std::string("\"") + name + (state == 1 ? "\" 1" : "\" 0") + " 3 0.5 0.25 0.125");
     }
     session->setClientProcessName(std::nullopt);
     device.processInformation.footprint = ProcessInformation::QueryError{2, "no such file"};

@@ -6,7 +6,6 @@
 
 #include <algorithm>
 #include <cmath>
-#include <sstream>
 
 namespace tamblo {
 namespace {
@@ -26,32 +25,25 @@ protected:
         send(std::move(payload), 0x08000004, 1);
     }
     void run() { device.workQueues.run(kQueue); }
-    /// Does what the words say; a number is sent as a message, or is a time in milliseconds.
+    /// A number is sent as a message, or is a time in milliseconds.
     void play(const std::string& script) {
-        std::istringstream words(script);
-        for (std::string word; words >> word;) {
-            if (word == "start") {
-                session->start();
-            } else if (word == "stop") {
-                session->stop();
-            } else if (word == "drop") {
-                session.reset();
-            } else if (word == "run") {
-                run();
-            } else if (word == "found") { // what answers the oldest configuration that waits
-                device.callQuality.findBackends({{"one", "two"}});
-            } else if (word == "none") {
-                device.callQuality.findBackends(std::nullopt);
-            } else if (word == "fails") {
-                device.callQuality.sendFailure = "no room";
-            } else if (word == "works") {
-                device.callQuality.sendFailure.reset();
-            } else if (word.ends_with("ms")) {
-                device.workQueues.elapse(std::chrono::milliseconds(std::stoi(word)));
-            } else {
-                sendNumber(std::stoi(word));
-            }
-        }
+        playWords(script,
+                  {{"start", [this] { session->start(); }},
+                   {"stop", [this] { session->stop(); }},
+                   {"drop", [this] { session.reset(); }},
+                   {"run", [this] { run(); }},
+                   // What answers the oldest configuration that waits.
+                   {"found", [this] { device.callQuality.findBackends(std::vector<std::string>(2, "one")); }},
+                   {"none", [this] { device.callQuality.findBackends(std::nullopt); }},
+                   {"fails", [this] { device.callQuality.sendFailure = "no room"; }},
+                   {"works", [this] { device.callQuality.sendFailure.reset(); }}},
+                  [this](const std::string& word) {
+                      if (word.ends_with("ms")) {
+                          device.workQueues.elapse(std::chrono::milliseconds(std::stoi(word)));
+                      } else {
+                          sendNumber(std::stoi(word));
+                      }
+                  });
     }
     /// The values of the key in the messages that a Linkmeter session was given: the summary's in brackets,
     /// an "s" for the session's own summary, which its stop sends, and an "f" if it was flushed.
@@ -116,6 +108,7 @@ TEST_F(RtcWorkerTest, SetsUpThenSendsInOrderWhateverComesOfIt) {
         {"the next run is not on", "start run 9000ms run found stop start 1 run", "/+/0"},
         {"until its own are found", "start run 9000ms run found stop start run found 1 run", "/1+/0"},
         {"a dropped session leaves nothing", "start run 1 drop run found run", "/0"},
+        {"nor before it waits", "start 1 drop run found run", "/0"},
         {"when nothing waits, all is sent", "start run found run 1 drop run", "1/0"},
         {"a stopped one is reported in full", "start run 1 stop drop run found run", "1s[1]f/0"},
         {"or when the wait is over", "start run 1 stop drop run 9000ms run", "/0"},

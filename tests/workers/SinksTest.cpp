@@ -32,20 +32,6 @@ protected:
         }
         return found;
     }
-    /// `DURATION ISSUETYPE|NODE|RTAIDCLIENT;` of each metric record.
-    std::string metricRecords() {
-        std::string found;
-        for (const auto& [metric, bytes] : std::exchange(device.diagnosticsMetrics.records, {})) {
-            EXPECT_EQ(metric, 5963779U);
-            tools::ProtoReader reader(bytes);
-            qmxmetrics::AudioIssueDetected record;
-            EXPECT_TRUE(tools::readRecord(reader, record) && reader.atEnd());
-            EXPECT_FALSE(record.timestamp);
-            found += std::to_string(record.duration) + " " + record.issuetype + "|" + record.node + "|" +
-                     record.rtaidclient + ";";
-        }
-        return found;
-    }
 };
 
 TEST_F(SinksTest, AnalyticsEventsHaveAGeneralNameAndOneOfTheService) {
@@ -113,19 +99,26 @@ TEST_F(SinksTest, EveryDetectedIssueIsAMetricRecordOfWhatThereIs) {
     constexpr const char* kSilence = "any_channel_silence_seconds";
     const struct {
         Dictionary payload;
-        const char* record;
+        const char* record; ///< `DURATION ISSUETYPE|NODE|RTAIDCLIENT`
         const char* logged; ///< a line for each thing that is missing
     } cases[] = {
-        {{}, "0 ||;", "eeee"},
-        {{{"issue_type", 3}, {kSilence, 2.9}}, "2 3||;", "ee"},
-        {{{"issue_type", ""}, {"rtaid_client", ""}, {"node", .5F}, {kSilence, -2.9}}, "-2 |0.5|;", ""},
-        {{{"node", Array{true}}, {"rtaid_client", Array{1, "x"}}}, R"(0 |[true]|[1,"x"];)", "ee"},
-        {{{"node", "n"}, {kSilence, 0x1'8000'0007}}, "-2147483641 |n|;", "ee"},
-        {{{"node", "n"}, {kSilence, " 12.7 s"}}, "12 |n|;", "ee"},
+        {{}, "0 ||", "eeee"},
+        {{{"issue_type", 3}, {kSilence, 2.9}}, "2 3||", "ee"},
+        {{{"issue_type", ""}, {"rtaid_client", ""}, {"node", .5F}, {kSilence, -2.9}}, "-2 |0.5|", ""},
+        {{{"node", Array{true}}, {"rtaid_client", Array{1, "x"}}}, R"(0 |[true]|[1,"x"])", "ee"},
+        {{{"node", "n"}, {kSilence, 0x1'8000'0007}}, "-2147483641 |n|", "ee"},
+        {{{"node", "n"}, {kSilence, " 12.7 s"}}, "12 |n|", "ee"},
     };
     for (const auto& row : cases) {
         worker->handleMessage(messageOf(row.payload, 0xFFFFFFFF, AudioEventTypeIssueDetector));
-        EXPECT_EQ(metricRecords(), row.record);
+        const auto& [metric, bytes] = device.diagnosticsMetrics.records.back();
+        EXPECT_EQ(metric, 5963779U);
+        tools::ProtoReader reader(bytes);
+        qmxmetrics::AudioIssueDetected record;
+        EXPECT_TRUE(tools::readRecord(reader, record) && reader.atEnd() && !record.timestamp);
+        EXPECT_EQ(std::to_string(record.duration) + " " + record.issuetype + "|" + record.node + "|" +
+                      record.rtaidclient,
+                  row.record);
         EXPECT_EQ(loggedLevels(ZRReportingQMXLogCategory()), row.logged) << row.record;
     }
 }

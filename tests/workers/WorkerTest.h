@@ -7,7 +7,10 @@
 
 #include <gmock/gmock.h>
 
+#include <functional>
+#include <map>
 #include <memory>
+#include <sstream>
 #include <string>
 #include <string_view>
 #include <utility>
@@ -66,6 +69,17 @@ protected:
         }
         device.log.clear();
         return levels;
+    }
+
+    using Acts = std::map<std::string, std::function<void()>, std::less<>>;
+    /// Does what the words say: those that are no act go to the other one.
+    static void playWords(const std::string& script, const Acts& acts,
+                          const std::function<void(const std::string&)>& other) {
+        std::istringstream words(script);
+        for (std::string word; words >> word;) {
+            const auto act = acts.find(word);
+            act != acts.end() ? act->second() : other(word);
+        }
     }
 
     FakePlatform device;

@@ -3,10 +3,7 @@
 #include "workers/sinks/ZRReportingSessionZephWorker.h"
 #include "workers/sinks/zeph/WorkerInstanceState.h"
 
-#include <functional>
-#include <map>
 #include <optional>
-#include <sstream>
 #include <thread>
 
 namespace tamblo {
@@ -17,6 +14,8 @@ using namespace std::chrono_literals;
 
 constexpr const char* kHapticKey = "Haptic_Active_Hardware_Time_Seconds";
 constexpr const char* kSoundKey = "System_Sound_Stuck_Time_Seconds";
+const Dictionary kHaptic{{kHapticKey, 90}};
+const Dictionary kSound{{kSoundKey, 90}};
 const Dictionary kLow{{"issue_type", "LowRMS"}};
 const Dictionary kOpened{{"success", true}, {"session_id", "S-1"}};
 
@@ -35,37 +34,22 @@ protected:
         device.clock.advance(1ms);
         send(payload, category, type);
     }
-    /// Does what the words say; a number is a time in seconds.
+    /// A number is a time in seconds.
     void play(const std::string& script) {
-        const std::map<std::string, std::function<void()>, std::less<>> acts{
-            {"alarms", [this] { startSession(AudioServiceTypeAlarms); }},
-            {"alerts", [this] { startSession(AudioServiceTypeAlerts); }},
-            {"test", [this] { startSession(AudioServiceTypeTest); }},
-            {"low", [this] { sendNow(kLow, AudioEventKindError, AudioEventTypeIssueDetector); }},
-            {"haptic",
-             [this] {
-                 sendNow({{kHapticKey, 90}}, 4, AudioEventTypeJoulery);
-             }},
-            {"sound",
-             [this] {
-                 sendNow({{kSoundKey, 90}}, 4, AudioEventTypeJoulery);
-             }},
-            {"start", [this] { session->start(); }},
-            {"stop", [this] { session->stop(); }},
-            {"answered", [this] { device.bugCapture.answer(kOpened); }},
-            {"failing",
-             [this] {
-                 device.bugCapture.promptAnswer = Dictionary{{"reason", 1}};
-             }},
-            {"refused", [this] { device.bugCapture.accepts = false; }}};
-        std::istringstream words(script);
-        for (std::string word; words >> word;) {
-            if (const auto act = acts.find(word); act != acts.end()) {
-                act->second();
-            } else {
-                device.clock.advance(std::chrono::seconds(std::stoi(word)));
-            }
-        }
+        const Dictionary failure{{"reason", 1}};
+        playWords(script,
+                  {{"alarms", [this] { startSession(AudioServiceTypeAlarms); }},
+                   {"alerts", [this] { startSession(AudioServiceTypeAlerts); }},
+                   {"test", [this] { startSession(AudioServiceTypeTest); }},
+                   {"low", [this] { sendNow(kLow, AudioEventKindError, AudioEventTypeIssueDetector); }},
+                   {"haptic", [this] { sendNow(kHaptic, 4, AudioEventTypeJoulery); }},
+                   {"sound", [this] { sendNow(kSound, 4, AudioEventTypeJoulery); }},
+                   {"start", [this] { session->start(); }},
+                   {"stop", [this] { session->stop(); }},
+                   {"answered", [this] { device.bugCapture.answer(kOpened); }},
+                   {"failing", [&] { device.bugCapture.promptAnswer = failure; }},
+                   {"refused", [this] { device.bugCapture.accepts = false; }}},
+                  [this](const auto& word) { device.clock.advance(std::chrono::seconds(std::stoi(word))); });
     }
     /// What was asked of the capture service since the last call.
     std::string asked() {
