@@ -128,7 +128,8 @@ TEST(JsonWriter, SaysForPeopleWhatHasNoFormAndWhere) {
          "a number that is not finite has no JSON form, at /K_1/n"},
         {{{"list", Array{1, Dictionary{{"a/b~", -std::numeric_limits<float>::infinity()}}}}},
          "a number that is not finite has no JSON form, at /K_1/list/1/a~1b~0"},
-        {{{"", Dictionary{{"d", Array{Array{Value::date(1)}}}}}}, "a date has no JSON form, at /K_1//d/0/0"},
+        {{{"", Dictionary{{"d", Array{Value(Array{Value::date(1)})}}}}},
+         "a date has no JSON form, at /K_1//d/0/0"},
     };
     for (const auto& [payload, says] : rows) {
         EXPECT_EQ(prettyText("K_1", payload), says);
