@@ -191,15 +191,15 @@ void LinuxPlatform::run(SerialQueue& requestQueue,
         all.sinks.flush();
         all.connections.releaseReplies();
     });
-    all.workQueues.threads().setRunEnd([&all] { all.callQuality.flush(); });
-    all.connections.setRequestQueue(requestQueue, all.workQueues.threads());
+    all.workQueues.setRunEnd([&all] { all.callQuality.flush(); });
+    all.connections.setRequestQueue(requestQueue, all.workQueues);
     all.signals.setEndWanted([&all, &shutDown] {
         notifyServiceManager("STOPPING=1");
         all.connections.stop();
         shutDown([&all] { all.loop.post([&all] { all.loop.stop(); }); });
     });
     notifyServiceManager("READY=1");
-    all.loop.run(all.workQueues.threads());
+    all.loop.run(all.workQueues);
     all.sinks.flush();
 }
 

@@ -61,7 +61,7 @@ TEST(ConnectionService, EndsAClientWhoseSocketCannotBeWatchedAndServesTheOthers)
     LinuxWorkQueues queues;
     const auto requests = queues.makeSerialQueue("requests");
     Delegate delegate;
-    service.setRequestQueue(*requests, queues.threads());
+    service.setRequestQueue(*requests, queues);
     service.setDelegate(delegate);
     ASSERT_EQ(service.open(directory.path()), std::nullopt);
 
@@ -69,7 +69,7 @@ TEST(ConnectionService, EndsAClientWhoseSocketCannotBeWatchedAndServesTheOthers)
     additionsToRefuse = 1;
     service.resume();
     EXPECT_THAT(log.take(), ElementsAre("3 zrrs accepting connections rests: No space left on device"));
-    std::thread thread([&] { loop.run(queues.threads()); });
+    std::thread thread([&] { loop.run(queues); });
 
     additionsToRefuse = 0;
     const FileDescriptor early = connectTo(path);

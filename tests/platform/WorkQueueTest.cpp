@@ -1,4 +1,3 @@
-#include "platform/linux/loop/LinuxSerialQueue.h"
 #include "platform/linux/loop/LinuxWorkQueues.h"
 
 #include <gtest/gtest.h>
@@ -83,15 +82,15 @@ TEST(SerialQueue, QuickWorkIsDrainedByThePosterInOneBatch) {
     LinuxWorkQueues queues;
     const auto queue = queues.makeSerialQueue("inline");
     queue->setBatchEnd(trace.step('|'));
-    queues.threads().setRunEnd(trace.step('.'));
-    queues.threads().beginWakeUp();
+    queues.setRunEnd(trace.step('.'));
+    queues.beginWakeUp();
     queue->post([&] {
         trace.add('a');
         queue->post(trace.step('c'));
     });
     queue->post(trace.step('b'));
     EXPECT_EQ(trace.text(), "");
-    queues.threads().endWakeUp();
+    queues.endWakeUp();
     EXPECT_EQ(trace.text(), "ab|c|.");
 }
 
@@ -101,7 +100,7 @@ TEST(SerialQueue, WorkThatMayBlockLeavesThePosterAndTakesWhatFollowsAlong) {
         const auto queue = queues.makeSerialQueue("hand over");
         Trace trace;
         std::latch mayGoOn(1);
-        queues.threads().beginWakeUp();
+        queues.beginWakeUp();
         queue->post([&] {
             trace.add('a');
             queue->setMayBlock(mayAllBlock); // even what is posted already
@@ -113,7 +112,7 @@ TEST(SerialQueue, WorkThatMayBlockLeavesThePosterAndTakesWhatFollowsAlong) {
             },
             mayAllBlock ? Pace::quick : Pace::mayBlock);
         queue->post(trace.step('c'));
-        queues.threads().endWakeUp(); // returns although b has not run
+        queues.endWakeUp(); // returns although b has not run
         mayGoOn.count_down();
         settle(*queue);
         EXPECT_EQ(trace.text(), "aBC");
@@ -158,13 +157,13 @@ TEST(SerialQueue, WhatWasPostedRunsAfterItIsDestroyed) {
 
         // In its own work, and on the thread that is to drain it.
         queue = queues.makeSerialQueue("suicide");
-        queues.threads().beginWakeUp();
+        queues.beginWakeUp();
         queue->post([&] { queue.reset(); });
         queue->post([&ran] { ++ran; });
         auto other = queues.makeSerialQueue("abandoned");
         other->post([&ran] { ++ran; });
         other.reset();
-        queues.threads().endWakeUp();
+        queues.endWakeUp();
         EXPECT_EQ(queue, nullptr);
     }
     EXPECT_EQ(ran, 1002);
@@ -182,7 +181,7 @@ TEST(SerialQueue, RunsNothingWhileItIsSuspendedAndAllOfItAfterwards) {
             }
         });
         if (isInline) {
-            queues.threads().beginWakeUp();
+            queues.beginWakeUp();
         }
         queue->post([&] {
             queue->suspend();
@@ -190,7 +189,7 @@ TEST(SerialQueue, RunsNothingWhileItIsSuspendedAndAllOfItAfterwards) {
             trace.add('a');
         });
         queue->post(trace.step('b')); // as a rule of the same batch
-        queues.threads().endWakeUp();
+        queues.endWakeUp();
         ASSERT_EQ(suspended.get_future().wait_for(kPatience), std::future_status::ready);
         queue->post(trace.step('c'), Pace::mayBlock);
         auto other = queues.makeSerialQueue("other");

@@ -31,7 +31,7 @@ public:
     /// way.
     [[nodiscard]] std::optional<std::string> open(const std::string& runtimeDirectory);
     /// The queue that carries out requests, and its threads. Before the loop runs.
-    void setRequestQueue(SerialQueue& queue, StrandThreads& threads) noexcept {
+    void setRequestQueue(SerialQueue& queue, LinuxWorkQueues& threads) noexcept {
         shared_.intake.setQueue(queue, threads);
     }
 

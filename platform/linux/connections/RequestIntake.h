@@ -2,7 +2,7 @@
 
 #include "base/KeySetCache.h"
 #include "platform/WorkQueue.h"
-#include "platform/linux/loop/LinuxSerialQueue.h"
+#include "platform/linux/loop/LinuxWorkQueues.h"
 #include "wire/Request.h"
 
 #include <cstddef>
@@ -30,7 +30,7 @@ public:
     RequestIntake() : buffer_(new std::uint8_t[kSmallRest + kBytesPerRead]) {}
 
     /// The queue that carries requests out, and the threads that it runs on. Before the first read.
-    void setQueue(SerialQueue& queue, StrandThreads& threads) noexcept {
+    void setQueue(SerialQueue& queue, LinuxWorkQueues& threads) noexcept {
         queue_ = &queue;
         threads_ = &threads;
     }
@@ -56,7 +56,7 @@ private:
     KeySetCache keySets_;
     wire::Request request_;
     SerialQueue* queue_ = nullptr;
-    StrandThreads* threads_ = nullptr;
+    LinuxWorkQueues* threads_ = nullptr;
 };
 
 } // namespace tamblo

@@ -1,6 +1,6 @@
 #include "platform/linux/loop/EventLoop.h"
 
-#include "platform/linux/loop/LinuxSerialQueue.h"
+#include "platform/linux/loop/LinuxWorkQueues.h"
 
 #include <algorithm>
 #include <array>
@@ -28,8 +28,6 @@ EventLoop::EventLoop(Control calls)
       wakeUp_(::eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK)) {
     isOpen_ = control(EPOLL_CTL_ADD, wakeUp_.get(), EPOLLIN, nullptr);
 }
-
-EventLoop::~EventLoop() = default;
 
 bool EventLoop::control(int operation, int descriptor, std::uint32_t events, EventSource* source) {
     epoll_event event{};
@@ -94,7 +92,7 @@ void EventLoop::runDelayed() {
     }
 }
 
-void EventLoop::run(StrandThreads& strands) {
+void EventLoop::run(LinuxWorkQueues& strands) {
     std::array<epoll_event, kEventsPerWakeUp> events;
     while (!isStopped_) {
         const int count = ::epoll_wait(epoll_.get(), events.data(), kEventsPerWakeUp, timeout());

@@ -13,7 +13,7 @@ struct epoll_event;
 
 namespace tamblo {
 
-class StrandThreads;
+class LinuxWorkQueues;
 
 /// Something with a file descriptor that the loop watches.
 class EventSource {
@@ -53,7 +53,6 @@ public:
 
     EventLoop();
     explicit EventLoop(Control calls);
-    ~EventLoop();
     EventLoop(const EventLoop&) = delete;
     EventLoop& operator=(const EventLoop&) = delete;
     /// False when the kernel refused what it needs; nothing else may be called then.
@@ -71,7 +70,7 @@ public:
     void callAfter(std::chrono::milliseconds delay, Task task);
 
     /// Returns after `stop`, which is called on the loop's thread. Lends its thread to the strands.
-    void run(StrandThreads& strands);
+    void run(LinuxWorkQueues& strands);
     void stop() noexcept { isStopped_ = true; }
 
 private:

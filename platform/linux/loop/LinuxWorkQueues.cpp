@@ -1,10 +1,40 @@
 #include "platform/linux/loop/LinuxWorkQueues.h"
 
+#include <string>
 #include <utility>
 
 namespace tamblo {
 
 namespace {
+
+/// A batch that takes longer than this ran into something slow (a disk that stalls, most likely). For this
+/// many times as long the queue is then left to the pool, so that the responsive thread is held up for a
+/// small share of the time, and so that a short hold-up, when other programs had the processor, has no
+/// lasting effect.
+constexpr std::chrono::milliseconds kSlowBatch{25};
+constexpr int kSlowBatchFactor = 4;
+
+/// A serial queue: its user's hold on a strand, which lives on until it has run what was posted.
+class LinuxSerialQueue final : public SerialQueue {
+public:
+    /// The threads must outlive the queue's work.
+    LinuxSerialQueue(LinuxWorkQueues& threads, std::string_view label)
+        : label_(label), strand_(std::make_shared<Strand>(threads)) {}
+    ~LinuxSerialQueue() override { strand_->resume(); }
+    LinuxSerialQueue(const LinuxSerialQueue&) = delete;
+    LinuxSerialQueue& operator=(const LinuxSerialQueue&) = delete;
+
+    void post(Work work, Pace pace) override { strand_->post(std::move(work), pace); }
+    void setBatchEnd(Work batchEnd) override { strand_->setBatchEnd(std::move(batchEnd)); }
+    void setMayBlock(bool mayBlock) override { strand_->setMayBlock(mayBlock); }
+    void suspend() override { strand_->suspend(); }
+    void resume() override { strand_->resume(); }
+    [[nodiscard]] std::string_view label() const noexcept override { return label_; }
+
+private:
+    const std::string label_;
+    const std::shared_ptr<Strand> strand_;
+};
 
 class PooledCall final : public DelayedCall {
 public:
@@ -22,12 +52,132 @@ private:
 } // namespace
 
 std::unique_ptr<SerialQueue> LinuxWorkQueues::makeSerialQueue(std::string_view label) {
-    return std::make_unique<LinuxSerialQueue>(threads_, label);
+    return std::make_unique<LinuxSerialQueue>(*this, label);
 }
 
 std::unique_ptr<DelayedCall> LinuxWorkQueues::callAfter(std::chrono::milliseconds delay,
                                                         UniqueFunction<void()> call) {
-    return std::make_unique<PooledCall>(threads_.pool(), delay, std::move(call));
+    return std::make_unique<PooledCall>(pool_, delay, std::move(call));
+}
+
+void LinuxWorkQueues::endWakeUp() {
+    drain();
+    collector_ = std::thread::id();
+}
+
+void LinuxWorkQueues::drain() {
+    posted_ = 0;
+    if (collected_.empty()) {
+        return;
+    }
+    // Draining one strand may post to others, which then join the list.
+    for (std::size_t i = 0; i < collected_.size(); ++i) {
+        const std::shared_ptr<Strand> strand = std::move(collected_[i]);
+        strand->drainQuickly();
+    }
+    collected_.clear();
+    endRun();
+}
+
+void LinuxWorkQueues::schedule(std::shared_ptr<Strand> strand) {
+    if (collector_.load(std::memory_order_relaxed) == std::this_thread::get_id()) {
+        collected_.push_back(std::move(strand));
+    } else {
+        scheduleOnPool(std::move(strand));
+    }
+}
+
+void LinuxWorkQueues::scheduleOnPool(std::shared_ptr<Strand> strand) {
+    pool_.post([this, strand = std::move(strand)] {
+        strand->drain();
+        endRun();
+    });
+}
+
+void LinuxWorkQueues::endRun() {
+    if (runEnd_) {
+        runEnd_();
+    }
+}
+
+void Strand::post(Work work, Pace pace) {
+    {
+        const MutexLock lock(mutex_);
+        pending_.push_back({std::move(work), pace});
+        if (std::exchange(isScheduled_, true)) {
+            return;
+        }
+    }
+    threads_.schedule(shared_from_this());
+}
+
+void Strand::resume() {
+    {
+        const MutexLock lock(mutex_);
+        // The rest of a batch may be looked at here while nobody drains.
+        if (!isSuspended_.exchange(false) || isScheduled_ || (next_ == batch_.size() && pending_.empty())) {
+            return;
+        }
+        isScheduled_ = true;
+    }
+    threads_.schedule(shared_from_this());
+}
+
+bool Strand::hasBatch() {
+    const bool hasRest = next_ != batch_.size();
+    if (!hasRest) {
+        batch_.clear();
+        next_ = 0;
+    }
+    const MutexLock lock(mutex_);
+    if (isSuspended_ || (!hasRest && pending_.empty())) {
+        isScheduled_ = false;
+        return false;
+    }
+    if (!hasRest) {
+        batch_.swap(pending_);
+    }
+    return true;
+}
+
+void Strand::runBatch(bool stopAtBlocking) {
+    while (next_ != batch_.size() && !isSuspended_) {
+        Item& item = batch_[next_];
+        if (stopAtBlocking && (mayBlock_ || item.pace == Pace::mayBlock)) {
+            break;
+        }
+        item.work();
+        // What the work holds is let go before the next runs, as if it had never been queued.
+        item.work.reset();
+        ++next_;
+    }
+    if (batchEnd_) {
+        batchEnd_();
+    }
+}
+
+void Strand::drain() {
+    while (hasBatch()) {
+        runBatch(false);
+    }
+}
+
+void Strand::drainQuickly() {
+    Time started = std::chrono::steady_clock::now();
+    bool isForPool = started < quickAllowedFrom_;
+    while (!isForPool && hasBatch()) {
+        runBatch(true);
+        const Time ended = std::chrono::steady_clock::now();
+        if (ended - started > kSlowBatch) {
+            quickAllowedFrom_ = ended + kSlowBatchFactor * (ended - started);
+        }
+        const bool isAtBlocking = next_ != batch_.size() && !isSuspended_;
+        isForPool = isAtBlocking || ended < quickAllowedFrom_;
+        started = ended;
+    }
+    if (isForPool) {
+        threads_.scheduleOnPool(shared_from_this());
+    }
 }
 
 } // namespace tamblo
