@@ -29,7 +29,6 @@ template <typename Piece> void LinkmeterAgent::post(Piece piece, Pace pace) {
     }
     linkmeterQueue_->post(
         [self = shared_from_this(), piece = std::move(piece)]() mutable {
-            self->settle();
             if (!self->isDropped_) {
                 piece(*self);
             }
@@ -68,7 +67,7 @@ void LinkmeterAgent::stop(std::vector<MessageRef> messages, AudioServiceType ser
 void LinkmeterAgent::abandon() {
     const MutexLock held(mutex_);
     isAbandoned_ = true;
-    if (wait_ == Wait::waiting && stopsToCome_ == 0) {
+    if (isWaiting_ && stopsToCome_ == 0) {
         isDropped_ = true;
         timeOut_.reset();
         linkmeterQueue_->resume();
@@ -93,7 +92,6 @@ void LinkmeterAgent::setUp(Dictionary sessionInfo, const Dictionary& userInfo) {
                                    agent.backendsFound(backends);
                                }));
     waitForBackends();
-    settle();
 }
 
 void LinkmeterAgent::waitForBackends() {
@@ -101,11 +99,11 @@ void LinkmeterAgent::waitForBackends() {
     const MutexLock held(mutex_);
     if (signals_ != 0) {
         --signals_;
-        wait_ = Wait::found;
+        tellWhatWasFound();
     } else if (isAbandoned_ && stopsToCome_ == 0) {
         isDropped_ = true;
     } else {
-        wait_ = Wait::waiting;
+        isWaiting_ = true;
         timeOut_ = context_.platform().workQueues->callAfter(
             kBackendPatience, whileAlive(weak_from_this(), [number = ++waitNumber_](LinkmeterAgent& agent) {
                 agent.timeOut(number);
@@ -125,44 +123,30 @@ void LinkmeterAgent::backendsFound(const std::optional<std::vector<std::string>>
     // after its stop, would keep the session's next start from setting up anew.
     linkmeterSessionStarted_ = backends.has_value();
     const MutexLock held(mutex_);
-    if (wait_ == Wait::waiting) {
-        endWait(Wait::found);
+    if (isWaiting_) {
+        isWaiting_ = false;
+        timeOut_.reset();
+        tellWhatWasFound();
+        linkmeterQueue_->resume();
     } else {
         ++signals_;
     }
 }
 
+void LinkmeterAgent::tellWhatWasFound() const {
+    log::standard(ZRReportingSessionLinkmeterCategory(), "{}",
+                  linkmeterSessionStarted_ ? "continuing with backends!" : "failed to find backend");
+}
+
 void LinkmeterAgent::timeOut(std::uint64_t waitNumber) {
     const MutexLock held(mutex_);
-    if (wait_ == Wait::waiting && waitNumber_ == waitNumber) {
-        endWait(Wait::timedOut);
-    }
-}
-
-void LinkmeterAgent::endWait(Wait outcome) {
-    wait_ = outcome;
-    linkmeterQueue_->resume();
-    linkmeterQueue_->post([self = shared_from_this()] { self->settle(); });
-}
-
-void LinkmeterAgent::settle() {
-    MutexLock held(mutex_);
-    if (wait_ == Wait::none || wait_ == Wait::waiting) {
-        return;
-    }
-    const bool isTimedOut = std::exchange(wait_, Wait::none) == Wait::timedOut;
-    timeOut_.reset();
-    held.unlock();
-    const LogCategory& category = ZRReportingSessionLinkmeterCategory();
-    if (isTimedOut) {
+    if (isWaiting_ && waitNumber_ == waitNumber) {
+        isWaiting_ = false;
         // Back ends that are found later still turn the worker on. It then has no session to send to, and
         // what it sends is lost quietly; this is meant.
-        log::standard(category, "timed out waiting for backends");
+        log::standard(ZRReportingSessionLinkmeterCategory(), "timed out waiting for backends");
         linkmeterSession_.reset();
-    } else if (linkmeterSessionStarted_) {
-        log::standard(category, "continuing with backends!");
-    } else {
-        log::standard(category, "failed to find backend");
+        linkmeterQueue_->resume();
     }
 }
 

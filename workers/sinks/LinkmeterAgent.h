@@ -45,20 +45,16 @@ public:
     void abandon();
 
 private:
-    enum class Wait : std::uint8_t { none, waiting, found, timedOut };
-
     template <typename Piece> void post(Piece piece, Pace pace = Pace::quick);
 
     // Any thread.
     void backendsFound(const std::optional<std::vector<std::string>>& backends);
     void timeOut(std::uint64_t waitNumber);
-    void endWait(Wait outcome) TAMBLO_REQUIRES(mutex_);
+    void tellWhatWasFound() const;
 
     // On the queue.
     void setUp(Dictionary sessionInfo, const Dictionary& userInfo);
     void waitForBackends();
-    /// Before whatever comes after a wait: what the wait has come to.
-    void settle();
     void sendMessage(Message message);
     void finish(const std::vector<MessageRef>& messages, AudioServiceType serviceType, ReporterID reporterID);
     void sendSummary(const std::vector<MessageRef>& messages, AudioServiceType serviceType,
@@ -69,12 +65,12 @@ private:
     std::atomic<bool> linkmeterSessionStarted_{false};
     std::atomic<bool> isDropped_{false}; ///< nobody will hear of the session any more
 
-    CallQualityService::SessionRef linkmeterSession_; ///< touched on the queue alone
+    CallQualityService::SessionRef linkmeterSession_; ///< touched on the queue, or by what ends its wait
 
     Mutex mutex_;
     bool isAbandoned_ TAMBLO_GUARDED_BY(mutex_) = false;
     std::size_t stopsToCome_ TAMBLO_GUARDED_BY(mutex_) = 0;
-    Wait wait_ TAMBLO_GUARDED_BY(mutex_) = Wait::none;
+    bool isWaiting_ TAMBLO_GUARDED_BY(mutex_) = false;
     std::uint64_t waitNumber_ TAMBLO_GUARDED_BY(mutex_) = 0;
     std::unique_ptr<DelayedCall> timeOut_ TAMBLO_GUARDED_BY(mutex_);
     /// The count of the semaphore that the wait is for. It lasts: back ends that come too late for one run
