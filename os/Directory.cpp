@@ -1,7 +1,9 @@
 #include "os/Directory.h"
 
 #include <cerrno>
+#include <memory>
 
+#include <dirent.h>
 #include <fcntl.h>
 #include <sys/file.h>
 
@@ -45,6 +47,26 @@ FileDescriptor lockDirectory(const std::string& path) {
         }
     }
     return directory;
+}
+
+DirectoryEntries DirectoryEntries::read(const std::string& path, std::size_t most) {
+    const std::unique_ptr<DIR, int (*)(DIR*)> directory(::opendir(path.c_str()), ::closedir);
+    if (directory == nullptr) {
+        return {errno};
+    }
+    DirectoryEntries entries;
+    while (const dirent* entry = ::readdir(directory.get())) {
+        const std::string_view name = entry->d_name;
+        if (name == "." || name == "..") {
+            continue;
+        }
+        if (entries.names.size() == most) {
+            entries.isCut = true;
+            break;
+        }
+        entries.names.emplace_back(name);
+    }
+    return entries;
 }
 
 } // namespace tamblo

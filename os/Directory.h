@@ -2,8 +2,10 @@
 
 #include "os/FileDescriptor.h"
 
+#include <cstddef>
 #include <string>
 #include <string_view>
+#include <vector>
 
 #include <sys/stat.h>
 
@@ -18,5 +20,16 @@ namespace tamblo {
 /// Takes a directory's advisory lock (`flock`), waiting for whoever has it: it lasts as long as the
 /// descriptor. Not open, with the reason in `errno`, when it cannot be had.
 [[nodiscard]] FileDescriptor lockDirectory(const std::string& path);
+
+/// The names of a directory's entries at this moment, without "." and ".." and in no order, or why they
+/// cannot be had.
+struct DirectoryEntries {
+    /// Of more than `most` entries, any so many.
+    [[nodiscard]] static DirectoryEntries read(const std::string& path, std::size_t most);
+
+    int error = 0; ///< 0 or an `errno`
+    bool isCut = false;
+    std::vector<std::string> names = {};
+};
 
 } // namespace tamblo

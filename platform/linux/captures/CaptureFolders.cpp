@@ -2,7 +2,7 @@
 
 #include "base/Format.h"
 #include "base/Rfc3339.h"
-#include "os/DirectoryEntries.h"
+#include "os/Directory.h"
 #include "os/ReplaceFile.h"
 
 #include <algorithm>
@@ -73,10 +73,8 @@ std::string CaptureFolders::identifier(WallTime time, std::uint64_t number) {
 void CaptureFolders::store(std::string_view identifier, std::span<const CaptureFile> files, WallTime now) {
     // Before, for a disk that is full of old ones; after, as the new one counts too.
     removeOld(now, identifier);
-    std::string problem = makeDirectory();
-    if (problem.empty()) {
-        problem = write(identifier, files);
-    }
+    const int error = makeDirectory(directory_);
+    const std::string problem = error != 0 ? failure("make", "it", error) : write(identifier, files);
     tell(isWritingOut_, problem, "captures have no folders until it can be written again");
     // Where there is no folder either, one line says it all.
     if (problem.empty()) {
@@ -87,21 +85,9 @@ void CaptureFolders::store(std::string_view identifier, std::span<const CaptureF
 
 void CaptureFolders::keep(std::string_view name, std::string_view text) {
     // A directory that there is not is told with the folder.
-    const bool isThere = makeDirectory().empty();
+    const bool isThere = makeDirectory(directory_) == 0;
     const int error = isThere ? replaceFileAtomically(formatted("{}/{}", directory_, name), text) : 0;
     keepingProblem_ = error != 0 ? failure("write", name, error) : "";
-}
-
-std::string CaptureFolders::makeDirectory() const {
-    if (::mkdir(directory_.c_str(), S_IRWXU) == 0) {
-        return "";
-    }
-    const int failed = errno;
-    std::error_code ignored;
-    if (fs::is_directory(directory_, ignored)) {
-        return "";
-    }
-    return failure("make", "it", failed == EEXIST ? ENOTDIR : failed);
 }
 
 std::string CaptureFolders::write(std::string_view identifier, std::span<const CaptureFile> files) const {

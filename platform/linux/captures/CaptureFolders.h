@@ -57,7 +57,6 @@ public:
     void keep(std::string_view name, std::string_view text);
 
 private:
-    [[nodiscard]] std::string makeDirectory() const;
     [[nodiscard]] std::string write(std::string_view identifier, std::span<const CaptureFile> files) const;
     void removeOld(WallTime now, std::string_view latest);
     void tell(bool& isOut, std::string_view problem, std::string_view consequence);

@@ -1,7 +1,7 @@
 #include "platform/linux/drivers/ChanlogFiles.h"
 
 #include "base/Format.h"
-#include "os/DirectoryEntries.h"
+#include "os/Directory.h"
 #include "platform/linux/drivers/ChanlogChannelJson.h"
 
 #include <algorithm>
