@@ -1,45 +1,9 @@
 #include "os/FileOperations.h"
 
 #include <cerrno>
-#include <cstdio>
 #include <ctime>
 
-#include <fcntl.h>
-#include <unistd.h>
-
 namespace tamblo {
-
-int FileOperations::open(const char* path, int flags, mode_t mode) noexcept {
-    return ::open(path, flags, mode);
-}
-
-int FileOperations::close(int descriptor) noexcept {
-    return ::close(descriptor);
-}
-
-ssize_t FileOperations::write(int descriptor, const void* bytes, std::size_t count) noexcept {
-    return ::write(descriptor, bytes, count);
-}
-
-ssize_t FileOperations::readAt(int descriptor, void* bytes, std::size_t count, off_t offset) noexcept {
-    return ::pread(descriptor, bytes, count, offset);
-}
-
-int FileOperations::truncate(int descriptor, off_t size) noexcept {
-    return ::ftruncate(descriptor, size);
-}
-
-int FileOperations::status(int descriptor, struct stat& status) noexcept {
-    return ::fstat(descriptor, &status);
-}
-
-int FileOperations::status(const char* path, struct stat& status) noexcept {
-    return ::stat(path, &status);
-}
-
-int FileOperations::rename(const char* from, const char* to) noexcept {
-    return ::rename(from, to);
-}
 
 std::chrono::nanoseconds FileOperations::coarseTime() noexcept {
     timespec time{};

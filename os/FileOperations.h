@@ -2,10 +2,12 @@
 
 #include <chrono>
 #include <cstddef>
+#include <cstdio>
 #include <string_view>
 
+#include <fcntl.h>
 #include <sys/stat.h>
-#include <sys/types.h>
+#include <unistd.h>
 
 namespace tamblo {
 
@@ -14,14 +16,18 @@ namespace tamblo {
 class FileOperations {
 public:
     virtual ~FileOperations() = default;
-    virtual int open(const char* path, int flags, mode_t mode) noexcept;
-    virtual int close(int descriptor) noexcept;
-    virtual ssize_t write(int descriptor, const void* bytes, std::size_t count) noexcept;
-    virtual ssize_t readAt(int descriptor, void* bytes, std::size_t count, off_t offset) noexcept;
-    virtual int truncate(int descriptor, off_t size) noexcept;
-    virtual int status(int descriptor, struct stat& status) noexcept;
-    virtual int status(const char* path, struct stat& status) noexcept;
-    virtual int rename(const char* from, const char* to) noexcept;
+    virtual int open(const char* path, int flags, mode_t mode) noexcept { return ::open(path, flags, mode); }
+    virtual int close(int descriptor) noexcept { return ::close(descriptor); }
+    virtual ssize_t write(int descriptor, const void* bytes, std::size_t count) noexcept {
+        return ::write(descriptor, bytes, count);
+    }
+    virtual ssize_t readAt(int descriptor, void* bytes, std::size_t count, off_t offset) noexcept {
+        return ::pread(descriptor, bytes, count, offset);
+    }
+    virtual int truncate(int descriptor, off_t size) noexcept { return ::ftruncate(descriptor, size); }
+    virtual int status(int descriptor, struct stat& status) noexcept { return ::fstat(descriptor, &status); }
+    virtual int status(const char* path, struct stat& status) noexcept { return ::stat(path, &status); }
+    virtual int rename(const char* from, const char* to) noexcept { return ::rename(from, to); }
     /// A clock that is cheap to read and advances every few milliseconds.
     virtual std::chrono::nanoseconds coarseTime() noexcept;
 

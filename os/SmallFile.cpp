@@ -1,10 +1,8 @@
 #include "os/SmallFile.h"
 
-#include "base/SplitText.h"
 #include "os/FileDescriptor.h"
 
 #include <algorithm>
-#include <cerrno>
 #include <system_error>
 
 #include <fcntl.h>
@@ -57,16 +55,8 @@ SmallFile SmallFile::read(int descriptor, std::size_t limit, std::size_t expecte
     }
 }
 
-bool SmallFile::isMissing() const noexcept {
-    return error == ENOENT || error == ENOTDIR;
-}
-
 std::string SmallFile::reason() const {
     return error == EINVAL ? "not a regular file" : std::generic_category().message(error);
-}
-
-std::string_view SmallFile::trimmed() const noexcept {
-    return tamblo::trimmed(text);
 }
 
 } // namespace tamblo

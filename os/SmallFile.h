@@ -1,7 +1,9 @@
 #pragma once
 
+#include "base/SplitText.h"
 #include "os/FileState.h"
 
+#include <cerrno>
 #include <cstddef>
 #include <string>
 #include <string_view>
@@ -21,11 +23,11 @@ struct SmallFile {
     /// What comes from a descriptor of any kind until its end, for which this may wait.
     [[nodiscard]] static SmallFile read(int descriptor, std::size_t limit, std::size_t expected = 0);
 
-    [[nodiscard]] bool isMissing() const noexcept;
+    [[nodiscard]] bool isMissing() const noexcept { return error == ENOENT || error == ENOTDIR; }
     /// The error in words.
     [[nodiscard]] std::string reason() const;
     /// Without the white space at both ends.
-    [[nodiscard]] std::string_view trimmed() const noexcept;
+    [[nodiscard]] std::string_view trimmed() const noexcept { return tamblo::trimmed(text); }
 
     int error = 0;
     std::string text = {};   ///< empty after an error

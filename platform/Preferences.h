@@ -1,5 +1,6 @@
 #pragma once
 
+#include "base/Json.h"
 #include "base/Value.h"
 #include "platform/WorkQueue.h"
 
@@ -38,7 +39,13 @@ public:
         return store_.copyPreferenceValue(key, domain_).has_value();
     }
     /// A text as it stands and a number as a text; empty for anything else, and without a value.
-    [[nodiscard]] std::string stringValue(std::string_view key) const;
+    [[nodiscard]] std::string stringValue(std::string_view key) const {
+        const std::optional<Value> value = store_.copyPreferenceValue(key, domain_);
+        if (!value || value->isString()) {
+            return value ? std::string(value->stringValue()) : std::string();
+        }
+        return value->isNumber() ? jsonText(*value) : std::string();
+    }
     /// False without a value.
     [[nodiscard]] bool boolValue(std::string_view key) const {
         const std::optional<Value> value = store_.copyPreferenceValue(key, domain_);

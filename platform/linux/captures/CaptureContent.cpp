@@ -2,7 +2,7 @@
 
 #include "base/Format.h"
 #include "base/Utf8.h"
-#include "os/DirectoryEntries.h"
+#include "os/Directory.h"
 #include "os/SmallFile.h"
 
 #include <algorithm>

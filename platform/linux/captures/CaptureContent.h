@@ -5,7 +5,7 @@
 #include "platform/Clock.h"
 #include "platform/linux/captures/CaptureFolders.h"
 #include "platform/linux/device/ProcessFiles.h"
-#include "platform/linux/sinks/SinkLine.h"
+#include "platform/linux/sinks/AppendOnlyFile.h"
 
 #include <chrono>
 #include <cstddef>

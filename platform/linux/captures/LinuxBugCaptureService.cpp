@@ -3,7 +3,6 @@
 #include "base/Format.h"
 #include "os/RandomNumber.h"
 #include "platform/ProcessList.h"
-#include "platform/linux/sinks/SinkLine.h"
 
 #include <span>
 #include <utility>
@@ -16,18 +15,12 @@ namespace {
 /// Beside the folders.
 constexpr std::string_view kAllowanceFile = "allowance.json";
 
-std::vector<pid_t> withoutRepeats(std::span<const pid_t> processes) {
-    ProcessList list;
-    list.add(processes);
-    return std::move(list).take();
-}
-
 } // namespace
 
 class LinuxBugCaptureService::Reporter final : public GlarnReporter {
 public:
-    Reporter(LinuxBugCaptureService& service, std::span<const pid_t> processes)
-        : service_(service), processes_(withoutRepeats(processes)) {}
+    Reporter(LinuxBugCaptureService& service, std::vector<pid_t> processes)
+        : service_(service), processes_(std::move(processes)) {}
 
     [[nodiscard]] bool snapshot(const BugCaptureSignature& signature, std::chrono::duration<double> duration,
                                 const Dictionary& payload, Reply reply) override {
@@ -61,7 +54,9 @@ LinuxBugCaptureService::LinuxBugCaptureService(SinkFiles& sinks, const std::stri
              {.waiting = kMaximumWaiting, .what = "pieces of bug captures", .categoryCode = "zrrb"}, log) {}
 
 std::unique_ptr<GlarnReporter> LinuxBugCaptureService::makeReporter(std::span<const pid_t> processes) {
-    return std::make_unique<Reporter>(*this, processes);
+    ProcessList eachOnce;
+    eachOnce.add(processes);
+    return std::make_unique<Reporter>(*this, std::move(eachOnce).take());
 }
 
 bool LinuxBugCaptureService::request(CaptureRequest request, const GlarnReporter::Reply& reply) {

@@ -1,7 +1,6 @@
 #include "platform/linux/captures/LinuxDiagnosticCapture.h"
 
 #include "platform/ProcessList.h"
-#include "platform/linux/sinks/SinkLine.h"
 
 #include <algorithm>
 #include <utility>

@@ -1,7 +1,5 @@
 #include "platform/linux/captures/LinuxMemoryLog.h"
 
-#include "platform/linux/sinks/SinkLine.h"
-
 #include <optional>
 #include <utility>
 

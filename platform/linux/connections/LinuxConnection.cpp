@@ -33,18 +33,6 @@ void giveBackIfLarge(TextBuffer& buffer) noexcept {
 LinuxConnection::LinuxConnection(Shared& shared, FileDescriptor socket, pid_t peer, Ended ended)
     : shared_(shared), peer_(peer), ended_(std::move(ended)), socket_(std::move(socket)) {}
 
-void LinuxConnection::setExportedObject(std::shared_ptr<ZRReportingServiceProtocol> object) {
-    exportedObject_ = std::move(object);
-}
-
-void LinuxConnection::setInterruptionHandler(UniqueFunction<void()> handler) {
-    interruptionHandler_ = std::move(handler);
-}
-
-void LinuxConnection::setInvalidationHandler(UniqueFunction<void()> handler) {
-    invalidationHandler_ = std::move(handler);
-}
-
 void LinuxConnection::resume() {
     const MutexLock lock(mutex_);
     wantsInput_ = true;

@@ -15,6 +15,7 @@
 #include <memory>
 #include <span>
 #include <string>
+#include <utility>
 
 namespace tamblo {
 
@@ -66,9 +67,15 @@ public:
     LinuxConnection(Shared& shared, FileDescriptor socket, pid_t peer, Ended ended);
 
     [[nodiscard]] pid_t peerProcessIdentifier() const noexcept override { return peer_; }
-    void setExportedObject(std::shared_ptr<ZRReportingServiceProtocol> object) override;
-    void setInterruptionHandler(UniqueFunction<void()> handler) override;
-    void setInvalidationHandler(UniqueFunction<void()> handler) override;
+    void setExportedObject(std::shared_ptr<ZRReportingServiceProtocol> object) override {
+        exportedObject_ = std::move(object);
+    }
+    void setInterruptionHandler(UniqueFunction<void()> handler) override {
+        interruptionHandler_ = std::move(handler);
+    }
+    void setInvalidationHandler(UniqueFunction<void()> handler) override {
+        invalidationHandler_ = std::move(handler);
+    }
     void resume() override TAMBLO_EXCLUDES(mutex_);
     [[nodiscard]] std::string description() const override;
 

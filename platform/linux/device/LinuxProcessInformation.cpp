@@ -6,8 +6,6 @@
 #include <system_error>
 #include <utility>
 
-#include <unistd.h>
-
 namespace tamblo {
 
 namespace {
@@ -38,14 +36,6 @@ std::variant<std::uint64_t, ProcessInformation::QueryError> readFootprint(const 
 
 LinuxProcessInformation::LinuxProcessInformation(std::string root, SteadyNow now)
     : files_(std::move(root)), footprint_(kValidity, std::move(now)) {}
-
-pid_t LinuxProcessInformation::ownProcessIdentifier() const noexcept {
-    return ::getpid();
-}
-
-std::optional<std::string> LinuxProcessInformation::ProcessNameForPid(pid_t pid) const {
-    return files_.name(pid);
-}
 
 std::chrono::duration<double> LinuxProcessInformation::systemUptime() const noexcept {
     return readClock(CLOCK_BOOTTIME);

@@ -8,6 +8,8 @@
 #include <chrono>
 #include <string>
 
+#include <unistd.h>
+
 namespace tamblo {
 
 /// Process figures from `/proc` and the kernel's clocks.
@@ -19,9 +21,11 @@ public:
     explicit LinuxProcessInformation(std::string root = "/proc",
                                      SteadyNow now = &std::chrono::steady_clock::now);
 
-    [[nodiscard]] pid_t ownProcessIdentifier() const noexcept override;
+    [[nodiscard]] pid_t ownProcessIdentifier() const noexcept override { return ::getpid(); }
     /// At most 15 bytes, as the kernel keeps it; always UTF-8, whatever the process calls itself.
-    [[nodiscard]] std::optional<std::string> ProcessNameForPid(pid_t pid) const override;
+    [[nodiscard]] std::optional<std::string> ProcessNameForPid(pid_t pid) const override {
+        return files_.name(pid);
+    }
     [[nodiscard]] std::chrono::duration<double> systemUptime() const noexcept override;
     [[nodiscard]] std::chrono::microseconds processorTime() const noexcept override;
     /// Anonymous and shared memory, resident or swapped out. Pages of files do not count: the system can drop

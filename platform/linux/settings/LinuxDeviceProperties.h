@@ -1,5 +1,6 @@
 #pragma once
 
+#include "base/Format.h"
 #include "base/Mutex.h"
 #include "platform/DeviceProperties.h"
 #include "platform/StructuredLog.h"
@@ -21,7 +22,24 @@ public:
     /// The log must outlive the properties.
     LinuxDeviceProperties(std::string path, StructuredLog& log) : log_(log), file_(std::move(path)) {}
 
-    [[nodiscard]] std::optional<bool> booleanProperty(std::string_view name) const override;
+    [[nodiscard]] std::optional<bool> booleanProperty(std::string_view name) const override {
+        const MutexLock lock(mutex_);
+        if (!file_.isCurrent()) {
+            properties_ = file_.read(log_);
+        }
+        const Value* const value = properties_ ? properties_->find(name) : nullptr;
+        if (value == nullptr) {
+            return std::nullopt;
+        }
+        if (value->kind() != Value::Kind::boolean) {
+            if (told_[std::string(name)].isNews("is no boolean", file_.state())) {
+                log_.report(LogLevel::error, "zrrs",
+                            formatted("{}: {} is no boolean; it is not used", file_.path(), name));
+            }
+            return std::nullopt;
+        }
+        return value->boolValue();
+    }
 
 private:
     StructuredLog& log_;

@@ -33,6 +33,26 @@ std::size_t wholeLines(std::string_view bytes, std::size_t length) noexcept {
 
 } // namespace
 
+SinkFiles::SinkFiles(std::string directory, StructuredLog& log, FileOperations& operations)
+    : directory_(std::move(directory)), log_(log), operations_(operations) {}
+
+void SinkFiles::flush() {
+    const MutexLock lock(mutex_);
+    for (AppendOnlyFile* file : files_) {
+        file->flush();
+    }
+}
+
+void SinkFiles::add(AppendOnlyFile& file) {
+    const MutexLock lock(mutex_);
+    files_.push_back(&file);
+}
+
+void SinkFiles::remove(AppendOnlyFile& file) {
+    const MutexLock lock(mutex_);
+    std::erase(files_, &file);
+}
+
 AppendOnlyFile::AppendOnlyFile(SinkFiles& sinks, std::string_view name, std::string_view categoryCode,
                                Flushed flushed, SinkFileLimits limits)
     : sinks_(sinks),

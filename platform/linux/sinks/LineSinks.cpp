@@ -1,7 +1,6 @@
 #include "platform/linux/sinks/LineSinks.h"
 
 #include "base/Base64.h"
-#include "platform/linux/sinks/SinkLine.h"
 
 namespace tamblo {
 

@@ -2,7 +2,6 @@
 
 #include "base/Format.h"
 #include "os/RandomNumber.h"
-#include "platform/linux/sinks/SinkLine.h"
 
 #include <utility>
 
@@ -10,15 +9,13 @@ namespace tamblo {
 
 class LinuxCallQualityService::SpoolSession final : public Session {
 public:
-    explicit SpoolSession(std::string name) : name_(std::move(name)) {}
-    [[nodiscard]] std::string description() const override { return name_; }
-    [[nodiscard]] const std::string& name() const noexcept { return name_; }
+    explicit SpoolSession(std::string text) : name(std::move(text)) {}
+    [[nodiscard]] std::string description() const override { return name; }
     [[nodiscard]] static const std::string& nameOf(const SessionRef& session) noexcept {
-        return static_cast<const SpoolSession&>(*session).name();
+        return static_cast<const SpoolSession&>(*session).name;
     }
 
-private:
-    const std::string name_;
+    const std::string name;
 };
 
 LinuxCallQualityService::LinuxCallQualityService(SinkFiles& sinks, const Clock& clock,
@@ -46,7 +43,7 @@ CallQualityService::SessionRef LinuxCallQualityService::CreateLinkmeterSession(c
     file_.append([&](TextBuffer& line) {
         SinkLine(line, clock_.now())
             .text("op", "open")
-            .text("session", session->name())
+            .text("session", session->name)
             .value("sessionInfo", sessionInfo)
             .value("userInfo", userInfo);
     });

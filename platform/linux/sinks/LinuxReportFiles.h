@@ -21,21 +21,20 @@ public:
     /// The operations must outlive this object and its files.
     explicit LinuxReportFiles(const std::string& logsDirectory,
                               FileOperations& operations = FileOperations::system())
-        : logsDirectory_(logsDirectory),
-          directory_(logsDirectory + "/DiagnosticLogs/Audio/Reporting"),
-          performanceDirectory_(logsDirectory + "/DiagnosticLogs/Audio/Performance"),
-          operations_(operations) {}
+        : logsDirectory_(logsDirectory), operations_(operations) {}
 
-    [[nodiscard]] std::string reportingLogsDirectory() const override { return directory_; }
-    [[nodiscard]] std::string performanceLogsDirectory() const override { return performanceDirectory_; }
+    [[nodiscard]] std::string reportingLogsDirectory() const override {
+        return logsDirectory_ + "/DiagnosticLogs/Audio/Reporting";
+    }
+    [[nodiscard]] std::string performanceLogsDirectory() const override {
+        return logsDirectory_ + "/DiagnosticLogs/Audio/Performance";
+    }
     [[nodiscard]] std::optional<std::string> createDirectory(const std::string& path) override;
     [[nodiscard]] std::variant<std::unique_ptr<ReportFile>, std::string>
     createFile(const std::string& path) override;
 
 private:
     const std::string logsDirectory_;
-    const std::string directory_;
-    const std::string performanceDirectory_;
     FileOperations& operations_;
 };
 

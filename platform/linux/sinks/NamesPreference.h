@@ -1,5 +1,6 @@
 #pragma once
 
+#include "base/Format.h"
 #include "platform/StructuredLog.h"
 #include "platform/linux/settings/LinuxPreferences.h"
 
@@ -29,7 +30,30 @@ public:
         : setting_(std::move(setting)), preferences_(preferences), log_(log) {}
 
     /// The names in their order; what is no text, or an empty one, is left out.
-    [[nodiscard]] std::vector<std::string> read();
+    [[nodiscard]] std::vector<std::string> read() {
+        std::optional<Value> value = preferences_.copyPreferenceValue(setting_.key, setting_.domain);
+        if (!value) {
+            reported_.reset();
+            return setting_.whenAbsent;
+        }
+        std::vector<std::string> names = value->isArray() ? std::vector<std::string>() : setting_.whenNoArray;
+        bool isMalformed = !value->isArray();
+        for (const Value& element : value->arrayValue()) {
+            if (element.stringValue().empty()) {
+                isMalformed = true;
+            } else {
+                names.emplace_back(element.stringValue());
+            }
+        }
+        if (isMalformed && reported_ != value) {
+            log_.report(LogLevel::error, setting_.categoryCode,
+                        formatted("{}: {} {}", preferences_.path(setting_.domain), setting_.key,
+                                  value->isArray() ? "holds what is no name; that is ignored"
+                                                   : formatted("is no array; {}", setting_.noArrayMeans)));
+        }
+        reported_ = isMalformed ? std::move(value) : std::nullopt;
+        return names;
+    }
 
 private:
     const Setting setting_;
