@@ -1,11 +1,11 @@
 #include "platform/linux/connections/LinuxConnectionService.h"
 
+#include "base/NumberText.h"
 #include "os/Directory.h"
 #include "os/LocalAddress.h"
 #include "wire/Protocol.h"
 
 #include <cerrno>
-#include <charconv>
 #include <chrono>
 #include <cstdlib>
 #include <cstring>
@@ -37,13 +37,7 @@ std::string because(const std::string& what, int error) {
 
 bool environmentSays(const char* name, long wanted) {
     const char* const text = std::getenv(name);
-    if (text == nullptr) {
-        return false;
-    }
-    long number = 0;
-    const char* const end = text + std::strlen(text);
-    const auto result = std::from_chars(text, end, number);
-    return result.ec == std::errc{} && result.ptr == end && number == wanted;
+    return text != nullptr && parseNumber<long>(text) == wanted;
 }
 
 bool activatedSocketHas(int option, int wanted) {

@@ -1,6 +1,7 @@
 #include "platform/linux/device/BluetoothRecord.h"
 
 #include "base/Format.h"
+#include "base/NumberText.h"
 #include "base/SplitText.h"
 
 #include <array>
@@ -17,12 +18,8 @@ constexpr std::uint32_t kMinorHeadphones = 0x06;
 
 /// A decimal number, or a hexadecimal one behind "0x", up to `most`.
 std::optional<std::uint32_t> numberFrom(std::string_view text, std::uint32_t most) noexcept {
-    const bool isHexadecimal = text.starts_with("0x");
-    if (isHexadecimal) {
-        text.remove_prefix(2);
-    }
-    const auto number = takeNumber<std::uint32_t>(text, isHexadecimal ? 16 : 10);
-    return text.empty() && number <= most ? number : std::nullopt;
+    const auto number = parseDecimalOrHex<std::uint32_t>(text);
+    return number <= most ? number : std::nullopt;
 }
 
 /// The sections that hold a key of a paired device: of classic Bluetooth, and of Low Energy in either role.

@@ -1,7 +1,7 @@
 #include "platform/linux/device/LinuxAccessories.h"
 
 #include "base/Format.h"
-#include "os/DirectoryEntries.h"
+#include "os/Directory.h"
 #include "os/SmallFile.h"
 #include "platform/linux/device/BluetoothRecord.h"
 
@@ -31,18 +31,10 @@ constexpr std::size_t kLongestMachineIdentifier = 64;
 
 /// Whether it is an address as the daemon names directories: "00:1B:66:AA:BB:CC".
 bool isAddress(std::string_view name) noexcept {
-    constexpr std::size_t kLength = 17;
-    if (name.size() != kLength) {
-        return false;
-    }
-    for (std::size_t i = 0; i < kLength; ++i) {
-        const char c = name[i];
+    return std::ranges::equal(name, std::string_view("00:00:00:00:00:00"), [](char c, char pattern) {
         const bool isDigit = (c >= '0' && c <= '9') || (c >= 'A' && c <= 'F');
-        if (i % 3 == 2 ? c != ':' : !isDigit) {
-            return false;
-        }
-    }
-    return true;
+        return pattern == '0' ? isDigit : c == pattern;
+    });
 }
 
 /// A secret of 128 bits.

@@ -1,7 +1,7 @@
 #include "platform/linux/device/LinuxDeviceConditions.h"
 
-#include "base/SplitText.h"
-#include "os/DirectoryEntries.h"
+#include "base/NumberText.h"
+#include "os/Directory.h"
 #include "os/SmallFile.h"
 
 #include <algorithm>
@@ -25,10 +25,7 @@ constexpr struct {
 } kTripPoints[] = {{"active", 1}, {"passive", 2}, {"hot", 3}, {"critical", 3}};
 
 std::optional<std::int64_t> readNumber(const std::string& path) {
-    const SmallFile file = SmallFile::read(path, kMaximumFile);
-    std::string_view text = file.trimmed();
-    const auto number = takeNumber<std::int64_t>(text);
-    return text.empty() ? number : std::nullopt;
+    return parseNumber<std::int64_t>(SmallFile::read(path, kMaximumFile).trimmed());
 }
 
 bool holds(const std::string& path, std::string_view word) {

@@ -24,8 +24,7 @@ constexpr std::array<std::pair<std::string_view, ChanlogFormat>, 4> kFormats{{
 /// Reads the members of one object; stays at the first fault, with which nothing more is read.
 class Members {
 public:
-    Members(const JsonItem& object, std::string& fault)
-        : object_(object), next_(object.first()), fault_(fault) {
+    Members(const JsonItem& object, std::string& fault) : object_(object), fault_(fault) {
         if (object.kind != JsonItem::Kind::object) {
             fail("it", "is no object");
         }
@@ -107,16 +106,8 @@ public:
     }
 
 private:
-    const JsonItem* find(std::string_view name) noexcept {
-        if (!isWell()) {
-            return nullptr;
-        }
-        // Members mostly stand in the order in which they are asked for.
-        const bool isNext =
-            next_ != object_.end() && next_->key == name && next_->kind != JsonItem::Kind::null;
-        const JsonItem* const found = isNext ? next_ : object_.find(name);
-        next_ = found != nullptr ? found->next() : next_;
-        return found;
+    const JsonItem* find(std::string_view name) const noexcept {
+        return isWell() ? object_.find(name) : nullptr;
     }
     /// The boolean false, which is no number of any kind, when there is none.
     const Value& scalar(std::string_view name) {
@@ -129,7 +120,6 @@ private:
     }
 
     const JsonItem& object_;
-    const JsonItem* next_; ///< behind the one found last
     std::string& fault_;
 };
 
