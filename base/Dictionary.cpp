@@ -215,9 +215,7 @@ void Dictionary::addAll(const Dictionary& other) {
     const std::size_t count = block_->count();
     std::vector<std::string_view> merged;
     std::vector<Value> mergedValues;
-    std::vector<std::uint32_t> places;
     const auto add = [&](std::string_view key, const Value& value) {
-        places.push_back(static_cast<std::uint32_t>(merged.size()));
         merged.push_back(key);
         mergedValues.push_back(value);
     };
@@ -234,7 +232,7 @@ void Dictionary::addAll(const Dictionary& other) {
     for (; mine < count; ++mine) {
         add(keyAt(mine), valueAt(mine));
     }
-    *this = fromKeySet(KeySet::make(merged), mergedValues, places);
+    *this = fromSorted(merged, mergedValues);
 }
 
 Dictionary Dictionary::fromKeySet(KeySetRef keys, std::span<Value> values,
@@ -245,6 +243,14 @@ Dictionary Dictionary::fromKeySet(KeySetRef keys, std::span<Value> values,
     for (std::size_t i = 0; i < values.size(); ++i) {
         new (to + places[i]) Value(std::move(values[i]));
     }
+    return dictionary;
+}
+
+Dictionary Dictionary::fromSorted(std::span<const std::string_view> keys, std::span<Value> values,
+                                  std::size_t spare) {
+    Dictionary dictionary;
+    dictionary.block_ = Block::make(values.size() + spare, KeySet::make(keys));
+    std::uninitialized_move(values.begin(), values.end(), dictionary.block_->values());
     return dictionary;
 }
 

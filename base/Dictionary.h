@@ -9,6 +9,7 @@
 #include <string>
 #include <string_view>
 #include <utility>
+#include <vector>
 
 namespace tamblo {
 
@@ -54,6 +55,20 @@ public:
     /// belongs to, each index once. `spare` is room for keys to come. The values are moved from.
     static Dictionary fromKeySet(KeySetRef keys, std::span<Value> values,
                                  std::span<const std::uint32_t> places, std::size_t spare = 0);
+    /// The same of keys in ascending order, each once, whose values stand in that order.
+    static Dictionary fromSorted(std::span<const std::string_view> keys, std::span<Value> values,
+                                 std::size_t spare = 0);
+    /// The entries of a map from texts to values, made at once: key by key, the time would grow with the
+    /// square of their number.
+    template <typename Map> static Dictionary fromMap(const Map& entries, std::size_t spare = 0) {
+        std::vector<std::string_view> keys;
+        std::vector<Value> values;
+        for (const auto& [key, value] : entries) {
+            keys.push_back(key);
+            values.push_back(value);
+        }
+        return fromSorted(keys, values, spare);
+    }
 
     [[nodiscard]] bool operator==(const Dictionary& other) const noexcept;
     /// Equal but for the entries of the ignored keys, wherever they stand.

@@ -4,12 +4,12 @@
 
 namespace tamblo {
 
-std::uint64_t processHashSeed() noexcept {
-    static const std::uint64_t seed = [] {
+SeededHash::SeededHash() noexcept {
+    static const std::uint64_t ofProcess = [] {
         std::random_device device;
         return std::uint64_t{device()} << 32U | device();
     }();
-    return seed;
+    seed = ofProcess;
 }
 
 } // namespace tamblo

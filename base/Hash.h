@@ -1,5 +1,7 @@
 #pragma once
 
+#include <concepts>
+#include <cstddef>
 #include <cstdint>
 
 namespace tamblo {
@@ -11,7 +13,14 @@ namespace tamblo {
     return number ^ (number >> 31U);
 }
 
-/// A number that differs from process to process, for hashes of what clients choose.
-[[nodiscard]] std::uint64_t processHashSeed() noexcept;
+/// A hash of numbers that clients choose: it differs from process to process, so that none can choose such
+/// that collide.
+struct SeededHash {
+    SeededHash() noexcept;
+    template <std::integral Number> std::size_t operator()(Number number) const noexcept {
+        return mixBits(static_cast<std::uint64_t>(number) ^ seed);
+    }
+    std::uint64_t seed;
+};
 
 } // namespace tamblo

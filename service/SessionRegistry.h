@@ -35,16 +35,8 @@ public:
     [[nodiscard]] std::size_t startedCount() const noexcept { return started_.size(); }
 
 private:
-    struct Hash {
-        Hash() noexcept : seed(processHashSeed()) {}
-        std::size_t operator()(ReporterID reporterID) const noexcept {
-            return mixBits(static_cast<std::uint64_t>(reporterID) ^ seed);
-        }
-        std::uint64_t seed;
-    };
-
     /// Almost always one client holds an ID; more are in order of acceptance.
-    std::unordered_map<ReporterID, std::vector<Entry>, Hash> holders_;
+    std::unordered_map<ReporterID, std::vector<Entry>, SeededHash> holders_;
     std::map<std::pair<std::uint64_t, ReporterID>, SessionRef> started_;
 };
 

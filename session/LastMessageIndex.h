@@ -31,17 +31,11 @@ public:
     void clear() { last_ = Map(); }
 
 private:
-    /// Differs from process to process, so that a client cannot choose categories that collide.
-    struct Hash {
-        Hash() noexcept : seed(processHashSeed()) {}
-        std::size_t operator()(std::uint64_t key) const noexcept { return mixBits(key ^ seed); }
-        std::uint64_t seed;
-    };
     static std::uint64_t key(AudioEventCategory category, AudioEventType type) noexcept {
         return std::uint64_t{category} << 16U | type;
     }
 
-    using Map = std::unordered_map<std::uint64_t, const ZRReportingSessionMessage*, Hash>;
+    using Map = std::unordered_map<std::uint64_t, const ZRReportingSessionMessage*, SeededHash>;
     Map last_;
 };
 

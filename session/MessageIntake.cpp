@@ -6,11 +6,9 @@
 #include <array>
 #include <cstdint>
 #include <map>
-#include <numeric>
 #include <string>
 #include <string_view>
 #include <utility>
-#include <vector>
 
 namespace tamblo::intake {
 
@@ -66,15 +64,7 @@ void removeWhiteSpaceFromKeys(Dictionary& payload) {
             }
         }
     }
-    std::vector<std::string_view> keys;
-    std::vector<Value> values;
-    for (const auto& [key, value] : cleaned) {
-        keys.push_back(key);
-        values.push_back(value);
-    }
-    std::vector<std::uint32_t> places(keys.size());
-    std::iota(places.begin(), places.end(), 0U);
-    payload = Dictionary::fromKeySet(KeySet::make(keys), values, places, kKeysAddedAfterwards);
+    payload = Dictionary::fromMap(cleaned, kKeysAddedAfterwards);
 }
 
 void addAudioMessageTag(Dictionary& payload, const Value& tag) {

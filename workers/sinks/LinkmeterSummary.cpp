@@ -38,13 +38,11 @@ public:
     [[nodiscard]] Dictionary result() const {
         std::vector<std::string_view> keys;
         std::vector<Value> values;
-        std::vector<std::uint32_t> places;
         for (const auto& [key, joined] : joined_) {
-            places.push_back(static_cast<std::uint32_t>(keys.size()));
             keys.push_back(key);
             values.emplace_back(joined.text.view());
         }
-        return Dictionary::fromKeySet(KeySet::make(keys), values, places);
+        return Dictionary::fromSorted(keys, values);
     }
 
 private:
