@@ -12,8 +12,9 @@ namespace tamblo {
 /// Text formatting with `{}` placeholders, the number of which is checked when the code is compiled.
 ///
 /// What can stand for a placeholder: integers, booleans ("1" or "0"), texts, and every type for which an
-/// `appendText(std::string&, const T&)` is found in its own namespace. Floating numbers are written with six
-/// digits after the point; `fixed` chooses another number of them.
+/// `appendText(std::string&, const T&)` is found in its own namespace; pointers and optionals, which stand
+/// for what they hold or are "(null)". Floating numbers are written with six digits after the point; `fixed`
+/// chooses another number of them.
 struct FixedPoint {
     double value;
     int digits;
@@ -50,6 +51,12 @@ template <typename T> void appendArgument(std::string& out, const T& argument) {
         appendText(out, FixedPoint{static_cast<double>(argument), 6});
     } else if constexpr (std::is_convertible_v<const T&, std::string_view>) {
         appendText(out, std::string_view(argument));
+    } else if constexpr (requires { *argument; }) {
+        if (argument) {
+            appendArgument(out, *argument);
+        } else {
+            appendText(out, "(null)");
+        }
     } else {
         appendText(out, argument);
     }

@@ -25,18 +25,6 @@ template <typename Reply, typename... Result> void answer(Reply& reply, const Re
     }
 }
 
-/// A session that may not be there, in a log line.
-struct OptionalSession {
-    const SessionRef& session;
-};
-void appendText(std::string& out, const OptionalSession& optional) {
-    if (optional.session != nullptr) {
-        appendText(out, *optional.session);
-    } else {
-        out += "(null)";
-    }
-}
-
 } // namespace
 
 ZRReportingClientServerInstance::ZRReportingClientServerInstance(
@@ -57,16 +45,12 @@ template <typename Piece> void ZRReportingClientServerInstance::onServerQueue(Pa
 
 void ZRReportingClientServerInstance::createReportingSession(ReporterID reporterID, BooleanReply reply) {
     onServerQueue(Pace::quick, [reporterID, reply = std::move(reply)](auto& client) mutable {
-        client.performCreate(reporterID);
+        log::debug(ZRReportingServiceDelegateCategory(), "creating session for reporter {}", reporterID);
+        emitTracePoint(client.context_, TraceEvent::createReportingSession);
+        client.storeSession(reporterID, client.makeSession(reporterID));
+        log::standard(ZRReportingServiceDelegateCategory(), "session created for reporter {}", reporterID);
         answer(reply, true);
     });
-}
-
-void ZRReportingClientServerInstance::performCreate(ReporterID reporterID) {
-    log::debug(ZRReportingServiceDelegateCategory(), "creating session for reporter {}", reporterID);
-    emitTracePoint(context_, TraceEvent::createReportingSession);
-    storeSession(reporterID, makeSession(reporterID));
-    log::standard(ZRReportingServiceDelegateCategory(), "session created for reporter {}", reporterID);
 }
 
 void ZRReportingClientServerInstance::setServiceType(std::uint16_t serviceType, ReporterID reporterID,
@@ -225,7 +209,7 @@ void ZRReportingClientServerInstance::performStop(ReporterID reporterID) {
         log::debug(ZRReportingServiceDelegateCategory(),
                    "Stop called, but session==nil or session.started==false. reporterID={} session={} "
                    "session.started={}",
-                   reporterID, OptionalSession{session}, session != nullptr && session->started());
+                   reporterID, session, session != nullptr && session->started());
     }
     log::standard(ZRReportingServiceDelegateCategory(), "stopping {}", reporterID);
 }
@@ -269,20 +253,17 @@ void ZRReportingClientServerInstance::reporterID(ReporterID reporterID, Dictiona
 }
 
 void ZRReportingClientServerInstance::getAllReporters(ReporterIDsReply reply) {
-    onServerQueue(Pace::quick,
-                  [reply = std::move(reply)](auto& client) mutable { client.performGetAllReporters(reply); });
-}
-
-void ZRReportingClientServerInstance::performGetAllReporters(ReporterIDsReply& reply) const {
-    std::vector<ReporterID> reporters;
-    if (const Delegate delegate = delegate_.lock()) {
-        for (const ClientRef& client : delegate->getAllClients()) {
-            for (const auto& [reporterID, session] : client->clientReportingSessionMap()) {
-                reporters.push_back(reporterID);
+    onServerQueue(Pace::quick, [reply = std::move(reply)](auto& client) mutable {
+        std::vector<ReporterID> reporters;
+        if (const Delegate delegate = client.delegate_.lock()) {
+            for (const ClientRef& other : delegate->getAllClients()) {
+                for (const auto& [reporterID, session] : other->clientReportingSessionMap()) {
+                    reporters.push_back(reporterID);
+                }
             }
         }
-    }
-    answer(reply, reporters);
+        answer(reply, reporters);
+    });
 }
 
 void ZRReportingClientServerInstance::killService() {

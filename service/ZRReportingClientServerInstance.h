@@ -80,14 +80,12 @@ private:
 
     /// Queues a piece of this client's work; `piece` is called with the client.
     template <typename Piece> void onServerQueue(Pace pace, Piece piece);
-    void performCreate(ReporterID reporterID);
     void performSetServiceType(std::uint16_t serviceType, ReporterID reporterID);
     void performStart(ReporterID reporterID, BooleanReply reply);
     void performSend(Dictionary message, std::uint32_t category, std::uint16_t type,
                      const std::vector<ReporterID>& reporterIDs, ErrorReply reply);
     void performStop(ReporterID reporterID);
     void performDestroy(ReporterID reporterID);
-    void performGetAllReporters(ReporterIDsReply& reply) const;
 
     [[nodiscard]] SessionRef makeSession(ReporterID reporterID) const;
     void storeSession(ReporterID reporterID, SessionRef session);

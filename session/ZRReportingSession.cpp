@@ -132,9 +132,7 @@ void ZRReportingSession::normalise(ZRReportingSessionMessage& message) const {
 }
 
 std::string ZRReportingSession::description() const {
-    std::string text;
-    appendText(text, *this);
-    return text;
+    return formatted("{}", *this);
 }
 
 void ZRReportingSession::addMissingDates(ZRReportingSessionMessage& message, WallTime now) {
@@ -182,9 +180,8 @@ void appendText(std::string& out, const ZRReportingSession& session) {
         "reporterID={},serviceName={},ownerPid={},clientProcessName={},HostApplicationDisplayID={},"
         "started={},singleMessageSession={}",
         session.reporterID(), session.serviceName(), owners.empty() ? pid_t{0} : owners.front(),
-        session.clientProcessName() ? std::string_view(*session.clientProcessName()) : "(null)",
-        ZRReportingUtilityRetrieveAppName(session.configuration()), session.started(),
-        session.isSingleMessageSession());
+        session.clientProcessName(), ZRReportingUtilityRetrieveAppName(session.configuration()),
+        session.started(), session.isSingleMessageSession());
 }
 
 void appendText(std::string& out, const SessionList& list) {

@@ -59,9 +59,7 @@ MessageRef ZRReportingSessionMessage::copyWithZone() const {
 }
 
 std::string ZRReportingSessionMessage::description() const {
-    std::string text;
-    appendText(text, *this);
-    return text;
+    return formatted("{}", *this);
 }
 
 bool ZRReportingSessionMessage::sortMessages(std::vector<MessageRef>& messages) {

@@ -35,7 +35,6 @@ public:
 
     /// A copy of the payload, which later changes do not reach.
     [[nodiscard]] Dictionary message() const noexcept { return message_; }
-    void setMessage(Dictionary message) noexcept { message_ = std::move(message); }
     /// The payload in place.
     [[nodiscard]] const Dictionary& payload() const noexcept { return message_; }
     /// Changes the payload in place; `edit` is given the dictionary.

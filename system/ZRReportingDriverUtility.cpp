@@ -8,7 +8,6 @@
 #include <algorithm>
 #include <cstddef>
 #include <cstdint>
-#include <numeric>
 #include <utility>
 #include <variant>
 
@@ -45,11 +44,6 @@ ZRReportingDriver driverOf(const DriverNames& names) {
     return ZRReportingDriver::driverWithGroupName(name(names.group), name(names.subGroup));
 }
 
-/// A name in a log line or a text.
-std::string_view textOf(const std::optional<std::string>& name) noexcept {
-    return name ? std::string_view(*name) : "(null)";
-}
-
 /// The channels, or null after a failure, which is logged where there is something to tell.
 ChanlogChannels channelsOrNull(const std::variant<ChanlogChannels, int>& result) {
     if (const auto* channels = std::get_if<ChanlogChannels>(&result)) {
@@ -83,30 +77,18 @@ void Stats::add(const ChanlogChannel& channel) {
     case ChanlogFormat::simpleArray:
         return log::info(ZRReportingDriverUtilityCategory(),
                          "Dropping sample of type : {} for group : {} subgroup : {}", format,
-                         textOf(channel.groupName), textOf(channel.subGroupName));
+                         channel.groupName, channel.subGroupName);
     }
     log::info(ZRReportingDriverUtilityCategory(),
-              "The ChanlogFormat {} is not supported group : {} subgroup : {}", format,
-              textOf(channel.groupName), textOf(channel.subGroupName));
+              "The ChanlogFormat {} is not supported group : {} subgroup : {}", format, channel.groupName,
+              channel.subGroupName);
 }
 
-/// Made at once: key by key, the time would grow with the square of their number.
-Dictionary payloadOf(ZRReportingDriverUtility::DriverStats& stats) {
-    std::vector<std::string_view> keys;
-    std::vector<Value> values;
-    for (auto& [key, value] : stats) {
-        keys.push_back(key);
-        values.push_back(std::move(value));
-    }
-    std::vector<std::uint32_t> places(keys.size());
-    std::iota(places.begin(), places.end(), 0U);
-    return Dictionary::fromKeySet(KeySet::make(keys), values, places, kKeysToBeAdded);
-}
-
-void send(ZRReportingSession& session, ZRReportingDriverUtility::DriverStats& stats, AudioEventType type) {
+void send(ZRReportingSession& session, const ZRReportingDriverUtility::DriverStats& stats,
+          AudioEventType type) {
     if (!stats.empty()) {
-        session.sendMessage(
-            std::make_shared<ZRReportingSessionMessage>(payloadOf(stats), AudioEventKindChanlog, type));
+        session.sendMessage(std::make_shared<ZRReportingSessionMessage>(
+            Dictionary::fromMap(stats, kKeysToBeAdded), AudioEventKindChanlog, type));
     }
 }
 
@@ -239,7 +221,7 @@ void ZRReportingDriverUtility::processHistogramData(const ChanlogChannel& channe
     std::string text;
     text.reserve(kUsualLength);
     appendFormatted(text, "count={},lower={},upper={},min={},max={},unit={}::{}", channel.buckets.size(),
-                    lower, upper, channel.minimum, channel.maximum, textOf(channel.unitLabel), hits);
+                    lower, upper, channel.minimum, channel.maximum, channel.unitLabel, hits);
     driverStats.insert_or_assign(getDriverStatsKey(channel, "Histogram"), Value(text));
 }
 

@@ -66,9 +66,8 @@ void DerivedMessages::logLength(const SegmentStart& start, const Value* timestam
     log::debug(ZRReportingSessionCategory(),
                "{} { func={}, {}={}, zrTimestamp={}, zrTimestamp_double={}, startZrTimestamp={}, "
                "startZrTimestamp_double={} }",
-               words_.length, words_.function, words_.length, start.until(timestamp).count(),
-               OptionalValue{timestamp}, secondsOf(timestamp), OptionalValue{start.timestamp()},
-               secondsOf(start.timestamp()));
+               words_.length, words_.function, words_.length, start.until(timestamp).count(), timestamp,
+               secondsOf(timestamp), start.timestamp(), secondsOf(start.timestamp()));
 }
 
 ZRReportingSessionMessage& DerivedMessages::add(Dictionary payload, AudioEventCategory category) {
@@ -97,14 +96,6 @@ std::vector<ZRReportingSessionMessage*> combineSpatialAudioSettings(const std::v
     static constexpr std::array<std::string_view, 2> kSettings{
         ZRReportingMessageKeySpatialAudioAccessoryFeature, kSpatializationEnabledKey};
     return ZRReportingSessionWorkerUtility::combineRapidMessages(messages, kSettings, longestPause);
-}
-
-void appendText(std::string& out, const OptionalValue& optional) {
-    if (optional.value != nullptr) {
-        appendText(out, *optional.value);
-    } else {
-        out += "(null)";
-    }
 }
 
 Dictionary previousValuesOf(const std::shared_ptr<ZRReportingSession>& session) {

@@ -116,10 +116,4 @@ void deriveAtStop(const std::shared_ptr<ZRReportingSession>& session, std::strin
     }
 }
 
-/// A value that may be absent, in a log line.
-struct OptionalValue {
-    const Value* value;
-};
-void appendText(std::string& out, const OptionalValue& optional);
-
 } // namespace tamblo

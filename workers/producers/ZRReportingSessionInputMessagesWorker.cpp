@@ -120,7 +120,7 @@ private:
         if (!isPresentAndHasChanged(message[Field::vocoder], state_[Field::vocoder])) {
             return;
         }
-        const std::string rate = formatted("{}", OptionalValue{message[Field::vocoderRate]});
+        const std::string rate = formatted("{}", message[Field::vocoderRate]);
         // A rate that begins so stands for a vocoder that does not run.
         if (!rate.starts_with("0.")) {
             vocoders_.insert(formatted("{}:{}", *message[Field::vocoder], rate));

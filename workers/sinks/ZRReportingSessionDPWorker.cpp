@@ -133,8 +133,7 @@ void ZRReportingSessionDPWorker::capture(ZRReportingSessionMessage& message, dou
     }
     Dictionary payload = message.message();
     log::info(ZRReportingDPLogCategory(), "Dropping stackburst {}", message);
-    const Value* application = payload.find(ZRReportingApplicationName);
-    std::string reason = application != nullptr ? formatted("{}", *application) : "(null)";
+    std::string reason = formatted("{}", payload.find(ZRReportingApplicationName));
     platform().diagnosticCapture->captureStacks({.requester = "com.vandra.tamblo",
                                                  .captureType = "AudioOverloads",
                                                  .reason = std::move(reason),
