@@ -14,6 +14,16 @@ namespace tamblo {
     return (static_cast<unsigned char>(byte) & 0xC0U) == 0x80U;
 }
 
+/// The text, of one longer than so many bytes the characters that fit into these.
+[[nodiscard]] constexpr std::string_view cutUtf8(std::string_view text, std::size_t longest) noexcept {
+    if (text.size() > longest) {
+        while (longest > 0 && isUtf8Continuation(text[longest])) {
+            --longest;
+        }
+    }
+    return text.substr(0, longest);
+}
+
 /// How many bytes from an index of the text on are a control character, of ASCII or of the second set that
 /// terminals obey (U+0080 to U+009F); 0 where there is none.
 [[nodiscard]] constexpr std::size_t controlLength(std::string_view text, std::size_t at) noexcept {

@@ -30,12 +30,7 @@ std::string timeInFileName(WallTime time, std::chrono::seconds utcOffset) {
 
 /// What a client names so stays one part of one file name.
 std::string asPartOfFileName(std::string name, std::size_t longest) {
-    if (name.size() > longest) {
-        while (longest > 0 && isUtf8Continuation(name[longest])) {
-            --longest;
-        }
-        name.resize(longest);
-    }
+    name.resize(cutUtf8(name, longest).size());
     std::replace_if(
         name.begin(), name.end(),
         [](char character) {

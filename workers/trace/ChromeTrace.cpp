@@ -1,7 +1,7 @@
 #include "workers/trace/ChromeTrace.h"
 
 #include "base/Format.h"
-#include "base/Json.h"
+#include "base/JsonObject.h"
 #include "base/Utf8.h"
 #include "util/Log.h"
 
@@ -44,13 +44,7 @@ std::string issueName(const SessionTrace::Issue& issue) {
         name = formatted("{}_{}", ZRReportingUtilityCategoryString(issue.category),
                          ZRReportingUtilityTypeString(issue.type));
     }
-    if (name.size() > kLongestName) {
-        std::size_t end = kLongestName;
-        while (end > 0 && isUtf8Continuation(name[end])) {
-            --end;
-        }
-        name.resize(end);
-    }
+    name.resize(cutUtf8(name, kLongestName).size());
     return name;
 }
 
@@ -86,28 +80,18 @@ private:
     void event(char phase, std::string_view name, std::int64_t pid, std::int64_t track,
                std::initializer_list<std::pair<std::string_view, std::int64_t>> numbers,
                const Dictionary& arguments = {}) {
-        text_.append(isFirst_ ? "\n{\"ph\":\"" : ",\n{\"ph\":\"");
-        isFirst_ = false;
-        text_.append(phase);
-        text_.append("\",\"name\":");
-        appendJsonString(text_, name);
-        number("pid", pid);
-        number("tid", track);
+        text_.append(std::exchange(isFirst_, false) ? "\n" : ",\n");
+        JsonObject event(text_);
+        event.text("ph", {&phase, 1}).text("name", name).number("pid", pid).number("tid", track);
         for (const auto& [member, value] : numbers) {
-            number(member, value);
+            event.number(member, value);
         }
-        text_.append(phase == 'i' ? ",\"s\":\"p\"" : "");
+        if (phase == 'i') {
+            event.text("s", "p");
+        }
         if (!arguments.empty()) {
-            text_.append(",\"args\":");
-            appendJson(text_, arguments);
+            event.value("args", arguments);
         }
-        text_.append('}');
-    }
-    void number(std::string_view name, std::int64_t value) {
-        text_.append(",\"");
-        text_.append(name);
-        text_.append("\":");
-        text_.append(std::to_string(value));
     }
 
     void names() {

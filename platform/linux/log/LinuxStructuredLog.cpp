@@ -32,16 +32,10 @@ constexpr std::string_view kPriorities = "76532";
 class LineBuffer {
 public:
     void append(std::string_view text) noexcept {
-        std::size_t count = text.size();
-        if (isCut_ || count > kCapacity - size_) {
-            count = isCut_ ? 0 : kCapacity - size_;
-            isCut_ = true;
-            while (count > 0 && isUtf8Continuation(text[count])) {
-                --count;
-            }
-        }
-        std::memcpy(bytes_.data() + size_, text.data(), count);
-        size_ += count;
+        const std::string_view kept = cutUtf8(text, isCut_ ? 0 : kCapacity - size_);
+        isCut_ = kept.size() < text.size() || isCut_;
+        std::memcpy(bytes_.data() + size_, kept.data(), kept.size());
+        size_ += kept.size();
     }
 
     void appendHarmless(std::string_view text) noexcept {
