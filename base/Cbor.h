@@ -41,8 +41,8 @@ public:
     void mapHead(std::uint64_t count) { head(5, count); }
     void unsignedInteger(std::uint64_t value) { head(0, value); }
     void integer(std::int64_t value);
-    void boolean(bool value);
-    void null();
+    void boolean(bool value) { out_.append(value ? '\xF5' : '\xF4'); }
+    void null() { out_.append('\xF6'); }
     void text(std::string_view text);
     void value(const Value& value);
     void dictionary(const Dictionary& dictionary);
@@ -131,13 +131,13 @@ private:
     bool takeBytes(const Head& head, std::string_view& bytes) noexcept;
     /// One definite piece of a text or byte string of indefinite length.
     bool takeChunk(Type major, std::string_view& chunk) noexcept;
-    bool assembleChunks(Type major, std::string& bytes);
+    /// All of them; put together, those of a text have to be texts.
+    bool takeChunks(Type major, std::string* bytes);
     bool readDate(const Head& head, Value& value);
     bool readArray(const Head& head, Value& value, int depth);
     bool readMap(const Head& head, Dictionary& dictionary, int depth, std::size_t spare);
     bool readEntries(const Head& head, int depth);
     bool makeDictionary(Dictionary& dictionary, std::size_t firstEntry, std::size_t spare);
-    bool skipChunks(Type major) noexcept;
     bool atBreak() noexcept;
     [[nodiscard]] MapEntries& entries() noexcept;
 

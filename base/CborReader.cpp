@@ -279,17 +279,20 @@ bool CborReader::takeChunk(Type major, std::string_view& chunk) noexcept {
     return takeBytes(head, chunk);
 }
 
-bool CborReader::assembleChunks(Type major, std::string& bytes) {
+bool CborReader::takeChunks(Type major, std::string* bytes) {
     while (!atBreak()) {
         std::string_view chunk;
         if (!takeChunk(major, chunk)) {
             return false;
         }
+        if (bytes == nullptr) {
+            continue;
+        }
         // Each chunk of a text is a text of its own (RFC 8949, section 3.2.3).
         if (major == Type::text && !isUtf8(chunk)) {
             return fail(CborError::notUtf8);
         }
-        bytes += chunk;
+        *bytes += chunk;
     }
     return true;
 }
@@ -301,7 +304,7 @@ bool CborReader::readString(const Head& head, Value& value) {
         if (!takeBytes(head, bytes)) {
             return false;
         }
-    } else if (assembleChunks(head.major, assembled)) {
+    } else if (takeChunks(head.major, &assembled)) {
         bytes = assembled;
     } else {
         return false;
@@ -440,7 +443,7 @@ bool CborReader::readKey(std::string_view& key) {
     }
     MapEntries& entries = this->entries();
     std::string assembled;
-    if (!assembleChunks(Type::text, assembled)) {
+    if (!takeChunks(Type::text, &assembled)) {
         return false;
     }
     key = entries.assembledKeys.emplace_back(std::move(assembled));

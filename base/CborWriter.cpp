@@ -38,14 +38,6 @@ void CborWriter::integer(std::int64_t value) {
     }
 }
 
-void CborWriter::boolean(bool value) {
-    out_.append(value ? '\xF5' : '\xF4');
-}
-
-void CborWriter::null() {
-    out_.append('\xF6');
-}
-
 void CborWriter::text(std::string_view text) {
     head(3, text.size());
     out_.append(text);

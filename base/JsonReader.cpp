@@ -47,21 +47,11 @@ JsonError errorAt(std::string_view text, std::size_t offset, std::string message
 }
 
 void appendUtf8(std::string& out, std::uint32_t code) {
-    const auto unit = [&out](std::uint32_t byte) { out += static_cast<char>(byte); };
-    if (code < 0x80) {
-        unit(code);
-    } else if (code < 0x800) {
-        unit(0xC0U | code >> 6U);
-        unit(0x80U | (code & 0x3FU));
-    } else if (code < 0x10000) {
-        unit(0xE0U | code >> 12U);
-        unit(0x80U | (code >> 6U & 0x3FU));
-        unit(0x80U | (code & 0x3FU));
-    } else {
-        unit(0xF0U | code >> 18U);
-        unit(0x80U | (code >> 12U & 0x3FU));
-        unit(0x80U | (code >> 6U & 0x3FU));
-        unit(0x80U | (code & 0x3FU));
+    const unsigned following = code < 0x80 ? 0 : code < 0x800 ? 1 : code < 0x10000 ? 2 : 3;
+    const std::uint32_t lead = following == 0 ? 0U : 0xFFU << (7U - following);
+    out += static_cast<char>(lead | code >> 6U * following);
+    for (unsigned left = following; left-- > 0;) {
+        out += static_cast<char>(0x80U | (code >> 6U * left & 0x3FU));
     }
 }
 
@@ -369,33 +359,18 @@ bool JsonReader::takeEscape(std::string& out) {
     if (atEnd()) {
         return fail("the text ends in an escape");
     }
+    constexpr std::string_view escapes = "\"\\/bfnrt";
+    constexpr std::string_view characters = "\"\\/\b\f\n\r\t";
     const char escape = text_[at_++];
-    switch (escape) {
-    case '"':
-    case '\\':
-    case '/':
-        out += escape;
-        return true;
-    case 'b':
-        out += '\b';
-        return true;
-    case 'f':
-        out += '\f';
-        return true;
-    case 'n':
-        out += '\n';
-        return true;
-    case 'r':
-        out += '\r';
-        return true;
-    case 't':
-        out += '\t';
-        return true;
-    case 'u':
+    if (escape == 'u') {
         return takeUnicodeEscape(out, start);
-    default:
+    }
+    const std::size_t known = escapes.find(escape);
+    if (known == std::string_view::npos) {
         return failAt(start, formatted("there is no escape of {}", nameOf(escape)));
     }
+    out += characters[known];
+    return true;
 }
 
 bool JsonReader::takeCodeUnit(std::uint32_t& unit) {

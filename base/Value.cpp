@@ -34,8 +34,9 @@ struct Value::ArrayBlock {
 
 namespace {
 
-constexpr double kTwoTo63 = 9223372036854775808.0;
-constexpr double kTwoTo64 = 18446744073709551616.0;
+/// The power of two that follows the integer's range.
+template <typename Integer>
+constexpr double kBehindLast = std::is_signed_v<Integer> ? 9223372036854775808.0 : 18446744073709551616.0;
 
 /// The number at the beginning of a text, after white space, as far as it reads; 0 when there is none.
 double leadingNumber(std::string_view text) noexcept {
@@ -56,25 +57,17 @@ double leadingNumber(std::string_view text) noexcept {
     return negative ? -number : number;
 }
 
-template <typename Integer> Integer clamped(double number, double limit) noexcept {
+template <typename Integer> Integer clamped(double number) noexcept {
     if (std::isnan(number)) {
         return 0;
     }
-    if (number >= limit) {
+    if (number >= kBehindLast<Integer>) {
         return std::numeric_limits<Integer>::max();
     }
     if (number <= static_cast<double>(std::numeric_limits<Integer>::min())) {
         return std::numeric_limits<Integer>::min();
     }
     return static_cast<Integer>(number);
-}
-
-std::int64_t signedFrom(double number) noexcept {
-    return clamped<std::int64_t>(number, kTwoTo63);
-}
-
-std::uint64_t unsignedFrom(double number) noexcept {
-    return clamped<std::uint64_t>(number, kTwoTo64);
 }
 
 /// An integer at the beginning of a text, exact where a double would round.
@@ -96,17 +89,13 @@ template <typename Integer> Integer leadingInteger(std::string_view text, double
             return number;
         }
     }
-    if constexpr (std::is_signed_v<Integer>) {
-        return signedFrom(asDouble);
-    } else {
-        return unsignedFrom(asDouble);
-    }
+    return clamped<Integer>(asDouble);
 }
 
-/// `behindLast` is the power of two that follows the integer's range.
-template <typename Integer> bool equalsWhole(double number, Integer integer, double behindLast) noexcept {
-    return number >= static_cast<double>(std::numeric_limits<Integer>::min()) && number < behindLast &&
-           static_cast<Integer>(number) == integer && static_cast<double>(integer) == number;
+template <typename Integer> bool equalsWhole(double number, Integer integer) noexcept {
+    return number >= static_cast<double>(std::numeric_limits<Integer>::min()) &&
+           number < kBehindLast<Integer> && static_cast<Integer>(number) == integer &&
+           static_cast<double>(integer) == number;
 }
 
 bool beginsWithYes(std::string_view text) noexcept {
@@ -259,7 +248,7 @@ std::int64_t Value::integerValue() const noexcept {
     case Kind::string:
         return leadingInteger<std::int64_t>(textBytes(), doubleValue());
     default:
-        return signedFrom(doubleValue());
+        return clamped<std::int64_t>(doubleValue());
     }
 }
 
@@ -273,7 +262,7 @@ std::uint64_t Value::unsignedValue() const noexcept {
     case Kind::string:
         return leadingInteger<std::uint64_t>(textBytes(), doubleValue());
     default:
-        return unsignedFrom(doubleValue());
+        return clamped<std::uint64_t>(doubleValue());
     }
 }
 
@@ -327,8 +316,8 @@ bool Value::numberEquals(const Value& other) const noexcept {
         return mine == theirs || (std::isnan(mine) && std::isnan(theirs));
     }
     if (isDouble(kind())) {
-        return isUnsigned(other.kind()) ? equalsWhole(doubleValue(), other.rawUnsigned(), kTwoTo64)
-                                        : equalsWhole(doubleValue(), other.rawInteger(), kTwoTo63);
+        return isUnsigned(other.kind()) ? equalsWhole(doubleValue(), other.rawUnsigned())
+                                        : equalsWhole(doubleValue(), other.rawInteger());
     }
     if (isDouble(other.kind())) {
         return other.numberEquals(*this);

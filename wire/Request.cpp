@@ -40,7 +40,6 @@ std::optional<Refusal> refuseUnlessWellFormed(std::span<const std::uint8_t> item
 
 /// Reads `0, id, method` or `2, method`. The answer says what is wrong.
 std::optional<Refusal> readHead(CborReader& reader, CborReader::ArrayHead& frame, Request& request) {
-    request.id.reset();
     const auto kind = reader.moreElements(frame) ? reader.readUnsigned() : std::nullopt;
     const bool isRequest = kind == static_cast<std::uint64_t>(FrameKind::request);
     if (!isRequest && kind != static_cast<std::uint64_t>(FrameKind::requestWithoutReply)) {
