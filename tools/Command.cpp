@@ -1,17 +1,11 @@
 #include "tools/Command.h"
 
+#include "base/Format.h"
+
 #include <algorithm>
 #include <cstdio>
 
 namespace tamblo::tools {
-
-namespace {
-
-std::string quoted(std::string_view text) {
-    return "\"" + std::string(text) + "\"";
-}
-
-} // namespace
 
 std::variant<Arguments, std::string> Arguments::parse(std::span<const Option> options,
                                                       std::span<const std::string_view> words) {
@@ -32,17 +26,17 @@ std::variant<Arguments, std::string> Arguments::parse(std::span<const Option> op
         const auto option = std::find_if(options.begin(), options.end(),
                                          [name](const Option& known) { return known.name == name; });
         if (option == options.end()) {
-            return "unknown option " + quoted(name);
+            return formatted("unknown option \"{}\"", name);
         }
         std::string_view value;
         if (equals != std::string_view::npos) {
             if (option->value.empty()) {
-                return "option " + quoted(name) + " takes no value";
+                return formatted("option \"{}\" takes no value", name);
             }
             value = word.substr(equals + 1);
         } else if (!option->value.empty()) {
             if (++i == words.size()) {
-                return "option " + quoted(name) + " needs a value: " + std::string(option->value);
+                return formatted("option \"{}\" needs a value: {}", name, option->value);
             }
             value = words[i];
         }

@@ -125,18 +125,8 @@ EncodedKind guessEncodedKind(std::string_view input) {
 }
 
 Decoded decode(std::string_view input, EncodedKind kind) {
-    Decoded decoded;
-    switch (kind) {
-    case EncodedKind::record:
-        decoded = decodeLines(input, appendRecord);
-        break;
-    case EncodedKind::line:
-        decoded = decodeLines(input, appendLine);
-        break;
-    case EncodedKind::frame:
-        decoded = decodeFrames(input);
-        break;
-    }
+    const AppendOne appendOne = kind == EncodedKind::record ? appendRecord : appendLine;
+    Decoded decoded = kind == EncodedKind::frame ? decodeFrames(input) : decodeLines(input, appendOne);
     if (decoded.text.empty() && decoded.problems.empty()) {
         decoded.problems.emplace_back("there is nothing to decode");
     }

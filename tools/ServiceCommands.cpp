@@ -54,7 +54,7 @@ ExitStatus send(const Arguments& arguments) {
     return ExitStatus::done;
 }
 
-constexpr Option kReportersOptions[] = {kJsonOption, kSocketOption, kTimeoutOption};
+constexpr Option kQueryOptions[] = {kJsonOption, kSocketOption, kTimeoutOption};
 
 ExitStatus reporters(const Arguments& arguments) {
     if (!arguments.rest().empty()) {
@@ -89,8 +89,6 @@ ExitStatus reporters(const Arguments& arguments) {
     }
     return ExitStatus::done;
 }
-
-constexpr Option kValidateOptions[] = {kJsonOption, kSocketOption, kTimeoutOption};
 
 ExitStatus validate(const Arguments& arguments) {
     if (arguments.rest().size() != 1) {
@@ -161,15 +159,14 @@ constexpr Command kCommandSend{
 };
 
 constexpr Command kCommandReporters{
-    "reporters",       "list the reporters of all clients, with their service types",
-    "[--json]",        "",
-    kReportersOptions, reporters,
+    "reporters", "list the reporters of all clients, with their service types", "[--json]", "", kQueryOptions,
+    reporters,
 };
 
 constexpr Command kCommandValidate{
-    "validate",       "ask whether a reporter exists, and for its service type",
-    "ID [--json]",    "Exits with 1 when the service does not know the reporter.",
-    kValidateOptions, validate,
+    "validate",    "ask whether a reporter exists, and for its service type",
+    "ID [--json]", "Exits with 1 when the service does not know the reporter.",
+    kQueryOptions, validate,
 };
 
 constexpr Command kCommandKill{

@@ -1,3 +1,4 @@
+#include "base/Format.h"
 #include "tools/Command.h"
 
 #include <algorithm>
@@ -78,11 +79,11 @@ ExitStatus run(const std::vector<std::string_view>& words) {
         std::fputs(help().c_str(), stdout);
         return ExitStatus::done;
     }
-    const Command* const command = commandNamed(asksForHelp ? words[1] : words[0]);
+    const std::string_view name = asksForHelp ? words[1] : words[0];
+    const Command* const command = commandNamed(name);
     if (command == nullptr) {
-        return complain(ExitStatus::usage, "unknown command \"" +
-                                               std::string(asksForHelp ? words[1] : words[0]) +
-                                               "\"; \"tambloctl help\" lists them");
+        return complain(ExitStatus::usage,
+                        tamblo::formatted("unknown command \"{}\"; \"tambloctl help\" lists them", name));
     }
     const auto end = std::find(words.begin() + 1, words.end(), "--");
     if (asksForHelp || std::find(words.begin() + 1, end, "--help") != end) {
@@ -91,8 +92,8 @@ ExitStatus run(const std::vector<std::string_view>& words) {
     }
     const auto arguments = Arguments::parse(command->options, std::span(words).subspan(1));
     if (const auto* wrong = std::get_if<std::string>(&arguments)) {
-        return complain(ExitStatus::usage, std::string(command->name) + ": " + *wrong + "; \"tambloctl " +
-                                               std::string(command->name) + " --help\" lists them");
+        return complain(ExitStatus::usage,
+                        tamblo::formatted("{}: {}; \"tambloctl {} --help\" lists them", name, *wrong, name));
     }
     return command->run(std::get<Arguments>(arguments));
 }

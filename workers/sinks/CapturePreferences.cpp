@@ -16,23 +16,15 @@ namespace {
 /// The values of a wrong kind that the log knows of, by key.
 class Reported {
 public:
-    /// Whether the value is another one than was reported last for its key; it then is the one.
-    [[nodiscard]] bool isNews(std::string_view key, const Value& value) {
+    /// Whether there is such a value now, and another than was reported last; it then is the one.
+    [[nodiscard]] bool isNews(std::string_view key, const std::optional<Value>& wrong) {
         const MutexLock lock(mutex_);
-        const auto [place, isNew] = values_.emplace(key, value);
-        return isNew || !(std::exchange(place->second, value) == value);
-    }
-    void forget(std::string_view key) {
-        const MutexLock lock(mutex_);
-        const auto found = values_.find(key);
-        if (found != values_.end()) {
-            values_.erase(found);
-        }
+        return std::exchange(values_[std::string(key)], wrong) != wrong && wrong;
     }
 
 private:
     Mutex mutex_;
-    std::map<std::string, Value, std::less<>> values_ TAMBLO_GUARDED_BY(mutex_);
+    std::map<std::string, std::optional<Value>> values_ TAMBLO_GUARDED_BY(mutex_);
 };
 
 bool beginsWithNumber(std::string_view text) noexcept {
@@ -71,11 +63,9 @@ std::string_view kindOf(const Value& value) noexcept {
 
 std::optional<Value> checked(Context& context, std::string_view key, const LogCategory& category,
                              bool (&isRight)(const Value&) noexcept, std::string_view wanted) {
-    auto& reported = context.shared<Reported>();
     std::optional<Value> value = capturePreferences(context).value(key);
-    if (!value || isRight(*value)) {
-        reported.forget(key);
-    } else if (reported.isNews(key, *value)) {
+    const std::optional<Value> wrong = value && !isRight(*value) ? value : std::nullopt;
+    if (context.shared<Reported>().isNews(key, wrong)) {
         log::error(category, "preference {} {}: {} in place of {}; it is read as 0",
                    kCapturePreferencesDomain, key, kindOf(*value), wanted);
     }
