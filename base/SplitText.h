@@ -16,10 +16,9 @@ namespace tamblo {
 std::string_view takeUpTo(char separator, std::string_view& text) noexcept;
 
 /// Takes a number off the front, if there is one that the type can hold.
-template <typename Number>
-[[nodiscard]] std::optional<Number> takeNumber(std::string_view& text, int base = 10) noexcept {
+template <typename Number> [[nodiscard]] std::optional<Number> takeNumber(std::string_view& text) noexcept {
     Number number{};
-    const auto result = std::from_chars(text.data(), text.data() + text.size(), number, base);
+    const auto result = std::from_chars(text.data(), text.data() + text.size(), number);
     if (result.ec != std::errc()) {
         return std::nullopt;
     }
