@@ -16,33 +16,40 @@
 
 namespace tamblo {
 
-/// A `std::mutex` that the analysis follows.
-class TAMBLO_THREAD_ANNOTATION(capability("mutex")) Mutex {
+/// A standard mutex that the analysis follows.
+template <typename Native> class TAMBLO_THREAD_ANNOTATION(capability("mutex")) AnnotatedMutex {
 public:
-    void lock() TAMBLO_THREAD_ANNOTATION(acquire_capability()) { mutex_.lock(); }
-    void unlock() TAMBLO_THREAD_ANNOTATION(release_capability()) { mutex_.unlock(); }
+    void lock() TAMBLO_THREAD_ANNOTATION(acquire_capability()) { native_.lock(); }
+    void unlock() TAMBLO_THREAD_ANNOTATION(release_capability()) { native_.unlock(); }
+    /// For what the analysis cannot follow: a lock that is handed on.
+    [[nodiscard]] Native& native() noexcept { return native_; }
 
 private:
-    friend class MutexLock;
-    std::mutex mutex_;
+    Native native_;
 };
 
+using Mutex = AnnotatedMutex<std::mutex>;
+using RecursiveMutex = AnnotatedMutex<std::recursive_mutex>;
+
 /// Holds a mutex for a scope; may let it go and take it again in between.
-class TAMBLO_THREAD_ANNOTATION(scoped_lockable) MutexLock {
+template <typename Native> class TAMBLO_THREAD_ANNOTATION(scoped_lockable) AnnotatedLock {
 public:
-    explicit MutexLock(Mutex& mutex) TAMBLO_THREAD_ANNOTATION(acquire_capability(mutex))
-        : lock_(mutex.mutex_) {}
-    ~MutexLock() TAMBLO_THREAD_ANNOTATION(release_capability()) = default;
-    MutexLock(const MutexLock&) = delete;
-    MutexLock& operator=(const MutexLock&) = delete;
+    explicit AnnotatedLock(AnnotatedMutex<Native>& mutex) TAMBLO_THREAD_ANNOTATION(acquire_capability(mutex))
+        : lock_(mutex.native()) {}
+    ~AnnotatedLock() TAMBLO_THREAD_ANNOTATION(release_capability()) = default;
+    AnnotatedLock(const AnnotatedLock&) = delete;
+    AnnotatedLock& operator=(const AnnotatedLock&) = delete;
 
     void lock() TAMBLO_THREAD_ANNOTATION(acquire_capability()) { lock_.lock(); }
     void unlock() TAMBLO_THREAD_ANNOTATION(release_capability()) { lock_.unlock(); }
     /// For a condition variable to wait with: on return the mutex is held again, as before.
-    [[nodiscard]] std::unique_lock<std::mutex>& forWaiting() noexcept { return lock_; }
+    [[nodiscard]] std::unique_lock<Native>& forWaiting() noexcept { return lock_; }
 
 private:
-    std::unique_lock<std::mutex> lock_;
+    std::unique_lock<Native> lock_;
 };
+
+using MutexLock = AnnotatedLock<std::mutex>;
+using RecursiveMutexLock = AnnotatedLock<std::recursive_mutex>;
 
 } // namespace tamblo

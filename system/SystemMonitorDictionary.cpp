@@ -11,13 +11,13 @@ SystemMonitorDictionary::Observation::~Observation() {
 }
 
 Dictionary SystemMonitorDictionary::find(std::string_view key) const {
-    const Lock held = lock();
+    const RecursiveMutexLock held(mutex_);
     const auto found = entries_.find(key);
     return found != entries_.end() ? found->second.state : Dictionary();
 }
 
 void SystemMonitorDictionary::set(std::string_view key, Dictionary state) {
-    const Lock held = lock();
+    const RecursiveMutexLock held(mutex_);
     const auto stored = entry(key);
     stored->second.state = std::move(state);
     const auto& observers = stored->second.observers;
@@ -34,14 +34,14 @@ void SystemMonitorDictionary::set(std::string_view key, Dictionary state) {
 
 SystemMonitorDictionary::Observation SystemMonitorDictionary::addKeyObserver(KeyObserver& observer,
                                                                              std::string_view key) {
-    const Lock held = lock();
+    const RecursiveMutexLock held(mutex_);
     const auto observed = entry(key);
     observed->second.observers.emplace(++lastObserver_, &observer);
     return {shared_from_this(), observed->first, lastObserver_};
 }
 
 std::size_t SystemMonitorDictionary::observationCount() const {
-    const Lock held = lock();
+    const RecursiveMutexLock held(mutex_);
     std::size_t count = 0;
     for (const auto& [key, entry] : entries_) {
         count += entry.observers.size();
@@ -55,7 +55,7 @@ SystemMonitorDictionary::Entries::iterator SystemMonitorDictionary::entry(std::s
 }
 
 void SystemMonitorDictionary::removeKeyObserver(std::string_view key, std::uint64_t id) {
-    const Lock held = lock();
+    const RecursiveMutexLock held(mutex_);
     entry(key)->second.observers.erase(id);
 }
 

@@ -1,6 +1,7 @@
 #pragma once
 
 #include "base/Dictionary.h"
+#include "base/Mutex.h"
 
 #include <cstddef>
 #include <cstdint>
@@ -52,7 +53,7 @@ public:
     };
 
     /// For what takes more than one step. Recursive.
-    [[nodiscard]] Lock lock() const { return Lock(mutex_); }
+    [[nodiscard]] Lock lock() const { return Lock(mutex_.native()); }
     /// The state stored last; empty when there is none.
     [[nodiscard]] Dictionary find(std::string_view key) const;
     /// Stores a state, then calls the key's observers, in the order in which they came.
@@ -71,12 +72,12 @@ private:
     using Entries = std::map<std::string, Entry, std::less<>>;
 
     /// Entries are never removed.
-    Entries::iterator entry(std::string_view key);
+    Entries::iterator entry(std::string_view key) TAMBLO_REQUIRES(mutex_);
     void removeKeyObserver(std::string_view key, std::uint64_t id);
 
-    mutable std::recursive_mutex mutex_; ///< guards what follows
-    Entries entries_;
-    std::uint64_t lastObserver_ = 0;
+    mutable RecursiveMutex mutex_;
+    Entries entries_ TAMBLO_GUARDED_BY(mutex_);
+    std::uint64_t lastObserver_ TAMBLO_GUARDED_BY(mutex_) = 0;
 };
 
 } // namespace tamblo

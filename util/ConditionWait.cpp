@@ -18,10 +18,10 @@ bool ZRReportingUtilityWait(ConditionLock& lock, std::chrono::duration<double> t
                             const LogCategory& category) {
     const auto wait = std::chrono::duration_cast<std::chrono::nanoseconds>(
         std::clamp(timeout, std::chrono::duration<double>::zero(), kLongestWait));
-    std::unique_lock held(lock.mutex);
+    MutexLock held(lock.mutex);
     while (!flag) {
         log::info(category, "{}", waitingMessage);
-        if (lock.condition.wait_for(held, wait) == std::cv_status::timeout) {
+        if (lock.condition.wait_for(held.forWaiting(), wait) == std::cv_status::timeout) {
             log::error(category, "{}", timeoutMessage);
             return false;
         }
@@ -31,7 +31,7 @@ bool ZRReportingUtilityWait(ConditionLock& lock, std::chrono::duration<double> t
 }
 
 void ZRReportingUtilitySignal(ConditionLock& lock, bool& flag) {
-    const std::lock_guard held(lock.mutex);
+    const MutexLock held(lock.mutex);
     flag = true;
     lock.condition.notify_one();
 }

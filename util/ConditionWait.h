@@ -1,17 +1,17 @@
 #pragma once
 
+#include "base/Mutex.h"
 #include "util/LogCategories.h"
 
 #include <chrono>
 #include <condition_variable>
-#include <mutex>
 #include <string_view>
 
 namespace tamblo {
 
 /// The lock of a one-shot handshake between two threads; guards the flag that says it is done.
 struct ConditionLock {
-    std::mutex mutex;
+    Mutex mutex;
     std::condition_variable condition;
 };
 
