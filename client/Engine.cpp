@@ -24,6 +24,22 @@ namespace tamblo::client {
 
 using std::chrono::milliseconds;
 
+namespace {
+
+/// Sets a variable for a scope: memory may run out within it, and the next call has to find it as it was.
+template <typename Variable, typename Set> class Scoped {
+public:
+    Scoped(Variable& variable, Set value) : variable_(variable) { variable_ = value; }
+    ~Scoped() { variable_ = Set{}; }
+    Scoped(const Scoped&) = delete;
+    Scoped& operator=(const Scoped&) = delete;
+
+private:
+    Variable& variable_;
+};
+
+} // namespace
+
 Engine::Engine(Options options) : options_(std::move(options)), queue_(options_.queueCapacity) {
     (void)received_.room(kReadBytes);
     if (options_.wakeable) {
@@ -133,13 +149,10 @@ void Engine::announce(ConnectionState state) {
     if (!options_.onState) {
         return;
     }
-    isAnnouncing_ = true;
-    if (state == ConnectionState::connected) {
-        announcingThread_.store(std::this_thread::get_id(), std::memory_order_relaxed);
-    }
+    const bool goesAhead = state == ConnectionState::connected;
+    const Scoped announcing(isAnnouncing_, true);
+    const Scoped thread(announcingThread_, goesAhead ? std::this_thread::get_id() : std::thread::id());
     options_.onState(state);
-    announcingThread_.store({}, std::memory_order_relaxed);
-    isAnnouncing_ = false;
 }
 
 void Engine::disconnect() noexcept {
@@ -336,7 +349,7 @@ std::size_t Engine::pump(milliseconds timeout) {
     if (isPumping_ || isClosed_) {
         return 0;
     }
-    isPumping_ = true;
+    const Scoped pumping(isPumping_, true);
     const Clock::time_point deadline = Clock::now() + timeout;
     hasNews_ = false;
     std::size_t handled = 0;
@@ -353,7 +366,6 @@ std::size_t Engine::pump(milliseconds timeout) {
         }
         handled = waitAndReceive(deadline);
     } while (handled == 0 && !hasNews_ && !isWakeWanted_.exchange(false) && Clock::now() < deadline);
-    isPumping_ = false;
     return handled;
 }
 

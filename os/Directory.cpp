@@ -2,12 +2,19 @@
 
 #include <cerrno>
 #include <memory>
+#include <thread>
 
 #include <dirent.h>
 #include <fcntl.h>
 #include <sys/file.h>
 
 namespace tamblo {
+
+namespace {
+
+constexpr std::chrono::milliseconds kLockRetry{5};
+
+} // namespace
 
 int makeDirectory(const std::string& path, mode_t mode) {
     if (::mkdir(path.c_str(), mode) != 0) {
@@ -37,13 +44,16 @@ int makeDirectories(const std::string& path, mode_t mode, std::string_view root)
     return parentFailure != 0 ? parentFailure : makeDirectory(path, mode);
 }
 
-FileDescriptor lockDirectory(const std::string& path) {
+FileDescriptor lockDirectory(const std::string& path, std::chrono::milliseconds patience) {
+    const auto until = std::chrono::steady_clock::now() + patience;
     FileDescriptor directory(::open(path.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
-    while (directory.isOpen() && ::flock(directory.get(), LOCK_EX) != 0) {
-        if (errno != EINTR) {
-            const int failure = errno;
+    while (directory.isOpen() && ::flock(directory.get(), LOCK_EX | LOCK_NB) != 0) {
+        const int failure = errno;
+        if (failure != EINTR && (failure != EWOULDBLOCK || std::chrono::steady_clock::now() >= until)) {
             directory.reset();
             errno = failure;
+        } else {
+            std::this_thread::sleep_for(kLockRetry);
         }
     }
     return directory;

@@ -50,9 +50,10 @@ std::variant<Dictionary, std::string> PreferenceFile::read() const {
 }
 
 std::optional<std::string> PreferenceFile::edit(const std::function<bool(Dictionary&)>& change) const {
-    const FileDescriptor lock = lockDirectory(directory_);
+    const FileDescriptor lock = lockDirectory(directory_, kLockPatience);
     if (!lock.isOpen()) {
-        return systemFault(directory_, errno);
+        return errno == EWOULDBLOCK ? formatted("{}: another program has it locked", directory_)
+                                    : systemFault(directory_, errno);
     }
     auto content = read();
     if (auto* fault = std::get_if<std::string>(&content)) {
@@ -62,7 +63,11 @@ std::optional<std::string> PreferenceFile::edit(const std::function<bool(Diction
     if (!change(values)) {
         return std::nullopt;
     }
-    const int failure = replaceFileAtomically(path_, jsonText(values) + "\n", Durability::power);
+    const std::string text = jsonText(values) + "\n";
+    if (text.size() > kMaximumSize || std::holds_alternative<JsonError>(readJson(text))) {
+        return formatted("{}: too large or too deeply nested to be read again; it is left as it is", path_);
+    }
+    const int failure = replaceFileAtomically(path_, text, Durability::power);
     return failure != 0 ? std::optional(systemFault(path_, failure)) : std::nullopt;
 }
 

@@ -2,7 +2,6 @@
 
 #include "base/Json.h"
 #include "base/Value.h"
-#include "platform/WorkQueue.h"
 
 #include <optional>
 #include <string>
@@ -18,11 +17,9 @@ public:
     /// The value that is stored now, or nothing.
     [[nodiscard]] virtual std::optional<Value> copyPreferenceValue(std::string_view key,
                                                                    std::string_view domain) const = 0;
-    /// Sets a value beside the others of the domain. This process reads it from now on; it is stored, for
-    /// other processes and those to come, on a thread that may wait for the disk, and then `afterwards` is
-    /// called there, if there is one. What cannot be stored is told in the log. Does not block.
-    virtual void setPreferenceValue(std::string_view key, std::string_view domain, const Value& value,
-                                    Work afterwards) = 0;
+    /// Sets a value beside the others of the domain and waits until it is stored, for other processes and for
+    /// those to come. What cannot be stored is told in the log; this process reads it all the same.
+    virtual void setPreferenceValue(std::string_view key, std::string_view domain, const Value& value) = 0;
 };
 
 /// The values of one domain, read as what the caller takes them for. Every call asks the store.
@@ -51,8 +48,8 @@ public:
         const std::optional<Value> value = store_.copyPreferenceValue(key, domain_);
         return value && value->boolValue();
     }
-    void setValue(std::string_view key, const Value& value, Work afterwards = {}) {
-        store_.setPreferenceValue(key, domain_, value, std::move(afterwards));
+    void setValue(std::string_view key, const Value& value) {
+        store_.setPreferenceValue(key, domain_, value);
     }
 
 private:

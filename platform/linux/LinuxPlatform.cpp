@@ -49,10 +49,7 @@ void raiseDescriptorLimit() noexcept {
 class LinuxPlatform::Signals final : public EventSource {
 public:
     Signals() {
-        sigset_t signals;
-        sigemptyset(&signals);
-        sigaddset(&signals, SIGTERM);
-        sigaddset(&signals, SIGINT);
+        const sigset_t signals = endingSignals();
         // A sink that reaches the process's file size limit is a full disk, not the end.
         std::signal(SIGXFSZ, SIG_IGN);
         ::sigprocmask(SIG_BLOCK, &signals, nullptr);
@@ -61,6 +58,11 @@ public:
 
     [[nodiscard]] bool watch(EventLoop& loop) { return loop.add(descriptor_.get(), EPOLLIN, *this); }
     void setEndWanted(UniqueFunction<void()> endWanted) { endWanted_ = std::move(endWanted); }
+    /// From now on, when nobody reads the descriptor any more, each ends the process.
+    static void letEnd() {
+        const sigset_t signals = endingSignals();
+        ::sigprocmask(SIG_UNBLOCK, &signals, nullptr);
+    }
 
     void ready(std::uint32_t) override {
         signalfd_siginfo signal{};
@@ -73,6 +75,14 @@ public:
     }
 
 private:
+    static sigset_t endingSignals() {
+        sigset_t signals;
+        sigemptyset(&signals);
+        sigaddset(&signals, SIGTERM);
+        sigaddset(&signals, SIGINT);
+        return signals;
+    }
+
     FileDescriptor descriptor_;
     UniqueFunction<void()> endWanted_;
 };
@@ -127,7 +137,7 @@ struct LinuxPlatform::Services {
     LinuxDeviceProperties& deviceProperties =
         provide<LinuxDeviceProperties>(platform.deviceProperties, directories.deviceProperties(), log);
     LinuxPreferences& preferences =
-        provide<LinuxPreferences>(platform.preferences, directories.preferences(), workQueues, log);
+        provide<LinuxPreferences>(platform.preferences, directories.preferences(), log);
     SinkFiles& sinks = sinkFiles.emplace(directories.logs, log);
     LinuxAnalyticsEventService& analyticsEvents =
         provide<LinuxAnalyticsEventService>(platform.analyticsEvents, sinks, clock, preferences, log);
@@ -200,6 +210,10 @@ void LinuxPlatform::run(SerialQueue& requestQueue,
     });
     notifyServiceManager("READY=1");
     all.loop.run(all.workQueues);
+    all.signals.letEnd();
+    // What ended the loop may have left more for the queues, which the service has to outlive.
+    all.workQueues.workOff();
+    all.connections.letGo();
     all.sinks.flush();
 }
 

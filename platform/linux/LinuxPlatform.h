@@ -25,8 +25,9 @@ public:
     [[nodiscard]] const Platform& services() const noexcept;
 
     /// Carries out requests until the first SIGTERM or SIGINT, then `shutDown`, and returns once that has
-    /// called the completion that it is given. The request queue is written out and answered batch by batch:
-    /// first what a batch recorded goes to the sinks' files, then its replies go to the clients.
+    /// called the completion that it is given, with the queues at rest and every connection gone. The request
+    /// queue is written out and answered batch by batch: first what a batch recorded goes to the sinks'
+    /// files, then its replies go to the clients.
     void run(SerialQueue& requestQueue,
              const std::function<void(std::function<void()> completion)>& shutDown);
 

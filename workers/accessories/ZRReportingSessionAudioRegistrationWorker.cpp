@@ -52,11 +52,10 @@ void lookUp(Context& context) {
     const bool isChanged = kept ? !(*kept == Value(update.registered)) : !update.registered.empty();
     if (isChanged) {
         // Stored first: after a crash an accessory is rather not reported than twice.
-        store.setValue(kKey, update.registered, [&context, reports = std::move(update.reports)]() mutable {
-            if (!reports.empty()) {
-                send(context, std::move(reports));
-            }
-        });
+        store.setValue(kKey, update.registered);
+    }
+    if (!update.reports.empty()) {
+        send(context, std::move(update.reports));
     }
 }
 

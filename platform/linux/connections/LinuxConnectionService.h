@@ -46,6 +46,8 @@ public:
     void releaseReplies() { shared_.heldReplies.release(); }
     /// Takes no further connections and reads no more from those there are; the socket file goes.
     void stop() TAMBLO_EXCLUDES(mutex_);
+    /// Ends the connections, and with them what they export. Once the queues are at rest.
+    void letGo() TAMBLO_EXCLUDES(mutex_);
 
 private:
     [[nodiscard]] std::optional<std::string> adoptActivatedSocket();

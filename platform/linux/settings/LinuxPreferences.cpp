@@ -6,10 +6,8 @@
 
 namespace tamblo {
 
-LinuxPreferences::LinuxPreferences(std::string directory, WorkQueues& workQueues, StructuredLog& log)
-    : log_(log),
-      queue_(workQueues.makeSerialQueue("com.vandra.tamblo.preferences")),
-      watcher_(std::move(directory)) {
+LinuxPreferences::LinuxPreferences(std::string directory, StructuredLog& log)
+    : log_(log), watcher_(std::move(directory)) {
     reportUnwatched();
 }
 
@@ -56,53 +54,30 @@ std::optional<Value> LinuxPreferences::copyPreferenceValue(std::string_view key,
     return value != nullptr ? std::optional<Value>(*value) : std::nullopt;
 }
 
-void LinuxPreferences::setPreferenceValue(std::string_view key, std::string_view domain, const Value& value,
-                                          Work afterwards) {
-    {
-        const MutexLock lock(mutex_);
-        if (Domain* const entry = domainNamed(domain)) {
-            const bool isStoring = !entry->pending.empty();
-            entry->unstored.set(key, value);
-            entry->pending.set(key, value);
-            if (!isStoring) {
-                queue_->post([this, entry] { store(*entry); }, Pace::mayBlock);
-            }
-        } else {
-            log_.report(LogLevel::error, "zrrs", formatted("\"{}\" is no preferences domain", domain));
-        }
-        if (afterwards) {
-            queue_->post(std::move(afterwards), Pace::mayBlock);
-        }
+void LinuxPreferences::setPreferenceValue(std::string_view key, std::string_view domain, const Value& value) {
+    MutexLock lock(mutex_);
+    Domain* const entry = domainNamed(domain);
+    if (entry == nullptr) {
+        log_.report(LogLevel::error, "zrrs", formatted("\"{}\" is no preferences domain", domain));
+        return;
+    }
+    entry->unstored.set(key, value);
+    generation_.fetch_add(1, std::memory_order_release);
+    // Editing waits for others, asking does not.
+    lock.unlock();
+    const std::optional<std::string> fault = entry->editable.edit([key, &value](Dictionary& values) {
+        values.set(key, value);
+        return true;
+    });
+    lock.lock();
+    if (!fault) {
+        entry->forgetFile();
+    }
+    if (entry->told.isNews(fault.value_or(""))) {
+        log_.report(LogLevel::error, "zrrs",
+                    formatted("{}; what was set is forgotten when the service ends", *fault));
     }
     generation_.fetch_add(1, std::memory_order_release);
-}
-
-void LinuxPreferences::store(Domain& domain) {
-    MutexLock lock(mutex_);
-    while (!domain.pending.empty()) {
-        const Dictionary taken = domain.pending;
-        // Editing waits for others, asking does not.
-        lock.unlock();
-        const std::optional<std::string> fault = domain.editable.edit([&taken](Dictionary& values) {
-            values.merge(taken);
-            return true;
-        });
-        lock.lock();
-        for (std::size_t i = 0; i < taken.size(); ++i) {
-            // What was set anew meanwhile is stored next.
-            if (*domain.pending.find(taken.keyAt(i)) == taken.valueAt(i)) {
-                domain.pending.remove(taken.keyAt(i));
-            }
-        }
-        if (!fault) {
-            domain.forgetFile();
-        }
-        if (domain.told.isNews(fault.value_or(""))) {
-            log_.report(LogLevel::error, "zrrs",
-                        formatted("{}; what was set is forgotten when the service ends", *fault));
-        }
-        generation_.fetch_add(1, std::memory_order_release);
-    }
 }
 
 void LinuxPreferences::readChanges() {

@@ -11,7 +11,6 @@
 #include <atomic>
 #include <cstdint>
 #include <map>
-#include <memory>
 #include <optional>
 #include <string>
 #include <string_view>
@@ -25,19 +24,18 @@ namespace tamblo {
 /// of the same wake-up, so that a preference is in force for every message sent after it was written. Any
 /// thread may ask.
 ///
-/// A value that is set is in force at once and stored on a queue of its own, since that waits for other
-/// programs that edit the file, and for the disk; values set meanwhile are stored together. What could not be
-/// stored is one error line for as long as that lasts, and is read back by this process all the same, until
-/// the file changes.
+/// A value that is set is in force at once, and is stored when setting it returns: that waits for other
+/// programs that edit the file, within bounds, and for the disk, but nobody who asks waits along. What could
+/// not be stored is one error line for as long as that lasts, and is read back by this process all the same,
+/// until the file changes.
 class LinuxPreferences final : public Preferences {
 public:
-    /// The log must outlive the preferences; the queues work off what was posted before the preferences go.
-    LinuxPreferences(std::string directory, WorkQueues& workQueues, StructuredLog& log);
+    /// The log must outlive the preferences.
+    LinuxPreferences(std::string directory, StructuredLog& log);
 
     [[nodiscard]] std::optional<Value> copyPreferenceValue(std::string_view key,
                                                            std::string_view domain) const override;
-    void setPreferenceValue(std::string_view key, std::string_view domain, const Value& value,
-                            Work afterwards) override;
+    void setPreferenceValue(std::string_view key, std::string_view domain, const Value& value) override;
 
     /// The file of a domain, whether it is there or not.
     [[nodiscard]] std::string path(std::string_view domain) const;
@@ -60,23 +58,19 @@ private:
         std::optional<Dictionary> values = std::nullopt;
         /// Set here and not in the file.
         Dictionary unstored = {};
-        /// Those of them that are still to be stored, by a piece that waits on the queue or runs.
-        Dictionary pending = {};
         ToldOnce told = {};
 
         void forgetFile() {
             isCurrent = false;
-            unstored = pending;
+            unstored = {};
         }
     };
 
     void reportUnwatched();
     /// Null for a name that no domain can have.
     [[nodiscard]] Domain* domainNamed(std::string_view name) const TAMBLO_REQUIRES(mutex_);
-    void store(Domain& domain);
 
     StructuredLog& log_;
-    const std::unique_ptr<SerialQueue> queue_;
     std::atomic<std::uint64_t> generation_{1};
     std::atomic<bool> isWatched_{false};
     /// Used by `readChanges` alone.
