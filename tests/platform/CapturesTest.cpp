@@ -359,7 +359,7 @@ TEST_F(StackCaptureTest, ThoseBeyondTheFourThatWaitAreDroppedAndCounted) {
         capture();
     }
     EXPECT_EQ(run(), 4U);
-    EXPECT_THAT(log.take(), ElementsAre("3 zrrp no stack captures wait any more; 2 were dropped"));
+    EXPECT_THAT(log.take(), ElementsAre("3 zrrl no stack captures wait any more; 2 were dropped"));
     capture();
     EXPECT_EQ(run(), 1U);
     EXPECT_THAT(log.take(), IsEmpty());

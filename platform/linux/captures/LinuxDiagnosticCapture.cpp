@@ -123,9 +123,9 @@ LinuxDiagnosticCapture::LinuxDiagnosticCapture(SinkFiles& sinks, Clock& clock, W
     : clock_(clock),
       clientProcesses_(std::move(clientProcesses)),
       files_(std::move(files)),
-      file_(sinks, "stack-captures.jsonl", "zrrp", AppendOnlyFile::Flushed::byOwner),
+      file_(sinks, "stack-captures.jsonl", "zrrl", AppendOnlyFile::Flushed::byOwner),
       queue_(workQueues, "com.vandra.tamblo.stackcaptures",
-             {.waiting = kMaximumWaiting, .what = "stack captures", .categoryCode = "zrrp"}, log) {}
+             {.waiting = kMaximumWaiting, .what = "stack captures", .categoryCode = "zrrl"}, log) {}
 
 void LinuxDiagnosticCapture::captureStacks(StackCaptureRequest request) {
     queue_.post(

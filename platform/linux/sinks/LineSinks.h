@@ -42,7 +42,7 @@ private:
 class LinuxBugReportDrafting final : public BugReportDraftingService {
 public:
     LinuxBugReportDrafting(SinkFiles& sinks, const Clock& clock)
-        : clock_(clock), file_(sinks, "bug-report-drafts.jsonl", "zrrp") {}
+        : clock_(clock), file_(sinks, "bug-report-drafts.jsonl", "zrrr") {}
     void createDraft(const BugReportDraft& draft, const std::string& processName,
                      const std::string& displayReason, Completion completion) override;
 
