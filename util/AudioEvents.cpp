@@ -5,6 +5,46 @@
 
 namespace tamblo {
 
+namespace {
+
+template <typename Word> consteval bool same(std::uint32_t number, Word word) {
+    return number == static_cast<std::uint32_t>(word);
+}
+
+} // namespace
+
+// What the service acts on has the protocol's numbers.
+static_assert([] {
+    using enum wire::Subsystem;
+    return same(AudioEventSubsystemSession, session) && same(AudioEventSubsystemHAL, hal);
+}());
+static_assert([] {
+    using enum wire::EventKind;
+    return same(AudioEventKindGeneric, generic) && same(AudioEventKindInput, input) &&
+           same(AudioEventKindPlayback, playback) && same(AudioEventKindIO, io) &&
+           same(AudioEventKindSetup, setup) && same(AudioEventKindError, error) &&
+           same(AudioEventKindChanlog, chanlog) && same(AudioEventKindVolume, volume) &&
+           same(AudioEventKindKaleen, kaleen) && same(AudioEventKindWirrels, wirrels);
+}());
+static_assert([] {
+    using enum wire::EventType;
+    return same(AudioEventTypeGeneric, generic) && same(AudioEventTypeStart, start) &&
+           same(AudioEventTypeStop, stop) && same(AudioEventTypeSetup, setup) &&
+           same(AudioEventTypeError, error) && same(AudioEventTypeIssueDetector, issueDetector) &&
+           same(AudioEventTypeJoulery, joulery) && same(AudioEventTypeSummary, summary) &&
+           same(AudioEventTypeSimple, simple) && same(AudioEventTypeHistogram, histogram) &&
+           same(AudioEventTypeState, state) && same(AudioEventTypeMemoryLog, memoryLog) &&
+           same(AudioEventTypeUnknown, unknown);
+}());
+static_assert([] {
+    using enum wire::ServiceType;
+    return same(AudioServiceTypeVelka, velka) && same(AudioServiceTypeTelephony, telephony) &&
+           same(AudioServiceTypeHaptics, haptics) && same(AudioServiceTypeAlarms, alarms) &&
+           same(AudioServiceTypeStandalone, standalone) && same(AudioServiceTypeAlerts, alerts) &&
+           same(AudioServiceTypeTest, test) && same(AudioServiceTypeAPIUsage, apiUsage) &&
+           same(AudioServiceTypeSystemSounds, systemSounds) && same(AudioServiceTypeUnknown, unknown);
+}());
+static_assert(same(AudioEventCategoryUnknown, wire::EventCategory::unknown));
 // The names lie at their numbers.
 static_assert(AudioEventKindWirrels + 1 == wire::kKindNames.size());
 static_assert(AudioEventTypeMemoryLog + 1 == wire::kTypeNames.size());
