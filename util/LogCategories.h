@@ -4,6 +4,7 @@
 
 #include <array>
 #include <atomic>
+#include <cstddef>
 #include <cstdint>
 #include <string_view>
 
@@ -39,43 +40,24 @@ inline constinit const std::array<LogCategory, 12> all{
     LogCategory("zrrc"), LogCategory("zrrs"), LogCategory("zrrr"), LogCategory("zrri"),
     LogCategory("zrrd"), LogCategory("zrrt"), LogCategory("zrrp"), LogCategory("zrra"),
     LogCategory("zrrb"), LogCategory("zrru"), LogCategory("zrrl"), LogCategory("zrrz")};
-}
 
-inline const LogCategory& ZRReportingClientCategory() noexcept {
-    return log_categories::all[0];
+template <std::size_t kPlace> [[nodiscard]] const LogCategory& at() noexcept {
+    return all[kPlace];
 }
-inline const LogCategory& ZRReportingServiceDelegateCategory() noexcept {
-    return log_categories::all[1];
-}
-inline const LogCategory& ZRReportingSessionCategory() noexcept {
-    return log_categories::all[2];
-}
-inline const LogCategory& ZRReportingSessionLinkmeterCategory() noexcept {
-    return log_categories::all[3];
-}
-inline const LogCategory& ZRReportingDriverUtilityCategory() noexcept {
-    return log_categories::all[4];
-}
-inline const LogCategory& ZRReportingTraceCategory() noexcept {
-    return log_categories::all[5];
-}
-inline const LogCategory& ZRReportingJouleryCategory() noexcept {
-    return log_categories::all[6];
-}
-inline const LogCategory& ZRReportingQMXLogCategory() noexcept {
-    return log_categories::all[7];
-}
-inline const LogCategory& ZRReportingZephLogCategory() noexcept {
-    return log_categories::all[8];
-}
-inline const LogCategory& ZRReportingSummaryLogCategory() noexcept {
-    return log_categories::all[9];
-}
-inline const LogCategory& ZRReportingDPLogCategory() noexcept {
-    return log_categories::all[10];
-}
-inline const LogCategory& ZRReportingAudioRegistrationCategory() noexcept {
-    return log_categories::all[11];
-}
+} // namespace log_categories
+
+// To be called, as in `ZRReportingClientCategory()`; `docs/architecture.md` says who writes under which code.
+inline constexpr auto& ZRReportingClientCategory = log_categories::at<0>;
+inline constexpr auto& ZRReportingServiceDelegateCategory = log_categories::at<1>;
+inline constexpr auto& ZRReportingSessionCategory = log_categories::at<2>;
+inline constexpr auto& ZRReportingSessionLinkmeterCategory = log_categories::at<3>;
+inline constexpr auto& ZRReportingDriverUtilityCategory = log_categories::at<4>;
+inline constexpr auto& ZRReportingTraceCategory = log_categories::at<5>;
+inline constexpr auto& ZRReportingJouleryCategory = log_categories::at<6>;
+inline constexpr auto& ZRReportingQMXLogCategory = log_categories::at<7>;
+inline constexpr auto& ZRReportingZephLogCategory = log_categories::at<8>;
+inline constexpr auto& ZRReportingSummaryLogCategory = log_categories::at<9>;
+inline constexpr auto& ZRReportingDPLogCategory = log_categories::at<10>;
+inline constexpr auto& ZRReportingAudioRegistrationCategory = log_categories::at<11>;
 
 } // namespace tamblo
