@@ -10,6 +10,7 @@
 #include <charconv>
 #include <cmath>
 #include <cstddef>
+#include <span>
 #include <string_view>
 
 namespace tamblo {
@@ -64,84 +65,72 @@ template <typename Number> std::string realText(Number number) {
 class PropertyListWriter {
 public:
     /// The document, or nothing when the value holds what XML cannot carry.
-    [[nodiscard]] static std::optional<std::string> write(const Value& value);
+    [[nodiscard]] static std::optional<std::string> write(const Value& value) {
+        PropertyListWriter writer;
+        writer.out_ = kHead;
+        if (!writer.element(value)) {
+            return std::nullopt;
+        }
+        writer.out_ += kFoot;
+        return std::move(writer.out_);
+    }
 
 private:
+    // Each answers whether XML can carry the value.
     [[nodiscard]] bool element(const Value& value);
-    [[nodiscard]] bool array(const Value& value);
+    [[nodiscard]] bool array(std::span<const Value> elements);
     [[nodiscard]] bool dictionary(const Dictionary& dictionary);
     [[nodiscard]] bool text(std::string_view name, std::string_view text);
     [[nodiscard]] bool date(double secondsSince1970);
-    void real(const Value& value);
-    void simple(std::string_view name, std::string_view content);
-    void line(std::string_view markup);
-    void indent() { out_.append(depth_, '\t'); }
+    bool simple(std::string_view name, std::string_view content);
+    bool line(std::string_view markup);
 
     std::string out_;
     std::size_t depth_ = 0;
 };
 
-std::optional<std::string> PropertyListWriter::write(const Value& value) {
-    PropertyListWriter writer;
-    writer.out_ = kHead;
-    if (!writer.element(value)) {
-        return std::nullopt;
-    }
-    writer.out_ += kFoot;
-    return std::move(writer.out_);
-}
-
 bool PropertyListWriter::element(const Value& value) {
     switch (value.kind()) {
     case Value::Kind::boolean:
-        line(value.boolValue() ? "<true/>" : "<false/>");
-        return true;
+        return line(value.boolValue() ? "<true/>" : "<false/>");
     case Value::Kind::integer:
-        simple("integer", formatted("{}", value.rawInteger()));
-        return true;
+        return simple("integer", formatted("{}", value.rawInteger()));
     case Value::Kind::unsignedInteger:
-        simple("integer", formatted("{}", value.rawUnsigned()));
-        return true;
+        return simple("integer", formatted("{}", value.rawUnsigned()));
     case Value::Kind::singleFloat:
+        return simple("real", realText(value.rawSingle()));
     case Value::Kind::doubleFloat:
-        real(value);
-        return true;
+        return simple("real", realText(value.rawDouble()));
     case Value::Kind::string:
         return text("string", value.stringValue());
     case Value::Kind::date:
         return date(value.dateSeconds());
     case Value::Kind::data:
-        simple("data", encodeBase64(value.dataValue()));
-        return true;
+        return simple("data", encodeBase64(value.dataValue()));
     case Value::Kind::array:
-        return array(value);
+        return array(value.arrayValue());
     case Value::Kind::dictionary:
         return dictionary(value.dictionaryValue());
     }
     return false;
 }
 
-bool PropertyListWriter::array(const Value& value) {
-    if (value.arrayValue().empty()) {
-        line("<array/>");
-        return true;
+bool PropertyListWriter::array(std::span<const Value> elements) {
+    if (elements.empty()) {
+        return line("<array/>");
     }
     line("<array>");
     ++depth_;
-    for (const Value& member : value.arrayValue()) {
-        if (!element(member)) {
-            return false;
-        }
+    if (!std::ranges::all_of(elements, [this](const Value& member) { return element(member); })) {
+        return false;
     }
     --depth_;
-    line("</array>");
-    return true;
+    return line("</array>");
 }
 
 bool PropertyListWriter::dictionary(const Dictionary& dictionary) {
     if (dictionary.empty()) {
-        line("<dict/>");
-        return true;
+        return line("<dict/>");
     }
     line("<dict>");
     ++depth_;
@@ -151,46 +140,27 @@ bool PropertyListWriter::dictionary(const Dictionary& dictionary) {
         }
     }
     --depth_;
-    line("</dict>");
-    return true;
+    return line("</dict>");
 }
 
 bool PropertyListWriter::text(std::string_view name, std::string_view text) {
     std::string content;
-    if (!appendEscaped(content, text)) {
-        return false;
-    }
-    simple(name, content);
-    return true;
+    return appendEscaped(content, text) && simple(name, content);
 }
 
 /// Dates of a property list are whole seconds.
 bool PropertyListWriter::date(double secondsSince1970) {
-    std::optional<std::string> text = formatRfc3339(std::floor(secondsSince1970));
-    if (!text) {
-        return false;
-    }
-    if (const std::size_t fraction = text->find('.'); fraction != std::string::npos) {
-        text->replace(fraction, std::string::npos, "Z");
-    }
-    simple("date", *text);
+    const std::optional<std::string> text = formatRfc3339(std::floor(secondsSince1970));
+    return text && simple("date", text->substr(0, text->find('.')) + 'Z');
+}
+
+bool PropertyListWriter::simple(std::string_view name, std::string_view content) {
+    return line(formatted("<{}>{}</{}>", name, content, name));
+}
+
+bool PropertyListWriter::line(std::string_view markup) {
+    out_.append(depth_, '\t').append(markup) += '\n';
     return true;
-}
-
-void PropertyListWriter::real(const Value& value) {
-    simple("real", value.kind() == Value::Kind::singleFloat ? realText(value.rawSingle())
-                                                            : realText(value.rawDouble()));
-}
-
-void PropertyListWriter::simple(std::string_view name, std::string_view content) {
-    indent();
-    appendFormatted(out_, "<{}>{}</{}>\n", name, content, name);
-}
-
-void PropertyListWriter::line(std::string_view markup) {
-    indent();
-    out_ += markup;
-    out_ += '\n';
 }
 
 } // namespace
