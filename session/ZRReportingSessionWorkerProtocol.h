@@ -24,8 +24,9 @@ public:
 
     /// Null once the session is gone.
     [[nodiscard]] std::shared_ptr<ZRReportingSession> session() const noexcept { return session_.lock(); }
+    /// Nothing here calls it yet: a worker is made for its session.
     void setSession(std::weak_ptr<ZRReportingSession> session) noexcept { session_ = std::move(session); }
-    /// Set by the session around `start` and `stop`.
+    /// Set by the session alone, after `start` and `stop`.
     [[nodiscard]] bool started() const noexcept { return started_; }
     void setStarted(bool started) noexcept { started_ = started; }
 

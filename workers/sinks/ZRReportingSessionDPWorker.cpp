@@ -86,11 +86,6 @@ ZRReportingSessionDPWorker::initWithSession(Context& context,
     return std::make_shared<ZRReportingSessionDPWorker>(context, session);
 }
 
-std::optional<bool> ZRReportingSessionDPWorker::start() {
-    setStarted(true);
-    return true;
-}
-
 void ZRReportingSessionDPWorker::handleMessage(const MessageRef& message) {
     if (message == nullptr) {
         return;

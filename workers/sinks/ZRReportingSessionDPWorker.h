@@ -22,7 +22,7 @@ public:
     [[nodiscard]] static std::shared_ptr<ZRReportingSessionWorkerProtocol>
     initWithSession(Context& context, const std::shared_ptr<ZRReportingSession>& session);
 
-    std::optional<bool> start() override;
+    std::optional<bool> start() override { return true; }
     void handleMessage(const MessageRef& message) override;
 
     /// Whether it is an overload of the audio I/O itself: an error of that kind, without a subsystem.

@@ -47,9 +47,7 @@ ZRReportingSessionSummaryJsonFileWorker::initWithSession(Context& context,
     if (session->serviceType() != AudioServiceTypeTest && !context.isInternalBuild()) {
         return nullptr;
     }
-    auto worker = std::make_shared<ZRReportingSessionSummaryJsonFileWorker>(context, session);
-    worker->setStarted(true);
-    return worker;
+    return std::make_shared<ZRReportingSessionSummaryJsonFileWorker>(context, session);
 }
 
 void ZRReportingSessionSummaryJsonFileWorker::stop() {
@@ -105,13 +103,11 @@ void ZRReportingSessionSummaryJsonFileWorker::openFile(const ZRReportingSession&
         log::error(ZRReportingSessionCategory(),
                    "SummaryJsonFileWorker failed to open file. action=open file={} error=\"{}\"",
                    *reportPath_, *failure);
-        setStarted(false);
         return;
     }
     reportFileHandle_ = std::get<std::unique_ptr<ReportFile>>(std::move(file));
     log::info(ZRReportingSessionCategory(), "SummaryJsonFileWorker opened file. action=open file={}",
               *reportPath_);
-    setStarted(true);
     isOut_ = false;
     writeLine("[");
 }
