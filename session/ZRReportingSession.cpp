@@ -92,7 +92,7 @@ void ZRReportingSession::recordOwnMessage(AudioEventType type, std::string_view 
     };
     auto message = std::make_shared<ZRReportingSessionMessage>(std::move(payload), AudioEventKindSetup, type);
     addMissingDates(*message, context_.platform().clock->now());
-    addAudioMessageTag(*message);
+    addAudioMessageTag(*message, audioTags_);
     record(std::move(message));
     ++ownRecordCount_;
 }
@@ -122,13 +122,10 @@ void ZRReportingSession::sendMessage(const MessageRef& message, ErrorReply reply
 }
 
 void ZRReportingSession::normalise(ZRReportingSessionMessage& message) const {
-    const WallTime now = context_.platform().clock->now();
-    message.editPayload([&](Dictionary& payload) {
-        intake::addMissingDates(payload, now);
-        intake::removeWhiteSpaceFromKeys(payload);
-        intake::addAudioMessageTag(payload, audioTags_.of(message.category(), message.type()));
-        intake::addAppName(payload, appName_);
-    });
+    addMissingDates(message, context_.platform().clock->now());
+    removeWhiteSpaceFromKeys(message);
+    addAudioMessageTag(message, audioTags_);
+    addAppName(message);
 }
 
 std::string ZRReportingSession::description() const {
@@ -143,9 +140,8 @@ void ZRReportingSession::removeWhiteSpaceFromKeys(ZRReportingSessionMessage& mes
     message.editPayload(intake::removeWhiteSpaceFromKeys);
 }
 
-void ZRReportingSession::addAudioMessageTag(ZRReportingSessionMessage& message) {
-    message.editPayload([&message](Dictionary& payload) {
-        auto& tags = Context::current().shared<intake::AudioTags>();
+void ZRReportingSession::addAudioMessageTag(ZRReportingSessionMessage& message, intake::AudioTags& tags) {
+    message.editPayload([&](Dictionary& payload) {
         intake::addAudioMessageTag(payload, tags.of(message.category(), message.type()));
     });
 }

@@ -25,9 +25,10 @@ namespace tamblo {
 /// One reporter's session: its identity, service type and configuration, the messages accepted since its
 /// start, and one worker of each applicable class.
 ///
-/// Owned by a client instance, the single-message session by the service. Created (the start-on-init workers
-/// run) → started (all workers run) → stopped (messages emptied, workers kept) → started again …; letting it
-/// go stops nothing. Used on the reporting server queue alone.
+/// Owned by a client instance, or by `LeavingClients` once the client has left; the single-message session by
+/// its keeper. Created (the start-on-init workers run) → started (all workers run) → stopped (messages
+/// emptied, workers kept) → started again …; letting it go stops nothing. Used on the reporting server queue
+/// alone.
 class ZRReportingSession : public std::enable_shared_from_this<ZRReportingSession> {
     struct Created {
         explicit Created() = default;
@@ -43,6 +44,7 @@ public:
     ZRReportingSession(const ZRReportingSession&) = delete;
     ZRReportingSession& operator=(const ZRReportingSession&) = delete;
 
+    /// Nothing here asks for them yet.
     [[nodiscard]] static std::span<const WorkerClass> getAllWorkerClasses() { return workerClassList(); }
 
     void setServiceType(AudioServiceType serviceType);
@@ -54,7 +56,8 @@ public:
 
     void start();
     /// Normalises the message, records it unless it is redundant, and offers it to the consumer workers,
-    /// whether or not the session is started. May be called by a worker in its `stop`.
+    /// whether or not the session is started. May be called by a worker in its `stop`. The reply, which
+    /// nothing here gives yet, is called at the end.
     void sendMessage(const MessageRef& message, ErrorReply reply = {});
     void stop();
 
@@ -84,12 +87,14 @@ public:
     [[nodiscard]] std::size_t acceptedMessageCount() const noexcept {
         return messages_.size() - ownRecordCount_;
     }
+    /// Nothing here asks for it yet.
     [[nodiscard]] std::size_t workerInstanceCount() const noexcept { return messageWorkers_.size(); }
     [[nodiscard]] std::string description() const;
 
+    /// What makes a message uniform, in this order; `session/MessageIntake.h` says how.
     static void addMissingDates(ZRReportingSessionMessage& message, WallTime now);
     static void removeWhiteSpaceFromKeys(ZRReportingSessionMessage& message);
-    static void addAudioMessageTag(ZRReportingSessionMessage& message);
+    static void addAudioMessageTag(ZRReportingSessionMessage& message, intake::AudioTags& tags);
     void addAppName(ZRReportingSessionMessage& message) const;
     /// Whether the message says, times aside, what the last accepted one of its category and type said.
     [[nodiscard]] bool messageIsRedundant(const ZRReportingSessionMessage& message) const;

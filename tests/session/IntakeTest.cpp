@@ -62,7 +62,7 @@ TEST_F(IntakeTest, ATagReplacesTheClientsHoweverManyThereAre) {
         for (AudioEventCategory kind = 0; kind < 2000; ++kind) {
             const auto message =
                 messageOf({{"audiotag", "mine"}}, AudioEventSubsystemHAL | kind, AudioEventTypeState);
-            ZRReportingSession::addAudioMessageTag(*message);
+            ZRReportingSession::addAudioMessageTag(*message, device.context().shared<intake::AudioTags>());
             ASSERT_EQ(message->payload().find("audiotag")->stringValue(),
                       ZRReportingUtilityCategoryString(message->category()) + "State");
         }
