@@ -45,9 +45,13 @@ const Dictionary& defaults() {
     return values;
 }
 
-/// The only workers that get the summaries.
-DestinationWorkers destinations() {
+/// The only workers that are offered the summaries, but on internal builds, where all are. Every worker still
+/// meets them among the session's messages: their values are in the call-quality summary on all builds.
+DestinationWorkers destinations(bool isInternalBuild) {
     DestinationWorkers workers;
+    if (isInternalBuild) {
+        return workers;
+    }
     for (const std::string_view name :
          {"ZRReportingSessionEventryWorker", "ZRReportingSessionSummaryJsonFileWorker"}) {
         if (const WorkerClass* workerClass = workerClassNamed(name)) {
@@ -75,8 +79,11 @@ bool watchedFieldChangeInMessage(const Fields& message, const Fields& previous) 
 /// One walk over a session's messages.
 class KaleenWalk {
 public:
-    KaleenWalk(Dictionary previousValues, Seconds minimum)
-        : previousValues_(std::move(previousValues)), minimum_(minimum), state_(previousValues_, places_) {
+    KaleenWalk(Dictionary previousValues, Seconds minimum, DestinationWorkers destinations)
+        : previousValues_(std::move(previousValues)),
+          minimum_(minimum),
+          destinations_(std::move(destinations)),
+          state_(previousValues_, places_) {
         isPlaying_ = state_.isTrue(Field::running);
         isInGroup_ = isInGroup(state_);
         if (isPlaying_ && isInGroup_) {
@@ -119,10 +126,7 @@ private:
         const Seconds playingTime = start_.until(timestamp);
         derived_.logLength(start_, timestamp);
         if (playingTime > minimum_ && isInGroup(state_)) {
-            ZRReportingSessionMessage& message = derived_.add(summary(playingTime), AudioEventKindKaleen);
-            if (!ZRReportingUtilityIsInternalBuild()) {
-                message.setDestinationWorkers(destinations());
-            }
+            derived_.add(summary(playingTime), AudioEventKindKaleen).setDestinationWorkers(destinations_);
         } else {
             derived_.skip();
         }
@@ -146,6 +150,7 @@ private:
 
     const Dictionary previousValues_;
     const Seconds minimum_;
+    const DestinationWorkers destinations_;
     KeyPlaces places_{kKeys};
     /// The latest value of each key, up to the message before the one at hand.
     Fields state_;
@@ -166,7 +171,9 @@ void ZRReportingSessionKaleenMessagesWorker::stop() {
 std::vector<MessageRef>
 ZRReportingSessionKaleenMessagesWorker::createKaleenMessages(const std::vector<MessageRef>& messages,
                                                              Seconds minimumPlaytime) const {
-    return derivedBy(KaleenWalk(previousValuesOf(session()), minimumPlaytime), messages);
+    return derivedBy(
+        KaleenWalk(previousValuesOf(session()), minimumPlaytime, destinations(context().isInternalBuild())),
+        messages);
 }
 
 } // namespace tamblo
