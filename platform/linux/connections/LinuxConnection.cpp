@@ -102,7 +102,7 @@ void LinuxConnection::takeFrames(std::span<const std::uint8_t> received) {
     wire::FrameSplitter frames(received);
     std::size_t requests = 0;
     for (auto item = frames.next(); item && ending_ == Ending::none; item = frames.next()) {
-        carryOut(*item);
+        decodeAndDispatch(*item);
         ++requests;
     }
     if (ending_ == Ending::none && frames.tooLong()) {
@@ -134,7 +134,7 @@ void LinuxConnection::keepRest(std::span<const std::uint8_t> rest, std::size_t w
     unfinishedWants_ = wanted;
 }
 
-void LinuxConnection::carryOut(std::span<const std::uint8_t> item) {
+void LinuxConnection::decodeAndDispatch(std::span<const std::uint8_t> item) {
     if (const auto refusal = shared_.intake.decode(item)) {
         refuse(*refusal);
     } else {

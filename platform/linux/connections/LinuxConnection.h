@@ -27,7 +27,7 @@ namespace tamblo {
 /// Reading a connection rests while more than this of it waits to be carried out: a fast client is slowed.
 inline constexpr std::size_t kMaximumWaitingRequests = 1024;
 inline constexpr std::size_t kMaximumWaitingBytes = 4 * 1024 * 1024;
-/// A client that does not read is closed once this many bytes of replies wait for it.
+/// A client is closed once this many bytes of replies wait for their sinks, or for it to read them.
 inline constexpr std::size_t kMaximumWaitingReplies = 4 * 1024 * 1024;
 
 /// One client's socket: splits what arrives into frames, decodes each into a call of the exported object, and
@@ -42,9 +42,9 @@ inline constexpr std::size_t kMaximumWaitingReplies = 4 * 1024 * 1024;
 /// then sent as far as the socket takes it; the loop tells when it takes more. Sending never waits.
 ///
 /// A client can be faster than the service in two ways. Of one that sends too fast, no more is read until
-/// what waits has been carried out, so the kernel holds it back. Of one that does not read its replies nobody
-/// else can be held back: its connection ends. It ends, too, when the peer hangs up or breaks the protocol,
-/// and when the kernel refuses to watch the socket, as it would never be read.
+/// what waits has been carried out, so the kernel holds it back. One whose replies grow beyond their limit,
+/// in one batch or because it does not read them, cannot be held back: its connection ends. It ends, too,
+/// when the peer hangs up or breaks the protocol, and when the kernel refuses to watch the socket.
 ///
 /// An end takes its turn: what was read before is carried out and answered first. Then the handlers are
 /// called and the object is let go, last the socket: a client that sees the end of its connection is one that
@@ -102,7 +102,7 @@ private:
     [[nodiscard]] Ending receive(int socket, std::span<const std::uint8_t>& received);
     void takeFrames(std::span<const std::uint8_t> received) TAMBLO_EXCLUDES(mutex_);
     void keepRest(std::span<const std::uint8_t> rest, std::size_t wanted);
-    void carryOut(std::span<const std::uint8_t> item) TAMBLO_EXCLUDES(mutex_);
+    void decodeAndDispatch(std::span<const std::uint8_t> item) TAMBLO_EXCLUDES(mutex_);
     void refuse(const wire::Refusal& refusal) TAMBLO_EXCLUDES(mutex_);
     void carriedOut(std::size_t requests, std::size_t bytes) TAMBLO_EXCLUDES(mutex_);
     void beginEnd(Ending ending) TAMBLO_EXCLUDES(mutex_);
