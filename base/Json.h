@@ -38,6 +38,7 @@ struct JsonError {
     std::string message;
 };
 
+/// How strictly a JSON text is read.
 struct JsonReadOptions {
     /// A `null` has no place among property-list values: members and elements that are null are left out, or,
     /// when refused, make the text an error.

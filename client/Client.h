@@ -75,7 +75,7 @@ public:
     Client(const Client&) = delete;
     Client& operator=(const Client&) = delete;
 
-    /// The eleven requests. Each answers whether it was queued. An empty callback (`nullptr`) asks the
+    /// The requests. Each answers whether it was queued. An empty callback (`nullptr`) asks the
     /// service for no reply. A start is answered when the session stops, or never.
     bool createReportingSession(std::int64_t reporterID, Callback<bool> callback);
     bool setServiceType(ServiceType type, std::int64_t reporterID, Callback<bool> callback);

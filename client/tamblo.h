@@ -12,6 +12,10 @@
  * copied. Callbacks run on the library's thread (TAMBLO_BACKGROUND) or inside tamblo_client_run
  * (TAMBLO_CALLER), get what they point to for the time of the call, may send, and must not run or destroy the
  * client. A null callback asks for no reply.
+ *
+ * With TAMBLO_BACKGROUND any thread may call the functions of a client, but for tamblo_client_destroy, after
+ * which none may; with TAMBLO_CALLER one thread does. A payload is used by one thread at a time. The requests
+ * reporterID, getAllReporters and killService are in C++ only.
  */
 
 #ifdef __cplusplus

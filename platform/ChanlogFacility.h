@@ -18,6 +18,7 @@ enum class ChanlogFormat : std::uint8_t {
     simpleArray = 4
 };
 
+/// One state of a state channel.
 struct ChanlogState {
     std::string name;
     std::uint64_t transitions = 0; ///< into the state
@@ -25,6 +26,7 @@ struct ChanlogState {
     double dutyCycle = 0;          ///< share of the residency of all states, 0 to 1; of a difference alone
 };
 
+/// One bucket of a histogram: how many values lay within its bounds.
 struct ChanlogBucket {
     std::int64_t lower = 0;
     std::int64_t upper = 0;

@@ -26,8 +26,8 @@ using ReporterIDsReply = UniqueFunction<void(const ReplyError*, const std::vecto
 
 using ReporterID = std::int64_t;
 
-/// The eleven requests of a client, as the object that a connection exports answers them. Called on the
-/// connection's thread; no operation blocks.
+/// The requests of a client, as the object that a connection exports answers them. Called on the connection's
+/// thread; no operation blocks.
 class ZRReportingServiceProtocol {
 public:
     virtual ~ZRReportingServiceProtocol() = default;

@@ -11,7 +11,7 @@ namespace tamblo {
 /// comes first.
 ///
 /// A client may leave ten thousand sessions behind. To stop them all in one piece of work would take a second
-/// or more in which no other client is answered, so a piece stops a few. Whoever owns this, the service,
+/// or more in which no other client is answered, so a piece stops a few. The service, whose member this is,
 /// queues one further piece at a time for as long as there is something left, however many clients leave
 /// together. On the reporting server queue. What is left at the end of its life is dropped unstopped.
 class LeavingClients {

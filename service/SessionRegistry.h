@@ -15,8 +15,8 @@
 namespace tamblo {
 
 /// The sessions of all clients by reporter ID, and the started ones among them in client order: what walks
-/// over the clients would find, at a cost that does not grow with their number. On the reporting server
-/// queue.
+/// over the clients would find, at a cost that does not grow with their number. A member of the service, on
+/// the reporting server queue.
 class SessionRegistry {
 public:
     struct Entry {

@@ -18,11 +18,12 @@
 
 namespace tamblo {
 
-/// One client: answers its requests and owns its sessions, by reporter ID.
+/// One client: the service's answers to its requests, one object for each connection; owns the client's
+/// sessions, by reporter ID.
 ///
-/// Held by its connection, by the service while it is among the service's clients, and by its queued
-/// requests. The requests come on the connection's thread, which only queues them; everything else happens on
-/// the reporting server queue, and so do all fields but the process identifier.
+/// Held by its connection, by the service among its clients or among those that leave (`LeavingClients`), and
+/// by its queued requests. The requests come on the connection's thread, which only queues them; everything
+/// else happens on the reporting server queue, and so do all fields but the process identifier.
 class ZRReportingClientServerInstance final
     : public ZRReportingServiceProtocol,
       public std::enable_shared_from_this<ZRReportingClientServerInstance> {

@@ -20,9 +20,10 @@ namespace tamblo {
 /// The one service: accepts every client, keeps them in order of acceptance, finds sessions across them, and
 /// owns the single-message session.
 ///
-/// Made by the entry point after the platform is installed, and made the delegate of the listener. Acceptance
-/// and the connections' handlers come on other threads and only queue work; everything else happens on the
-/// reporting server queue. Destroy it only when that queue is at rest.
+/// Made by the entry point after the context, and made the delegate of the listener. Acceptance and the
+/// connections' handlers come on other threads and only queue work; everything else happens on the reporting
+/// server queue. Destroy it only when that queue is at rest. The clients' requests are not here: they are
+/// operations of `ZRReportingClientServerInstance`, one for each connection.
 class ZRReportingService final : public ListenerDelegate, public ZRReportingServiceDelegateProtocol {
 public:
     using ExitProcess = void (*)(int status);
@@ -40,7 +41,8 @@ public:
     /// the reporting server queue. Any thread, once.
     void shutDown(UniqueFunction<void()> completed);
 
-    /// While it is off, lookups find nothing and messages are refused. No request changes it. Any thread.
+    /// While it is off, lookups find nothing and messages are refused. Nothing turns it off: no request, and
+    /// not the preference `disable_reporting`. Any thread.
     void setReportingEnabled(bool enabled) noexcept { reportingEnabled_ = enabled; }
     /// Null when there is none now.
     [[nodiscard]] SessionRef singleMessageSession() const { return singleMessages_->singleMessageSession(); }

@@ -44,7 +44,8 @@ initWithSession(Context& context, const std::shared_ptr<ZRReportingSession>& ses
 /// The class of that name, or null.
 [[nodiscard]] const WorkerClass* workerClassNamed(std::string_view name) noexcept;
 
-/// The classes that sessions make workers of, sorted out once for the process.
+/// The classes that sessions make workers of: sorted out with the first call, and there as long as the
+/// process. Any thread.
 struct WorkerClassLists {
     std::vector<const WorkerClass*> valid;
     std::vector<const WorkerClass*> startOnInit;

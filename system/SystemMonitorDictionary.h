@@ -62,6 +62,7 @@ public:
     /// From the next store under the key on, each calls the observer; the current state is not told. The
     /// observer must outlive the observation.
     [[nodiscard]] Observation addKeyObserver(KeyObserver& observer, std::string_view key);
+    /// Of all keys; for tests, which look for one that was left behind.
     [[nodiscard]] std::size_t observationCount() const;
 
 private:

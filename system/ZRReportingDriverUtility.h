@@ -44,7 +44,7 @@ inline void appendText(std::string& out, const ZRReportingDriver& driver) {
     out += driver.description();
 }
 
-/// The subscription to one driver's channels. Owned by the driver utility, for the life of the process.
+/// The subscription to one driver's channels. Owned by the driver utility, as long as that lives.
 class ZRReportingIOChannelSubscription {
 public:
     explicit ZRReportingIOChannelSubscription(ZRReportingDriver driver) : driver_(std::move(driver)) {}
@@ -86,6 +86,7 @@ public:
     ZRReportingDriverUtility(const ZRReportingDriverUtility&) = delete;
     ZRReportingDriverUtility& operator=(const ZRReportingDriverUtility&) = delete;
 
+    /// Nothing here asks for them yet.
     [[nodiscard]] const std::vector<ZRReportingIOChannelSubscription>&
     ioChannelSubscriptions() const noexcept {
         return ioChannelSubscriptions_;

@@ -59,7 +59,7 @@ private:
     std::vector<std::pair<std::type_index, std::shared_ptr<void>>> shared_ TAMBLO_GUARDED_BY(mutex_);
 };
 
-/// The same of the context of the process.
+/// The same of the context of the process. Nothing here calls them yet.
 [[nodiscard]] inline SerialQueue& ZRReportingUtilityGetReportingServerQueue() noexcept {
     return Context::current().serverQueue();
 }

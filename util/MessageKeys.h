@@ -32,7 +32,7 @@ inline constexpr std::string_view kVocoderKey = "vp_config_primary_vocoder";
 inline constexpr std::string_view kVocoderRateKey = "vp_config_primary_vocoderFs";
 inline constexpr std::string_view kIssueTypeKey = "issue_type";
 
-/// Published with the others; a payload that carries them is treated like any other.
+/// Published with the others, and read by nothing here: a payload that carries them is like any other.
 inline constexpr std::string_view ZRReportingSessionBlacklistFieldsKey = "_comparison_field_blacklist";
 inline constexpr std::string_view ZRReportingSessionThrottleSecondsKey = "_throttle_seconds";
 

@@ -8,6 +8,9 @@
 
 namespace tamblo {
 
+// Small functions of the vocabulary. Nothing here calls those named `ZRReportingUtility…` yet: they are for
+// workers to come. Any thread.
+
 /// Whether both values are there and differ.
 [[nodiscard]] inline bool isPresentAndHasChanged(const Value* before, const Value* after) noexcept {
     return before != nullptr && after != nullptr && !(*before == *after);
@@ -20,7 +23,8 @@ namespace tamblo {
 /// To the nearest whole number, as payloads carry uptimes; kept within the range.
 [[nodiscard]] int roundedTo32Bits(double number) noexcept;
 /// The dictionary with the time of day, the system's uptime and the process's processor time set to now. What
-/// is stored as "processuptime_ms" is consumed processor time, whatever the name says.
+/// is stored as "processuptime_ms" is consumed processor time, whatever the name says. Asks the context of
+/// the process, which has to be there.
 [[nodiscard]] Dictionary ZRReportingUtilityAddDates(const Dictionary& message);
 
 [[nodiscard]] constexpr bool ZRReportingUtilityShouldSendMessage() noexcept {

@@ -10,8 +10,7 @@
 
 /// The words of the client protocol, each said once for both ends: the requests, and the categories, types
 /// and service types that they carry. The service's decoder, the client's encoder and `tambloctl decode`
-/// follow the rows below; a new request is a row here, an operation of `ZRReportingServiceProtocol` and one
-/// of `Client`.
+/// follow the rows below. What a new request takes besides its row is in `docs/adding-a-request.md`.
 namespace tamblo::wire {
 
 /// A parameter: what it means and, with that, how it travels.
@@ -61,6 +60,7 @@ enum class Method : std::uint8_t {
     killService,
 };
 
+/// A request: what it is called, what it takes, and what answers it.
 struct MethodRow {
     std::string_view name;
     ResultKind result;

@@ -18,7 +18,7 @@ namespace tamblo {
 ///     "3f1c…": {"first_seen": "2026-03-01", "last_seen": "2026-11-21", "last_reported": 1795266549.1}
 ///
 /// Days are of UTC. The dictionary lies where anybody who runs the device may edit it: an entry of another
-/// shape counts as none.
+/// shape counts as none. Any thread: it is a function of what it is given.
 struct AccessoryRegistry {
     /// An accessory is reported again after this time at the earliest.
     static constexpr std::chrono::hours kReportInterval{24};

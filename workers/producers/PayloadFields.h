@@ -11,7 +11,8 @@
 namespace tamblo {
 
 /// What one payload holds under the keys of a walk: one value for each `Field`, an enumeration from 0 that
-/// ends with `count`, and null for an absent one. The values are the payload's own.
+/// ends with `count`, and null for an absent one. The values are the payload's own, so it is used where the
+/// payload is: on the reporting server queue.
 template <typename Field> class PayloadFields {
 public:
     static constexpr std::size_t kCount = static_cast<std::size_t>(Field::count);

@@ -17,7 +17,7 @@
 /// What the producers of volume, group-session and input summaries have in common. Each walks a session's
 /// messages at its stop, keeps the latest value of every key it knows (the running state), cuts the time into
 /// segments wherever something that it watches changes, and derives one message from each segment that is
-/// long enough.
+/// long enough. On the reporting server queue.
 namespace tamblo {
 
 using Seconds = std::chrono::duration<double>;

@@ -34,7 +34,7 @@ struct RecordedSamples {
     std::shared_ptr<const void> hold; ///< goes with these: so many may be held at a time
 };
 
-/// The samples of one session's processes while it is traced. The sampler fills it on its thread, tick by
+/// The samples of one session's processes while it is traced. The sampler fills it on its queue, tick by
 /// tick; whoever traces the session takes what there is at the end. Nothing here waits for anything but the
 /// few instructions that the other thread holds the lock for.
 ///

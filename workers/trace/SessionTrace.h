@@ -15,7 +15,8 @@
 
 namespace tamblo {
 
-/// What one session's performance file is made of.
+/// What one session's performance file is made of: filled on the reporting server queue, then handed to the
+/// queue that writes the file.
 struct SessionTrace {
     /// Stretches and issues in one file, some megabyte of it: a client may send as many as it likes.
     static constexpr std::size_t kMostMarks = 10'000;

@@ -31,8 +31,9 @@ public:
 /// 1. sources that come first. They steer the service (preferences, notifications), so that a preference
 ///    written before a message was sent is in force for that message;
 /// 2. the other sources: connections read and decode, and what they post to the queues is collected;
-/// 3. the quick part of what was collected runs, here: one frame costs one wake-up, not two, and what one
-///    wake-up has read shares one write of the sinks and one send of the replies;
+/// 3. the quick part of what was collected runs, here, or within step 2 as soon as 256 requests are there:
+///    one frame costs one wake-up, not two, and a batch shares one write of the sinks and one send of the
+///    replies;
 /// 4. tasks: what other threads, or the sources themselves, want done once no source of this wake-up is
 ///    looked at any more, such as the end of a connection;
 /// 5. the delayed task, if its time has come.

@@ -19,7 +19,7 @@ namespace tamblo {
 
 /// What the bug-capture worker counts for one detector, and the thresholds at which the detector fires.
 ///
-/// A detector's own, or shared by the detectors of a class in all sessions, for the life of the process.
+/// A detector's own, or shared by the detectors of a class in all sessions, for the life of the context.
 /// Used on the thread that does the sessions' work, but for the identifier of the capture session: the
 /// capture service answers on any thread.
 class WorkerInstanceState {
