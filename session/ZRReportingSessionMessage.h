@@ -40,7 +40,7 @@ public:
     /// Changes the payload in place; `edit` is given the dictionary.
     template <typename Edit> void editPayload(Edit&& edit) { edit(message_); }
 
-    /// The only consumer workers that are to see the message; empty for all of them.
+    /// The only consumer workers that are to see the message; empty for all of them. Nothing here asks yet.
     [[nodiscard]] DestinationWorkers destinationWorkers() const;
     void setDestinationWorkers(DestinationWorkers workers);
     /// Whether a consumer worker of this class is to see it.

@@ -46,7 +46,6 @@ private:
     std::vector<AppendOnlyFile*> files_ TAMBLO_GUARDED_BY(mutex_);
 };
 
-/// When a sink's lines are written, and its file begun anew; tests have smaller ones.
 struct SinkFileLimits {
     /// A line that would make the file larger begins a new file.
     std::uint64_t fileSize = 64U << 20U;
