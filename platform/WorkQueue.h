@@ -39,7 +39,6 @@ public:
     /// resumes it, so that nothing is stranded.
     virtual void suspend() = 0;
     virtual void resume() = 0;
-    [[nodiscard]] virtual std::string_view label() const noexcept = 0;
 };
 
 /// One call that is to come. Destroying it calls it off; a call that has begun is not waited for.
@@ -52,6 +51,7 @@ public:
 class WorkQueues {
 public:
     virtual ~WorkQueues() = default;
+    /// The label says what the queue is for, to whoever lists the queues.
     [[nodiscard]] virtual std::unique_ptr<SerialQueue> makeSerialQueue(std::string_view label) = 0;
     /// Makes the call once, after the delay, on some thread; it must not block.
     [[nodiscard]] virtual std::unique_ptr<DelayedCall> callAfter(std::chrono::milliseconds delay,

@@ -58,12 +58,8 @@ public:
                                                            std::string_view domain) const override {
         return lookUp(values_, std::pair(std::string(domain), std::string(key)));
     }
-    void setPreferenceValue(std::string_view key, std::string_view domain, const Value& value,
-                            Work afterwards) override {
+    void setPreferenceValue(std::string_view key, std::string_view domain, const Value& value) override {
         set(std::string(key), std::string(domain), value);
-        if (afterwards) {
-            afterwards();
-        }
     }
     void set(const std::string& key, const std::string& domain, Value value) {
         values_[{domain, key}] = std::move(value);

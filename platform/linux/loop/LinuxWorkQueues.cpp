@@ -18,8 +18,7 @@ constexpr int kSlowBatchFactor = 4;
 class LinuxSerialQueue final : public SerialQueue {
 public:
     /// The threads must outlive the queue's work.
-    LinuxSerialQueue(LinuxWorkQueues& threads, std::string_view label)
-        : label_(label), strand_(std::make_shared<Strand>(threads)) {}
+    explicit LinuxSerialQueue(LinuxWorkQueues& threads) : strand_(std::make_shared<Strand>(threads)) {}
     ~LinuxSerialQueue() override { strand_->resume(); }
     LinuxSerialQueue(const LinuxSerialQueue&) = delete;
     LinuxSerialQueue& operator=(const LinuxSerialQueue&) = delete;
@@ -29,10 +28,8 @@ public:
     void setMayBlock(bool mayBlock) override { strand_->setMayBlock(mayBlock); }
     void suspend() override { strand_->suspend(); }
     void resume() override { strand_->resume(); }
-    [[nodiscard]] std::string_view label() const noexcept override { return label_; }
 
 private:
-    const std::string label_;
     const std::shared_ptr<Strand> strand_;
 };
 
@@ -51,8 +48,8 @@ private:
 
 } // namespace
 
-std::unique_ptr<SerialQueue> LinuxWorkQueues::makeSerialQueue(std::string_view label) {
-    return std::make_unique<LinuxSerialQueue>(*this, label);
+std::unique_ptr<SerialQueue> LinuxWorkQueues::makeSerialQueue(std::string_view) {
+    return std::make_unique<LinuxSerialQueue>(*this);
 }
 
 std::unique_ptr<DelayedCall> LinuxWorkQueues::callAfter(std::chrono::milliseconds delay,

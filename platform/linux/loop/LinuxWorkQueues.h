@@ -19,10 +19,10 @@ namespace tamblo {
 // that is drained by one thread at a time. Whoever posts to a strand that nobody drains sees to it that
 // somebody does; from then on it is that thread's until it is found empty, or suspended.
 //
-// Which thread that is. Waking another thread costs more than a message does, so the event loop's thread runs
-// the quick work that it posts itself. It does not run it at once: during a wake-up the strands are
-// collected, and drained together at its end, so that one write of the sinks and one send of the replies
-// serve all that was read. Everything else runs on the pool.
+// Which thread that is. Waking another thread costs more than a message does, so the event loop's thread
+// runs the quick work that it posts itself. It does not run it at once: during a wake-up the strands are
+// collected, and drained together at its end or as soon as 256 requests are there, so that one write of the
+// sinks and one send of the replies serve all that was read. Everything else runs on the pool.
 //
 // Who may block. Nobody on the event loop's thread. A piece that may block goes to the pool, and takes what
 // stands behind it along, as the order is kept. Quick work that turns out slow (a disk that stalls) sends its
