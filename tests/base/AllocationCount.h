@@ -9,10 +9,8 @@ struct AllocationCount {
     std::size_t blocks = 0;
     std::size_t bytes = 0;
 };
-/// Of the thread, since it began.
 inline thread_local AllocationCount allocationCount;
 
-/// The allocations of the calling thread while `run` runs.
 template <typename Run> AllocationCount allocationsOf(const Run& run) {
     const AllocationCount before = allocationCount;
     run();

@@ -7,8 +7,7 @@
 
 #include <algorithm>
 #include <iterator>
-#include <map>
-#include <ranges>
+#include <set>
 #include <sstream>
 #include <string>
 #include <variant>
@@ -32,13 +31,9 @@ Outcome read(std::span<const std::uint8_t> bytes, KeySetCache* known = nullptr) 
         EXPECT_EQ(cached.readValue(), value);
         EXPECT_EQ(cached.error(), plain.error());
     }
+    EXPECT_TRUE(value ? plain.atEnd() : plain.peek() == CborReader::Type::end);
     EXPECT_EQ(value.has_value(), plain.error() == CborError::none);
-    if (!value) {
-        EXPECT_EQ(plain.peek(), CborReader::Type::end);
-        return plain.error();
-    }
-    EXPECT_TRUE(plain.atEnd());
-    return *value;
+    return value ? Outcome(*value) : plain.error();
 }
 
 Bytes written(const Value& value) {
@@ -71,12 +66,11 @@ Value valueNamed(const std::string& text) {
     case 'h':
         return Value::data(fromHex(std::string_view(text).substr(0, text.size() - 1)));
     default:
-        const auto outcome = readJson(text);
-        return std::holds_alternative<Value>(outcome) ? std::get<Value>(outcome) : Value("not JSON: " + text);
+        return std::get<Value>(readJson(text));
     }
 }
 
-TEST(Cbor, ReadsTheExamplesOfTheStandard) {
+TEST(Cbor, ReadsTheExamplesOfTheStandardAndFindsTheirTruncationAtEveryByte) {
     // RFC 8949, appendix A, and some more, without what an independent implementation writes in the same way:
     // bytes and their value.
     constexpr std::string_view table = R"(
@@ -89,7 +83,8 @@ TEST(Cbor, ReadsTheExamplesOfTheStandard) {
         9fff []  9f018202039f0405ffff [1,[2,3],[4,5]]  83019f0203ff820405 [1,[2,3],[4,5]]
         bf61610161629f0203ffff {"a":1,"b":[2,3]}  826161bf61626163ff ["a",{"b":"c"}]
         bf6346756ef563416d7421ff {"Fun":true,"Amt":-2}  bf7f616161626163ff01ff {"abc":1}
-        1800 0  190000 0  1a00000000 0  3800 -1  1b0000000000000001 1)";
+        1800 0  190000 0  1a00000000 0  3800 -1  1b0000000000000001 1  5900020102 0102h
+        5a000000020102 0102h  7b000000000000000178 "x"  bf7f616162c3a9ff9ff5a1616280ffff {"aé":[true,{"b":[]}]})";
     const auto words = wordsOf(table);
     for (std::size_t i = 0; i + 1 < words.size(); i += 2) {
         SCOPED_TRACE(words[i]);
@@ -100,10 +95,15 @@ TEST(Cbor, ReadsTheExamplesOfTheStandard) {
             ASSERT_EQ(outcome, Outcome(expected));
             EXPECT_EQ(std::get<Value>(outcome).kind(), expected.kind());
         }
+        for (std::size_t length = 0; length < bytes.size(); ++length) {
+            // A copy of its own length, so that a memory checker sees a step beyond it.
+            const Bytes part(bytes.begin(), bytes.begin() + static_cast<std::ptrdiff_t>(length));
+            EXPECT_EQ(read(part), Outcome(CborError::truncated)) << length;
+            EXPECT_FALSE(skips(part)) << length;
+        }
     }
-    EXPECT_EQ(written(Value(0.1F)), fromHex("fa3dcccccd"));
-    EXPECT_EQ(written(Value(1.0)), fromHex("fb3ff0000000000000"));
-    EXPECT_EQ(written(Value(Dictionary{{"b", 24}, {"a", -257}})), fromHex("a261613901006162 1818"));
+    EXPECT_EQ(written(Array{0.1F, 1.0, Dictionary{{"b", 24}, {"a", -257}}}),
+              fromHex("83 fa3dcccccd fb3ff0000000000000 a2 6161 390100 6162 1818"));
 }
 
 TEST(Cbor, RefusesWhatIsNoValueAndSkipsWhatIsWellFormed) {
@@ -133,42 +133,18 @@ TEST(Cbor, RefusesWhatIsNoValueAndSkipsWhatIsWellFormed) {
     }
 }
 
-TEST(Cbor, FindsTheTruncationAtEveryByte) {
-    const Dictionary everything{{"array", Array{1, -300, 70000, Array{}, "text"}},
-                                {"data", Value::data(Bytes(30, 7))},
-                                {"date", Value::date(1.25)},
-                                {"double", 0.1},
-                                {"large", 18446744073709551615U},
-                                {"map", Dictionary{{"inner", true}, {"single", 0.5F}}},
-                                {"text", std::string(300, 'x')}};
-    const Bytes indefinite =
-        fromHex("bf61617f616162c3a9ff61625f42010243030405ff61639fc101bf6161f97e00ffffff");
-    for (const Bytes& bytes : {written(everything), indefinite}) {
-        EXPECT_TRUE(std::holds_alternative<Value>(read(bytes)));
-        for (std::size_t length = 0; length < bytes.size(); ++length) {
-            // A copy of its own length, so that a memory checker sees a step beyond it.
-            const Bytes part(bytes.begin(), bytes.begin() + static_cast<std::ptrdiff_t>(length));
-            EXPECT_EQ(read(part), Outcome(CborError::truncated)) << length;
-            EXPECT_FALSE(skips(part)) << length;
-        }
-    }
-}
-
 TEST(Cbor, AllocatesNothingFromADeclaredCount) {
-    for (const std::string& head : wordsOf("9b1000000000000000 bb1000000000000000 5b1000000000000000 "
-                                           "7b1000000000000000 9a40000000 ba40000000 5a40000000 7a40000000 "
-                                           "9bffffffffffffffff bbffffffffffffffff bb8000000000000000 "
-                                           "7bffffffffffffffff")) {
-        for (const char* rest : {"", "616101", "0000"}) {
-            const Bytes bytes = fromHex(head + rest);
-            KeySetCache cache;
-            const auto spent = test::allocationsOf([&] {
-                CborReader reader(bytes, &cache);
-                EXPECT_EQ(reader.readValue(), std::nullopt);
-                EXPECT_NE(reader.error(), CborError::none);
-            });
-            EXPECT_LT(spent.bytes, 20'000U) << head << rest;
-            EXPECT_FALSE(skips(bytes)) << head << rest;
+    KeySetCache cache;
+    for (const char* major : {"5", "7", "9", "b"}) {
+        for (const char* count :
+             {"a40000000", "b1000000000000000", "b8000000000000000", "bffffffffffffffff"}) {
+            for (const char* rest : {"", "616101", "0000"}) {
+                const Bytes bytes = fromHex(std::string(major) + count + rest);
+                const auto spent = test::allocationsOf(
+                    [&] { EXPECT_EQ(CborReader(bytes, &cache).readValue(), std::nullopt); });
+                EXPECT_LT(spent.bytes, 20'000U) << major << count << rest;
+                EXPECT_FALSE(skips(bytes)) << major << count << rest;
+            }
         }
     }
 }
@@ -182,26 +158,12 @@ TEST(Cbor, NestsToItsDepth) {
         };
         EXPECT_TRUE(std::holds_alternative<Value>(read(nested(most)))) << open;
         EXPECT_EQ(read(nested(most + 1)), Outcome(CborError::tooDeep)) << open;
-        EXPECT_FALSE(std::holds_alternative<Value>(read(nested(200'000)))) << open;
-        CborReader(nested(200'000)).skip();
+        EXPECT_EQ(read(nested(200'000)), Outcome(CborError::tooDeep)) << open;
+        EXPECT_TRUE(skips(nested(200'000))) << open;
     }
-    EXPECT_FALSE(std::holds_alternative<Value>(read(fromHex(repeated("c1", 200'000) + "01"))));
-    CborReader(fromHex(repeated("c1", 200'000) + "01")).skip();
-}
-
-TEST(Cbor, AgreesWithAnIndependentImplementation) {
-    test::RandomValues random(7);
-    for (int i = 0; i < 3000; ++i) {
-        const Value value = random.value(4, false);
-        const Bytes bytes = written(value);
-        EXPECT_EQ(nlohmann::json::from_cbor(bytes), test::toNlohmann(value));
-        EXPECT_EQ(read(bytes), Outcome(value));
-
-        const nlohmann::json theirs = test::toNlohmann(random.value(4, false));
-        const Outcome ours = read(nlohmann::json::to_cbor(theirs));
-        ASSERT_TRUE(std::holds_alternative<Value>(ours)) << theirs;
-        EXPECT_EQ(test::toNlohmann(std::get<Value>(ours)), theirs);
-    }
+    const Bytes tags = fromHex(repeated("c1", 200'000) + "01");
+    EXPECT_EQ(read(tags), Outcome(CborError::unsupportedTag));
+    EXPECT_TRUE(skips(tags));
 }
 
 TEST(KeySetCache, MakesNoDifferenceButSharesKeySets) {
@@ -211,27 +173,17 @@ TEST(KeySetCache, MakesNoDifferenceButSharesKeySets) {
     // twice; many keys fill the memory.
     for (int i = 0; i < 6000; ++i) {
         const std::size_t entries = random.below(6);
-        const bool isIndefinite = random.below(4) == 0;
-        Bytes bytes{static_cast<std::uint8_t>(isIndefinite ? 0xBF : 0xA0 + entries)};
-        std::map<std::string, Value> expected;
+        Bytes bytes{static_cast<std::uint8_t>(0xA0 + entries)};
+        std::set<std::string> keys;
         for (std::size_t entry = 0; entry < entries; ++entry) {
             const std::string key = random.below(8) == 0 ? "key" + std::to_string(random.below(1500))
                                                          : std::string(1, "abcdefgh"[random.below(8)]);
-            const Value value = random.value(1, false);
             std::ranges::copy(written(Value(key)), std::back_inserter(bytes));
-            std::ranges::copy(written(value), std::back_inserter(bytes));
-            expected.emplace(key, value);
+            std::ranges::copy(written(random.value(1)), std::back_inserter(bytes));
+            keys.insert(key);
         }
-        bytes.insert(bytes.end(), isIndefinite ? 1 : 0, 0xFF);
-        const Outcome outcome = read(bytes, &cache);
-        if (expected.size() < entries) {
-            ASSERT_EQ(outcome, Outcome(CborError::duplicateKey));
-            continue;
-        }
-        const Dictionary& found = std::get<Value>(outcome).dictionaryValue();
-        ASSERT_TRUE(std::ranges::equal(
-            expected, std::views::iota(std::size_t{0}, found.size()),
-            [&](auto& e, auto at) { return e.first == found.keyAt(at) && e.second == found.valueAt(at); }));
+        const bool namesAKeyTwice = keys.size() < entries;
+        ASSERT_EQ(read(bytes, &cache) == Outcome(CborError::duplicateKey), namesAKeyTwice);
     }
     const Bytes one = fromHex("a3616101616202616303");
     const Bytes other = fromHex("a3616105616206616307");
@@ -243,18 +195,14 @@ TEST(RecentTexts, AreSharedAndNeverTakenForOthers) {
     KeySetCache cache;
     const auto read = [&cache](const Bytes& bytes) { return CborReader(bytes, &cache).readValue(); };
     // Some take each other's places, some differ in the middle only, some are too short or too long.
-    for (int round = 0; round < 3; ++round) {
-        for (int i = 0; i < 2000; ++i) {
-            const std::string number = std::to_string(i);
-            for (const std::string& text : {"a text with " + number, "equal ends " + number + " equal ends",
-                                            std::string(i % 120, 'x')}) {
-                const Bytes bytes = written(Value(text));
-                ASSERT_EQ(read(bytes), Value(text));
-                std::optional<Value> again;
-                EXPECT_EQ(test::allocationsOf([&] { again = read(bytes); }).blocks,
-                          text.size() > 96 ? 1U : 0U);
-                ASSERT_EQ(again, Value(text));
-            }
+    for (int i = 0; i < 6000; ++i) {
+        const std::string number = std::to_string(i % 2000);
+        for (const std::string& text :
+             {"a text with " + number, "equal ends " + number + " equal ends", std::string(i % 120, 'x')}) {
+            const Bytes bytes = written(Value(text));
+            ASSERT_EQ(read(bytes), Value(text));
+            const auto spent = test::allocationsOf([&] { ASSERT_EQ(read(bytes)->stringValue(), text); });
+            ASSERT_EQ(spent.blocks, text.size() > 96 ? 1U : 0U);
         }
     }
     Bytes broken = written(Value("a text that is not UTF-8"));

@@ -29,20 +29,13 @@ TEST(Format, PutsArgumentsInTheirPlaces) {
     EXPECT_EQ(formatted("{}", std::numeric_limits<double>::max()).size(), 309U + 7U);
 }
 
-TEST(TextBuffer, GrowsAndGivesBack) {
+TEST(TextBuffer, GivesBackAtBothEnds) {
     TextBuffer buffer;
-    std::string expected;
-    for (int i = 0; i < 300; ++i) {
-        buffer.append("0123456789");
-        buffer.append('x');
-        expected += "0123456789x";
-    }
-    EXPECT_EQ(buffer.view(), expected);
-    buffer.dropFront(11);
+    buffer.append(test::repeated("0123456789x", 300));
+    buffer.dropFront(12);
     buffer.truncate(buffer.size() - 1);
-    EXPECT_EQ(buffer.view(), std::string_view(expected).substr(11, expected.size() - 12));
-    TextBuffer moved = std::move(buffer);
-    EXPECT_EQ(moved.size(), expected.size() - 12);
+    const TextBuffer moved = std::move(buffer);
+    EXPECT_EQ(moved.view(), "123456789x" + test::repeated("0123456789x", 297) + "0123456789");
     EXPECT_EQ(buffer.size(), 0U);
 }
 
@@ -51,15 +44,15 @@ TEST(Utf8, TellsWhatIsWellFormed) {
     const std::string wellFormed = "207f c280 dfbf e0a080 ed9fbf ee8080 efbfbf f0908080 f48fbfbf";
     const std::string malformed = "80 bf c080 c1bf c2 c241 c2c280 e09fbf e6b0 eda080 edbfbf f08fbfbf f09085 "
                                   "f4908080 f5808080 ff";
-    for (const bool expected : {true, false}) {
-        std::istringstream words(expected ? wellFormed : malformed);
-        for (std::string word; words >> word;) {
-            const auto bytes = test::fromHex(word);
-            for (std::size_t i = 0; i < 17 * 3; ++i) {
-                const std::string text = std::string(i / 3, 'a') + std::string(bytes.begin(), bytes.end()) +
-                                         std::string(i % 3 * 4, 'z');
-                EXPECT_EQ(isUtf8(text), expected) << word << " behind " << i / 3;
-            }
+    std::istringstream words(wellFormed + " | " + malformed);
+    bool expected = true;
+    for (std::string word; words >> word;) {
+        expected = expected && word != "|";
+        const auto bytes = test::fromHex(word == "|" ? "ff" : word);
+        for (std::size_t i = 0; i < 17 * 3; ++i) {
+            const std::string text = std::string(i / 3, 'a') + std::string(bytes.begin(), bytes.end()) +
+                                     std::string(i % 3 * 4, 'z');
+            EXPECT_EQ(isUtf8(text), expected) << word << " behind " << i / 3;
         }
     }
 }
@@ -84,9 +77,7 @@ TEST(Rfc3339, WritesTimes) {
         {0.9996, "1970-01-01T00:00:01.000Z"},
         {59.99951, "1970-01-01T00:01:00.000Z"},
         {-0.25, "1969-12-31T23:59:59.750Z"},
-        {-0.0001, "1970-01-01T00:00:00.000Z"},
-        {1772366400.25, "2026-03-01T12:00:00.250Z"},
-        {1709164800, "2024-02-29T00:00:00.000Z"},
+        {1709208000.25, "2024-02-29T12:00:00.250Z"},
         {951782399.9996, "2000-02-29T00:00:00.000Z"},
         {4107542400, "2100-03-01T00:00:00.000Z"},
         {-62167219200, "0000-01-01T00:00:00.000Z"},
@@ -108,29 +99,22 @@ TEST(UniqueFunction, HoldsMovesAndDestroysItsTarget) {
         auto token = std::make_shared<int>(1);
         const std::weak_ptr<int> watched = token;
         Function function;
-        EXPECT_FALSE(function);
-        const auto spent = test::allocationsOf([&] {
-            if (large) {
-                function = [token, ballast = std::array<char, 100>{}](auto add) {
-                    return ++*token + *add + ballast[99];
-                };
-            } else {
-                function = [token](auto add) { return ++*token + *add; };
-            }
-        });
-        EXPECT_TRUE(large || spent.blocks == 0);
-        token.reset();
+        const auto small = [token](auto add) { return ++*token + *add; };
+        EXPECT_EQ(test::allocationsOf([&] { function = small; }).blocks, 0U);
+        if (large) {
+            function = [small, ballast = std::array<char, 100>{}](auto add) {
+                return small(std::move(add)) + ballast[99];
+            };
+        }
         EXPECT_EQ(function(std::make_unique<int>(10)), 12);
         Function moved = std::move(function);
         EXPECT_FALSE(function);
         auto& self = moved;
         moved = std::move(self);
-        EXPECT_EQ(watched.use_count(), 1);
-        Function last([](auto) { return 0; });
-        last = std::move(moved);
-        EXPECT_EQ(last(std::make_unique<int>(0)), 3);
-        last.reset();
-        EXPECT_TRUE(watched.expired() && !last);
+        EXPECT_EQ(watched.use_count(), 3) << "token, small, and the one that was moved";
+        moved = Function([](auto) { return 0; });
+        EXPECT_EQ(watched.use_count(), 2);
+        EXPECT_EQ(moved(std::make_unique<int>(0)), 0);
     }
 }
 

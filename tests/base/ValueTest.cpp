@@ -3,7 +3,7 @@
 
 #include <gtest/gtest.h>
 
-#include <cmath>
+#include <algorithm>
 #include <limits>
 #include <string>
 #include <vector>
@@ -12,7 +12,6 @@ namespace tamblo {
 namespace {
 
 constexpr double kNan = std::numeric_limits<double>::quiet_NaN();
-constexpr double kInfinity = std::numeric_limits<double>::infinity();
 constexpr std::int64_t kLeast = std::numeric_limits<std::int64_t>::min();
 constexpr std::int64_t kMost = std::numeric_limits<std::int64_t>::max();
 constexpr std::uint64_t kMostUnsigned = std::numeric_limits<std::uint64_t>::max();
@@ -21,7 +20,7 @@ constexpr std::int64_t k2To53 = std::int64_t{1} << 53;
 TEST(Value, NumbersAreEqualByValueAcrossKinds) {
     const std::vector<std::vector<Value>> classes{
         {0, false, 0.0, -0.0, 0.0F, -0.0F, 0U, Value()},
-        {1, true, 1.0, 1.0F, 1ULL},
+        {1, true, 1.0, 1.0F, 1U},
         {0.1F, static_cast<double>(0.1F)},
         {k2To53, static_cast<double>(k2To53), static_cast<float>(k2To53)},
         {k2To53 + 1, static_cast<std::uint64_t>(k2To53) + 1},
@@ -30,11 +29,9 @@ TEST(Value, NumbersAreEqualByValueAcrossKinds) {
         {kMostUnsigned},
         {0x1p64, 0x1p64F},
         {kLeast, -0x1p63, -0x1p63F},
-        {-kInfinity},
         {kNan, std::numeric_limits<float>::quiet_NaN(), -kNan},
         {""},
         {Value::date(1)},
-        {Value::date(kNan)},
         {Value::data({})},
         {Value(Dictionary{})},
         {Value(Array{1, "a"}), Value(Array{1.0, "a"})},
@@ -44,7 +41,7 @@ TEST(Value, NumbersAreEqualByValueAcrossKinds) {
         for (const auto& others : classes) {
             for (const Value& a : some) {
                 for (const Value& b : others) {
-                    EXPECT_EQ(a == b, &some == &others) << jsonText(a) << " and " << jsonText(b);
+                    EXPECT_EQ(a == b, &some == &others) << jsonText(Array{a, b});
                 }
             }
         }
@@ -65,35 +62,31 @@ TEST(Value, ReadingANumberNeverFails) {
         {-2.9, -2.9, -2, 0, true},
         {0.5F, 0.5, 0, 0, true},
         {kMostUnsigned, 0x1p64, kMost, kMostUnsigned, true},
+        {std::numeric_limits<float>::quiet_NaN(), kNan, 0, 0, false},
         {1e300, 1e300, kMost, kMostUnsigned, true},
         {-0.0, 0, 0, 0, false},
         {" \t-3.75e1x", -37.5, -37, 0, true},
         {"0." + std::string(400, '0') + "1", 0, 0, 0, false},
-        {std::string(400, '1'), kInfinity, kMost, kMostUnsigned, true},
+        {std::string(400, '1'), std::numeric_limits<double>::infinity(), kMost, kMostUnsigned, true},
         {"9223372036854775807", 0x1p63, kMost, static_cast<std::uint64_t>(kMost), true},
-        {"18446744073709551615", 0x1p64, kMost, kMostUnsigned, true},
         {"99999999999999999999", 99999999999999999999.0, kMost, kMostUnsigned, true},
         {"-", 0, 0, 0, false},
         {"YES", 0, 0, 0, true},
         {Value::date(5), 0, 0, 0, false},
         {Value(Dictionary{{"a", 1}}), 0, 0, 0, false}};
-    for (std::size_t i = 0; i < rows.size(); ++i) {
-        EXPECT_DOUBLE_EQ(rows[i].value.doubleValue(), rows[i].real) << "row " << i;
-        EXPECT_EQ(rows[i].value.integerValue(), rows[i].integer) << "row " << i;
-        EXPECT_EQ(rows[i].value.unsignedValue(), rows[i].natural) << "row " << i;
-        EXPECT_EQ(rows[i].value.boolValue(), rows[i].truth) << "row " << i;
+    for (const auto& [value, real, integer, natural, truth] : rows) {
+        EXPECT_EQ(Value(value.doubleValue()), Value(real)) << jsonText(value);
+        EXPECT_EQ(value.integerValue(), integer) << jsonText(value);
+        EXPECT_EQ(value.unsignedValue(), natural) << jsonText(value);
+        EXPECT_EQ(value.boolValue(), truth) << jsonText(value);
     }
-    EXPECT_EQ(Value(kNan).integerValue(), 0);
-    EXPECT_EQ(Value(kNan).unsignedValue(), 0U);
 }
 
 TEST(Value, KeepsItsContent) {
     // Lengths on both sides of what lies in the value itself, through copy, move and assignment to itself.
-    for (const std::size_t length : {0U, 1U, 13U, 14U, 15U, 16U, 254U, 255U, 256U, 70'000U}) {
+    for (const std::size_t length : {0U, 1U, 14U, 15U, 254U, 255U, 256U, 70'000U}) {
         std::string text(length, 'x');
-        if (length > 1) {
-            text[length / 2] = '\0';
-        }
+        text[length / 2] = '\0';
         Value value(text);
         Value copy = value;
         Value moved = std::move(value);
@@ -102,10 +95,10 @@ TEST(Value, KeepsItsContent) {
         EXPECT_EQ(copy.stringValue(), text);
         EXPECT_EQ(moved, copy);
         EXPECT_NE(moved, Value(text + "y"));
-        const std::vector<std::uint8_t> bytes(length, 0xFF);
+        const std::vector<std::uint8_t> bytes(text.begin(), text.end());
         const Value data = Value::data(bytes);
         EXPECT_TRUE(std::ranges::equal(bytes, data.dataValue()));
-        EXPECT_NE(data, Value(text));
+        EXPECT_NE(data, copy);
     }
 }
 

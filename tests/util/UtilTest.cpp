@@ -18,10 +18,10 @@ namespace {
 
 /// The names of the numbers from 0 on, and of some more.
 template <typename Number, typename Name>
-std::string named(Number count, std::initializer_list<Number> others, Name name) {
+std::string named(Number count, std::vector<Number> others, Name name) {
     std::string names;
-    for (Number number = 0; number < count; ++number) {
-        names += std::string(name(number)) + " ";
+    for (; count > 0; --count) {
+        others.insert(others.begin(), static_cast<Number>(count - 1));
     }
     for (const Number number : others) {
         names += std::string(name(number)) + " ";
@@ -52,7 +52,7 @@ TEST(VocabularyTest, NumbersOfNames) {
     for (AudioEventCategory kind = 1; kind <= 16; ++kind) {
         EXPECT_EQ(ZRReportingUtilityCategoryFromString(ZRReportingUtilityCategoryString(kind)), kind);
     }
-    for (const char* name : {"Unknown", "Wirrels", "Undefined", "Session_Playback", "volume", ""}) {
+    for (const char* name : {"Wirrels", "Undefined", "Session_Playback", "volume"}) {
         EXPECT_EQ(ZRReportingUtilityCategoryFromString(name), AudioEventCategoryUnknown) << name;
     }
     for (AudioEventType type = 0; type <= 18; ++type) {
@@ -60,63 +60,50 @@ TEST(VocabularyTest, NumbersOfNames) {
     }
     EXPECT_EQ(ZRReportingUtilityTypeFromString("Unknown"), 65535);
     EXPECT_EQ(ZRReportingUtilityTypeFromString("MemoryLog"), 0);
-    for (AudioServiceType type = 0; type < 14; ++type) {
-        const auto name = ZRReportingUtilityGenerateServiceNameFromServiceType(type);
-        EXPECT_EQ(ZRReportingUtilityGenerateServiceTypeFromServiceName(name), type);
-    }
+    EXPECT_EQ(ZRReportingUtilityGenerateServiceTypeFromServiceName("systemsounds"), 13);
     EXPECT_EQ(ZRReportingUtilityGenerateServiceTypeFromServiceName("Telephony"), 65535);
-    EXPECT_EQ(ZRReportingUtilityRetrieveAppName({}).stringValue(), "Unknown");
 }
 
 struct Costly {
-    int* written;
+    int& written;
 };
 void appendText(std::string& out, const Costly& costly) {
-    ++*costly.written;
-    out += "costly";
+    out += "costly " + std::to_string(++costly.written);
 }
 
 TEST(LogTest, LinesHaveAPrefixAndTextOnlyWhenOn) {
     FakePlatform device(LogLevel::info);
     int written = 0;
-    log::debug(ZRReportingJouleryCategory(), "{}", Costly{&written});
-    EXPECT_EQ(written, 0);
-    log::info(ZRReportingJouleryCategory(), "{} of {}: {} {}", Costly{&written}, Value("text"), Value(7),
-              true);
+    log::debug(ZRReportingJouleryCategory(), "{}", Costly{written});
+    log::info(ZRReportingJouleryCategory(), "{} of {}: {}", Costly{written}, Value("text"), Value(7));
     log::fault(ZRReportingQMXLogCategory(), "{}", Dictionary{{"a", Dictionary{{"b", 0.5}}}});
     const auto lines = device.log.lines();
     ASSERT_EQ(lines.size(), 2U);
     EXPECT_THAT(lines[0].prefix, testing::MatchesRegex("                 UtilTest:[0-9]+ +"));
     EXPECT_EQ(lines[0].prefix.size(), 32U);
-    EXPECT_EQ(lines[0].category + " " + lines[0].text, "zrrp costly of text: 7 1");
+    EXPECT_EQ(lines[0].category + " " + lines[0].text, "zrrp costly 1 of text: 7");
     EXPECT_EQ(lines[1].category + " " + lines[1].text, "zrra {\"a\":{\"b\":0.5}}");
     EXPECT_EQ(lines[1].level, LogLevel::fault);
 }
 
 TEST(UtilitiesTest, NearestBucket) {
-    const struct {
-        double value;
-        std::vector<double> buckets;
-        unsigned digits;
-        const char* text;
-    } cases[] = {
-        {3, {1, 2, 4, 8}, 0, "4"}, {2.9, {1, 2, 4, 8}, 0, "2"}, {-5, {10, 20}, 0, "10"},
-        {3, {3}, 2, "3.0"},        {3, {3.256}, 2, "3.26"},     {1, {5, 9, 1}, 0, "5"},
-        {0, {-2.25}, 1, "-2.2"},   {0, {1e6}, 1, "1000000.0"},
+    const std::tuple<double, std::vector<double>, unsigned, std::optional<std::string>> cases[] = {
+        {3, {1, 2, 4, 8}, 0, "4"}, {2.9, {1, 2, 4, 8}, 0, "2"}, {3, {3}, 2, "3.0"},
+        {3, {3.256}, 2, "3.26"},   {1, {5, 9, 1}, 0, "5"},      {0, {-2.25}, 1, "-2.2"},
+        {1, {}, 0, std::nullopt},
     };
-    for (const auto& c : cases) {
-        EXPECT_EQ(ZRReportingUtilityBucketNumberToString(c.value, c.buckets, c.digits), c.text) << c.value;
+    for (const auto& [value, buckets, digits, text] : cases) {
+        EXPECT_EQ(ZRReportingUtilityBucketNumberToString(value, buckets, digits), text) << value;
     }
-    EXPECT_EQ(ZRReportingUtilityBucketNumberToString(1, {}, 0), std::nullopt);
 }
 
 TEST(UtilitiesTest, ChangesRoundingAndDates) {
     const Dictionary first{{"same", 1}, {"changed", 1}, {"gone", 1}};
     const Dictionary second{{"same", 1.0}, {"changed", "1"}};
-    EXPECT_FALSE(ZRReportingUtilityKeyIsPresentAndHasChanged("same", &first, &second));
-    EXPECT_TRUE(ZRReportingUtilityKeyIsPresentAndHasChanged("changed", &first, &second));
-    EXPECT_FALSE(ZRReportingUtilityKeyIsPresentAndHasChanged("gone", &first, &second));
-    EXPECT_FALSE(ZRReportingUtilityKeyIsPresentAndHasChanged("changed", nullptr, &second));
+    for (const char* key : {"same", "changed", "gone"}) {
+        EXPECT_EQ(ZRReportingUtilityKeyIsPresentAndHasChanged(key, &first, &second), key[0] == 'c') << key;
+        EXPECT_FALSE(ZRReportingUtilityKeyIsPresentAndHasChanged(key, nullptr, &second)) << key;
+    }
     EXPECT_EQ(ZRReportingUtilityRoundWithPlaces(-2.5, 0), -3);
     EXPECT_EQ(ZRReportingUtilityRoundWithPlaces(1234, -2), 1200);
     EXPECT_EQ(ZRReportingUtilityRoundWithPlaces(0.126, 2), 0.13);
@@ -151,42 +138,35 @@ TEST(ConditionWaitTest, SignalledAndTimedOut) {
     const LogCategory& category = ZRReportingSessionLinkmeterCategory();
     ConditionLock lock;
     bool flag = false;
-    EXPECT_FALSE(ZRReportingUtilityWait(lock, std::chrono::seconds(0), flag, "waiting", "timeout", category));
+    const auto wait = [&](std::chrono::hours time) {
+        return ZRReportingUtilityWait(lock, time, flag, "waiting", "timeout", category);
+    };
+    EXPECT_FALSE(wait(std::chrono::hours(0)));
     EXPECT_THAT(device.log.texts(), testing::ElementsAre("waiting", "timeout"));
-    std::thread signaller([&] {
+    const std::jthread signaller([&] {
         while (device.log.count("waiting") < 3) {
-            std::this_thread::yield();
             lock.condition.notify_one(); // a wake-up that means nothing
         }
         ZRReportingUtilitySignal(lock, flag);
     });
-    EXPECT_TRUE(
-        ZRReportingUtilityWait(lock, std::chrono::hours(1'000'000), flag, "waiting", "timeout", category));
-    signaller.join();
+    EXPECT_TRUE(wait(std::chrono::hours(1'000'000)));
     EXPECT_EQ(device.log.texts().back(), "continuing");
 }
 
 TEST(DataSerializeTest, EveryKindOfValue) {
-    const std::uint8_t bytes[] = {0, 1, 255};
-    const Dictionary list{{"array", Array{true, false, Array{}, Dictionary{}}},
-                          {"data", Value::data(bytes)},
-                          {"date", Value::date(1772366400.75)},
-                          {"infinite", -std::numeric_limits<double>::infinity()},
-                          {"int", -5},
-                          {"k<&>", "a\r\n\"b\" é"},
-                          {"single", 0.1F},
-                          {"unsigned", std::numeric_limits<std::uint64_t>::max()}};
+    const Dictionary list{
+        {"array", Array{true, false, Array{}, Dictionary{}, -5, std::numeric_limits<std::uint64_t>::max(),
+                        0.1F, -std::numeric_limits<double>::infinity(), Value::date(1772366400.75)}},
+        {"data", Value::data(std::vector<std::uint8_t>{0, 1, 255})},
+        {"k<&>", "a\r\n\"b\" é"}};
     const std::string expected = "<?xml version=\"1.0\" encoding=\"UTF-8\"?>\n<!DOCTYPE plist>\n"
-                                 "<plist version=\"1.0\">\n<dict>\n"
-                                 "\t<key>array</key>\n\t<array>\n\t\t<true/>\n\t\t<false/>\n\t\t<array/>\n"
-                                 "\t\t<dict/>\n\t</array>\n"
+                                 "<plist version=\"1.0\">\n<dict>\n\t<key>array</key>\n\t<array>\n"
+                                 "\t\t<true/>\n\t\t<false/>\n\t\t<array/>\n\t\t<dict/>\n"
+                                 "\t\t<integer>-5</integer>\n\t\t<integer>18446744073709551615</integer>\n"
+                                 "\t\t<real>0.1</real>\n\t\t<real>-infinity</real>\n"
+                                 "\t\t<date>2026-03-01T12:00:00Z</date>\n\t</array>\n"
                                  "\t<key>data</key>\n\t<data>AAH/</data>\n"
-                                 "\t<key>date</key>\n\t<date>2026-03-01T12:00:00Z</date>\n"
-                                 "\t<key>infinite</key>\n\t<real>-infinity</real>\n"
-                                 "\t<key>int</key>\n\t<integer>-5</integer>\n"
                                  "\t<key>k&lt;&amp;&gt;</key>\n\t<string>a&#13;\n\"b\" é</string>\n"
-                                 "\t<key>single</key>\n\t<real>0.1</real>\n"
-                                 "\t<key>unsigned</key>\n\t<integer>18446744073709551615</integer>\n"
                                  "</dict>\n</plist>\n";
     EXPECT_EQ(DataSerialize::getDataXMLInfo(list), expected);
     EXPECT_EQ(DataSerialize::getXMLInfo(list), std::nullopt) << "not ASCII";

@@ -10,13 +10,11 @@
 namespace tamblo::wire {
 namespace {
 
-using testing::AllOf;
 using testing::HasSubstr;
 
 TEST(DirectoriesTest, ComeFromTheUnitOrFromTheirUsualPlaces) {
-    using Variables = std::map<std::string, std::string, std::less<>>;
     const struct {
-        Variables variables;
+        std::map<std::string, std::string> variables;
         bool isRoot;
         std::array<std::string, 3> places; ///< of what runs, is configured and is logged
     } cases[] = {
@@ -33,17 +31,14 @@ TEST(DirectoriesTest, ComeFromTheUnitOrFromTheirUsualPlaces) {
         {{}, false, {"", "/h/.config/tamblo", "/h/.local/state/tamblo"}},
     };
     for (const auto& [variables, isRoot, places] : cases) {
-        const auto variable = [&variables](std::string_view name) {
-            const auto found = variables.find(name);
-            return found == variables.end() ? std::string() : found->second;
-        };
-        const auto found = Directories::find({variable, isRoot, "/h"});
+        const auto found = Directories::find(
+            {[named = variables](std::string_view name) mutable { return named[std::string(name)]; }, isRoot,
+             "/h"});
         EXPECT_EQ((std::array{found.runtime, found.configuration, found.logs}), places);
     }
     const Environment bare{[](std::string_view) { return std::string(); }, false, "/h"};
     EXPECT_EQ(Directories::find(bare).socketFile(), "");
-    EXPECT_THAT(std::get<std::string>(Directories::prepare(bare)),
-                AllOf(HasSubstr("RUNTIME_DIRECTORY"), HasSubstr("XDG_RUNTIME_DIR")));
+    EXPECT_THAT(std::get<std::string>(Directories::prepare(bare)), HasSubstr("XDG_RUNTIME_DIR"));
 }
 
 TEST(DirectoriesTest, AreCreatedForTheirOwnerAloneOrSayWhyNot) {
@@ -51,20 +46,17 @@ TEST(DirectoriesTest, AreCreatedForTheirOwnerAloneOrSayWhyNot) {
     const auto variable = [&home](std::string_view name) {
         return name == "LOGS_DIRECTORY" ? home.path("logs/deep") : home.path("x") + "/" + std::string(name);
     };
-    const auto made = Directories::prepare({variable, false, ""});
-    ASSERT_TRUE(std::holds_alternative<Directories>(made)) << std::get<std::string>(made);
-    const auto& directories = std::get<Directories>(made);
-    for (const std::string& path : {directories.logs, home.path("logs"), directories.notifications(),
-                                    directories.driverChannels(), directories.preferences()}) {
-        EXPECT_EQ(std::filesystem::status(path).permissions(), std::filesystem::perms::owner_all) << path;
+    for (int time = 0; time < 2; ++time) { // they may be there already
+        const auto made = std::get<Directories>(Directories::prepare({variable, false, ""}));
+        for (const std::string& path : {made.logs, home.path("logs"), made.notifications(),
+                                        made.driverChannels(), made.preferences()}) {
+            EXPECT_EQ(std::filesystem::status(path).permissions(), std::filesystem::perms::owner_all) << path;
+        }
     }
-    EXPECT_TRUE(std::holds_alternative<Directories>(Directories::prepare({variable, false, ""})))
-        << "all exist";
     std::filesystem::remove_all(home.path("logs"));
     home.write("logs", "a file");
-    EXPECT_THAT(
-        std::get<std::string>(Directories::prepare({variable, false, ""})),
-        AllOf(HasSubstr(home.path("logs/deep")), HasSubstr("Not a directory"), HasSubstr("LOGS_DIRECTORY")));
+    EXPECT_THAT(std::get<std::string>(Directories::prepare({variable, false, ""})),
+                HasSubstr(home.path("logs/deep") + ": Not a directory; create it, or set LOGS_DIRECTORY"));
 }
 
 } // namespace

@@ -4,12 +4,10 @@
 #include "wire/FrameSplitter.h"
 #include "wire/Reply.h"
 
-#include <gtest/gtest.h>
+#include <gmock/gmock.h>
 
 #include <limits>
 #include <string>
-#include <string_view>
-#include <tuple>
 #include <vector>
 
 namespace tamblo::wire {
@@ -33,12 +31,8 @@ TEST(Request, EveryMethodIsReadAsItWasWritten) {
             written.id = id;
             TextBuffer out;
             ASSERT_TRUE(appendRequestFrame(out, written));
-            FrameSplitter frames(out.bytes());
-            const auto frame = frames.next();
-            ASSERT_TRUE(frame && frames.rest().empty());
-
             Request read;
-            const auto refusal = decodeRequest(*frame, keySets, read);
+            const auto refusal = decodeRequest(out.bytes().subspan(kLengthBytes), keySets, read);
             ASSERT_FALSE(refusal) << kMethods[i].name << ": " << refusal->error.message;
             EXPECT_EQ(read.method, written.method);
             EXPECT_EQ(read.id, written.id);
@@ -69,7 +63,7 @@ TEST(Request, WhatIsRefusedNamesItsReason) {
     const struct {
         std::int64_t code;
         std::uint64_t id;
-        std::string_view mentions;
+        std::string mentions;
         std::string hex;
     } cases[] = {
         {kNotWellFormed, 0, "early", ""},
@@ -94,16 +88,13 @@ TEST(Request, WhatIsRefusedNamesItsReason) {
     };
     KeySetCache keySets;
     Request request;
-    for (const auto& expected : cases) {
-        SCOPED_TRACE(expected.hex);
-        const auto refusal = decodeRequest(fromHex(expected.hex), keySets, request);
-        ASSERT_TRUE(refusal);
-        EXPECT_EQ(refusal->error.domain, kProtocolErrorDomain);
-        EXPECT_EQ(refusal->error.code, expected.code);
-        EXPECT_EQ(refusal->id, expected.id);
-        EXPECT_EQ(refusal->endsConnection, expected.code == kNotWellFormed);
-        EXPECT_NE(refusal->error.message.find(expected.mentions), std::string::npos)
-            << refusal->error.message;
+    for (const auto& [code, id, mentions, hex] : cases) {
+        SCOPED_TRACE(hex);
+        const auto refusal = decodeRequest(fromHex(hex), keySets, request).value();
+        EXPECT_EQ(refusal.error.code, code);
+        EXPECT_EQ(refusal.id, id);
+        EXPECT_EQ(refusal.endsConnection, code == kNotWellFormed);
+        EXPECT_THAT(refusal.error.message, testing::HasSubstr(mentions));
     }
     // What was refused leaves nothing behind that the next request could trip over.
     EXPECT_FALSE(decodeRequest(fromHex("84" + create + "81 07"), keySets, request));
@@ -111,12 +102,7 @@ TEST(Request, WhatIsRefusedNamesItsReason) {
 }
 
 TEST(FrameSplitter, TakesWholeFramesOfAnyCutUpToTheLimit) {
-    Bytes stream;
-    for (const std::size_t length : {0U, 1U, 300U}) {
-        stream.insert(stream.end(),
-                      {static_cast<std::uint8_t>(length), static_cast<std::uint8_t>(length >> 8), 0, 0});
-        stream.insert(stream.end(), length, 0x20);
-    }
+    const Bytes stream = fromHex("00000000 01000000 20 2c010000" + test::repeated("20", 300));
     for (std::size_t cut = 0; cut <= stream.size(); ++cut) {
         FrameSplitter frames({stream.data(), cut});
         std::size_t taken = 0;
@@ -141,15 +127,16 @@ TEST(Reply, EveryResultIsReadAsItWasWritten) {
     const Dictionary dictionary{{"reporterID", 7}, {"serviceType", 2}};
     const std::optional<Value> results[] = {std::nullopt, true, 65535, dictionary,
                                             Array(numbers.begin(), numbers.end())};
-    const Error errors[] = {{"a.domain", -32601, "why"}, {"b.domain", 1, ""}};
+    const std::string errors[] = {"a.domain -32601 why", "b.domain 1 ",
+                                  "com.vandra.tamblo.protocol -32600 the result is too long"};
     TextBuffer out;
     appendNullReply(out, 0);
     appendBooleanReply(out, 1, true);
     appendUnsignedReply(out, 2, 65535);
     appendDictionaryReply(out, 3, dictionary);
     appendIntegersReply(out, 4, numbers);
-    appendErrorReply(out, 5, errors[0]);
-    appendErrorReply(out, 6, errors[1]);
+    appendErrorReply(out, 5, {"a.domain", -32601, "why"});
+    appendErrorReply(out, 6, {"b.domain", 1, ""});
     appendDictionaryReply(out, 7, {{"k", std::string(kMaximumFrameBytes, 'x')}});
     FrameSplitter frames(out.bytes());
     std::uint64_t id = 0;
@@ -159,12 +146,9 @@ TEST(Reply, EveryResultIsReadAsItWasWritten) {
         EXPECT_EQ(reply->id, id);
         EXPECT_EQ(reply->result, id < 5 ? results[id] : std::nullopt);
         ASSERT_EQ(reply->error.has_value(), id >= 5);
-        if (id == 7) {
-            EXPECT_EQ(reply->error->code, kNotARequest) << "a result that is too long";
-        } else if (id >= 5) {
-            const auto& [domain, code, message] = errors[id - 5];
-            EXPECT_EQ(std::tie(reply->error->domain, reply->error->code, reply->error->message),
-                      std::tie(domain, code, message));
+        if (id >= 5) {
+            const auto& [domain, code, message] = *reply->error;
+            EXPECT_EQ(domain + " " + std::to_string(code) + " " + message, errors[id - 5]);
         }
         for (std::size_t cut = 0; cut < frame->size(); ++cut) {
             EXPECT_FALSE(decodeReply(frame->first(cut)));
