@@ -50,8 +50,8 @@ bool skips(const Bytes& bytes) {
     return whole;
 }
 
-std::vector<std::string> wordsOf(std::string_view text) {
-    std::istringstream stream{std::string(text)};
+std::vector<std::string> wordsOf(const std::string& text) {
+    std::istringstream stream(text);
     return {std::istream_iterator<std::string>(stream), {}};
 }
 
@@ -73,7 +73,7 @@ Value valueNamed(const std::string& text) {
 TEST(Cbor, ReadsTheExamplesOfTheStandardAndFindsTheirTruncationAtEveryByte) {
     // RFC 8949, appendix A, and some more, without what an independent implementation writes in the same way:
     // bytes and their value.
-    constexpr std::string_view table = R"(
+    const auto words = wordsOf(R"(
         f90000 0.0f  f98000 -0.0f  f93c00 1.0f  f97bff 65504.0f  f9c400 -4.0f  f90001 5.960464477539063e-8f
         f90400 0.00006103515625f  fa47c35000 100000.0f  fa7f7fffff 3.4028234663852886e+38f  fa3dcccccd 0.1f
         f97c00 inff  f9fc00 -inff  fa7f800000 inff  fa7fc00000 nanf  fb3ff0000000000000 1.0
@@ -84,8 +84,7 @@ TEST(Cbor, ReadsTheExamplesOfTheStandardAndFindsTheirTruncationAtEveryByte) {
         bf61610161629f0203ffff {"a":1,"b":[2,3]}  826161bf61626163ff ["a",{"b":"c"}]
         bf6346756ef563416d7421ff {"Fun":true,"Amt":-2}  bf7f616161626163ff01ff {"abc":1}
         1800 0  190000 0  1a00000000 0  3800 -1  1b0000000000000001 1  5900020102 0102h
-        5a000000020102 0102h  7b000000000000000178 "x"  bf7f616162c3a9ff9ff5a1616280ffff {"aé":[true,{"b":[]}]})";
-    const auto words = wordsOf(table);
+        5a000000020102 0102h  7b000000000000000178 "x"  bf7f616162c3a9ff9ff5a1616280ffff {"aé":[true,{"b":[]}]})");
     for (std::size_t i = 0; i + 1 < words.size(); i += 2) {
         SCOPED_TRACE(words[i]);
         const Value expected = valueNamed(words[i + 1]);
@@ -117,7 +116,7 @@ TEST(Cbor, RefusesWhatIsNoValueAndSkipsWhatIsWellFormed) {
         {CborError::duplicateKey, "a2616101616102 a3616201616102616203 bf6161016161f5ff a27f6161ff01616102"},
         {CborError::duplicateKey, "8181a2616101616102"},
         // Each chunk of a text stands for itself (RFC 8949, section 3.2.3).
-        {CborError::notUtf8, "61ff 62c080 63eda080 a161ff01 7f61c361bcff"},
+        {CborError::notUtf8, "61ff 62c080 63eda080 70616161616161616161616161616161ff a161ff01 7f61c361bcff"},
         {CborError::integerOutOfRange, "3bffffffffffffffff 3b8000000000000000"},
         {CborError::malformed, "1c 1d 1e 3c 3e 5c 7d 9e bc dd fc fd fe f800 f818 f81f 1f 3f df ff c1ff"},
         {CborError::malformed, "5f00ff 5f21ff 5f6100ff 5f80ff 5fa0ff 5fc000ff 5fe0ff 7f4100ff 5f5f4100ffff"},
@@ -168,7 +167,7 @@ TEST(Cbor, NestsToItsDepth) {
 
 TEST(KeySetCache, MakesNoDifferenceButSharesKeySets) {
     KeySetCache cache;
-    test::RandomValues random(3);
+    test::RandomJson random(3);
     // Few keys make shapes that begin like a remembered one and then differ, end early, go on, or name a key
     // twice; many keys fill the memory.
     for (int i = 0; i < 6000; ++i) {
@@ -179,7 +178,7 @@ TEST(KeySetCache, MakesNoDifferenceButSharesKeySets) {
             const std::string key = random.below(8) == 0 ? "key" + std::to_string(random.below(1500))
                                                          : std::string(1, "abcdefgh"[random.below(8)]);
             std::ranges::copy(written(Value(key)), std::back_inserter(bytes));
-            std::ranges::copy(written(random.value(1)), std::back_inserter(bytes));
+            std::ranges::copy(written(valueNamed(random.value(1))), std::back_inserter(bytes));
             keys.insert(key);
         }
         const bool namesAKeyTwice = keys.size() < entries;
@@ -193,22 +192,18 @@ TEST(KeySetCache, MakesNoDifferenceButSharesKeySets) {
 
 TEST(RecentTexts, AreSharedAndNeverTakenForOthers) {
     KeySetCache cache;
-    const auto read = [&cache](const Bytes& bytes) { return CborReader(bytes, &cache).readValue(); };
     // Some take each other's places, some differ in the middle only, some are too short or too long.
     for (int i = 0; i < 6000; ++i) {
         const std::string number = std::to_string(i % 2000);
         for (const std::string& text :
              {"a text with " + number, "equal ends " + number + " equal ends", std::string(i % 120, 'x')}) {
             const Bytes bytes = written(Value(text));
-            ASSERT_EQ(read(bytes), Value(text));
-            const auto spent = test::allocationsOf([&] { ASSERT_EQ(read(bytes)->stringValue(), text); });
-            ASSERT_EQ(spent.blocks, text.size() > 96 ? 1U : 0U);
+            ASSERT_EQ(CborReader(bytes, &cache).readValue(), Value(text));
+            const auto again = test::allocationsOf(
+                [&] { ASSERT_EQ(CborReader(bytes, &cache).readValue()->stringValue(), text); });
+            ASSERT_EQ(again.blocks, text.size() > 96 ? 1U : 0U);
         }
     }
-    Bytes broken = written(Value("a text that is not UTF-8"));
-    EXPECT_TRUE(read(broken));
-    broken[12] = 0xFF;
-    EXPECT_FALSE(read(broken));
 }
 
 } // namespace

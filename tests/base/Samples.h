@@ -1,10 +1,5 @@
 #pragma once
 
-#include "base/Dictionary.h"
-#include "base/Value.h"
-
-#include <bit>
-#include <cmath>
 #include <cstdint>
 #include <random>
 #include <string>
@@ -34,71 +29,63 @@ inline std::string repeated(std::string_view piece, int count) {
     return text;
 }
 
-/// Values that JSON has, at random from a seed: every length around the limits of what is stored in place,
-/// numbers of every magnitude.
-class RandomValues {
+/// JSON at random from a seed: texts of every length around what is stored in place, numbers of every
+/// magnitude.
+class RandomJson {
 public:
-    explicit RandomValues(std::uint32_t seed) : random_(seed) {}
+    explicit RandomJson(std::uint32_t seed) : random_(seed) {}
 
-    Value value(int depth) {
-        switch (below(depth > 0 ? 8U : 5U)) {
+    std::string value(int depth) {
+        switch (below(depth > 0 ? 8 : 5)) {
         case 0:
-            return below(2) == 0;
+            return below(2) == 0 ? "true" : "false";
         case 1:
-            return static_cast<std::int64_t>(below(2) == 0 ? bits() : ~bits());
+            return integer();
         case 2:
-            return bits();
-        case 3:
-            return real();
-        case 5: {
-            Array elements;
-            for (std::size_t i = below(5); i > 0; --i) {
-                elements.push_back(value(depth - 1));
-            }
-            return elements;
-        }
+            return integer() + "." + std::to_string(below(1000)) + "e" + std::to_string(below(40));
+        case 5:
+            return "[" + items([&](std::size_t) { return value(depth - 1); }) + "]";
         case 6:
         case 7:
-            return dictionary(depth - 1);
+            return object(depth);
         default:
-            return text();
+            return "\"" + characters() + "\"";
         }
     }
-
-    Dictionary dictionary(int depth) {
-        Dictionary dictionary;
-        for (std::size_t i = below(6); i > 0; --i) {
-            dictionary.set(text(), value(depth));
-        }
-        return dictionary;
+    /// No key twice.
+    std::string object(int depth) {
+        return "{" + items([&](std::size_t number) {
+                   return "\"" + characters() + std::to_string(number) + "\":" + value(depth - 1);
+               }) +
+               "}";
     }
 
     std::size_t below(std::size_t limit) { return random_() % limit; }
 
 private:
-    std::string text() {
-        static const std::vector<std::string> pieces{"a",  "Z",    "0", " ",  "\"", "\\",       "/",
-                                                     "\n", "\x7f", "é", "水", "𐅑",  "reporting"};
+    template <typename Item> std::string items(const Item& item) {
+        std::string text;
+        for (std::size_t i = below(6); i > 0; --i) {
+            text += item(i) + (i > 1 ? "," : "");
+        }
+        return text;
+    }
+
+    /// Every second one is a power of two or stands beside one.
+    std::string integer() {
+        const std::uint64_t power = 1ULL << (1 + below(63));
+        const std::uint64_t number = below(2) == 0 ? power + below(3) - 1 : random_() % power;
+        return below(3) == 0 && power <= 1ULL << 62 ? "-" + std::to_string(number) : std::to_string(number);
+    }
+
+    std::string characters() {
+        static const std::vector<std::string> pieces{
+            "a", "Z", "0", " ", "\\\"", "\\\\", "/", "\\n", "\\u0000", "\x7f", "é", "水", "𐅑", "reporting"};
         std::string text;
         for (std::size_t i = below(22); i > 0; --i) {
             text += pieces[below(4) == 0 ? below(pieces.size()) : below(3)];
         }
         return text;
-    }
-
-    /// Magnitudes are spread evenly over the lengths in bits; every second number is a power of two or stands
-    /// beside one.
-    std::uint64_t bits() {
-        const std::uint64_t power = 1ULL << below(64);
-        return below(2) == 0 ? power + below(3) - 1 : random_() % power;
-    }
-
-    double real() {
-        const auto number = std::bit_cast<double>(random_());
-        return below(3) == 0 && std::isfinite(number)
-                   ? number
-                   : static_cast<double>(static_cast<std::int64_t>(bits())) /
-                         static_cast<double>(bits() | 1U);
     }
 
     std::mt19937_64 random_;

@@ -21,11 +21,9 @@ namespace {
 
 TEST(Format, PutsArgumentsInTheirPlaces) {
     EXPECT_EQ(formatted("a={}{}{}, {{}", -5, true, "b", std::string("{}")), "a=-51b, {{}");
-    EXPECT_EQ(formatted("{}/{}", std::numeric_limits<std::int64_t>::min(),
-                        std::numeric_limits<std::uint64_t>::max()),
-              "-9223372036854775808/18446744073709551615");
-    EXPECT_EQ(formatted("{} {} {}", 1.5, 0.1F, -0.0), "1.500000 0.100000 -0.000000");
-    EXPECT_EQ(formatted("{} {} {}", fixed(2.675, 1), fixed(2.5, 0), fixed(-0.125, 2)), "2.7 2 -0.12");
+    EXPECT_EQ(formatted("{} {}", std::numeric_limits<std::int64_t>::min(), ~0ULL),
+              "-9223372036854775808 18446744073709551615");
+    EXPECT_EQ(formatted("{} {} {}", 1.5, fixed(2.5, 0), fixed(-0.125, 2)), "1.500000 2 -0.12");
     EXPECT_EQ(formatted("{}", std::numeric_limits<double>::max()).size(), 309U + 7U);
 }
 
@@ -41,14 +39,13 @@ TEST(TextBuffer, GivesBackAtBothEnds) {
 
 TEST(Utf8, TellsWhatIsWellFormed) {
     // The first and the last of every length, and their neighbours.
-    const std::string wellFormed = "207f c280 dfbf e0a080 ed9fbf ee8080 efbfbf f0908080 f48fbfbf";
-    const std::string malformed = "80 bf c080 c1bf c2 c241 c2c280 e09fbf e6b0 eda080 edbfbf f08fbfbf f09085 "
-                                  "f4908080 f5808080 ff";
-    std::istringstream words(wellFormed + " | " + malformed);
+    std::istringstream words("207f c280 dfbf e0a080 ed9fbf ee8080 efbfbf f0908080 f48fbfbf "
+                             "ff 80 bf c080 c1bf c2 c241 c2c280 e09fbf e6b0 eda080 edbfbf f08fbfbf f09085 "
+                             "f4908080 f5808080");
     bool expected = true;
     for (std::string word; words >> word;) {
-        expected = expected && word != "|";
-        const auto bytes = test::fromHex(word == "|" ? "ff" : word);
+        expected = expected && word != "ff"; // the first that is not
+        const auto bytes = test::fromHex(word);
         for (std::size_t i = 0; i < 17 * 3; ++i) {
             const std::string text = std::string(i / 3, 'a') + std::string(bytes.begin(), bytes.end()) +
                                      std::string(i % 3 * 4, 'z');
@@ -66,8 +63,8 @@ TEST(Base64, ReadsAndWritesTheExamplesOfTheStandard) {
         EXPECT_EQ(encodeBase64(bytes), text);
         EXPECT_EQ(decodeBase64(text), bytes);
     }
-    for (const char* text : {"Z", "Zg", "Zg=", "Zg===", "=", "====", "Z===", "Zh==", "Zm9=", "Zm-_", "Zm9v\n",
-                             " Zm9v", "Zg==Zg==", "Zm=v"}) {
+    for (const char* text :
+         {"Z", "Zg=", "Zg===", "====", "Z===", "Zh==", "Zm9=", "Zm-_", "Zm9v\n", "Zg==Zg==", "Zm=v"}) {
         EXPECT_EQ(decodeBase64(text), std::nullopt) << text;
     }
 }
@@ -96,8 +93,7 @@ TEST(Rfc3339, WritesTimes) {
 TEST(UniqueFunction, HoldsMovesAndDestroysItsTarget) {
     using Function = UniqueFunction<int(std::unique_ptr<int>)>;
     for (const bool large : {false, true}) {
-        auto token = std::make_shared<int>(1);
-        const std::weak_ptr<int> watched = token;
+        const auto token = std::make_shared<int>(1);
         Function function;
         const auto small = [token](auto add) { return ++*token + *add; };
         EXPECT_EQ(test::allocationsOf([&] { function = small; }).blocks, 0U);
@@ -111,9 +107,9 @@ TEST(UniqueFunction, HoldsMovesAndDestroysItsTarget) {
         EXPECT_FALSE(function);
         auto& self = moved;
         moved = std::move(self);
-        EXPECT_EQ(watched.use_count(), 3) << "token, small, and the one that was moved";
+        EXPECT_EQ(token.use_count(), 3) << "this one, small's, and the one that was moved";
         moved = Function([](auto) { return 0; });
-        EXPECT_EQ(watched.use_count(), 2);
+        EXPECT_EQ(token.use_count(), 2);
         EXPECT_EQ(moved(std::make_unique<int>(0)), 0);
     }
 }

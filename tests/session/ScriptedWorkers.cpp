@@ -6,11 +6,15 @@
 #include <utility>
 
 namespace tamblo {
+
+WorkerScript& WorkerScript::current() {
+    static WorkerScript script;
+    return script;
+}
+
 namespace {
 
-WorkerScript& script() {
-    return WorkerScript::current();
-}
+WorkerScript& script = WorkerScript::current();
 
 class ScriptedWorker final : public ZRReportingSessionWorkerConsumerProtocol {
 public:
@@ -21,17 +25,17 @@ public:
         if (name_ == "Only" || name_ == "Redundant") {
             return std::nullopt;
         }
-        script().saw("start " + name_);
-        return !script().notStarting.contains(name_);
+        script.saw("start " + name_);
+        return !script.notStarting.contains(name_);
     }
     void stop() override {
-        script().saw("stop " + name_);
-        if (const auto act = script().atStop.find(name_); act != script().atStop.end()) {
-            act->second(*session());
+        script.saw("stop " + name_);
+        if (script.atStop.contains(name_)) {
+            script.atStop[name_](*session());
         }
     }
     void handleMessage(const MessageRef& message) override {
-        script().saw(formatted("message {} {}/{}", name_, message->category(), message->type()));
+        script.saw(formatted("message {} {}/{}", name_, message->category(), message->type()));
     }
     [[nodiscard]] bool handleRedundantMessages() const override { return name_ == "Redundant"; }
 
@@ -43,8 +47,8 @@ template <std::size_t Row>
 std::shared_ptr<ZRReportingSessionWorkerProtocol> make(Context& context,
                                                        const std::shared_ptr<ZRReportingSession>& session) {
     const std::string name(workerClassList()[Row].name);
-    return script().refusing.contains(name) ? nullptr
-                                            : std::make_shared<ScriptedWorker>(context, session, name);
+    return script.refusing.contains(name) ? nullptr
+                                          : std::make_shared<ScriptedWorker>(context, session, name);
 }
 
 constexpr std::array<WorkerClass, 7> kClasses{{
@@ -61,11 +65,6 @@ constexpr std::array<WorkerClass, 7> kClasses{{
 
 std::span<const WorkerClass> workerClassList() {
     return kClasses;
-}
-
-WorkerScript& WorkerScript::current() {
-    static WorkerScript script;
-    return script;
 }
 
 } // namespace tamblo

@@ -21,17 +21,15 @@ namespace tamblo {
 /// implement no start; the others answer true unless told otherwise.
 class WorkerScript {
 public:
-    using Act = std::function<void(ZRReportingSession&)>;
-
     /// The script of the process.
     static WorkerScript& current();
     void reset() { *this = WorkerScript(); }
 
     /// Classes whose factory refuses, and whose start answers false.
-    std::set<std::string, std::less<>> refusing;
-    std::set<std::string, std::less<>> notStarting;
+    std::set<std::string> refusing;
+    std::set<std::string> notStarting;
     /// What a class's worker does in its stop.
-    std::map<std::string, Act, std::less<>> atStop;
+    std::map<std::string, std::function<void(ZRReportingSession&)>> atStop;
 
     void saw(std::string event) { events_.push_back(std::move(event)); }
     /// "start Late", "stop Late", "message Late 14/11" since the last call.

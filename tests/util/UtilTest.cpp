@@ -55,9 +55,7 @@ TEST(VocabularyTest, NumbersOfNames) {
     for (const char* name : {"Wirrels", "Undefined", "Session_Playback", "volume"}) {
         EXPECT_EQ(ZRReportingUtilityCategoryFromString(name), AudioEventCategoryUnknown) << name;
     }
-    for (AudioEventType type = 0; type <= 18; ++type) {
-        EXPECT_EQ(ZRReportingUtilityTypeFromString(ZRReportingUtilityTypeString(type)), type);
-    }
+    EXPECT_EQ(ZRReportingUtilityTypeFromString("State"), 18);
     EXPECT_EQ(ZRReportingUtilityTypeFromString("Unknown"), 65535);
     EXPECT_EQ(ZRReportingUtilityTypeFromString("MemoryLog"), 0);
     EXPECT_EQ(ZRReportingUtilityGenerateServiceTypeFromServiceName("systemsounds"), 13);
@@ -77,13 +75,11 @@ TEST(LogTest, LinesHaveAPrefixAndTextOnlyWhenOn) {
     log::debug(ZRReportingJouleryCategory(), "{}", Costly{written});
     log::info(ZRReportingJouleryCategory(), "{} of {}: {}", Costly{written}, Value("text"), Value(7));
     log::fault(ZRReportingQMXLogCategory(), "{}", Dictionary{{"a", Dictionary{{"b", 0.5}}}});
-    const auto lines = device.log.lines();
-    ASSERT_EQ(lines.size(), 2U);
-    EXPECT_THAT(lines[0].prefix, testing::MatchesRegex("                 UtilTest:[0-9]+ +"));
-    EXPECT_EQ(lines[0].prefix.size(), 32U);
-    EXPECT_EQ(lines[0].category + " " + lines[0].text, "zrrp costly 1 of text: 7");
-    EXPECT_EQ(lines[1].category + " " + lines[1].text, "zrra {\"a\":{\"b\":0.5}}");
-    EXPECT_EQ(lines[1].level, LogLevel::fault);
+    EXPECT_THAT(device.log.texts(), testing::ElementsAre("costly 1 of text: 7", R"({"a":{"b":0.5}})"));
+    const auto line = device.log.lines().back();
+    EXPECT_THAT(line.prefix, testing::MatchesRegex("                 UtilTest:[0-9]+ +"));
+    EXPECT_EQ(line.prefix.size(), 32U);
+    EXPECT_TRUE(line.category == "zrra" && line.level == LogLevel::fault);
 }
 
 TEST(UtilitiesTest, NearestBucket) {

@@ -32,10 +32,8 @@ TEST(Request, EveryMethodIsReadAsItWasWritten) {
             TextBuffer out;
             ASSERT_TRUE(appendRequestFrame(out, written));
             Request read;
-            const auto refusal = decodeRequest(out.bytes().subspan(kLengthBytes), keySets, read);
-            ASSERT_FALSE(refusal) << kMethods[i].name << ": " << refusal->error.message;
-            EXPECT_EQ(read.method, written.method);
-            EXPECT_EQ(read.id, written.id);
+            ASSERT_FALSE(decodeRequest(out.bytes().subspan(kLengthBytes), keySets, read)) << i;
+            EXPECT_TRUE(read.method == written.method && read.id == written.id) << i;
             TextBuffer again;
             ASSERT_TRUE(appendRequestFrame(again, read));
             EXPECT_EQ(again.view(), out.view()) << "every parameter";
@@ -70,7 +68,6 @@ TEST(Request, WhatIsRefusedNamesItsReason) {
         {kNotWellFormed, 0, "follow", "84" + create + "81 07 00"},
         {kNotWellFormed, 0, "early", send + "a1 61 6b f6 01 02"}, // a bad value, then cut short
         {kNotARequest, 0, "array", "a0"},
-        {kNotARequest, 0, "neither", "84 01 05 f6 f6"},
         {kNotARequest, 0, "id", "84 00 20 60 80"},
         {kNotARequest, 5, "method", "84 00 05 07 80"},
         {kNotARequest, 5, "too many", "85" + create + "81 07 00"},
@@ -79,7 +76,6 @@ TEST(Request, WhatIsRefusedNamesItsReason) {
         {kWrongParameters, 5, "reporter ID is missing", "84" + create + "80"},
         {kWrongParameters, 5, "too many", "84" + create + "82 07 07"},
         {kWrongParameters, 5, "reporter ID", "84" + create + "81 1b ffffffffffffffff"},
-        {kWrongParameters, 5, "payload", send + "80 01 02 80"},
         {kWrongParameters, 5, "twice", send + "a2 61 6b 01 61 6b 02 01 02 80"},
         {kWrongParameters, 5, "category", send + "a0 1b 0000000100000000 02 80"},
         {kWrongParameters, 5, "type", send + "a0 01 1a 00010000 80"},
@@ -96,9 +92,6 @@ TEST(Request, WhatIsRefusedNamesItsReason) {
         EXPECT_EQ(refusal.endsConnection, code == kNotWellFormed);
         EXPECT_THAT(refusal.error.message, testing::HasSubstr(mentions));
     }
-    // What was refused leaves nothing behind that the next request could trip over.
-    EXPECT_FALSE(decodeRequest(fromHex("84" + create + "81 07"), keySets, request));
-    EXPECT_EQ(request.reporterID, 7);
 }
 
 TEST(FrameSplitter, TakesWholeFramesOfAnyCutUpToTheLimit) {
@@ -110,16 +103,14 @@ TEST(FrameSplitter, TakesWholeFramesOfAnyCutUpToTheLimit) {
             taken += kLengthBytes + frame->size();
         }
         EXPECT_EQ(taken + frames.rest().size(), cut);
-        EXPECT_FALSE(frames.tooLong());
-        EXPECT_GT(frames.wanted(), frames.rest().size());
+        EXPECT_TRUE(!frames.tooLong() && frames.wanted() > frames.rest().size());
     }
     Bytes longest(kLengthBytes + kMaximumFrameBytes);
     longest[2] = 0x10;
     EXPECT_TRUE(FrameSplitter(longest).next());
     longest[0] = 1;
     FrameSplitter frames(longest);
-    EXPECT_FALSE(frames.next());
-    EXPECT_TRUE(frames.tooLong());
+    EXPECT_TRUE(!frames.next() && frames.tooLong());
 }
 
 TEST(Reply, EveryResultIsReadAsItWasWritten) {
