@@ -32,6 +32,7 @@ TEST(Value, NumbersAreEqualByValueAcrossKinds) {
         {kNan, std::numeric_limits<float>::quiet_NaN(), -kNan},
         {""},
         {Value::date(1)},
+        {Value::date(kNan), Value::date(-kNan)},
         {Value::data({})},
         {Value(Dictionary{})},
         {Value(Array{1, "a"}), Value(Array{1.0, "a"})},
