@@ -175,7 +175,8 @@ TEST(KeySetCache, MakesNoDifferenceButSharesKeySets) {
         Bytes bytes{static_cast<std::uint8_t>(0xA0 + entries)};
         std::set<std::string> keys;
         for (std::size_t entry = 0; entry < entries; ++entry) {
-            const std::string key = random.below(8) == 0 ? "key" + std::to_string(random.below(1500))
+            const std::string number = std::to_string(random.below(1500));
+            const std::string key = random.below(8) == 0 ? "equal ends " + number + " equal ends"
                                                          : std::string(1, "abcdefgh"[random.below(8)]);
             std::ranges::copy(written(Value(key)), std::back_inserter(bytes));
             std::ranges::copy(written(valueNamed(random.value(1))), std::back_inserter(bytes));

@@ -72,7 +72,7 @@ protected:
         const std::string& name = key();
         const std::size_t other = below(kChanging + 1);
         const std::size_t place = below(std::max<std::size_t>(model.size(), 1));
-        switch (below(12)) {
+        switch (below(11)) {
         case 0:
             dictionary.merge(dictionaries_[other]);
             for (const auto& [theirs, their] : Model(models_[other])) {
@@ -111,7 +111,6 @@ protected:
             break;
         case 6:
         case 7:
-        case 8:
             ASSERT_EQ(dictionary.remove(name), model.erase(name) == 1);
             break;
         default:

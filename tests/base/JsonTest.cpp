@@ -23,8 +23,6 @@ using test::repeated;
 using testing::AnyOf;
 using testing::HasSubstr;
 
-constexpr double kInfinity = std::numeric_limits<double>::infinity();
-
 /// An array is refused for the same reason when it is read element by element.
 void expectSameByElements(const std::string& element) {
     const std::string text = "[" + element + "]";
@@ -56,7 +54,7 @@ TEST(JsonWriter, GivesEveryKindItsForm) {
         {9007199254740992.0, "9007199254740992.0"},
         {16777216.0F, "16777216.0"},
         {Value::date(1772366400.25), "\"2026-03-01T12:00:00.250Z\""},
-        {Value::date(kInfinity), "null"},
+        {Value::date(1e300), "null"},
         {Value::data(bytes), "\"AP8QgA==\""}};
     for (const auto& [value, text] : rows) {
         EXPECT_EQ(jsonText(value), text);
@@ -148,9 +146,11 @@ TEST(JsonReader, SaysWhatIsWrongAndWhere) {
         {repeated("{\"\":", 200'000), 1, 129, "deeper than 32"},
     };
     for (const auto& row : rows) {
-        const auto [line, column, message] = std::get<JsonError>(readJson(row.text));
-        EXPECT_EQ(std::tie(line, column), std::tie(row.line, row.column)) << row.text;
-        EXPECT_THAT(message, HasSubstr(row.says)) << row.text;
+        const auto outcome = readJson(row.text);
+        const auto* const error = std::get_if<JsonError>(&outcome);
+        ASSERT_TRUE(error != nullptr) << row.text;
+        EXPECT_EQ(std::tie(error->line, error->column), std::tie(row.line, row.column)) << row.text;
+        EXPECT_THAT(error->message, HasSubstr(row.says)) << row.text;
         expectSameByElements(row.text);
     }
     EXPECT_EQ(std::get<JsonError>(readJson("{\"a\":\n[1, null]}", {.refuseNull = true})).column, 5U);

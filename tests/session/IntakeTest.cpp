@@ -5,7 +5,6 @@
 #include <gmock/gmock.h>
 
 #include <cmath>
-#include <limits>
 #include <random>
 
 namespace tamblo {
@@ -131,9 +130,9 @@ TEST_F(IntakeTest, TheIndexSaysWhatAWalkOverTheListWouldAlsoAfterTheSort) {
 }
 
 TEST_F(IntakeTest, SortingKeepsTheOrderOfEqualTimesAndTakesNoNumberForZero) {
-    const double kNaN = std::numeric_limits<double>::quiet_NaN();
     std::vector<MessageRef> messages;
-    for (const Value& time : {Value(3.0), Value(1.0), Value(kNaN), Value(3.0), Value(-1.0), Value("soon")}) {
+    for (const Value& time :
+         {Value(3.0), Value(1.0), Value(std::nan("")), Value(3.0), Value(-1.0), Value("soon")}) {
         messages.push_back(messageOf({{"n", messages.size() + 1}, {"zrreporting_timestamp", time}}));
     }
     EXPECT_TRUE(ZRReportingSessionMessage::sortMessages(messages));

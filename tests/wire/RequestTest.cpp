@@ -120,32 +120,33 @@ TEST(Reply, EveryResultIsReadAsItWasWritten) {
                                             Array(numbers.begin(), numbers.end())};
     const std::string errors[] = {"a.domain -32601 why", "b.domain 1 ",
                                   "com.vandra.tamblo.protocol -32600 the result is too long"};
+    const std::uint64_t ids[] = {70'000, ~0ULL, 23, 24, 255, 256, 65'535, 7};
     TextBuffer out;
-    appendNullReply(out, 0);
-    appendBooleanReply(out, 1, true);
-    appendUnsignedReply(out, 2, 65535);
-    appendDictionaryReply(out, 3, dictionary);
-    appendIntegersReply(out, 4, numbers);
-    appendErrorReply(out, 5, {"a.domain", -32601, "why"});
-    appendErrorReply(out, 6, {"b.domain", 1, ""});
-    appendDictionaryReply(out, 7, {{"k", std::string(kMaximumFrameBytes, 'x')}});
+    appendNullReply(out, ids[0]);
+    appendBooleanReply(out, ids[1], true);
+    appendUnsignedReply(out, ids[2], 65535);
+    appendDictionaryReply(out, ids[3], dictionary);
+    appendIntegersReply(out, ids[4], numbers);
+    appendErrorReply(out, ids[5], {"a.domain", -32601, "why"});
+    appendErrorReply(out, ids[6], {"b.domain", 1, ""});
+    appendDictionaryReply(out, ids[7], {{"k", std::string(kMaximumFrameBytes, 'x')}});
     FrameSplitter frames(out.bytes());
-    std::uint64_t id = 0;
-    for (; const auto frame = frames.next(); ++id) {
+    std::size_t i = 0;
+    for (; const auto frame = frames.next(); ++i) {
         const auto reply = decodeReply(*frame);
         ASSERT_TRUE(reply);
-        EXPECT_EQ(reply->id, id);
-        EXPECT_EQ(reply->result, id < 5 ? results[id] : std::nullopt);
-        ASSERT_EQ(reply->error.has_value(), id >= 5);
-        if (id >= 5) {
+        EXPECT_EQ(reply->id, ids[i]);
+        EXPECT_EQ(reply->result, i < 5 ? results[i] : std::nullopt);
+        ASSERT_EQ(reply->error.has_value(), i >= 5);
+        if (i >= 5) {
             const auto& [domain, code, message] = *reply->error;
-            EXPECT_EQ(domain + " " + std::to_string(code) + " " + message, errors[id - 5]);
+            EXPECT_EQ(domain + " " + std::to_string(code) + " " + message, errors[i - 5]);
         }
         for (std::size_t cut = 0; cut < frame->size(); ++cut) {
             EXPECT_FALSE(decodeReply(frame->first(cut)));
         }
     }
-    EXPECT_EQ(id, 8U);
+    EXPECT_EQ(i, 8U);
 }
 
 } // namespace
