@@ -167,8 +167,8 @@ TEST(DataSerializeTest, EveryKindOfValue) {
     EXPECT_EQ(DataSerialize::getDataXMLInfo(list), expected);
     EXPECT_EQ(DataSerialize::getXMLInfo(list), std::nullopt) << "not ASCII";
     EXPECT_EQ(DataSerialize::getXMLInfo("x"), DataSerialize::getDataXMLInfo("x"));
-    EXPECT_THAT(*DataSerialize::getPlistBlob(list), testing::ElementsAreArray(expected));
-    EXPECT_TRUE(DataSerialize::getBase64XMLBlob(true)->starts_with("PD94bWwgdmVyc2lvbj0i"));
+    EXPECT_THAT(DataSerialize::getPlistBlob(list).value(), testing::ElementsAreArray(expected));
+    EXPECT_TRUE(DataSerialize::getBase64XMLBlob(true).value().starts_with("PD94bWwgdmVyc2lvbj0i"));
     EXPECT_EQ(DataSerialize::getPlistBlob(Array{Dictionary{{"a", "\x01"}}}), std::nullopt);
 }
 
