@@ -86,11 +86,12 @@ TEST(Request, WhatIsRefusedNamesItsReason) {
     Request request;
     for (const auto& [code, id, mentions, hex] : cases) {
         SCOPED_TRACE(hex);
-        const auto refusal = decodeRequest(fromHex(hex), keySets, request).value();
-        EXPECT_EQ(refusal.error.code, code);
-        EXPECT_EQ(refusal.id, id);
-        EXPECT_EQ(refusal.endsConnection, code == kNotWellFormed);
-        EXPECT_THAT(refusal.error.message, testing::HasSubstr(mentions));
+        const auto refusal = decodeRequest(fromHex(hex), keySets, request);
+        ASSERT_TRUE(refusal);
+        EXPECT_EQ(refusal->error.code, code);
+        EXPECT_EQ(refusal->id, id);
+        EXPECT_EQ(refusal->endsConnection, code == kNotWellFormed);
+        EXPECT_THAT(refusal->error.message, testing::HasSubstr(mentions));
     }
 }
 
