@@ -107,19 +107,16 @@ TEST_F(SessionTest, OwnRecordsOfStartAndStop) {
     session->start();
     session->start();
     ASSERT_EQ(session->messages().size(), 3U);
-    EXPECT_EQ(session->messages()[0]->payload(),
-              (Dictionary{{"method", "stop"},
-                          {"messages_at_stop", 0},
-                          {"unique_messages_at_stop", 0},
-                          {"reporterid", 77},
-                          {"running_at_stop", "NO"},
-                          {"zrreporting_timestamp", device.clock.seconds()},
-                          {"invalid_timestamp", "nil"},
-                          {"audiotag", "SetupStop"}}));
-    for (const std::size_t start : {1U, 2U}) {
-        EXPECT_EQ(shown(session->messages()[start]->payload(),
-                        {"messages_at_start", "unique_messages_at_start", "running_at_start", "audiotag"}),
-                  start == 1 ? R"(1 1 "NO" "SetupStart")" : R"(2 2 "YES" "SetupStart")");
+    const char* const rows[] = {R"("stop" 0 0 77 "NO" "nil" "SetupStop")",
+                                R"("start" 1 1 77 "NO" "nil" "SetupStart")",
+                                R"("start" 2 2 77 "YES" "nil" "SetupStart")"};
+    for (std::size_t i = 0; i < 3; ++i) {
+        const Dictionary& payload = session->messages()[i]->payload();
+        const std::string suffix = i == 0 ? "_at_stop" : "_at_start";
+        EXPECT_EQ(shown(payload, {"method", "messages" + suffix, "unique_messages" + suffix, "reporterid",
+                                  "running" + suffix, "invalid_timestamp", "audiotag"}),
+                  rows[i]);
+        EXPECT_EQ(*payload.find("zrreporting_timestamp"), Value(device.clock.seconds()));
     }
 
     // They are what a client's message of their kind is compared with.
