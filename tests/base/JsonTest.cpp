@@ -7,6 +7,7 @@
 #include <nlohmann/json.hpp>
 
 #include <array>
+#include <bit>
 #include <charconv>
 #include <cmath>
 #include <limits>

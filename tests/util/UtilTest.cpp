@@ -10,7 +10,10 @@
 #include <gmock/gmock.h>
 
 #include <limits>
+#include <optional>
+#include <string>
 #include <thread>
+#include <tuple>
 #include <vector>
 
 namespace tamblo {
