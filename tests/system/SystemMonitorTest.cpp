@@ -1,37 +1,37 @@
-#include "session/ZRReportingSession.h"
 #include "system/ZRReportingSystemMonitor.h"
-#include "tests/fakes/FakePlatform.h"
-#include "tests/fakes/Messages.h"
+#include "tests/workers/WorkerTest.h"
 
-#include <gmock/gmock.h>
-
+#include <cctype>
 #include <optional>
-#include <string>
 #include <thread>
-#include <vector>
 
 namespace tamblo {
 namespace {
 
-using testing::ElementsAre;
-using testing::IsEmpty;
-
 constexpr const char* kSpatial = "spatial-audio-accessory-feature";
 constexpr const char* kRinger = "com.vandra.dashlo.ringerstate";
 constexpr const char* kReporting = "com.vandra.tamblo.reporting";
+constexpr WallTime kStart{1'772'366'400s}; ///< of the fake clock
 
-class SystemMonitorTest : public testing::Test {
+class SystemMonitorTest : public WorkerTest {
 protected:
-    std::shared_ptr<SystemMonitorDictionary> makeMonitor() {
-        ZRReportingSystemMonitor::initializeWithQueue(device.context(), device.serverQueue());
+    auto newMonitor() {
+        return ZRReportingSystemMonitor::initWithQueue(device.services(), device.serverQueue());
+    }
+    /// The context's.
+    std::shared_ptr<SystemMonitorDictionary> snapshot() {
         return ZRReportingSystemMonitor::getSystemMonitorDictionary(device.context());
     }
-    /// A second later, so that the reading differs from the one before; the time of the reading.
-    double post(const std::string& name, std::uint64_t word) {
-        device.clock.advance(std::chrono::seconds(1));
+    std::shared_ptr<SystemMonitorDictionary> makeMonitor() {
+        ZRReportingSystemMonitor::initializeWithQueue(device.context(), device.serverQueue());
+        return snapshot();
+    }
+    void setName(Value name) { device.preferences.set("device_name", "com.vandra.tamblo", std::move(name)); }
+    /// By default a second later, so that the reading differs from the one before.
+    void post(const std::string& name, std::uint64_t word, std::chrono::seconds later = 1s) {
+        device.clock.advance(later);
         device.namedNotifications.post(name, word);
         (void)device.serverQueue().runAll();
-        return device.clock.seconds();
     }
     /// A feature's state as it would be read now.
     Dictionary stateNow(std::string_view feature, Value value) {
@@ -39,35 +39,50 @@ protected:
                 {"zrreporting_timestamp", device.clock.seconds()},
                 {"systemuptime_sec", static_cast<int>(device.processInformation.uptime.count() + 0.5)}};
     }
-
-    FakePlatform device;
+    /// The values that the session was sent, "@" when they were read and ">" when they were sent, in seconds.
+    static std::string toldTo(const std::shared_ptr<ZRReportingSession>& listener) {
+        std::string told;
+        for (const MessageRef& message :
+             listener != nullptr ? listener->messages() : std::vector<MessageRef>()) {
+            const Dictionary& payload = message->payload();
+            if (message->category() == 8 && message->type() == 5) {
+                const auto time = [&payload](std::string_view key) {
+                    return std::to_string(
+                        std::lround(payload.find(key)->doubleValue() - secondsSince1970(kStart)));
+                };
+                told += shown(payload, {"device_name", "ringerstate"}) + "@" + time("last_updated") + ">" +
+                        time("zrreporting_timestamp") + " ";
+            }
+        }
+        return told;
+    }
 };
 
 TEST_F(SystemMonitorTest, ReadsPreferencesAtOnceAndTheRingerAtItsFirstNotification) {
     const Value spatial(Dictionary{{"mode", "fixed"}});
     device.preferences.set(kSpatial, "com.vandra.dashlo", spatial);
-    device.preferences.set("device_name", "com.vandra.tamblo", 42);
+    setName(42);
     device.processInformation.uptime = std::chrono::duration<double>(99.5);
     device.namedNotifications.post(kRinger, 1); // before anybody listens
-    const auto snapshot = makeMonitor();
+    const auto states = makeMonitor();
     const Dictionary name = stateNow("device_name", 42);
-    EXPECT_EQ(snapshot->find(kSpatial), stateNow(kSpatial, spatial));
-    EXPECT_EQ(snapshot->find("device_name"), name) << "as it is stored";
-    EXPECT_TRUE(snapshot->find("ringerstate").empty());
-    device.preferences.set("device_name", "com.vandra.tamblo", "den");
+    EXPECT_EQ(states->find(kSpatial), stateNow(kSpatial, spatial));
+    EXPECT_EQ(states->find("device_name"), name) << "as it is stored";
+    EXPECT_TRUE(states->find("ringerstate").empty());
+    setName("den");
     post(kRinger, 1);
-    EXPECT_EQ(snapshot->find("ringerstate"), stateNow("ringerstate", true));
-    EXPECT_EQ(snapshot->find("device_name"), name) << "read at its own notification alone";
+    EXPECT_EQ(states->find("ringerstate"), stateNow("ringerstate", true));
+    EXPECT_EQ(states->find("device_name"), name) << "read at its own notification alone";
     post(kReporting, 0);
     const Dictionary den = stateNow("device_name", "den");
-    EXPECT_EQ(snapshot->find("device_name"), den);
+    EXPECT_EQ(states->find("device_name"), den);
     device.preferences.remove("device_name", "com.vandra.tamblo");
     post(kReporting, 0);
-    EXPECT_EQ(snapshot->find("device_name"), den) << "a value that is gone leaves the previous state";
+    EXPECT_EQ(states->find("device_name"), den) << "a value that is gone leaves the previous state";
 }
 
-TEST_F(SystemMonitorTest, RingerIsOnForTheWordOneOnly) {
-    const auto monitor = ZRReportingSystemMonitor::initWithQueue(device.services(), device.serverQueue());
+TEST_F(SystemMonitorTest, RingerIsOnForTheWordOneOnlyAndUnknownWithoutANotification) {
+    const auto monitor = newMonitor();
     EXPECT_EQ(monitor->getFeatureState("ringerstate"), std::nullopt) << "never posted: the read fails";
     for (const std::uint64_t word : {1UL, 0UL, 2UL, UINT64_MAX, (1UL << 32U) + 1}) {
         post(kRinger, word);
@@ -79,32 +94,26 @@ TEST_F(SystemMonitorTest, RingerIsOnForTheWordOneOnly) {
     EXPECT_EQ(device.namedNotifications.registrationCount(), 0U);
     EXPECT_EQ(monitor->getFeatureState("ringerstate"), std::nullopt);
     EXPECT_FALSE(monitor->systemMonitorDictionary()->find("ringerstate").empty());
-}
 
-TEST_F(SystemMonitorTest, FailedRegistrationsAreLoggedAndNeverValued) {
     device.namedNotifications.registrationStatus = 7;
-    device.preferences.set("device_name", "com.vandra.tamblo", "den");
-    const auto monitor = ZRReportingSystemMonitor::initWithQueue(device.services(), device.serverQueue());
+    setName("den");
+    const auto deaf = newMonitor();
     EXPECT_EQ(device.log.count("notify setup result 7 token 0"), 3U);
     post(kRinger, 1);
-    EXPECT_TRUE(monitor->systemMonitorDictionary()->find("ringerstate").empty());
-    EXPECT_EQ(monitor->getFeatureState("ringerstate"), std::nullopt);
-    EXPECT_FALSE(monitor->systemMonitorDictionary()->find("device_name").empty());
+    EXPECT_TRUE(deaf->systemMonitorDictionary()->find("ringerstate").empty());
+    EXPECT_FALSE(deaf->systemMonitorDictionary()->find("device_name").empty());
 }
 
 TEST_F(SystemMonitorTest, DefaultsAreReadOnce) {
-    const auto make = [&] {
-        return ZRReportingSystemMonitor::initWithQueue(device.services(), device.serverQueue());
-    };
-    const auto unset = make();
-    device.preferences.set("device_name", "com.vandra.tamblo", 42);
+    const auto unset = newMonitor();
+    setName(42);
     device.preferences.set("disable_reporting", "com.vandra.tamblo", "YES");
     EXPECT_EQ(unset->getDefaults(), (Dictionary{{"disable_reporting", false}}));
-    EXPECT_EQ(make()->getDefaults(), (Dictionary{{"device_name", "42"}, {"disable_reporting", true}}));
+    EXPECT_EQ(newMonitor()->getDefaults(), (Dictionary{{"device_name", "42"}, {"disable_reporting", true}}));
 }
 
 TEST_F(SystemMonitorTest, OneForTheProcessUntilItIsReset) {
-    EXPECT_EQ(ZRReportingSystemMonitor::getSystemMonitorDictionary(device.context()), nullptr);
+    EXPECT_EQ(snapshot(), nullptr);
     EXPECT_THAT(ZRReportingSystemMonitor::getSystemMonitorKeys(device.context()), IsEmpty());
     ZRReportingSystemMonitor::reset(device.context());
     {
@@ -117,13 +126,12 @@ TEST_F(SystemMonitorTest, OneForTheProcessUntilItIsReset) {
     EXPECT_THAT(ZRReportingSystemMonitor::getSystemMonitorKeys(device.context()),
                 ElementsAre("device_name", "ringerstate", kSpatial));
 
-    const auto first = ZRReportingSystemMonitor::getSystemMonitorDictionary(device.context());
+    const auto first = snapshot();
     FakeSerialQueue other("other");
     ZRReportingSystemMonitor::initializeWithQueue(device.context(), other);
-    EXPECT_EQ(ZRReportingSystemMonitor::getSystemMonitorDictionary(device.context()), first);
+    EXPECT_EQ(snapshot(), first);
     device.namedNotifications.post(kRinger, 1);
-    EXPECT_EQ(other.runAll(), 0U);
-    EXPECT_TRUE(first->find("ringerstate").empty()) << "the first queue runs the handler";
+    EXPECT_EQ(other.runAll(), 0U) << "the first queue runs the handler";
 
     ZRReportingSystemMonitor::reset(device.context()); // with a notification on its way
     EXPECT_EQ(device.namedNotifications.registrationCount(), 0U);
@@ -135,177 +143,113 @@ TEST_F(SystemMonitorTest, OneForTheProcessUntilItIsReset) {
 
 /// Notes each call, then does what the test wants.
 struct Observer final : SystemMonitorDictionary::KeyObserver {
-    Observer(std::string observerName, std::vector<std::string>& observerCalls)
+    Observer(std::string observerName, std::string& observerCalls)
         : name(std::move(observerName)), calls(observerCalls) {}
     void keyValueChanged(std::string_view) override {
-        calls.push_back(name);
+        calls += name + " ";
         if (act) {
             act();
         }
     }
-    void observe(SystemMonitorDictionary& snapshot, std::string_view key) {
-        observation.emplace(snapshot.addKeyObserver(*this, key));
+    void observe(SystemMonitorDictionary& states, std::string_view key) {
+        observation.emplace(states.addKeyObserver(*this, key));
     }
 
-    std::string name;
-    std::vector<std::string>& calls;
+    const std::string name;
+    std::string& calls;
     std::function<void()> act;
     std::optional<SystemMonitorDictionary::Observation> observation;
 };
 
 TEST(SystemMonitorDictionaryTest, ObserversMayComeAndGoWhileTheyAreCalled) {
-    const auto snapshot = std::make_shared<SystemMonitorDictionary>();
-    std::vector<std::string> calls;
+    const auto states = std::make_shared<SystemMonitorDictionary>();
+    std::string calls;
     Observer a("a", calls), b("b", calls), c("c", calls), late("late", calls), elsewhere("elsewhere", calls);
-    snapshot->set("key", {{"key", 0}});
-    a.observe(*snapshot, "key");
-    b.observe(*snapshot, "key");
-    c.observe(*snapshot, "key");
-    elsewhere.observe(*snapshot, "other");
-    EXPECT_THAT(calls, IsEmpty()) << "what stands there already is not told";
+    states->set("key", {{"key", 0}});
+    a.observe(*states, "key");
+    b.observe(*states, "key");
+    c.observe(*states, "key");
+    elsewhere.observe(*states, "other");
+    EXPECT_EQ(calls, "") << "what stands there already is not told";
 
     a.act = [&] {
         a.observation.reset();
         b.observation.reset();
-        late.observe(*snapshot, "key");
-        EXPECT_EQ(snapshot->find("key"), (Dictionary{{"key", 1}})) << "stored before it is told";
+        late.observe(*states, "key");
+        EXPECT_EQ(states->find("key"), (Dictionary{{"key", 1}})) << "stored before it is told";
     };
-    snapshot->set("key", {{"key", 1}});
-    EXPECT_THAT(std::exchange(calls, {}), ElementsAre("a", "c"));
+    states->set("key", {{"key", 1}});
+    EXPECT_EQ(calls, "a c ");
     c.act = [&] {
         c.act = nullptr;
-        snapshot->set("key", {{"key", 3}});
+        states->set("key", {{"key", 3}});
     };
-    snapshot->set("key", {{"key", 2}});
-    EXPECT_THAT(std::exchange(calls, {}), ElementsAre("c", "c", "late", "late"));
-
-    c.observation.reset();
-    late.observation.reset();
-    const auto moved = std::move(*elsewhere.observation);
-    elsewhere.observation.reset();
-    EXPECT_EQ(snapshot->observationCount(), 1U);
-    snapshot->set("other", {{"other", 1}});
-    EXPECT_THAT(calls, ElementsAre("elsewhere"));
+    states->set("key", {{"key", 2}});
+    EXPECT_EQ(calls, "a c c c late late ");
 }
 
 TEST(SystemMonitorDictionaryTest, EndingAnObservationWaitsForACallOnAnotherThread) {
-    const auto snapshot = std::make_shared<SystemMonitorDictionary>();
-    std::vector<std::string> calls; // unguarded: the race detector watches
+    const auto states = std::make_shared<SystemMonitorDictionary>();
+    std::string calls; // unguarded: the race detector watches
     for (int round = 0; round != 200; ++round) {
         auto observer = std::make_unique<Observer>("it", calls);
-        observer->observe(*snapshot, "key");
-        std::thread storing([&] { snapshot->set("key", {{"key", round}}); });
+        observer->observe(*states, "key");
+        std::thread storing([&] { states->set("key", {{"key", round}}); });
         observer.reset();
         storing.join();
     }
-    EXPECT_EQ(snapshot->observationCount(), 0U);
+    EXPECT_EQ(states->observationCount(), 0U);
 }
 
-/// Sessions with their real workers beside a monitor.
-class SystemMonitorWorkerTest : public SystemMonitorTest {
-protected:
-    SystemMonitorWorkerTest() { (void)makeMonitor(); }
-
-    std::shared_ptr<ZRReportingSession> startedSession() {
-        auto session = device.makeSession();
-        session->start();
-        return session;
-    }
-    /// The messages that the worker sent.
-    static std::vector<Dictionary> sent(const std::shared_ptr<ZRReportingSession>& session) {
-        std::vector<Dictionary> payloads;
-        for (const MessageRef& message : session->messages()) {
-            if (message->category() == 8 && message->type() == 5) {
-                payloads.push_back(message->payload());
-            }
+TEST_F(SystemMonitorTest, SessionsAreToldWhatIsKnownAtTheStartAndEveryChangeAfter) {
+    const struct {
+        const char* what;
+        const char* script; ///< "a+" starts session a, "a-" stops it, "a!" drops it; a number is seconds
+        const char* told;   ///< what each session was told, then the observations that there are
+    } cases[] = {
+        {"the ringer once it was signalled; the same reading at the same time is no change",
+         "monitor name 10 a+ b+ ring again c+",
+         R"(a "den"@1>11 true@12>12 b "den"@1>11 true@12>12 c "den"@1>12 true@12>12 : 9)"},
+        {"a stopped session hears nothing until it starts again", "monitor a+ b+ a- ring 3 a+ quiet",
+         "a true@1>4 false@5>5 b true@1>1 false@5>5 : 6"},
+        {"one that is dropped while it is started leaves nothing behind", "monitor a+ a! ring b+ quiet",
+         "a b true@1>1 false@2>2 : 3"},
+        {"workers keep the snapshot that they found, or none",
+         "monitor ring a+ reset b+ monitor quiet 1 a- a+ c+", "a true@1>3 b c false@2>3 : 3"},
+    };
+    for (const auto& row : cases) {
+        session.reset();
+        device.restart();
+        device.clock.set(kStart);
+        device.preferences.remove("device_name", "com.vandra.tamblo");
+        std::map<char, std::shared_ptr<ZRReportingSession>> sessions;
+        playWords(
+            row.script,
+            {{"monitor", [this] { (void)makeMonitor(); }},
+             {"reset", [this] { ZRReportingSystemMonitor::reset(device.context()); }},
+             {"name",
+              [this] {
+                  setName("den");
+                  post(kReporting, 0);
+              }},
+             {"ring", [this] { post(kRinger, 1); }},
+             {"again", [this] { post(kRinger, 1, 0s); }},
+             {"quiet", [this] { post(kRinger, 0); }}},
+            [&](const std::string& word) {
+                if (std::isdigit(word.front()) != 0) {
+                    device.clock.advance(std::chrono::seconds(std::stoi(word)));
+                    return;
+                }
+                std::shared_ptr<ZRReportingSession>& meant = sessions[word.front()];
+                meant = meant == nullptr ? makeSession() : meant;
+                word.back() == '+' ? meant->start() : word.back() == '-' ? meant->stop() : meant.reset();
+            });
+        std::string told;
+        for (const auto& [name, listener] : sessions) {
+            told += std::string(1, name) + " " + toldTo(listener);
         }
-        return payloads;
+        EXPECT_EQ(told + ": " + std::to_string(snapshot()->observationCount()), row.told) << row.what;
     }
-    /// A message of the worker's as the session keeps it, sent now.
-    Dictionary message(std::string_view feature, Value value, double lastUpdated) {
-        return {{feature, std::move(value)},
-                {"last_updated", lastUpdated},
-                {"zrreporting_timestamp", device.clock.seconds()},
-                {"audiotag", "SetupSetup"},
-                {"invalid_timestamp", "nil"}, // it comes without one
-                {"HostApplicationDisplayID", "Unknown"}};
-    }
-    std::size_t observationCount() {
-        return ZRReportingSystemMonitor::getSystemMonitorDictionary(device.context())->observationCount();
-    }
-
-    static constexpr std::size_t kObservations = 3; ///< of a started session
-};
-
-TEST_F(SystemMonitorWorkerTest, TellsWhatIsKnownAtTheStartAndEveryChangeAfter) {
-    device.preferences.set("device_name", "com.vandra.tamblo", "den");
-    const double named = post(kReporting, 0);
-    device.clock.advance(std::chrono::seconds(10));
-    const auto first = startedSession();
-    EXPECT_THAT(sent(first), ElementsAre(message("device_name", "den", named)))
-        << "the ringer has never been signalled";
-    const auto second = startedSession();
-    EXPECT_EQ(observationCount(), 2 * kObservations);
-
-    const double signalled = post(kRinger, 1);
-    const Dictionary ringer = message("ringerstate", true, signalled);
-    for (const auto& session : {first, second}) {
-        EXPECT_THAT(sent(session), ElementsAre(testing::_, ringer));
-        EXPECT_EQ(session->previousValues().find("last_updated")->doubleValue(), signalled);
-    }
-    device.namedNotifications.post(kRinger, 1);
-    (void)device.serverQueue().runAll();
-    EXPECT_EQ(first->totalMessageCount(), 2) << "the same reading at the same time is no change";
-
-    const auto third = startedSession();
-    EXPECT_THAT(sent(third), testing::UnorderedElementsAre(message("device_name", "den", named), ringer));
-    EXPECT_EQ(device.analyticsEvents.payloads("com.vandra.tamblo.Setup.Setup").size(), 6U)
-        << "consumers see the messages like any other";
-}
-
-TEST_F(SystemMonitorWorkerTest, StoppedSessionHearsNothingUntilItStartsAgain) {
-    const auto session = startedSession();
-    const auto other = startedSession();
-    session->stop();
-    EXPECT_EQ(observationCount(), kObservations);
-    const double signalled = post(kRinger, 1);
-    EXPECT_EQ(session->totalMessageCount(), 0);
-    EXPECT_EQ(other->totalMessageCount(), 1);
-    device.clock.advance(std::chrono::seconds(3));
-    session->start();
-    EXPECT_THAT(sent(session), ElementsAre(message("ringerstate", true, signalled)));
-    post(kRinger, 0);
-    EXPECT_EQ(session->totalMessageCount(), 2);
-}
-
-TEST_F(SystemMonitorWorkerTest, SessionThatIsDroppedWhileStartedLeavesNothingBehind) {
-    auto session = startedSession();
-    const std::weak_ptr<ZRReportingSession> watched = session;
-    session.reset();
-    EXPECT_TRUE(watched.expired());
-    EXPECT_EQ(observationCount(), 0U);
-    post(kRinger, 1);
-    const auto survivor = startedSession();
-    post(kRinger, 0);
-    EXPECT_EQ(survivor->totalMessageCount(), 2);
-}
-
-TEST_F(SystemMonitorWorkerTest, WorkersKeepTheSnapshotThatTheyFound) {
-    const double signalled = post(kRinger, 1);
-    const auto session = startedSession();
-    ZRReportingSystemMonitor::reset(device.context());
-    const auto between = startedSession();
-    EXPECT_THAT(sent(between), IsEmpty()) << "no monitor, no features";
-    (void)makeMonitor();
-    post(kRinger, 0);
-    EXPECT_EQ(session->totalMessageCount(), 1);
-    EXPECT_EQ(between->totalMessageCount(), 0);
-    EXPECT_EQ(observationCount(), 0U);
-    session->stop();
-    session->start();
-    EXPECT_THAT(sent(session), ElementsAre(message("ringerstate", true, signalled)))
-        << "the old monitor's last reading";
-    EXPECT_EQ(sent(startedSession()).size(), 1U);
 }
 
 } // namespace

@@ -3,10 +3,11 @@
 #include "tests/fakes/FakePlatform.h"
 #include "tests/fakes/Messages.h"
 #include "util/Log.h"
-#include "util/LogCategories.h"
 
 #include <gmock/gmock.h>
 
+#include <chrono>
+#include <cmath>
 #include <functional>
 #include <map>
 #include <memory>
@@ -14,10 +15,65 @@
 #include <string>
 #include <string_view>
 #include <utility>
+#include <vector>
 
 #include <sys/types.h>
 
 namespace tamblo {
+
+using namespace std::chrono_literals;
+using testing::ElementsAre, testing::IsEmpty, testing::SizeIs;
+
+/// "10 out volume=0.5": a timestamp after the start, "-" for none, then keys, some by short names, each with
+/// its value in JSON, or a word; without one it is true.
+inline Dictionary payloadOf(const std::string& text, double start = 0) {
+    static const std::map<std::string, std::string, std::less<>> longNames{
+        {"out", "session_output_running"},
+        {"in", "session_input_running"},
+        {"group", "kaleen_session"},
+        {"length", "session_duration"},
+        {"volume", "QVSessionVolume"},
+        {"devices", "active_devices"},
+        {"format", "session_selected_format"},
+        {"formatID", "mFormatID"},
+        {"channels", "mChannelsPerFrame"},
+        {"ringer", "ringerstate"},
+        {"spatial", "spatializationEnabled"},
+        {"feature", "spatial-audio-accessory-feature"},
+        {"vocoder", "vp_config_primary_vocoder"},
+        {"rate", "vp_config_primary_vocoderFs"}};
+    const auto valueOf = [](const std::string& word) {
+        const auto read = readJson(word);
+        const Value* value = std::get_if<Value>(&read);
+        return word == "nan" ? Value(NAN) : value != nullptr ? *value : Value(word);
+    };
+    Dictionary payload;
+    std::istringstream words(text);
+    std::string word;
+    words >> word;
+    if (const Value time = valueOf(word); word != "-") {
+        payload.set("zrreporting_timestamp", time.isNumber() ? Value(start + time.doubleValue()) : time);
+    }
+    while (words >> word) {
+        const std::size_t end = word.find('=');
+        const std::string name = word.substr(0, end);
+        payload.set(lookUp(longNames, name).value_or(name),
+                    end == std::string::npos ? Value(true) : valueOf(word.substr(end + 1)));
+    }
+    return payload;
+}
+
+/// Several of them, with semicolons between. Their categories are their numbers, from 1.
+inline std::vector<MessageRef> messagesOf(const std::string& texts, double start = 0,
+                                          AudioEventType type = AudioEventTypeGeneric) {
+    std::vector<MessageRef> messages;
+    std::istringstream payloads(texts);
+    for (std::string text; std::getline(payloads, text, ';');) {
+        messages.push_back(
+            messageOf(payloadOf(text, start), static_cast<AudioEventCategory>(messages.size() + 1), type));
+    }
+    return messages;
+}
 
 inline constexpr pid_t kClient = 77;
 inline constexpr pid_t kOtherClient = 78;
@@ -36,6 +92,11 @@ protected:
         made->setServiceType(type);
         made->setClientProcessName("caller");
         made->updateConfigurationWithContentsOfConfiguration(configuration);
+        return made;
+    }
+    std::shared_ptr<ZRReportingSession> startedSession() {
+        auto made = makeSession();
+        made->start();
         return made;
     }
     /// A worker of the session that the session itself does not have.
