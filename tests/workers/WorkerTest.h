@@ -78,6 +78,13 @@ inline std::vector<MessageRef> messagesOf(const std::string& texts, double start
 inline constexpr pid_t kClient = 77;
 inline constexpr pid_t kOtherClient = 78;
 
+/// A row of a table: what is played, as a text, and what comes of it.
+struct Played {
+    const char* what;
+    const char* script;
+    const char* expected;
+};
+
 /// A device in memory and a session of two client processes on it. The one way for tests of workers to make
 /// sessions and workers.
 class WorkerTest : public testing::Test {

@@ -1,0 +1,340 @@
+#include "tests/workers/WorkerTest.h"
+#include "workers/sinks/ZRReportingSessionDPWorker.h"
+#include "workers/sinks/ZRReportingSessionQuilletWorker.h"
+#include "workers/sinks/ZRReportingSessionZephWorker.h"
+#include "workers/sinks/zeph/WorkerInstanceState.h"
+
+#include <thread>
+
+// The workers that draft bug reports, capture stacks and ask for bug captures.
+
+namespace tamblo {
+namespace {
+
+constexpr const char* kLastRun = "TalvixInvalidXyQLTlastRun";
+constexpr const char* kSize = "smallest_buffer_frame_size";
+constexpr const char* kCycle = "io_cycle";
+
+class CaptureTest : public WorkerTest {
+protected:
+    using Worker = ZRReportingSessionDPWorker;
+    CaptureTest() : WorkerTest(LogLevel::debug, true) {
+        prefer("TalvixInvalidXyBackOffSeconds", "60.5 s");
+        prefer("enable_stackburst", "YES");
+    }
+    void prefer(const std::string& key, Value value) {
+        device.preferences.set(key, "com.vandra.tamblo.zrreporting", std::move(value));
+    }
+    /// What a new worker makes of messages, which are told by their times: a "d" for each that is drafted,
+    /// a "." for each that is not. "x" has another key, "+" sets the clock on.
+    std::string drafts(const std::string& script) {
+        const auto worker = tryToMake<ZRReportingSessionQuilletWorker>();
+        std::string made;
+        playWords(script, {{"stop", [&worker] { worker->stop(); }}, {"drop", [this] { session.reset(); }}},
+                  [&](const std::string& word) {
+                      if (word.starts_with('+')) {
+                          device.clock.advance(std::chrono::milliseconds(std::stoi(word)));
+                          return;
+                      }
+                      const bool isOther = word.starts_with('x');
+                      const std::size_t before = device.bugReportDrafting.requests.size();
+                      worker->handleMessage(
+                          messageOf({{isOther ? "Tvac_invalid_x" : "tvac_invalid_x", 1},
+                                     {"zrreporting_timestamp", 1e9 + std::stod(word.substr(isOther))}}));
+                      made += device.bugReportDrafting.requests.size() == before ? "." : "d";
+                  });
+        return made;
+    }
+    /// Whether an overload with these is captured.
+    bool isCaptured(Worker& worker, const Dictionary& payload, AudioEventType type = 6,
+                    AudioEventCategory category = 7) {
+        const std::size_t before = device.diagnosticCapture.requests.size();
+        worker.handleMessage(messageOf(payload, category, type));
+        return device.diagnosticCapture.requests.size() != before;
+    }
+    const Dictionary overload{{kSize, 512}, {kCycle, 3}};
+};
+
+TEST_F(CaptureTest, DraftsFiveSecondsAfterTheFirstMessageOnceInARunAndInABackOffPeriod) {
+    const auto& requests = device.bugReportDrafting.requests;
+    EXPECT_EQ(drafts("0 5 x5.1 5.1 7 stop +60499 70 +1 70"), "...d..d");
+    EXPECT_EQ(requests.front().processName, "caller");
+    device.log.clear();
+    requests.front().completion("no disk");
+    EXPECT_EQ(loggedLevels(ZRReportingSessionCategory()), "e");
+
+    // Without a period, a run still has one draft; each message of interest moves the time on.
+    prefer("TalvixInvalidXyBackOffSeconds", 0);
+    prefer(kLastRun, Array{1});
+    EXPECT_EQ(drafts("0 drop +1000 6 +1000 6"), ".d.");
+    EXPECT_EQ(device.preferences.copyPreferenceValue(kLastRun, "com.vandra.tamblo.zrreporting"),
+              Value(device.clock.seconds()));
+    EXPECT_EQ(requests.back().processName, "");
+    EXPECT_EQ(loggedLevels(ZRReportingSessionCategory()), "es") << "the rubbish, the draft";
+}
+
+TEST_F(CaptureTest, CapturesOverloadsOfLargeBuffersAndCycles) {
+    EXPECT_FALSE(isCaptured(*tryToMake<Worker>(), overload, 6, 0x08000007));
+    EXPECT_FALSE(isCaptured(*tryToMake<Worker>(), overload, 5, 7));
+    const struct {
+        Value leastSize; ///< preferences
+        Value leastCycle;
+        Dictionary payload;
+        bool isCaptured;
+    } cases[] = {
+        {0, 0, {{kSize, 511}}, false},
+        {0, 0, {{kSize, 512}}, true},
+        {"64", 0, {{kSize, 63.9}}, false},
+        {"64", 0, {{kSize, "64"}}, true},
+        {-1, 0, {}, true},
+        {1, 0, {}, false},
+        {std::int64_t{1} << 40, 0, {{kSize, std::int64_t{1} << 32}}, true},
+        {1, 3, {{kSize, 1}, {kCycle, 2}}, false},
+        {1, 3, {{kSize, 1}, {kCycle, 3}}, true},
+        {1, -1, {{kSize, 1}, {kCycle, -2}}, false},
+    };
+    for (const auto& [leastSize, leastCycle, payload, isToBeCaptured] : cases) {
+        prefer("io_buffer_size", leastSize);
+        prefer("io_cycle", leastCycle);
+        EXPECT_EQ(isCaptured(*tryToMake<Worker>(), payload), isToBeCaptured)
+            << jsonText(leastSize) << jsonText(leastCycle) << jsonText(payload);
+    }
+}
+
+TEST_F(CaptureTest, NamesTheApplicationAndWaitsForMoreThanTenSeconds) {
+    const auto worker = tryToMake<Worker>();
+    Dictionary payload = overload;
+    payload.set("HostApplicationDisplayID", "com.a");
+    EXPECT_TRUE(isCaptured(*worker, payload));
+    device.clock.advance(10s);
+    EXPECT_FALSE(isCaptured(*worker, overload));
+    EXPECT_TRUE(isCaptured(*tryToMake<Worker>(), overload)) << "each worker counts for itself";
+    device.clock.advance(500ms);
+    EXPECT_TRUE(isCaptured(*worker, overload));
+    const auto& requests = device.diagnosticCapture.requests;
+    EXPECT_EQ(requests[0].payload, payload);
+    EXPECT_EQ(requests[0].reason, "com.a");
+    EXPECT_EQ(requests[1].reason, "(null)");
+    const std::string posted = "com.vandra.tamblo.dropped-stackburst";
+    EXPECT_THAT(device.namedNotifications.posted, ElementsAre(posted, posted, posted));
+}
+
+TEST_F(CaptureTest, WaitsAsLongAsWantedAndTheServerQueueMayThenBlock) {
+    const std::pair<Value, std::int64_t> cases[] = {
+        {0.9, 0}, {1'500'000.9, 1'500'000}, {-1, 0}, {4'294'967'296.0, 4'294'967'295}, {NAN, 0}};
+    for (const auto& [preference, microseconds] : cases) {
+        prefer("wait_time", preference);
+        const auto worker = tryToMake<Worker>();
+        const WallTime before = device.clock.now();
+        EXPECT_TRUE(isCaptured(*worker, overload));
+        EXPECT_EQ(device.clock.now() - before, std::chrono::microseconds(microseconds));
+        EXPECT_EQ(device.serverQueue().mayBlock, microseconds != 0) << microseconds;
+    }
+}
+
+TEST_F(CaptureTest, AValueOfTheWrongKindIsOneErrorLineUntilItChanges) {
+    const std::pair<Value, const char*> cases[] = {
+        // one line: it is no number; two: nor is it a flag
+        {" -.5", ""}, {"NO", "e"}, {"true", "e"}, {"", "ee"}, {Array{1}, "ee"},
+        {"7 x", ""},  {"NO", "e"}, {"-", "ee"},   {1.5, ""},  {Value::date(1), "ee"}};
+    for (const auto& [value, levels] : cases) {
+        prefer("io_cycle", value);
+        prefer("enable_stackburst", value);
+        device.log.clear();
+        for (int reading = 0; reading < 2; ++reading) {
+            EXPECT_EQ(Worker::getRunTimeDefaults(device.context(), "io_cycle"), value.integerValue());
+            EXPECT_EQ(Worker::getEnableFlag(device.context(), "enable_stackburst"), value.boolValue());
+        }
+        EXPECT_EQ(loggedLevels(ZRReportingDPLogCategory()), levels) << jsonText(value);
+    }
+}
+
+constexpr const char* kHapticKey = "Haptic_Active_Hardware_Time_Seconds";
+constexpr const char* kSoundKey = "System_Sound_Stuck_Time_Seconds";
+const Dictionary kLow{{"issue_type", "LowRMS"}};
+const Dictionary kOpened{{"success", true}, {"session_id", "S-1"}};
+
+class ZephWorkerTest : public WorkerTest {
+protected:
+    ZephWorkerTest() : WorkerTest(LogLevel::debug, true) {
+        device.deviceProperties.set("HapticLeakCapture", true);
+    }
+
+    void startSession(AudioServiceType type, bool isSingle = false) {
+        session = makeSession(type);
+        session->setIsSingleMessageSession(isSingle);
+        session->start();
+    }
+    void sendNow(const Dictionary& payload, AudioEventCategory category, AudioEventType type) {
+        device.clock.advance(1ms);
+        send(payload, category, type);
+    }
+    /// A number is a time in seconds.
+    void play(const std::string& script) {
+        playWords(script,
+                  {{"alarms", [this] { startSession(AudioServiceTypeAlarms); }},
+                   {"alerts", [this] { startSession(AudioServiceTypeAlerts); }},
+                   {"test", [this] { startSession(AudioServiceTypeTest); }},
+                   {"low", [this] { sendNow(kLow, AudioEventKindError, AudioEventTypeIssueDetector); }},
+                   {"haptic",
+                    [this] {
+                        sendNow({{kHapticKey, 90}}, 4, AudioEventTypeJoulery);
+                    }},
+                   {"sound",
+                    [this] {
+                        sendNow({{kSoundKey, 90}}, 4, AudioEventTypeJoulery);
+                    }},
+                   {"start", [this] { session->start(); }},
+                   {"stop", [this] { session->stop(); }},
+                   {"answered", [this] { device.bugCapture.answer(kOpened); }},
+                   {"failing",
+                    [this] {
+                        device.bugCapture.promptAnswer = Dictionary{{"reason", 1}};
+                    }},
+                   {"refused", [this] { device.bugCapture.accepts = false; }}},
+                  [this](const auto& word) { device.clock.advance(std::chrono::seconds(std::stoi(word))); });
+    }
+};
+
+TEST(WorkerInstanceStateTest, IsDueAtTheCountOrElseAfterTheTime) {
+    const struct {
+        std::optional<std::uint64_t> count;
+        std::optional<std::chrono::duration<double>> duration;
+        std::uint64_t seen;
+        std::chrono::nanoseconds since;
+        bool isDue;
+    } cases[] = {{3, {}, 2, 0s, false},    {3, {}, 3, 0s, true},         {1, 10s, 1, -1s, true},
+                 {0, 10s, 9, 10s, false},  {0, 10s, 1, 10s + 1ns, true}, {0, 10s, 9, -99s, false},
+                 {0, {}, 9, 9999h, false}, {{}, 1s, 9, 99s, false}};
+    for (const auto& [count, duration, seen, since, isDue] : cases) {
+        WorkerInstanceState state;
+        state.interestThresholdCount = count.value_or(state.interestThresholdCount);
+        state.interestThresholdDurationSeconds = duration.value_or(state.interestThresholdDurationSeconds);
+        state.interestedCount = seen;
+        state.interestFirstSeen = WallTime(1h);
+        EXPECT_EQ(state.isDue(WallTime(1h + since)), isDue) << seen << " " << since.count();
+    }
+}
+
+TEST_F(ZephWorkerTest, EachDetectorLooksAtItsOwnMessages) {
+    const struct {
+        AudioServiceType service;
+        AudioEventType type;
+        AudioEventCategory category;
+        Dictionary payload;
+        std::string interested;
+        bool isSingle = false;
+    } cases[] = {
+        {4, 8, 4, {{kHapticKey, "x"}, {kSoundKey, false}}, "HapticLeaks SSSLeaks "},
+        {2, 8, 0xFFFFFFFF, {{kHapticKey, 1}, {kSoundKey, 1}}, "HapticLeaks SSSLeaks ", true},
+        {4, 7, 11, {{kHapticKey, 1}, {kSoundKey, 1}}, ""},
+        {4, 7, 11, kLow, "AlarmLowRMS "},
+        {4, 7, 11, kLow, "", true},
+        {2, 7, 11, kLow, ""},
+        {4, 7, 0x0800000B, kLow, ""},
+        {4, 6, 11, kLow, ""},
+        {4, 7, 11, {{"issue_type", "lowRMS"}}, ""},
+    };
+    const std::string beginning = "Interested in message. instance=ZRReportingZephWorkerInstance";
+    for (const auto& row : cases) {
+        startSession(row.service, row.isSingle);
+        device.log.clear();
+        sendNow(row.payload, row.category, row.type);
+        std::string interested;
+        for (const std::string& line : device.log.texts(beginning)) {
+            interested += line.substr(beginning.size(), line.find(',') - beginning.size()) + " ";
+        }
+        EXPECT_EQ(interested, row.interested) << row.type << jsonText(row.payload);
+    }
+}
+
+TEST_F(ZephWorkerTest, DetectorsAskForCaptures) {
+    const Played cases[] = {
+        {"two leaks of haptics, over sessions; repeats count", "alerts haptic alarms haptic haptic haptic",
+         "snapshot haptics; snapshot haptics; "},
+        {"each stuck sound", "alerts sound", "snapshot systemsounds; "},
+        {"but none of 15 seconds", "alerts sound 14 alerts sound 0 sound", "snapshot systemsounds; "},
+        {"from the last capture on", "alerts sound 15 sound 10 sound 5 sound",
+         "snapshot systemsounds; snapshot systemsounds; snapshot systemsounds; "},
+        {"two low alarms are too few; over a stop, and once; not answered, nothing is cancelled",
+         "alarms low low stop start low low stop", "start alarms; "},
+        {"every later stop cancels again", "alarms low low low answered stop start low low low stop",
+         "start alarms; cancel S-1; cancel S-1; "},
+        {"a capture that failed is cancelled, too", "alarms failing low low low stop",
+         "start alarms; cancel NONE_RETURNED; "},
+        {"one that was refused is not", "alarms refused low low low stop", "start alarms; "},
+        {"a test goes as far as to make a reporter", "test low low low sound stop", ""},
+    };
+    FakeBugCaptureService& captures = device.bugCapture;
+    for (const auto& row : cases) {
+        session.reset();
+        device.restart();
+        captures.accepts = true;
+        captures.promptAnswer.reset();
+        captures.replies.clear();
+        captures.reportersMade = 0;
+        play(row.script);
+        std::string asked;
+        for (const auto& request : std::exchange(captures.requests, {})) {
+            EXPECT_THAT(request.processes, ElementsAre(kClient, kOtherClient));
+            asked += request.operation + " " +
+                     (request.operation == "cancel" ? request.session : request.signature.type) + "; ";
+        }
+        EXPECT_EQ(asked, row.expected) << row.what;
+    }
+    EXPECT_EQ(captures.reportersMade, 2);
+}
+
+TEST_F(ZephWorkerTest, CapturesSayWhatTheyAreOf) {
+    play("alarms haptic haptic low low low");
+    std::string found;
+    for (const auto& [operation, processes, filed, duration, payload, name] : device.bugCapture.requests) {
+        found += filed.domain + "/" + filed.type + "/" + filed.subType + "/" + filed.subTypeContext + "/" +
+                 filed.detectedProcess + " " + std::to_string(duration.count()) + jsonText(payload) + "\n";
+    }
+    EXPECT_EQ(found, "Tonmetry/haptics/Playback/Joulery/Unknown 0.000000"
+                     R"({"diagnostic_extension_parameters":)"
+                     R"({"com.vandra.powerlog.systemlog.filterprocess":{"processIDs":[77,78]}}})"
+                     "\nTonmetry/alarms/Error/IssueDetector/caller 60.000000{}\n");
+}
+
+TEST_F(ZephWorkerTest, AnswersComeOnAnyThreadAndWhenEverythingIsGone) {
+    play("alarms low low low sound");
+    session.reset();
+    device.restart();
+    play("answered answered");
+    EXPECT_EQ(device.log.count("Started Zeph session for"), 2U);
+    play("alarms low low low");
+    device.setThreshold(LogLevel::fault); // the log's lock would keep the threads apart
+    std::thread answering([this] { device.bugCapture.answer(kOpened); });
+    for (int i = 0; i < 20; ++i) {
+        play("stop start");
+    }
+    answering.join();
+    session->stop();
+    EXPECT_EQ(device.bugCapture.requests.back().session, "S-1");
+}
+
+TEST_F(ZephWorkerTest, RepliesSayWhetherThereIsACapture) {
+    const struct {
+        Dictionary response;
+        const char* levels;
+        const char* identifier = "NONE_RETURNED";
+    } cases[] = {
+        {{{"success", 1.0}, {"session_id", 17}}, "i", "17"},
+        {{{"success", true}, {"reason", 3}}, "e"},
+        {{{"success", 2}, {"session_id", "S"}}, "e"},
+        {{{"reason", "none"}}, "e"},
+        {{{"reason", 0x1'0000'0000}}, "e"},
+        {{{"reason", 9}}, "i"},
+        {{{"reason", 10}}, "i"},
+        {{{"reason", 0xFFFF'FFFF}}, "i"},
+    };
+    for (const auto& [response, levels, identifier] : cases) {
+        EXPECT_EQ(ZRReportingSessionZephWorker::getSessionIdentifierFromResponse(response), identifier);
+        EXPECT_EQ(loggedLevels(ZRReportingZephLogCategory()), levels);
+    }
+}
+
+} // namespace
+} // namespace tamblo

@@ -1,0 +1,389 @@
+#include "tests/workers/WorkerTest.h"
+#include "workers/ReportFileName.h"
+#include "workers/sinks/ZRReportingSessionSummaryJsonFileWorker.h"
+#include "workers/trace/ChromeTrace.h"
+#include "workers/trace/ProcessSampler.h"
+#include "workers/trace/SessionTrace.h"
+
+#include <nlohmann/json.hpp>
+
+#include <algorithm>
+#include <limits>
+#include <span>
+
+// The files of whole sessions: their messages, and what their processes did.
+
+namespace tamblo {
+namespace {
+
+using Json = nlohmann::json;
+
+constexpr pid_t kService = 4321;
+constexpr WallTime kStart{1'772'366'400s}; ///< of the fake clock
+
+TEST(ReportFileNameTest, TellsLocalTimeAndSession) {
+    const std::string longest(206, 'x');
+    const std::string epoch = "19700101-000000+0000-1-";
+    const struct {
+        std::int64_t time;
+        int offset;
+        std::int64_t reporter;
+        Value application;
+        std::string name;
+    } cases[] = {
+        {1'773'476'813, -12'600, -7, "a b'\xC3\xA9", "20260314-045653-0330--7-a b'\xC3\xA9-test.json"},
+        {1'772'323'199, 1, 1, "", "20260301-000000+0000-1--test.json"},
+        {951'782'400, 45'900, INT64_MIN, "a", "20000229-124500+1245--9223372036854775808-a-test.json"},
+        // A name is one part of one file name, whatever a client sends.
+        {0, 0, 1, std::string("../a\0b\n\x1F\x7F", 9), epoch + ".._a_b___-test.json"},
+        {0, 0, 1, Array{"a/b", 12.5}, epoch + "[\"a_b\",12.5]-test.json"},
+        {0, 0, 1, longest + std::string(17, 'y'), epoch + longest + std::string(16, 'y') + "-test.json"},
+        {0, 0, 1, longest + "0123456789ABCDE\xC3\xA9", epoch + longest + "0123456789ABCDE-test.json"},
+    };
+    for (const auto& c : cases) {
+        EXPECT_EQ(reportFileName(WallTime(std::chrono::seconds(c.time)), std::chrono::seconds(c.offset),
+                                 c.reporter, c.application, "test"),
+                  c.name);
+    }
+}
+
+class ReportFilesTest : public WorkerTest {
+protected:
+    explicit ReportFilesTest(AudioServiceType type = AudioServiceTypeTest, bool isInternalBuild = false)
+        : WorkerTest(LogLevel::info, isInternalBuild) {
+        session = makeSession(type);
+    }
+    FakeReportFiles& files = device.reportFiles;
+};
+
+class SummaryJsonFileWorkerTest : public ReportFilesTest {
+protected:
+    MessageRef sendVolume(Dictionary payload) {
+        payload.set("zrreporting_timestamp", device.clock.seconds());
+        return send(std::move(payload), AudioEventKindVolume, AudioEventTypeStart);
+    }
+    /// The text of the one file that a stop writes now, empty when it writes none.
+    std::string stop() {
+        files.files.clear();
+        worker->stop();
+        return files.files.empty() ? "" : files.files.begin()->second;
+    }
+    std::shared_ptr<ZRReportingSessionSummaryJsonFileWorker> worker =
+        tryToMake<ZRReportingSessionSummaryJsonFileWorker>();
+};
+
+TEST_F(SummaryJsonFileWorkerTest, WritesOneObjectForEachMessage) {
+    stop();
+    sendVolume({{"n", 1}})->isRedundant = true;
+    stop();
+    EXPECT_THAT(files.createdDirectories, IsEmpty()) << "without messages to write there is no file";
+    const MessageRef first = sendVolume({{"n", 2}});
+    sendVolume({{"n", 3}})->isSessionStarted = true;
+    const auto object = [](const std::string& number, const std::string& isStarted, const std::string& n) {
+        return "{\n  \"Volume_Start_" + number + "\": {\n    \"HostApplicationDisplayID\": \"Unknown\",\n" +
+               "    \"audiotag\": \"VolumeStart\",\n    \"isSessionStarted\": \"" + isStarted + "\",\n" +
+               "    \"n\": " + n + ",\n    \"zrreporting_timestamp\": 1772366400.0\n  }\n}\n";
+    };
+    const std::string both = "[\n" + object("1", "NO", "2") + ",\n" + object("2", "YES", "3") + "]\n";
+    EXPECT_EQ(stop(), both);
+    EXPECT_EQ(*first->payload().find("isSessionStarted"), Value("NO")) << "later workers see it";
+    EXPECT_THAT(files.createdDirectories, ElementsAre("/reports"));
+
+    // The next file counts anew, under a name of its own time.
+    device.clock.advance(1s);
+    device.clock.offset = 2h;
+    EXPECT_EQ(stop(), both);
+    EXPECT_EQ(files.files.begin()->first, "/reports/20260301-140001+0200-5-Unknown-test.json");
+    // Categories without names of their own are counted together.
+    for (const AudioEventCategory category : {0x0800000EU, 99U, 0xFFFFFFFFU}) {
+        send({{"n", category}}, category, 8);
+    }
+    std::string names;
+    for (const auto& written : nlohmann::ordered_json::parse(stop())) {
+        names += written.begin().key() + " ";
+    }
+    EXPECT_EQ(names, "Volume_Start_1 Volume_Start_2 Session_Volume_Joulery_1 Undefined_Joulery_1 "
+                     "Undefined_Joulery_2 ");
+    session.reset();
+    EXPECT_EQ(stop(), "");
+}
+
+TEST_F(SummaryJsonFileWorkerTest, EachFailedStepIsTold) {
+    const struct {
+        std::optional<std::string> FakeReportFiles::*failure;
+        const char* told;
+        bool started;
+        bool wrote;
+    } cases[] = {
+        {&FakeReportFiles::directoryFailure, "eii", true, true},
+        {&FakeReportFiles::openFailure, "e", false, false},
+        {&FakeReportFiles::writeFailure, "iei", true, false},
+        // The next file's outage is its own.
+        {&FakeReportFiles::writeFailure, "iei", true, false},
+        {&FakeReportFiles::closeFailure, "ie", true, true},
+    };
+    sendVolume({{"n", 1}});
+    (void)loggedLevels(ZRReportingSessionCategory());
+    for (const auto& c : cases) {
+        files.*c.failure = "no way";
+        worker->setStarted(!c.started);
+        EXPECT_EQ(Json::accept(stop()), c.wrote);
+        files.*c.failure = std::nullopt;
+        EXPECT_EQ(loggedLevels(ZRReportingSessionCategory()), c.told);
+        EXPECT_EQ(worker->started(), c.started) << c.told;
+    }
+}
+
+TEST_F(SummaryJsonFileWorkerTest, WhatHasNoFormLeavesItsSeparator) {
+    sendVolume({{"deep", Array{Dictionary{{"when", Value::date(1)}}}}});
+    sendVolume({{"x", std::numeric_limits<double>::infinity()}});
+    sendVolume({{"n", 3}});
+    (void)loggedLevels(ZRReportingSessionCategory());
+    EXPECT_TRUE(stop().starts_with("[\n,\n,\n{\n  \"Volume_Start_3\": {"));
+    EXPECT_EQ(loggedLevels(ZRReportingSessionCategory()), "ieei");
+}
+
+TEST_F(SummaryJsonFileWorkerTest, WritesInPiecesAndTellsOfEachOutageOnce) {
+    for (int i = 0; i < 2000; ++i) {
+        sendVolume({{"n", i}, {"text", std::string(1000, 'x')}});
+    }
+    EXPECT_EQ(Json::parse(stop()).size(), 2000U);
+    const auto pieces = std::exchange(files.writes, {});
+    EXPECT_THAT(pieces, SizeIs(testing::AllOf(testing::Ge(6U), testing::Le(40U))));
+    EXPECT_LE(*std::ranges::max_element(pieces), 512U << 10U);
+    files.writeFailure = "disk full";
+    files.failingWrites = {2, 3, 5};
+    (void)loggedLevels(ZRReportingSessionCategory());
+    stop();
+    EXPECT_EQ(loggedLevels(ZRReportingSessionCategory()), "ieei");
+    EXPECT_THAT(files.writes, SizeIs(pieces.size()));
+}
+
+ProcessSample sampleOf(std::int64_t userMicroseconds, std::uint64_t faults = 0) {
+    ProcessSample sample;
+    sample.userTime = std::chrono::microseconds(userMicroseconds);
+    sample.voluntarySwitches = 3;
+    sample.minorFaults = faults;
+    sample.residentBytes = 1U << 20U;
+    sample.threads = 2;
+    return sample;
+}
+
+class TraceWorkerTest : public ReportFilesTest {
+protected:
+    TraceWorkerTest() : ReportFilesTest(AudioServiceTypeVelka, true) {}
+
+    /// A tick, after which the time of day has gone on by the step.
+    void tick(std::chrono::milliseconds step = 100ms) {
+        device.clock.advance(step);
+        device.processInformation.uptime += 100ms;
+        device.workQueues.elapse(100ms);
+        device.workQueues.run("com.vandra.tamblo.trace.samples");
+    }
+    /// The performance files, whose names have the time of the stop; an internal build writes others, too.
+    [[nodiscard]] std::map<std::string, std::string> written() {
+        device.workQueues.run("com.vandra.tamblo.trace");
+        auto performanceFiles = std::exchange(files.files, {});
+        std::erase_if(performanceFiles, [](const auto& f) { return !f.first.starts_with("/performance/"); });
+        return performanceFiles;
+    }
+    void startAnew(ZRReportingSession& traced) {
+        traced.stop();
+        traced.start();
+    }
+};
+
+TEST_F(TraceWorkerTest, WritesWhatASessionsProcessesDid) {
+    device.processInformation.names[kService] = "tamblod";
+    session->start();
+    ASSERT_EQ(device.workQueues.delayedCalls(), 1U);
+    constexpr std::int64_t kMost = std::numeric_limits<std::int64_t>::max();
+    const struct {
+        std::optional<std::int64_t> clientsTime;
+        std::uint64_t servicesFaults;
+        std::chrono::milliseconds step = 100ms;
+    } ticks[] = {{1000, 10},
+                 {6000, 9}, // runs backwards
+                 {kMost, ~0ULL, -1h},
+                 {std::nullopt, 19},
+                 {1, 29}}; // another process has the client's number now
+    for (const auto& t : ticks) {
+        device.processSampling.set(kService, sampleOf(0, t.servicesFaults));
+        device.processSampling.end(kClient);
+        if (t.clientsTime) {
+            device.processSampling.set(kClient, sampleOf(*t.clientsTime));
+        }
+        tick(t.step);
+    }
+    device.clock.set(kStart);
+    session->stop();
+    const std::string path = "/performance/20260301-120000+0000-5-Unknown-velka.json";
+    EXPECT_FALSE(files.files.contains(path)) << "written on the server queue";
+
+    const auto found = written();
+    ASSERT_THAT(found, SizeIs(1));
+    const Json events = Json::parse(found.at(path)).at("traceEvents");
+    /// "TIME:VALUE" of one counter's member, times in milliseconds from the start.
+    const auto counter = [&events](pid_t pid, const std::string& name, const char* member) {
+        std::string values;
+        for (const Json& event : events) {
+            if (event.at("ph") == "C" && event.at("pid") == pid && event.at("name") == name) {
+                const auto time = std::chrono::microseconds(event.at("ts").get<std::int64_t>());
+                values += std::to_string((time - kStart.time_since_epoch()) / 1ms) + ":" +
+                          event.at("args").at(member).dump() + " ";
+            }
+        }
+        return values;
+    };
+    EXPECT_EQ(counter(kClient, "processor time (% of a core)", "user"), "200:5.0 ");
+    EXPECT_EQ(counter(kClient, "memory (bytes)", "resident"), "100:1048576 200:1048576 200:1048576 ");
+    EXPECT_EQ(counter(kService, "page faults (per second)", "minor"), "200:0.0 300:0.0 400:100.0 ");
+    EXPECT_EQ(events.at(0).at("args").at("name"), "caller");
+    EXPECT_EQ(events.at(1).at("args").at("name"), "tamblod");
+    EXPECT_EQ(events.at(5).at("dur"), 3'600'000'000) << "the clock goes on from where it was";
+}
+
+TEST_F(TraceWorkerTest, HoldsSoManyTracesAtATimeAndForgetsDroppedSessions) {
+    std::vector<std::shared_ptr<ZRReportingSession>> sessions;
+    for (std::size_t i = 0; i < ProcessSampler::kMostRecordings + 3; ++i) {
+        sessions.push_back(makeSession(AudioServiceTypeVelka, {}, static_cast<ReporterID>(i)));
+        sessions.back()->start();
+    }
+    const auto timesFull = [this] { return device.log.count("32 sessions are traced already"); };
+    EXPECT_EQ(timesFull(), 1U);
+    sessions.erase(sessions.begin()); // without a stop
+    startAnew(*sessions.back());
+    EXPECT_EQ(timesFull(), 1U) << "there was room for it";
+    tick();
+    for (const auto& traced : std::span(sessions).first(sessions.size() - 1)) {
+        startAnew(*traced);
+    }
+    EXPECT_EQ(timesFull(), 2U) << "the files wait";
+    EXPECT_THAT(written(), SizeIs(ProcessSampler::kMostRecordings - 1));
+    startAnew(*sessions.front());
+    startAnew(*sessions.front());
+    sessions.back()->stop();
+    EXPECT_THAT(written(), SizeIs(2)) << "though nothing was sampled";
+    EXPECT_EQ(device.workQueues.delayedCalls(), 1U);
+    sessions.clear();
+    EXPECT_EQ(device.workQueues.delayedCalls(), 0U);
+}
+
+TEST_F(TraceWorkerTest, EachFailureIsOneLine) {
+    for (const auto step : {&FakeReportFiles::directoryFailure, &FakeReportFiles::openFailure,
+                            &FakeReportFiles::writeFailure, &FakeReportFiles::closeFailure}) {
+        session->start();
+        files.*step = "no way";
+        session->stop();
+        (void)written();
+        files.*step = std::nullopt;
+        EXPECT_EQ(loggedLevels(ZRReportingTraceCategory()), "e");
+    }
+}
+
+TEST(SampleRecordingTest, KeepsEveryOtherSampleWhenItIsFull) {
+    constexpr std::size_t kMost = SampleRecording::kMostSamples;
+    const pid_t processes[] = {1, 2};
+    SampleRecording recording(processes, WallTime());
+    std::size_t looked = 0;
+    for (std::size_t tick = 0; tick < 2 * kMost + 2; ++tick) {
+        for (const pid_t pid : recording.nextTick()) {
+            recording.add(pid, WallTime(std::chrono::seconds(tick)), sampleOf(0));
+            ++looked;
+        }
+    }
+    EXPECT_EQ(looked, 2 * (kMost + kMost / 2 + 1));
+    for (const RecordedSamples::Process& process : recording.take(WallTime()).processes) {
+        ASSERT_EQ(process.samples.size(), kMost / 2 + 1);
+        for (std::size_t i = 0; i < process.samples.size(); ++i) {
+            ASSERT_EQ(process.samples[i].time, WallTime(std::chrono::seconds(4 * i)));
+        }
+    }
+    EXPECT_THAT(recording.nextTick(), IsEmpty());
+}
+
+/// Of a session of ten seconds with these messages.
+SessionTrace marksOf(const std::string& messages, AudioEventType type = AudioEventTypeGeneric) {
+    SessionTrace trace;
+    trace.recorded.begin = kStart;
+    trace.recorded.end = kStart + 10s;
+    addMarks(trace, messagesOf(messages, secondsSince1970(kStart), type));
+    return trace;
+}
+
+TEST(SessionTraceTest, StretchesAreWhereOutputAndInputRan) {
+    const std::pair<const char*, const char*> cases[] = {
+        {"2 out; 3 volume=0.5; 4 out; 5 out=NO; 6 out=false; 7 out", "2-5 7-10 "},
+        {"2 out; 4 length=1; 5 volume=0.5; 6 out=1.5", "2-4 6-10 "},
+        {"2 out length=1; 3 out=false", "2-3 "},
+        {"1 in; 2 out=false; 3 length=1", ""},
+        // Times beyond the session, in no order, and such as are none.
+        {"-50 out; -20 out=false; -10 out; 3 out=false", "0-3 "},
+        {"5 out; 4 out=false; 8 out; 1e300 out=false", "8-10 "},
+        {"- out; nan out; 1 out=false; 2 out; 30 out=false; 31 out", "0-1 2-10 "},
+    };
+    for (const auto& [messages, output] : cases) {
+        std::string found;
+        for (const SessionTrace::Stretch& stretch : marksOf(messages).output) {
+            found += std::to_string((stretch.begin - kStart) / 1s) + "-" +
+                     std::to_string((stretch.end - kStart) / 1s) + " ";
+        }
+        EXPECT_EQ(found, output) << messages;
+    }
+}
+
+TEST(SessionTraceTest, IssuesAreOfTwoTypesAndLimited) {
+    const std::string longest(127, 'x');
+    for (const AudioEventType type : {AudioEventTypeError, AudioEventTypeIssueDetector}) {
+        const SessionTrace trace = marksOf("5 issue_type=" + longest + "\xC3\xA9", type);
+        const Json events = Json::parse(chromeTraceText(trace).view()).at("traceEvents");
+        EXPECT_EQ(events.at(4).at("name"), longest);
+    }
+    std::string many = "3 out issue_type=x";
+    for (std::size_t i = 1; i < SessionTrace::kMostMarks; ++i) {
+        many += ";3 issue_type=x";
+    }
+    EXPECT_THAT(marksOf(many, AudioEventTypeGeneric).issues, IsEmpty());
+    const SessionTrace full = marksOf(many, AudioEventTypeError);
+    EXPECT_THAT(full.issues, SizeIs(SessionTrace::kMostMarks));
+    EXPECT_THAT(full.output, IsEmpty());
+    EXPECT_EQ(full.droppedMarks, 1U);
+}
+
+TEST(ChromeTraceTest, IsTheObjectForm) {
+    SessionTrace trace = marksOf("2 out in; 3 issue_type=over\"load", AudioEventTypeError);
+    trace.reporterID = 7;
+    trace.serviceName = "velka";
+    trace.applicationName = "a\nb";
+    trace.droppedMarks = 1;
+    trace.processNames = {"a\\b", ""};
+    trace.recorded.processes = {
+        {kClient, {{kStart + 100ms, sampleOf(0)}, {kStart + 400ms, sampleOf(100'000, 1)}}, false},
+        {kService, {}, false}};
+    const Json file = Json::parse(chromeTraceText(trace).view());
+    EXPECT_EQ(file.at("otherData").dump(),
+              R"({"applicationName":"a\nb","droppedMarks":1,"reporterID":7,"serviceName":"velka"})");
+    const Json& events = file.at("traceEvents");
+    ASSERT_EQ(events.size(), 16U);
+    const std::pair<std::size_t, const char*> expected[] = {
+        {0, R"({"args":{"name":"a\\b"},"name":"process_name","ph":"M","pid":77,"tid":77})"},
+        {2, R"({"args":{"name":"output 7"},"name":"thread_name","ph":"M","pid":77,"tid":4194327})"},
+        {4, R"({"args":{"reporterID":7,"serviceName":"velka"},"dur":10000000,"name":"session","ph":"X",)"
+            R"("pid":77,"tid":4194326,"ts":1772366400000000})"},
+        {6, R"({"dur":8000000,"name":"input","ph":"X","pid":77,"tid":4194328,"ts":1772366402000000})"},
+        {7, R"({"args":{"category":"Undefined","type":"Error"},"name":"Undefined_Error","ph":"i",)"
+            R"("pid":77,"s":"p","tid":77,"ts":1772366402000000})"},
+        {13, R"x({"args":{"system":0.0,"user":33.333},"name":"processor time (% of a core)","ph":"C",)x"
+             R"("pid":77,"tid":77,"ts":1772366400400000})"}};
+    for (const auto& [place, event] : expected) {
+        EXPECT_EQ(events.at(place).dump(), event);
+    }
+    EXPECT_EQ(events.at(8).at("name"), "over\"load");
+    EXPECT_EQ(events.at(15).at("args").dump(), R"({"major":0.0,"minor":3.333})");
+    trace.reporterID = std::numeric_limits<std::int64_t>::min() + (1 << 20) - 1;
+    const Json apart = Json::parse(chromeTraceText(trace).view()).at("traceEvents");
+    EXPECT_EQ(apart.at(1).at("tid"), 4'194'305 + 3 * 1'048'575) << "of another session";
+}
+
+} // namespace
+} // namespace tamblo
