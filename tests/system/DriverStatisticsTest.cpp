@@ -57,12 +57,11 @@ TEST_F(DriverStatisticsTest, ADriverThatFailsIsAbsent) {
     chanlog.channels = {simple(5, "Speaker")};
     chanlog.channelsError = 13;
     EXPECT_THAT(Utility(chanlog).ioChannelSubscriptions(), IsEmpty());
-    EXPECT_EQ(device.log.count("error 13 getting channels for driver Speaker-(null)"), 1U);
     chanlog.channelsError.reset();
     chanlog.subscribeError = 14;
     EXPECT_THAT(Utility(chanlog).ioChannelSubscriptions(), IsEmpty());
+    EXPECT_EQ(device.log.count("error 13 getting channels for driver Speaker-(null)"), 1U);
     EXPECT_EQ(device.log.count("error 14 creating subscription for Speaker-(null)"), 1U);
-
     chanlog.subscribeError.reset();
     const Utility utility(chanlog);
     EXPECT_THAT(utility.ioChannelSubscriptions(), SizeIs(1));
@@ -83,18 +82,23 @@ TEST_F(DriverStatisticsTest, ADriverThatFailsIsAbsent) {
 
 TEST_F(DriverStatisticsTest, AStopSendsWhatWasGainedKindByKind) {
     ChanlogChannel histogram = channelOf(ChanlogFormat::histogram, "Speaker", "Thermal Zone_1", "coil temp");
-    histogram.driverName = "Speaker_Amp<2>";
+    histogram.driverName = "Speaker_Amp<2><3>";
     histogram.unitLabel = "C";
     histogram.buckets = {{.lower = 0, .upper = 10, .hits = 3}, {.lower = 10, .upper = 20, .hits = 0}};
     histogram.minimum = 1;
     histogram.maximum = 9;
+    ChanlogChannel below = channelOf(ChanlogFormat::histogram, "Speaker", {}, "below");
+    below.buckets = {{-9, -5, 77, 2}, {-5, -4, 0, -1}};
+    below.maximum = -1;
     ChanlogChannel state = channelOf(ChanlogFormat::state, "Speaker", {}, "power");
     state.states = {{.name = "off", .transitions = 2, .residency = 0, .dutyCycle = 0},
                     {.name = "on", .transitions = 1, .residency = UINT64_MAX, .dutyCycle = 1.0 / 3},
                     {.name = "low", .transitions = 0, .residency = 1, .dutyCycle = 2.0 / 3}};
     device.chanlog.channels = {state,
                                histogram,
-                               simple(4, "Speaker", "MCA", "a_b c"),
+                               below,
+                               simple(4, "Speaker<1>", "MCA", "a_b <c>"),
+                               simple(7, {}, "MCA", {}),
                                simple(0, "Speaker", {}, "idle"),
                                channelOf(ChanlogFormat::invalid, "Speaker"),
                                channelOf(ChanlogFormat::simpleArray, "Speaker", "s"),
@@ -104,47 +108,23 @@ TEST_F(DriverStatisticsTest, AStopSendsWhatWasGainedKindByKind) {
     device.chanlog.calls.clear();
     session->stop();
     EXPECT_EQ(device.chanlog.calls, "|sdsd") << "one pass";
-    EXPECT_THAT(sent(), ElementsAre(R"(Simple{"Speaker_MCA_Simple_abc":4})",
-                                    R"(Histogram{"SpeakerAmp_Speaker_ThermalZone1_Histogram_coiltemp":)"
-                                    R"("count=2,lower=0,upper=20,min=1,max=9,unit=C::0-10:3"})",
-                                    R"(State{"Speaker_State_power":"name:on,transition:1,)"
-                                    R"(residency:18446744073709551615,duty_cycle:0.333333;)"
-                                    R"(name:low,transition:0,residency:1,duty_cycle:0.666667;"})"));
+    EXPECT_THAT(sent(),
+                ElementsAre(R"(Simple{"MCA_Simple_":7,"Speaker<1>_MCA_Simple_ab<c>":4})",
+                            R"(Histogram{"SpeakerAmp_Speaker_ThermalZone1_Histogram_coiltemp":)"
+                            R"("count=2,lower=0,upper=20,min=1,max=9,unit=C::0-10:3",)"
+                            R"("Speaker_Histogram_below":)"
+                            R"("count=2,lower=-9,upper=0,min=0,max=-1,unit=(null)::-9--5:2;-5--4:-1"})",
+                            R"(State{"Speaker_State_power":"name:on,transition:1,)"
+                            R"(residency:18446744073709551615,duty_cycle:0.333333;)"
+                            R"(name:low,transition:0,residency:1,duty_cycle:0.666667;"})"));
 
     device.analyticsEvents.clear();
     state.states.resize(1);
-    device.chanlog.channels = {simple(0, "Speaker"), simple(-4, "Speaker", {}, "m"), state};
+    histogram.buckets[0].hits = 0;
+    device.chanlog.channels = {simple(0, "Speaker"), simple(-4, "Speaker", {}, "m"), state, histogram};
     session->start();
     session->stop();
     EXPECT_THAT(sent(), IsEmpty()) << "nothing moved, nothing is sent";
-}
-
-TEST_F(DriverStatisticsTest, KeysAreMadeOfTheCleanedNames) {
-    const auto key = [](Name driver, Name group, Name subGroup, Name name) {
-        ChanlogChannel channel = simple(1, std::move(group), std::move(subGroup), std::move(name));
-        channel.driverName = std::move(driver);
-        return Utility::getDriverStatsKey(channel, "Simple");
-    };
-    EXPECT_EQ(key("A_1 x<2><3>", "G<1>", "s_ s", "n_<m>"), "A1x_G<1>_ss_Simple_n<m>");
-    EXPECT_EQ(key({}, {}, {}, {}), "Simple_");
-    EXPECT_EQ(key("<1>", {}, "s", "n"), "_s_Simple_n") << "a driver's name, though nothing is left of it";
-}
-
-TEST_F(DriverStatisticsTest, HistogramsAsText) {
-    const std::pair<std::vector<ChanlogBucket>, const char*> histograms[] = {
-        {{}, ""},
-        {{{0, 5, 0, 0}, {5, 9, 0, 0}}, ""},
-        {{{5, 9, 0, 1}, {9, 12, 0, -1}}, "count=2,lower=0,upper=12,min=0,max=-1,unit=(null)::5-9:1;9-12:-1"},
-        {{{-9, -5, 77, 2}}, "count=1,lower=-9,upper=0,min=0,max=-1,unit=(null)::-9--5:2"},
-    };
-    for (const auto& [buckets, text] : histograms) {
-        ChanlogChannel channel = channelOf(ChanlogFormat::histogram, "g");
-        channel.buckets = buckets;
-        channel.maximum = -1;
-        Utility::DriverStats stats;
-        Utility::processHistogramData(channel, stats);
-        EXPECT_EQ(stats.empty() ? "" : stats.begin()->second.stringValue(), text);
-    }
 }
 
 } // namespace

@@ -181,7 +181,6 @@ TEST(WorkerUtilityTest, CombinesBurstsInPlace) {
         {"another message between", "0 s=1; 0.5 x=2; 1 e=3", 5, "1:1 3 1.0; 2:2 0.5; "},
         {"a repeat begins anew", "0 s=1; 1 s=2; 1.5 e=3", 5, "1:1 0.0; 2:2 3 1.5; "},
         {"one with both keys counts under the first", "0 s=1 e=1; 1 e=2", 5, "1:1 2 1.0; "},
-        {"just below the pause", "0 e=1; 1.999 s=2", 2, "1:2 1 1.999; "},
         {"the pause since the message before", "0 e=1; 1.5 r=2; 3 s=3", 2, "1:3 1 2 3.0; "},
         {"at the pause; the old anchor stays, and a repeat of the late one's key begins anew",
          "0 e=1; 2 s=2; 3 r=3; 3 s=4", 2, "1:1 0.0; 2:2 2.0; 3:3 3.0; 4:4 3.0; "},
@@ -203,41 +202,38 @@ TEST(WorkerUtilityTest, CombinesBurstsInPlace) {
 
 class SummaryWorkerTest : public WorkerTest {
 protected:
-    void sendIO(const std::string& words, AudioEventType type = AudioEventTypeGeneric) {
-        send(payloadOf("- " + words), AudioEventKindIO, type);
-    }
-    /// Stops the session; these values of its summary.
-    std::string summary(std::initializer_list<std::string_view> keys) {
-        device.analyticsEvents.clear();
-        session->stop();
+    /// Starts and stops the session, and sends it messages of input and output; these values of the summary
+    /// of its last stop.
+    std::string summary(const std::string& script, std::initializer_list<std::string_view> keys) {
+        const auto sendIO = [this](const std::string& words, AudioEventType type = AudioEventTypeGeneric) {
+            send(payloadOf("- " + words), AudioEventKindIO, type);
+        };
+        playWords(script,
+                  {{"start", [this] { session->start(); }},
+                   {"stop", [this] { session->stop(); }},
+                   {"both", [&] { sendIO("length=2.5 issue_type=overload"); }},
+                   {"error", [&] { sendIO("issue_type=overload", AudioEventTypeError); }}},
+                  sendIO);
         const auto payloads = device.analyticsEvents.payloads("com.vandra.tamblo.Session_Generic.Summary");
-        EXPECT_THAT(payloads, SizeIs(1));
-        return payloads.empty() ? "" : shown(payloads[0], keys);
+        return payloads.empty() ? "" : shown(payloads.back(), keys);
     }
 };
 
-TEST_F(SummaryWorkerTest, CountsMessagesAndActivity) {
-    const auto counts = [this] {
-        return summary({"num_messages", "num_unique_messages", "num_redundant_messages", "active_count",
-                        "total_active_time", "average_active_time", "overload_count"});
+TEST_F(SummaryWorkerTest, CountsMessagesOfTheRunAndActivityOverAllRuns) {
+    const Played cases[] = {
+        {"its own records of starts and stops are no messages", "stop start stop", "0 0 0 0 0.0 0.0 0"},
+        {"what comes before the start counts to the run that follows, repeats among it",
+         "n=0 start start n=1 n=2 n=2 n=2 n=3 both length=4s issue_type=overload issue_type=overload stop",
+         "10 7 3 2 6.5 3.25 1"},
+        {"the next run", "start issue_type=underrun error error stop", "3 3 0 2 6.5 3.25 3"},
     };
-    session->stop(); // stops nothing
-    session->start();
-    EXPECT_EQ(counts(), "0 0 0 0 0.0 0.0 0") << "records of starts and stops are no messages";
-    // What a session is sent before its start counts to the run that follows.
-    sendIO("n=0");
-    session->start();
-    session->start();
-    for (const char* payload : {"n=1", "n=2", "n=2", "n=2", "n=3", "length=2.5 issue_type=overload",
-                                "length=4s", "issue_type=overload", "issue_type=overload"}) {
-        sendIO(payload);
+    for (const auto& row : cases) {
+        EXPECT_EQ(summary(row.script,
+                          {"num_messages", "num_unique_messages", "num_redundant_messages", "active_count",
+                           "total_active_time", "average_active_time", "overload_count"}),
+                  row.expected)
+            << row.what;
     }
-    EXPECT_EQ(counts(), "10 7 3 2 6.5 3.25 1");
-
-    session->start();
-    sendIO("issue_type=underrun");
-    sendIO("issue_type=overload", AudioEventTypeError);
-    EXPECT_EQ(counts(), "2 2 0 2 6.5 3.25 2") << "messages are counted by the run, activity over all";
 }
 
 TEST_F(SummaryWorkerTest, TellsHowTheDeviceIs) {
@@ -245,16 +241,14 @@ TEST_F(SummaryWorkerTest, TellsHowTheDeviceIs) {
     for (const auto& [state, name] : {std::pair(0, "Nominal"), {3, "Critical"}, {4, "Unknown"}}) {
         device.deviceConditions.thermal = state;
         device.deviceConditions.lowPower = state == 3;
-        session->start();
-        EXPECT_EQ(summary({"thermal_state", "low_power_enabled", "vmInfo_phys_footprint_MiB",
-                           "load_avg_1_min", "load_avg_5_min", "load_avg_15_min"}),
+        EXPECT_EQ(summary("start stop", {"thermal_state", "low_power_enabled", "vmInfo_phys_footprint_MiB",
+                                         "load_avg_1_min", "load_avg_5_min", "load_avg_15_min"}),
                   "\"" + std::string(name) + (state == 3 ? "\" 1" : "\" 0") + " 3 0.5 0.25 0.125");
     }
     session->setClientProcessName(std::nullopt);
     device.processInformation.footprint = ProcessInformation::QueryError{2, "no such file"};
-    (void)loggedLevels(ZRReportingSummaryLogCategory());
-    session->start();
-    EXPECT_EQ(summary({"vmInfo_phys_footprint_MiB", "clientProcessName"}), "");
+    device.log.clear();
+    EXPECT_EQ(summary("start stop", {"vmInfo_phys_footprint_MiB", "clientProcessName"}), "");
     EXPECT_EQ(loggedLevels(ZRReportingSummaryLogCategory()), "e");
 }
 
