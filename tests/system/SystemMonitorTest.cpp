@@ -33,12 +33,6 @@ protected:
         device.namedNotifications.post(name, word);
         (void)device.serverQueue().runAll();
     }
-    /// A feature's state as it would be read now.
-    Dictionary stateNow(std::string_view feature, Value value) {
-        return {{feature, std::move(value)},
-                {"zrreporting_timestamp", device.clock.seconds()},
-                {"systemuptime_sec", static_cast<int>(device.processInformation.uptime.count() + 0.5)}};
-    }
     /// The values that the session was sent, "@" when they were read and ">" when they were sent, in seconds.
     static std::string toldTo(const std::shared_ptr<ZRReportingSession>& listener) {
         std::string told;
@@ -58,27 +52,13 @@ protected:
     }
 };
 
-TEST_F(SystemMonitorTest, ReadsPreferencesAtOnceAndTheRingerAtItsFirstNotification) {
+TEST_F(SystemMonitorTest, AStateHasTheValueAsItIsStoredAndWhenItWasRead) {
     const Value spatial(Dictionary{{"mode", "fixed"}});
     device.preferences.set(kSpatial, "com.vandra.dashlo", spatial);
-    setName(42);
     device.processInformation.uptime = std::chrono::duration<double>(99.5);
-    device.namedNotifications.post(kRinger, 1); // before anybody listens
-    const auto states = makeMonitor();
-    const Dictionary name = stateNow("device_name", 42);
-    EXPECT_EQ(states->find(kSpatial), stateNow(kSpatial, spatial));
-    EXPECT_EQ(states->find("device_name"), name) << "as it is stored";
-    EXPECT_TRUE(states->find("ringerstate").empty());
-    setName("den");
-    post(kRinger, 1);
-    EXPECT_EQ(states->find("ringerstate"), stateNow("ringerstate", true));
-    EXPECT_EQ(states->find("device_name"), name) << "read at its own notification alone";
-    post(kReporting, 0);
-    const Dictionary den = stateNow("device_name", "den");
-    EXPECT_EQ(states->find("device_name"), den);
-    device.preferences.remove("device_name", "com.vandra.tamblo");
-    post(kReporting, 0);
-    EXPECT_EQ(states->find("device_name"), den) << "a value that is gone leaves the previous state";
+    EXPECT_EQ(makeMonitor()->find(kSpatial), (Dictionary{{kSpatial, spatial},
+                                                         {"zrreporting_timestamp", device.clock.seconds()},
+                                                         {"systemuptime_sec", 100}}));
 }
 
 TEST_F(SystemMonitorTest, RingerIsOnForTheWordOneOnlyAndUnknownWithoutANotification) {
@@ -98,14 +78,6 @@ TEST_F(SystemMonitorTest, RingerIsOnForTheWordOneOnlyAndUnknownWithoutANotificat
     post(kRinger, 1);
     EXPECT_TRUE(deaf->systemMonitorDictionary()->find("ringerstate").empty());
     EXPECT_FALSE(deaf->systemMonitorDictionary()->find("device_name").empty());
-}
-
-TEST_F(SystemMonitorTest, DefaultsAreReadOnce) {
-    const auto unset = newMonitor();
-    setName(42);
-    device.preferences.set("disable_reporting", "com.vandra.tamblo", "YES");
-    EXPECT_EQ(unset->getDefaults(), (Dictionary{{"disable_reporting", false}}));
-    EXPECT_EQ(newMonitor()->getDefaults(), (Dictionary{{"device_name", "42"}, {"disable_reporting", true}}));
 }
 
 TEST_F(SystemMonitorTest, OneForTheProcessUntilItIsReset) {
@@ -141,9 +113,7 @@ struct Observer final : SystemMonitorDictionary::KeyObserver {
         : name(std::move(observerName)), calls(observerCalls) {}
     void keyValueChanged(std::string_view) override {
         calls += name + " ";
-        if (act) {
-            act();
-        }
+        act();
     }
     void observe(SystemMonitorDictionary& states, std::string_view key) {
         observation.emplace(states.addKeyObserver(*this, key));
@@ -151,7 +121,7 @@ struct Observer final : SystemMonitorDictionary::KeyObserver {
 
     const std::string name;
     std::string& calls;
-    std::function<void()> act;
+    std::function<void()> act = [] {};
     std::optional<SystemMonitorDictionary::Observation> observation;
 };
 
@@ -159,13 +129,11 @@ TEST(SystemMonitorDictionaryTest, ObserversMayComeAndGoWhileTheyAreCalled) {
     const auto states = std::make_shared<SystemMonitorDictionary>();
     std::string calls;
     Observer a("a", calls), b("b", calls), c("c", calls), late("late", calls), elsewhere("elsewhere", calls);
-    states->set("key", {{"key", 0}});
-    a.observe(*states, "key");
-    b.observe(*states, "key");
-    c.observe(*states, "key");
+    states->set("key", {{"key", 0}}); // not told to those who come later
+    for (Observer* observer : {&a, &b, &c}) {
+        observer->observe(*states, "key");
+    }
     elsewhere.observe(*states, "other");
-    EXPECT_EQ(calls, "") << "what stands there already is not told";
-
     a.act = [&] {
         a.observation.reset();
         b.observation.reset();
@@ -175,7 +143,7 @@ TEST(SystemMonitorDictionaryTest, ObserversMayComeAndGoWhileTheyAreCalled) {
     states->set("key", {{"key", 1}});
     EXPECT_EQ(calls, "a c ");
     c.act = [&] {
-        c.act = nullptr;
+        c.act = [] {};
         states->set("key", {{"key", 3}});
     };
     states->set("key", {{"key", 2}});
@@ -204,6 +172,9 @@ TEST_F(SystemMonitorTest, SessionsAreToldWhatIsKnownAtTheStartAndEveryChangeAfte
         {"the ringer once it was signalled; the same reading at the same time is no change",
          "monitor name 10 a+ b+ ring again c+",
          R"(a "den"@1>11 true@12>12 b "den"@1>11 true@12>12 c "den"@1>12 true@12>12 : 9)"},
+        {"preferences at once, the ringer not; names anew at their own notification",
+         "name ring monitor a+ rename ring", R"(a "den"@2>2 true@3>3 : 3)"},
+        {"a value that is gone leaves the previous state", "monitor name unname a+", R"(a "den"@1>2 : 3)"},
         {"a stopped session hears nothing until it starts again", "monitor a+ b+ a- ring 3 a+ quiet",
          "a true@1>4 false@5>5 b true@1>1 false@5>5 : 6"},
         {"one that is dropped while it is started leaves nothing behind", "monitor a+ a! ring b+ quiet",
@@ -224,6 +195,12 @@ TEST_F(SystemMonitorTest, SessionsAreToldWhatIsKnownAtTheStartAndEveryChangeAfte
              {"name",
               [this] {
                   setName("den");
+                  post(kReporting, 0);
+              }},
+             {"rename", [this] { setName("attic"); }},
+             {"unname",
+              [this] {
+                  device.preferences.remove("device_name", "com.vandra.tamblo");
                   post(kReporting, 0);
               }},
              {"ring", [this] { post(kRinger, 1); }},

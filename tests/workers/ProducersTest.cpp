@@ -12,13 +12,6 @@ namespace {
 using Messages = std::vector<MessageRef>;
 using Seconds = std::chrono::duration<double>;
 
-struct Case {
-    const char* what;
-    const char* messages;
-    const char* expected; ///< the values of some keys of each summary
-    const char* previous = "-";
-};
-
 class ProducersTest : public WorkerTest {
 public:
     Messages volume(const Messages& messages, Seconds minimum, const Value* player) {
@@ -28,17 +21,21 @@ public:
     Messages input(const Messages& messages, Seconds minimum, const Value* player) {
         return make<ZRReportingSessionInputMessagesWorker>()->createInputMessages(messages, player, minimum);
     }
-    Messages group(const Messages& messages, Seconds minimum, const Value* = nullptr) {
+    Messages group(const Messages& messages, Seconds minimum, const Value*) {
         return make<ZRReportingSessionKaleenMessagesWorker>()->createKaleenMessages(messages, minimum);
     }
-    /// Holds what is derived of each row's messages, segments of more than five seconds, against it.
+    /// Holds the values of the keys that are derived of each row's messages, segments of more than five
+    /// seconds, against it. Before a bar stand the values that were before.
     void expectSegments(Messages (ProducersTest::*derive)(const Messages&, Seconds, const Value*),
-                        std::initializer_list<std::string_view> keys, const std::vector<Case>& cases) {
-        for (const Case& row : cases) {
+                        std::initializer_list<std::string_view> keys, const std::vector<Played>& cases) {
+        for (const Played& row : cases) {
             session = makeSession();
-            session->addPreviousValues(payloadOf(row.previous));
+            const std::string script = row.script;
+            const std::size_t bar = script.find('|');
+            session->addPreviousValues(payloadOf(bar == script.npos ? "-" : script.substr(0, bar)));
             std::string found;
-            for (const MessageRef& message : (this->*derive)(messagesOf(row.messages), 5s, &process)) {
+            for (const MessageRef& message :
+                 (this->*derive)(messagesOf(script.substr(bar + 1)), 5s, &process)) {
                 found += (found.empty() ? "" : "; ") + shown(message->payload(), keys);
             }
             std::erase(found, '"');
@@ -57,8 +54,7 @@ TEST_F(ProducersTest, VolumeSegments) {
              "10 out volume=0.5; 20 volume=0.8; 25 volume=0.9; 30.5 out=false",
              "10.0 0.5 unknown false 1 2; 5.5 0.9 unknown false 2 2"},
             {"the session's length ends playing, unless output is still said to run",
-             "0 out volume=0.5; 6 length=6; 20 volume=1; 30 out=false; 40 out; 50 length=10 out; 70 "
-             "out=false",
+             "0 out volume=0.5; 6 length=6; 20 volume=1; 30 out=0; 40 out; 50 length=10 out; 70 out=0",
              "6.0 0.5 unknown false 1 3; 10.0 1 unknown false 2 3; 20.0 1 unknown false 3 3"},
             {"each watched setting ends one; carried settings alone do not, nor what is said again",
              "0 out volume=0.5; 10 formatID=x channels=2; 15 ringer=0 spatial=0 format=unknown; 20 ringer;"
@@ -73,8 +69,8 @@ TEST_F(ProducersTest, VolumeSegments) {
             {"an end or a start without a timestamp", "- out volume=0.5; 20 out=false; -20 out; - out=false",
              ""},
             {"a session that begins already playing ends nothing until output is said to run anew",
-             "10 volume=0.9; 20 out; 30 length=20", "10.0 0.9 Speaker false 1 1",
-             "1 out volume=0.5 devices=Speaker"},
+             "1 out volume=0.5 devices=Speaker | 10 volume=0.9; 20 out; 30 length=20",
+             "10.0 0.9 Speaker false 1 1"},
             {"output that is said twice to run goes on; timestamps that run backwards make nothing",
              "50 out volume=0.5; 60 out; 70 out=false; 80 out; 40 out=false", "20.0 0.5 unknown false 1 1"},
         });
@@ -94,7 +90,7 @@ TEST_F(ProducersTest, InputSegments) {
             {"the vocoders of a stretch that is too short go to the next",
              "0 in devices=A; 1 vocoder=v; 2 devices=B; 20 in=false", "18.0 B v:(null) 1 1"},
             {"input that ran before opens no segment, nor when it is said again; the next change does",
-             "10 devices=B; 16 in; 30 devices=C; 40 length=12", "10.0 C 1 1", "0 in devices=A"},
+             "0 in devices=A | 10 devices=B; 16 in; 30 devices=C; 40 length=12", "10.0 C 1 1"},
             {"a length with input still said to run ends one segment and begins another; alone it ends input",
              "0 in devices=A; 10 length=10 in; 30 in=false; 50 in; 60 length=10; 70 devices=B; 80 in=false",
              "10.0 A 1 3; 20.0 A 2 3; 10.0 A 3 3"},
@@ -116,14 +112,15 @@ TEST_F(ProducersTest, GroupSessionSegments) {
              "0 out group=1 formatID=F1; 10 format=S; 20 channels=2; 30 channels=6; 40 out=false",
              "30.0 F1 2 S 1 2; 10.0 F1 6 S 2 2"},
             {"joining and leaving while output runs, as it did before; exactly the minimum is too short",
-             "0 out; 10 group=1; 20 group=0; 30 group=1; 35 group=0; 60 length=1",
-             "10.0 unknown -1 unknown 1 1", "-50 out"},
+             "-50 out | 0 out; 10 group=1; 20 group=0; 30 group=1; 35 group=0; 60 length=1",
+             "10.0 unknown -1 unknown 1 1"},
             {"a pause is left out; after the session's length both playing and the group are to be said anew",
              "0 out group=1 formatID=F1; 10 out=false; 100 out; 110 length=1 out; 120 out; 130 formatID=F2;"
              "140 group=1; 150 length=1",
              "10.0 F1 -1 unknown 1 3; 10.0 F1 -1 unknown 2 3; 10.0 F2 -1 unknown 3 3"},
-            {"what was before counts from its own time", "10 formatID=F2; 17 length=1",
-             "8.0 F1 -1 unknown 1 2; 7.0 F2 -1 unknown 2 2", "2 out group=1 formatID=F1"},
+            {"what was before counts from its own time",
+             "2 out group=1 formatID=F1 | 10 formatID=F2; 17 length=1",
+             "8.0 F1 -1 unknown 1 2; 7.0 F2 -1 unknown 2 2"},
         });
 }
 
@@ -145,11 +142,11 @@ TEST_F(ProducersTest, SummariesAreSentAtTheStopAndSomeToSomeWorkersOnly) {
               "\"unknown\"");
     EXPECT_EQ(volume(messages, 0s, &process)[0]->payload().find("play_seconds")->kind(),
               Value::Kind::singleFloat);
-    EXPECT_EQ(group(messages, 0s)[0]->destinationWorkers(),
+    EXPECT_EQ(group(messages, 0s, nullptr)[0]->destinationWorkers(),
               (DestinationWorkers{workerClassNamed("ZRReportingSessionEventryWorker"),
                                   workerClassNamed("ZRReportingSessionSummaryJsonFileWorker")}));
     setInternalBuild(true);
-    EXPECT_EQ(group(messages, 0s)[0]->destinationWorkers(), DestinationWorkers{});
+    EXPECT_EQ(group(messages, 0s, nullptr)[0]->destinationWorkers(), DestinationWorkers{});
 }
 
 TEST_F(ProducersTest, WrongKindsFollowTheReadingRules) {

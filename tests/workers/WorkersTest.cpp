@@ -90,65 +90,54 @@ TEST_F(WorkersTest, AnalyticsEventsHaveAGeneralNameAndOneOfTheService) {
     EXPECT_THAT(device.analyticsEvents.events(), IsEmpty()) << "the worker holds its session weakly";
 }
 
-TEST_F(WorkersTest, EachPowerTriggerIsAnEventAndWhatIsMissingIsLeftOut) {
-    const auto worker = make<ZRReportingSessionJouleryWorker>();
+TEST_F(WorkersTest, PowerEventsAndMetricRecordsHaveWhatThereIs) {
+    const auto joulery = make<ZRReportingSessionJouleryWorker>();
+    const auto qmx = make<ZRReportingSessionQMXWorker>();
     const struct {
-        Value appName;
-        Dictionary payload;
-        const char* events;
-        const char* logged = "";
+        Value application;
+        AudioEventType type;
+        const char* payload;
+        const char* written; ///< power events, and records as `DURATION ISSUETYPE|NODE|RTAIDCLIENT`
+        const char* logged;  ///< a line for each thing that is missing
     } cases[] = {
-        {"Unknown",
-         {{"EngineOnTime", "5 s"}, {"EngineState", "EngineOn"}},
-         R"(EngineOnDuration {"EngineOnDuration":"5 s"} )"
-         R"(ClientStatus {"ApplicationName":"Unknown","Status":1} )",
+        {"Unknown", 8, "- EngineOnTime=5s EngineState=EngineOn",
+         R"(EngineOnDuration {"EngineOnDuration":"5s"} ClientStatus {"ApplicationName":"Unknown","Status":1} )",
          "ee"},
-        {7,
-         {{"EngineState", "engineOn"}, {"zrreporting_timestamp", "then"}},
-         R"(ClientStatus {"ApplicationName":7,"Status":0,"TimestampEnd":"then"} )"},
-        {"a",
-         {{"Haptic_Active_Hardware_Time_Seconds", 90}, {"Active_Clients", Array{"b"}}},
-         R"(LeakedHapticsSessionInfo {"Active_Clients":["b"],"Haptic_Active_Hardware_Time_Seconds":90} )"},
+        {7, 8, "then EngineState=engineOn",
+         R"(ClientStatus {"ApplicationName":7,"Status":0,"TimestampEnd":"then"} )", ""},
+        {"a", 8, R"(- Haptic_Active_Hardware_Time_Seconds=90 Active_Clients=["b"])",
+         R"(LeakedHapticsSessionInfo {"Active_Clients":["b"],"Haptic_Active_Hardware_Time_Seconds":90} )",
+         ""},
+        {"a", 7, "-", "0 ||", "eeee"},
+        {"a", 7, "- issue_type=3 any_channel_silence_seconds=2.9", "2 3||", "ee"},
+        {"a", 7, R"(- issue_type="" rtaid_client="" node=0.5 any_channel_silence_seconds=-2.9)", "-2 |0.5|",
+         ""},
+        {"a", 7, R"(- node=[true] rtaid_client=[1,"x"])", R"(0 |[true]|[1,"x"])", "ee"},
+        {"a", 7, "- node=n any_channel_silence_seconds=6442450951", "-2147483641 |n|", "ee"},
     };
     for (const auto& row : cases) {
-        session->updateConfigurationWithContentsOfConfiguration({{"HostApplicationDisplayID", row.appName}});
-        worker->handleMessage(messageOf(row.payload, 4, AudioEventTypeJoulery));
-        std::string found;
+        session->updateConfigurationWithContentsOfConfiguration(
+            {{"HostApplicationDisplayID", row.application}});
+        joulery->handleMessage(messageOf(payloadOf(row.payload), 4, row.type));
+        qmx->handleMessage(messageOf(payloadOf(row.payload), 0xFFFFFFFF, row.type));
+        std::string written;
         for (const auto& event : std::exchange(device.powerEvents.events, {})) {
             EXPECT_EQ(event.subsystem, 28U);
-            found += event.name.substr(event.name.starts_with("Korvell_Haptics_") ? 16 : 0) + " " +
-                     jsonText(event.payload) + " ";
+            written += event.name.substr(event.name.starts_with("Korvell_Haptics_") ? 16 : 0) + " " +
+                       jsonText(event.payload) + " ";
         }
-        EXPECT_EQ(found, row.events);
-        EXPECT_EQ(loggedLevels(ZRReportingJouleryCategory()), row.logged) << jsonText(row.payload);
-    }
-}
-
-TEST_F(WorkersTest, EveryDetectedIssueIsAMetricRecordOfWhatThereIs) {
-    const auto worker = make<ZRReportingSessionQMXWorker>();
-    constexpr const char* silence = "any_channel_silence_seconds";
-    const struct {
-        Dictionary payload;
-        const char* record; ///< `DURATION ISSUETYPE|NODE|RTAIDCLIENT`
-        const char* logged; ///< a line for each thing that is missing
-    } cases[] = {
-        {{}, "0 ||", "eeee"},
-        {{{"issue_type", 3}, {silence, 2.9}}, "2 3||", "ee"},
-        {{{"issue_type", ""}, {"rtaid_client", ""}, {"node", .5F}, {silence, -2.9}}, "-2 |0.5|", ""},
-        {{{"node", Array{true}}, {"rtaid_client", Array{1, "x"}}}, R"(0 |[true]|[1,"x"])", "ee"},
-        {{{"node", "n"}, {silence, 0x1'8000'0007}}, "-2147483641 |n|", "ee"},
-    };
-    for (const auto& row : cases) {
-        worker->handleMessage(messageOf(row.payload, 0xFFFFFFFF, AudioEventTypeIssueDetector));
-        const auto& [metric, bytes] = device.diagnosticsMetrics.records.back();
-        EXPECT_EQ(metric, 5963779U);
-        tools::ProtoReader reader(bytes);
-        qmxmetrics::AudioIssueDetected record;
-        EXPECT_TRUE(tools::readRecord(reader, record) && reader.atEnd() && !record.timestamp);
-        EXPECT_EQ(std::to_string(record.duration) + " " + record.issuetype + "|" + record.node + "|" +
-                      record.rtaidclient,
-                  row.record);
-        EXPECT_EQ(loggedLevels(ZRReportingQMXLogCategory()), row.logged) << row.record;
+        for (const auto& [metric, bytes] : std::exchange(device.diagnosticsMetrics.records, {})) {
+            EXPECT_EQ(metric, 5963779U);
+            tools::ProtoReader reader(bytes);
+            qmxmetrics::AudioIssueDetected record;
+            EXPECT_TRUE(tools::readRecord(reader, record) && reader.atEnd() && !record.timestamp);
+            written += std::to_string(record.duration) + " " + record.issuetype + "|" + record.node + "|" +
+                       record.rtaidclient;
+        }
+        EXPECT_EQ(written, row.written);
+        EXPECT_EQ(loggedLevels(row.type == 8 ? ZRReportingJouleryCategory() : ZRReportingQMXLogCategory()),
+                  row.logged)
+            << row.payload;
     }
 }
 
@@ -182,7 +171,8 @@ TEST_F(WorkersTest, OtherMessagesCostThemNothing) {
     const std::pair<ZRReportingSessionWorkerConsumerProtocol*, AudioEventType> sinks[] = {
         {joulery.get(), 8}, {qmx.get(), 7}, {memory.get(), 19}, {captures.get(), 6}};
     for (const auto& [worker, own] : sinks) {
-        for (const AudioEventType type : {0, 6, 7, 8, 9, 19, 7 + 256, 8 + 256, 19 + 256, 65535}) {
+        for (const AudioEventType type :
+             std::initializer_list<AudioEventType>{0, 6, 7, 8, 19, 263, 264, 275}) {
             const MessageRef message = messageOf({{"EngineOnTime", 1}, {"issue_type", 1}}, 7, type);
             const auto allocated = test::allocationsOf([&, sink = worker] { sink->handleMessage(message); });
             EXPECT_EQ(allocated.blocks == 0, type != own) << type;
