@@ -11,7 +11,6 @@ namespace {
 constexpr const char* kSpatial = "spatial-audio-accessory-feature";
 constexpr const char* kRinger = "com.vandra.dashlo.ringerstate";
 constexpr const char* kReporting = "com.vandra.tamblo.reporting";
-constexpr WallTime kStart{1'772'366'400s}; ///< of the fake clock
 
 class SystemMonitorTest : public WorkerTest {
 protected:
@@ -61,7 +60,7 @@ TEST_F(SystemMonitorTest, AStateHasTheValueAsItIsStoredAndWhenItWasRead) {
                                                          {"systemuptime_sec", 100}}));
 }
 
-TEST_F(SystemMonitorTest, RingerIsOnForTheWordOneOnlyAndUnknownWithoutANotification) {
+TEST_F(SystemMonitorTest, RingerIsOnForTheWordOneOnly) {
     const auto monitor = newMonitor();
     EXPECT_EQ(monitor->getFeatureState("ringerstate"), std::nullopt) << "never posted: the read fails";
     for (const std::uint64_t word : {1UL, 0UL, 2UL, UINT64_MAX, (1UL << 32U) + 1}) {
@@ -70,14 +69,6 @@ TEST_F(SystemMonitorTest, RingerIsOnForTheWordOneOnlyAndUnknownWithoutANotificat
         EXPECT_EQ(shown(state, {"ringerstate"}), word == 1 ? "true" : "false") << word;
     }
     EXPECT_EQ(monitor->getFeatureState("volume"), std::nullopt);
-
-    device.namedNotifications.registrationStatus = 7;
-    setName("den");
-    const auto deaf = newMonitor();
-    EXPECT_EQ(device.log.count("notify setup result 7 token 0"), 3U);
-    post(kRinger, 1);
-    EXPECT_TRUE(deaf->systemMonitorDictionary()->find("ringerstate").empty());
-    EXPECT_FALSE(deaf->systemMonitorDictionary()->find("device_name").empty());
 }
 
 TEST_F(SystemMonitorTest, OneForTheProcessUntilItIsReset) {

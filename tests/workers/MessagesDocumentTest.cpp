@@ -17,11 +17,6 @@ namespace {
 
 using Row = std::vector<std::string>; ///< the cells of a table's row, without code marks
 
-struct Section {
-    std::vector<Row> rows;
-    std::vector<std::string> json; ///< the lines of its code blocks
-};
-
 Row cellsOf(const std::string& line) {
     Row cells;
     std::istringstream text(line.substr(1));
@@ -33,28 +28,23 @@ Row cellsOf(const std::string& line) {
     return cells;
 }
 
-std::map<std::string, Section> sectionsOfThePage() {
-    std::ifstream page(EXAMPLES_DIR "/../docs/messages.md");
-    EXPECT_TRUE(page);
-    std::map<std::string, Section> sections;
-    Section* section = &sections[""];
-    for (std::string line; std::getline(page, line);) {
-        if (line.starts_with("##")) {
-            section = &sections[line.substr(line.find(' ') + 1)];
-        } else if (line.starts_with("{")) {
-            section->json.push_back(line);
-        } else if (line.starts_with("| ") && !line.starts_with("| key")) {
-            section->rows.push_back(cellsOf(line));
-        }
-    }
-    return sections;
-}
-
 class MessagesDocumentTest : public WorkerTest {
 protected:
-    MessagesDocumentTest() : WorkerTest(LogLevel::error) {}
-
-    std::map<std::string, Section> page = sectionsOfThePage();
+    MessagesDocumentTest() : WorkerTest(LogLevel::error) {
+        std::ifstream page(EXAMPLES_DIR "/../docs/messages.md");
+        std::string heading;
+        for (std::string line; std::getline(page, line);) {
+            if (line.starts_with("##")) {
+                heading = line.substr(line.find(' ') + 1);
+            } else if (line.starts_with("{")) {
+                examples[heading].push_back(line);
+            } else if (line.starts_with("| ") && !line.starts_with("| key")) {
+                tables[heading].push_back(cellsOf(line));
+            }
+        }
+    }
+    std::map<std::string, std::vector<std::string>> examples; ///< by heading, the lines of JSON
+    std::map<std::string, std::vector<Row>> tables;
 };
 
 TEST_F(MessagesDocumentTest, ExamplesAreWhatComesOfItsSession) {
@@ -68,7 +58,7 @@ TEST_F(MessagesDocumentTest, ExamplesAreWhatComesOfItsSession) {
     session->setClientProcessName("phone");
     session->start();
     const double start = device.clock.seconds();
-    for (const std::string& text : page["What to send"].json) {
+    for (const std::string& text : examples["What to send"]) {
         auto parsed = tools::parseSessionLine(text);
         auto& line = std::get<tools::SessionLine>(parsed);
         line.payload.set("zrreporting_timestamp", start + *line.offset);
@@ -81,9 +71,9 @@ TEST_F(MessagesDocumentTest, ExamplesAreWhatComesOfItsSession) {
          {"Volume.Summary", "Kaleen.Summary", "Input.Summary", "Session_Generic.Summary", "Setup.Setup"}) {
         const std::string name = "com.vandra.tamblo." + event;
         const std::vector<Dictionary> payloads = device.analyticsEvents.payloads(name);
-        ASSERT_EQ(page[name].json.size(), payloads.size()) << name;
+        ASSERT_EQ(examples[name].size(), payloads.size()) << name;
         for (std::size_t i = 0; i < payloads.size(); ++i) {
-            Dictionary line = std::get<Value>(readJson(page[name].json[i])).dictionaryValue();
+            Dictionary line = std::get<Value>(readJson(examples[name][i])).dictionaryValue();
             EXPECT_EQ(*line.find("event"), Value(name));
             line = Dictionary(line.find("payload")->dictionaryValue());
             // What a run measures stands for itself, lengths up to a hundredth of a second.
@@ -110,7 +100,7 @@ TEST_F(MessagesDocumentTest, KeysDoWhatTheirTableSays) {
                : row[1] == "boolean" ? Value(row[0].ends_with("_running") != isChanged)
                                      : Value(isChanged ? 0.0 : 1.0);
     };
-    std::vector<Row> rows = page["What to send"].rows;
+    std::vector<Row> rows = tables["What to send"];
     std::erase_if(rows, [](const Row& row) {
         return row[0] == "zrreporting_timestamp" || row[0] == "session_duration";
     });

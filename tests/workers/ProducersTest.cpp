@@ -56,11 +56,9 @@ TEST_F(ProducersTest, VolumeSegments) {
             {"the session's length ends playing, unless output is still said to run",
              "0 out volume=0.5; 6 length=6; 20 volume=1; 30 out=0; 40 out; 50 length=10 out; 70 out=0",
              "6.0 0.5 unknown false 1 3; 10.0 1 unknown false 2 3; 20.0 1 unknown false 3 3"},
-            {"each watched setting ends one; carried settings alone do not, nor what is said again",
-             "0 out volume=0.5; 10 formatID=x channels=2; 15 ringer=0 spatial=0 format=unknown; 20 ringer;"
-             "30 spatial; 40 devices=D; 50 devices=E; 60 feature; 70 format=S; 76 out=false",
-             "20.0 0.5 unknown 0 1 6; 10.0 0.5 unknown true 2 6; 10.0 0.5 unknown true 3 6; "
-             "10.0 0.5 D true 4 6; 20.0 0.5 E true 5 6; 6.0 0.5 E true 6 6"},
+            {"what is said again ends nothing",
+             "0 out volume=0.5; 10 ringer=0 spatial=0 format=unknown; 20 ringer devices=D; 30 out=0",
+             "20.0 0.5 unknown 0 1 2; 10.0 0.5 D true 2 2"},
             {"two spatial settings less than five seconds apart are one change, at the time of the second",
              "0 out volume=0.5; 10 spatial; 14.5 feature; 30 spatial=false; 35 feature=false; 50 out=false",
              "14.5 0.5 unknown false 1 3; 15.5 0.5 unknown false 2 3; 20.0 0.5 unknown false 3 3"},

@@ -18,7 +18,6 @@ namespace {
 using Json = nlohmann::json;
 
 constexpr pid_t kService = 4321;
-constexpr WallTime kStart{1'772'366'400s}; ///< of the fake clock
 
 TEST(ReportFileNameTest, TellsLocalTimeAndSession) {
     const std::string longest(206, 'x');
@@ -31,7 +30,6 @@ TEST(ReportFileNameTest, TellsLocalTimeAndSession) {
         std::string name;
     } cases[] = {
         {1'773'476'813, -12'600, -7, "a b'\xC3\xA9", "20260314-045653-0330--7-a b'\xC3\xA9-test.json"},
-        {1'772'323'199, 1, 1, "", "20260301-000000+0000-1--test.json"},
         {951'782'400, 45'900, INT64_MIN, "a", "20000229-124500+1245--9223372036854775808-a-test.json"},
         // A name is one part of one file name, whatever a client sends.
         {0, 0, 1, std::string("../a\0b\n\x1F\x7F", 9), epoch + ".._a_b___-test.json"},
@@ -140,14 +138,6 @@ TEST_F(ReportFilesTest, EachFailedStepIsTold) {
         EXPECT_EQ(loggedLevels(ZRReportingTraceCategory()), "e") << c.told;
         files.*c.failure = std::nullopt;
     }
-}
-
-TEST_F(ReportFilesTest, WhatHasNoFormLeavesItsSeparator) {
-    sendVolume({{"deep", Array{Dictionary{{"when", Value::date(1)}}}}});
-    sendVolume({{"x", INFINITY}});
-    sendVolume({{"n", 3}});
-    EXPECT_TRUE(summary().starts_with("[\n,\n,\n{\n  \"Volume_Start_3\": {"));
-    EXPECT_EQ(loggedLevels(ZRReportingSessionCategory()), "ieei");
 }
 
 TEST_F(ReportFilesTest, SummariesAreWrittenInPiecesAndEachOutageIsToldOnce) {

@@ -77,6 +77,7 @@ inline std::vector<MessageRef> messagesOf(const std::string& texts, double start
 
 inline constexpr pid_t kClient = 77;
 inline constexpr pid_t kOtherClient = 78;
+inline constexpr WallTime kStart{1'772'366'400s}; ///< of the fake clock: 2026-03-01, 12:00
 
 /// A row of a table: what is played, as a text, and what comes of it.
 struct Played {

@@ -1,3 +1,4 @@
+#include "base/Format.h"
 #include "platform/ProcessList.h"
 #include "session/WorkerClass.h"
 #include "tests/base/AllocationCount.h"
@@ -5,12 +6,15 @@
 #include "tools/MetricRecord.h"
 #include "workers/accessories/AccessoryRegistry.h"
 #include "workers/accessories/ZRReportingSessionAudioRegistrationWorker.h"
+#include "workers/sinks/LinkmeterSummary.h"
 #include "workers/sinks/ZRReportingSessionDPWorker.h"
 #include "workers/sinks/ZRReportingSessionEventryWorker.h"
 #include "workers/sinks/ZRReportingSessionJouleryWorker.h"
 #include "workers/sinks/ZRReportingSessionMemoryLogWorker.h"
 #include "workers/sinks/ZRReportingSessionQMXWorker.h"
+#include "workers/sinks/ZRReportingSessionRtcWorker.h"
 
+#include <algorithm>
 #include <numeric>
 
 // The list of workers, and those that write into one sink what they are offered or find.
@@ -85,9 +89,6 @@ TEST_F(WorkersTest, AnalyticsEventsHaveAGeneralNameAndOneOfTheService) {
     }
     device.analyticsEvents.setEventsInUse({{"com.vandra.systemsounds.Volume.Start"}});
     EXPECT_EQ(eventsOf(13, 14, 1), "systemsounds.Volume.Start ") << "which are in use is seen at once";
-    session.reset();
-    worker->handleMessage(messageOf({}, 14, 1));
-    EXPECT_THAT(device.analyticsEvents.events(), IsEmpty()) << "the worker holds its session weakly";
 }
 
 TEST_F(WorkersTest, PowerEventsAndMetricRecordsHaveWhatThereIs) {
@@ -156,28 +157,21 @@ TEST_F(WorkersTest, ASecondPassesBetweenMemoryRecordsUnlessTheClockIsSetBack) {
     }
     EXPECT_EQ(requests[0].reporterID, 5);
     EXPECT_THAT(requests[0].processes, ElementsAre(kClient, kOtherClient, 7));
-    session.reset();
-    device.clock.advance(1h);
-    worker->handleMessage(message);
-    EXPECT_THAT(requests, SizeIs(1));
 }
 
 TEST_F(WorkersTest, OtherMessagesCostThemNothing) {
     device.setThreshold(LogLevel::info);
-    const auto joulery = make<ZRReportingSessionJouleryWorker>();
-    const auto qmx = make<ZRReportingSessionQMXWorker>();
-    const auto memory = make<ZRReportingSessionMemoryLogWorker>();
-    const auto captures = make<ZRReportingSessionDPWorker>();
-    const std::pair<ZRReportingSessionWorkerConsumerProtocol*, AudioEventType> sinks[] = {
-        {joulery.get(), 8}, {qmx.get(), 7}, {memory.get(), 19}, {captures.get(), 6}};
+    const std::pair<std::shared_ptr<ZRReportingSessionWorkerConsumerProtocol>, AudioEventType> sinks[] = {
+        {make<ZRReportingSessionJouleryWorker>(), 8},
+        {make<ZRReportingSessionQMXWorker>(), 7},
+        {make<ZRReportingSessionMemoryLogWorker>(), 19},
+        {make<ZRReportingSessionDPWorker>(), 6}};
     for (const auto& [worker, own] : sinks) {
-        for (const AudioEventType type :
-             std::initializer_list<AudioEventType>{0, 6, 7, 8, 19, 263, 264, 275}) {
-            const MessageRef message = messageOf({{"EngineOnTime", 1}, {"issue_type", 1}}, 7, type);
+        for (const int type : {6, 7, 8, 19, 263, 264, 275}) {
+            const MessageRef message = messageOf({{"EngineOnTime", 1}}, 7, static_cast<AudioEventType>(type));
             const auto allocated = test::allocationsOf([&, sink = worker] { sink->handleMessage(message); });
             EXPECT_EQ(allocated.blocks == 0, type != own) << type;
         }
-        worker->handleMessage(nullptr);
     }
 }
 
@@ -202,42 +196,43 @@ TEST(ProcessListTest, TakesWhatIsAProcessOnceAndUpToItsLimit) {
     EXPECT_THAT(std::move(own).take(), SizeIs(64));
 }
 
-const WallTime kNow{1'772'366'400s}; ///< of the fake clock: 2026-03-01, 12:00
 const std::string kEntry = R"("first_seen":"2025-12-31","last_seen":"2026-02-28","last_reported":)";
 
 TEST(AccessoryRegistryTest, ReportsEachAccessoryOnceInADay) {
-    const std::string day = R"("last_seen_day":"2026-03-01","model":"m"})";
-    const std::string known = R"({"first_seen_day":"2025-12-31",)" + day;
-    const std::string isNew = R"({"first_seen_day":"2026-03-01",)" + day;
     const auto reportedAgo = [](std::chrono::seconds time) {
-        return "{" + kEntry + std::to_string((kNow - time).time_since_epoch() / 1s) + "}";
+        return "{" + kEntry + std::to_string((kStart - time).time_since_epoch() / 1s) + "}";
     };
     const struct {
-        std::string kept; ///< of the accessory that is seen
-        std::string report;
+        std::string kept;     ///< of the accessory that is seen
+        std::string reported; ///< the day on which it was first seen, when it is reported
         bool hadRubbish = false;
     } cases[] = {
         {reportedAgo(24h - 1s), ""},
-        {reportedAgo(24h), known},
+        {reportedAgo(24h), "2025-12-31"},
         // A clock that was set back, a little or by years.
         {reportedAgo(-24h + 1s), ""},
-        {reportedAgo(-24h), known},
-        {R"({"first_seen":"2031-01-01","last_seen":"2031-01-01","last_reported":1.5})", isNew},
+        {reportedAgo(-24h), "2025-12-31"},
+        {R"({"first_seen":"2031-01-01","last_seen":"2031-01-01","last_reported":1.5})", "2026-03-01"},
         // What is no entry.
-        {"7", isNew, true},
-        {R"({"first_seen":"2026-02-28","last_seen":"yesterday","last_reported":1})", isNew, true},
-        {R"({"first_seen":5,"last_seen":"2026-02-28","last_reported":1})", isNew, true},
-        {R"({"first_seen":"2026-02-28","last_seen":"2026-02-28","last_reported":"1"})", isNew, true},
+        {"7", "2026-03-01", true},
+        {R"({"first_seen":"2026-02-28","last_seen":"yesterday","last_reported":1})", "2026-03-01", true},
+        {R"({"first_seen":5,"last_seen":"2026-02-28","last_reported":1})", "2026-03-01", true},
+        {R"({"first_seen":"2026-02-28","last_seen":"2026-02-28","last_reported":"1"})", "2026-03-01", true},
     };
     const Accessory seen[] = {{"a", "m"}};
     for (const auto& c : cases) {
         const Value kept = std::get<Value>(readJson("{\"a\":" + c.kept + ",\"b\":{" + kEntry + "1.0}}"));
-        const AccessoryRegistry::Update update = AccessoryRegistry::update(kept, seen, kNow);
-        EXPECT_EQ(update.reports.empty() ? "" : jsonText(update.reports[0]), c.report) << c.kept;
+        const AccessoryRegistry::Update update = AccessoryRegistry::update(kept, seen, kStart);
+        EXPECT_EQ(update.reports.empty()
+                      ? ""
+                      : shown(update.reports[0], {"first_seen_day", "last_seen_day", "model"}),
+                  c.reported.empty() ? "" : "\"" + c.reported + R"(" "2026-03-01" "m")")
+            << c.kept;
         EXPECT_EQ(update.hadRubbish, c.hadRubbish) << c.kept;
         const Dictionary& entry = update.registered.find("a")->dictionaryValue();
         EXPECT_EQ(*entry.find("last_seen"), Value("2026-03-01"));
-        EXPECT_EQ(entry.find("last_reported")->doubleValue() == secondsSince1970(kNow), !c.report.empty());
+        EXPECT_EQ(entry.find("last_reported")->doubleValue() == secondsSince1970(kStart),
+                  !c.reported.empty());
         EXPECT_EQ(*update.registered.find("b"), *kept.dictionaryValue().find("b")) << "of another one";
     }
 }
@@ -250,21 +245,13 @@ TEST(AccessoryRegistryTest, ForgetsThoseUnseenForTheLongestTime) {
                  Dictionary{{"first_seen", day}, {"last_seen", day}, {"last_reported", 1}});
     }
     const Accessory seen[] = {{"new", ""}};
-    AccessoryRegistry::Update update = AccessoryRegistry::update(Value(kept), {}, kNow);
+    AccessoryRegistry::Update update = AccessoryRegistry::update(Value(kept), {}, kStart);
     EXPECT_THAT(update.registered, SizeIs(64));
     EXPECT_FALSE(update.registered.contains("k50")) << "of a clock that was wrong";
-    update = AccessoryRegistry::update(Value(kept), seen, kNow);
+    update = AccessoryRegistry::update(Value(kept), seen, kStart);
     EXPECT_THAT(update.registered, SizeIs(64));
     EXPECT_FALSE(update.registered.contains("k40"));
     EXPECT_EQ(*update.reports.at(0).find("model"), Value("unknown"));
-
-    std::vector<Accessory> many;
-    for (int i = 0; i < 70; ++i) {
-        many.push_back({std::to_string(i), "m"});
-    }
-    update = AccessoryRegistry::update(std::nullopt, many, kNow);
-    EXPECT_THAT(update.reports, SizeIs(64));
-    EXPECT_THAT(AccessoryRegistry::update(Value(update.registered), many, kNow).reports, IsEmpty());
 }
 
 TEST_F(WorkersTest, AccessoriesAreLookedUpAtMostOnceAMinuteAndKept) {
@@ -294,7 +281,7 @@ TEST_F(WorkersTest, AccessoriesAreLookedUpAtMostOnceAMinuteAndKept) {
     startSession(1min);
     EXPECT_EQ(device.accessories.lookups, 0) << "nobody wants the event";
     device.analyticsEvents.setEventsInUse(std::nullopt);
-    device.clock.set(kNow);
+    device.clock.set(kStart);
     (void)startedSession();
     EXPECT_EQ(reports(), 0U) << "sent on the server queue";
     startSession(0s);
@@ -312,6 +299,151 @@ TEST_F(WorkersTest, AccessoriesAreLookedUpAtMostOnceAMinuteAndKept) {
         EXPECT_EQ(reports(), c.events);
     }
     EXPECT_EQ(loggedLevels(ZRReportingAudioRegistrationCategory()), "");
+}
+
+/// The call-quality service answers, and the worker's queue runs, when a test says so.
+class RtcWorkerTest : public WorkerTest {
+protected:
+    RtcWorkerTest() { session = makeSession(AudioServiceTypeTelephony); }
+
+    void sendNumber(int n, Dictionary payload = {}) {
+        payload.set("n", n);
+        send(std::move(payload), 0x08000004, 1);
+    }
+    /// A number is sent as a message, or is a time in milliseconds; a configuration that waits is answered
+    /// with "found" back ends, or "none".
+    void play(const std::string& script) {
+        playWords(script,
+                  {{"start", [this] { session->start(); }},
+                   {"stop", [this] { session->stop(); }},
+                   {"drop", [this] { session.reset(); }},
+                   {"run", [this] { device.workQueues.run("com.vandra.tamblo.session.linkmeter"); }},
+                   {"found",
+                    [this] {
+                        device.callQuality.findBackends({{"one", "two"}});
+                    }},
+                   {"none", [this] { device.callQuality.findBackends(std::nullopt); }},
+                   {"fails", [this] { device.callQuality.sendFailure = "no room"; }},
+                   {"works", [this] { device.callQuality.sendFailure.reset(); }}},
+                  [this](const std::string& word) {
+                      const int number = std::stoi(word);
+                      word.ends_with("ms") ? device.workQueues.elapse(std::chrono::milliseconds(number))
+                                           : sendNumber(number);
+                  });
+    }
+    /// The values of the key in the messages that a Linkmeter session was given: the summary's in brackets,
+    /// an "s" for the session's own summary, which its stop sends, and an "f" if it was flushed.
+    static std::string sent(const FakeCallQualityService::FakeSession& made, std::string_view key = "n") {
+        std::string text;
+        for (const auto& message : made.messages) {
+            const Value* found = message.payload.find(key);
+            const std::string value = found != nullptr ? formatted("{}", *found) : "";
+            const bool isSummary = message.category == 0xFFFF && message.type == 0xFFFF;
+            text += message.type == AudioEventTypeSummary ? "s" : isSummary ? "[" + value + "]" : value;
+        }
+        return text + std::string(static_cast<std::size_t>(made.flushes), 'f');
+    }
+    /// What all Linkmeter sessions were sent, with a "+" for each that somebody besides the fake holds, how
+    /// many waits there are, and an "e" for each error that the log tells.
+    std::string outcome() {
+        std::string text;
+        for (const auto& made : device.callQuality.sessions) {
+            text += sent(*made) + (made.use_count() > 1 ? "+" : "") + "/";
+        }
+        const std::string levels = loggedLevels(ZRReportingSessionLinkmeterCategory());
+        return text + std::to_string(device.workQueues.delayedCalls()) +
+               std::string(static_cast<std::size_t>(std::ranges::count(levels, 'e')), 'e');
+    }
+};
+
+TEST_F(RtcWorkerTest, DescribesTheSessionToTheService) {
+    session = makeSession(AudioServiceTypeTelephony,
+                          {{"ClientName", "other"}, {"HostApplicationDisplayID", "app"}, {"x", 1}});
+    session->setIsSingleMessageSession(true);
+    play("start run");
+    const auto& made = *device.callQuality.sessions.back();
+    EXPECT_EQ(shown(made.sessionInfo, {"BatchEvent", "ContainsRealtimeEvents", "ClientBundleID"}),
+              R"(true false "app")");
+    EXPECT_EQ(shown(made.userInfo, {"ClientName", "ServiceName", "x"}), R"("other" "telephony" 1)");
+    session->setServiceType(AudioServiceTypeTest);
+    EXPECT_EQ(make<ZRReportingSessionRtcWorker>()->start(), false);
+}
+
+TEST_F(RtcWorkerTest, SetsUpThenSendsInOrderWhateverComesOfIt) {
+    const Played cases[] = {
+        {"what is handed in meanwhile follows", "start 1 run 2 run", "+/1"},
+        {"back ends at the last moment", "start 1 run 2 run stop run 8999ms found 9000ms run", "12s[1,2]f/0"},
+        {"no back ends", "start 1 run 2 run stop run none run", "+/0e"},
+        {"none, and too late", "start 1 run 2 run stop run 9000ms none run", "/0e"},
+        {"found too late, before what waited has run", "start 1 run stop run 9000ms found run", "/0"},
+        {"one that cannot be sent", "start run found run fails 1 run works 2 run", "2+/0e"},
+        {"two runs before the queue gets to them", "start run found 1 stop 2 start 3 stop run", "1s[1]f/+/1"},
+        {"each set up anew", "start run found 1 stop 2 start 3 stop run found run", "1s[1]f/3s[3]f/0"},
+        {"found after it: on, without a session", "start run 9000ms run found 1 run", "/0"},
+        {"the next run is not on", "start run 9000ms run found stop start 1 run", "/+/0"},
+        {"until its own are found", "start run 9000ms run found stop start run found 1 run", "/1+/0"},
+        {"a dropped session leaves nothing", "start run 1 drop run found run", "/0"},
+        {"nor before it waits", "start 1 drop run found run", "/0"},
+        {"when nothing waits, all is sent", "start run found run 1 drop run", "1/0"},
+        {"a stopped one is reported in full", "start run 1 stop drop run found run", "1s[1]f/0"},
+        {"or when the wait is over", "start run 1 stop drop run 9000ms run", "/0"},
+        {"whenever it was dropped", "start 1 stop drop run found run", "1s[1]f/0"},
+    };
+    for (const auto& row : cases) {
+        device.callQuality.sessions.clear();
+        device.callQuality.completions.clear();
+        session = makeSession(AudioServiceTypeTelephony);
+        device.log.clear();
+        play(row.script);
+        EXPECT_EQ(outcome(), row.expected) << row.what;
+        play("drop 9000ms run");
+    }
+    device.callQuality.token.reset();
+    session = makeSession(AudioServiceTypeTelephony);
+    device.callQuality.sessions.clear();
+    play("start 1 stop run");
+    EXPECT_EQ(outcome(), "0e") << "without a token nothing is opened";
+}
+
+TEST_F(RtcWorkerTest, TheSummaryJoinsWhatWasSentOnceWhileStarted) {
+    const auto& sessions = device.callQuality.sessions;
+    sendNumber(0, {{"early", true}});
+    play("start run found");
+    sendNumber(1, {{"zrreporting_timestamp", 4e9}});
+    sendNumber(1, {{"zrreporting_timestamp", 4e9}});
+    const MessageRef elsewhere = messageOf({{"n", 2}, {"zrreporting_timestamp", 5e9}}, 4, 1);
+    elsewhere->setDestinationWorkers({workerClassNamed("ZRReportingSessionEventryWorker")});
+    session->sendMessage(elsewhere);
+    play("run stop run");
+    EXPECT_EQ(sessions[0]->messages[0].category, 4) << "the kind";
+    EXPECT_EQ(outcome(), "1s[1,2]f/0") << "the destinations count for the sending alone";
+    EXPECT_EQ(sent(*sessions[0], "zrreporting_timestamp"), "s[]f") << "outside internal builds";
+    EXPECT_EQ(shown(sessions[0]->messages.back().payload, {"ZR_Session_Summary_Event", "early"}), "\"2\"");
+    setInternalBuild(true);
+    session = makeSession(AudioServiceTypeTelephony);
+    play("start run found");
+    sendNumber(3, {{"zrreporting_timestamp", 4e9}});
+    play("run");
+    EXPECT_EQ(sent(*sessions[1], "zrreporting_timestamp"), "4000000000.0");
+}
+
+TEST(LinkmeterSummaryTest, ValuesAreTextsInTheOrderOfTheMessages) {
+    const auto messages = messagesOf({{{"a", ""}, {"b", true}, {"c", Array{1, "x"}}},
+                                      {{"a", "x"}, {"b", 0.5F}, {"ZR_Session_Summary_Event", "mine"}},
+                                      {{"a", "y,z"}, {"b", NAN}, {"d", Value::date(0)}},
+                                      {{"a", Dictionary{{"k", 1}}}, {"b", ~0ULL}, {"c", Value::data({})}},
+                                      {{"a", "a repeat"}},
+                                      {{"a", "before the start"}}});
+    for (const MessageRef& message : messages) {
+        message->isSessionStarted = message != messages.back();
+    }
+    messages[4]->isRedundant = true;
+    EXPECT_EQ(linkmeterSummary(messages, AudioServiceTypeUnknown),
+              (Dictionary{{"a", R"(,x,y,z,{"k":1})"},
+                          {"b", "true,0.5,null,18446744073709551615"},
+                          {"c", R"([1,"x"],"")"},
+                          {"d", R"("1970-01-01T00:00:00.000Z")"},
+                          {"ZR_Session_Summary_Event", "65535,mine"}}));
 }
 
 } // namespace

@@ -19,10 +19,10 @@ constexpr const char* kSoundKey = "System_Sound_Stuck_Time_Seconds";
 const Dictionary kLow{{"issue_type", "LowRMS"}};
 const Dictionary kOpened{{"success", true}, {"session_id", "S-1"}};
 
-class CapturesTest : public WorkerTest {
+class CaptureWorkersTest : public WorkerTest {
 protected:
     using Worker = ZRReportingSessionDPWorker;
-    CapturesTest() : WorkerTest(LogLevel::debug, true) {
+    CaptureWorkersTest() : WorkerTest(LogLevel::debug, true) {
         device.deviceProperties.set("HapticLeakCapture", true);
         prefer("TalvixInvalidXyBackOffSeconds", "60.5 s");
         prefer("enable_stackburst", "YES");
@@ -109,7 +109,7 @@ protected:
     const Dictionary overload{{kSize, 512}, {kCycle, 3}};
 };
 
-TEST_F(CapturesTest, DraftsFiveSecondsAfterTheFirstMessageOnceInARunAndInABackOffPeriod) {
+TEST_F(CaptureWorkersTest, DraftsFiveSecondsAfterTheFirstMessageOnceInARunAndInABackOffPeriod) {
     const auto& requests = device.bugReportDrafting.requests;
     EXPECT_EQ(drafts("0 5 x5.1 5.1 7 stop +60499 70 +1 70"), "...d..d");
     EXPECT_EQ(requests.front().processName, "caller");
@@ -127,7 +127,7 @@ TEST_F(CapturesTest, DraftsFiveSecondsAfterTheFirstMessageOnceInARunAndInABackOf
     EXPECT_EQ(loggedLevels(ZRReportingSessionCategory()), "es") << "the rubbish, the draft";
 }
 
-TEST_F(CapturesTest, CapturesOverloadsOfLargeBuffersAndCycles) {
+TEST_F(CaptureWorkersTest, CapturesOverloadsOfLargeBuffersAndCycles) {
     EXPECT_FALSE(isCaptured(*tryToMake<Worker>(), overload, 6, 0x08000007));
     EXPECT_FALSE(isCaptured(*tryToMake<Worker>(), overload, 5, 7));
     const struct {
@@ -153,7 +153,7 @@ TEST_F(CapturesTest, CapturesOverloadsOfLargeBuffersAndCycles) {
     }
 }
 
-TEST_F(CapturesTest, NamesTheApplicationAndWaitsForMoreThanTenSeconds) {
+TEST_F(CaptureWorkersTest, NamesTheApplicationAndWaitsForMoreThanTenSeconds) {
     const auto worker = tryToMake<Worker>();
     Dictionary payload = overload;
     payload.set("HostApplicationDisplayID", "com.a");
@@ -171,7 +171,7 @@ TEST_F(CapturesTest, NamesTheApplicationAndWaitsForMoreThanTenSeconds) {
     EXPECT_THAT(device.namedNotifications.posted, ElementsAre(posted, posted, posted));
 }
 
-TEST_F(CapturesTest, WaitsAsLongAsWantedAndTheServerQueueMayThenBlock) {
+TEST_F(CaptureWorkersTest, WaitsAsLongAsWantedAndTheServerQueueMayThenBlock) {
     const std::pair<Value, std::int64_t> cases[] = {
         {0.9, 0}, {1'500'000.9, 1'500'000}, {-1, 0}, {4'294'967'296.0, 4'294'967'295}, {NAN, 0}};
     for (const auto& [preference, microseconds] : cases) {
@@ -184,7 +184,7 @@ TEST_F(CapturesTest, WaitsAsLongAsWantedAndTheServerQueueMayThenBlock) {
     }
 }
 
-TEST_F(CapturesTest, AValueOfTheWrongKindIsOneErrorLineUntilItChanges) {
+TEST_F(CaptureWorkersTest, AValueOfTheWrongKindIsOneErrorLineUntilItChanges) {
     const std::pair<Value, const char*> cases[] = {
         // one line: it is no number; two: nor is it a flag
         {" -.5", ""}, {"NO", "e"}, {"true", "e"}, {"", "ee"}, {Array{1}, "ee"},
@@ -201,7 +201,7 @@ TEST_F(CapturesTest, AValueOfTheWrongKindIsOneErrorLineUntilItChanges) {
     }
 }
 
-TEST_F(CapturesTest, DetectorsAskForCaptures) {
+TEST_F(CaptureWorkersTest, DetectorsAskForCaptures) {
     const Played cases[] = {
         {"leaks are of every session and category, but of one type", "single issue issue both both",
          "snapshot systemsounds; snapshot haptics; "},
@@ -245,7 +245,7 @@ TEST_F(CapturesTest, DetectorsAskForCaptures) {
     EXPECT_EQ(captures.reportersMade, 2);
 }
 
-TEST_F(CapturesTest, CapturesSayWhatTheyAreOf) {
+TEST_F(CaptureWorkersTest, CapturesSayWhatTheyAreOf) {
     play("alarms haptic haptic low low low");
     std::string found;
     for (const auto& [operation, processes, filed, duration, payload, name] : device.bugCapture.requests) {
@@ -256,7 +256,7 @@ TEST_F(CapturesTest, CapturesSayWhatTheyAreOf) {
                      "Tonmetry/alarms/Error/IssueDetector/caller 60.000000; ");
 }
 
-TEST_F(CapturesTest, AnswersComeOnAnyThreadAndWhenEverythingIsGone) {
+TEST_F(CaptureWorkersTest, AnswersComeOnAnyThreadAndWhenEverythingIsGone) {
     play("alarms low low low sound");
     session.reset();
     device.restart();
@@ -273,22 +273,18 @@ TEST_F(CapturesTest, AnswersComeOnAnyThreadAndWhenEverythingIsGone) {
     EXPECT_EQ(device.bugCapture.requests.back().session, "S-1");
 }
 
-TEST_F(CapturesTest, RepliesSayWhetherThereIsACapture) {
-    const struct {
-        Dictionary response;
-        const char* levels;
-        const char* identifier = "NONE_RETURNED";
-    } cases[] = {
-        {{{"success", 1.0}, {"session_id", 17}}, "i", "17"},
-        {{{"success", true}, {"reason", 3}}, "e"},
-        {{{"success", 2}, {"session_id", "S"}}, "e"},
-        {{{"reason", 0x1'0000'0000}}, "e"},
-        {{{"reason", 10}}, "i"},
-        {{{"reason", 0xFFFF'FFFF}}, "i"},
+TEST_F(CaptureWorkersTest, RepliesSayWhetherThereIsACapture) {
+    const std::pair<Dictionary, const char*> cases[] = {
+        {{{"success", 1.0}, {"session_id", 17}}, "i 17"},
+        {{{"success", true}, {"reason", 3}}, "e NONE_RETURNED"},
+        {{{"success", 2}, {"session_id", "S"}}, "e NONE_RETURNED"},
+        {{{"reason", 0x1'0000'0000}}, "e NONE_RETURNED"},
+        {{{"reason", 10}}, "i NONE_RETURNED"},
+        {{{"reason", 0xFFFF'FFFF}}, "i NONE_RETURNED"},
     };
-    for (const auto& [response, levels, identifier] : cases) {
-        EXPECT_EQ(ZRReportingSessionZephWorker::getSessionIdentifierFromResponse(response), identifier);
-        EXPECT_EQ(loggedLevels(ZRReportingZephLogCategory()), levels);
+    for (const auto& [response, expected] : cases) {
+        const auto identifier = ZRReportingSessionZephWorker::getSessionIdentifierFromResponse(response);
+        EXPECT_EQ(loggedLevels(ZRReportingZephLogCategory()) + " " + identifier, expected);
     }
 }
 
