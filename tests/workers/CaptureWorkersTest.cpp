@@ -14,10 +14,23 @@ constexpr const char* kLastRun = "TalvixInvalidXyQLTlastRun";
 constexpr const char* kSize = "smallest_buffer_frame_size";
 constexpr const char* kCycle = "io_cycle";
 
-constexpr const char* kHapticKey = "Haptic_Active_Hardware_Time_Seconds";
-constexpr const char* kSoundKey = "System_Sound_Stuck_Time_Seconds";
-const Dictionary kLow{{"issue_type", "LowRMS"}};
+struct Sent {
+    Dictionary payload;
+    AudioEventCategory category;
+    AudioEventType type;
+};
+const std::map<std::string, Sent> kMessages{
+    {"haptic", {payloadOf("- Haptic_Active_Hardware_Time_Seconds=90"), 4, 8}},
+    {"sound", {payloadOf("- System_Sound_Stuck_Time_Seconds=90"), 4, 8}},
+    {"both",
+     {payloadOf("- Haptic_Active_Hardware_Time_Seconds=x System_Sound_Stuck_Time_Seconds=0"), ~0U, 8}},
+    {"issue", {payloadOf("- Haptic_Active_Hardware_Time_Seconds System_Sound_Stuck_Time_Seconds"), 11, 7}},
+    {"low", {payloadOf("- issue_type=LowRMS"), 11, 7}},
+    {"lowercase", {payloadOf("- issue_type=lowRMS"), 11, 7}},
+    {"low-of-session", {payloadOf("- issue_type=LowRMS"), 0x0800000B, 7}},
+    {"low-error", {payloadOf("- issue_type=LowRMS"), 11, 6}}};
 const Dictionary kOpened{{"success", true}, {"session_id", "S-1"}};
+const Dictionary kFailed{{"reason", 1}};
 
 class CaptureWorkersTest : public WorkerTest {
 protected:
@@ -62,49 +75,26 @@ protected:
         session->setIsSingleMessageSession(isSingle);
         session->start();
     }
-    void sendNow(const Dictionary& payload, AudioEventCategory category, AudioEventType type) {
-        device.clock.advance(1ms);
-        send(payload, category, type);
-    }
-    /// A number is a time in seconds.
+    /// A number is a time in seconds; what is a message is sent now.
     void play(const std::string& script) {
         playWords(script,
                   {{"alarms", [this] { startSession(AudioServiceTypeAlarms); }},
                    {"alerts", [this] { startSession(AudioServiceTypeAlerts); }},
                    {"test", [this] { startSession(AudioServiceTypeTest); }},
                    {"single", [this] { startSession(AudioServiceTypeAlarms, true); }},
-                   {"both",
-                    [this] {
-                        sendNow({{kHapticKey, "x"}, {kSoundKey, false}}, 0xFFFFFFFF, 8);
-                    }},
-                   {"issue",
-                    [this] {
-                        sendNow({{kHapticKey, 1}, {kSoundKey, 1}}, 11, 7);
-                    }},
-                   {"lowercase",
-                    [this] {
-                        sendNow({{"issue_type", "lowRMS"}}, 11, 7);
-                    }},
-                   {"low-of-session", [this] { sendNow(kLow, 0x0800000B, 7); }},
-                   {"low-error", [this] { sendNow(kLow, 11, AudioEventTypeError); }},
-                   {"low", [this] { sendNow(kLow, AudioEventKindError, AudioEventTypeIssueDetector); }},
-                   {"haptic",
-                    [this] {
-                        sendNow({{kHapticKey, 90}}, 4, AudioEventTypeJoulery);
-                    }},
-                   {"sound",
-                    [this] {
-                        sendNow({{kSoundKey, 90}}, 4, AudioEventTypeJoulery);
-                    }},
                    {"start", [this] { session->start(); }},
                    {"stop", [this] { session->stop(); }},
                    {"answered", [this] { device.bugCapture.answer(kOpened); }},
-                   {"failing",
-                    [this] {
-                        device.bugCapture.promptAnswer = Dictionary{{"reason", 1}};
-                    }},
+                   {"failing", [this] { device.bugCapture.promptAnswer = kFailed; }},
                    {"refused", [this] { device.bugCapture.accepts = false; }}},
-                  [this](const auto& word) { device.clock.advance(std::chrono::seconds(std::stoi(word))); });
+                  [this](const std::string& word) {
+                      if (const auto message = lookUp(kMessages, word)) {
+                          device.clock.advance(1ms);
+                          send(message->payload, message->category, message->type);
+                      } else {
+                          device.clock.advance(std::chrono::seconds(std::stoi(word)));
+                      }
+                  });
     }
     const Dictionary overload{{kSize, 512}, {kCycle, 3}};
 };

@@ -82,8 +82,8 @@ TEST_F(WorkersTest, AnalyticsEventsHaveAGeneralNameAndOneOfTheService) {
         return names;
     };
     for (int i = 0; i < 2; ++i) { // the names are remembered
-        EXPECT_EQ(eventsOf(2, 0x08000001, 11),
-                  "tamblo.Session_Generic.Summary telephony.Session_Generic.Summary ");
+        EXPECT_EQ(eventsOf(2, 0x08000001, 1),
+                  "tamblo.Session_Generic.Start telephony.Session_Generic.Start ");
         EXPECT_EQ(eventsOf(99, 0xFFFFFFFF, 65535), "tamblo.Undefined.Unknown unknown.Undefined.Unknown ");
         EXPECT_EQ(eventsOf(13, 14, 1), "tamblo.Volume.Start systemsounds.Volume.Start ");
     }
@@ -98,21 +98,19 @@ TEST_F(WorkersTest, PowerEventsAndMetricRecordsHaveWhatThereIs) {
         Value application;
         AudioEventType type;
         const char* payload;
-        const char* written; ///< power events, and records as `DURATION ISSUETYPE|NODE|RTAIDCLIENT`
-        const char* logged;  ///< a line for each thing that is missing
+        const char* written;     ///< power events, and records as `DURATION ISSUETYPE|NODE|RTAIDCLIENT`
+        const char* logged = ""; ///< a line for each thing that is missing
     } cases[] = {
         {"Unknown", 8, "- EngineOnTime=5s EngineState=EngineOn",
          R"(EngineOnDuration {"EngineOnDuration":"5s"} ClientStatus {"ApplicationName":"Unknown","Status":1} )",
          "ee"},
         {7, 8, "then EngineState=engineOn",
-         R"(ClientStatus {"ApplicationName":7,"Status":0,"TimestampEnd":"then"} )", ""},
+         R"(ClientStatus {"ApplicationName":7,"Status":0,"TimestampEnd":"then"} )"},
         {"a", 8, R"(- Haptic_Active_Hardware_Time_Seconds=90 Active_Clients=["b"])",
-         R"(LeakedHapticsSessionInfo {"Active_Clients":["b"],"Haptic_Active_Hardware_Time_Seconds":90} )",
-         ""},
+         R"(LeakedHapticsSessionInfo {"Active_Clients":["b"],"Haptic_Active_Hardware_Time_Seconds":90} )"},
         {"a", 7, "-", "0 ||", "eeee"},
         {"a", 7, "- issue_type=3 any_channel_silence_seconds=2.9", "2 3||", "ee"},
-        {"a", 7, R"(- issue_type="" rtaid_client="" node=0.5 any_channel_silence_seconds=-2.9)", "-2 |0.5|",
-         ""},
+        {"a", 7, R"(- issue_type="" rtaid_client="" node=0.5 any_channel_silence_seconds=-2.9)", "-2 |0.5|"},
         {"a", 7, R"(- node=[true] rtaid_client=[1,"x"])", R"(0 |[true]|[1,"x"])", "ee"},
         {"a", 7, "- node=n any_channel_silence_seconds=6442450951", "-2147483641 |n|", "ee"},
     };
@@ -318,10 +316,7 @@ protected:
                    {"stop", [this] { session->stop(); }},
                    {"drop", [this] { session.reset(); }},
                    {"run", [this] { device.workQueues.run("com.vandra.tamblo.session.linkmeter"); }},
-                   {"found",
-                    [this] {
-                        device.callQuality.findBackends({{"one", "two"}});
-                    }},
+                   {"found", [this] { device.callQuality.findBackends(std::vector<std::string>(2, "one")); }},
                    {"none", [this] { device.callQuality.findBackends(std::nullopt); }},
                    {"fails", [this] { device.callQuality.sendFailure = "no room"; }},
                    {"works", [this] { device.callQuality.sendFailure.reset(); }}},

@@ -45,9 +45,9 @@ TEST(ReportFileNameTest, TellsLocalTimeAndSession) {
 }
 
 /// On an internal build, whose sessions write both files.
-class ReportFilesTest : public WorkerTest {
+class SessionFilesTest : public WorkerTest {
 protected:
-    ReportFilesTest() : WorkerTest(LogLevel::info, true) {
+    SessionFilesTest() : WorkerTest(LogLevel::info, true) {
         session = makeSession(AudioServiceTypeVelka);
         worker = tryToMake<ZRReportingSessionSummaryJsonFileWorker>();
     }
@@ -79,7 +79,7 @@ protected:
     std::shared_ptr<ZRReportingSessionSummaryJsonFileWorker> worker;
 };
 
-TEST_F(ReportFilesTest, SummariesHaveOneObjectForEachMessage) {
+TEST_F(SessionFilesTest, SummariesHaveOneObjectForEachMessage) {
     sendVolume({{"n", 1}})->isRedundant = true;
     EXPECT_EQ(summary(), "") << "without messages to write there is no file";
     EXPECT_THAT(files.createdDirectories, IsEmpty());
@@ -112,7 +112,7 @@ TEST_F(ReportFilesTest, SummariesHaveOneObjectForEachMessage) {
     EXPECT_EQ(summary(), "");
 }
 
-TEST_F(ReportFilesTest, EachFailedStepIsTold) {
+TEST_F(SessionFilesTest, EachFailedStepIsTold) {
     const struct {
         std::optional<std::string> FakeReportFiles::*failure;
         const char* told;
@@ -140,7 +140,7 @@ TEST_F(ReportFilesTest, EachFailedStepIsTold) {
     }
 }
 
-TEST_F(ReportFilesTest, SummariesAreWrittenInPiecesAndEachOutageIsToldOnce) {
+TEST_F(SessionFilesTest, SummariesAreWrittenInPiecesAndEachOutageIsToldOnce) {
     for (int i = 0; i < 2000; ++i) {
         sendVolume({{"n", i}, {"text", std::string(1000, 'x')}});
     }
@@ -163,7 +163,7 @@ ProcessSample sampleOf(std::int64_t userMicroseconds, std::uint64_t faults = 0) 
     return sample;
 }
 
-TEST_F(ReportFilesTest, TracesTellWhatASessionsProcessesDid) {
+TEST_F(SessionFilesTest, TracesTellWhatASessionsProcessesDid) {
     device.processInformation.names[kService] = "tamblod";
     session->start();
     constexpr std::int64_t most = std::numeric_limits<std::int64_t>::max();
@@ -211,7 +211,7 @@ TEST_F(ReportFilesTest, TracesTellWhatASessionsProcessesDid) {
     EXPECT_EQ(events.at(5).at("dur"), 3'600'000'000) << "the clock goes on from where it was";
 }
 
-TEST_F(ReportFilesTest, HoldsSoManyTracesAtATimeAndForgetsDroppedSessions) {
+TEST_F(SessionFilesTest, HoldsSoManyTracesAtATimeAndForgetsDroppedSessions) {
     std::vector<std::shared_ptr<ZRReportingSession>> sessions;
     for (std::size_t i = 0; i < ProcessSampler::kMostRecordings + 3; ++i) {
         sessions.push_back(makeSession(AudioServiceTypeVelka, {}, static_cast<ReporterID>(i)));
