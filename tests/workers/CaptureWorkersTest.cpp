@@ -19,16 +19,6 @@ struct Sent {
     AudioEventCategory category;
     AudioEventType type;
 };
-const std::map<std::string, Sent> kMessages{
-    {"haptic", {payloadOf("- Haptic_Active_Hardware_Time_Seconds=90"), 4, 8}},
-    {"sound", {payloadOf("- System_Sound_Stuck_Time_Seconds=90"), 4, 8}},
-    {"both",
-     {payloadOf("- Haptic_Active_Hardware_Time_Seconds=x System_Sound_Stuck_Time_Seconds=0"), ~0U, 8}},
-    {"issue", {payloadOf("- Haptic_Active_Hardware_Time_Seconds System_Sound_Stuck_Time_Seconds"), 11, 7}},
-    {"low", {payloadOf("- issue_type=LowRMS"), 11, 7}},
-    {"lowercase", {payloadOf("- issue_type=lowRMS"), 11, 7}},
-    {"low-of-session", {payloadOf("- issue_type=LowRMS"), 0x0800000B, 7}},
-    {"low-error", {payloadOf("- issue_type=LowRMS"), 11, 6}}};
 const Dictionary kOpened{{"success", true}, {"session_id", "S-1"}};
 const Dictionary kFailed{{"reason", 1}};
 
@@ -88,7 +78,7 @@ protected:
                    {"failing", [this] { device.bugCapture.promptAnswer = kFailed; }},
                    {"refused", [this] { device.bugCapture.accepts = false; }}},
                   [this](const std::string& word) {
-                      if (const auto message = lookUp(kMessages, word)) {
+                      if (const auto message = lookUp(messages, word)) {
                           device.clock.advance(1ms);
                           send(message->payload, message->category, message->type);
                       } else {
@@ -96,6 +86,17 @@ protected:
                       }
                   });
     }
+    const std::map<std::string, Sent> messages{
+        {"haptic", {payloadOf("- Haptic_Active_Hardware_Time_Seconds=90"), 4, 8}},
+        {"sound", {payloadOf("- System_Sound_Stuck_Time_Seconds=90"), 4, 8}},
+        {"both",
+         {payloadOf("- Haptic_Active_Hardware_Time_Seconds=x System_Sound_Stuck_Time_Seconds=0"), ~0U, 8}},
+        {"issue",
+         {payloadOf("- Haptic_Active_Hardware_Time_Seconds System_Sound_Stuck_Time_Seconds"), 11, 7}},
+        {"low", {payloadOf("- issue_type=LowRMS"), 11, 7}},
+        {"lowercase", {payloadOf("- issue_type=lowRMS"), 11, 7}},
+        {"low-of-session", {payloadOf("- issue_type=LowRMS"), 0x0800000B, 7}},
+        {"low-error", {payloadOf("- issue_type=LowRMS"), 11, 6}}};
     const Dictionary overload{{kSize, 512}, {kCycle, 3}};
 };
 
