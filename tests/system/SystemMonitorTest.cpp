@@ -97,13 +97,13 @@ TEST_F(SystemMonitorTest, OneForTheProcessUntilItIsReset) {
     EXPECT_FALSE(second->find("ringerstate").empty());
 }
 
-/// Notes each call, then does what the test wants.
+/// Notes each call, then does what the test wants, once.
 struct Observer final : SystemMonitorDictionary::KeyObserver {
     Observer(std::string observerName, std::string& observerCalls)
         : name(std::move(observerName)), calls(observerCalls) {}
     void keyValueChanged(std::string_view) override {
         calls += name + " ";
-        act();
+        std::exchange(act, [] {})();
     }
     void observe(SystemMonitorDictionary& states, std::string_view key) {
         observation.emplace(states.addKeyObserver(*this, key));
@@ -132,10 +132,7 @@ TEST(SystemMonitorDictionaryTest, ObserversMayComeAndGoWhileTheyAreCalled) {
     };
     states->set("key", {{"key", 1}});
     EXPECT_EQ(calls, "a c ");
-    c.act = [&] {
-        c.act = [] {};
-        states->set("key", {{"key", 3}});
-    };
+    c.act = [&] { states->set("key", {{"key", 3}}); };
     states->set("key", {{"key", 2}});
     EXPECT_EQ(calls, "a c c c late late ");
 }

@@ -115,7 +115,8 @@ TEST_F(CaptureWorkersTest, DraftsFiveSecondsAfterTheFirstMessageOnceInARunAndInA
     EXPECT_EQ(device.preferences.copyPreferenceValue(kLastRun, "com.vandra.tamblo.zrreporting"),
               Value(device.clock.seconds()));
     EXPECT_EQ(requests.back().processName, "");
-    EXPECT_EQ(loggedLevels(ZRReportingSessionCategory()), "es") << "the rubbish, the draft";
+    EXPECT_EQ(loggedLevels(ZRReportingSessionCategory()), "ies")
+        << "the dropped session, the rubbish, the draft";
 }
 
 TEST_F(CaptureWorkersTest, CapturesOverloadsOfLargeBuffersAndCycles) {
