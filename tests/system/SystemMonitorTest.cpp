@@ -10,13 +10,9 @@ namespace {
 
 constexpr const char* kSpatial = "spatial-audio-accessory-feature";
 constexpr const char* kRinger = "com.vandra.dashlo.ringerstate";
-constexpr const char* kReporting = "com.vandra.tamblo.reporting";
 
 class SystemMonitorTest : public WorkerTest {
 protected:
-    auto newMonitor() {
-        return ZRReportingSystemMonitor::initWithQueue(device.services(), device.serverQueue());
-    }
     /// The context's.
     std::shared_ptr<SystemMonitorDictionary> snapshot() {
         return ZRReportingSystemMonitor::getSystemMonitorDictionary(device.context());
@@ -60,7 +56,7 @@ TEST_F(SystemMonitorTest, AStateHasTheValueAsItIsStoredAndWhenItWasRead) {
 }
 
 TEST_F(SystemMonitorTest, RingerIsOnForTheWordOneOnly) {
-    const auto monitor = newMonitor();
+    const auto monitor = ZRReportingSystemMonitor::initWithQueue(device.services(), device.serverQueue());
     EXPECT_EQ(monitor->getFeatureState("ringerstate"), std::nullopt) << "never posted: the read fails";
     for (const std::uint64_t word : {1UL, 0UL, 2UL, UINT64_MAX, (1UL << 32U) + 1}) {
         post(kRinger, word);
@@ -179,7 +175,7 @@ TEST_F(SystemMonitorTest, SessionsAreToldWhatIsKnownAtTheStartAndEveryChangeAfte
             {{"monitor", [this] { (void)makeMonitor(); }},
              {"reset", [this] { ZRReportingSystemMonitor::reset(device.context()); }},
              {"unname", [this] { device.preferences.remove("device_name", "com.vandra.tamblo"); }},
-             {"changed", [this] { post(kReporting, 0); }},
+             {"changed", [this] { post("com.vandra.tamblo.reporting", 0); }},
              {"ring", [this] { post(kRinger, 1); }},
              {"again", [this] { post(kRinger, 1, 0s); }},
              {"quiet", [this] { post(kRinger, 0); }}},

@@ -42,6 +42,21 @@ public:
             EXPECT_EQ(found, row.expected) << row.what;
         }
     }
+    /// Starts and stops the session, and sends it messages of input and output; these values of the summary
+    /// of its last stop.
+    std::string summary(const std::string& script, std::initializer_list<std::string_view> keys) {
+        const auto sendIO = [this](const std::string& words, AudioEventType type = AudioEventTypeGeneric) {
+            send(payloadOf("- " + words), AudioEventKindIO, type);
+        };
+        playWords(script,
+                  {{"start", [this] { session->start(); }},
+                   {"stop", [this] { session->stop(); }},
+                   {"both", [&] { sendIO("length=2.5 issue_type=overload"); }},
+                   {"error", [&] { sendIO("issue_type=overload", AudioEventTypeError); }}},
+                  sendIO);
+        const auto payloads = device.analyticsEvents.payloads("com.vandra.tamblo.Session_Generic.Summary");
+        return payloads.empty() ? "" : shown(payloads.back(), keys);
+    }
     const Value process = "com.example.player";
 };
 
@@ -195,26 +210,7 @@ TEST(WorkerUtilityTest, CombinesBurstsInPlace) {
     }
 }
 
-class SummaryWorkerTest : public WorkerTest {
-protected:
-    /// Starts and stops the session, and sends it messages of input and output; these values of the summary
-    /// of its last stop.
-    std::string summary(const std::string& script, std::initializer_list<std::string_view> keys) {
-        const auto sendIO = [this](const std::string& words, AudioEventType type = AudioEventTypeGeneric) {
-            send(payloadOf("- " + words), AudioEventKindIO, type);
-        };
-        playWords(script,
-                  {{"start", [this] { session->start(); }},
-                   {"stop", [this] { session->stop(); }},
-                   {"both", [&] { sendIO("length=2.5 issue_type=overload"); }},
-                   {"error", [&] { sendIO("issue_type=overload", AudioEventTypeError); }}},
-                  sendIO);
-        const auto payloads = device.analyticsEvents.payloads("com.vandra.tamblo.Session_Generic.Summary");
-        return payloads.empty() ? "" : shown(payloads.back(), keys);
-    }
-};
-
-TEST_F(SummaryWorkerTest, CountsMessagesOfTheRunAndActivityOverAllRuns) {
+TEST_F(ProducersTest, SessionSummariesCountMessagesOfTheRunAndActivityOverAllRuns) {
     const Played cases[] = {
         {"its own records of starts and stops are no messages", "stop start stop", "0 0 0 0 0.0 0.0 0"},
         {"what comes before the start counts to the run that follows, repeats among it",
@@ -231,7 +227,7 @@ TEST_F(SummaryWorkerTest, CountsMessagesOfTheRunAndActivityOverAllRuns) {
     }
 }
 
-TEST_F(SummaryWorkerTest, TellsHowTheDeviceIs) {
+TEST_F(ProducersTest, SessionSummariesTellHowTheDeviceIs) {
     device.processInformation.footprint = (std::uint64_t{4} << 30U) + (std::uint64_t{3} << 20U) + 5;
     for (const auto& [state, name] : {std::pair(0, "Nominal"), {3, "Critical"}, {4, "Unknown"}}) {
         device.deviceConditions.thermal = state;
