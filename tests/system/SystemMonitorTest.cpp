@@ -147,22 +147,22 @@ TEST(SystemMonitorDictionaryTest, EndingAnObservationWaitsForACallOnAnotherThrea
 }
 
 /// "a+" starts session a, "a-" stops it, "a!" drops it; a number is seconds, "=" sets the name. What each
-/// session was told, then the observations that there are.
+/// session was told, then the observations that there are, and all messages.
 TEST_F(SystemMonitorTest, SessionsAreToldWhatIsKnownAtTheStartAndEveryChangeAfter) {
     const Played cases[] = {
         {"the ringer once it was signalled; the same reading at the same time is no change",
          "monitor =den changed 10 a+ b+ ring again c+",
-         R"(a "den"@1>11 true@12>12 b "den"@1>11 true@12>12 c "den"@1>12 true@12>12 : 9)"},
+         R"(a "den"@1>11 true@12>12 b "den"@1>11 true@12>12 c "den"@1>12 true@12>12 : 9 6)"},
         {"preferences at once, the ringer not; names anew at their own notification",
-         "=den ring monitor a+ =attic ring", R"(a "den"@1>1 true@2>2 : 3)"},
+         "=den ring monitor a+ =attic ring", R"(a "den"@1>1 true@2>2 : 3 2)"},
         {"a value that is gone leaves the previous state", "monitor =den changed unname changed a+",
-         R"(a "den"@1>2 : 3)"},
+         R"(a "den"@1>2 : 3 1)"},
         {"a stopped session hears nothing until it starts again", "monitor a+ b+ a- ring 3 a+ quiet",
-         "a true@1>4 false@5>5 b true@1>1 false@5>5 : 6"},
+         "a true@1>4 false@5>5 b true@1>1 false@5>5 : 6 4"},
         {"one that is dropped while it is started leaves nothing behind", "monitor a+ a! ring b+ quiet",
-         "a b true@1>1 false@2>2 : 3"},
+         "a b true@1>1 false@2>2 : 3 2"},
         {"workers keep the snapshot that they found, or none",
-         "monitor ring a+ reset b+ monitor quiet 1 a- a+ c+", "a true@1>3 b c false@2>3 : 3"},
+         "monitor ring a+ reset b+ monitor quiet 1 a- a+ c+", "a true@1>3 b c false@2>3 : 3 2"},
     };
     for (const auto& row : cases) {
         session.reset();
@@ -193,10 +193,13 @@ TEST_F(SystemMonitorTest, SessionsAreToldWhatIsKnownAtTheStartAndEveryChangeAfte
                 word.back() == '+' ? meant->start() : word.back() == '-' ? meant->stop() : meant.reset();
             });
         std::string told;
+        std::int64_t messages = 0;
         for (const auto& [name, listener] : sessions) {
             told += std::string(1, name) + " " + toldTo(listener);
+            messages += listener != nullptr ? listener->totalMessageCount() : 0;
         }
-        EXPECT_EQ(told + ": " + std::to_string(snapshot()->observationCount()), row.expected) << row.what;
+        told += ": " + std::to_string(snapshot()->observationCount()) + " " + std::to_string(messages);
+        EXPECT_EQ(told, row.expected) << row.what;
     }
 }
 
