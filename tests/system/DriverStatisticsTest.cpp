@@ -104,7 +104,6 @@ TEST_F(DriverStatisticsTest, AStopSendsWhatWasGainedKindByKind) {
                                channelOf(ChanlogFormat::simpleArray, "Speaker", "s"),
                                channelOf(static_cast<ChanlogFormat>(200), "Speaker")};
     session->start();
-    EXPECT_THAT(sent(), IsEmpty());
     device.chanlog.calls.clear();
     session->stop();
     EXPECT_EQ(device.chanlog.calls, "|sdsd") << "one pass";
