@@ -1,19 +1,12 @@
 #pragma once
 
-#include "platform/Accessories.h"
-#include "platform/ChanlogFacility.h"
-#include "platform/ConnectionService.h"
-#include "platform/DeviceConditions.h"
-#include "platform/DeviceProperties.h"
-#include "platform/NamedNotifications.h"
-#include "platform/Preferences.h"
-#include "platform/ProcessInformation.h"
-#include "platform/ProcessSampling.h"
-#include "platform/StructuredLog.h"
-#include "platform/TracePoints.h"
+#include "base/WhileAlive.h"
+#include "platform/Platform.h"
 
 #include <array>
 #include <atomic>
+#include <chrono>
+#include <functional>
 #include <map>
 #include <mutex>
 #include <optional>
@@ -23,9 +16,34 @@
 #include <variant>
 #include <vector>
 
-/// The device, its settings and processes, as a test sets them; those who talk to the service, and what it
-/// logs.
+/// The device, its time, settings and processes, as a test sets them; those who talk to the service, and what
+/// it logs.
 namespace tamblo {
+
+/// Time that stands still until a test turns it; the time of day begins in March 2026, and may be set alone.
+class FakeClock final : public Clock {
+public:
+    WallTime now() const noexcept override { return now_; }
+    std::chrono::steady_clock::time_point steadyNow() const noexcept override { return steadyNow_; }
+    [[nodiscard]] double seconds() const noexcept { return secondsSince1970(now()); }
+    std::chrono::seconds utcOffset(WallTime) const override { return offset; }
+    void sleepFor(std::chrono::microseconds time) override {
+        advance(time);
+        whileAsleep();
+    }
+    void advance(std::chrono::nanoseconds step) noexcept {
+        now_ += step;
+        steadyNow_ += step;
+    }
+    void set(WallTime time) noexcept { now_ = time; }
+
+    std::chrono::seconds offset{0};
+    std::function<void()> whileAsleep = [] {};
+
+private:
+    WallTime now_{std::chrono::seconds(1'772'366'400)};
+    std::chrono::steady_clock::time_point steadyNow_{};
+};
 
 template <typename Map, typename Key> auto lookUp(const Map& map, const Key& key) {
     const auto found = map.find(key);
@@ -34,8 +52,8 @@ template <typename Map, typename Key> auto lookUp(const Map& map, const Key& key
 
 class FakeDeviceConditions final : public DeviceConditions {
 public:
-    [[nodiscard]] int thermalState() const override { return thermal; }
-    [[nodiscard]] bool isLowPowerModeEnabled() const override { return lowPower; }
+    int thermalState() const override { return thermal; }
+    bool isLowPowerModeEnabled() const override { return lowPower; }
 
     int thermal = 0;
     bool lowPower = false;
@@ -43,7 +61,7 @@ public:
 
 class FakeDeviceProperties final : public DeviceProperties {
 public:
-    [[nodiscard]] std::optional<bool> booleanProperty(std::string_view name) const override {
+    std::optional<bool> booleanProperty(std::string_view name) const override {
         return lookUp(properties_, name);
     }
     void set(const std::string& name, bool value) { properties_[name] = value; }
@@ -54,8 +72,7 @@ private:
 
 class FakePreferences final : public Preferences {
 public:
-    [[nodiscard]] std::optional<Value> copyPreferenceValue(std::string_view key,
-                                                           std::string_view domain) const override {
+    std::optional<Value> copyPreferenceValue(std::string_view key, std::string_view domain) const override {
         return lookUp(values_, std::pair(std::string(domain), std::string(key)));
     }
     void setPreferenceValue(std::string_view key, std::string_view domain, const Value& value) override {
@@ -72,31 +89,22 @@ private:
 
 class FakeProcessInformation final : public ProcessInformation {
 public:
-    [[nodiscard]] pid_t ownProcessIdentifier() const noexcept override { return own; }
-    [[nodiscard]] std::optional<std::string> ProcessNameForPid(pid_t pid) const override {
-        return lookUp(names, pid);
-    }
-    [[nodiscard]] std::chrono::duration<double> systemUptime() const noexcept override { return uptime; }
-    [[nodiscard]] std::chrono::microseconds processorTime() const noexcept override { return consumed; }
+    pid_t ownProcessIdentifier() const noexcept override { return 4321; }
+    std::optional<std::string> ProcessNameForPid(pid_t pid) const override { return lookUp(names, pid); }
+    std::chrono::duration<double> systemUptime() const noexcept override { return uptime; }
+    std::chrono::microseconds processorTime() const noexcept override { return consumed; }
+    std::variant<std::uint64_t, QueryError> physicalFootprint() const override { return footprint; }
+    std::array<double, 3> loadAverages() const override { return {0.5, 0.25, 0.125}; }
 
-    [[nodiscard]] std::variant<std::uint64_t, QueryError> physicalFootprint() const override {
-        return footprint;
-    }
-    [[nodiscard]] std::array<double, 3> loadAverages() const override { return loads; }
-
-    pid_t own = 4321;
     std::map<pid_t, std::string> names;
     std::chrono::duration<double> uptime{1000.0};
     std::chrono::microseconds consumed{0};
     std::variant<std::uint64_t, QueryError> footprint = std::uint64_t{3} << 20U;
-    std::array<double, 3> loads{0.5, 0.25, 0.125};
 };
 
 class FakeProcessSampling final : public ProcessSampling {
 public:
-    [[nodiscard]] std::optional<ProcessSample> sample(pid_t pid) const override {
-        return lookUp(samples_, pid);
-    }
+    std::optional<ProcessSample> sample(pid_t pid) const override { return lookUp(samples_, pid); }
     void set(pid_t pid, const ProcessSample& sample) { samples_[pid] = sample; }
     void end(pid_t pid) { samples_.erase(pid); }
 
@@ -106,7 +114,7 @@ private:
 
 class FakeAccessories final : public Accessories {
 public:
-    [[nodiscard]] std::vector<Accessory> connectedEarbuds() override {
+    std::vector<Accessory> connectedEarbuds() override {
         ++lookups;
         return earbuds;
     }
@@ -139,23 +147,22 @@ public:
     /// difference; a sampling begins with `|`.
     std::string calls;
 
-    [[nodiscard]] std::unique_ptr<ChanlogSampling> beginSampling() override {
+    std::unique_ptr<ChanlogSampling> beginSampling() override {
         calls += '|';
         return std::make_unique<Sampling>(*this);
     }
-    [[nodiscard]] std::variant<std::unique_ptr<ChanlogSubscription>, int>
+    std::variant<std::unique_ptr<ChanlogSubscription>, int>
     subscribe(const ChanlogSelection& selection, const ChanlogChannels& subscribed) override {
         if (subscribeError) {
             return *subscribeError;
         }
         return std::make_unique<Subscription>(selection, subscribed);
     }
-    [[nodiscard]] std::variant<ChanlogChannels, int> difference(const ChanlogChannels& earlier,
-                                                                const ChanlogChannels& later) override {
+    std::variant<ChanlogChannels, int> difference(const ChanlogChannels& earlier,
+                                                  const ChanlogChannels& later) override {
         calls += 'd';
-        constexpr int kNoEarlierSample = 2;
         if (earlier == nullptr) {
-            return kNoEarlierSample;
+            return 2;
         }
         return later;
     }
@@ -164,7 +171,7 @@ private:
     struct Subscription final : ChanlogSubscription {
         Subscription(ChanlogSelection chosen, ChanlogChannels found)
             : selection(std::move(chosen)), subscribed(std::move(found)) {}
-        [[nodiscard]] const ChanlogChannels& subscribedChannels() const override { return subscribed; }
+        const ChanlogChannels& subscribedChannels() const override { return subscribed; }
 
         ChanlogSelection selection;
         ChanlogChannels subscribed;
@@ -172,8 +179,7 @@ private:
 
     struct Sampling final : ChanlogSampling {
         explicit Sampling(FakeChanlogFacility& owner) : facility(owner) {}
-        [[nodiscard]] std::variant<ChanlogChannels, int>
-        channelsOf(const ChanlogSelection& selection) override {
+        std::variant<ChanlogChannels, int> channelsOf(const ChanlogSelection& selection) override {
             facility.calls +=
                 selection.groupName.value_or("") + "-" + selection.subGroupName.value_or("") + " ";
             if (facility.channelsError) {
@@ -181,7 +187,7 @@ private:
             }
             return facility.select(selection);
         }
-        [[nodiscard]] std::variant<ChanlogChannels, int> sample(ChanlogSubscription& subscription) override {
+        std::variant<ChanlogChannels, int> sample(ChanlogSubscription& subscription) override {
             facility.calls += 's';
             if (facility.sampleError) {
                 return *facility.sampleError;
@@ -207,21 +213,21 @@ private:
 /// Notifications that a test posts; the handlers run when the test runs their queue.
 class FakeNamedNotifications final : public NamedNotifications {
 public:
-    [[nodiscard]] Registration RegisterNamedNotification(std::string_view name, SerialQueue& queue,
-                                                         Handler handler) override {
+    Registration RegisterNamedNotification(std::string_view name, SerialQueue& queue,
+                                           Handler handler) override {
         if (registrationStatus != 0) {
             return {registrationStatus, 0};
         }
-        registered_[++lastToken_] = {std::string(name), &queue,
-                                     std::make_shared<Handler>(std::move(handler))};
+        registered_[++lastToken_] =
+            std::make_shared<Registered>(std::string(name), queue, std::move(handler));
         return {0, lastToken_};
     }
-    [[nodiscard]] State GetNamedNotificationState(int token) override {
+    State GetNamedNotificationState(int token) override {
         const auto found = registered_.find(token);
-        const auto word = found != registered_.end() ? words_.find(found->second.name) : words_.end();
-        return word != words_.end() ? State{0, word->second} : State{kNoState, 0};
+        const auto word = found != registered_.end() ? lookUp(words_, found->second->name) : std::nullopt;
+        return word ? State{0, *word} : State{1, 0};
     }
-    [[nodiscard]] int PostNamedNotification(std::string_view name) override {
+    int PostNamedNotification(std::string_view name) override {
         posted.emplace_back(name);
         post(posted.back(), words_[posted.back()]);
         return 0;
@@ -231,8 +237,9 @@ public:
     void post(const std::string& name, std::uint64_t word) {
         words_[name] = word;
         for (const auto& [token, registration] : registered_) {
-            if (registration.name == name) {
-                registration.queue->post([this, which = token] { call(which); }, Pace::mayBlock);
+            if (registration->name == name) {
+                const auto call = [which = token](Registered& called) { called.handler(which); };
+                registration->queue.post(whileAlive(std::weak_ptr(registration), call), Pace::mayBlock);
             }
         }
     }
@@ -244,23 +251,13 @@ public:
     int registrationStatus = 0;
 
 private:
-    static constexpr int kNoState = 1;
-
     struct Registered {
         std::string name;
-        SerialQueue* queue;
-        std::shared_ptr<Handler> handler;
+        SerialQueue& queue;
+        Handler handler;
     };
 
-    void call(int token) {
-        const auto found = registered_.find(token);
-        if (found != registered_.end()) {
-            const auto handler = found->second.handler;
-            (*handler)(token);
-        }
-    }
-
-    std::map<int, Registered> registered_;
+    std::map<int, std::shared_ptr<Registered>> registered_;
     std::map<std::string, std::uint64_t> words_;
     int lastToken_ = 0;
 };
@@ -270,7 +267,7 @@ class FakeClientConnection final : public ClientConnection {
 public:
     explicit FakeClientConnection(pid_t pid) : pid_(pid) {}
 
-    [[nodiscard]] pid_t peerProcessIdentifier() const noexcept override { return pid_; }
+    pid_t peerProcessIdentifier() const noexcept override { return pid_; }
     void setExportedObject(std::shared_ptr<ZRReportingServiceProtocol> object) override {
         object_ = std::move(object);
     }
@@ -281,7 +278,7 @@ public:
         invalidation_ = std::move(handler);
     }
     void resume() override {}
-    [[nodiscard]] std::string description() const override { return "connection of " + std::to_string(pid_); }
+    std::string description() const override { return "connection of " + std::to_string(pid_); }
 
     [[nodiscard]] ZRReportingServiceProtocol& object() const noexcept { return *object_; }
     void interrupt() { interruption_(); }
@@ -302,7 +299,7 @@ private:
 /// A listener that tests connect to.
 class FakeConnectionService final : public ConnectionService, private ConnectionListener {
 public:
-    [[nodiscard]] ConnectionListener& listenerForServiceName(std::string_view) override { return *this; }
+    ConnectionListener& listenerForServiceName(std::string_view) override { return *this; }
 
     /// A new client, or null when it is turned away or nobody listens.
     [[nodiscard]] std::unique_ptr<FakeClientConnection> connect(pid_t pid) {
@@ -329,7 +326,7 @@ public:
         std::string text;
     };
 
-    [[nodiscard]] LogLevel threshold(std::string_view) const noexcept override { return threshold_; }
+    LogLevel threshold(std::string_view) const noexcept override { return threshold_; }
     void write(LogLevel level, std::string_view categoryCode, std::string_view line) noexcept override {
         // "%25s:%-5d ": the text begins after the blank that follows the number and its padding.
         const std::size_t colon = line.find(':');
@@ -357,10 +354,18 @@ public:
         return found;
     }
     [[nodiscard]] std::size_t count(std::string_view beginning) const { return texts(beginning).size(); }
-    void clear() {
+    /// The lines since the last call, as `LEVEL CODE TEXT` with the level as a digit.
+    [[nodiscard]] std::vector<std::string> take() {
+        std::vector<std::string> taken;
         const std::lock_guard held(mutex_);
+        for (const Line& line : lines_) {
+            taken.push_back(std::to_string(static_cast<int>(line.level)) + " " + line.category + " " +
+                            line.text);
+        }
         lines_.clear();
+        return taken;
     }
+    void clear() { (void)take(); }
 
 private:
     std::atomic<LogLevel> threshold_{LogLevel::debug};

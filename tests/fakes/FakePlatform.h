@@ -1,7 +1,6 @@
 #pragma once
 
 #include "session/ZRReportingSession.h"
-#include "tests/fakes/FakeClock.h"
 #include "tests/fakes/FakeDevice.h"
 #include "tests/fakes/FakeSinks.h"
 #include "tests/fakes/FakeWorkQueues.h"

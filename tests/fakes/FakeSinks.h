@@ -1,14 +1,6 @@
 #pragma once
 
-#include "platform/AnalyticsEventService.h"
-#include "platform/BugCaptureService.h"
-#include "platform/BugReportDraftingService.h"
-#include "platform/CallQualityService.h"
-#include "platform/DiagnosticCaptureService.h"
-#include "platform/DiagnosticsMetricsService.h"
-#include "platform/MemoryLog.h"
-#include "platform/PowerEventLog.h"
-#include "platform/ReportFiles.h"
+#include "platform/Platform.h"
 
 #include <map>
 #include <optional>
@@ -30,10 +22,8 @@ public:
         Dictionary payload;
     };
 
-    [[nodiscard]] bool isEventInUse(std::string_view eventName) override {
-        return !inUse_ || inUse_->contains(eventName);
-    }
-    [[nodiscard]] std::uint64_t inUseGeneration() const noexcept override { return generation_; }
+    bool isEventInUse(std::string_view eventName) override { return !inUse_ || inUse_->contains(eventName); }
+    std::uint64_t inUseGeneration() const noexcept override { return generation_; }
     void sendEventLazy(std::string_view eventName, const std::function<Dictionary()>& payload) override {
         events_.push_back({std::string(eventName), payload()});
     }
@@ -73,7 +63,7 @@ public:
         std::string session; ///< of a "cancel"
     };
 
-    [[nodiscard]] std::unique_ptr<GlarnReporter> makeReporter(std::span<const pid_t> processes) override {
+    std::unique_ptr<GlarnReporter> makeReporter(std::span<const pid_t> processes) override {
         ++reportersMade;
         return std::make_unique<Reporter>(*this, std::vector(processes.begin(), processes.end()));
     }
@@ -96,13 +86,12 @@ private:
     public:
         Reporter(FakeBugCaptureService& owner, std::vector<pid_t> processes)
             : owner_(owner), processes_(std::move(processes)) {}
-        [[nodiscard]] bool snapshot(const BugCaptureSignature& signature,
-                                    std::chrono::duration<double> duration, const Dictionary& payload,
-                                    Reply reply) override {
+        bool snapshot(const BugCaptureSignature& signature, std::chrono::duration<double> duration,
+                      const Dictionary& payload, Reply reply) override {
             return owner_.take({"snapshot", processes_, signature, duration, payload, {}}, std::move(reply));
         }
-        [[nodiscard]] bool startSession(const BugCaptureSignature& signature,
-                                        std::chrono::duration<double> duration, Reply reply) override {
+        bool startSession(const BugCaptureSignature& signature, std::chrono::duration<double> duration,
+                          Reply reply) override {
             return owner_.take({"start", processes_, signature, duration, {}, {}}, std::move(reply));
         }
         void cancelSession(std::string_view sessionIdentifier) override {
@@ -134,16 +123,15 @@ public:
         Dictionary payload;
     };
     struct FakeSession final : Session {
-        [[nodiscard]] std::string description() const override { return "fake session"; }
+        std::string description() const override { return "fake session"; }
 
         Dictionary sessionInfo, userInfo;
         std::vector<Message> messages;
         int flushes = 0;
     };
 
-    [[nodiscard]] std::optional<std::string> NewHierarchyToken(std::string_view) override { return token; }
-    [[nodiscard]] SessionRef CreateLinkmeterSession(const Dictionary& sessionInfo,
-                                                    const Dictionary& userInfo) override {
+    std::optional<std::string> NewHierarchyToken(std::string_view) override { return token; }
+    SessionRef CreateLinkmeterSession(const Dictionary& sessionInfo, const Dictionary& userInfo) override {
         auto session = std::make_shared<FakeSession>();
         session->sessionInfo = sessionInfo;
         session->userInfo = userInfo;
@@ -153,9 +141,8 @@ public:
     void StartConfiguration(const SessionRef&, Completion completion) override {
         completions.push_back(std::move(completion));
     }
-    [[nodiscard]] std::optional<std::string> SendLinkmeterMessage(const SessionRef& session,
-                                                                  std::uint16_t category, std::uint16_t type,
-                                                                  const Dictionary& payload) override {
+    std::optional<std::string> SendLinkmeterMessage(const SessionRef& session, std::uint16_t category,
+                                                    std::uint16_t type, const Dictionary& payload) override {
         if (sendFailure || session == nullptr) {
             return sendFailure;
         }
@@ -241,14 +228,13 @@ public:
 /// Report files in memory. Each step can be made to fail, with the text that a test sets for it.
 class FakeReportFiles final : public ReportFiles {
 public:
-    [[nodiscard]] std::string reportingLogsDirectory() const override { return "/reports"; }
-    [[nodiscard]] std::string performanceLogsDirectory() const override { return "/performance"; }
-    [[nodiscard]] std::optional<std::string> createDirectory(const std::string& path) override {
+    std::string reportingLogsDirectory() const override { return "/reports"; }
+    std::string performanceLogsDirectory() const override { return "/performance"; }
+    std::optional<std::string> createDirectory(const std::string& path) override {
         createdDirectories.push_back(path);
         return directoryFailure;
     }
-    [[nodiscard]] std::variant<std::unique_ptr<ReportFile>, std::string>
-    createFile(const std::string& path) override {
+    std::variant<std::unique_ptr<ReportFile>, std::string> createFile(const std::string& path) override {
         if (openFailure) {
             return *openFailure;
         }
@@ -266,7 +252,7 @@ private:
     class File final : public ReportFile {
     public:
         File(FakeReportFiles& owner, std::string& content) : owner_(owner), content_(content) {}
-        [[nodiscard]] std::optional<std::string> write(std::string_view text) override {
+        std::optional<std::string> write(std::string_view text) override {
             owner_.writes.push_back(text.size());
             const bool isMeant =
                 owner_.failingWrites.empty() || owner_.failingWrites.contains(owner_.writes.size());
@@ -276,7 +262,7 @@ private:
             content_ += text;
             return std::nullopt;
         }
-        [[nodiscard]] std::optional<std::string> close() override { return owner_.closeFailure; }
+        std::optional<std::string> close() override { return owner_.closeFailure; }
 
     private:
         FakeReportFiles& owner_;

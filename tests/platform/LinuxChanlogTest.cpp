@@ -3,18 +3,12 @@
 #include "platform/linux/drivers/LinuxChanlogFacility.h"
 #include "tests/platform/LinuxServiceSupport.h"
 
-#include <gmock/gmock.h>
-
-#include <chrono>
 #include <thread>
 
 namespace tamblo {
 namespace {
 
-using testing::AllOf;
-using testing::ElementsAre;
-using testing::HasSubstr;
-using testing::IsEmpty;
+using namespace testing;
 
 std::string textOf(const ChanlogChannels& channels) {
     std::string text;
@@ -37,46 +31,17 @@ std::string textOf(const ChanlogChannels& channels) {
     return text;
 }
 
-/// A list of channels, from words: a simple one of the group "g" as `NAME=VALUE`, a state one named "s" as
-/// `s,NAME:TRANSITIONS:RESIDENCY,...`, a histogram named "h" as `h,MINIMUM,LOWER:UPPER:HITS,...`. Words that
-/// begin with a brace stand for themselves.
-std::string channels(const std::string& description) {
-    std::string list;
-    std::istringstream words(description);
-    for (std::string word; words >> word;) {
-        list += list.empty() ? "" : ",\n";
-        std::istringstream parts(word.substr(std::min<std::size_t>(2, word.size())));
-        std::string elements, minimum, first, second, third;
-        const bool isState = word.starts_with("s,");
-        if (word.front() == '{') {
-            list += word;
-            continue;
-        }
-        if (const std::size_t equals = word.find('='); equals != std::string::npos) {
-            list += formatted(R"({"group":"g","name":"{}","format":"simple","value":{}})",
-                              word.substr(0, equals), word.substr(equals + 1));
-            continue;
-        }
-        if (!isState) {
-            std::getline(parts, minimum, ',');
-        }
-        while (std::getline(parts, first, ':') && std::getline(parts, second, ':') &&
-               std::getline(parts, third, ',')) {
-            elements += elements.empty() ? "" : ",";
-            elements +=
-                isState ? formatted(R"({"name":"{}","transitions":{},"residency":{}})", first, second, third)
-                        : formatted(R"({"lower":{},"upper":{},"hits":{}})", first, second, third);
-        }
-        list += isState
-                    ? formatted(R"({"group":"g","subgroup":"s","name":"s","format":"state","states":[{}]})",
-                                elements)
-                    : formatted(R"({"name":"h","format":"histogram","min":{},"max":9,"buckets":[{}]})",
-                                minimum, elements);
+/// A file of simple channels of the group "g".
+std::string simples(const std::vector<std::pair<std::string, int>>& channels) {
+    std::string text;
+    for (const auto& [name, value] : channels) {
+        appendFormatted(text, R"({}{"group":"g","name":"{}","format":"simple","value":{}})",
+                        text.empty() ? "[" : ",\n", name, value);
     }
-    return "[" + list + "]";
+    return text + "]";
 }
 
-class LinuxChanlogTest : public testing::Test {
+class LinuxChanlogTest : public Test {
 protected:
     void publish(const std::string& name, const std::string& text) const {
         root.write("chanlog/" + name, text);
@@ -91,24 +56,24 @@ protected:
     }
 
     TemporaryDirectory root;
-    RecordingLog log;
+    FakeLog log;
     LinuxChanlogFacility facility{root.path("chanlog"), log, root.path("asound")};
 };
 
 TEST_F(LinuxChanlogTest, ChannelsAreReadAndSelected) {
     EXPECT_EQ(now(), "");
     EXPECT_EQ(std::get<int>(facility.difference(nullptr, sample())), ENOENT);
-    publish("b.json", channels("b1=-5 s,on:1:18446744073709551615"));
+    publish("b.json", R"([{"group":"g","name":"b1","format":"simple","value":-5},)"
+                      R"({"group":"g","subgroup":"s","name":"a2","format":"simple","value":1}])");
     publish("a.json",
-            R"([{"driver":"d","subgroup":"s","name":"h","unit":"ms","format":"histogram","buckets":)"
-            R"([{"lower":-1,"upper":2,"hits":3}],"min":-4,"max":5,"x":{}},)"
+            R"([{"driver":"d","subgroup":"s","name":"a1","unit":"ms","format":"simple","value":1,"x":{}},)"
             R"({"name":"array","format":"simple_array"},{"format":"simple","value":1}])");
-    publish(".hidden.json", channels("no=1"));
-    publish("a.json.new", channels("no=1"));
-    EXPECT_EQ(now(), "h,-1-2:3,-4..5 array -=1 b1=-5 s,on:1:18446744073709551615:0.00");
-    EXPECT_EQ(textOf(sample({"g", {}})), "b1=-5 s,on:1:18446744073709551615:0.00");
-    EXPECT_EQ(textOf(sample({{}, "s"})), "h,-1-2:3,-4..5 s,on:1:18446744073709551615:0.00");
-    EXPECT_EQ(textOf(sample({"g", "s"})), "s,on:1:18446744073709551615:0.00");
+    publish(".hidden.json", simples({{"no", 1}}));
+    publish("a.json.new", simples({{"no", 1}}));
+    EXPECT_EQ(now(), "a1=1 array -=1 b1=-5 a2=1");
+    EXPECT_EQ(textOf(sample({"g", {}})), "b1=-5 a2=1");
+    EXPECT_EQ(textOf(sample({{}, "s"})), "a1=1 a2=1");
+    EXPECT_EQ(textOf(sample({"g", "s"})), "a2=1");
     EXPECT_EQ(sample()->front()->unitLabel, "ms");
     EXPECT_EQ(sample()->front()->driverName, "d");
     EXPECT_THAT(log.take(), IsEmpty());
@@ -124,15 +89,15 @@ TEST_F(LinuxChanlogTest, TheFileOnThePageIsGood) {
 }
 
 TEST_F(LinuxChanlogTest, ASampleIsOneReadingAndSeesEveryChange) {
-    publish("a.json", channels("a=0"));
+    publish("a.json", simples({{"a", 0}}));
     auto subscription =
         std::get<std::unique_ptr<ChanlogSubscription>>(facility.subscribe({"g", {}}, sample()));
     for (int i = 1; i < 10; ++i) {
         // Written in place within one tick of the kernel's clock, and of the same size.
-        publish("a.json", channels(formatted("a={}", i)));
+        publish("a.json", simples({{"a", i}}));
         const auto moment = facility.beginSampling();
         EXPECT_EQ(textOf(std::get<ChanlogChannels>(moment->sample(*subscription))), formatted("a={}", i));
-        publish("a.json", channels("a=0"));
+        publish("a.json", simples({{"a", 0}}));
         EXPECT_EQ(textOf(std::get<ChanlogChannels>(moment->sample(*subscription))), formatted("a={}", i));
     }
     EXPECT_EQ(textOf(subscription->subscribedChannels()), "a=0");
@@ -140,7 +105,7 @@ TEST_F(LinuxChanlogTest, ASampleIsOneReadingAndSeesEveryChange) {
     (void)sample();
     const ChanlogChannels old = facility.readAll();
     EXPECT_EQ(facility.readAll(), old) << "a file that is certainly the same is not read again";
-    publish("b.json", channels("b=1"));
+    publish("b.json", simples({{"b", 1}}));
     EXPECT_EQ(now(), "a=0 b=1");
     std::filesystem::remove(root.path("chanlog/a.json"));
     EXPECT_EQ(now(), "b=1");
@@ -149,16 +114,14 @@ TEST_F(LinuxChanlogTest, ASampleIsOneReadingAndSeesEveryChange) {
 TEST_F(LinuxChanlogTest, RubbishCostsItsOwnFileOrChannelAloneAndIsToldOnce) {
     const std::string state = R"({"format":"state","states":[)";
     const std::string histogram = R"({"format":"histogram","min":1,"buckets":[)";
-    std::string many = "s";
-    for (std::size_t i = 0; i <= kMaximumChanlogElements; ++i) {
-        many += ",on:0:0";
+    std::string many = state + R"({"name":"a","transitions":0,"residency":0})";
+    for (std::size_t i = 0; i < kMaximumChanlogElements; ++i) {
+        many += R"(,{"name":"a","transitions":0,"residency":0})";
     }
     const std::pair<std::string, std::string> cases[] = {
         {"7", "it is no object"},
         {"{}", "format is missing"},
         {R"({"format":"other"})", "format \"other\" is not known"},
-        {R"({"format":"simple"})", "value is missing"},
-        {R"({"format":"simple","value":1.0})", "value is no signed 64-bit integer"},
         {R"({"format":"simple","value":9223372036854775808})", "value is no signed 64-bit integer"},
         {R"({"format":"simple","value":1,"driver":5})", "driver is no text"},
         {R"({"format":"simple","value":1,"name":")" + std::string(257, 'n') + R"("})",
@@ -167,11 +130,11 @@ TEST_F(LinuxChanlogTest, RubbishCostsItsOwnFileOrChannelAloneAndIsToldOnce) {
         {state + "5]}", "states 0: it is no object"},
         {state + R"({"name":"a","transitions":1,"residency":-1}]})",
          "states 0: residency is no unsigned 64-bit integer"},
-        {channels(many).substr(1, channels(many).size() - 2), "states has more than 256 elements"},
+        {many + "]}", "states has more than 256 elements"},
         {histogram + R"({"lower":1,"upper":2,"hits":-1}]})", "buckets 0: hits is negative"},
         {histogram + "]}", "max is missing"},
     };
-    publish("good.json", channels("good=1"));
+    publish("good.json", simples({{"good", 1}}));
     for (const auto& [channel, reason] : cases) {
         publish("a.json", "[]");
         EXPECT_EQ(now(), "good=1");
@@ -180,12 +143,10 @@ TEST_F(LinuxChanlogTest, RubbishCostsItsOwnFileOrChannelAloneAndIsToldOnce) {
                                   R"(,{"name":"b","format":"simple","value":1}])");
             EXPECT_EQ(now(), formatted("a={} b=1 good=1", value)) << channel;
         }
-        EXPECT_THAT(log.take(), ElementsAre(HasSubstr("/a.json: channel 1: " + reason + "; it is left out")))
-            << "a publisher that goes on so is told of once";
+        EXPECT_THAT(log.take(), ElementsAre(HasSubstr("/a.json: channel 1: " + reason + "; it is left out")));
     }
     for (const auto& [text, reason] :
          {std::pair<std::string, const char*>("[{}, {\"gro", "line 1, column "),
-          {"{}", "line 1, column 1: not an array"},
           {std::string(ChanlogFiles::kMaximumFileSize + 1, ' '), "File too large"}}) {
         publish("a.json", text);
         EXPECT_EQ(now(), "good=1");
@@ -195,27 +156,25 @@ TEST_F(LinuxChanlogTest, RubbishCostsItsOwnFileOrChannelAloneAndIsToldOnce) {
 }
 
 TEST_F(LinuxChanlogTest, LimitsHoldAndAreToldOnce) {
-    std::string most;
+    std::vector<std::pair<std::string, int>> most;
     for (std::size_t i = 0; i < LinuxChanlogFacility::kMaximumChannels; ++i) {
-        most += formatted("c{}=1 ", i);
+        most.emplace_back("c" + std::to_string(i), 1);
     }
-    publish("a.json", channels(most));
+    publish("a.json", simples(most));
     EXPECT_EQ(sample()->size(), LinuxChanlogFacility::kMaximumChannels);
     EXPECT_THAT(log.take(), IsEmpty());
-    publish("b.json", channels("more=1"));
-    EXPECT_EQ(sample()->size(), LinuxChanlogFacility::kMaximumChannels);
+    publish("b.json", simples({{"more", 1}}));
     EXPECT_EQ(sample()->size(), LinuxChanlogFacility::kMaximumChannels);
     EXPECT_THAT(log.take(), ElementsAre(HasSubstr("4097 driver statistics channels; those beyond 4096")));
 
-    publish("a.json", channels("first=1 first=2"));
-    publish("b.json",
-            channels(R"(first=3 {"group":"g","name":"first","format":"simple","value":4,"driver":""})"));
+    publish("a.json", simples({{"first", 1}, {"first", 2}}));
+    publish("b.json", R"([{"group":"g","name":"first","format":"simple","value":3},)"
+                      R"({"group":"g","name":"first","format":"simple","value":4,"driver":""}])");
     EXPECT_EQ(now(), "first=1 first=4") << "one that comes again does not count";
 
     for (std::size_t i = 2; i <= ChanlogFiles::kMaximumFiles; ++i) {
         publish(formatted("c{}.json", 1000 + i), i < ChanlogFiles::kMaximumFiles ? "[]" : "rubbish");
     }
-    EXPECT_EQ(now(), "first=1 first=4");
     EXPECT_EQ(now(), "first=1 first=4");
     EXPECT_THAT(log.take(), ElementsAre(HasSubstr("/c1256.json: more than 256 files")));
     for (int i = 2; i < 6; ++i) {
@@ -229,43 +188,57 @@ TEST_F(LinuxChanlogTest, LimitsHoldAndAreToldOnce) {
     EXPECT_EQ(now(), "first=1 first=4");
     publish("one more", "");
     EXPECT_EQ(now(), "");
-    EXPECT_EQ(now(), "");
     EXPECT_THAT(log.take(), ElementsAre(HasSubstr("/chanlog: more than 4096 entries; no driver statistics")));
 }
 
+/// A histogram where there are buckets, else a simple channel, which may have states, too.
+std::shared_ptr<ChanlogChannel> channelOf(const char* name, std::int64_t value,
+                                          std::vector<ChanlogState> states = {},
+                                          std::vector<ChanlogBucket> buckets = {}) {
+    auto channel = std::make_shared<ChanlogChannel>();
+    channel->channelName = name;
+    channel->format = buckets.empty() ? ChanlogFormat::simple : ChanlogFormat::histogram;
+    channel->value = channel->minimum = channel->maximum = value;
+    channel->states = std::move(states);
+    channel->buckets = std::move(buckets);
+    return channel;
+}
+
 TEST_F(LinuxChanlogTest, DifferencesAreGains) {
+    const auto a = channelOf("a", 5), elsewhere = channelOf("a", 9), least = channelOf("a", INT64_MIN);
+    elsewhere->subGroupName = "s";
+    const auto on = channelOf("s", 0, {{"on", 1, 10}}), hit = channelOf("h", 1, {}, {{0, 5, 0, 2}});
     const struct {
-        const char *earlier, *later, *gained, *trouble = nullptr;
+        std::vector<ChanlogChannelRef> earlier, later;
+        const char *gained, *trouble = "";
     } cases[] = {
-        {"a=5 b=1 c=1", "new=9 c=-1 a=5", "c=-2 a=0"},
-        {"a=5", R"({"group":"g","name":"a","format":"simple","value":9,"subgroup":"s"})", ""},
-        {"a=-9223372036854775808", "a=-1", "a=9223372036854775807"},
-        {"a=-9223372036854775808 b=1", "a=0 b=3", "b=2", "the value has moved by more"},
-        {"s,on:1:10,off:1:10,gone:1:10", "s,off:3:13,new:1:70,on:1:11", "s,off:2:3:0.75,on:0:1:0.25"},
-        {"s,on:1:10", "s,on:1:10", "s,on:0:0:0.00"},
-        {"s,on:0:0", "s,on:0:18446744073709551615", "s,on:0:18446744073709551615:1.00"},
-        {"s,on:2:10", "s,on:1:11", "", "a counter has run backwards"},
-        {"s,on:1:10", "s,on:1:9", "", "a counter has run backwards"},
-        {"h,1,0:5:2,5:9:7", "h,3,5:9:7,0:9:9", "h,5-9:0,3..9"},
-        {"h,1,0:5:2", "h,1,0:5:6", "h,0-5:4,1..9"},
-        {"h,1,0:5:2", "h,1,0:5:1", "", "run backwards"},
+        {{a, channelOf("b", 1), channelOf("c", 1)}, {channelOf("new", 9), channelOf("c", -1), a}, "c=-2 a=0"},
+        {{a}, {elsewhere}, ""},
+        {{least}, {channelOf("a", -1)}, "a=9223372036854775807"},
+        {{least, on}, {channelOf("a", 0), on}, "s=0,on:0:0:0.00", "the value has moved by more"},
+        {{channelOf("s", 0, {{"on", 1, 10}, {"off", 1, 10}, {"gone", 1, 10}})},
+         {channelOf("s", 0, {{"off", 3, 13}, {"new", 1, 70}, {"on", 1, 11}})},
+         "s=0,off:2:3:0.75,on:0:1:0.25"},
+        {{channelOf("s", 0, {{"on", 0, 0}})},
+         {channelOf("s", 0, {{"on", 0, UINT64_MAX}})},
+         "s=0,on:0:18446744073709551615:1.00"},
+        {{on}, {channelOf("s", 0, {{"on", 0, 11}})}, "", "a counter has run backwards"},
+        {{on}, {channelOf("s", 0, {{"on", 1, 9}})}, "", "a counter has run backwards"},
+        {{channelOf("h", 1, {}, {{0, 5, 0, 2}, {5, 9, 0, 7}})},
+         {channelOf("h", 3, {}, {{5, 9, 0, 8}, {0, 9, 0, 9}})},
+         "h,5-9:1,3..3"},
+        {{hit}, {channelOf("h", 1, {}, {{0, 5, 0, 1}})}, "", "run backwards"},
     };
-    for (const auto& [earlierText, laterText, gained, trouble] : cases) {
-        publish("a.json", channels(earlierText));
-        const ChanlogChannels earlier = sample();
-        publish("a.json", channels(laterText));
-        const ChanlogChannels later = sample();
-        EXPECT_EQ(difference(earlier, later), gained) << laterText;
-        if (trouble == nullptr) {
-            EXPECT_THAT(log.take(), IsEmpty());
-            continue;
+    for (const auto& [earlierList, laterList, gained, trouble] : cases) {
+        const auto earlier = std::make_shared<const std::vector<ChanlogChannelRef>>(earlierList);
+        const auto later = std::make_shared<const std::vector<ChanlogChannelRef>>(laterList);
+        for (int outage = 0; outage < 2; ++outage) {
+            EXPECT_EQ(difference(earlier, later), gained);
+            EXPECT_EQ(difference(earlier, later), gained);
+            EXPECT_THAT(log.take(), AllOf(SizeIs(*trouble != '\0' ? 1 : 0), Each(HasSubstr(trouble))))
+                << "once for as long as it lasts";
+            (void)difference(later, later);
         }
-        EXPECT_EQ(difference(earlier, later), gained);
-        EXPECT_THAT(log.take(), ElementsAre(HasSubstr(trouble))) << "once for as long as it lasts";
-        (void)difference(later, later);
-        (void)difference(earlier, later);
-        EXPECT_EQ(log.take().size(), 1U) << "and again after it was well";
-        (void)difference(later, later);
     }
 }
 
@@ -279,11 +252,9 @@ TEST_F(LinuxChanlogTest, PcmStreamsAreChannels) {
                "01-07: HDMI 0 : HDMI 0 : playback 1\n01-09: gone : gone : capture 1\nrubbish\n");
     const std::string closed = "frames=0 overruns=0 available=0 delay=0";
     EXPECT_EQ(textOf(sample({"Rx", {}})), closed);
-    const ChanlogChannels before = sample({"Tx", {}});
-    EXPECT_EQ(textOf(before), closed + " " + closed + " " + closed);
-    EXPECT_EQ(before->at(4)->driverName, "PCH");
-    EXPECT_EQ(before->at(4)->subGroupName, "pcm0p sub1");
-    EXPECT_EQ(before->at(8)->subGroupName, "pcm7p");
+    EXPECT_EQ(textOf(sample({"Tx", {}})), closed + " " + closed + " " + closed);
+    EXPECT_EQ(textOf(sample({"Tx", "pcm0p sub1"})), closed);
+    EXPECT_EQ(sample()->front()->driverName, "PCH");
     EXPECT_EQ(facility.readAll(), facility.readAll()) << "nothing has changed";
     const std::pair<std::string, std::string> cases[] = {
         {"state: RUNNING\nowner_pid   : 10\ntstamp      : 0.0\ndelay       : -3\navail       : 512\n"

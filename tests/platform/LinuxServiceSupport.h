@@ -1,14 +1,19 @@
 #pragma once
 
-#include "platform/StructuredLog.h"
+#include "os/FileOperations.h"
 #include "tests/Files.h"
+#include "tests/fakes/FakeDevice.h"
 
-#include <gtest/gtest.h>
+#include <gmock/gmock.h>
 
 #include <algorithm>
+#include <cerrno>
+#include <chrono>
 #include <cstddef>
-#include <mutex>
+#include <functional>
+#include <optional>
 #include <string>
+#include <string_view>
 #include <utility>
 #include <vector>
 
@@ -21,25 +26,55 @@ namespace tamblo {
     return ::poll(&question, 1, milliseconds) == 1;
 }
 
-/// Keeps what is logged, as `LEVEL CODE TEXT` with the level as a digit, without the prefix of 32 bytes.
-class RecordingLog final : public StructuredLog {
+/// The real system calls on a disk that fills up, and with faults that tests switch on. Time passes at every
+/// look.
+class FaultyOperations final : public FileOperations {
 public:
-    [[nodiscard]] LogLevel threshold(std::string_view) const noexcept override { return LogLevel::debug; }
-    void write(LogLevel level, std::string_view code, std::string_view line) noexcept override {
-        const std::lock_guard lock(mutex_);
-        EXPECT_EQ(line.find(':'), 25U) << line;
-        lines_.push_back(std::to_string(static_cast<int>(level)) + " " + std::string(code) + " " +
-                         std::string(line.substr(std::min<std::size_t>(line.size(), 32))));
+    std::optional<std::size_t> room; ///< bytes that can still be written
+    std::size_t largestWrite = 1U << 30U;
+    int interruptions = 0; ///< of writes to come, every second one
+    int openError = 0, truncateError = 0, closeError = 0;
+    int renameError = 0; ///< of the newest file of a rotation, which is the last to be moved
+    int writes = 0;
+    std::function<void()> beforeWrite = [] {};
+
+    int open(const char* path, int flags, mode_t mode) noexcept override {
+        return openError != 0 ? fail(openError) : FileOperations::open(path, flags, mode);
     }
-    /// The lines since the last call.
-    [[nodiscard]] std::vector<std::string> take() {
-        const std::lock_guard lock(mutex_);
-        return std::exchange(lines_, {});
+    ssize_t write(int descriptor, const void* bytes, std::size_t count) noexcept override {
+        beforeWrite();
+        ++writes;
+        isInterrupted_ = interruptions > 0 && !isInterrupted_;
+        if (isInterrupted_) {
+            --interruptions;
+            return fail(EINTR);
+        }
+        count = std::min({count, largestWrite, room.value_or(count)});
+        if (room) {
+            *room -= count;
+        }
+        return count == 0 ? fail(ENOSPC) : FileOperations::write(descriptor, bytes, count);
     }
+    int truncate(int descriptor, off_t size) noexcept override {
+        return truncateError != 0 ? fail(truncateError) : FileOperations::truncate(descriptor, size);
+    }
+    int rename(const char* from, const char* to) noexcept override {
+        const bool fails = renameError != 0 && std::string_view(from).ends_with(".jsonl");
+        return fails ? fail(renameError) : FileOperations::rename(from, to);
+    }
+    int close(int descriptor) noexcept override {
+        const int result = FileOperations::close(descriptor);
+        return closeError != 0 ? fail(closeError) : result;
+    }
+    std::chrono::nanoseconds coarseTime() noexcept override { return std::chrono::seconds(++time_); }
 
 private:
-    std::mutex mutex_;
-    std::vector<std::string> lines_;
+    static int fail(int error) noexcept {
+        errno = error;
+        return -1;
+    }
+    bool isInterrupted_ = false;
+    long time_ = 0;
 };
 
 } // namespace tamblo

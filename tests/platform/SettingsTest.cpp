@@ -1,9 +1,9 @@
+#include "platform/linux/loop/LinuxWorkQueues.h"
 #include "platform/linux/settings/LinuxDeviceProperties.h"
+#include "platform/linux/settings/LinuxNamedNotifications.h"
 #include "platform/linux/settings/LinuxPreferences.h"
 #include "tests/fakes/FakeWorkQueues.h"
 #include "tests/platform/LinuxServiceSupport.h"
-
-#include <gmock/gmock.h>
 
 #include <sys/stat.h>
 
@@ -11,14 +11,11 @@ namespace tamblo {
 namespace {
 
 namespace fs = std::filesystem;
-using testing::ElementsAre;
-using testing::HasSubstr;
-using testing::IsEmpty;
-using testing::SizeIs;
+using namespace testing;
 
 TEST(JsonFileTest, WhatIsWrongIsAbsentAndToldOncePerState) {
     const TemporaryDirectory directory;
-    RecordingLog log;
+    FakeLog log;
     JsonFile file(directory.path("f.json"), 100);
     EXPECT_EQ(file.read(log), std::nullopt);
     EXPECT_THAT(log.take(), IsEmpty()) << "a missing file is no fault";
@@ -42,18 +39,14 @@ TEST(JsonFileTest, WhatIsWrongIsAbsentAndToldOncePerState) {
     int elements = 0;
     EXPECT_TRUE(file.readArray([&elements](const JsonItem&) { ++elements; }, log));
     EXPECT_EQ(elements, 2);
-    fs::remove(directory.path("f.json"));
-    ASSERT_EQ(::mkfifo(directory.path("f.json").c_str(), 0600), 0);
-    EXPECT_EQ(file.read(log), std::nullopt) << "a pipe, which nobody waits for";
-    EXPECT_THAT(log.take(), ElementsAre(HasSubstr("not a regular file")));
 }
 
-class LinuxPreferencesTest : public testing::Test {
+class LinuxPreferencesTest : public Test {
 protected:
     LinuxPreferencesTest() { fs::create_directory(path_); }
 
     void write(const std::string& content) const { directory_.write("preferences/d.json", content); }
-    [[nodiscard]] std::string content() const { return directory_.read("preferences/d.json"); }
+    std::string content() const { return directory_.read("preferences/d.json"); }
     void takeInChange() {
         const std::uint64_t before = preferences_.generation();
         while (isReadable(preferences_.fileDescriptor(), preferences_.generation() == before ? 2000 : 0)) {
@@ -62,7 +55,7 @@ protected:
         EXPECT_NE(preferences_.generation(), before);
     }
     /// What is in force, or -1.
-    [[nodiscard]] std::int64_t value(std::string_view key = "k", std::string_view domain = "d") const {
+    std::int64_t value(std::string_view key = "k", std::string_view domain = "d") const {
         const std::optional<Value> value = preferences_.copyPreferenceValue(key, domain);
         return value ? value->integerValue() : -1;
     }
@@ -77,7 +70,7 @@ protected:
 
     TemporaryDirectory directory_;
     const std::string path_ = directory_.path("preferences");
-    RecordingLog log_;
+    FakeLog log_;
     FakeWorkQueues queues_;
     LinuxPreferences preferences_{path_, queues_, log_};
 };
@@ -126,30 +119,27 @@ TEST_F(LinuxPreferencesTest, AValueIsInForceAtOnceAndStoredBesideTheOthers) {
 }
 
 TEST_F(LinuxPreferencesTest, WhatCannotBeStoredIsToldOnceAndInForceUntilTheFileChanges) {
-    for (const char* const content : {"{oops}", "[1]"}) {
-        write(content);
-        takeInChange();
-        for (const int number : {7, 8}) {
-            set("k", number);
-            store();
-            EXPECT_EQ(value(), number);
-        }
-        EXPECT_EQ(this->content(), content);
-        EXPECT_THAT(log_.take(),
-                    ElementsAre(testing::AllOf(HasSubstr("d.json: "),
-                                               HasSubstr("is forgotten when the service ends"))));
-        write(R"({"k": 1})");
-        EXPECT_EQ(valueAfterChange(), 1);
-        set("k", 2);
+    write("{oops}");
+    takeInChange();
+    for (const int number : {7, 8}) {
+        set("k", number);
         store();
-        EXPECT_EQ(valueAfterChange(), 2);
-        EXPECT_THAT(log_.take(), IsEmpty());
+        EXPECT_EQ(value(), number);
     }
+    EXPECT_EQ(content(), "{oops}");
+    EXPECT_THAT(log_.take(),
+                ElementsAre(AllOf(HasSubstr("d.json: "), HasSubstr("forgotten when the service ends"))));
+    write(R"({"k": 1})");
+    EXPECT_EQ(valueAfterChange(), 1);
+    set("k", 2);
+    store();
+    EXPECT_EQ(valueAfterChange(), 2);
+    EXPECT_THAT(log_.take(), IsEmpty());
 }
 
 TEST(LinuxDevicePropertiesTest, AreReadAgainWhenTheFileChanges) {
     const TemporaryDirectory directory;
-    RecordingLog log;
+    FakeLog log;
     const LinuxDeviceProperties properties(directory.path("p.json"), log);
     const auto isInternal = [&properties] { return properties.booleanProperty("InternalBuild"); };
     EXPECT_EQ(isInternal(), std::nullopt);
@@ -165,8 +155,200 @@ TEST(LinuxDevicePropertiesTest, AreReadAgainWhenTheFileChanges) {
     }
     EXPECT_THAT(log.take(), ElementsAre(HasSubstr("p.json: InternalBuild is no boolean"),
                                         HasSubstr("p.json: line 1, column")));
-    fs::remove(directory.path("p.json"));
-    EXPECT_EQ(isInternal(), std::nullopt);
+}
+
+using State = std::pair<int, std::uint64_t>;
+
+class NamedNotificationsTest : public Test {
+protected:
+    NamedNotificationsTest() {
+        fs::create_directory(path_); // watched from before it is there
+        deliver();
+    }
+
+    int add(std::string_view name, NamedNotifications::Handler handler) {
+        return notifications_.RegisterNamedNotification(name, queue_, std::move(handler)).token;
+    }
+    /// A registration whose handler notes its call.
+    int add(std::string_view name) {
+        return add(name, [this](int called) { calls_.push_back(called); });
+    }
+    void post(const std::string& name, const std::string& text) const {
+        directory_.write("notifications/" + name, text);
+    }
+    /// The changes that must have come.
+    void deliver() {
+        EXPECT_TRUE(isReadable(notifications_.fileDescriptor()));
+        while (isReadable(notifications_.fileDescriptor(), 0)) {
+            notifications_.deliverPosts();
+        }
+    }
+    /// The tokens of the handlers that a change had called.
+    std::vector<int> callsAfterChange() {
+        deliver();
+        queue_.runAll();
+        return std::exchange(calls_, {});
+    }
+    State state(int token) {
+        const auto found = notifications_.GetNamedNotificationState(token);
+        return {found.status, found.word};
+    }
+
+    TemporaryDirectory directory_;
+    const std::string path_ = directory_.path("notifications");
+    FakeLog log_;
+    // Before the queue, which runs what waits when it goes.
+    std::vector<int> calls_;
+    LinuxNamedNotifications notifications_{path_, log_};
+    FakeSerialQueue queue_{"test"};
+};
+
+TEST_F(NamedNotificationsTest, ReadsTheWordThatStandsInTheFile) {
+    const int token = add("n");
+    EXPECT_EQ(state(token), State(ENOENT, 0));
+    const std::pair<std::string, State> cases[] = {
+        {" \t7\r\n", {0, 7}},
+        {"18446744073709551615\n", {0, UINT64_MAX}},
+        {"18446744073709551616", {ERANGE, 0}},
+        {" \n", {EBADMSG, 0}},
+        {"-1", {EBADMSG, 0}},
+        {" 1 2", {EBADMSG, 0}},
+        {std::string("1\0", 2), {EBADMSG, 0}},
+        {std::string(256, ' ') + "1", {EFBIG, 0}},
+        {std::string(255, ' ') + "1", {0, 1}},
+    };
+    for (const auto& [text, expected] : cases) {
+        post("n", text);
+        EXPECT_EQ(state(token), expected) << text;
+        EXPECT_EQ(state(token), expected) << text;
+        const bool isRubbish = expected.first != 0 && text != " \n"; // its writer may have just begun
+        EXPECT_THAT(log_.take(), SizeIs(isRubbish ? 1 : 0)) << text;
+    }
+    ASSERT_EQ(::mkfifo((path_ + "/pipe").c_str(), 0600), 0);
+    fs::create_symlink("n", path_ + "/link");
+    EXPECT_EQ(state(add("pipe")), State(EINVAL, 0));
+    EXPECT_EQ(state(add("link")), State(ELOOP, 0));
+}
+
+TEST_F(NamedNotificationsTest, APostCallsEachRegistrationOfItsName) {
+    const int first = add("n"), second = add("n"), other = add("other");
+    for (const char* word : {"1", "1"}) {
+        post("n", word);
+        EXPECT_THAT(callsAfterChange(), ElementsAre(first, second));
+    }
+    fs::remove(path_ + "/n");
+    EXPECT_THAT(callsAfterChange(), ElementsAre(first, second));
+    EXPECT_EQ(state(second), State(ENOENT, 0));
+    post("nobody", "1");
+    post("other", "3");
+    EXPECT_THAT(callsAfterChange(), ElementsAre(other));
+    EXPECT_THAT(queue_.takePaces(), Each(Pace::mayBlock));
+    post("other", "4");
+    notifications_.deliverPosts([&] {
+        EXPECT_FALSE(isReadable(notifications_.fileDescriptor(), 0)) << "taken in";
+        EXPECT_THAT(queue_.takePaces(), IsEmpty()) << "and not yet delivered";
+    });
+    EXPECT_THAT(queue_.takePaces(), SizeIs(1));
+}
+
+TEST_F(NamedNotificationsTest, TheServicesOwnPostIsOneAndKeepsTheWord) {
+    const int token = add("n");
+    EXPECT_EQ(notifications_.PostNamedNotification("n"), 0);
+    EXPECT_THAT(callsAfterChange(), ElementsAre(token));
+    EXPECT_EQ(directory_.read("notifications/n"), "0\n");
+    for (const auto& [text, word] : {std::pair(" 18446744073709551615 ", UINT64_MAX), {"1 2", 0}, {"", 0}}) {
+        post("n", text);
+        (void)callsAfterChange();
+        EXPECT_EQ(notifications_.PostNamedNotification("n"), 0);
+        EXPECT_THAT(callsAfterChange(), ElementsAre(token));
+        EXPECT_EQ(directory_.read("notifications/n"), std::to_string(word) + "\n");
+    }
+    EXPECT_THAT(log_.take(), IsEmpty());
+    fs::create_directory(path_ + "/directory");
+    EXPECT_EQ(notifications_.PostNamedNotification("directory"), EISDIR);
+    EXPECT_EQ(notifications_.PostNamedNotification("directory"), EISDIR);
+    EXPECT_THAT(log_.take(), ElementsAre(HasSubstr("/directory: Is a directory; the notification is not")));
+    fs::create_symlink("n", path_ + "/link");
+    EXPECT_EQ(notifications_.PostNamedNotification("link"), ELOOP);
+}
+
+TEST_F(NamedNotificationsTest, ANameIsThatOfAFileOfItsOwn) {
+    using namespace std::string_view_literals;
+    EXPECT_GT(add(std::string(255, 'x')), 0);
+    for (const std::string_view name : {""sv, ".n"sv, "../n"sv, "a\0b"sv, "a/b"sv}) {
+        EXPECT_EQ(notifications_.RegisterNamedNotification(name, queue_, [](int) {}).status, EINVAL) << name;
+        EXPECT_EQ(notifications_.PostNamedNotification(name), EINVAL) << name;
+    }
+    EXPECT_EQ(notifications_.PostNamedNotification(std::string(256, 'x')), ENAMETOOLONG);
+}
+
+TEST_F(NamedNotificationsTest, ABurstIsOneWaitingCallThatSeesTheLastState) {
+    std::vector<std::uint64_t> seen;
+    add("n", [&](int called) {
+        seen.push_back(state(called).second);
+        if (seen.size() == 1) {
+            post("n", "8");
+            deliver();
+        }
+    });
+    for (int word = 1; word <= 100; ++word) {
+        post("n", std::to_string(word));
+        deliver();
+    }
+    EXPECT_THAT(queue_.takePaces(), SizeIs(1));
+    queue_.runAll();
+    EXPECT_THAT(seen, ElementsAre(100, 8)) << "what comes while the handler runs is another call";
+}
+
+TEST_F(NamedNotificationsTest, TheLastPostIsSeenOnAnotherThread) {
+    LinuxWorkQueues queues;
+    const auto queue = queues.makeSerialQueue("notifications");
+    std::uint64_t seen = 0; // unguarded: the queue is the guard
+    const auto handler = [&](int called) { seen = state(called).second; };
+    const int token = notifications_.RegisterNamedNotification("n", *queue, handler).token;
+    for (int word = 1; word <= 300; ++word) {
+        post("n", std::to_string(word));
+        deliver();
+    }
+    queues.workOff();
+    notifications_.CancelNamedNotification(token);
+    EXPECT_EQ(seen, 300U);
+}
+
+TEST_F(NamedNotificationsTest, NoCallFollowsACancellationOrTheirEnd) {
+    const auto held = std::make_shared<int>();
+    const int first = add("n", [held](int) {});
+    add("n", [this, held](int called) {
+        notifications_.CancelNamedNotification(called);
+        calls_.push_back(held != nullptr ? -1 : 0); // what it holds is still there
+    });
+    const int remaining = add("n");
+    auto others = std::make_unique<LinuxNamedNotifications>(path_, log_);
+    (void)others->RegisterNamedNotification("n", queue_, [held](int) { FAIL(); });
+    post("n", "1");
+    deliver();
+    others->deliverPosts();
+    EXPECT_THAT(queue_.takePaces(), SizeIs(4));
+    notifications_.CancelNamedNotification(first); // its call waits on the queue
+    notifications_.CancelNamedNotification(first);
+    notifications_.CancelNamedNotification(4711);
+    others.reset();
+    queue_.runAll();
+    EXPECT_THAT(std::exchange(calls_, {}), ElementsAre(-1, remaining));
+    EXPECT_EQ(held.use_count(), 1) << "the handlers are gone";
+    EXPECT_EQ(state(first), State(EBADF, 0));
+    post("n", "2");
+    EXPECT_THAT(callsAfterChange(), ElementsAre(remaining));
+}
+
+TEST_F(NamedNotificationsTest, AnythingMayHaveChangedWhenTheDirectoryComesOrGoes) {
+    const int first = add("a"), second = add("b");
+    fs::remove(path_);
+    fs::create_symlink("notifications", path_);
+    EXPECT_THAT(callsAfterChange(), ElementsAre(first, second));
+    EXPECT_EQ(state(first), State(ELOOP, 0));
+    EXPECT_THAT(log_.take(), ElementsAre(HasSubstr("/notifications: Too many levels of symbolic links; "),
+                                         HasSubstr("/a: Too many levels of symbolic links; ")));
 }
 
 } // namespace

@@ -1,52 +1,33 @@
 #include "platform/linux/loop/LinuxWorkQueues.h"
 
-#include <gtest/gtest.h>
+#include <gmock/gmock.h>
 
-#include <algorithm>
-#include <atomic>
 #include <cctype>
-#include <chrono>
 #include <filesystem>
 #include <future>
 #include <latch>
-#include <memory>
-#include <mutex>
-#include <string>
-#include <thread>
-#include <utility>
-#include <vector>
 
 namespace tamblo {
 namespace {
 
+using namespace testing;
+using std::chrono::milliseconds;
+
 constexpr std::chrono::seconds kPatience{20};
 
-/// Waits for everything posted before.
-void settle(SerialQueue& queue) {
-    std::promise<void> done;
-    queue.post([&done] { done.set_value(); });
-    ASSERT_EQ(done.get_future().wait_for(kPatience), std::future_status::ready);
-}
-
-/// The letters of the pieces that ran: as they are on the test's own thread, else as capitals.
+/// The letters of the pieces that ran: as they are on the test's own thread, else as capitals. Of one queue,
+/// which is its guard.
 class Trace {
 public:
-    void add(char letter) {
-        const std::lock_guard lock(mutex_);
-        text_ += static_cast<char>(std::this_thread::get_id() == me_ ? letter : std::toupper(letter));
+    auto step(char letter) {
+        return [this, letter] {
+            text += static_cast<char>(std::this_thread::get_id() == me_ ? letter : std::toupper(letter));
+        };
     }
-    [[nodiscard]] auto step(char letter) {
-        return [this, letter] { add(letter); };
-    }
-    [[nodiscard]] std::string text() const {
-        const std::lock_guard lock(mutex_);
-        return text_;
-    }
+    std::string text;
 
 private:
     const std::thread::id me_ = std::this_thread::get_id();
-    mutable std::mutex mutex_;
-    std::string text_;
 };
 
 TEST(SerialQueue, RunsWorkOfManyThreadsOneAtATimeInTheirOrderHoweverOftenItIsSuspended) {
@@ -70,10 +51,10 @@ TEST(SerialQueue, RunsWorkOfManyThreadsOneAtATimeInTheirOrderHoweverOftenItIsSus
         }
     });
     threads.clear();
-    settle(*queue);
+    queues.workOff();
     for (const std::vector<int>& ofThread : seen) {
-        ASSERT_EQ(ofThread.size(), static_cast<std::size_t>(kEach));
-        EXPECT_TRUE(std::is_sorted(ofThread.begin(), ofThread.end()));
+        EXPECT_EQ(ofThread.size(), static_cast<std::size_t>(kEach));
+        EXPECT_TRUE(std::ranges::is_sorted(ofThread));
     }
 }
 
@@ -85,13 +66,13 @@ TEST(SerialQueue, QuickWorkIsDrainedByThePosterInOneBatch) {
     queues.setRunEnd(trace.step('.'));
     queues.beginWakeUp();
     queue->post([&] {
-        trace.add('a');
+        trace.step('a')();
         queue->post(trace.step('c'));
     });
     queue->post(trace.step('b'));
-    EXPECT_EQ(trace.text(), "");
+    EXPECT_EQ(trace.text, "");
     queues.endWakeUp();
-    EXPECT_EQ(trace.text(), "ab|c|.");
+    EXPECT_EQ(trace.text, "ab|c|.");
 }
 
 TEST(SerialQueue, WorkThatMayBlockLeavesThePosterAndTakesWhatFollowsAlong) {
@@ -102,45 +83,32 @@ TEST(SerialQueue, WorkThatMayBlockLeavesThePosterAndTakesWhatFollowsAlong) {
         std::latch mayGoOn(1);
         queues.beginWakeUp();
         queue->post([&] {
-            trace.add('a');
+            trace.step('a')();
             queue->setMayBlock(mayAllBlock); // even what is posted already
         });
-        queue->post(
-            [&] {
-                mayGoOn.wait();
-                trace.add('b');
-            },
-            mayAllBlock ? Pace::quick : Pace::mayBlock);
-        queue->post(trace.step('c'));
-        queues.endWakeUp(); // returns although b has not run
+        queue->post([&] { mayGoOn.wait(); }, mayAllBlock ? Pace::quick : Pace::mayBlock);
+        queue->post(trace.step('b'));
+        queues.endWakeUp(); // returns although the second waits
         mayGoOn.count_down();
-        settle(*queue);
-        EXPECT_EQ(trace.text(), "aBC");
+        queues.workOff();
+        EXPECT_EQ(trace.text, "aB");
     }
 }
 
 TEST(SerialQueue, ManyQueuesShareFewThreadsThatGrowWhileWorkBlocks) {
     LinuxWorkQueues queues;
-    constexpr std::size_t kBlocked = 8;
-    std::latch allBlocked(kBlocked);
-    std::latch mayGoOn(1);
+    std::latch allBlock(8);
     std::atomic<int> ran{0};
-    std::vector<std::unique_ptr<SerialQueue>> many;
-    for (std::size_t i = 0; i < 10'000; ++i) {
-        many.push_back(queues.makeSerialQueue("one of many"));
-        many.back()->post([&, isBlocked = i < kBlocked] {
-            if (isBlocked) {
-                allBlocked.count_down();
-                mayGoOn.wait();
+    for (int i = 0; i < 10'000; ++i) {
+        queues.makeSerialQueue("one of many")->post([&, isBlocking = i < 8] {
+            if (isBlocking) {
+                allBlock.arrive_and_wait();
             }
             ++ran;
         });
     }
-    allBlocked.wait();
-    settle(*many.back());
     const std::filesystem::directory_iterator threads("/proc/self/task");
     EXPECT_LE(std::distance(threads, {}), static_cast<std::ptrdiff_t>(ThreadPool::kMaximumThreads) + 4);
-    mayGoOn.count_down();
     queues.workOff();
     EXPECT_EQ(ran, 10'000);
 }
@@ -153,16 +121,12 @@ TEST(SerialQueue, WhatWasPostedRunsAfterItIsDestroyed) {
         for (int i = 0; i < 1000; ++i) {
             queue->post([&ran] { ++ran; }, i % 2 == 0 ? Pace::quick : Pace::mayBlock);
         }
-        queue.reset();
-
         // In its own work, and on the thread that is to drain it.
         queue = queues.makeSerialQueue("suicide");
         queues.beginWakeUp();
         queue->post([&] { queue.reset(); });
         queue->post([&ran] { ++ran; });
-        auto other = queues.makeSerialQueue("abandoned");
-        other->post([&ran] { ++ran; });
-        other.reset();
+        queues.makeSerialQueue("abandoned")->post([&ran] { ++ran; });
         queues.endWakeUp();
         EXPECT_EQ(queue, nullptr);
     }
@@ -174,52 +138,42 @@ TEST(SerialQueue, RunsNothingWhileItIsSuspendedAndAllOfItAfterwards) {
     for (const bool isInline : {true, false}) {
         auto queue = queues.makeSerialQueue("suspended");
         Trace trace;
-        std::promise<void> suspended;
-        queue->setBatchEnd([&, isFirst = true]() mutable {
-            if (std::exchange(isFirst, false)) {
-                suspended.set_value();
-            }
-        });
         if (isInline) {
             queues.beginWakeUp();
         }
         queue->post([&] {
             queue->suspend();
             queue->suspend();
-            trace.add('a');
+            trace.step('a')();
         });
         queue->post(trace.step('b')); // as a rule of the same batch
         queues.endWakeUp();
-        ASSERT_EQ(suspended.get_future().wait_for(kPatience), std::future_status::ready);
+        queues.workOff();
         queue->post(trace.step('c'), Pace::mayBlock);
-        auto other = queues.makeSerialQueue("other");
-        settle(*other);
-        EXPECT_EQ(trace.text(), isInline ? "a" : "A");
-        other->post([&] { queue->resume(); });
-        settle(*other);
-        settle(*queue);
-        EXPECT_EQ(trace.text(), isInline ? "aBC" : "ABC");
+        queues.workOff();
+        EXPECT_EQ(trace.text, isInline ? "a" : "A");
+        queue->resume();
+        queues.workOff();
+        EXPECT_EQ(trace.text, isInline ? "aBC" : "ABC");
 
         queue->resume(); // of a queue that runs
         queue->suspend();
-        std::promise<void> done;
-        queue->post([&done] { done.set_value(); });
+        queue->post(trace.step('d'));
         queue.reset();
-        EXPECT_EQ(done.get_future().wait_for(kPatience), std::future_status::ready);
+        queues.workOff();
+        EXPECT_EQ(trace.text.back(), 'D');
     }
 }
 
 TEST(DelayedCall, IsMadeOnceItsTimeHasComeUnlessItIsCalledOff) {
     LinuxWorkQueues queues;
-    using std::chrono::milliseconds;
     const auto start = std::chrono::steady_clock::now();
     std::promise<void> late;
     std::atomic<bool> isSoonMade{false};
-    std::atomic<bool> isCalledOffMade{false};
     const auto lateCall = queues.callAfter(milliseconds(60), [&late] { late.set_value(); });
-    auto calledOff = queues.callAfter(milliseconds(30), [&] { isCalledOffMade = true; });
+    auto calledOff = queues.callAfter(milliseconds(30), [] { ADD_FAILURE() << "it was called off"; });
     const auto soonCall = queues.callAfter(milliseconds(10), [&] { isSoonMade = true; });
-    const auto never = queues.callAfter(std::chrono::hours(24), [] { FAIL(); });
+    const auto never = queues.callAfter(std::chrono::hours(24), [] { ADD_FAILURE() << "too early"; });
     calledOff.reset();
     // Also while the thread that waits for the time is blocked by other work.
     std::latch mayGoOn(1);
@@ -228,21 +182,15 @@ TEST(DelayedCall, IsMadeOnceItsTimeHasComeUnlessItIsCalledOff) {
     ASSERT_EQ(late.get_future().wait_for(kPatience), std::future_status::ready);
     EXPECT_GE(std::chrono::steady_clock::now() - start, milliseconds(60));
     EXPECT_TRUE(isSoonMade);
-    EXPECT_FALSE(isCalledOffMade);
     mayGoOn.count_down();
 
-    // Many at once, each made once.
-    std::atomic<int> made{0};
-    std::promise<void> allMade;
+    constexpr std::ptrdiff_t kMany = 2000;
+    std::latch allMade(kMany);
     std::vector<std::unique_ptr<DelayedCall>> calls;
-    for (int i = 0; i < 2000; ++i) {
-        calls.push_back(queues.callAfter(milliseconds(i % 20), [&] {
-            if (++made == 2000) {
-                allMade.set_value();
-            }
-        }));
+    for (std::ptrdiff_t i = 0; i < kMany; ++i) {
+        calls.push_back(queues.callAfter(milliseconds(i % 20), [&] { allMade.count_down(); }));
     }
-    EXPECT_EQ(allMade.get_future().wait_for(kPatience), std::future_status::ready);
+    allMade.wait();
 }
 
 } // namespace
