@@ -152,7 +152,8 @@ protected:
         reporter = service->makeReporter(std::array<pid_t, 3>{12, 13, 12});
     }
     std::string identifier(std::size_t reply) const {
-        return std::string(replies.at(reply).find(glarn::kReplySessionID)->stringValue());
+        const Value* found = replies.at(reply).find(glarn::kReplySessionID);
+        return found != nullptr ? std::string(found->stringValue()) : "";
     }
     /// The sink's lines as "OP SESSION".
     std::vector<std::string> lines() {
@@ -239,6 +240,9 @@ TEST_F(BugCaptureServiceTest, ATimedSessionIsKeptUnlessItIsCancelledBeforeItsEnd
 }
 
 TEST_F(BugCaptureServiceTest, RequestsOutsideTheLimitsMakeNoLine) {
+    const auto refusal = [](GlarnError reason) {
+        return Dictionary{{glarn::kReplySuccess, false}, {glarn::kReplyReason, int{reason}}};
+    };
     makeService();
     for (const double seconds : {-0.001, std::nan(""), std::numeric_limits<double>::infinity(), 3600.001}) {
         const std::chrono::duration<double> duration(seconds);
@@ -253,14 +257,13 @@ TEST_F(BugCaptureServiceTest, RequestsOutsideTheLimitsMakeNoLine) {
     gather();
     makeService(); // a restart begins no new day
     EXPECT_TRUE(reporter->snapshot(signature, 0s, {}, keep));
-    EXPECT_EQ(*replies.back().find(glarn::kReplyReason), Value(int{kGlarnErrorDailyLimitExceeded}));
+    EXPECT_EQ(replies.back(), refusal(kGlarnErrorDailyLimitExceeded));
     gather();
     EXPECT_THAT(lines(), SizeIs(21)) << "one of them for the session that the service's end has cancelled";
     service->endSessions();
     clock.advance(24h);
     EXPECT_TRUE(reporter->startSession(signature, 1s, keep));
-    EXPECT_EQ(replies.back(), (Dictionary{{glarn::kReplySuccess, false},
-                                          {glarn::kReplyReason, int{kGlarnErrorServiceUnavailable}}}));
+    EXPECT_EQ(replies.back(), refusal(kGlarnErrorServiceUnavailable));
 }
 
 class StackCaptureTest : public CapturesTest {
@@ -293,6 +296,8 @@ TEST_F(StackCaptureTest, ALineHoldsTheSamplesThatEachThreadHad) {
         if (++sleeps == 1) {
             writeThread("8", "9", "D (disk sleep)");
             writeThread("8", "10", "R (running)");
+        } else if (sleeps == 2) {
+            root.write("proc/8/task/9/wchan", "io_wait");
         } else if (sleeps == 3) {
             fs::remove_all(root.path("proc/8"));
         }
@@ -308,7 +313,8 @@ TEST_F(StackCaptureTest, ALineHoldsTheSamplesThatEachThreadHad) {
                        R"({"process":6,"name":"p6","threads":[{"thread":6,"name":"t6","samples":[)"
                        R"-({"count":5,"state":"S (sleeping)","kernelStack":[]}]}]},)-"
                        R"({"process":8,"name":"p8","threads":[{"thread":9,"name":"t9","samples":[)"
-                       R"-({"count":1,"state":"R (running)"},{"count":2,"state":"D (disk sleep)"}]}]},)-"
+                       R"-({"count":1,"state":"R (running)"},{"count":1,"state":"D (disk sleep)"},)-"
+                       R"-({"count":1,"state":"D (disk sleep)","waitChannel":"io_wait"}]}]},)-"
                        R"({"process":7,"name":"p7","threads":[{"thread":7,"name":"t7","samples":[)"
                        R"-({"count":5,"state":"S (sleeping)","waitChannel":"pipe_read",)-"
                        R"("kernelStack":["pipe_read+0x1/0x2","f [mod]","torn"]}]}]}]})"

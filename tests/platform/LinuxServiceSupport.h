@@ -8,14 +8,6 @@
 
 #include <algorithm>
 #include <cerrno>
-#include <chrono>
-#include <cstddef>
-#include <functional>
-#include <optional>
-#include <string>
-#include <string_view>
-#include <utility>
-#include <vector>
 
 #include <poll.h>
 

@@ -257,6 +257,7 @@ class LinuxAnalyticsEventServiceTest : public Test {
 protected:
     void useEvents(const Value& patterns) {
         preferences_.setPreferenceValue("events_in_use", "com.vandra.tamblo.analytics", patterns, {});
+        queues_.workOff();
     }
 
     TemporaryDirectory directory_;
@@ -291,6 +292,7 @@ TEST_F(LinuxAnalyticsEventServiceTest, AnswersWhichEventsAreInUse) {
         }
     }
     preferences_.setPreferenceValue("k", "d", 1, {}); // no news of these
+    queues_.workOff();
     EXPECT_TRUE(events_.isEventInUse("1x"));
     EXPECT_THAT(log_.take(), ElementsAre(HasSubstr("analytics.json: events_in_use is no array"),
                                          HasSubstr("analytics.json: events_in_use holds what is no name")));
