@@ -337,9 +337,7 @@ protected:
         file = std::get<std::unique_ptr<ReportFile>>(std::move(created));
         return name;
     }
-    static unsigned modeOf(const std::string& path) {
-        return static_cast<unsigned>(fs::status(path).permissions());
-    }
+    static fs::perms modeOf(const std::string& path) { return fs::status(path).permissions(); }
 
     TemporaryDirectory directory;
     FaultyOperations operations;
@@ -354,12 +352,12 @@ TEST_F(LinuxReportFilesTest, DirectoriesAreForEverybodyWhateverTheMask) {
     EXPECT_EQ(files.createDirectory(reporting), std::nullopt);
     ::umask(before);
     for (const char* name : {"DiagnosticLogs", "DiagnosticLogs/Audio", "DiagnosticLogs/Audio/Reporting"}) {
-        EXPECT_EQ(modeOf(directory.path(name)), 0777U) << name;
+        EXPECT_EQ(modeOf(directory.path(name)), fs::perms::all) << name;
     }
-    EXPECT_EQ(modeOf(directory.path()), 0700U);
+    EXPECT_EQ(modeOf(directory.path()), fs::perms::owner_all);
     ::chmod(reporting.c_str(), 0750);
     EXPECT_EQ(files.createDirectory(reporting), std::nullopt);
-    EXPECT_EQ(modeOf(reporting), 0750U) << "what is there stays as it is";
+    EXPECT_EQ(modeOf(reporting), fs::perms{0750}) << "what is there stays as it is";
 
     fs::remove_all(directory.path("DiagnosticLogs"));
     directory.write("DiagnosticLogs", "a file");
@@ -383,7 +381,7 @@ TEST_F(LinuxReportFilesTest, AFileTakesThePlaceOfARegularOneOnly) {
     const mode_t before = ::umask(0);
     EXPECT_EQ(create("new"), "new");
     ::umask(before);
-    EXPECT_EQ(modeOf(directory.path("new")), 0644U);
+    EXPECT_EQ(modeOf(directory.path("new")), fs::perms{0644});
 
     fs::create_symlink(directory.path("report"), directory.path("link"));
     ::mkfifo(directory.path("pipe").c_str(), 0600);
