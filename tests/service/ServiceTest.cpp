@@ -5,13 +5,10 @@
 #include <gmock/gmock.h>
 
 #include <algorithm>
-#include <csignal>
-#include <string>
+#include <array>
 
-#include <fcntl.h>
 #include <sys/file.h>
 #include <sys/stat.h>
-#include <unistd.h>
 
 // How the service begins and ends, what one client sees of it, and what lies on the disk afterwards.
 
@@ -34,9 +31,8 @@ TEST(Service, MessageOfAStartedSessionBecomesTwoEvents) {
     EXPECT_EQ(client.call(Method::getAllReporters)->result, Value(Array{7}));
 
     client.send(framesOf(request(Method::startReportingSessionForID, 7), 77));
-    EXPECT_TRUE(client.staysSilent());
     const Dictionary payload{{"route name", "Speaker"}, {"level", 0.25F}, {"zrreporting_timestamp", 4e9}};
-    const auto answered = client.call(message(payload, {7}, 0x08000004, 1));
+    const auto answered = client.call(message(payload, {7}, 0x08000004));
     EXPECT_TRUE(answered && !answered->error && !answered->result);
     const std::string expected =
         R"("payload":{"HostApplicationDisplayID":"com.example.music","audiotag":"Session_PlaybackStart",)"
@@ -45,7 +41,6 @@ TEST(Service, MessageOfAStartedSessionBecomesTwoEvents) {
         const std::string name = R"(,"event":"com.vandra.)" + subject + R"(.Session_Playback.Start",)";
         EXPECT_EQ(service.countEvents(name + expected), 1U) << subject;
     }
-    EXPECT_EQ(service.countEvents("Playback.Start"), 2U);
 
     // The stop answers the held start first.
     const auto held = client.call(Method::stopReportingSessionForID, 7);
@@ -141,7 +136,7 @@ TEST(Service, ClientThatLeavesIsReportedOnce) {
     RawClient other(service.socketPath());
     EXPECT_EQ(other.call(Method::getAllReporters)->result, Value(Array{}));
     EXPECT_EQ(service.countEvents("\"n\":1"), 2U);
-    EXPECT_EQ(service.countEvents("zrreportingclientuptime"), 1U);
+    EXPECT_EQ(countOf("interruptionHandler", service.errorOutput()), 0U);
 }
 
 TEST(Service, WhatKeepsItFromStartingIsOneClearLine) {
@@ -248,39 +243,29 @@ TEST(Service, OfTwoThatStartAtOnceOneServes) {
     EXPECT_EQ(winner.stop(), 0);
 }
 
-TEST(Service, APreferenceThatCannotBeStoredLeavesItsFileWhole) {
+TEST(Service, APreferenceOutlivesTheServiceUnlessThereIsNoRoomForIt) {
     constexpr rlim_t kRoom = 4096;
     const std::string preferences =
         R"({"TalvixInvalidXyBackOffSeconds":3600,"other":[")" + std::string(kRoom, 'x') + "\"]}\n";
-    ServiceProcess service({.isInternalBuild = true,
-                            .preferences = {{kCaptures, preferences}},
-                            .environment = {{"TAMBLO_LOG", "error"}},
-                            .fileSizeLimit = kRoom});
+    ServiceProcess service({.isInternalBuild = true, .preferences = {{kCaptures, preferences}}});
     const auto file = service.preferenceFile(kCaptures);
-    /// How many drafts there are after five seconds of a fault.
+    /// How many drafts there are after five seconds of a fault and the service's end.
     const auto drafts = [&service] {
         Session client(service.socketPath());
         for (const double offset : {0.0, 5.1}) {
-            EXPECT_TRUE(client.call(
-                message({{"tvac_invalid_x", offset}, {"zrreporting_timestamp", 4e9 + offset}}, {7}, 14, 11)));
+            client.call(
+                message({{"tvac_invalid_x", offset}, {"zrreporting_timestamp", 4e9 + offset}}, {7}, 14, 11));
         }
+        service.stop(); // which waits for what is still to be stored
         return linesOf(service.logs() / "bug-report-drafts.jsonl").size();
     };
+    service.limit(RLIMIT_FSIZE, kRoom);
     EXPECT_EQ(drafts(), 1U);
-    EXPECT_EQ(drafts(), 1U) << "the service itself knows";
-    service.stop(); // which waits for what is still to be stored
     EXPECT_EQ(contentOf(file), preferences);
-
-    // Once there is room, the time of a draft is the device's: another run of the service keeps to it.
-    service.start();
-    service.liftFileSizeLimit();
-    EXPECT_EQ(drafts(), 2U);
-    service.stop();
-    EXPECT_THAT(contentOf(file),
-                testing::ContainsRegex(R"(^\{"TalvixInvalidXyBackOffSeconds":3600,)"
-                                       R"("TalvixInvalidXyQLTlastRun":[0-9]{10}\.[0-9]+,"other":\[")"));
-    service.start();
-    EXPECT_EQ(drafts(), 2U);
+    for (int run = 0; run < 2; ++run) {
+        service.start();
+        EXPECT_EQ(drafts(), 2U) << "the time of a draft is the device's";
+    }
     EXPECT_EQ(entriesOf(file.parent_path()), 1) << "nothing is left over";
 }
 
