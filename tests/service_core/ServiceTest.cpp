@@ -1,5 +1,6 @@
 #include "tests/service_core/ServiceTestBase.h"
 
+#include <map>
 #include <random>
 
 namespace tamblo {
@@ -8,56 +9,207 @@ namespace {
 using std::chrono::milliseconds;
 using testing::ElementsAre;
 using testing::IsEmpty;
+using ReporterIDs = std::vector<ReporterID>;
 
-using ServiceTest = ServiceTestBase;
+constexpr const char* kRefused = "send com.vandra.audio.reporting 1";
 
-TEST_F(ServiceTest, FindsSessionsByID) {
-    const Connection first = connect(10);
-    const Connection second = connect(11);
-    open(second, 7);
-    open(second, 8);
-    EXPECT_THAT(found({7, 0, 7, 8}), ElementsAre(7, 7, 8));
-    EXPECT_THAT(found({0}), IsEmpty()) << "no falling back when IDs were given";
-    EXPECT_THAT(found({9}), IsEmpty());
-    EXPECT_EQ(service->singleMessageSession(), nullptr);
+class ServiceTest : public ServiceTestBase {
+protected:
+    using ServiceTestBase::ServiceTestBase;
+    Connection client = connect(10);
+    ZRReportingServiceProtocol& requests = client->object();
+};
 
-    open(first, 7);
-    EXPECT_EQ(find(7)->processIdentifiers().front(), 10) << "the client that was accepted first wins";
-    first->interrupt();
+class InternalBuildTest : public ServiceTest {
+protected:
+    InternalBuildTest() : ServiceTest(true) {}
+};
+
+TEST_F(ServiceTest, UnknownReportersAreAnsweredWithSuccess) {
+    // ID 0 names no session, even once there is one.
+    requests.createReportingSession(0, {});
     (void)run();
-    EXPECT_EQ(find(7)->processIdentifiers().front(), 11);
+    (void)script.take();
+    for (const ReporterID id : {ReporterID{0}, ReporterID{99}}) {
+        requests.setServiceType(2, id, note<bool>("type"));
+        requests.setConfiguration({{"a", 1}}, id, note<bool>("configure"));
+        requests.startReportingSessionForID(id, note<bool>("start"));
+        requests.stopReportingSessionForID(id, note<bool>("stop"));
+        requests.destroyReportingSession(id, note<bool>("destroy"));
+        requests.reporterID(id, note<Dictionary>("found"));
+        requests.getServiceNameForReporterID(id, note<std::uint16_t>(id == 0 ? "twice" : "once"));
+    }
+    EXPECT_THAT(takeReplies(), IsEmpty()) << "nothing happens on the connection's thread";
+    send(client, {99});
+    const char* const found = R"(found {"reporterID":0,"serviceType":65535})";
+    EXPECT_THAT(takeReplies(),
+                ElementsAre("type true", "configure true", "start true", "stop true", "destroy true", found,
+                            "twice 65535", "twice 65535", "type true", "configure true", "start true",
+                            "stop true", "destroy true", found, "once 65535", "send"));
+    EXPECT_THAT(script.take(), IsEmpty());
+}
+
+TEST_F(ServiceTest, TheStartReplyIsHeldUntilTheStop) {
+    requests.createReportingSession(7, note<bool>("create"));
+    requests.setServiceType(AudioServiceTypeTest, 7, {});
+    requests.startReportingSessionForID(7, note<bool>("start"));
+    requests.startReportingSessionForID(7, note<bool>("again"));
+    EXPECT_THAT(answers(), ElementsAre("create true"));
+    requests.stopReportingSessionForID(7, note<bool>("stop"));
+    requests.stopReportingSessionForID(7, note<bool>("stop"));
+    EXPECT_THAT(answers(), ElementsAre("start true", "stop true", "stop true")) << "answered once";
+}
+
+TEST_F(InternalBuildTest, OfATestSessionItIsAnsweredAtOnceAndPayloadsForAllAreMarked) {
+    open(client, 8);
+    requests.createReportingSession(7, {});
+    requests.setServiceType(AudioServiceTypeTest, 7, {});
+    requests.startReportingSessionForID(7, note<bool>("start"));
+    EXPECT_THAT(answers(), ElementsAre("start true"));
+    requests.stopReportingSessionForID(7, {});
+    EXPECT_THAT(answers(), ElementsAre("start true")) << "and at the stop";
+    for (const ReporterIDs& to : {ReporterIDs{}, ReporterIDs{8}}) {
+        send(client, to, {{"recipients", to.size()}});
+        EXPECT_EQ(find(8)->messages().back()->payload().contains("sendSingleMessage"), to.empty());
+    }
+}
+
+TEST_F(ServiceTest, AReplyHeldByASessionThatGoesIsNeverAnswered) {
+    const struct {
+        const char* what;
+        std::function<void()> end;
+        std::size_t stops;
+    } endings[] = {
+        {"destroyed", [&] { requests.destroyReportingSession(7, {}); }, 1},
+        {"replaced", [&] { requests.createReportingSession(7, {}); }, 0},
+        {"changed", [&] { requests.setServiceType(3, 7, {}); }, 0},
+        {"left", [&] { client->interrupt(); }, 1},
+    };
+    for (const auto& ending : endings) {
+        requests.createReportingSession(7, {});
+        requests.startReportingSessionForID(7, note<bool>("start"));
+        (void)run();
+        ending.end();
+        EXPECT_THAT(answers(), IsEmpty()) << ending.what;
+        EXPECT_EQ(script.count("stop Init"), ending.stops) << ending.what;
+        (void)script.take();
+    }
+}
+
+TEST_F(ServiceTest, AChangeOfServiceTypeMakesAFreshSessionOfTheSameClient) {
+    open(client, 7);
+    requests.setConfiguration({{"HostApplicationDisplayID", "com.app"}}, 7, {});
+    send(client, {7}, {{"volume", 3}});
+    const SessionRef before = find(7);
+    requests.setServiceType(65535, 7, {});
+    (void)run();
+    EXPECT_EQ(find(7), before) << "the same type";
+    requests.setServiceType(2, 7, {});
+    (void)run();
+    const SessionRef after = find(7);
+    EXPECT_TRUE(before->started()) << "dropped, not stopped";
+    EXPECT_EQ(after->description(), "reporterID=7,serviceName=telephony,ownerPid=10,clientProcessName=app10,"
+                                    "HostApplicationDisplayID=com.app,started=0,singleMessageSession=0");
+    EXPECT_THAT(after->messages(), IsEmpty());
+    EXPECT_EQ(after->previousValues().find("volume")->integerValue(), 3);
+    EXPECT_THAT(service->getAllActiveReportingSessions(), IsEmpty());
+}
+
+TEST_F(ServiceTest, DisabledReportingRefusesMessages) {
+    open(client, 7);
+    service->setReportingEnabled(false);
+    send(client, {7});
+    send(client, {});
+    EXPECT_THAT(takeReplies(), ElementsAre(kRefused, kRefused));
+    EXPECT_EQ(find(7), nullptr);
+    EXPECT_EQ(service->singleMessageSession(), nullptr);
+    service->setReportingEnabled(true);
+    send(client, {7});
+    EXPECT_THAT(takeReplies(), ElementsAre("send"));
+}
+
+TEST_F(ServiceTest, LookupsCrossClientsChangesDoNot) {
+    const Connection other = connect(11);
+    ZRReportingServiceProtocol& others = other->object();
+    open(client, 7);
+    requests.createReportingSession(8, {});
+    requests.setServiceType(2, 8, {});
+    requests.createReportingSession(9, {});
+    open(other, 9);
+    others.setServiceType(3, 8, {});
+    others.setConfiguration({{"a", 1}}, 8, {});
+    others.startReportingSessionForID(8, {});
+    others.stopReportingSessionForID(7, {});
+    others.destroyReportingSession(7, {});
+    others.setServiceType(4, 9, {});
+    others.getServiceNameForReporterID(9, note<std::uint16_t>("own"));
+    others.reporterID(8, note<Dictionary>("found"));
+    others.getAllReporters(note<ReporterIDs>("all"));
+    EXPECT_THAT(answers(),
+                ElementsAre("own 4", R"(found {"reporterID":8,"serviceType":2})", "all { 7, 8, 9, 9 }"));
+    EXPECT_TRUE(find(7)->started());
+    EXPECT_FALSE(find(8)->started());
+    EXPECT_FALSE(find(8)->configuration().contains("a"));
+}
+
+TEST_F(ServiceTest, PacesAndTracePoints) {
+    (void)device.serverQueue().takePaces();
+    (void)device.tracePoints.take();
+    requests.createReportingSession(7, {});
+    requests.startReportingSessionForID(7, {});
+    requests.sendMessage({}, 1, 1, {5}, {});
+    requests.stopReportingSessionForID(7, {});
+    requests.destroyReportingSession(7, {});
+    EXPECT_THAT(device.serverQueue().takePaces(),
+                ElementsAre(Pace::quick, Pace::mayBlock, Pace::quick, Pace::mayBlock, Pace::mayBlock));
+    (void)run();
+    std::vector<std::uint32_t> codes = device.tracePoints.take();
+    std::erase_if(codes, [](std::uint32_t code) { return code > 0x21044824; }); // a session's own
+    EXPECT_THAT(codes, ElementsAre(0x21044814, 0x21044818, 0x21044824, 0x2104481C, 0x21044820));
+}
+
+TEST_F(ServiceTest, KillingEndsTheProcessAtOnceWhileThereIsAService) {
+    requests.killService();
+    EXPECT_EQ(std::exchange(exitStatus(), 0), 2);
+    service.reset();
+    requests.createReportingSession(7, note<bool>("create"));
+    requests.sendMessage({}, 1, 1, {7}, note<>("send"));
+    requests.killService();
+    client->interrupt();
+    EXPECT_THAT(answers(), ElementsAre("create true", kRefused));
+    EXPECT_EQ(exitStatus(), 0);
 }
 
 TEST_F(ServiceTest, TheRegistryFindsWhatAWalkOverTheClientsWould) {
     std::mt19937 random(11);
-    const auto upTo = [&](unsigned most) { return random() % (most + 1); };
+    const auto below = [&](std::size_t limit) { return random() % limit; };
     std::vector<Connection> connections;
     for (int step = 0; step < 3000; ++step) {
-        if (connections.empty() || (connections.size() < 6 && upTo(30) == 0)) {
+        if (connections.empty() || (connections.size() < 6 && below(31) == 0)) {
             connections.push_back(connect(100 + step));
         }
-        const std::size_t at = upTo(static_cast<unsigned>(connections.size() - 1));
-        ZRReportingServiceProtocol& client = connections[at]->object();
-        const ReporterID id = upTo(4) + 1;
-        const auto what = upTo(12);
-        if (what == 0) {
-            connections[at]->invalidate();
-            connections.erase(connections.begin() + static_cast<int>(at));
-        } else if (what == 1) {
-            client.destroyReportingSession(id, {});
-        } else if (what == 2) {
-            client.setServiceType(static_cast<std::uint16_t>(upTo(3)), id, {});
-        } else if (what < 5) {
-            client.stopReportingSessionForID(id, {});
-        } else if (what < 8) {
-            client.startReportingSessionForID(id, {});
+        const auto at = connections.begin() + static_cast<int>(below(connections.size()));
+        ZRReportingServiceProtocol& to = (*at)->object();
+        const auto id = static_cast<ReporterID>(1 + below(5));
+        const std::function<void()> steps[] = {
+            [&] { to.destroyReportingSession(id, {}); },
+            [&] { to.setServiceType(static_cast<std::uint16_t>(below(4)), id, {}); },
+            [&] { to.stopReportingSessionForID(id, {}); },
+            [&] { to.startReportingSessionForID(id, {}); },
+            [&] { to.createReportingSession(id, {}); },
+        };
+        if (below(13) == 0) {
+            (*at)->invalidate();
+            connections.erase(at);
         } else {
-            client.createReportingSession(id, {});
+            steps[below(std::size(steps))]();
         }
         (void)run();
         std::vector<SessionRef> active;
+        std::map<ReporterID, SessionRef> first;
         for (const ClientRef& each : service->getAllClients()) {
             for (const auto& [key, session] : each->clientReportingSessionMap()) {
+                first.emplace(key, session);
                 if (session->started()) {
                     active.push_back(session);
                 }
@@ -65,34 +217,29 @@ TEST_F(ServiceTest, TheRegistryFindsWhatAWalkOverTheClientsWould) {
         }
         ASSERT_EQ(service->getAllActiveReportingSessions(), active) << step;
         for (ReporterID each = 1; each <= 5; ++each) {
-            SessionRef first;
-            for (const ClientRef& holder : service->getAllClients()) {
-                first = first != nullptr ? first : holder->findReportingSessionForID(each, false);
-            }
-            ASSERT_EQ(find(each), first) << step;
+            ASSERT_EQ(find(each), first[each]) << step;
         }
         device.log.clear();
     }
 }
 
-TEST_F(ServiceTest, MessagesWithoutIDsGoToEveryStartedSession) {
-    const Connection first = connect(10);
-    const Connection second = connect(11);
-    open(first, 7);
-    open(second, 8);
-    second->object().createReportingSession(9, {});
-    (void)run();
-    EXPECT_THAT(found({}), ElementsAre(7, 8));
-    send(first, {}, {{"to", "both"}});
+TEST_F(ServiceTest, MessagesGoToTheSessionsOfTheirIDsOrToEveryStartedOne) {
+    const Connection other = connect(11);
+    open(other, 8);
+    open(client, 7);
+    other->object().createReportingSession(9, {});
+    send(client, {}, {{"to", "both"}});
     const Dictionary& sent = find(7)->messages().back()->payload();
     EXPECT_EQ(sent, find(8)->messages().back()->payload());
     EXPECT_TRUE(sent.contains("to"));
     EXPECT_FALSE(sent.contains("sendSingleMessage"));
+    EXPECT_THAT(found({}), ElementsAre(7, 8)) << "in the order of the clients";
+    EXPECT_THAT(found({9, 0, 7, 99, 9}), ElementsAre(9, 7, 9));
+    EXPECT_THAT(found({0}), IsEmpty()) << "no falling back when IDs were given";
     EXPECT_EQ(service->singleMessageSession(), nullptr);
 }
 
 TEST_F(ServiceTest, TheSingleMessageSessionLivesUntilItIsIdleForMoreThanFiveSeconds) {
-    const Connection client = connect(10);
     send(client, {});
     const SessionRef session = service->singleMessageSession();
     ASSERT_NE(session, nullptr);
@@ -118,7 +265,6 @@ TEST_F(ServiceTest, TheSingleMessageSessionLivesUntilItIsIdleForMoreThanFiveSeco
     device.workQueues.elapse(milliseconds(500));
     EXPECT_TRUE(session->started()) << "on the server queue";
     (void)run();
-    EXPECT_FALSE(session->started());
     EXPECT_EQ(script.count("stop Late"), 1U) << "workers stop as they do in any session";
     EXPECT_EQ(service->singleMessageSession(), nullptr);
     EXPECT_EQ(device.workQueues.delayedCalls(), 0U) << "an idle service makes no wake-ups";
@@ -129,10 +275,9 @@ TEST_F(ServiceTest, TheSingleMessageSessionLivesUntilItIsIdleForMoreThanFiveSeco
     EXPECT_EQ(device.workQueues.delayedCalls(), 1U);
 }
 
-TEST_F(ServiceTest, ALostClientIsRemovedOnceAndReportedOnce) {
-    Connection client = connect(10);
+TEST_F(ServiceTest, ALostClientIsRemovedAndItsUptimeReportedOnce) {
     open(client, 7);
-    client->object().createReportingSession(8, {});
+    requests.createReportingSession(8, {});
     device.clock.advance(milliseconds(2500));
     client->interrupt();
     client->invalidate();
@@ -142,13 +287,11 @@ TEST_F(ServiceTest, ALostClientIsRemovedOnceAndReportedOnce) {
     EXPECT_THAT(service->getAllClients(), IsEmpty());
     EXPECT_EQ(script.count("stop Init"), 1U) << "only what was started is stopped";
     EXPECT_EQ(find(8), nullptr);
-    EXPECT_EQ(device.log.count("removing 10 from the server client list"), 1U);
-    EXPECT_THAT(device.analyticsEvents.payloads(kUptimeEvent),
-                ElementsAre(Dictionary{{"processName", "app10"}, {"seconds", 2.5}}));
-}
 
-TEST_F(ServiceTest, UptimeOfAClientThatIsNotKnown) {
-    const auto nameless = device.connections.connect(10);
+    const Connection fromTheFuture = connect(12);
+    device.clock.advance(milliseconds(-1500));
+    fromTheFuture->invalidate();
+    const auto nameless = device.connections.connect(99);
     nameless->invalidate();
     (void)run();
     const Connection gone = connect(11);
@@ -158,53 +301,9 @@ TEST_F(ServiceTest, UptimeOfAClientThatIsNotKnown) {
     gone->invalidate();
     (void)run();
     EXPECT_EQ(device.log.count("invalidationHandler: connection exited process=unknown uptime_sec=-1"), 1U);
-    EXPECT_THAT(device.analyticsEvents.events(), IsEmpty());
-
-    const Connection fromTheFuture = connect(12);
-    device.clock.advance(milliseconds(-1500));
-    fromTheFuture->invalidate();
-    (void)run();
     EXPECT_THAT(device.analyticsEvents.payloads(kUptimeEvent),
-                ElementsAre(Dictionary{{"processName", "app12"}, {"seconds", 1.5}}));
-}
-
-TEST_F(ServiceTest, ShutDownWorksOffWhatIsQueuedThenStopsEverything) {
-    const Connection first = connect(10);
-    const Connection second = connect(11);
-    send(first, {});
-    const SessionRef single = service->singleMessageSession();
-    open(first, 7);
-    open(second, 8);
-    (void)script.take();
-    first->object().sendMessage({{"last", 1}}, 14, 11, {7}, note<>("send"));
-    service->shutDown([done = note<>("completed")] { done(nullptr); });
-    EXPECT_THAT(takeReplies(), ElementsAre("send"));
-    (void)run();
-    EXPECT_EQ(script.take().front(), "message Init 14/11");
-    EXPECT_THAT(takeReplies(), ElementsAre("send", "completed"));
-    EXPECT_THAT(service->getAllClients(), IsEmpty());
-    EXPECT_FALSE(single->started());
-    EXPECT_EQ(service->singleMessageSession(), nullptr);
-    EXPECT_EQ(device.workQueues.delayedCalls(), 0U);
-    first->invalidate();
-    (void)run();
-    EXPECT_EQ(device.log.count("removing 10 from the server client list"), 1U);
-    const auto uptimes = device.analyticsEvents.payloads(kUptimeEvent);
-    ASSERT_EQ(uptimes.size(), 2U);
-    EXPECT_EQ(uptimes[0].find("processName")->stringValue(), "app10");
-    EXPECT_EQ(uptimes[1].find("processName")->stringValue(), "app11");
-}
-
-TEST_F(ServiceTest, DestroyingTheServiceEndsTheReaper) {
-    const Connection client = connect(10);
-    send(client, {});
-    const SessionRef session = service->singleMessageSession();
-    device.clock.advance(milliseconds(5001));
-    device.workQueues.elapse(milliseconds(500)); // its work is on its way
-    service.reset();
-    (void)run();
-    EXPECT_TRUE(session->started()) << "dropped unstopped";
-    EXPECT_EQ(device.workQueues.delayedCalls(), 0U);
+                ElementsAre(Dictionary{{"processName", "app10"}, {"seconds", 2.5}},
+                            Dictionary{{"processName", "app12"}, {"seconds", 1.5}}));
 }
 
 } // namespace

@@ -74,6 +74,11 @@ protected:
     }
     /// What was answered since the last call.
     std::vector<std::string> takeReplies() { return std::exchange(replies, {}); }
+    /// The same, once all that is queued has run.
+    std::vector<std::string> answers() {
+        (void)run();
+        return takeReplies();
+    }
 
     SessionRef find(ReporterID reporterID) { return service->findReportingSessionForID(reporterID); }
     std::vector<ReporterID> found(const std::vector<ReporterID>& reporterIDs) {

@@ -1,20 +1,21 @@
 #include "base/Json.h"
 #include "tests/client/FakeService.h"
-#include "tests/platform/LinuxServiceSupport.h"
 #include "tools/Payload.h"
 #include "tools/ServiceConnection.h"
 #include "tools/SessionPlayer.h"
+#include "tools/SessionSummaries.h"
 #include "tools/SinkFile.h"
+
+#include <algorithm>
+#include <span>
+
+#include <gtest/gtest.h>
 
 namespace tamblo::tools {
 namespace {
 
 namespace fs = std::filesystem;
 using namespace std::chrono_literals;
-
-void append(const std::string& path, std::string_view text) {
-    std::ofstream(path, std::ios::app) << text;
-}
 
 TEST(Payload, WordsAndObjectsAreRead) {
     const struct {
@@ -55,16 +56,13 @@ TEST(Arguments, OptionsAreTakenApart) {
 
 TEST(ServiceConnection, TheTimeoutIsANumberOfSeconds) {
     const Option options[] = {kSocketOption, kTimeoutOption};
-    const auto connect = [&options](std::string_view timeout) {
-        const std::string_view words[] = {"--socket", "/nonexistent/socket", "--timeout", timeout};
+    const std::pair<std::string_view, std::chrono::milliseconds> cases[] = {
+        {".25", 250ms}, {"1e9", 24h}, {"abc", -1ms}, {"5s", -1ms}, {"-1", -1ms}, {"nan", -1ms}, {"", -1ms}};
+    for (const auto& [text, timeout] : cases) {
+        const std::string_view words[] = {"--socket", "/nonexistent/socket", "--timeout", text};
         ServiceConnection service(std::get<Arguments>(Arguments::parse(options, words)));
-        const auto status = service.connect();
-        return status == ExitStatus::unreachable ? service.timeout() : -1ms;
-    };
-    EXPECT_EQ(connect(".25"), 250ms);
-    EXPECT_EQ(connect("1e9"), 24h);
-    for (const std::string_view wrong : {"abc", "5s", "-1", "nan", ""}) {
-        EXPECT_EQ(connect(wrong), -1ms) << wrong;
+        const bool isRead = service.connect() == ExitStatus::unreachable;
+        EXPECT_EQ(isRead ? service.timeout() : -1ms, timeout) << text;
     }
 }
 
@@ -78,8 +76,8 @@ TEST(SessionFile, LinesAreReadAndWrongOnesRefused) {
     EXPECT_EQ(line.payload, (Dictionary{{"a", 1}}));
     for (const std::string_view wrong :
          {"[]", R"({"type": "Start"})", R"({"category": 14.5})", R"({"category": 14, "type": "Nope"})",
-          R"({"category": 14, "offset_s": -1})", R"({"category": 14, "offset_s": "1"})",
-          R"({"category": 14, "payload": [1]})", R"({"category": 14, "payload": {"a": null}})"}) {
+          R"({"category": 14, "offset_s": -1})", R"({"category": 14, "payload": [1]})",
+          R"({"category": 14, "payload": {"a": null}})"}) {
         EXPECT_TRUE(std::holds_alternative<std::string>(parseSessionLine(wrong))) << wrong;
     }
 }
@@ -115,13 +113,12 @@ protected:
         requests = service.requests();
         return wrong;
     }
-    /// The timestamp of a message that the service was sent.
+    /// Of a message that the service was sent.
     double timestamp(std::size_t number) {
         return requests.at(number).dictionary.find(kTimestampKey)->doubleValue();
     }
-    static double now() {
-        return std::chrono::duration<double>(std::chrono::system_clock::now().time_since_epoch()).count();
-    }
+    const double now =
+        std::chrono::duration<double>(std::chrono::system_clock::now().time_since_epoch()).count();
 
     test::FakeService service;
     client::Client client{{.socketPath = service.path(), .threading = client::Client::Threading::caller}};
@@ -135,12 +132,10 @@ TEST_F(SessionPlayerTest, PlaysInTimeAndStampsWhatHasNoTimestamp) {
                             "{\"category\": 14, \"offset_s\": 0.4}\n{\"category\": }\n");
     ASSERT_TRUE(wrong);
     EXPECT_TRUE(wrong->starts_with("file:4: ")) << *wrong;
-    EXPECT_EQ(report.sent, 2U);
-    EXPECT_EQ(report.answered, 2U);
-    EXPECT_EQ(report.refused, 0U);
+    EXPECT_TRUE(report.sent == 2 && report.answered == 2 && report.refused == 0);
     EXPECT_GE(report.seconds, 0.04);
     EXPECT_EQ(timestamp(0), 5);
-    EXPECT_NEAR(timestamp(1), now(), 5);
+    EXPECT_NEAR(timestamp(1), now, 5);
     EXPECT_EQ(requests[1].reporterIDs, std::vector<std::int64_t>{7});
 }
 
@@ -151,7 +146,7 @@ TEST_F(SessionPlayerTest, KeepsTheRecordedTimesAtAnySpeed) {
     EXPECT_EQ(recordedLength(lines), 62.0);
     EXPECT_FALSE(play({.speed = {}, .recordedLength = 62}, recorded));
     EXPECT_NEAR(timestamp(1) - timestamp(0), 60, 1e-3);
-    EXPECT_NEAR(timestamp(1), now(), 5);
+    EXPECT_NEAR(timestamp(1), now, 5);
 }
 
 TEST(RecordFilter, WantsOneOfTheEventsAndAllOfTheKeys) {
@@ -181,32 +176,109 @@ TEST(SinkFollower, ReadsWholeLinesThroughRotationsAndTornEnds) {
     const TemporaryDirectory directory;
     const std::string path = directory.path("events.jsonl");
     SinkFollower follower(path);
-    std::string seen;
-    LineFunction collect = [&seen](std::string_view line) { seen.append(line).append(" "); };
-    const auto read = [&] {
-        seen.clear();
+    const auto append = [&path](std::string_view text) { test::writeFile(path, text, std::ios::app); };
+    const auto read = [&follower] {
+        std::string seen;
+        LineFunction collect = [&seen](std::string_view line) { seen.append(line).append(" "); };
         follower.readNew(collect);
         return seen;
     };
     EXPECT_EQ(read(), "");
-    append(path, "1\n2\nto");
+    append("1\n2\nto");
     EXPECT_EQ(read(), "1 2 ");
     fs::resize_file(path, 4);
-    append(path, "3\n");
+    append("3\n");
     EXPECT_EQ(read(), "3 ");
-    append(path, "4\n" + std::string(600000, 'x') + "\n");
+    append("4\n" + std::string(600000, 'x') + "\n");
     fs::rename(path, path + ".1");
-    append(path, "5\n");
+    append("5\n");
     fs::rename(path + ".1", path + ".2");
     fs::rename(path, path + ".1");
-    append(path, "6\n");
+    append("6\n");
     EXPECT_EQ(read(), "4 " + std::string(600000, 'x') + " 5 6 ");
     EXPECT_EQ(filesOfSink(path), (std::vector{path + ".2", path + ".1", path}));
     fs::remove(path);
     EXPECT_EQ(read(), "");
-    append(path, "7\n");
+    append("7\n");
     EXPECT_EQ(read(), "7 ");
-    EXPECT_EQ(sinkPath(directory.path(""), path), path);
+}
+
+constexpr std::pair<char, std::string_view> kEvents[] = {{'V', "com.vandra.tamblo.Volume.Summary"},
+                                                         {'K', "com.vandra.tamblo.Kaleen.Summary"},
+                                                         {'S', "com.vandra.tamblo.Session_Generic.Summary"},
+                                                         {'I', "com.vandra.tamblo.Input.Summary"}};
+
+/// "V2" is the second output stretch, "Smusic:9" the summary of a session of that application with 9
+/// messages.
+SessionSummary summaryFrom(const std::string& word) {
+    const auto kind = std::ranges::find(kEvents, word[0], &std::pair<char, std::string_view>::first);
+    SessionSummary summary{std::string(kind->second), {}};
+    if (const std::size_t colon = word.find(':'); colon != word.npos) {
+        summary.payload = {{"HostApplicationDisplayID", word.substr(1, colon - 1)},
+                           {"summaryServiceName", "haptics"},
+                           {"num_messages", std::stoi(word.substr(colon + 1))}};
+    } else {
+        summary.payload = {{"msgidx", std::stoi(word.substr(1))}};
+    }
+    return summary;
+}
+
+TEST(SessionSummaries, ThoseOfOneStopAreTakenOut) {
+    const struct {
+        const char* written;
+        std::size_t first, count;
+    } cases[] = {
+        {"V1 V2 K1 Sa:9 I1", 0, 5},
+        {"Sb:9 V1 Sa:9 Sb:9", 1, 2},             // stops without stretches
+        {"V1 Sa:9 I1 I2 V1 V2 Sb:9", 0, 4},      // input comes behind the session
+        {"V1 V2 Sb:9 I1 I1 Sb:9 K1 Sa:9", 6, 2}, // one that has no session of its own in between
+        {"V1 Sa:9 V1 Sa:10", 2, 2},              // alike: the last
+        {"V1 Sa:4 I1 V1 Sb:9", 3, 2},            // none: too few messages, another application
+        {"V1 V2 V1", 2, 1},                      // the session's own is not in use
+        {"", 0, 0},
+    };
+    for (const auto& row : cases) {
+        SCOPED_TRACE(row.written);
+        std::istringstream words(row.written);
+        std::vector<SessionSummary> written;
+        for (std::string word; words >> word;) {
+            written.push_back(summaryFrom(word));
+        }
+        const auto found = summariesOf({"a", "haptics", 5}, written);
+        EXPECT_TRUE(std::ranges::equal(
+            found, std::span(written).subspan(row.first, row.count),
+            [](const auto& a, const auto& b) { return a.event == b.event && a.payload == b.payload; }));
+    }
+    const SessionSummary haptics[] = {summaryFrom("Sa:9"), summaryFrom("Sb:9")};
+    EXPECT_EQ(summariesOf({"a", "alarms", 5}, haptics)[0].payload, haptics[1].payload);
+}
+
+TEST(SessionSummaries, TablesHoldWhatFits) {
+    const SessionSummary summaries[] = {
+        {"com.vandra.tamblo.Input.Summary",
+         {{"msgidx", 1},
+          {"msgcnt", 2},
+          {"inputrunning_seconds", 7.9599},
+          {"inputrunning_secondsBucketed", "10"},
+          {"active_devices", "Übertrager \x1b[31m und nöch mehr davon"},
+          {"vocoders", "EVS:32000"}}},
+        {"com.vandra.tamblo.Input.Summary",
+         {{"msgidx", 2}, {"msgcnt", 2}, {"inputrunning_seconds", "odd"}, {"active_devices", 5}}},
+        {"com.vandra.tamblo.Session_Generic.Summary",
+         {{"total_active_time", 18.759}, {"active_count", 1}, {"low_power_enabled", 1}}},
+    };
+    EXPECT_EQ(summaryTables(summaries),
+              "\nsession  (com.vandra.tamblo.Session_Generic.Summary)\n"
+              "  reported  by -  process -  as -  single-message -\n"
+              "  messages  all -  unique -  redundant -\n"
+              "  activity  seconds 18.76  periods 1  average -  overloads -\n"
+              "  device    thermal state -  low power yes\n"
+              "  service   memory MiB -\n"
+              "  load      1 min -  5 min -  15 min -\n"
+              "\ninput  (com.vandra.tamblo.Input.Summary)\n"
+              "    #  seconds  class  devices                        mode  port  vocoders\n"
+              "  1/2     7.96     10  Übertrager \\u001b[31m und nö…  -     -     EVS:32000\n"
+              "  2/2      odd      -  5                              -     -     -");
 }
 
 } // namespace
