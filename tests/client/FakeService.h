@@ -54,8 +54,6 @@ public:
     }
     /// While true nothing is read.
     std::atomic<bool> isDeaf{false};
-    /// Frames that were no requests.
-    std::atomic<int> refusals{0};
 
     /// What the real service answers, but for a start, which it holds.
     static void answer(const wire::Request& request, TextBuffer& replies) {
@@ -110,8 +108,7 @@ private:
         while (const auto item = frames.next()) {
             wire::Request request;
             if (wire::decodeRequest(*item, keySets, request)) {
-                ++refusals;
-                continue;
+                return false;
             }
             handler_(request, replies);
             const std::lock_guard lock(mutex_);

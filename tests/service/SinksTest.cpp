@@ -1,6 +1,4 @@
-#include "base/Json.h"
-#include "tests/service/RawClient.h"
-#include "tests/service/ServiceProcess.h"
+#include "tests/service/RealService.h"
 
 #include <gmock/gmock.h>
 #include <nlohmann/json.hpp>
@@ -13,56 +11,39 @@
 namespace tamblo::test {
 namespace {
 
-using testing::ContainsRegex;
-using testing::Matches;
+using namespace testing;
 
 constexpr const char* kCallQuality = "com.vandra.tamblo.callquality";
 
 enum class Due { withTheReply, soon, withTheStop, withTheEnd };
 
 struct Lines {
-    /// A pattern of paths below the logs.
-    std::string files;
-    /// What they hold, as a regular expression; empty: nothing.
-    std::string content;
-
-    [[nodiscard]] std::string contentIn(const ServiceProcess& service) const {
-        return run("cat " + (service.logs() / files).string() + " 2> /dev/null; true").output;
-    }
-    [[nodiscard]] bool areThere(const ServiceProcess& service) const {
-        return content.empty() ? contentIn(service).empty()
-                               : Matches(ContainsRegex(content))(contentIn(service));
-    }
+    std::string files;   ///< a pattern of paths below the logs
+    std::string content; ///< what they hold, as a regular expression
 };
+constexpr const char* kNothing = "^$";
 
-/// "CATEGORY/TYPE PAYLOAD"
-wire::Request parsed(const std::string& text) {
-    unsigned category = 0;
-    unsigned short type = 0;
-    std::sscanf(text.c_str(), "%u/%hu", &category, &type);
-    const auto payload = readJson(std::string_view(text).substr(text.find(' ') + 1));
-    return message(std::get<Value>(payload).dictionaryValue(), {7}, category, type);
+/// For reporter 7.
+wire::Request messageOf(std::uint32_t category, std::uint16_t type, Dictionary payload) {
+    return message(std::move(payload), {7}, category, type);
 }
 
-/// The initials of the operations in the call-quality file, by session and, by "", of all.
+/// The initials of the operations in the call-quality file, by session.
 std::map<std::string, std::string> callQualityOf(const ServiceProcess& service) {
     std::map<std::string, std::string> operations;
     for (const std::string& text : linesOf(service.logs() / "call-quality.jsonl")) {
         const auto line = nlohmann::json::parse(text);
-        for (const std::string& session : {line["session"].get<std::string>(), std::string()}) {
-            operations[session] += line["op"].get<std::string>().front();
-        }
+        operations[line["session"]] += line["op"].get<std::string>().front();
     }
     return operations;
 }
 
-class Sinks : public testing::Test {
+class Sinks : public Test {
 protected:
     /// That these lines come of the messages, no earlier than they are due.
     static void expect(const std::string& build, std::uint16_t serviceType,
-                       const std::vector<std::string>& messages, Due due,
+                       const std::vector<wire::Request>& messages, Due due,
                        const std::vector<Lines>& expected) {
-        SCOPED_TRACE(messages.back());
         ServiceProcess service(
             {.isInternalBuild = build == "internal",
              .preferences = {{kCaptures,
@@ -72,23 +53,26 @@ protected:
         client.call({.method = Method::setConfiguration,
                      .reporterID = 7,
                      .dictionary = {{"HostApplicationDisplayID", "../com.example/game"}}});
-        const auto isEarly = [&service](const Lines& lines) {
-            return !lines.content.empty() && lines.areThere(service);
+        const auto contentIn = [&](const Lines& lines) {
+            return run("cat " + (service.logs() / lines.files).string() + " 2> /dev/null; true").output;
         };
-        for (const std::string& text : messages) {
+        const auto areThere = [&](const Lines& lines) {
+            return Matches(ContainsRegex(lines.content))(contentIn(lines));
+        };
+        const auto isEarly = [&](const Lines& lines) { return lines.content != kNothing && areThere(lines); };
+        for (const wire::Request& each : messages) {
             EXPECT_TRUE(std::ranges::none_of(expected, isEarly));
-            ASSERT_TRUE(client.call(parsed(text)));
+            ASSERT_TRUE(client.call(each));
         }
         if (due >= Due::withTheStop) {
-            ::usleep(due == Due::withTheEnd ? 350'000 : 0); // for samples of what the processes do
             EXPECT_TRUE(std::ranges::none_of(expected, isEarly));
+            ::usleep(due == Due::withTheEnd ? 350'000 : 0); // for samples of what the processes do
             EXPECT_TRUE(due == Due::withTheStop ? client.stop() : service.stop() == 0);
         }
         for (const Lines& lines : expected) {
-            const auto areThere = [&] { return lines.areThere(service); };
-            EXPECT_TRUE(due == Due::soon ? eventually(areThere) : areThere())
+            EXPECT_TRUE(due == Due::soon ? eventually([&] { return areThere(lines); }) : areThere(lines))
                 << lines.files << "\n"
-                << lines.contentIn(service) << service.errorOutput();
+                << contentIn(lines) << service.errorOutput();
         }
     }
 
@@ -99,22 +83,29 @@ protected:
 };
 
 TEST_F(Sinks, LinesStandInTheFilesWhenTheReplyIsThere) {
-    expect("", 2, {R"(4/8 {"EngineOnTime": 2.5, "EngineState": "EngineOn", "zrreporting_timestamp": 4e9,
-                    "Haptic_Active_Hardware_Time_Seconds": 90})"},
+    expect("", 2,
+           {messageOf(4, 8,
+                      {{"EngineOnTime", 2.5},
+                       {"EngineState", "EngineOn"},
+                       {"zrreporting_timestamp", 4e9},
+                       {"Haptic_Active_Hardware_Time_Seconds", 90}})},
            Due::withTheReply,
            {{"power-events.jsonl",
              "^" + time + R"("subsystem":28,"event":"Korvell_Haptics_EngineOnDuration","payload":)" +
                  R"(\{"ApplicationName":"\.\./com\.example/game","EngineOnDuration":2\.5,)" +
                  R"("TimestampEnd":4000000000\.0\}\})" + "\n.*ClientStatus.*\n.*LeakedHaptics.*\n$"}});
-    expect(
-        "", 2,
-        {R"(4/7 {"issue_type": 3, "node": "n", "rtaid_client": "com", "any_channel_silence_seconds": 2.9})"},
-        Due::withTheReply,
-        {{"diagnostics-metrics.jsonl",
-          "^" + time + R"("metric":5963779,"record":"EAIaATMiAW4qA2NvbQ=="\})" + "\n$"}});
+    expect("", 2,
+           {messageOf(4, 7,
+                      {{"issue_type", 3},
+                       {"node", "n"},
+                       {"rtaid_client", "com"},
+                       {"any_channel_silence_seconds", 2.9}})},
+           Due::withTheReply,
+           {{"diagnostics-metrics.jsonl",
+             "^" + time + R"("metric":5963779,"record":"EAIaATMiAW4qA2NvbQ=="\})" + "\n$"}});
     expect("internal", 2,
-           {R"(14/11 {"tvac_invalid_x": 0, "zrreporting_timestamp": 4000000000.0})",
-            R"(14/11 {"tvac_invalid_x": 6, "zrreporting_timestamp": 4000000005.1})"},
+           {messageOf(14, 11, {{"tvac_invalid_x", 0}, {"zrreporting_timestamp", 4000000000.0}}),
+            messageOf(14, 11, {{"tvac_invalid_x", 6}, {"zrreporting_timestamp", 4000000005.1}})},
            Due::withTheReply,
            {{"bug-report-drafts.jsonl", "^" + time + R"("process":"tamblo_service_","reason":"a Talvix .*)" +
                                             R"("reproducibility":6,.*\}\})" + "\n$"}});
@@ -122,7 +113,7 @@ TEST_F(Sinks, LinesStandInTheFilesWhenTheReplyIsThere) {
 
 TEST_F(Sinks, CapturesFollowAsSoonAsTheyAreGathered) {
     const std::string name = R"("session":"[0-9]{8}T[0-9]{6}\.[0-9]{3}Z-[0-9a-f]{8}")";
-    expect("internal", 13, {R"(4/8 {"System_Sound_Stuck_Time_Seconds": 20})"}, Due::soon,
+    expect("internal", 13, {messageOf(4, 8, {{"System_Sound_Stuck_Time_Seconds", 20}})}, Due::soon,
            {{"bug-captures.jsonl", "^" + time + R"("op":"snapshot",)" + name +
                                        R"(,"signature":\{"domain":"Tonmetry","type":"systemsounds",.*\})" +
                                        "\n$"},
@@ -131,20 +122,19 @@ TEST_F(Sinks, CapturesFollowAsSoonAsTheyAreGathered) {
             {"captures/*/system.txt", "MemTotal:"},
             {"captures/*/process-" + me + ".txt", "== threads\n.*== status\n.*VmRSS:"}});
     expect("internal", 4,
-           {R"(11/7 {"issue_type": "LowRMS"})", R"(11/7 {"issue_type": "LowRMS", "n": 1})",
-            R"(11/7 {"issue_type": "LowRMS", "n": 2})"},
+           {messageOf(11, 7, {{"issue_type", "LowRMS"}}),
+            messageOf(11, 7, {{"issue_type", "LowRMS"}, {"n", 1}}),
+            messageOf(11, 7, {{"issue_type", "LowRMS"}, {"n", 2}})},
            Due::withTheEnd,
            {{"bug-captures.jsonl", R"("op":"start",.*"duration":60\.0,"payload":\{\}\})"
                                    "\n" +
                                        time + R"("op":"cancel",)" + name + "\\}\n$"}});
     const std::string parent = std::to_string(::getppid());
-    expect("", 2, {R"(4/19 {"processIDs": [)" + parent + ", -1]}"}, Due::soon,
+    expect("", 2, {messageOf(4, 19, {{"processIDs", Array{::getppid(), -1}}})}, Due::soon,
            {{"memory-log.jsonl", "^" + time + R"("reporter":7,"processes":\[\{"process":)" + me +
                                      R"(,.*\},\{"process":)" + parent +
                                      R"(,.*"resident":[0-9]{6,}.*"kernel":\{.*"slab":[0-9]{6,})"}});
-    expect("internal", 2,
-           {R"(7/6 {"smallest_buffer_frame_size": 511})", R"(7/6 {"smallest_buffer_frame_size": 512})"},
-           Due::withTheEnd,
+    expect("internal", 2, {messageOf(7, 6, {{"smallest_buffer_frame_size", 512}})}, Due::withTheEnd,
            {{"stack-captures.jsonl",
              "^" + time + R"("requester":"com\.vandra\.tamblo",.*"options":\[1,1,0,0,0\],"stacks":\[)" +
                  R"(\{"process":)" + me + R"(,.*"threads":\[\{"thread":)" + me +
@@ -160,10 +150,11 @@ TEST_F(Sinks, CallQualityIsWrittenByAQueueOfItsOwn) {
                            R"("ContainsRealtimeEvents":true,"HierarchyToken":"[^"]+","SessionID":7\},)"
                            R"("userInfo":\{"ClientName":"com\.vandra\.tamblo",.*)"
                            R"("ServiceName":"apiusage_session","ZRReportingSessionID":7\})");
-    const std::string volume = line("message", R"(,"category":14,"type":65535,"payload":\{.*"volume":3\})");
-    expect("", 12, {R"(14/65535 {"volume": 3})"}, Due::soon, {{"call-quality.jsonl", opened + volume + "$"}});
-    expect("", 12, {R"(14/65535 {"volume": 3})"}, Due::withTheEnd,
-           {{"call-quality.jsonl", volume + line("message", R"(,"category":1,"type":11,.*)") +
+    const wire::Request volume = messageOf(14, 65535, {{"volume", 3}});
+    const std::string sent = line("message", R"(,"category":14,"type":65535,"payload":\{.*"volume":3\})");
+    expect("", 12, {volume}, Due::soon, {{"call-quality.jsonl", opened + sent + "$"}});
+    expect("", 12, {volume}, Due::withTheEnd,
+           {{"call-quality.jsonl", sent + line("message", R"(,"category":1,"type":11,.*)") +
                                        line("message", R"(,"category":65535,"type":65535,.*)") +
                                        line("flush", "") + "$"}});
 }
@@ -174,7 +165,7 @@ TEST_F(Sinks, WithoutABackEndOfCallQualityThereIsNothingToSend) {
         Session client(service.socketPath());
         EXPECT_TRUE(client.stop());
         EXPECT_EQ(service.stop(), 0);
-        EXPECT_EQ(callQualityOf(service)[""], "o");
+        EXPECT_THAT(callQualityOf(service), ElementsAre(Pair(_, "o")));
         EXPECT_EQ(countOf("backends is no array; no back end is found", service.errorOutput()),
                   backEnds == "5" ? 1U : 0U);
     }
@@ -193,28 +184,26 @@ TEST_F(Sinks, OfManySessionsNothingIsLostAtTheEndAndTheyShareFewThreads) {
     client.call(message({{"n", 1}}, {}));
     client.call(message({{"n", 2}}, {}));
     EXPECT_EQ(service.stop(), 0);
-    auto operations = callQualityOf(service);
-    operations.erase("");
-    EXPECT_EQ(operations.size(), kSessions);
-    EXPECT_THAT(operations, testing::Each(testing::Pair(testing::_, "ommmmf")));
+    EXPECT_EQ(callQualityOf(service).size(), kSessions);
+    EXPECT_THAT(callQualityOf(service), Each(Pair(_, "ommmmf")));
     service.start();
     EXPECT_TRUE(Session(service.socketPath()).stop());
     EXPECT_EQ(service.stop(), 0);
-    EXPECT_EQ(callQualityOf(service).size(), 1 + kSessions + 1) << "another run draws other names";
+    EXPECT_EQ(callQualityOf(service).size(), kSessions + 1) << "another run draws other names";
 }
 
 TEST_F(Sinks, WhatASessionLeavesIsThereWhenItsStopIsAnswered) {
-    const std::string playback = R"(4/1 {"level": 0.5})";
-    expect("", 2, {playback, R"(4/1 {"level": 1})"}, Due::withTheStop,
+    const wire::Request playback = messageOf(4, 1, {{"level", 0.5}}), other = messageOf(4, 1, {{"level", 1}});
+    expect("", 2, {playback, other}, Due::withTheStop,
            {{"analytics-events.jsonl",
              R"("event":"com\.vandra\.telephony\.Session_Generic\.Summary",.*"num_messages":2,)"},
-            {reports, ""},
-            {traces, ""}});
-    expect("", 11, {playback, playback, R"(4/1 {"level": 1})"}, Due::withTheStop,
+            {reports, kNothing},
+            {traces, kNothing}});
+    expect("", 11, {playback, playback, other}, Due::withTheStop,
            {{"DiagnosticLogs/Audio/Reporting/[0-9]*-[0-9]*-7-.._com.example_game-test.json",
              "Setup_Start_1.*Playback_Start_2.*Session_Generic_Summary_1"}});
     expect("internal", 2, {playback}, Due::withTheStop, {{reports, "\"Playback_Start_1\""}});
-    expect("internal", 2, {R"(4/1 {"session_output_running": true})"}, Due::withTheEnd,
+    expect("internal", 2, {messageOf(4, 1, {{"session_output_running", true}})}, Due::withTheEnd,
            {{traces, R"("name":"session","pid":)" + me + R"(.*"name":"output","pid":)" + me +
                          R"(,.*"name":"memory .bytes.","pid":)" + me}});
 }

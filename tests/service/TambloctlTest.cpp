@@ -1,5 +1,4 @@
-#include "tests/service/RawClient.h"
-#include "tests/service/ServiceProcess.h"
+#include "tests/service/RealService.h"
 
 #include <gmock/gmock.h>
 #include <nlohmann/json.hpp>
@@ -111,21 +110,21 @@ TEST(Tambloctl, PreferenceIsInForceForTheNextMessage) {
 
 TEST(Tambloctl, ShowsTheSummariesOfTheSessionsItPlays) {
     ServiceProcess service;
-    // Four sessions that stop at about the same time.
+    // Sessions that stop at about the same time.
     std::vector<std::future<CommandResult>> runs;
-    for (const std::string number : {"1", "2", "3", "4"}) {
-        const std::string arguments =
+    for (const std::string reporter : {"1", "2", "3", "4"}) {
+        const std::string command = service.tambloctlCommand(
             "session --json --fast --recorded-spacing --service-type telephony --play " EXAMPLES_DIR
-            "/call.jsonl --reporter " +
-            number + R"( --configuration '{"HostApplicationDisplayID":"application)" + number + R"("}')";
-        runs.push_back(std::async(std::launch::async, run, service.tambloctlCommand(arguments)));
+            "/call.jsonl --configuration '{\"HostApplicationDisplayID\":\"of " +
+            reporter + "\"}' --reporter " + reporter);
+        runs.push_back(std::async(std::launch::async, run, command));
     }
     for (std::size_t i = 0; i < runs.size(); ++i) {
-        const auto report = nlohmann::json::parse(runs[i].get().output);
         std::string kinds;
+        const auto report = nlohmann::json::parse(runs[i].get().output);
         for (const auto& summary : report["summaries"]) {
             kinds += summary["event"].get<std::string>().substr(18, 1);
-            EXPECT_EQ(summary["payload"]["HostApplicationDisplayID"], "application" + std::to_string(i + 1));
+            EXPECT_EQ(summary["payload"]["HostApplicationDisplayID"], "of " + std::to_string(i + 1));
         }
         EXPECT_EQ(kinds, "VVVVSII");
     }

@@ -170,14 +170,14 @@ TEST_F(ServiceTest, PacesAndTracePoints) {
 
 TEST_F(ServiceTest, KillingEndsTheProcessAtOnceWhileThereIsAService) {
     requests.killService();
-    EXPECT_EQ(std::exchange(exitStatus(), 0), 2);
+    EXPECT_EQ(std::exchange(exitStatus, 0), 2);
     service.reset();
     requests.createReportingSession(7, note<bool>("create"));
     requests.sendMessage({}, 1, 1, {7}, note<>("send"));
     requests.killService();
     client->interrupt();
     EXPECT_THAT(answers(), ElementsAre("create true", kRefused));
-    EXPECT_EQ(exitStatus(), 0);
+    EXPECT_EQ(exitStatus, 0);
 }
 
 TEST_F(ServiceTest, TheRegistryFindsWhatAWalkOverTheClientsWould) {

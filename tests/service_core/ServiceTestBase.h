@@ -24,7 +24,7 @@ protected:
 
     explicit ServiceTestBase(bool isInternalBuild = false) : device(LogLevel::debug, isInternalBuild) {
         script.reset();
-        exitStatus() = 0;
+        exitStatus = 0;
         ConnectionListener& listener =
             device.connections.listenerForServiceName("com.vandra.tamblo.reporting");
         listener.setDelegate(*service);
@@ -90,16 +90,13 @@ protected:
         }
         return ids;
     }
-    static int& exitStatus() {
-        static int status = 0;
-        return status;
-    }
+    static inline int exitStatus = 0;
 
     FakePlatform device;
     WorkerScript& script = WorkerScript::current();
     std::vector<std::string> replies;
     std::unique_ptr<ZRReportingService> service =
-        std::make_unique<ZRReportingService>(device.context(), [](int status) { exitStatus() = status; });
+        std::make_unique<ZRReportingService>(device.context(), [](int status) { exitStatus = status; });
 };
 
 } // namespace tamblo

@@ -89,16 +89,9 @@ TEST(Decode, FramesAreShownAsJson) {
 {"frame":"reply","id":4,"error":null,"result":{"b":true}}
 {"frame":"reply","id":0,"error":{"code":-32601,"domain":"d","message":"unknown \"method\""},"result":null}
 )";
-    std::string hex;
-    for (const std::uint8_t byte : out.bytes()) {
-        constexpr std::string_view digits = "0123456789aBcDeF";
-        hex.append({digits[byte >> 4U], digits[byte & 15U], byte == 1 ? '\n' : ' '});
-    }
-    for (const std::string& input : {std::string(out.view()), hex}) {
-        const Decoded decoded = guessed(input);
-        EXPECT_EQ(decoded.text, expected);
-        EXPECT_THAT(decoded.problems, IsEmpty());
-    }
+    const Decoded decoded = guessed(out.view());
+    EXPECT_EQ(decoded.text, expected);
+    EXPECT_THAT(decoded.problems, IsEmpty());
 }
 
 TEST(Decode, FramesThatAreNoneAreNamed) {
@@ -110,7 +103,7 @@ TEST(Decode, FramesThatAreNoneAreNamed) {
         {"0100100080", "its length, 1048577, is beyond the longest, 1048576"},
     };
     for (const auto& [hex, problem] : cases) {
-        const Decoded decoded = guessed("05000000 840103F6F5" + hex); // behind [1, 3, null, true]
+        const Decoded decoded = guessed("05000000 840103f6\nF5" + hex); // behind [1, 3, null, true]
         EXPECT_EQ(decoded.text, "{\"frame\":\"reply\",\"id\":3,\"error\":null,\"result\":true}\n");
         EXPECT_THAT(decoded.problems, ElementsAre("frame 2: " + problem));
     }

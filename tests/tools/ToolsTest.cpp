@@ -42,14 +42,13 @@ TEST(Payload, WordsAndObjectsAreRead) {
 
 TEST(Arguments, OptionsAreTakenApart) {
     const Option options[] = {{"--name", "X", ""}, {"--flag", "", ""}};
-    const std::string_view words[] = {"a", "--name", "1", "--flag", "--name=2=3", "b", "--", "--flag"};
-    const auto parsed = Arguments::parse(options, words);
-    const auto& arguments = std::get<Arguments>(parsed);
-    EXPECT_EQ(arguments.all("--name"), (std::vector<std::string_view>{"1", "2=3"}));
+    using Words = std::vector<std::string_view>;
+    const auto arguments = std::get<Arguments>(
+        Arguments::parse(options, Words{"a", "--name", "1", "--flag", "--name=2=3", "b", "--", "--flag"}));
+    EXPECT_EQ(arguments.all("--name"), (Words{"1", "2=3"}));
     EXPECT_TRUE(arguments.has("--flag"));
-    EXPECT_EQ(arguments.rest(), (std::vector<std::string_view>{"a", "b", "--flag"}));
-    for (const std::vector<std::string_view>& wrong :
-         {std::vector<std::string_view>{"--other"}, {"--name"}, {"--flag=1"}, {"--nam=1"}}) {
+    EXPECT_EQ(arguments.rest(), (Words{"a", "b", "--flag"}));
+    for (const Words& wrong : {Words{"--other"}, {"--name"}, {"--flag=1"}, {"--nam=1"}}) {
         EXPECT_TRUE(std::holds_alternative<std::string>(Arguments::parse(options, wrong))) << wrong[0];
     }
 }
@@ -110,20 +109,18 @@ protected:
         std::istringstream stream(lines);
         auto wrong = player.play(stream, "file");
         report = player.report();
-        requests = service.requests();
+        for (const wire::Request& request : service.requests()) {
+            timestamps.push_back(request.dictionary.find(kTimestampKey)->doubleValue());
+        }
         return wrong;
     }
-    /// Of a message that the service was sent.
-    double timestamp(std::size_t number) {
-        return requests.at(number).dictionary.find(kTimestampKey)->doubleValue();
-    }
+
     const double now =
         std::chrono::duration<double>(std::chrono::system_clock::now().time_since_epoch()).count();
-
     test::FakeService service;
     client::Client client{{.socketPath = service.path(), .threading = client::Client::Threading::caller}};
     SessionPlayer::Report report;
-    std::vector<wire::Request> requests;
+    std::vector<double> timestamps;
 };
 
 TEST_F(SessionPlayerTest, PlaysInTimeAndStampsWhatHasNoTimestamp) {
@@ -134,9 +131,9 @@ TEST_F(SessionPlayerTest, PlaysInTimeAndStampsWhatHasNoTimestamp) {
     EXPECT_TRUE(wrong->starts_with("file:4: ")) << *wrong;
     EXPECT_TRUE(report.sent == 2 && report.answered == 2 && report.refused == 0);
     EXPECT_GE(report.seconds, 0.04);
-    EXPECT_EQ(timestamp(0), 5);
-    EXPECT_NEAR(timestamp(1), now, 5);
-    EXPECT_EQ(requests[1].reporterIDs, std::vector<std::int64_t>{7});
+    EXPECT_EQ(timestamps.at(0), 5);
+    EXPECT_NEAR(timestamps.at(1), now, 5);
+    EXPECT_EQ(service.requests()[1].reporterIDs, std::vector<std::int64_t>{7});
 }
 
 TEST_F(SessionPlayerTest, KeepsTheRecordedTimesAtAnySpeed) {
@@ -145,27 +142,24 @@ TEST_F(SessionPlayerTest, KeepsTheRecordedTimesAtAnySpeed) {
     std::istringstream lines(recorded);
     EXPECT_EQ(recordedLength(lines), 62.0);
     EXPECT_FALSE(play({.speed = {}, .recordedLength = 62}, recorded));
-    EXPECT_NEAR(timestamp(1) - timestamp(0), 60, 1e-3);
-    EXPECT_NEAR(timestamp(1), now, 5);
+    EXPECT_NEAR(timestamps.at(1) - timestamps.at(0), 60, 1e-3);
+    EXPECT_NEAR(timestamps.at(1), now, 5);
 }
 
 TEST(RecordFilter, WantsOneOfTheEventsAndAllOfTheKeys) {
     const Dictionary record{
         {"time", 1}, {"event", "com.vandra.a"}, {"payload", Dictionary{{"n", 5}, {"t", "5"}}}};
-    const struct {
-        std::vector<std::string_view> events;
-        std::vector<std::string_view> keys;
-        bool accepts;
-    } cases[] = {
+    using Words = std::vector<std::string_view>;
+    const std::tuple<Words, Words, bool> cases[] = {
         {{"x", "com.*"}, {}, true},      {{"com.vandra"}, {}, false}, {{"com.vandra.a*"}, {"n"}, true},
         {{}, {"n=5", "t=5"}, true},      {{}, {"n=6"}, false},        {{}, {"n", "missing"}, false},
         {{}, {"n=5.0", "time=1"}, true},
     };
-    for (const auto& row : cases) {
+    for (const auto& [events, keys, accepts] : cases) {
         RecordFilter filter;
-        std::ranges::for_each(row.events, [&](auto event) { filter.wantEvent(event); });
-        std::ranges::for_each(row.keys, [&](auto key) { filter.wantKey(key); });
-        EXPECT_EQ(filter.accepts(record), row.accepts) << (row.keys.empty() ? "" : row.keys[0]);
+        std::ranges::for_each(events, [&](auto event) { filter.wantEvent(event); });
+        std::ranges::for_each(keys, [&](auto key) { filter.wantKey(key); });
+        EXPECT_EQ(filter.accepts(record), accepts) << testing::PrintToString(keys);
     }
     RecordFilter ofReporter;
     ofReporter.wantEvent("7");
@@ -224,10 +218,7 @@ SessionSummary summaryFrom(const std::string& word) {
 }
 
 TEST(SessionSummaries, ThoseOfOneStopAreTakenOut) {
-    const struct {
-        const char* written;
-        std::size_t first, count;
-    } cases[] = {
+    const std::tuple<const char*, std::size_t, std::size_t> cases[] = {
         {"V1 V2 K1 Sa:9 I1", 0, 5},
         {"Sb:9 V1 Sa:9 Sb:9", 1, 2},             // stops without stretches
         {"V1 Sa:9 I1 I2 V1 V2 Sb:9", 0, 4},      // input comes behind the session
@@ -237,31 +228,30 @@ TEST(SessionSummaries, ThoseOfOneStopAreTakenOut) {
         {"V1 V2 V1", 2, 1},                      // the session's own is not in use
         {"", 0, 0},
     };
-    for (const auto& row : cases) {
-        SCOPED_TRACE(row.written);
-        std::istringstream words(row.written);
+    for (const auto& [text, first, count] : cases) {
+        std::istringstream words(text);
         std::vector<SessionSummary> written;
         for (std::string word; words >> word;) {
             written.push_back(summaryFrom(word));
         }
-        const auto found = summariesOf({"a", "haptics", 5}, written);
         EXPECT_TRUE(std::ranges::equal(
-            found, std::span(written).subspan(row.first, row.count),
-            [](const auto& a, const auto& b) { return a.event == b.event && a.payload == b.payload; }));
+            summariesOf({"a", "haptics", 5}, written), std::span(written).subspan(first, count),
+            [](const auto& a, const auto& b) { return a.event == b.event && a.payload == b.payload; }))
+            << text;
     }
     const SessionSummary haptics[] = {summaryFrom("Sa:9"), summaryFrom("Sb:9")};
     EXPECT_EQ(summariesOf({"a", "alarms", 5}, haptics)[0].payload, haptics[1].payload);
 }
 
 TEST(SessionSummaries, TablesHoldWhatFits) {
+    const Dictionary first{{"msgidx", 1},
+                           {"msgcnt", 2},
+                           {"inputrunning_seconds", 7.9599},
+                           {"inputrunning_secondsBucketed", "10"},
+                           {"active_devices", "Übertrager \x1b[31m und nöch mehr davon"},
+                           {"vocoders", "EVS:32000"}};
     const SessionSummary summaries[] = {
-        {"com.vandra.tamblo.Input.Summary",
-         {{"msgidx", 1},
-          {"msgcnt", 2},
-          {"inputrunning_seconds", 7.9599},
-          {"inputrunning_secondsBucketed", "10"},
-          {"active_devices", "Übertrager \x1b[31m und nöch mehr davon"},
-          {"vocoders", "EVS:32000"}}},
+        {"com.vandra.tamblo.Input.Summary", first},
         {"com.vandra.tamblo.Input.Summary",
          {{"msgidx", 2}, {"msgcnt", 2}, {"inputrunning_seconds", "odd"}, {"active_devices", 5}}},
         {"com.vandra.tamblo.Session_Generic.Summary",
