@@ -37,8 +37,7 @@ inline void writeFile(const std::filesystem::path& path, std::string_view text,
 }
 
 [[nodiscard]] inline std::ptrdiff_t entriesOf(const std::filesystem::path& directory) {
-    using Entries = std::filesystem::directory_iterator;
-    return std::distance(Entries(directory), Entries());
+    return std::distance(std::filesystem::directory_iterator(directory), {});
 }
 
 } // namespace tamblo::test
@@ -48,13 +47,11 @@ namespace tamblo {
 /// A directory that goes away with its owner.
 class TemporaryDirectory {
 public:
-    explicit TemporaryDirectory(
-        const std::filesystem::path& parent = std::filesystem::temp_directory_path()) {
-        std::string pattern = (parent / "tamblo-test-XXXXXX").string();
-        if (::mkdtemp(pattern.data()) == nullptr) {
+    explicit TemporaryDirectory(const std::filesystem::path& parent = std::filesystem::temp_directory_path())
+        : path_(parent / "tamblo-test-XXXXXX") {
+        if (::mkdtemp(path_.data()) == nullptr) {
             throw std::runtime_error("no temporary directory");
         }
-        path_ = pattern;
     }
     ~TemporaryDirectory() {
         std::error_code ignored;
@@ -67,7 +64,6 @@ public:
         return name.empty() ? path_ : path_ + "/" + name;
     }
     void write(const std::string& name, std::string_view text) const { test::writeFile(path(name), text); }
-    /// Nothing and an empty file read the same.
     [[nodiscard]] std::string read(const std::string& name) const { return test::contentOf(path(name)); }
 
 private:

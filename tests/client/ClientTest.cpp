@@ -43,38 +43,6 @@ protected:
 INSTANTIATE_TEST_SUITE_P(, ClientInBothModes,
                          ::testing::Values(Client::Threading::background, Client::Threading::caller));
 
-TEST_P(ClientInBothModes, AllRequestsReachTheServiceAndTheirRepliesComeBackTyped) {
-    Client client(options());
-    const std::int64_t reporters[] = {7, -8};
-    std::future<Result<bool>> booleans[] = {
-        client.createReportingSession(7),
-        client.setServiceType(ServiceType::longFormAudio, 7),
-        client.setConfiguration({{"HostApplicationDisplayID", "com.example.music"}}, 7),
-        client.stopReportingSessionForID(7),
-        client.destroyReportingSession(-8),
-    };
-    auto sent = client.sendMessage({{"volume", 0.5F}}, kVolume, EventType::start, reporters);
-    auto type = client.getServiceNameForReporterID(7);
-    auto state = client.reporterID(7);
-    auto all = client.getAllReporters();
-    ASSERT_TRUE(client.wait(all, 5s));
-    for (auto& boolean : booleans) {
-        const Result<bool> result = boolean.get();
-        EXPECT_TRUE(result.ok() && result.value);
-    }
-    EXPECT_TRUE(sent.get().ok());
-    EXPECT_EQ(type.get().value, ServiceType::longFormAudio);
-    EXPECT_EQ(state.get().value, (Dictionary{{"reporterID", 7}}));
-    EXPECT_EQ(all.get().value, (std::vector<std::int64_t>{7, -8}));
-
-    const auto requests = service.requests();
-    ASSERT_EQ(requests.size(), 9U);
-    EXPECT_EQ(requests[1].serviceType, 7);
-    EXPECT_EQ(requests[2].dictionary, (Dictionary{{"HostApplicationDisplayID", "com.example.music"}}));
-    EXPECT_EQ(requests[4].reporterID, -8);
-    EXPECT_EQ(requests[5].reporterIDs, (std::vector<std::int64_t>{7, -8}));
-}
-
 TEST_P(ClientInBothModes, PendingRequestsFailWhenTheServiceGoesAndSessionsAreRemadeBeforeWhatWaits) {
     std::string trace;
     Client* sender = nullptr;
@@ -118,7 +86,6 @@ TEST_P(ClientInBothModes, AFullQueueRefusesAndCountsWithoutBlocking) {
             client.run(0ms);
         }
     }
-    EXPECT_GE(accepted, 8U);
     EXPECT_EQ(client.refusedMessages(), 1000 - accepted);
     EXPECT_GT(client.refusedMessages(), 500U);
     std::future<Result<Nothing>> refused;
@@ -188,8 +155,11 @@ TEST(Client, SecondRepliesAreDroppedUnlessAskedForAndStrangeOnesHarmNothing) {
     client.getServiceNameForReporterID(
         0, [&](auto&& reply) { every += reply.ok() ? 1 : 100; }, Replies::every);
     auto held = client.startReportingSessionForID(7);
-    auto last = client.reporterID(1);
-    ASSERT_TRUE(client.wait(last, 5s));
+    auto state = client.reporterID(1);
+    auto all = client.getAllReporters();
+    ASSERT_TRUE(client.wait(all, 5s));
+    EXPECT_EQ(state.get().value, (Dictionary{{"reporterID", 1}}));
+    EXPECT_EQ(all.get().value, (std::vector<std::int64_t>{7, -8}));
     EXPECT_EQ(every, 2);
     service.stop();
     EXPECT_EQ(codeOf(client, std::move(held)), ErrorCode::connectionLost);
@@ -296,9 +266,11 @@ TEST(CApi, ACProgramRunsASessionAndItsPayloadArrivesAsItWasBuilt) {
         {"string", "text"}, {"int", -5},    {"uint", ~std::uint64_t{0}}, {"double", 0.1},
         {"float", 0.5F},    {"bool", true}, {"date", Value::date(1.5)},  {"data", Value::data(bytes)}};
     const auto requests = service.requests();
-    EXPECT_EQ(requests[5].dictionary, expected);
+    EXPECT_EQ(requests[2].serviceType, 7);
+    EXPECT_EQ(requests[3].dictionary, expected);
     EXPECT_EQ(requests[5].dictionary.find("float")->kind(), Value::Kind::singleFloat);
     EXPECT_EQ(requests[5].category, 0x08000004U);
+    EXPECT_EQ(requests[5].reporterIDs, std::vector<std::int64_t>{7});
     EXPECT_TRUE(requests[6].reporterIDs.empty());
     EXPECT_FALSE(requests[6].id);
 }
@@ -307,7 +279,6 @@ TEST(Vocabulary, NamesAndNumbersAreReadAndWritten) {
     const std::pair<std::string_view, EventCategory> named[] = {
         {"Volume", kVolume},
         {"Session_Playback", category(Subsystem::session, EventKind::playback)},
-        {"Toolbox_Wirrels", category(Subsystem::toolbox, EventKind::wirrels)},
         {"Unknown", EventCategory::unknown}};
     for (const auto& [name, value] : named) {
         EXPECT_EQ(parseCategory(name), value) << name;
@@ -321,10 +292,8 @@ TEST(Vocabulary, NamesAndNumbersAreReadAndWritten) {
     for (const std::uint32_t unnamed : {0U, 18U, 0x08000000U, 0x08000012U, 0x0C000001U, 0xFFFFFFFEU}) {
         EXPECT_EQ(categoryName(EventCategory{unnamed}), "") << unnamed;
     }
-    EXPECT_EQ(parseType("MemoryLog"), EventType::memoryLog);
     EXPECT_EQ(parseType("65535"), parseType("Unknown"));
     EXPECT_FALSE(parseType("65536"));
-    EXPECT_EQ(parseServiceType("systemsounds"), ServiceType::systemSounds);
 }
 
 } // namespace

@@ -17,8 +17,7 @@
 
 namespace tamblo::test {
 
-/// Answers one client at a time on a thread of its own, as a test tells it to: in full, not at all, twice. It
-/// can go away and come back at the same path.
+/// Answers one client at a time, on a thread of its own. It can go away and come back at the same path.
 class FakeService {
 public:
     /// Appends the frames that answer a request. Runs on the service's thread.

@@ -251,6 +251,10 @@ public:
         return true;
     }
 
+    [[nodiscard]] bool isReadable(int milliseconds) const {
+        pollfd descriptor{.fd = socket_, .events = POLLIN, .revents = 0};
+        return ::poll(&descriptor, 1, milliseconds) == 1;
+    }
     /// The next reply, waiting at most some seconds; nothing at the end of the connection.
     std::optional<wire::Reply> receive() {
         for (;;) {
@@ -286,8 +290,6 @@ public:
         return call(request(method, reporterID));
     }
 
-    /// Whether no reply arrives within a short while.
-    [[nodiscard]] bool staysSilent() const { return received_.empty() && !isReadable(50); }
     /// Whether the service has closed the connection; takes what still arrives before that.
     [[nodiscard]] bool isClosedByService() {
         receiveAll();
@@ -295,11 +297,6 @@ public:
     }
 
 private:
-    [[nodiscard]] bool isReadable(int milliseconds) const {
-        pollfd descriptor{.fd = socket_, .events = POLLIN, .revents = 0};
-        return ::poll(&descriptor, 1, milliseconds) == 1;
-    }
-
     int socket_ = -1;
     std::uint64_t nextID_ = 1;
     std::vector<std::uint8_t> received_;

@@ -44,8 +44,6 @@ TEST(Service, MessageOfAStartedSessionBecomesTwoEvents) {
                                   R"("audiotag":"Session_PlaybackStart","level":0.25,"route_name":"Speaker",)"
                                   R"("zrreporting_timestamp":4000000000.0}})"),
               1U);
-    EXPECT_EQ(service.countEvents("Session_Playback.Start"), 2U);
-
     // The stop answers the held start first.
     const auto held = client.call(Method::stopReportingSessionForID, 7);
     EXPECT_EQ(held->id, 77U);
@@ -227,30 +225,20 @@ TEST(Service, OfTwoThatStartAtOnceOneServes) {
     EXPECT_EQ(one.stop().value() + other.stop().value(), 1);
 }
 
-TEST(Service, APreferenceOutlivesTheServiceUnlessThereIsNoRoomForIt) {
-    constexpr rlim_t kRoom = 4096;
-    const std::string preferences =
-        R"({"TalvixInvalidXyBackOffSeconds":3600,"other":[")" + std::string(kRoom, 'x') + "\"]}\n";
-    ServiceProcess service({.isInternalBuild = true, .preferences = {{kCaptures, preferences}}});
-    const auto file = service.preferenceFile(kCaptures);
-    /// How many drafts there are after five seconds of a fault and the service's end.
-    const auto drafts = [&service] {
+TEST(Service, APreferenceThatItStoresOutlivesIt) {
+    ServiceProcess service({.isInternalBuild = true,
+                            .preferences = {{kCaptures, R"({"TalvixInvalidXyBackOffSeconds": 3600})"}}});
+    for (int run = 0; run < 2; ++run) {
         Session client(service.socketPath());
+        // Five seconds of a fault are drafted, unless they have been in this or the last hour.
         for (const double offset : {0.0, 5.1}) {
             client.call(
                 message({{"tvac_invalid_x", offset}, {"zrreporting_timestamp", 4e9 + offset}}, {7}, 14, 11));
         }
         service.stop(); // which waits for what is still to be stored
-        return linesOf(service.logs() / "bug-report-drafts.jsonl").size();
-    };
-    service.limit(RLIMIT_FSIZE, kRoom);
-    EXPECT_EQ(drafts(), 1U);
-    EXPECT_EQ(contentOf(file), preferences);
-    for (int run = 0; run < 2; ++run) {
+        EXPECT_EQ(linesOf(service.logs() / "bug-report-drafts.jsonl").size(), 1U);
         service.start();
-        EXPECT_EQ(drafts(), 2U) << "the time of a draft is the device's";
     }
-    EXPECT_EQ(entriesOf(file.parent_path()), 1) << "nothing is left over";
 }
 
 TEST(Service, SleepsWhenThereIsNothingToDo) {

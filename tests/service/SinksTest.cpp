@@ -150,25 +150,17 @@ TEST_F(Sinks, CallQualityIsWrittenByAQueueOfItsOwn) {
                            R"("ContainsRealtimeEvents":true,"HierarchyToken":"[^"]+","SessionID":7\},)"
                            R"("userInfo":\{"ClientName":"com\.vandra\.tamblo",.*)"
                            R"("ServiceName":"apiusage_session","ZRReportingSessionID":7\})");
-    const wire::Request volume = messageOf(14, 65535, {{"volume", 3}});
-    const std::string sent = line("message", R"(,"category":14,"type":65535,"payload":\{.*"volume":3\})");
-    expect("", 12, {volume}, Due::soon, {{"call-quality.jsonl", opened + sent + "$"}});
-    expect("", 12, {volume}, Due::withTheEnd,
-           {{"call-quality.jsonl", sent + line("message", R"(,"category":1,"type":11,.*)") +
-                                       line("message", R"(,"category":65535,"type":65535,.*)") +
-                                       line("flush", "") + "$"}});
+    expect("", 12, {messageOf(14, 65535, {{"volume", 3}})}, Due::soon,
+           {{"call-quality.jsonl",
+             opened + line("message", R"(,"category":14,"type":65535,"payload":\{.*"volume":3\})") + "$"}});
 }
 
 TEST_F(Sinks, WithoutABackEndOfCallQualityThereIsNothingToSend) {
-    for (const std::string backEnds : {"[]", "5"}) {
-        ServiceProcess service({.preferences = {{kCallQuality, "{\"backends\": " + backEnds + "}"}}});
-        Session client(service.socketPath());
-        EXPECT_TRUE(client.stop());
-        EXPECT_EQ(service.stop(), 0);
-        EXPECT_THAT(callQualityOf(service), ElementsAre(Pair(_, "o")));
-        EXPECT_EQ(countOf("backends is no array; no back end is found", service.errorOutput()),
-                  backEnds == "5" ? 1U : 0U);
-    }
+    ServiceProcess service({.preferences = {{kCallQuality, R"({"backends": 5})"}}});
+    EXPECT_TRUE(Session(service.socketPath()).stop());
+    EXPECT_EQ(service.stop(), 0);
+    EXPECT_THAT(callQualityOf(service), ElementsAre(Pair(_, "o")));
+    EXPECT_EQ(countOf("backends is no array; no back end is found", service.errorOutput()), 1U);
 }
 
 TEST_F(Sinks, OfManySessionsNothingIsLostAtTheEndAndTheyShareFewThreads) {
@@ -210,13 +202,11 @@ TEST_F(Sinks, WhatASessionLeavesIsThereWhenItsStopIsAnswered) {
 
 TEST_F(Sinks, ASessionIsToldWhatItsTimeHasAddedToTheDrivers) {
     ServiceProcess service;
-    const std::filesystem::path file = service.runtimeDirectory() + "/chanlog/haptics.json";
     const auto publish = [&](const std::string& count) {
-        writeFile(file.string() + ".new",
+        writeFile(service.runtimeDirectory() + "/chanlog/haptics.json",
                   R"([{"driver": "Haptic_Engine<0>", "group": "Haptics", "subgroup": "Stats", )"
                   R"("name": "buffers played", "format": "simple", "value": )" +
                       count + "}]");
-        std::filesystem::rename(file.string() + ".new", file);
     };
     publish("10");
     Session client(service.socketPath());

@@ -75,23 +75,19 @@ TEST_F(InternalBuildTest, OfATestSessionItIsAnsweredAtOnceAndPayloadsForAllAreMa
 }
 
 TEST_F(ServiceTest, AReplyHeldByASessionThatGoesIsNeverAnswered) {
-    const struct {
-        const char* what;
-        std::function<void()> end;
-        std::size_t stops;
-    } endings[] = {
-        {"destroyed", [&] { requests.destroyReportingSession(7, {}); }, 1},
-        {"replaced", [&] { requests.createReportingSession(7, {}); }, 0},
-        {"changed", [&] { requests.setServiceType(3, 7, {}); }, 0},
-        {"left", [&] { client->interrupt(); }, 1},
+    const std::pair<std::function<void()>, std::size_t> endings[] = {
+        {[&] { requests.destroyReportingSession(7, {}); }, 1},
+        {[&] { requests.createReportingSession(7, {}); }, 0},
+        {[&] { requests.setServiceType(3, 7, {}); }, 0},
+        {[&] { client->interrupt(); }, 1},
     };
-    for (const auto& ending : endings) {
+    for (const auto& [end, stops] : endings) {
         requests.createReportingSession(7, {});
         requests.startReportingSessionForID(7, note<bool>("start"));
         (void)run();
-        ending.end();
-        EXPECT_THAT(answers(), IsEmpty()) << ending.what;
-        EXPECT_EQ(script.count("stop Init"), ending.stops) << ending.what;
+        end();
+        EXPECT_THAT(answers(), IsEmpty());
+        EXPECT_EQ(script.count("stop Init"), stops);
         (void)script.take();
     }
 }
@@ -246,12 +242,11 @@ TEST_F(ServiceTest, TheSingleMessageSessionLivesUntilItIsIdleForMoreThanFiveSeco
     EXPECT_EQ(session->description(),
               "reporterID=1,serviceName=standalone,ownerPid=4321,clientProcessName=(null),"
               "HostApplicationDisplayID=Unknown,started=1,singleMessageSession=1");
-    EXPECT_EQ(session->messages().back()->payload().find("a")->integerValue(), 1);
     EXPECT_EQ(find(1), nullptr) << "it cannot be had by its ID";
 
     device.clock.advance(milliseconds(4000));
     send(client, {});
-    EXPECT_EQ(service->singleMessageSession(), session);
+    EXPECT_EQ(session->messages().back()->payload().find("a")->integerValue(), 1);
     device.clock.advance(milliseconds(5000));
     device.clock.set(device.clock.now() - std::chrono::hours(24)); // it is the steady time that counts
     (void)device.serverQueue().takePaces();
@@ -286,8 +281,6 @@ TEST_F(ServiceTest, ALostClientIsRemovedAndItsUptimeReportedOnce) {
     (void)run();
     EXPECT_THAT(service->getAllClients(), IsEmpty());
     EXPECT_EQ(script.count("stop Init"), 1U) << "only what was started is stopped";
-    EXPECT_EQ(find(8), nullptr);
-
     const Connection fromTheFuture = connect(12);
     device.clock.advance(milliseconds(-1500));
     fromTheFuture->invalidate();

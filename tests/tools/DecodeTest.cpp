@@ -89,9 +89,8 @@ TEST(Decode, FramesAreShownAsJson) {
 {"frame":"reply","id":4,"error":null,"result":{"b":true}}
 {"frame":"reply","id":0,"error":{"code":-32601,"domain":"d","message":"unknown \"method\""},"result":null}
 )";
-    const Decoded decoded = guessed(out.view());
-    EXPECT_EQ(decoded.text, expected);
-    EXPECT_THAT(decoded.problems, IsEmpty());
+    EXPECT_EQ(guessed(out.view()).text, expected);
+    EXPECT_THAT(guessed(out.view()).problems, IsEmpty());
 }
 
 TEST(Decode, FramesThatAreNoneAreNamed) {
