@@ -183,6 +183,7 @@ TEST(SinkFollower, ReadsWholeLinesThroughRotationsAndTornEnds) {
     EXPECT_EQ(read(), "");
     append("7\n");
     EXPECT_EQ(read(), "7 ");
+    EXPECT_EQ(sinkPath("/logs", path), path);
 }
 
 /// "V2" is the second output stretch, "Smusic:9" the summary of a session of that application with 9
