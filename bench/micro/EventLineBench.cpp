@@ -50,8 +50,7 @@ void eventsIntoFile(benchmark::State& state) {
     const TemporaryDirectory directory;
     const LinuxClock clock;
     LinuxStructuredLog log;
-    LinuxWorkQueues workQueues;
-    const LinuxPreferences preferences(directory.path(), workQueues, log);
+    const LinuxPreferences preferences(directory.path(), log);
     SinkFiles sinks(directory.path(), log);
     LinuxAnalyticsEventService events(sinks, clock, preferences, log);
     std::size_t i = 0;

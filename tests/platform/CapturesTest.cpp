@@ -329,7 +329,7 @@ TEST_F(StackCaptureTest, ThoseBeyondTheFourThatWaitAreDroppedAndCounted) {
     EXPECT_THAT(log.take(), IsEmpty());
     capture();
     capture();
-    EXPECT_THAT(log.take(), ElementsAre("3 zrrp 4 stack captures wait; further ones are dropped"));
+    EXPECT_THAT(log.take(), ElementsAre("3 zrrl 4 stack captures wait; further ones are dropped"));
     EXPECT_EQ(run(), 4U);
     EXPECT_THAT(log.take(), ElementsAre("3 zrrl no stack captures wait any more; 2 were dropped"));
     capture();

@@ -5,7 +5,7 @@
 #include "tests/fakes/FakeWorkQueues.h"
 #include "tests/platform/LinuxServiceSupport.h"
 
-#include <sys/stat.h>
+#include <sys/file.h>
 
 namespace tamblo {
 namespace {
@@ -63,16 +63,12 @@ protected:
         takeInChange();
         return value();
     }
-    void set(std::string_view key, int value, Work afterwards = {}) {
-        preferences_.setPreferenceValue(key, "d", value, std::move(afterwards));
-    }
-    std::size_t store() { return queues_.run("com.vandra.tamblo.preferences"); }
+    void set(std::string_view key, int value) { preferences_.setPreferenceValue(key, "d", value); }
 
     TemporaryDirectory directory_;
     const std::string path_ = directory_.path("preferences");
     FakeLog log_;
-    FakeWorkQueues queues_;
-    LinuxPreferences preferences_{path_, queues_, log_};
+    LinuxPreferences preferences_{path_, log_};
 };
 
 TEST_F(LinuxPreferencesTest, FollowTheFiles) {
@@ -97,43 +93,37 @@ TEST_F(LinuxPreferencesTest, FollowTheFiles) {
     EXPECT_EQ(preferences_.generation(), before) << "no preference";
 }
 
-TEST_F(LinuxPreferencesTest, AValueIsInForceAtOnceAndStoredBesideTheOthers) {
+TEST_F(LinuxPreferencesTest, AValueIsStoredBesideTheOthersWhenItIsSet) {
     write(R"({"a":[1], "k":1})");
     EXPECT_EQ(valueAfterChange(), 1);
     const std::uint64_t before = preferences_.generation();
-    std::string storedThen;
-    set("k", 2, [&] { storedThen = content(); });
-    set("l", 3);
-    EXPECT_EQ(value(), 2);
+    set("k", 2);
     EXPECT_NE(preferences_.generation(), before);
-    EXPECT_EQ(content(), R"({"a":[1], "k":1})") << "nobody has waited for the disk";
-    write(R"({"a":[1], "k":9, "m":4})");
-    EXPECT_EQ(valueAfterChange(), 2) << "is still to be stored";
-    EXPECT_EQ(store(), 2U) << "both values with one piece, and what was to come afterwards";
-    EXPECT_EQ(content(), "{\"a\":[1],\"k\":2,\"l\":3,\"m\":4}\n");
-    EXPECT_EQ(storedThen, content());
     EXPECT_EQ(value(), 2);
-    EXPECT_EQ(value("m"), 4);
+    set("l", 3);
+    EXPECT_EQ(content(), "{\"a\":[1],\"k\":2,\"l\":3}\n");
     write(R"({"k": 5})");
     EXPECT_EQ(valueAfterChange(), 5);
 }
 
 TEST_F(LinuxPreferencesTest, WhatCannotBeStoredIsToldOnceAndInForceUntilTheFileChanges) {
-    write("{oops}");
-    takeInChange();
-    for (const int number : {7, 8}) {
-        set("k", number);
-        store();
-        EXPECT_EQ(value(), number);
+    const auto locked = lockDirectory(path_, {});
+    for (const char* const fault : {"another program has it locked", "d.json: line 1"}) {
+        for (const int number : {7, 8}) {
+            set("k", number);
+            EXPECT_EQ(value(), number);
+        }
+        EXPECT_THAT(log_.take(),
+                    ElementsAre(AllOf(HasSubstr(fault), HasSubstr("forgotten when the service ends"))));
+        write("{oops}");
+        takeInChange();
+        ::flock(locked.get(), LOCK_UN);
     }
     EXPECT_EQ(content(), "{oops}");
-    EXPECT_THAT(log_.take(),
-                ElementsAre(AllOf(HasSubstr("d.json: "), HasSubstr("forgotten when the service ends"))));
     write(R"({"k": 1})");
     EXPECT_EQ(valueAfterChange(), 1);
     set("k", 2);
-    store();
-    EXPECT_EQ(valueAfterChange(), 2);
+    EXPECT_EQ(value(), 2);
     EXPECT_THAT(log_.take(), IsEmpty());
 }
 

@@ -256,14 +256,12 @@ TEST_F(AppendOnlyFileTest, KeepsLinesWholeWhenThreadsAppendAndFilesRotate) {
 class LinuxAnalyticsEventServiceTest : public Test {
 protected:
     void useEvents(const Value& patterns) {
-        preferences_.setPreferenceValue("events_in_use", "com.vandra.tamblo.analytics", patterns, {});
-        queues_.workOff();
+        preferences_.setPreferenceValue("events_in_use", "com.vandra.tamblo.analytics", patterns);
     }
 
     TemporaryDirectory directory_;
     FakeLog log_;
-    FakeWorkQueues queues_;
-    LinuxPreferences preferences_{directory_.path(), queues_, log_};
+    LinuxPreferences preferences_{directory_.path(), log_};
     FakeClock clock_;
     SinkFiles sinks_{directory_.path(), log_};
     LinuxAnalyticsEventService events_{sinks_, clock_, preferences_, log_};
@@ -291,8 +289,7 @@ TEST_F(LinuxAnalyticsEventServiceTest, AnswersWhichEventsAreInUse) {
             }
         }
     }
-    preferences_.setPreferenceValue("k", "d", 1, {}); // no news of these
-    queues_.workOff();
+    preferences_.setPreferenceValue("k", "d", 1); // no news of these
     EXPECT_TRUE(events_.isEventInUse("1x"));
     EXPECT_THAT(log_.take(), ElementsAre(HasSubstr("analytics.json: events_in_use is no array"),
                                          HasSubstr("analytics.json: events_in_use holds what is no name")));

@@ -235,7 +235,8 @@ TEST(Service, APreferenceThatItStoresOutlivesIt) {
             client.call(
                 message({{"tvac_invalid_x", offset}, {"zrreporting_timestamp", 4e9 + offset}}, {7}, 14, 11));
         }
-        service.stop(); // which waits for what is still to be stored
+        service.signal(SIGKILL);
+        (void)service.awaitEnd();
         EXPECT_EQ(linesOf(service.logs() / "bug-report-drafts.jsonl").size(), 1U);
         service.start();
     }
