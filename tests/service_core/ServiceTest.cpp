@@ -107,7 +107,7 @@ TEST_F(ServiceTest, AChangeOfServiceTypeMakesAFreshSessionOfTheSameClient) {
     EXPECT_EQ(after->description(), "reporterID=7,serviceName=telephony,ownerPid=10,clientProcessName=app10,"
                                     "HostApplicationDisplayID=com.app,started=0,singleMessageSession=0");
     EXPECT_THAT(after->messages(), IsEmpty());
-    EXPECT_EQ(after->previousValues().find("volume")->integerValue(), 3);
+    EXPECT_EQ(shown(after->previousValues(), {"volume"}), "3");
     EXPECT_THAT(service->getAllActiveReportingSessions(), IsEmpty());
 }
 
