@@ -44,16 +44,17 @@ int makeDirectories(const std::string& path, mode_t mode, std::string_view root)
     return parentFailure != 0 ? parentFailure : makeDirectory(path, mode);
 }
 
-FileDescriptor lockDirectory(const std::string& path, std::chrono::milliseconds patience) {
-    const auto until = std::chrono::steady_clock::now() + patience;
+FileDescriptor lockDirectory(const std::string& path, std::optional<std::chrono::milliseconds> patience) {
+    const auto begin = std::chrono::steady_clock::now();
     FileDescriptor directory(::open(path.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
-    while (directory.isOpen() && ::flock(directory.get(), LOCK_EX | LOCK_NB) != 0) {
+    while (directory.isOpen() && ::flock(directory.get(), patience ? LOCK_EX | LOCK_NB : LOCK_EX) != 0) {
         const int failure = errno;
-        if (failure != EINTR && (failure != EWOULDBLOCK || std::chrono::steady_clock::now() >= until)) {
+        const bool isTaken = failure == EWOULDBLOCK && std::chrono::steady_clock::now() < begin + *patience;
+        if (isTaken) {
+            std::this_thread::sleep_for(kLockRetry);
+        } else if (failure != EINTR) {
             directory.reset();
             errno = failure;
-        } else {
-            std::this_thread::sleep_for(kLockRetry);
         }
     }
     return directory;

@@ -4,6 +4,7 @@
 
 #include <chrono>
 #include <cstddef>
+#include <optional>
 #include <string>
 #include <string_view>
 #include <vector>
@@ -18,10 +19,12 @@ namespace tamblo {
 /// Makes a directory and those on the way to it, up to `root`, which has to be there.
 [[nodiscard]] int makeDirectories(const std::string& path, mode_t mode = S_IRWXU, std::string_view root = {});
 
-/// Takes a directory's advisory lock (`flock`), waiting at most this long for whoever has it: it lasts as
-/// long as the descriptor. Not open, with the reason in `errno`, when it cannot be had; `EWOULDBLOCK` while
-/// another has it.
-[[nodiscard]] FileDescriptor lockDirectory(const std::string& path, std::chrono::milliseconds patience);
+/// Takes a directory's advisory lock (`flock`), waiting for whoever has it, at most so long if that is said:
+/// it lasts as long as the descriptor. Not open, with the reason in `errno`, when it cannot be had;
+/// `EWOULDBLOCK` when the wait was too long. A wait without limit is the fairer one: the kernel has those who
+/// wait take turns.
+[[nodiscard]] FileDescriptor lockDirectory(const std::string& path,
+                                           std::optional<std::chrono::milliseconds> patience = {});
 
 /// The names of a directory's entries at this moment, without "." and ".." and in no order, or why they
 /// cannot be had.

@@ -49,8 +49,9 @@ std::variant<Dictionary, std::string> PreferenceFile::read() const {
     return value.dictionaryValue();
 }
 
-std::optional<std::string> PreferenceFile::edit(const std::function<bool(Dictionary&)>& change) const {
-    const FileDescriptor lock = lockDirectory(directory_, kLockPatience);
+std::optional<std::string> PreferenceFile::edit(const std::function<bool(Dictionary&)>& change,
+                                                std::optional<std::chrono::milliseconds> patience) const {
+    const FileDescriptor lock = lockDirectory(directory_, patience);
     if (!lock.isOpen()) {
         return errno == EWOULDBLOCK ? formatted("{}: another program has it locked", directory_)
                                     : systemFault(directory_, errno);

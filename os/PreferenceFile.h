@@ -18,15 +18,12 @@ namespace tamblo {
 ///
 /// Whoever changes such a file holds the advisory lock (`flock`) of the directory from before the file is
 /// read until it has been replaced, so that no change is lost; `flock DIRECTORY COMMAND` does so for a
-/// script. Who only reads needs no lock. Any thread; editing waits for the lock, for a second at most, and
-/// for the disk.
+/// script. Who only reads needs no lock. Any thread; editing waits for the lock, and for the disk.
 class PreferenceFile {
 public:
     /// Bytes; larger files are refused.
     static constexpr std::size_t kMaximumSize = 4U << 20U;
     static constexpr std::string_view kSuffix = ".json";
-    /// An edit takes milliseconds: who has the lock for longer is not waited for.
-    static constexpr std::chrono::milliseconds kLockPatience{1000};
 
     /// Nothing for a domain whose name is not the name of a file in the directory and of nothing else.
     [[nodiscard]] static std::optional<PreferenceFile> of(std::string directory, std::string_view domain);
@@ -38,7 +35,10 @@ public:
     /// by what it left: in one step, keeping mode and owner, and on the disk when this returns. Answers what
     /// went wrong, or nothing. A file that cannot be read as an object is somebody's mistake and is left as
     /// it is; so is one that cannot be replaced, or could not be read again.
-    [[nodiscard]] std::optional<std::string> edit(const std::function<bool(Dictionary&)>& change) const;
+    /// The lock is waited for without limit, unless one is given.
+    [[nodiscard]] std::optional<std::string>
+    edit(const std::function<bool(Dictionary&)>& change,
+         std::optional<std::chrono::milliseconds> patience = {}) const;
 
 private:
     PreferenceFile(std::string directory, std::string path)

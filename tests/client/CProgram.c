@@ -51,7 +51,7 @@ int runCProgram(const char* socket_path) {
     Seen seen = {0};
     tamblo_options options = {.socket_path = socket_path};
     tamblo_client* client = tamblo_client_create(&options); /* with a thread of its own */
-    if (!tamblo_client_create_session(client, 7, NULL, NULL))
+    if (!tamblo_client_create_session(client, 7, NULL, NULL) || !tamblo_client_flush(client, 5000))
         return __LINE__;
     tamblo_client_destroy(client);
 

@@ -90,7 +90,6 @@ public:
     void setMayBlock(bool mayBlockNow) override { mayBlock = mayBlockNow; }
     void suspend() override { strand_->setSuspended(true); }
     void resume() override { strand_->setSuspended(false); }
-    std::string_view label() const noexcept override { return strand_->label; }
 
     std::size_t runAll() { return strand_->runAll(); }
     bool runOne() { return strand_->runOne(); }

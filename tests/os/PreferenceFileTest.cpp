@@ -7,6 +7,7 @@
 #include <csignal>
 #include <thread>
 
+#include <sys/resource.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -85,6 +86,31 @@ TEST_F(PreferenceFileTest, AKillLeavesTheOldOrTheNewAndNoLock) {
         EXPECT_GE(keys(), 50U) << round;
         EXPECT_EQ(setKeys(file_, "k", 1), 0) << round;
     }
+}
+
+TEST_F(PreferenceFileTest, WhatCannotBeWrittenOrReadAgainLeavesTheOldFileAndNothingElse) {
+    ASSERT_EQ(setKeys(file_, "k", 1), 0);
+    const std::string before = directory_.read("d.json");
+    Value deep = 1;
+    for (int i = 0; i < 40; ++i) {
+        deep = Array{deep};
+    }
+    rlimit limit{};
+    ::getrlimit(RLIMIT_FSIZE, &limit);
+    const rlimit small{4096, limit.rlim_max};
+    const auto handler = std::signal(SIGXFSZ, SIG_IGN);
+    ::setrlimit(RLIMIT_FSIZE, &small);
+    for (const Value& value : {Value(std::string(10'000, 'x')), deep}) {
+        const auto fault = file_.edit([&value](Dictionary& values) {
+            values.set("much", value);
+            return true;
+        });
+        EXPECT_THAT(fault.value_or(""), HasSubstr(value.isString() ? "File too large" : "nested"));
+    }
+    ::setrlimit(RLIMIT_FSIZE, &limit);
+    std::signal(SIGXFSZ, handler);
+    EXPECT_EQ(directory_.read("d.json"), before);
+    EXPECT_EQ(test::entriesOf(directory_.path()), 1);
 }
 
 TEST_F(PreferenceFileTest, WhatIsNoObjectIsLeftAsItIs) {

@@ -1,3 +1,4 @@
+#include "os/Directory.h"
 #include "platform/linux/loop/LinuxWorkQueues.h"
 #include "platform/linux/settings/LinuxDeviceProperties.h"
 #include "platform/linux/settings/LinuxNamedNotifications.h"

@@ -171,6 +171,8 @@ TEST(SinkFollower, ReadsWholeLinesThroughRotationsAndTornEnds) {
     fs::resize_file(path, 4);
     append("3\n");
     EXPECT_EQ(read(), "3 ");
+    fs::resize_file(path, 0);
+    EXPECT_EQ(read(), "");
     append("4\n" + std::string(600000, 'x') + "\n");
     fs::rename(path, path + ".1");
     append("5\n");

@@ -25,8 +25,6 @@ namespace {
 constexpr int kActivatedSocket = 3;
 /// Waiting connections beyond this are turned away by the kernel.
 constexpr int kBacklog = 1024;
-/// A service that starts has the socket's directory locked for a moment.
-constexpr std::chrono::milliseconds kLockPatience{1000};
 /// How long accepting rests when the process has no descriptors left.
 constexpr std::chrono::milliseconds kAcceptPause{100};
 /// How many connections one wake-up accepts, so that those there are get their turn.
@@ -87,7 +85,7 @@ std::optional<std::string> LinuxConnectionService::bindSocket(const std::string&
                "): set RUNTIME_DIRECTORY to a shorter one";
     }
     // Two services that start at the same time must not both take a left-over socket for theirs to replace.
-    const FileDescriptor lock = lockDirectory(path.substr(0, path.rfind('/')), kLockPatience);
+    const FileDescriptor lock = lockDirectory(path.substr(0, path.rfind('/')));
 
     FileDescriptor socket(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0));
     if (::bind(socket.get(), address->get(), address->size()) != 0) {

@@ -6,6 +6,13 @@
 
 namespace tamblo {
 
+namespace {
+
+/// An edit takes milliseconds: who has the lock for longer is not waited for.
+constexpr std::chrono::milliseconds kLockPatience{1000};
+
+} // namespace
+
 LinuxPreferences::LinuxPreferences(std::string directory, StructuredLog& log)
     : log_(log), watcher_(std::move(directory)) {
     reportUnwatched();
@@ -65,10 +72,11 @@ void LinuxPreferences::setPreferenceValue(std::string_view key, std::string_view
     generation_.fetch_add(1, std::memory_order_release);
     // Editing waits for others, asking does not.
     lock.unlock();
-    const std::optional<std::string> fault = entry->editable.edit([key, &value](Dictionary& values) {
+    const auto set = [key, &value](Dictionary& values) {
         values.set(key, value);
         return true;
-    });
+    };
+    const std::optional<std::string> fault = entry->editable.edit(set, kLockPatience);
     lock.lock();
     if (!fault) {
         entry->forgetFile();
