@@ -38,9 +38,30 @@ char escapeOf(char character) noexcept {
     return kEscapes[static_cast<unsigned char>(character)];
 }
 
+/// Whether one of the eight bytes needs an escape: each test sets the high bit of the bytes that it finds,
+/// and may do so for others only next to one that it found.
+bool anyNeedsEscape(std::uint64_t block) noexcept {
+    constexpr std::uint64_t ones = 0x0101'0101'0101'0101;
+    constexpr std::uint64_t highBits = ones * 0x80;
+    const std::uint64_t quote = block ^ (ones * '"');
+    const std::uint64_t backslash = block ^ (ones * '\\');
+    const std::uint64_t found =
+        ((block - ones * 0x20) & ~block) | ((quote - ones) & ~quote) | ((backslash - ones) & ~backslash);
+    return (found & highBits) != 0;
+}
+
 /// Copies bytes up to the first that needs an escape, and answers how many.
 std::size_t copyPlain(char* to, std::string_view text) noexcept {
     std::size_t i = 0;
+    while (text.size() - i >= 8) {
+        std::uint64_t block;
+        std::memcpy(&block, text.data() + i, sizeof block);
+        if (anyNeedsEscape(block)) {
+            break;
+        }
+        std::memcpy(to + i, &block, sizeof block);
+        i += 8;
+    }
     while (i < text.size() && escapeOf(text[i]) == 0) {
         to[i] = text[i];
         ++i;

@@ -37,25 +37,33 @@ template <typename Piece> void LinkmeterAgent::post(Piece piece, Pace pace) {
 }
 
 void LinkmeterAgent::start(Dictionary sessionInfo, Dictionary userInfo) {
+    {
+        const MutexLock held(mutex_);
+        toSend_.reset();
+    }
     post([sessionInfo = std::move(sessionInfo), userInfo = std::move(userInfo)](
              LinkmeterAgent& agent) mutable { agent.setUp(std::move(sessionInfo), userInfo); });
 }
 
 void LinkmeterAgent::send(Message message) {
-    post([message = std::move(message)](LinkmeterAgent& agent) mutable {
-        if (agent.linkmeterSessionStarted_) {
-            agent.sendMessage(std::move(message));
-        } else {
-            log::standard(ZRReportingSessionLinkmeterCategory(), "Session never started. {}",
-                          "handleMessage");
-        }
-    });
+    MutexLock held(mutex_);
+    const bool isFirst = toSend_ == nullptr;
+    if (isFirst) {
+        toSend_ = std::make_shared<Messages>();
+    }
+    toSend_->push_back(std::move(message));
+    if (isFirst) {
+        const std::shared_ptr<Messages> messages = toSend_;
+        held.unlock();
+        post([messages](LinkmeterAgent& agent) { agent.sendAll(messages); });
+    }
 }
 
 void LinkmeterAgent::stop(std::vector<MessageRef> messages, AudioServiceType serviceType,
                           ReporterID reporterID) {
     {
         const MutexLock held(mutex_);
+        toSend_.reset();
         ++stopsToCome_;
     }
     const Pace pace = messages.size() > kQuickSummary ? Pace::mayBlock : Pace::quick;
@@ -147,6 +155,23 @@ void LinkmeterAgent::timeOut(std::uint64_t waitNumber) {
         log::standard(ZRReportingSessionLinkmeterCategory(), "timed out waiting for backends");
         linkmeterSession_.reset();
         linkmeterQueue_->resume();
+    }
+}
+
+void LinkmeterAgent::sendAll(const std::shared_ptr<Messages>& messages) {
+    {
+        const MutexLock held(mutex_);
+        if (toSend_ == messages) {
+            toSend_.reset();
+        }
+    }
+    for (Message& message : *messages) {
+        if (linkmeterSessionStarted_) {
+            sendMessage(std::move(message));
+        } else {
+            log::standard(ZRReportingSessionLinkmeterCategory(), "Session never started. {}",
+                          "handleMessage");
+        }
     }
 }
 

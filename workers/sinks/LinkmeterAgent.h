@@ -45,6 +45,8 @@ public:
     void abandon();
 
 private:
+    using Messages = std::vector<Message>;
+
     template <typename Piece> void post(Piece piece, Pace pace = Pace::quick);
 
     // Any thread.
@@ -55,6 +57,7 @@ private:
     // On the queue.
     void setUp(Dictionary sessionInfo, const Dictionary& userInfo);
     void waitForBackends();
+    void sendAll(const std::shared_ptr<Messages>& messages);
     void sendMessage(Message message);
     void finish(const std::vector<MessageRef>& messages, AudioServiceType serviceType, ReporterID reporterID);
     void sendSummary(const std::vector<MessageRef>& messages, AudioServiceType serviceType,
@@ -73,6 +76,9 @@ private:
     bool isWaiting_ TAMBLO_GUARDED_BY(mutex_) = false;
     std::uint64_t waitNumber_ TAMBLO_GUARDED_BY(mutex_) = 0;
     std::unique_ptr<DelayedCall> timeOut_ TAMBLO_GUARDED_BY(mutex_);
+    /// What the piece that was posted last will send, until it begins: of messages that many may wait, for
+    /// nine seconds, and so they share a piece.
+    std::shared_ptr<Messages> toSend_ TAMBLO_GUARDED_BY(mutex_);
     /// The count of the semaphore that the wait is for. It lasts: back ends that come too late for one run
     /// of the session are there at once for the next.
     unsigned signals_ TAMBLO_GUARDED_BY(mutex_) = 0;
