@@ -291,6 +291,12 @@ private:
     std::size_t depth_ = 0;
 };
 
+/// Whether JSON has a form for every value of the kind.
+bool alwaysHasForm(Value::Kind kind) noexcept {
+    return kind == Value::Kind::boolean || kind == Value::Kind::integer ||
+           kind == Value::Kind::unsignedInteger || kind == Value::Kind::string;
+}
+
 /// The kind of the first value in this one, which stands at `step`, that JSON has no form for, for people;
 /// null without one. The way to it is put in front of `pointer`.
 const char* kindWithoutForm(std::string_view step, const Value& value, std::string& pointer) {
@@ -308,13 +314,17 @@ const char* kindWithoutForm(std::string_view step, const Value& value, std::stri
         break;
     case Value::Kind::array:
         for (std::size_t i = 0; kind == nullptr && i < value.arrayValue().size(); ++i) {
-            kind = kindWithoutForm(std::to_string(i), value.arrayValue()[i], pointer);
+            const Value& element = value.arrayValue()[i];
+            kind = alwaysHasForm(element.kind()) ? nullptr
+                                                 : kindWithoutForm(std::to_string(i), element, pointer);
         }
         break;
     case Value::Kind::dictionary: {
         const Dictionary& dictionary = value.dictionaryValue();
         for (std::size_t i = 0; kind == nullptr && i < dictionary.size(); ++i) {
-            kind = kindWithoutForm(dictionary.keyAt(i), dictionary.valueAt(i), pointer);
+            const Value& field = dictionary.valueAt(i);
+            kind =
+                alwaysHasForm(field.kind()) ? nullptr : kindWithoutForm(dictionary.keyAt(i), field, pointer);
         }
         break;
     }

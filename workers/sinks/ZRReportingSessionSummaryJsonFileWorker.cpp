@@ -25,20 +25,30 @@ constexpr std::size_t kBytesPerWrite = 256U << 10U;
 /// The names of one file's messages: the category's and the type's, and the number among those of that name.
 class ZRReportingSessionSummaryJsonFileWorker::MessageNames {
 public:
-    [[nodiscard]] std::string next(const ZRReportingSessionMessage& message) {
+    /// Holds until the next call.
+    [[nodiscard]] std::string_view next(const ZRReportingSessionMessage& message) {
         // Several categories and types may have one name, and are then counted together.
         const std::uint64_t key =
             std::uint64_t{1} << 48U | std::uint64_t{message.category()} << 16U | message.type();
-        const std::string& prefix = prefixes_.get(key, [&message] {
-            return formatted("{}_{}_", ZRReportingUtilityCategoryString(message.category()),
-                             ZRReportingUtilityTypeString(message.type()));
+        Count* const count = recent_.get(key, [&] {
+            return &*counts_
+                         .try_emplace(formatted("{}_{}_",
+                                                ZRReportingUtilityCategoryString(message.category()),
+                                                ZRReportingUtilityTypeString(message.type())))
+                         .first;
         });
-        return prefix + std::to_string(++counts_[prefix]);
+        name_.assign(count->first);
+        appendText(name_, ++count->second);
+        return name_;
     }
 
 private:
-    BoundedCache<std::string> prefixes_;
-    std::map<std::string, std::uint64_t, std::less<>> counts_;
+    using Counts = std::map<std::string, std::uint64_t>;
+    using Count = Counts::value_type;
+
+    Counts counts_;
+    BoundedCache<Count*> recent_;
+    std::string name_;
 };
 
 std::shared_ptr<ZRReportingSessionWorkerProtocol>
