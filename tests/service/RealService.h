@@ -273,11 +273,11 @@ public:
             received_.insert(received_.end(), bytes.begin(), bytes.begin() + count);
         }
     }
-    /// The number of replies with IDs of at least this, to the end of the connection.
-    std::size_t receiveAll(std::uint64_t leastID = 0) {
+    /// The number of replies to the end of the connection.
+    std::size_t receiveAll() {
         std::size_t count = 0;
-        for (auto reply = receive(); reply; reply = receive()) {
-            count += reply->id >= leastID ? 1U : 0U;
+        while (receive()) {
+            ++count;
         }
         return count;
     }

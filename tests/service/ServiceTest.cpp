@@ -1,10 +1,6 @@
-#include "tests/Sockets.h"
 #include "tests/service/RealService.h"
 
 #include <gmock/gmock.h>
-
-#include <algorithm>
-#include <array>
 
 #include <sys/file.h>
 #include <sys/stat.h>
@@ -95,22 +91,6 @@ TEST(Service, EndsAsAskedTo) {
     }
     EXPECT_EQ(service.awaitEnd(), 0);
     EXPECT_EQ(service.countEvents("zrreportingclientuptime"), 1U);
-}
-
-TEST(Service, WhatIsAnsweredAtItsEndIsInTheFile) {
-    ServiceProcess service;
-    Session before(service.socketPath()), after(service.socketPath(), 8);
-    ASSERT_TRUE(before.call(message({{"last", true}})));
-    constexpr std::uint64_t kLastID = 2'000'000;
-    // Two more messages and the signal between them wait for the same wake-up.
-    service.signal(SIGSTOP);
-    before.send(framesOf(message({{"last", true}, {"n", 2}}), kLastID));
-    service.signal(SIGTERM);
-    after.send(framesOf(message({{"last", true}, {"n", 2}}, {8}), kLastID));
-    service.signal(SIGCONT);
-    EXPECT_EQ(service.awaitEnd(), 0);
-    const std::size_t answered = 1 + before.receiveAll(kLastID) + after.receiveAll(kLastID);
-    EXPECT_EQ(service.countEvents("\"last\":true"), 2 * answered);
 }
 
 TEST(Service, ClientThatLeavesIsReportedOnce) {
@@ -223,23 +203,6 @@ TEST(Service, OfTwoThatStartAtOnceOneServes) {
     }));
     EXPECT_TRUE(RawClient(before.socketPath()).call(Method::getAllReporters));
     EXPECT_EQ(one.stop().value() + other.stop().value(), 1);
-}
-
-TEST(Service, APreferenceThatItStoresOutlivesIt) {
-    ServiceProcess service({.isInternalBuild = true,
-                            .preferences = {{kCaptures, R"({"TalvixInvalidXyBackOffSeconds": 3600})"}}});
-    for (int run = 0; run < 2; ++run) {
-        Session client(service.socketPath());
-        // Five seconds of a fault are drafted, unless they have been in this or the last hour.
-        for (const double offset : {0.0, 5.1}) {
-            client.call(
-                message({{"tvac_invalid_x", offset}, {"zrreporting_timestamp", 4e9 + offset}}, {7}, 14, 11));
-        }
-        service.signal(SIGKILL);
-        (void)service.awaitEnd();
-        EXPECT_EQ(linesOf(service.logs() / "bug-report-drafts.jsonl").size(), 1U);
-        service.start();
-    }
 }
 
 TEST(Service, SleepsWhenThereIsNothingToDo) {

@@ -140,22 +140,5 @@ TEST_F(LeavingClientsTest, ShuttingDownWorksOffWhatIsQueuedThenStopsEverything) 
     EXPECT_EQ(device.workQueues.delayedCalls(), 0U);
 }
 
-TEST_F(LeavingClientsTest, TheServiceMayGoInTheMiddle) {
-    const Connection leaving = connect(10);
-    send(leaving, {});
-    const SessionRef single = service->singleMessageSession();
-    openFrom(leaving, 1, 40);
-    leaving->interrupt();
-    ASSERT_TRUE(runOne());
-    device.clock.advance(std::chrono::milliseconds(5001));
-    device.workQueues.elapse(std::chrono::milliseconds(500)); // work for the idle session is on its way
-    service.reset();
-    (void)run();
-    EXPECT_EQ(stopped, fromTo(1, 32));
-    EXPECT_EQ(device.log.count("deallocing this session 40"), 1U);
-    EXPECT_TRUE(single->started()) << "dropped unstopped";
-    EXPECT_EQ(device.workQueues.delayedCalls(), 0U);
-}
-
 } // namespace
 } // namespace tamblo

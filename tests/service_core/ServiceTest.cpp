@@ -167,13 +167,19 @@ TEST_F(ServiceTest, PacesAndTracePoints) {
 TEST_F(ServiceTest, KillingEndsTheProcessAtOnceWhileThereIsAService) {
     requests.killService();
     EXPECT_EQ(std::exchange(exitStatus, 0), 2);
+    send(client, {});
+    const SessionRef single = service->singleMessageSession();
+    device.clock.advance(milliseconds(5001));
+    device.workQueues.elapse(milliseconds(500)); // work for the idle session is on its way
     service.reset();
     requests.createReportingSession(7, note<bool>("create"));
     requests.sendMessage({}, 1, 1, {7}, note<>("send"));
     requests.killService();
     client->interrupt();
-    EXPECT_THAT(answers(), ElementsAre("create true", kRefused));
+    EXPECT_THAT(answers(), ElementsAre("send", "create true", kRefused));
     EXPECT_EQ(exitStatus, 0);
+    EXPECT_TRUE(single->started()) << "dropped unstopped";
+    EXPECT_EQ(device.workQueues.delayedCalls(), 0U);
 }
 
 TEST_F(ServiceTest, TheRegistryFindsWhatAWalkOverTheClientsWould) {
@@ -232,6 +238,8 @@ TEST_F(ServiceTest, MessagesGoToTheSessionsOfTheirIDsOrToEveryStartedOne) {
     EXPECT_THAT(found({}), ElementsAre(7, 8)) << "in the order of the clients";
     EXPECT_THAT(found({9, 0, 7, 99, 9}), ElementsAre(9, 7, 9));
     EXPECT_THAT(found({0}), IsEmpty()) << "no falling back when IDs were given";
+    EXPECT_EQ(device.log.count("found reporting session 9 for client 11"), 2U);
+    EXPECT_THAT(device.log.texts("failed to find"), ElementsAre("failed to find reporting session 99"));
     EXPECT_EQ(service->singleMessageSession(), nullptr);
 }
 
