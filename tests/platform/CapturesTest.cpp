@@ -105,7 +105,6 @@ TEST_F(CaptureFoldersTest, TheOldestGoWhenThereIsNoRoomForAllButNeverTheLatest) 
 TEST_F(CaptureFoldersTest, AnOutageIsOneLineAndLeavesNoHalfFolder) {
     directory.write("captures", "in the way");
     store(identifier(0s, 1));
-    folders.keep("allowance.json", "{}");
     store(identifier(0s, 2));
     EXPECT_THAT(log.take(),
                 ElementsAre(HasSubstr("captures: cannot make it: Not a directory; captures have")));
@@ -115,13 +114,6 @@ TEST_F(CaptureFoldersTest, AnOutageIsOneLineAndLeavesNoHalfFolder) {
     folders.store(identifier(0s, 4), impossible, clock.now());
     EXPECT_THAT(names(), ElementsAre(stored));
     EXPECT_THAT(log.take(), ElementsAre(HasSubstr("cannot write no/such/place: No such file or directory;")));
-    fs::create_directory(directory.path("captures/allowance.json"));
-    for (const std::uint64_t number : {5U, 6U}) {
-        folders.keep("allowance.json", "{}");
-        store(identifier(0s, number));
-    }
-    EXPECT_THAT(log.take(),
-                ElementsAre(HasSubstr("cannot write allowance.json: Is a directory; the service")));
 }
 
 /// A directory for logs and, as `proc` and `sys`, what the kernel shows: written by each test.
@@ -191,7 +183,6 @@ TEST_F(BugCaptureServiceTest, ASnapshotIsALineOnceItsFolderIsComplete) {
     root.write("proc/loadavg", "0.10 0.20 0.30 1/99 12\n");
     root.write("sys/class/thermal/thermal_zone0/type", "soc\n");
     root.write("sys/class/thermal/thermal_zone0/temp", "48500\n");
-    root.write("sys/class/thermal/cooling_device0/type", "fan\n");
     makeService();
     ASSERT_TRUE(reporter->snapshot(signature, 0s, {{"processIDs", 12}}, keep));
     const std::string request =
@@ -226,7 +217,6 @@ TEST_F(BugCaptureServiceTest, ATimedSessionIsKeptUnlessItIsCancelledBeforeItsEnd
     EXPECT_THAT(lines(), SizeIs(3)) << "nothing has ended by itself";
     reporter->cancelSession(identifier(1));
     reporter->cancelSession(identifier(1));
-    reporter->cancelSession("20200101T000000.000Z-00000000");
     workQueues.elapse(1ms);
     gather();
     reporter->cancelSession(identifier(0));
@@ -240,9 +230,6 @@ TEST_F(BugCaptureServiceTest, ATimedSessionIsKeptUnlessItIsCancelledBeforeItsEnd
 }
 
 TEST_F(BugCaptureServiceTest, RequestsOutsideTheLimitsMakeNoLine) {
-    const auto refusal = [](GlarnError reason) {
-        return Dictionary{{glarn::kReplySuccess, false}, {glarn::kReplyReason, int{reason}}};
-    };
     makeService();
     for (const double seconds : {-0.001, std::nan(""), std::numeric_limits<double>::infinity(), 3600.001}) {
         const std::chrono::duration<double> duration(seconds);
@@ -257,13 +244,10 @@ TEST_F(BugCaptureServiceTest, RequestsOutsideTheLimitsMakeNoLine) {
     gather();
     makeService(); // a restart begins no new day
     EXPECT_TRUE(reporter->snapshot(signature, 0s, {}, keep));
-    EXPECT_EQ(replies.back(), refusal(kGlarnErrorDailyLimitExceeded));
+    EXPECT_EQ(replies.back(), (Dictionary{{glarn::kReplySuccess, false},
+                                          {glarn::kReplyReason, int{kGlarnErrorDailyLimitExceeded}}}));
     gather();
     EXPECT_THAT(lines(), SizeIs(21)) << "one of them for the session that the service's end has cancelled";
-    service->endSessions();
-    clock.advance(24h);
-    EXPECT_TRUE(reporter->startSession(signature, 1s, keep));
-    EXPECT_EQ(replies.back(), refusal(kGlarnErrorServiceUnavailable));
 }
 
 class StackCaptureTest : public CapturesTest {
@@ -323,32 +307,14 @@ TEST_F(StackCaptureTest, ALineHoldsTheSamplesThatEachThreadHad) {
 }
 
 TEST_F(StackCaptureTest, ThoseBeyondTheFourThatWaitAreDroppedAndCounted) {
-    for (std::size_t i = 0; i < LinuxDiagnosticCapture::kMaximumWaiting; ++i) {
+    for (int i = 0; i < 6; ++i) {
         capture();
     }
-    EXPECT_THAT(log.take(), IsEmpty());
-    capture();
-    capture();
     EXPECT_THAT(log.take(), ElementsAre("3 zrrl 4 stack captures wait; further ones are dropped"));
     EXPECT_EQ(run(), 4U);
     EXPECT_THAT(log.take(), ElementsAre("3 zrrl no stack captures wait any more; 2 were dropped"));
     capture();
     EXPECT_EQ(run(), 1U);
-    EXPECT_THAT(log.take(), IsEmpty());
-}
-
-TEST_F(StackCaptureTest, AProcessWithTooManyThreadsLeavesTheOthersTheirs) {
-    writeThread("7", "5000", "S (sleeping)");
-    for (std::size_t i = 1; i < LinuxDiagnosticCapture::kMaximumThreads; ++i) {
-        fs::create_directory_symlink("5000", root.path("proc/7/task/" + std::to_string(i)));
-    }
-    writeThread("8", "8", "R (running)");
-    clients = {7, 8};
-    capture();
-    run();
-    const auto stacks = nlohmann::json::parse(lines())["stacks"];
-    EXPECT_EQ(stacks[0]["threads"].size(), LinuxDiagnosticCapture::kMaximumThreads - 1);
-    EXPECT_EQ(stacks[1]["threads"].size(), 1U);
 }
 
 TEST_F(CapturesTest, TheMemoryLogLeavesOutWhoIsGone) {
@@ -359,23 +325,18 @@ TEST_F(CapturesTest, TheMemoryLogLeavesOutWhoIsGone) {
         "Name:\tVmRSS: 9\nVmPeak:\t9 kB\nVmLck:\t7 kB\nVmHWM:\t  20 kB\nVmRSS:\t 10 kB\nRssAnon:\t5 kB\n"
         "RssFile:\t3 kB\nRssShmem:\t2 kB\nVmPTE:\t6 kB\nVmSwap:\t8 kB\nThreads:\t4\n");
     writeThread("8", "8", "Z (zombie)");
-    memory.logMemory(-5, {9});
-    EXPECT_EQ(root.read("memory-log.jsonl"), "") << "nothing is read on the caller's thread";
-    EXPECT_EQ(workQueues.run("com.vandra.tamblo.memorylog"), 1U);
-    memory.logMemory(-5, {9, 8, 7});
+    memory.logMemory(-5, {9, 8, 7}); // nothing is read on the caller's thread
     root.write("proc/meminfo",
                "MemTotal: 9 kB\nUnevictable: 1 kB\nMlocked: 2 kB\nSlab: 3 kB\nSReclaimable: 4 kB\n"
                "SUnreclaim: much\nKernelStack: 6 kB\nSecPageTables: 8 kB\nPageTables: 7 kB\n");
     EXPECT_EQ(workQueues.run("com.vandra.tamblo.memorylog"), 1U);
-    EXPECT_THAT(
-        test::linesOf(root.path("memory-log.jsonl")),
-        ElementsAre(
-            R"({"time":4.0,"reporter":-5,"processes":[],"kernel":{}})",
-            R"({"time":4.0,"reporter":-5,"processes":[{"process":7,"name":"p7","resident":10240,)"
-            R"("peakResident":20480,"anonymous":5120,"file":3072,"shared":2048,"swapped":8192,)"
-            R"("locked":7168,"pageTables":6144,"threads":4}],"kernel":{"unevictable":1024,"locked":2048,)"
-            R"("slab":3072,"slabReclaimable":4096,"slabUnreclaimable":0,"pageTables":7168,)"
-            R"("kernelStack":6144}})"));
+    EXPECT_EQ(root.read("memory-log.jsonl"),
+              R"({"time":4.0,"reporter":-5,"processes":[{"process":7,"name":"p7","resident":10240,)"
+              R"("peakResident":20480,"anonymous":5120,"file":3072,"shared":2048,"swapped":8192,)"
+              R"("locked":7168,"pageTables":6144,"threads":4}],"kernel":{"unevictable":1024,"locked":2048,)"
+              R"("slab":3072,"slabReclaimable":4096,"slabUnreclaimable":0,"pageTables":7168,)"
+              R"("kernelStack":6144}})"
+              "\n");
 }
 
 } // namespace

@@ -1,11 +1,9 @@
 #include "platform/linux/device/BluetoothRecord.h"
 #include "platform/linux/device/LinuxAccessories.h"
-#include "platform/linux/device/LinuxClock.h"
 #include "platform/linux/device/LinuxDeviceConditions.h"
 #include "platform/linux/device/LinuxProcessInformation.h"
 #include "tests/platform/LinuxServiceSupport.h"
 
-#include <cstdlib>
 #include <set>
 
 #include <unistd.h>
@@ -18,25 +16,14 @@ namespace {
 using namespace std::chrono_literals;
 using namespace testing;
 
-TEST(LinuxClockTest, TheOffsetIsThatOfTheZoneOfTheMoment) {
-    const char* before = ::getenv("TZ");
-    const std::string zone = before != nullptr ? before : "";
-    for (const auto& [name, offset] : {std::pair("ABC-5:45", 20'700), {"ABC3:30", -12'600}}) {
-        ::setenv("TZ", name, 1);
-        EXPECT_EQ(LinuxClock().utcOffset(WallTime()).count(), offset) << name;
-    }
-    before != nullptr ? ::setenv("TZ", zone.c_str(), 1) : ::unsetenv("TZ");
-    ::tzset();
-}
-
 const std::string kKey = "\n[LinkKey]\nKey=00112233445566778899AABBCCDDEEFF\nType=4\n";
 const std::string kIdentity = "[DeviceID]\nSource=1\nVendor=65535\nProduct=257\nVersion=515\n";
 const std::string kEarbud = "[General]\nName=Class=1\nAppearance=0x0941\n" + kIdentity + kKey;
 
 TEST(BluetoothRecordTest, TellsEarbudsAndTheirModel) {
-    for (const std::string general : {"Class=0x240404", "Class=0x240418\r", "Class=2360344",
-                                      "Appearance=0x0941", "Appearance=0x0941\nClass=0x000100",
-                                      "Appearance=0x0000\nClass=0x240418", "Appearance=-1\nClass=0x240418"}) {
+    for (const std::string general :
+         {"Class=0x240404", "Class=2360344\r", "Appearance=0x0941\nClass=0x000100",
+          "Appearance=0x0000\nClass=0x240418"}) {
         EXPECT_TRUE(BluetoothRecord::parse("[General]\n" + general).isEarbud()) << general;
     }
     for (const std::string general : {"Class=0x24041c", "Class=0x240518", "Class=0x1240418", "Class=0x24041g",
@@ -47,7 +34,6 @@ TEST(BluetoothRecordTest, TellsEarbudsAndTheirModel) {
         {kIdentity, "bluetooth:ffff:0101:0203"},
         {"[DeviceID]\nVersion=x\nProduct=0xFFFF\nVendor=1\nSource=2", "usb:0001:ffff:0000"},
         {"[DeviceID]\nSource=9\nVendor=65536\nProduct=1", "unknown:0000:0001:0000"},
-        {"[DeviceID]\nSource=1\nVendor=0\nProduct=0", ""},
         {"Vendor=7\n[DeviceID\nVendor=7\n=\n[]\n[", ""},
     };
     for (const auto& [text, model] : models) {
@@ -81,9 +67,7 @@ TEST_F(LinuxAccessoriesTest, FindsPairedEarbudsEachOnce) {
     addDevice(address(1), address(4), "[General]\nAppearance=0x0941\n"); // was seen, never paired
     addDevice(address(1), address(5), kEarbud + std::string(300'000, '\n'));
     addDevice(address(9), address(2));
-    addDevice("cache", address(6));
     addDevice(address(9), "cache");
-    directory.write("bt/" + address(8), "no directory");
     const std::vector<Accessory> found = earbuds();
     ASSERT_THAT(found, SizeIs(2));
     EXPECT_EQ(found[0].model, "bluetooth:ffff:0101:0203");
@@ -118,15 +102,12 @@ void makeZones(const TemporaryDirectory& root, const std::string& description) {
 
 TEST(LinuxDeviceConditionsTest, TheWorstTripPointReachedIsTheThermalState) {
     const std::pair<const char*, int> cases[] = {
-        {"", 0},
         {"/thermal_zone0 temp=59999 0=active@60000", 0},
         {"/thermal_zone0 temp=60000 0=active@60000", 1},
         {"/thermal_zone0 temp=60000 0=passive@60000", 2},
         {"/thermal_zone0 temp=60000 0=hot@60000", 3},
-        {"/thermal_zone0 temp=60000 0=critical@60000", 3},
-        {"/thermal_zone0 temp=60000 0=other@50000", 0},
-        {"/thermal_zone0 temp=80000 0=critical@105000 1=passive@80000 2=active@50000", 2},
-        {"/thermal_zone0 temp=80000 0=active@50000 13=hot@80000", 3},
+        {"/thermal_zone0 temp=80000 0=critical@105000 13=passive@80000 2=active@50000 3=other@1", 2},
+        {"/thermal_zone0 temp=80000 0=active@50000 1=critical@80000", 3},
         {"/thermal_zone0 temp=50 0=active@50 /thermal_zone1 temp=60 0=passive@60 /thermal_zone2 temp=1", 2},
         {"/thermal_zone0 mode=disabled temp=60000 0=hot@60000", 0},
         {"/thermal_zone0 temp=60000 0=hot@0 1=critical@-274000 2=passive@ 3=hot@5x 4=active@1", 1},
@@ -167,26 +148,16 @@ TEST(LinuxProcessInformationTest, TheFootprintIsWhatFilesCannotGiveBack) {
         {"Name:\tx\nVmRSS:\t8388608 kB\nRssAnon:\t8388608 kB\n", 8LL << 30},
         {"Name:\tRssAnon: 5 kB\nVmRSS:\t99 kB\n", -ENODATA},
         {"Name:\tx\nVmRSS:\t99 kB\nRssAnon:", -ENODATA},
-        {"", -ENODATA},
     };
     const TemporaryDirectory root;
-    std::chrono::steady_clock::time_point now{};
-    const LinuxProcessInformation information(root.path(), [&now] { return now; });
-    // The footprint, or minus the error's code.
-    const auto footprint = [&information] {
-        const auto result = information.physicalFootprint();
-        const auto* error = std::get_if<ProcessInformation::QueryError>(&result);
-        return error != nullptr ? -error->code : static_cast<std::int64_t>(std::get<std::uint64_t>(result));
-    };
-    std::int64_t before = footprint();
-    EXPECT_EQ(before, -ENOENT);
     for (const auto& [status, expected] : cases) {
         root.write("self/status", status);
-        now += 99ms;
-        EXPECT_EQ(footprint(), before) << status;
-        now += 1ms;
-        before = footprint();
-        EXPECT_EQ(before, expected) << status;
+        const auto found = LinuxProcessInformation(root.path()).physicalFootprint();
+        if (const auto* const error = std::get_if<ProcessInformation::QueryError>(&found)) {
+            EXPECT_EQ(-error->code, expected) << status;
+        } else {
+            EXPECT_EQ(std::get<std::uint64_t>(found), static_cast<std::uint64_t>(expected)) << status;
+        }
     }
 }
 

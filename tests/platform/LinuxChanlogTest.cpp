@@ -1,9 +1,6 @@
 #include "base/Format.h"
-#include "platform/linux/drivers/ChanlogChannelJson.h"
 #include "platform/linux/drivers/LinuxChanlogFacility.h"
 #include "tests/platform/LinuxServiceSupport.h"
-
-#include <thread>
 
 namespace tamblo {
 namespace {
@@ -101,10 +98,6 @@ TEST_F(LinuxChanlogTest, ASampleIsOneReadingAndSeesEveryChange) {
         EXPECT_EQ(textOf(std::get<ChanlogChannels>(moment->sample(*subscription))), formatted("a={}", i));
     }
     EXPECT_EQ(textOf(subscription->subscribedChannels()), "a=0");
-    std::this_thread::sleep_for(2 * FileState::kCertainAge);
-    (void)sample();
-    const ChanlogChannels old = facility.readAll();
-    EXPECT_EQ(facility.readAll(), old) << "a file that is certainly the same is not read again";
     publish("b.json", simples({{"b", 1}}));
     EXPECT_EQ(now(), "a=0 b=1");
     std::filesystem::remove(root.path("chanlog/a.json"));
@@ -114,23 +107,15 @@ TEST_F(LinuxChanlogTest, ASampleIsOneReadingAndSeesEveryChange) {
 TEST_F(LinuxChanlogTest, RubbishCostsItsOwnFileOrChannelAloneAndIsToldOnce) {
     const std::string state = R"({"format":"state","states":[)";
     const std::string histogram = R"({"format":"histogram","min":1,"buckets":[)";
-    std::string many = state + R"({"name":"a","transitions":0,"residency":0})";
-    for (std::size_t i = 0; i < kMaximumChanlogElements; ++i) {
-        many += R"(,{"name":"a","transitions":0,"residency":0})";
-    }
     const std::pair<std::string, std::string> cases[] = {
         {"7", "it is no object"},
-        {"{}", "format is missing"},
         {R"({"format":"other"})", "format \"other\" is not known"},
         {R"({"format":"simple","value":9223372036854775808})", "value is no signed 64-bit integer"},
-        {R"({"format":"simple","value":1,"driver":5})", "driver is no text"},
         {R"({"format":"simple","value":1,"name":")" + std::string(257, 'n') + R"("})",
          "name is longer than 256 bytes"},
-        {R"({"format":"state","states":{}})", "states is no array"},
         {state + "5]}", "states 0: it is no object"},
         {state + R"({"name":"a","transitions":1,"residency":-1}]})",
          "states 0: residency is no unsigned 64-bit integer"},
-        {many + "]}", "states has more than 256 elements"},
         {histogram + R"({"lower":1,"upper":2,"hits":-1}]})", "buckets 0: hits is negative"},
         {histogram + "]}", "max is missing"},
     };
@@ -177,18 +162,6 @@ TEST_F(LinuxChanlogTest, LimitsHoldAndAreToldOnce) {
     }
     EXPECT_EQ(now(), "first=1 first=4");
     EXPECT_THAT(log.take(), ElementsAre(HasSubstr("/c1256.json: more than 256 files")));
-    for (int i = 2; i < 6; ++i) {
-        publish(formatted("c{}.json", 1000 + i), "[]" + std::string(ChanlogFiles::kMaximumFileSize - 2, ' '));
-    }
-    EXPECT_EQ(now(), "first=1 first=4");
-    EXPECT_THAT(log.take(), ElementsAre(HasSubstr("/c1005.json: more than 256 files or 4194304 bytes")));
-    for (std::size_t i = 4 + ChanlogFiles::kMaximumFiles; i <= ChanlogFiles::kMaximumEntries; ++i) {
-        publish(formatted("other{}", i), "");
-    }
-    EXPECT_EQ(now(), "first=1 first=4");
-    publish("one more", "");
-    EXPECT_EQ(now(), "");
-    EXPECT_THAT(log.take(), ElementsAre(HasSubstr("/chanlog: more than 4096 entries; no driver statistics")));
 }
 
 /// A histogram where there are buckets, else a simple channel, which may have states, too.
@@ -232,13 +205,11 @@ TEST_F(LinuxChanlogTest, DifferencesAreGains) {
     for (const auto& [earlierList, laterList, gained, trouble] : cases) {
         const auto earlier = std::make_shared<const std::vector<ChanlogChannelRef>>(earlierList);
         const auto later = std::make_shared<const std::vector<ChanlogChannelRef>>(laterList);
-        for (int outage = 0; outage < 2; ++outage) {
-            EXPECT_EQ(difference(earlier, later), gained);
-            EXPECT_EQ(difference(earlier, later), gained);
-            EXPECT_THAT(log.take(), AllOf(SizeIs(*trouble != '\0' ? 1 : 0), Each(HasSubstr(trouble))))
-                << "once for as long as it lasts";
-            (void)difference(later, later);
-        }
+        EXPECT_EQ(difference(earlier, later), gained);
+        EXPECT_EQ(difference(earlier, later), gained);
+        EXPECT_THAT(log.take(), AllOf(SizeIs(*trouble != '\0' ? 1 : 0), Each(HasSubstr(trouble))))
+            << "once for as long as it lasts";
+        (void)difference(later, later);
     }
 }
 
@@ -261,8 +232,7 @@ TEST_F(LinuxChanlogTest, PcmStreamsAreChannels) {
          "avail_max   : 4096\n-----\nhw_ptr      : 48000\nappl_ptr    : 49000\n",
          "frames=48000 overruns=0 available=512 delay=-3"},
         {"state: XRUN\nhw_ptr      : 7\n", "frames=7 overruns=1"},
-        {"state: OPEN\nhw_ptr: x\ndelay: \n", "overruns=0"},
-        {"error -19\n", ""},
+        {"error -19\nhw_ptr: x\n", ""},
         {"closed\n", closed},
     };
     for (const auto& [status, expected] : cases) {
@@ -272,10 +242,6 @@ TEST_F(LinuxChanlogTest, PcmStreamsAreChannels) {
     std::filesystem::remove(root.path("asound/pcm"));
     EXPECT_EQ(now(), "");
     EXPECT_THAT(log.take(), IsEmpty());
-    std::filesystem::create_directory(root.path("asound/pcm"));
-    EXPECT_EQ(now(), "");
-    EXPECT_EQ(now(), "");
-    EXPECT_THAT(log.take(), ElementsAre(HasSubstr("/asound/pcm: Is a directory")));
 }
 
 } // namespace

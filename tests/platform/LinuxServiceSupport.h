@@ -25,14 +25,11 @@ public:
     std::optional<std::size_t> room; ///< bytes that can still be written
     std::size_t largestWrite = 1U << 30U;
     int interruptions = 0; ///< of writes to come, every second one
-    int openError = 0, truncateError = 0, closeError = 0;
+    int truncateError = 0;
     int renameError = 0; ///< of the newest file of a rotation, which is the last to be moved
     int writes = 0;
     std::function<void()> beforeWrite = [] {};
 
-    int open(const char* path, int flags, mode_t mode) noexcept override {
-        return openError != 0 ? fail(openError) : FileOperations::open(path, flags, mode);
-    }
     ssize_t write(int descriptor, const void* bytes, std::size_t count) noexcept override {
         beforeWrite();
         ++writes;
@@ -53,10 +50,6 @@ public:
     int rename(const char* from, const char* to) noexcept override {
         const bool fails = renameError != 0 && std::string_view(from).ends_with(".jsonl");
         return fails ? fail(renameError) : FileOperations::rename(from, to);
-    }
-    int close(int descriptor) noexcept override {
-        const int result = FileOperations::close(descriptor);
-        return closeError != 0 ? fail(closeError) : result;
     }
     std::chrono::nanoseconds coarseTime() noexcept override { return std::chrono::seconds(++time_); }
 

@@ -1,19 +1,21 @@
+#include "platform/linux/connections/LinuxConnectionService.h"
 #include "platform/linux/loop/LinuxWorkQueues.h"
-
-#include <gmock/gmock.h>
+#include "tests/Sockets.h"
+#include "tests/platform/LinuxServiceSupport.h"
+#include "wire/Protocol.h"
 
 #include <cctype>
-#include <filesystem>
 #include <future>
 #include <latch>
+#include <thread>
+
+#include <sys/epoll.h>
 
 namespace tamblo {
 namespace {
 
 using namespace testing;
 using std::chrono::milliseconds;
-
-constexpr std::chrono::seconds kPatience{20};
 
 /// The letters of the pieces that ran: as they are on the test's own thread, else as capitals. Of one queue,
 /// which is its guard.
@@ -179,18 +181,67 @@ TEST(DelayedCall, IsMadeOnceItsTimeHasComeUnlessItIsCalledOff) {
     std::latch mayGoOn(1);
     const auto blocked = queues.makeSerialQueue("blocked");
     blocked->post([&mayGoOn] { mayGoOn.wait(); }, Pace::mayBlock);
-    ASSERT_EQ(late.get_future().wait_for(kPatience), std::future_status::ready);
+    ASSERT_EQ(late.get_future().wait_for(std::chrono::seconds(20)), std::future_status::ready);
     EXPECT_GE(std::chrono::steady_clock::now() - start, milliseconds(60));
     EXPECT_TRUE(isSoonMade);
     mayGoOn.count_down();
+}
 
-    constexpr std::ptrdiff_t kMany = 2000;
-    std::latch allMade(kMany);
-    std::vector<std::unique_ptr<DelayedCall>> calls;
-    for (std::ptrdiff_t i = 0; i < kMany; ++i) {
-        calls.push_back(queues.callAfter(milliseconds(i % 20), [&] { allMade.count_down(); }));
+std::atomic<int> additions{0};
+
+/// The kernel, but for every second addition, which it refuses as if the user had no watches left.
+int refusingControl(int epoll, int operation, int descriptor, epoll_event* event) {
+    if (operation == EPOLL_CTL_ADD && ++additions % 2 == 0) {
+        errno = ENOSPC;
+        return -1;
     }
-    allMade.wait();
+    return ::epoll_ctl(epoll, operation, descriptor, event);
+}
+
+/// Accepts everybody and notes what becomes of them, on the loop's thread.
+struct Delegate final : ListenerDelegate {
+    bool shouldAcceptNewConnection(ClientConnection& connection) override {
+        connection.setInterruptionHandler([this] { trace += "interrupted "; });
+        connection.setInvalidationHandler([this] { trace += "invalidated "; });
+        connection.resume();
+        return true;
+    }
+    std::string trace;
+};
+
+TEST(ConnectionService, EndsAClientWhoseSocketCannotBeWatchedAndServesTheOthers) {
+    const TemporaryDirectory directory;
+    const sockaddr_un address = test::addressOf(wire::socketPath(directory.path()));
+    const FileDescriptor unwatched(::socket(AF_UNIX, SOCK_STREAM, 0));
+    const FileDescriptor other(::socket(AF_UNIX, SOCK_STREAM, 0));
+    FakeLog log;
+    EventLoop loop(refusingControl);
+    LinuxConnectionService service(loop, log);
+    LinuxWorkQueues queues;
+    const auto requests = queues.makeSerialQueue("requests");
+    Delegate delegate;
+    service.setRequestQueue(*requests, queues);
+    service.setDelegate(delegate);
+    ASSERT_EQ(service.open(directory.path()), std::nullopt);
+    service.resume(); // nor can the listener's own socket, for a moment
+    std::thread thread([&] { loop.run(queues); });
+    for (const FileDescriptor* client : {&unwatched, &other}) {
+        ::connect(client->get(), reinterpret_cast<const sockaddr*>(&address), sizeof address);
+    }
+    EXPECT_TRUE(isReadable(unwatched.get(), 20'000)) << "that it has ended";
+    ::send(other.get(), "\x01\0\0\0\xA0", 5, MSG_NOSIGNAL);
+    EXPECT_TRUE(isReadable(other.get(), 20'000)) << "an answer: that this is no request";
+    EXPECT_THAT(service.clientProcesses(), ElementsAre(::getpid()));
+
+    loop.post([&] {
+        service.stop();
+        loop.stop();
+    });
+    thread.join();
+    EXPECT_EQ(delegate.trace, "interrupted invalidated ");
+    EXPECT_THAT(log.take(), ElementsAre("3 zrrs accepting connections rests: No space left on device",
+                                        "3 zrrs accepting connections again",
+                                        HasSubstr("since its socket cannot be watched: No space left on")));
 }
 
 } // namespace
