@@ -215,6 +215,7 @@ TEST(ConnectionService, EndsAClientWhoseSocketCannotBeWatchedAndServesTheOthers)
     const FileDescriptor unwatched(::socket(AF_UNIX, SOCK_STREAM, 0));
     const FileDescriptor other(::socket(AF_UNIX, SOCK_STREAM, 0));
     FakeLog log;
+    additions = 0;
     EventLoop loop(refusingControl);
     LinuxConnectionService service(loop, log);
     LinuxWorkQueues queues;
@@ -232,7 +233,6 @@ TEST(ConnectionService, EndsAClientWhoseSocketCannotBeWatchedAndServesTheOthers)
     ::send(other.get(), "\x01\0\0\0\xA0", 5, MSG_NOSIGNAL);
     EXPECT_TRUE(isReadable(other.get(), 20'000)) << "an answer: that this is no request";
     EXPECT_THAT(service.clientProcesses(), ElementsAre(::getpid()));
-
     loop.post([&] {
         service.stop();
         loop.stop();
