@@ -136,10 +136,12 @@ private:
 /// Channels and failures as a test sets them. What has been gained between two samples is what the later one
 /// says: the figures of a channel are those of a difference.
 class FakeChanlogFacility final : public ChanlogFacility {
+    using Answer = std::variant<ChanlogChannels, int>;
+
 public:
     /// What there is from now on.
     std::vector<ChanlogChannel> channels;
-    /// Error codes in place of an answer; none when empty. 0 is a failure without a code.
+    /// Error codes in place of an answer; none when empty.
     std::optional<int> channelsError;
     std::optional<int> subscribeError;
     std::optional<int> sampleError;
@@ -158,13 +160,9 @@ public:
         }
         return std::make_unique<Subscription>(selection, subscribed);
     }
-    std::variant<ChanlogChannels, int> difference(const ChanlogChannels& earlier,
-                                                  const ChanlogChannels& later) override {
+    Answer difference(const ChanlogChannels& earlier, const ChanlogChannels& later) override {
         calls += 'd';
-        if (earlier == nullptr) {
-            return 2;
-        }
-        return later;
+        return earlier == nullptr ? Answer(2) : later;
     }
 
 private:
@@ -179,26 +177,23 @@ private:
 
     struct Sampling final : ChanlogSampling {
         explicit Sampling(FakeChanlogFacility& owner) : facility(owner) {}
-        std::variant<ChanlogChannels, int> channelsOf(const ChanlogSelection& selection) override {
+        Answer channelsOf(const ChanlogSelection& selection) override {
             facility.calls +=
                 selection.groupName.value_or("") + "-" + selection.subGroupName.value_or("") + " ";
-            if (facility.channelsError) {
-                return *facility.channelsError;
-            }
-            return facility.select(selection);
+            return facility.select(selection, facility.channelsError);
         }
-        std::variant<ChanlogChannels, int> sample(ChanlogSubscription& subscription) override {
+        Answer sample(ChanlogSubscription& subscription) override {
             facility.calls += 's';
-            if (facility.sampleError) {
-                return *facility.sampleError;
-            }
-            return facility.select(static_cast<Subscription&>(subscription).selection);
+            return facility.select(static_cast<Subscription&>(subscription).selection, facility.sampleError);
         }
 
         FakeChanlogFacility& facility;
     };
 
-    [[nodiscard]] ChanlogChannels select(const ChanlogSelection& selection) const {
+    [[nodiscard]] Answer select(const ChanlogSelection& selection, std::optional<int> error) const {
+        if (error) {
+            return *error;
+        }
         auto selected = std::make_shared<std::vector<ChanlogChannelRef>>();
         for (const ChanlogChannel& channel : channels) {
             if ((!selection.groupName || channel.groupName == selection.groupName) &&
@@ -215,9 +210,6 @@ class FakeNamedNotifications final : public NamedNotifications {
 public:
     Registration RegisterNamedNotification(std::string_view name, SerialQueue& queue,
                                            Handler handler) override {
-        if (registrationStatus != 0) {
-            return {registrationStatus, 0};
-        }
         registered_[++lastToken_] =
             std::make_shared<Registered>(std::string(name), queue, std::move(handler));
         return {0, lastToken_};
@@ -247,8 +239,6 @@ public:
 
     /// The names that the service itself has posted.
     std::vector<std::string> posted;
-    /// What registering answers; other than 0, it fails.
-    int registrationStatus = 0;
 
 private:
     struct Registered {

@@ -51,7 +51,7 @@ private:
     std::vector<Event> events_;
 };
 
-/// Keeps what its reporters ask for; accepts and answers as a test says.
+/// Keeps what its reporters ask for; accepts as a test says, and answers when it does.
 class FakeBugCaptureService final : public BugCaptureService {
 public:
     struct Request {
@@ -64,7 +64,6 @@ public:
     };
 
     std::unique_ptr<GlarnReporter> makeReporter(std::span<const pid_t> processes) override {
-        ++reportersMade;
         return std::make_unique<Reporter>(*this, std::vector(processes.begin(), processes.end()));
     }
     /// Answers the oldest request that waits.
@@ -75,9 +74,6 @@ public:
     }
 
     bool accepts = true;
-    /// Given to every request before it returns; without one, replies wait for `answer`.
-    std::optional<Dictionary> promptAnswer;
-    int reportersMade = 0;
     std::vector<Request> requests;
     std::vector<GlarnReporter::Reply> replies;
 
@@ -105,9 +101,7 @@ private:
 
     bool take(Request request, GlarnReporter::Reply reply) {
         requests.push_back(std::move(request));
-        if (accepts && promptAnswer) {
-            reply(*promptAnswer);
-        } else if (accepts) {
+        if (accepts) {
             replies.push_back(std::move(reply));
         }
         return accepts;
@@ -188,18 +182,16 @@ public:
     std::vector<Event> events;
 };
 
-/// Keeps the drafts; a test calls their completions.
+/// Keeps for whom there were drafts; a test calls their completions.
 class FakeBugReportDraftingService final : public BugReportDraftingService {
 public:
     struct Request {
-        BugReportDraft draft;
         std::string processName;
-        std::string displayReason;
         Completion completion;
     };
-    void createDraft(const BugReportDraft& draft, const std::string& processName,
-                     const std::string& displayReason, Completion completion) override {
-        requests.push_back({draft, processName, displayReason, std::move(completion)});
+    void createDraft(const BugReportDraft&, const std::string& processName, const std::string&,
+                     Completion completion) override {
+        requests.push_back({processName, std::move(completion)});
     }
 
     std::vector<Request> requests;
@@ -214,15 +206,11 @@ public:
 
 class FakeMemoryLog final : public MemoryLog {
 public:
-    struct Request {
-        std::int64_t reporterID;
-        std::vector<pid_t> processes;
-    };
     void logMemory(std::int64_t reporterID, std::vector<pid_t> processes) override {
-        requests.push_back({reporterID, std::move(processes)});
+        requests.emplace_back(reporterID, std::move(processes));
     }
 
-    std::vector<Request> requests;
+    std::vector<std::pair<std::int64_t, std::vector<pid_t>>> requests; ///< reporter and processes
 };
 
 /// Report files in memory. Each step can be made to fail, with the text that a test sets for it.
@@ -230,10 +218,7 @@ class FakeReportFiles final : public ReportFiles {
 public:
     std::string reportingLogsDirectory() const override { return "/reports"; }
     std::string performanceLogsDirectory() const override { return "/performance"; }
-    std::optional<std::string> createDirectory(const std::string& path) override {
-        createdDirectories.push_back(path);
-        return directoryFailure;
-    }
+    std::optional<std::string> createDirectory(const std::string&) override { return directoryFailure; }
     std::variant<std::unique_ptr<ReportFile>, std::string> createFile(const std::string& path) override {
         if (openFailure) {
             return *openFailure;
@@ -243,10 +228,8 @@ public:
     }
 
     std::map<std::string, std::string> files; ///< the contents by path
-    std::vector<std::string> createdDirectories;
     std::optional<std::string> directoryFailure, openFailure, writeFailure, closeFailure;
-    std::set<std::size_t> failingWrites; ///< those that the write failure is for, from 1; without any, all
-    std::vector<std::size_t> writes;     ///< the length of each
+    std::vector<std::size_t> writes; ///< the length of each
 
 private:
     class File final : public ReportFile {
@@ -254,13 +237,10 @@ private:
         File(FakeReportFiles& owner, std::string& content) : owner_(owner), content_(content) {}
         std::optional<std::string> write(std::string_view text) override {
             owner_.writes.push_back(text.size());
-            const bool isMeant =
-                owner_.failingWrites.empty() || owner_.failingWrites.contains(owner_.writes.size());
-            if (owner_.writeFailure && isMeant) {
-                return owner_.writeFailure;
+            if (!owner_.writeFailure) {
+                content_ += text;
             }
-            content_ += text;
-            return std::nullopt;
+            return owner_.writeFailure;
         }
         std::optional<std::string> close() override { return owner_.closeFailure; }
 

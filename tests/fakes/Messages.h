@@ -8,7 +8,6 @@
 #include <string>
 #include <string_view>
 #include <utility>
-#include <vector>
 
 namespace tamblo {
 
@@ -16,14 +15,6 @@ namespace tamblo {
 inline MessageRef messageOf(Dictionary payload, AudioEventCategory category = AudioEventKindPlayback,
                             AudioEventType type = AudioEventTypeGeneric) {
     return std::make_shared<ZRReportingSessionMessage>(std::move(payload), category, type);
-}
-
-inline std::vector<MessageRef> messagesOf(const std::vector<Dictionary>& payloads) {
-    std::vector<MessageRef> messages;
-    for (const Dictionary& payload : payloads) {
-        messages.push_back(messageOf(payload));
-    }
-    return messages;
 }
 
 /// The values of some keys as JSON, with blanks between; a key that is absent is left out.

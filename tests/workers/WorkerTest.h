@@ -102,11 +102,6 @@ protected:
         made->updateConfigurationWithContentsOfConfiguration(configuration);
         return made;
     }
-    std::shared_ptr<ZRReportingSession> startedSession() {
-        auto made = makeSession();
-        made->start();
-        return made;
-    }
     /// A worker of the session that the session itself does not have.
     template <typename Worker> std::shared_ptr<Worker> make() {
         return std::make_shared<Worker>(device.context(), session);

@@ -1,9 +1,11 @@
+#include "system/ZRReportingSessionDriverSnapshotWorker.h"
 #include "system/ZRReportingSystemMonitor.h"
 #include "tests/workers/WorkerTest.h"
 
 #include <cctype>
-#include <optional>
 #include <thread>
+
+// What sessions are told of the system: its settings and its drivers.
 
 namespace tamblo {
 namespace {
@@ -46,24 +48,16 @@ protected:
     }
 };
 
-TEST_F(SystemMonitorTest, AStateHasTheValueAsItIsStoredAndWhenItWasRead) {
-    const Value spatial(Dictionary{{"mode", "fixed"}});
-    device.preferences.set(kSpatial, "com.vandra.dashlo", spatial);
-    device.processInformation.uptime = std::chrono::duration<double>(99.5);
-    EXPECT_EQ(makeMonitor()->find(kSpatial), (Dictionary{{kSpatial, spatial},
-                                                         {"zrreporting_timestamp", device.clock.seconds()},
-                                                         {"systemuptime_sec", 100}}));
-}
-
-TEST_F(SystemMonitorTest, RingerIsOnForTheWordOneOnly) {
-    const auto monitor = ZRReportingSystemMonitor::initWithQueue(device.services(), device.serverQueue());
-    EXPECT_EQ(monitor->getFeatureState("ringerstate"), std::nullopt) << "never posted: the read fails";
+TEST_F(SystemMonitorTest, AStateHasTheValueAndWhenItWasReadAndTheRingerIsOnForTheWordOneOnly) {
+    device.preferences.set(kSpatial, "com.vandra.dashlo", "fixed");
+    const auto states = makeMonitor();
+    EXPECT_EQ(states->find(kSpatial), (Dictionary{{kSpatial, "fixed"},
+                                                  {"zrreporting_timestamp", device.clock.seconds()},
+                                                  {"systemuptime_sec", 1000}}));
     for (const std::uint64_t word : {1UL, 0UL, 2UL, UINT64_MAX, (1UL << 32U) + 1}) {
         post(kRinger, word);
-        const Dictionary state = monitor->systemMonitorDictionary()->find("ringerstate");
-        EXPECT_EQ(shown(state, {"ringerstate"}), word == 1 ? "true" : "false") << word;
+        EXPECT_EQ(shown(states->find("ringerstate"), {"ringerstate"}), word == 1 ? "true" : "false") << word;
     }
-    EXPECT_EQ(monitor->getFeatureState("volume"), std::nullopt);
 }
 
 TEST_F(SystemMonitorTest, OneForTheProcessUntilItIsReset) {
@@ -76,15 +70,8 @@ TEST_F(SystemMonitorTest, OneForTheProcessUntilItIsReset) {
         }
     }
     EXPECT_EQ(device.namedNotifications.registrationCount(), 3U);
-    EXPECT_THAT(ZRReportingSystemMonitor::getSystemMonitorKeys(device.context()),
-                ElementsAre("device_name", "ringerstate", kSpatial));
-
     const auto first = snapshot();
-    FakeSerialQueue other("other");
-    ZRReportingSystemMonitor::initializeWithQueue(device.context(), other);
-    EXPECT_EQ(snapshot(), first);
     device.namedNotifications.post(kRinger, 1);
-    EXPECT_EQ(other.runAll(), 0U) << "the first queue runs the handler";
     ZRReportingSystemMonitor::reset(device.context()); // with a notification on its way
     EXPECT_EQ(device.namedNotifications.registrationCount(), 0U);
     const auto second = makeMonitor();
@@ -114,12 +101,11 @@ struct Observer final : SystemMonitorDictionary::KeyObserver {
 TEST(SystemMonitorDictionaryTest, ObserversMayComeAndGoWhileTheyAreCalled) {
     const auto states = std::make_shared<SystemMonitorDictionary>();
     std::string calls;
-    Observer a("a", calls), b("b", calls), c("c", calls), late("late", calls), elsewhere("elsewhere", calls);
+    Observer a("a", calls), b("b", calls), c("c", calls), late("late", calls);
     states->set("key", {{"key", 0}}); // not told to those who come later
     for (Observer* observer : {&a, &b, &c}) {
         observer->observe(*states, "key");
     }
-    elsewhere.observe(*states, "other");
     a.act = [&] {
         a.observation.reset();
         b.observation.reset();
@@ -201,6 +187,117 @@ TEST_F(SystemMonitorTest, SessionsAreToldWhatIsKnownAtTheStartAndEveryChangeAfte
         told += ": " + std::to_string(snapshot()->observationCount()) + " " + std::to_string(messages);
         EXPECT_EQ(told, row.expected) << row.what;
     }
+}
+
+using Utility = ZRReportingDriverUtility;
+using Name = std::optional<std::string>;
+
+ChanlogChannel channelOf(ChanlogFormat format, Name group, Name subGroup = {}, Name name = "n") {
+    ChanlogChannel channel;
+    channel.format = format;
+    channel.groupName = std::move(group);
+    channel.subGroupName = std::move(subGroup);
+    channel.channelName = std::move(name);
+    return channel;
+}
+ChanlogChannel simple(std::int64_t value, Name group, Name subGroup = {}, Name name = "n") {
+    auto channel = channelOf(ChanlogFormat::simple, std::move(group), std::move(subGroup), std::move(name));
+    channel.value = value;
+    return channel;
+}
+
+class DriverStatisticsTest : public WorkerTest {
+protected:
+    /// What sessions were sent of the drivers, without what every message has.
+    std::vector<std::string> sent() {
+        std::vector<std::string> found;
+        for (const auto& event : device.analyticsEvents.events()) {
+            Dictionary payload = event.payload;
+            for (const char* key :
+                 {"HostApplicationDisplayID", "audiotag", "invalid_timestamp", "zrreporting_timestamp"}) {
+                payload.remove(key);
+            }
+            if (event.name.starts_with("com.vandra.tamblo.Chanlog.")) {
+                found.push_back(event.name.substr(26) + jsonText(payload));
+            }
+        }
+        return found;
+    }
+};
+
+TEST_F(DriverStatisticsTest, TheFirstStartSubscribesToTheGroupsThatThereAre) {
+    device.chanlog.channels = {simple(1, "Speaker"), simple(1, "x", "MCA"), simple(1, "Haptics"),
+                               simple(1, "Haptics", "Stats")};
+    makeSession()->start();
+    EXPECT_EQ(device.chanlog.calls, "|VandraAE2MCA- Speaker- -MCA Haptics-Stats StateTransitionTimes_ms- Rx- "
+                                    "Tx- -VXA2 pdm- |sss");
+    device.chanlog.channels.push_back(simple(1, "pdm"));
+    device.chanlog.calls.clear();
+    makeSession()->start();
+    EXPECT_EQ(device.chanlog.calls, "|sss") << "a group that comes later is not asked for";
+}
+
+TEST_F(DriverStatisticsTest, ADriverThatFailsIsAbsent) {
+    FakeChanlogFacility& chanlog = device.chanlog;
+    chanlog.channels = {simple(5, "Speaker")};
+    for (const auto error : {&FakeChanlogFacility::channelsError, &FakeChanlogFacility::subscribeError}) {
+        chanlog.*error = 13;
+        EXPECT_THAT(Utility(chanlog).ioChannelSubscriptions(), IsEmpty());
+        (chanlog.*error).reset();
+    }
+    EXPECT_EQ(device.log.count("error 13 "), 10U) << "for each of nine drivers, and the one that is there";
+    const Utility utility(chanlog);
+    const Utility::DriverSnapShot empty;
+    for (const std::optional<int> error : {std::optional(15), std::optional<int>()}) {
+        chanlog.sampleError = error;
+        EXPECT_EQ(utility.getSnapShot().empty(), error.has_value());
+        utility.sendDriverLogsForSession(session, &empty);
+    }
+    utility.sendDriverLogsForSession(session, nullptr);
+    EXPECT_EQ(device.log.count("ChanlogCreateSamples error"), 3U) << "two, and no sample to compare with";
+    EXPECT_EQ(session->totalMessageCount(), 0);
+}
+
+TEST_F(DriverStatisticsTest, AStopSendsWhatWasGainedKindByKind) {
+    ChanlogChannel histogram = channelOf(ChanlogFormat::histogram, "Speaker", "Thermal Zone_1", "coil temp");
+    histogram.driverName = "Speaker_Amp<2><3>";
+    histogram.unitLabel = "C";
+    histogram.buckets = {{.lower = -9, .upper = -5, .hits = 3},
+                         {.lower = -5, .upper = -4, .hits = 0},
+                         {.lower = -4, .upper = -1, .hits = 2}};
+    histogram.minimum = -8;
+    histogram.maximum = -1;
+    ChanlogChannel state = channelOf(ChanlogFormat::state, "Speaker", {}, "power");
+    state.states = {{.name = "off", .transitions = 2, .residency = 0, .dutyCycle = 0},
+                    {.name = "on", .transitions = 1, .residency = UINT64_MAX, .dutyCycle = 1.0 / 3},
+                    {.name = "low", .transitions = 0, .residency = 1, .dutyCycle = 2.0 / 3}};
+    device.chanlog.channels = {state,
+                               histogram,
+                               simple(4, "Speaker<1>", "MCA", "a_b <c>"),
+                               simple(7, {}, "MCA", {}),
+                               simple(0, "Speaker", {}, "idle"),
+                               channelOf(ChanlogFormat::invalid, "Speaker"),
+                               channelOf(ChanlogFormat::simpleArray, "Speaker", "s"),
+                               channelOf(static_cast<ChanlogFormat>(200), "Speaker")};
+    session->start();
+    device.chanlog.calls.clear();
+    session->stop();
+    EXPECT_EQ(device.chanlog.calls, "|sdsd") << "one pass";
+    EXPECT_THAT(sent(), ElementsAre(R"(Simple{"MCA_Simple_":7,"Speaker<1>_MCA_Simple_ab<c>":4})",
+                                    R"(Histogram{"SpeakerAmp_Speaker_ThermalZone1_Histogram_coiltemp":)"
+                                    R"("count=3,lower=-9,upper=0,min=-8,max=-1,unit=C::-9--5:3;-4--1:2"})",
+                                    R"(State{"Speaker_State_power":"name:on,transition:1,)"
+                                    R"(residency:18446744073709551615,duty_cycle:0.333333;)"
+                                    R"(name:low,transition:0,residency:1,duty_cycle:0.666667;"})"));
+
+    device.analyticsEvents.clear();
+    state.states.resize(1);
+    histogram.buckets.resize(2);
+    histogram.buckets[0].hits = 0;
+    device.chanlog.channels = {simple(0, "Speaker"), simple(-4, "Speaker", {}, "m"), state, histogram};
+    session->start();
+    session->stop();
+    EXPECT_THAT(sent(), IsEmpty()) << "nothing moved, nothing is sent";
 }
 
 } // namespace
