@@ -1,7 +1,6 @@
 #include "tests/workers/WorkerTest.h"
 #include "workers/sinks/ZRReportingSessionDPWorker.h"
 #include "workers/sinks/ZRReportingSessionQuilletWorker.h"
-#include "workers/sinks/ZRReportingSessionZephWorker.h"
 
 #include <thread>
 

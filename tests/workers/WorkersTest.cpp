@@ -264,7 +264,6 @@ TEST_F(WorkersTest, AccessoriesAreLookedUpAtMostOnceAMinuteAndKept) {
         EXPECT_EQ(device.accessories.lookups, c.lookups);
         EXPECT_EQ(reports(), c.events);
     }
-    EXPECT_EQ(loggedLevels(ZRReportingAudioRegistrationCategory()), "");
 }
 
 /// The call-quality service answers, and the worker's queue runs, when a test says so.
