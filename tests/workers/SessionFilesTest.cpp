@@ -258,7 +258,7 @@ TEST(SessionTraceTest, StretchesAreWhereOutputAndInputRan) {
         // Times beyond the session, in no order, and such as are none.
         {"-50 out; -20 out=false; -10 out; 3 out=false", "0-3 "},
         {"5 out; 4 out=false; 8 out; 1e300 out=false", "8-10 "},
-        {"- out; nan out; 1 out=false; 2 out; 30 out=false; 31 out", "0-1 2-10 "},
+        {"nan out; - out; 1 out=false; 2 out; 30 out=false; 31 out", "0-1 2-10 "},
     };
     for (const auto& [messages, output] : cases) {
         std::string found;

@@ -140,7 +140,7 @@ TEST_F(WorkersTest, ASecondPassesBetweenMemoryRecordsUnlessTheClockIsSetBack) {
     const auto worker = make<ZRReportingSessionMemoryLogWorker>();
     auto& requests = device.memoryLog.requests;
     const MessageRef message = messageOf({{"processIDs", Array{7, kClient}}}, 4, AudioEventTypeMemoryLog);
-    worker->handleMessage(messageOf(message->payload(), 4, 256 + AudioEventTypeMemoryLog));
+    worker->handleMessage(messageOf({}, 4, 256 + AudioEventTypeMemoryLog));
     const std::pair<std::chrono::nanoseconds, std::size_t> steps[] = {
         {0s, 1}, {1s - 1ns, 1}, {1ns, 2}, {-1h, 3}, {999ms, 3}, {-1ns, 3}, {-2s, 4}};
     for (const auto& [step, records] : steps) {
