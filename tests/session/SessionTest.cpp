@@ -273,13 +273,26 @@ TEST_F(SessionTest, SortingKeepsTheOrderOfEqualTimesAndTakesNoNumberForZero) {
          {Value(3.0), Value(1.0), Value(std::nan("")), Value(3.0), Value(-1.0), Value("soon")}) {
         messages.push_back(messageOf({{"n", messages.size() + 1}, {"zrreporting_timestamp", time}}));
     }
+    messages.push_back(messageOf({{"n", 7}}));
     EXPECT_TRUE(ZRReportingSessionMessage::sortMessages(messages));
     std::string order;
     for (const MessageRef& message : messages) {
         order += shown(message->payload(), {"n"});
     }
-    EXPECT_EQ(order, "536214");
+    EXPECT_EQ(order, "5367214");
     EXPECT_FALSE(ZRReportingSessionMessage::sortMessages(messages));
+}
+
+TEST(ZRReportingSessionMessage, ACopyHasItsFlagsAndUnknownNumbersHaveNames) {
+    const auto message = messageOf({{"n", 1}}, AudioEventCategoryUnknown, 999);
+    for (const bool flag : {false, true}) {
+        message->isRedundant = flag;
+        message->isSessionStarted = !flag;
+        const auto copy = message->copyWithZone();
+        EXPECT_EQ(copy->isRedundant, flag);
+        EXPECT_EQ(copy->isSessionStarted, !flag);
+        EXPECT_EQ(copy->description(), formatted("category=Undefined type=Generic {}", message->payload()));
+    }
 }
 
 } // namespace
