@@ -1,6 +1,7 @@
 #include "tests/fakes/FakePlatform.h"
 #include "tests/fakes/Messages.h"
 #include "tests/session/ScriptedWorkers.h"
+#include "util/Log.h"
 
 #include <gmock/gmock.h>
 
