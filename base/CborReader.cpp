@@ -315,10 +315,11 @@ bool CborReader::readString(const Head& head, Value& value) {
     }
     if (keySets_ != nullptr) {
         std::optional<Value> text = keySets_->textValue(bytes);
-        if (text) {
-            value = *std::move(text);
+        if (!text) {
+            return fail(CborError::notUtf8);
         }
-        return text || fail(CborError::notUtf8);
+        value = *std::move(text);
+        return true;
     }
     value = Value(bytes);
     return isUtf8(bytes) || fail(CborError::notUtf8);

@@ -75,7 +75,7 @@ TEST_F(Fault, WhatIsNoRequestEndsItsConnectionOnceWhatCameBeforeIsAnsweredIfNoth
 TEST_F(Fault, AQueueThatWaitsHoldsSendersBackAndServesThemInFull) {
     ServiceProcess& service =
         start({.isInternalBuild = true,
-               .preferences = {{kCaptures, R"({"enable_stackburst": true, "wait_time": 1.5e6})"}},
+               .preferences = {{kCaptures, R"({"enable_stackburst": true, "wait_time": 5e6})"}},
                .environment = {{"TAMBLO_LOG", "error"}}});
     Session client(service.socketPath());
     Session manySmall(service.socketPath(), 8);
