@@ -1,5 +1,6 @@
 #include "platform/linux/device/LinuxDeviceConditions.h"
 
+#include "base/Format.h"
 #include "base/NumberText.h"
 #include "os/Directory.h"
 #include "os/SmallFile.h"
@@ -53,10 +54,11 @@ int stateOfZone(const std::string& zone) {
         if (!name.starts_with("trip_point_") || !name.ends_with(kTypeSuffix)) {
             continue;
         }
-        const int reachedState = stateOfTripPoint(zone + '/' + name);
+        const int reachedState = stateOfTripPoint(formatted("{}/{}", zone, name));
         name.replace(name.size() - kTypeSuffix.size(), kTypeSuffix.size(), "_temp");
         // Drivers give 0 or less for a trip point that is not in use.
-        const auto threshold = reachedState > state ? readNumber(zone + '/' + name) : std::nullopt;
+        const auto threshold =
+            reachedState > state ? readNumber(formatted("{}/{}", zone, name)) : std::nullopt;
         if (threshold && *threshold > 0 && *temperature >= *threshold) {
             state = reachedState;
         }
@@ -75,7 +77,7 @@ int LinuxDeviceConditions::thermalState() const {
         int state = 0;
         for (const std::string& name : DirectoryEntries::read(zones, kMaximumEntries).names) {
             if (name.starts_with("thermal_zone")) {
-                state = std::max(state, stateOfZone(zones + '/' + name));
+                state = std::max(state, stateOfZone(formatted("{}/{}", zones, name)));
             }
         }
         return state;
