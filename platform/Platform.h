@@ -12,6 +12,7 @@
 #include "platform/DeviceProperties.h"
 #include "platform/DiagnosticCaptureService.h"
 #include "platform/DiagnosticsMetricsService.h"
+#include "platform/Limits.h"
 #include "platform/MemoryLog.h"
 #include "platform/NamedNotifications.h"
 #include "platform/PowerEventLog.h"
@@ -32,6 +33,7 @@ namespace tamblo {
 /// All are there before anything uses one. In the order in which they may need each other: the last goes
 /// first, and while the work queues go, what was posted may still use all others.
 struct Platform {
+    Limits limits; ///< before any service, as they need none and all may ask
     std::unique_ptr<StructuredLog> log;
     std::unique_ptr<Clock> clock;
     std::unique_ptr<TracePoints> tracePoints;

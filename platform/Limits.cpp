@@ -1,0 +1,51 @@
+#include "platform/Limits.h"
+
+#include "platform/Preferences.h"
+
+#include <array>
+#include <optional>
+#include <utility>
+
+namespace tamblo {
+
+namespace {
+
+using Member = std::size_t Limits::*;
+
+constexpr std::array kMembers = std::to_array<std::pair<std::string_view, Member>>({
+    {"reporters_of_message", &Limits::reportersOfMessage},
+    {"entries_of_dictionary", &Limits::entriesOfDictionary},
+    {"key_bytes", &Limits::keyBytes},
+    {"decoded_bytes_of_frame", &Limits::decodedBytesOfFrame},
+    {"application_name_bytes", &Limits::applicationNameBytes},
+    {"configuration_bytes_of_session", &Limits::configurationBytesOfSession},
+    {"configuration_bytes_of_user", &Limits::configurationBytesOfUser},
+    {"previous_keys_of_session", &Limits::previousKeysOfSession},
+    {"sessions_of_connection", &Limits::sessionsOfConnection},
+    {"sessions_of_user", &Limits::sessionsOfUser},
+    {"connections_of_user", &Limits::connectionsOfUser},
+    {"retained_bytes_of_user", &Limits::retainedBytesOfUser},
+    {"retained_bytes", &Limits::retainedBytes},
+    {"waiting_requests", &Limits::waitingRequests},
+    {"waiting_bytes", &Limits::waitingBytes},
+    {"waiting_bytes_of_user", &Limits::waitingBytesOfUser},
+    {"unfinished_bytes_of_user", &Limits::unfinishedBytesOfUser},
+    {"frame_seconds", &Limits::frameSeconds},
+    {"reply_bytes", &Limits::replyBytes},
+    {"reply_bytes_of_user", &Limits::replyBytesOfUser},
+});
+
+} // namespace
+
+Limits Limits::read(const Preferences& preferences) {
+    Limits limits;
+    for (const auto& [name, member] : kMembers) {
+        const std::optional<Value> value = preferences.copyPreferenceValue(name, kLimitsDomain);
+        if (value && value->isNumber() && value->integerValue() > 0) {
+            limits.*member = static_cast<std::size_t>(value->integerValue());
+        }
+    }
+    return limits;
+}
+
+} // namespace tamblo
