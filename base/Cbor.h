@@ -27,10 +27,22 @@ enum class CborError : std::uint8_t {
     duplicateKey,
     notUtf8,
     integerOutOfRange,
+    // What the reader's limits forbid.
+    tooManyEntries,
+    keyTooLong,
+    tooLarge,
 };
 
 /// For people: "a map holds a key twice".
 [[nodiscard]] std::string_view describe(CborError error) noexcept;
+
+/// What a reader accepts at most. The bytes are those of the values in memory, about: an empty array is one
+/// byte of CBOR, and sixty-four here.
+struct CborLimits {
+    std::size_t entries = static_cast<std::size_t>(-1); ///< of all maps together
+    std::size_t keyBytes = static_cast<std::size_t>(-1);
+    std::size_t decodedBytes = static_cast<std::size_t>(-1);
+};
 
 /// Writes CBOR items in their shortest heads, definite lengths, maps in key order.
 class CborWriter {
@@ -75,13 +87,16 @@ public:
         end
     };
 
-    explicit CborReader(std::span<const std::uint8_t> bytes, KeySetCache* keySets = nullptr) noexcept
-        : position_(bytes.data()), end_(bytes.data() + bytes.size()), keySets_(keySets) {}
+    explicit CborReader(std::span<const std::uint8_t> bytes, KeySetCache* keySets = nullptr,
+                        const CborLimits& limits = {}) noexcept
+        : position_(bytes.data()), end_(bytes.data() + bytes.size()), keySets_(keySets), limits_(limits) {}
     CborReader(const CborReader&) = delete;
     CborReader& operator=(const CborReader&) = delete;
 
     [[nodiscard]] CborError error() const noexcept { return error_; }
     [[nodiscard]] bool atEnd() const noexcept { return position_ == end_; }
+    /// What the values that were read take, as the limits count it.
+    [[nodiscard]] std::size_t decodedBytes() const noexcept { return decodedBytes_; }
     /// The type of the next item; `end` at the end of the bytes or after an error.
     [[nodiscard]] Type peek() const noexcept;
     [[nodiscard]] bool nextIsNull() const noexcept { return position_ != end_ && *position_ == 0xF6; }
@@ -140,10 +155,18 @@ private:
     bool makeDictionary(Dictionary& dictionary, std::size_t firstEntry, std::size_t spare);
     bool atBreak() noexcept;
     [[nodiscard]] MapEntries& entries() noexcept;
+    /// Counts what a value takes, before it is made.
+    bool charge(std::size_t bytes) noexcept {
+        decodedBytes_ += bytes;
+        return decodedBytes_ <= limits_.decodedBytes || fail(CborError::tooLarge);
+    }
 
     const std::uint8_t* position_;
     const std::uint8_t* end_;
     KeySetCache* keySets_;
+    const CborLimits limits_;
+    std::size_t decodedBytes_ = 0;
+    std::size_t entriesRead_ = 0;
     MapEntries ownEntries_; ///< without a cache
     CborError error_ = CborError::none;
 };

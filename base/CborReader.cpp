@@ -15,6 +15,11 @@ constexpr std::uint8_t kBreak = 0xFF;
 constexpr unsigned kShortText = 0x60; ///< to 0x77: a text whose length is in its first byte
 constexpr std::uint64_t kDateTag = 1;
 
+// What values take in memory, about: a value in a list, and the blocks of those that have one.
+constexpr std::size_t kElementBytes = sizeof(Value);
+constexpr std::size_t kEntryBytes = 2 * sizeof(Value); ///< and its part of a key set
+constexpr std::size_t kBlockBytes = 64;
+
 std::uint64_t loadBigEndian(const std::uint8_t* from, unsigned count) noexcept {
     std::uint64_t value = 0;
     for (unsigned i = 0; i < count; ++i) {
@@ -42,7 +47,7 @@ float halfToSingle(std::uint16_t half) noexcept {
 } // namespace
 
 std::string_view describe(CborError error) noexcept {
-    constexpr std::array<std::string_view, 11> texts{
+    constexpr std::array<std::string_view, 14> texts{
         "no error",
         "the item ends too early",
         "not well-formed",
@@ -54,8 +59,11 @@ std::string_view describe(CborError error) noexcept {
         "a map holds a key twice",
         "text that is not UTF-8",
         "an integer below -2^63",
+        "too many entries",
+        "a key that is too long",
+        "values that take too much memory",
     };
-    static_assert(texts.size() == static_cast<std::size_t>(CborError::integerOutOfRange) + 1);
+    static_assert(texts.size() == static_cast<std::size_t>(CborError::tooLarge) + 1);
     return texts[static_cast<std::size_t>(error)];
 }
 
@@ -263,6 +271,9 @@ bool CborReader::takeBytes(const Head& head, std::string_view& bytes) noexcept {
     if (static_cast<std::uint64_t>(end_ - position_) < head.argument) {
         return fail(CborError::truncated);
     }
+    if (!charge(head.argument)) {
+        return false;
+    }
     bytes = {reinterpret_cast<const char*>(position_), static_cast<std::size_t>(head.argument)};
     position_ += head.argument;
     return true;
@@ -347,10 +358,13 @@ bool CborReader::readArray(const Head& head, Value& value, int depth) {
     if (depth > kMaximumDepth) {
         return fail(CborError::tooDeep);
     }
+    if (!charge(kBlockBytes)) {
+        return false;
+    }
     Array elements;
     const bool isIndefinite = head.info == kIndefinite;
     for (std::uint64_t i = 0; isIndefinite ? !atBreak() : i < head.argument; ++i) {
-        if (!readItem(elements.emplace_back(), depth)) {
+        if (!charge(kElementBytes) || !readItem(elements.emplace_back(), depth)) {
             return false;
         }
     }
@@ -365,7 +379,8 @@ bool CborReader::readMap(const Head& head, Dictionary& dictionary, int depth, st
     MapEntries& entries = this->entries();
     const std::size_t first = entries.keys.size();
     const std::size_t assembled = entries.assembledKeys.size();
-    const bool isRead = readEntries(head, depth) && makeDictionary(dictionary, first, spare);
+    const bool isRead =
+        charge(kBlockBytes) && readEntries(head, depth) && makeDictionary(dictionary, first, spare);
     entries.keys.resize(first);
     entries.values.resize(first);
     entries.assembledKeys.resize(assembled);
@@ -400,6 +415,15 @@ bool CborReader::readEntries(const Head& head, int depth) {
         Value value;
         // The two commonest items of a message are taken without looking at all that an item may be.
         if (!(takeShortText(key) || readKey(key)) || !(takeDouble(value) || readItem(value, depth))) {
+            return false;
+        }
+        if (++entriesRead_ > limits_.entries) {
+            return fail(CborError::tooManyEntries);
+        }
+        if (key.size() > limits_.keyBytes) {
+            return fail(CborError::keyTooLong);
+        }
+        if (!charge(kEntryBytes)) {
             return false;
         }
         entries.keys.push_back(key);

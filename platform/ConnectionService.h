@@ -1,6 +1,8 @@
 #pragma once
 
 #include "base/UniqueFunction.h"
+#include "platform/ClientIdentity.h"
+#include "platform/WorkQueue.h"
 #include "platform/ZRReportingServiceProtocol.h"
 
 #include <memory>
@@ -16,7 +18,14 @@ namespace tamblo {
 class ClientConnection {
 public:
     virtual ~ClientConnection() = default;
-    [[nodiscard]] virtual pid_t peerProcessIdentifier() const noexcept = 0;
+    /// The user and the process at the other end, when it connected.
+    [[nodiscard]] virtual ClientIdentity peer() const noexcept = 0;
+    [[nodiscard]] pid_t peerProcessIdentifier() const noexcept { return peer().process; }
+    /// Whether that process still has its identifier: what was read of it by that is its own then.
+    [[nodiscard]] virtual bool isPeerThere() const noexcept = 0;
+    /// Where the client's requests are carried out, in turns with other clients'. What is posted behind a
+    /// request runs behind it.
+    [[nodiscard]] virtual const std::shared_ptr<RequestQueue>& requestQueue() const noexcept = 0;
     /// The object that answers the client's requests; held until the connection has ended.
     virtual void setExportedObject(std::shared_ptr<ZRReportingServiceProtocol> object) = 0;
     /// Called once when the connection breaks off (a reset, a protocol error).

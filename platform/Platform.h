@@ -1,6 +1,7 @@
 #pragma once
 
 #include "platform/Accessories.h"
+#include "platform/Activity.h"
 #include "platform/AnalyticsEventService.h"
 #include "platform/BugCaptureService.h"
 #include "platform/BugReportDraftingService.h"
@@ -33,7 +34,8 @@ namespace tamblo {
 /// All are there before anything uses one. In the order in which they may need each other: the last goes
 /// first, and while the work queues go, what was posted may still use all others.
 struct Platform {
-    Limits limits; ///< before any service, as they need none and all may ask
+    Limits limits{};
+    std::unique_ptr<Activity> activity = std::make_unique<Activity>();
     std::unique_ptr<StructuredLog> log;
     std::unique_ptr<Clock> clock;
     std::unique_ptr<TracePoints> tracePoints;

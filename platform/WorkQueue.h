@@ -41,6 +41,25 @@ public:
     virtual void resume() = 0;
 };
 
+/// One client's requests: work that runs on the reporting server queue, one piece at a time in the order
+/// posted, in turns with that of the other clients. It holds what it was given until that has run; letting
+/// go of the queue itself drops nothing.
+class RequestQueue {
+public:
+    virtual ~RequestQueue() = default;
+    /// From any thread, without blocking. The work runs later, never inside this call.
+    virtual void post(Work work, Pace pace = Pace::quick) = 0;
+    /// From the queue's own work: the rest of a request that takes long. Runs before whatever was posted,
+    /// once other clients have had their turns; one for each piece of work.
+    virtual void postNext(Work work, Pace pace = Pace::quick) = 0;
+    /// No further piece begins until each `suspend` has had its `resume`. From any thread.
+    virtual void suspend() = 0;
+    virtual void resume() = 0;
+    /// Drops what waits, the rest of a request too, without running it, and takes back every `suspend`. On
+    /// the reporting server queue, outside the queue's own work.
+    virtual void abandon() = 0;
+};
+
 /// One call that is to come. Destroying it calls it off; a call that has begun is not waited for.
 class DelayedCall {
 public:

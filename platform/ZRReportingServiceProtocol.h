@@ -13,6 +13,7 @@ namespace tamblo {
 struct ReplyError {
     std::string domain;
     std::int64_t code = 0;
+    std::string message{}; ///< for people; empty: absent
 };
 
 /// Replies: the error, null when there is none, then the result. A reply may be called from any thread, more

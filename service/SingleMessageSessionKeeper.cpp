@@ -62,7 +62,14 @@ void SingleMessageSessionKeeper::reapSingleMessageSession() {
     }
     log::info(ZRReportingServiceDelegateCategory(), "Stopping singleMessageSession after timeout={}",
               kTimeout.count());
-    stop();
+    stopSome(std::exchange(singleMessageSession_, nullptr));
+}
+
+void SingleMessageSessionKeeper::stopSome(SessionRef session) {
+    if (!session->stopSome()) {
+        const auto rest = [session = std::move(session)](auto& keeper) { keeper.stopSome(session); };
+        context_.serverQueue().post(whileAlive(weak_from_this(), rest), Pace::mayBlock);
+    }
 }
 
 void SingleMessageSessionKeeper::stop() {

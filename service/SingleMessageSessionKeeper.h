@@ -32,6 +32,8 @@ private:
     [[nodiscard]] SessionRef create();
     void tickLater();
     void reapSingleMessageSession();
+    /// Stops a session that is nobody's any more, in parts.
+    void stopSome(SessionRef session);
 
     Context& context_;
     SessionRef singleMessageSession_;

@@ -3,8 +3,10 @@
 #include "session/ZRReportingSession.h"
 #include "util/AudioEvents.h"
 #include "util/Log.h"
+#include "util/MessageKeys.h"
 #include "util/TraceEvents.h"
 
+#include <algorithm>
 #include <utility>
 
 namespace tamblo {
@@ -15,9 +17,13 @@ constexpr std::string_view ZRReporterProxyKeyReporterID = "reporterID";
 constexpr std::string_view ZRReporterProxyKeyServiceType = "serviceType";
 constexpr std::string_view kErrorDomain = "com.vandra.audio.reporting";
 constexpr std::int64_t kReportingDisabled = 1;
+/// How many sessions of a client that leaves are looked at in one piece of work.
+constexpr std::size_t kSessionsLeftAtOnce = 16;
 constexpr int kExitStatusKilled = 2;
 /// More retained messages than this take a moment to free.
 constexpr std::size_t kManyMessages = 10'000;
+/// A message to more sessions than this is sent to so many at a time.
+constexpr std::size_t kRecipientsAtOnce = 32;
 
 template <typename Reply, typename... Result> void answer(Reply& reply, const Result&... result) {
     if (reply) {
@@ -25,32 +31,96 @@ template <typename Reply, typename... Result> void answer(Reply& reply, const Re
     }
 }
 
+void refuse(BooleanReply& reply, const ReplyError& error) {
+    if (reply) {
+        reply(&error, false);
+    }
+}
+
+/// The bytes of the longest name of the application that a configuration gives.
+std::size_t applicationNameBytes(const Dictionary& configuration) {
+    std::size_t longest = 0;
+    for (const auto key : {ZRReportingApplicationName, ZRReportingMessageQVHostApplicationDisplayID}) {
+        const Value* const name = configuration.find(key);
+        longest = std::max(longest, name != nullptr ? name->stringValue().size() : 0);
+    }
+    return longest;
+}
+
 } // namespace
 
+/// A message on its way to many sessions.
+struct ZRReportingClientServerInstance::Sending {
+    Dictionary message;
+    std::uint32_t category;
+    std::uint16_t type;
+    bool isForStartedOnly; ///< those that are stopped meanwhile are left out
+    std::vector<SessionRef> recipients;
+    std::size_t next = 0;
+    ErrorReply reply;
+
+    [[nodiscard]] MessageRef record() const {
+        return std::make_shared<ZRReportingSessionMessage>(message, category, type);
+    }
+};
+
 ZRReportingClientServerInstance::ZRReportingClientServerInstance(
-    Context& context, pid_t processIdentifier, std::weak_ptr<ZRReportingServiceDelegateProtocol> delegate)
-    : context_(context), processIdentifier_(processIdentifier), delegate_(std::move(delegate)) {
-    log::standard(ZRReportingServiceDelegateCategory(), "new client with pid {}", processIdentifier);
+    Context& context, Origin origin, std::shared_ptr<RequestQueue> requests,
+    std::weak_ptr<ZRReportingServiceDelegateProtocol> delegate)
+    : context_(context),
+      origin_(std::move(origin)),
+      requests_(std::move(requests)),
+      delegate_(std::move(delegate)) {
+    log::standard(ZRReportingServiceDelegateCategory(), "new client with pid {}", processIdentifier());
 }
 
 ZRReportingClientServerInstance::~ZRReportingClientServerInstance() {
     log::standard(ZRReportingServiceDelegateCategory(), "dealloc {} from the server client list",
-                  processIdentifier_);
+                  processIdentifier());
 }
 
 template <typename Piece> void ZRReportingClientServerInstance::onServerQueue(Pace pace, Piece piece) {
     auto work = [client = shared_from_this(), piece = std::move(piece)]() mutable { piece(*client); };
-    context_.serverQueue().post(std::move(work), pace);
+    requests_->post(std::move(work), pace);
+}
+
+template <typename Piece> void ZRReportingClientServerInstance::afterTurnsOfOthers(Pace pace, Piece piece) {
+    auto work = [client = shared_from_this(), piece = std::move(piece)]() mutable { piece(*client); };
+    requests_->postNext(std::move(work), pace);
 }
 
 void ZRReportingClientServerInstance::createReportingSession(ReporterID reporterID, BooleanReply reply) {
     onServerQueue(Pace::quick, [reporterID, reply = std::move(reply)](auto& client) mutable {
-        log::debug(ZRReportingServiceDelegateCategory(), "creating session for reporter {}", reporterID);
-        emitTracePoint(client.context_, TraceEvent::createReportingSession);
-        client.storeSession(reporterID, client.makeSession(reporterID));
-        log::standard(ZRReportingServiceDelegateCategory(), "session created for reporter {}", reporterID);
-        answer(reply, true);
+        client.performCreate(reporterID, std::move(reply));
     });
+}
+
+void ZRReportingClientServerInstance::performCreate(ReporterID reporterID, BooleanReply reply) {
+    log::debug(ZRReportingServiceDelegateCategory(), "creating session for reporter {}", reporterID);
+    emitTracePoint(context_, TraceEvent::createReportingSession);
+    if (!clientReportingSessionMap_.contains(reporterID)) {
+        if (const auto refused = beyondLimitOfSessions()) {
+            log::error(ZRReportingServiceDelegateCategory(), "a session is refused: {}. pid={} uid={}",
+                       refused->message, processIdentifier(), user());
+            refuse(reply, *refused);
+            return;
+        }
+    }
+    storeSession(reporterID, makeSession(reporterID));
+    log::standard(ZRReportingServiceDelegateCategory(), "session created for reporter {}", reporterID);
+    answer(reply, true);
+}
+
+std::optional<ReplyError> ZRReportingClientServerInstance::beyondLimitOfSessions() const {
+    const Limits& limits = context_.platform().limits;
+    if (clientReportingSessionMap_.size() >= limits.sessionsOfConnection) {
+        return limitReached("sessions_of_connection", limits.sessionsOfConnection);
+    }
+    const Delegate delegate = delegate_.lock();
+    if (delegate != nullptr && delegate->accountOf(user()).sessions >= limits.sessionsOfUser) {
+        return limitReached("sessions_of_user", limits.sessionsOfUser);
+    }
+    return std::nullopt;
 }
 
 void ZRReportingClientServerInstance::setServiceType(std::uint16_t serviceType, ReporterID reporterID,
@@ -104,12 +174,52 @@ void ZRReportingClientServerInstance::setConfiguration(Dictionary configuration,
                                                        BooleanReply reply) {
     onServerQueue(Pace::quick, [configuration = std::move(configuration), reporterID,
                                 reply = std::move(reply)](auto& client) mutable {
-        log::debug(ZRReportingServiceDelegateCategory(), "setting configuration");
-        if (const SessionRef session = client.findReportingSessionForID(reporterID, false)) {
-            session->updateConfigurationWithContentsOfConfiguration(configuration);
-        }
-        answer(reply, true);
+        client.performSetConfiguration(configuration, reporterID, std::move(reply));
     });
+}
+
+void ZRReportingClientServerInstance::performSetConfiguration(const Dictionary& configuration,
+                                                              ReporterID reporterID, BooleanReply reply) {
+    log::debug(ZRReportingServiceDelegateCategory(), "setting configuration");
+    if (const SessionRef session = findReportingSessionForID(reporterID, false)) {
+        Dictionary merged = session->configuration();
+        merged.merge(configuration);
+        const std::size_t before = heldBytes(session->configuration());
+        const std::size_t after = heldBytes(merged);
+        if (const auto refused = beyondLimitOfConfiguration(configuration, before, after)) {
+            log::error(ZRReportingServiceDelegateCategory(), "a configuration is refused: {}. pid={} uid={}",
+                       refused->message, processIdentifier(), user());
+            refuse(reply, *refused);
+            return;
+        }
+        session->updateConfigurationWithContentsOfConfiguration(configuration);
+        countConfiguration(before, after);
+    }
+    answer(reply, true);
+}
+
+std::optional<ReplyError>
+ZRReportingClientServerInstance::beyondLimitOfConfiguration(const Dictionary& added, std::size_t before,
+                                                            std::size_t after) const {
+    const Limits& limits = context_.platform().limits;
+    if (applicationNameBytes(added) > limits.applicationNameBytes) {
+        return limitReached("application_name_bytes", limits.applicationNameBytes);
+    }
+    if (after > limits.configurationBytesOfSession) {
+        return limitReached("configuration_bytes_of_session", limits.configurationBytesOfSession);
+    }
+    const Delegate delegate = delegate_.lock();
+    const std::size_t all = delegate != nullptr ? delegate->accountOf(user()).configurationBytes : 0;
+    if (after > before && all + (after - before) > limits.configurationBytesOfUser) {
+        return limitReached("configuration_bytes_of_user", limits.configurationBytesOfUser);
+    }
+    return std::nullopt;
+}
+
+void ZRReportingClientServerInstance::countConfiguration(std::size_t before, std::size_t after) const {
+    if (const Delegate delegate = hasLeft_ ? nullptr : delegate_.lock()) {
+        delegate->accountOf(user()).configurationBytes += after - before;
+    }
 }
 
 void ZRReportingClientServerInstance::startReportingSessionForID(ReporterID reporterID, BooleanReply reply) {
@@ -171,6 +281,13 @@ void ZRReportingClientServerInstance::performSend(Dictionary message, std::uint3
         return;
     }
     delegate->findReportingSessionsForIDs(reporterIDs, recipients_);
+    const bool isStopping = std::any_of(recipients_.begin(), recipients_.end(),
+                                        [](const SessionRef& session) { return session->isStopping(); });
+    if (isStopping || recipients_.size() > kRecipientsAtOnce) {
+        sendSome(std::make_unique<Sending>(Sending{std::move(message), category, type, reporterIDs.empty(),
+                                                   std::exchange(recipients_, {}), 0, std::move(reply)}));
+        return;
+    }
     const auto sendTo = [category, type](const SessionRef& session, Dictionary payload) {
         session->sendMessage(std::make_shared<ZRReportingSessionMessage>(std::move(payload), category, type));
     };
@@ -185,57 +302,104 @@ void ZRReportingClientServerInstance::performSend(Dictionary message, std::uint3
     answer(reply);
 }
 
-void ZRReportingClientServerInstance::stopReportingSessionForID(ReporterID reporterID, BooleanReply reply) {
-    onServerQueue(Pace::mayBlock, [reporterID, reply = std::move(reply)](auto& client) mutable {
-        client.performStop(reporterID);
-        answer(reply, true);
+void ZRReportingClientServerInstance::sendSome(std::unique_ptr<Sending> sending) {
+    const std::size_t end = std::min(sending->recipients.size(), sending->next + kRecipientsAtOnce);
+    while (sending->next != end) {
+        const SessionRef session = std::move(sending->recipients[sending->next++]);
+        if (session->isStopping()) {
+            // The session keeps the message for its end, and this client's requests wait for that.
+            requests_->suspend();
+            session->sendMessage(sending->record(),
+                                 [requests = requests_](const ReplyError*) { requests->resume(); });
+            break;
+        }
+        if (session->started() || !sending->isForStartedOnly) {
+            session->sendMessage(sending->record());
+        }
+    }
+    afterTurnsOfOthers(Pace::quick, [sending = std::move(sending)](auto& client) mutable {
+        if (sending->next == sending->recipients.size()) {
+            answer(sending->reply);
+        } else {
+            client.sendSome(std::move(sending));
+        }
     });
 }
 
-void ZRReportingClientServerInstance::performStop(ReporterID reporterID) {
+void ZRReportingClientServerInstance::stopReportingSessionForID(ReporterID reporterID, BooleanReply reply) {
+    onServerQueue(Pace::mayBlock, [reporterID, reply = std::move(reply)](auto& client) mutable {
+        client.performStop(reporterID, std::move(reply));
+    });
+}
+
+void ZRReportingClientServerInstance::performStop(ReporterID reporterID, BooleanReply reply) {
     log::debug(ZRReportingServiceDelegateCategory(), "stopping session for reporter {}", reporterID);
     emitTracePoint(context_, TraceEvent::stopReportingSession);
     if (reporterID == 0) {
+        answer(reply, true);
         return;
     }
     const SessionRef session = findReportingSessionForID(reporterID, false);
     if (session != nullptr && session->started()) {
-        session->stop();
-        sessionChanged(reporterID, session);
-        BooleanReply held = session->takeTransactionCompleteBlock();
-        answer(held, true);
-        logReportingSessions();
-    } else {
-        log::debug(ZRReportingServiceDelegateCategory(),
-                   "Stop called, but session==nil or session.started==false. reporterID={} session={} "
-                   "session.started={}",
-                   reporterID, session, session != nullptr && session->started());
+        stopSome(reporterID, session, std::move(reply));
+        return;
     }
+    log::debug(ZRReportingServiceDelegateCategory(),
+               "Stop called, but session==nil or session.started==false. reporterID={} session={} "
+               "session.started={}",
+               reporterID, session, session != nullptr && session->started());
     log::standard(ZRReportingServiceDelegateCategory(), "stopping {}", reporterID);
+    answer(reply, true);
+}
+
+void ZRReportingClientServerInstance::stopSome(ReporterID reporterID, const SessionRef& session,
+                                               BooleanReply reply) {
+    if (!session->stopSome()) {
+        afterTurnsOfOthers(Pace::mayBlock,
+                           [reporterID, session, reply = std::move(reply)](auto& client) mutable {
+                               client.stopSome(reporterID, session, std::move(reply));
+                           });
+        return;
+    }
+    sessionChanged(reporterID, session);
+    BooleanReply held = session->takeTransactionCompleteBlock();
+    answer(held, true);
+    logReportingSessions();
+    log::standard(ZRReportingServiceDelegateCategory(), "stopping {}", reporterID);
+    answer(reply, true);
 }
 
 void ZRReportingClientServerInstance::destroyReportingSession(ReporterID reporterID, BooleanReply reply) {
     onServerQueue(Pace::mayBlock, [reporterID, reply = std::move(reply)](auto& client) mutable {
-        client.performDestroy(reporterID);
-        answer(reply, true);
+        client.performDestroy(reporterID, std::move(reply));
     });
 }
 
-void ZRReportingClientServerInstance::performDestroy(ReporterID reporterID) {
+void ZRReportingClientServerInstance::performDestroy(ReporterID reporterID, BooleanReply reply) {
     log::debug(ZRReportingServiceDelegateCategory(), "destroying session for reporter {}", reporterID);
     emitTracePoint(context_, TraceEvent::destroyReportingSession);
     if (reporterID == 0) {
+        answer(reply, true);
         return;
     }
-    if (const SessionRef session = findReportingSessionForID(reporterID, false)) {
-        if (session->started()) {
-            session->stop();
-        }
-        clientReportingSessionMap_.erase(reporterID);
-        sessionChanged(reporterID, nullptr);
+    destroySome(reporterID, findReportingSessionForID(reporterID, false), std::move(reply));
+}
+
+void ZRReportingClientServerInstance::destroySome(ReporterID reporterID, const SessionRef& session,
+                                                  BooleanReply reply) {
+    if (session != nullptr && session->started() && !session->stopSome()) {
+        afterTurnsOfOthers(Pace::mayBlock,
+                           [reporterID, session, reply = std::move(reply)](auto& client) mutable {
+                               client.destroySome(reporterID, session, std::move(reply));
+                           });
+        return;
+    }
+    if (session != nullptr) {
+        dropSession(clientReportingSessionMap_.find(reporterID));
     }
     log::standard(ZRReportingServiceDelegateCategory(), "destroying {}", reporterID);
     logReportingSessions();
+    answer(reply, true);
 }
 
 void ZRReportingClientServerInstance::reporterID(ReporterID reporterID, DictionaryReply reply) {
@@ -253,6 +417,9 @@ void ZRReportingClientServerInstance::reporterID(ReporterID reporterID, Dictiona
 }
 
 void ZRReportingClientServerInstance::getAllReporters(ReporterIDsReply reply) {
+    if (!reply) {
+        return; // there may be many of them
+    }
     onServerQueue(Pace::quick, [reply = std::move(reply)](auto& client) mutable {
         std::vector<ReporterID> reporters;
         if (const Delegate delegate = client.delegate_.lock()) {
@@ -277,9 +444,38 @@ void ZRReportingClientServerInstance::handleConnectionError() {
     onServerQueue(Pace::mayBlock, [](auto& client) { client.endConnection(); });
 }
 
+void ZRReportingClientServerInstance::endAtOnce() {
+    requests_->abandon();
+    handleConnectionError();
+}
+
+/// Leaves the service, then stops the started sessions. No held start reply is answered.
 void ZRReportingClientServerInstance::endConnection() {
+    const Delegate delegate = delegate_.lock();
+    if (delegate != nullptr && delegate->removeClient(*this)) {
+        hasLeft_ = true;
+        leaveSome();
+    }
+}
+
+void ZRReportingClientServerInstance::leaveSome() {
+    for (std::size_t i = 0; i != kSessionsLeftAtOnce && !clientReportingSessionMap_.empty(); ++i) {
+        // Let go as soon as it is stopped, so that what it holds is not freed all at once in the end.
+        const auto entry = clientReportingSessionMap_.begin();
+        const SessionRef& session = entry->second;
+        if (session->started() && !session->stopSome()) {
+            break;
+        }
+        clientReportingSessionMap_.erase(entry);
+    }
+    if (!clientReportingSessionMap_.empty()) {
+        afterTurnsOfOthers(Pace::mayBlock, [](auto& client) { client.leaveSome(); });
+        return;
+    }
+    log::standard(ZRReportingServiceDelegateCategory(), "removing {} from the server client list",
+                  processIdentifier());
     if (const Delegate delegate = delegate_.lock()) {
-        delegate->removeClient(*this);
+        delegate->clientHasLeft(shared_from_this());
     }
 }
 
@@ -294,8 +490,9 @@ SessionRef ZRReportingClientServerInstance::findReportingSessionForID(ReporterID
 }
 
 SessionRef ZRReportingClientServerInstance::makeSession(ReporterID reporterID) const {
-    SessionRef session = ZRReportingSession::initWithID(context_, reporterID, {processIdentifier_});
-    session->setClientProcessName(clientProcessName_);
+    SessionRef session = ZRReportingSession::initWithID(context_, reporterID, {processIdentifier()});
+    session->setClientProcessName(clientProcessName());
+    session->setUser(user());
     return session;
 }
 
@@ -303,14 +500,31 @@ void ZRReportingClientServerInstance::storeSession(ReporterID reporterID, Sessio
     SessionRef& place = clientReportingSessionMap_[reporterID];
     SessionRef replaced = std::exchange(place, std::move(session));
     sessionChanged(reporterID, place);
+    const std::size_t before = replaced != nullptr ? heldBytes(replaced->configuration()) : 0;
+    countConfiguration(before, heldBytes(place->configuration()));
+    if (const Delegate delegate = hasLeft_ || replaced != nullptr ? nullptr : delegate_.lock()) {
+        ++delegate->accountOf(user()).sessions;
+    }
     if (replaced != nullptr && replaced->messages().size() > kManyMessages) {
         // Freed as a piece of work of its own, which may take its time.
         context_.serverQueue().post([session = std::move(replaced)] {}, Pace::mayBlock);
     }
 }
 
+void ZRReportingClientServerInstance::dropSession(SessionMap::iterator entry) {
+    const SessionRef session = std::move(entry->second);
+    const ReporterID reporterID = entry->first;
+    clientReportingSessionMap_.erase(entry);
+    sessionChanged(reporterID, nullptr);
+    countConfiguration(heldBytes(session->configuration()), 0);
+    if (const Delegate delegate = hasLeft_ ? nullptr : delegate_.lock()) {
+        --delegate->accountOf(user()).sessions;
+    }
+}
+
 void ZRReportingClientServerInstance::sessionChanged(ReporterID reporterID, const SessionRef& session) const {
-    if (const Delegate delegate = delegate_.lock()) {
+    // A client that has left is none whose sessions are found.
+    if (const Delegate delegate = hasLeft_ ? nullptr : delegate_.lock()) {
         delegate->sessionChanged(*this, reporterID, session);
     }
 }

@@ -1,5 +1,6 @@
 #pragma once
 
+#include "platform/ClientIdentity.h"
 #include "platform/Clock.h"
 #include "platform/WorkQueue.h"
 #include "platform/ZRReportingServiceProtocol.h"
@@ -21,16 +22,29 @@ namespace tamblo {
 /// One client: the service's answers to its requests, one object for each connection; owns the client's
 /// sessions, by reporter ID.
 ///
-/// Held by its connection, by the service among its clients or among those that leave (`LeavingClients`), and
-/// by its queued requests. The requests come on the connection's thread, which only queues them; everything
-/// else happens on the reporting server queue, and so do all fields but the process identifier.
+/// Held by its connection, by the service among its clients, and by its queued work. The requests come on the
+/// connection's thread, which only queues them; everything else happens on the reporting server queue, in the
+/// client's turns, and so do all fields that are not constant.
+///
+/// What takes long is carried out in parts, between which other clients have their turns: a stop, a message
+/// to very many sessions, the end of a client with thousands of sessions. The client's next request waits for
+/// the last part, and a message to a session that is being stopped waits for its end; so nobody sees the
+/// parts but in that others are answered meanwhile.
 class ZRReportingClientServerInstance final
     : public ZRReportingServiceProtocol,
       public std::enable_shared_from_this<ZRReportingClientServerInstance> {
 public:
     using SessionMap = std::map<ReporterID, SessionRef>;
 
-    ZRReportingClientServerInstance(Context& context, pid_t processIdentifier,
+    /// What is known of a client when it connects.
+    struct Origin {
+        ClientIdentity identity;
+        std::uint64_t acceptanceOrder; ///< the client's place in the order of acceptance, from 1
+        WallTime startDate;
+        std::optional<std::string> processName;
+    };
+
+    ZRReportingClientServerInstance(Context& context, Origin origin, std::shared_ptr<RequestQueue> requests,
                                     std::weak_ptr<ZRReportingServiceDelegateProtocol> delegate);
     ~ZRReportingClientServerInstance() override;
     ZRReportingClientServerInstance(const ZRReportingClientServerInstance&) = delete;
@@ -52,55 +66,65 @@ public:
 
     /// The connection is lost: queues the end of this client. Any thread.
     void handleConnectionError();
-    /// Leaves the service, which stops the started sessions; nothing when that was done before. No held start
-    /// reply is answered.
-    void endConnection();
-    /// The sessions, which are the client's no more.
-    [[nodiscard]] SessionMap takeSessions() noexcept { return std::exchange(clientReportingSessionMap_, {}); }
+    /// The same without the requests that wait: those are dropped. On the server queue.
+    void endAtOnce();
 
     [[nodiscard]] SessionRef findReportingSessionForID(ReporterID reporterID, bool acrossAllClients) const;
 
-    [[nodiscard]] pid_t processIdentifier() const noexcept { return processIdentifier_; }
+    [[nodiscard]] pid_t processIdentifier() const noexcept { return origin_.identity.process; }
+    [[nodiscard]] uid_t user() const noexcept { return origin_.identity.user; }
     [[nodiscard]] const SessionMap& clientReportingSessionMap() const noexcept {
         return clientReportingSessionMap_;
     }
-    [[nodiscard]] const std::optional<WallTime>& clientStartDate() const noexcept { return clientStartDate_; }
+    [[nodiscard]] std::optional<WallTime> clientStartDate() const noexcept { return origin_.startDate; }
     [[nodiscard]] const std::optional<std::string>& clientProcessName() const noexcept {
-        return clientProcessName_;
+        return origin_.processName;
     }
-    void setClientStartDate(std::optional<WallTime> date) noexcept { clientStartDate_ = date; }
-    void setClientProcessName(std::optional<std::string> name) { clientProcessName_ = std::move(name); }
     /// True for the first caller alone, who then reports how long the client was there.
     [[nodiscard]] bool claimUptimeReport() noexcept { return !std::exchange(isUptimeReported_, true); }
-    /// The client's place in the order of acceptance, from 1; 0 while it is not among the service's clients.
-    [[nodiscard]] std::uint64_t acceptanceOrder() const noexcept { return acceptanceOrder_; }
-    void setAcceptanceOrder(std::uint64_t order) noexcept { acceptanceOrder_ = order; }
+    [[nodiscard]] std::uint64_t acceptanceOrder() const noexcept { return origin_.acceptanceOrder; }
 
 private:
     using Delegate = std::shared_ptr<ZRReportingServiceDelegateProtocol>;
+    struct Sending;
 
     /// Queues a piece of this client's work; `piece` is called with the client.
     template <typename Piece> void onServerQueue(Pace pace, Piece piece);
+    /// Queues the rest of the request at hand.
+    template <typename Piece> void afterTurnsOfOthers(Pace pace, Piece piece);
+    void performCreate(ReporterID reporterID, BooleanReply reply);
     void performSetServiceType(std::uint16_t serviceType, ReporterID reporterID);
+    void performSetConfiguration(const Dictionary& configuration, ReporterID reporterID, BooleanReply reply);
     void performStart(ReporterID reporterID, BooleanReply reply);
     void performSend(Dictionary message, std::uint32_t category, std::uint16_t type,
                      const std::vector<ReporterID>& reporterIDs, ErrorReply reply);
-    void performStop(ReporterID reporterID);
-    void performDestroy(ReporterID reporterID);
+    void sendSome(std::unique_ptr<Sending> sending);
+    void performStop(ReporterID reporterID, BooleanReply reply);
+    void stopSome(ReporterID reporterID, const SessionRef& session, BooleanReply reply);
+    void performDestroy(ReporterID reporterID, BooleanReply reply);
+    void destroySome(ReporterID reporterID, const SessionRef& session, BooleanReply reply);
+    void endConnection();
+    void leaveSome();
 
     [[nodiscard]] SessionRef makeSession(ReporterID reporterID) const;
     void storeSession(ReporterID reporterID, SessionRef session);
+    /// Takes the session out of the map. It is the client's no more, and nobody finds it.
+    void dropSession(SessionMap::iterator entry);
+    /// Notes in the user's account how the bytes of a configuration have changed.
+    void countConfiguration(std::size_t before, std::size_t after) const;
+    [[nodiscard]] std::optional<ReplyError> beyondLimitOfSessions() const;
+    [[nodiscard]] std::optional<ReplyError>
+    beyondLimitOfConfiguration(const Dictionary& added, std::size_t before, std::size_t after) const;
     void sessionChanged(ReporterID reporterID, const SessionRef& session) const;
     void logReportingSessions() const;
     [[nodiscard]] bool isReportingEnabled() const noexcept;
 
     Context& context_;
-    const pid_t processIdentifier_;
+    const Origin origin_;
+    const std::shared_ptr<RequestQueue> requests_;
     const std::weak_ptr<ZRReportingServiceDelegateProtocol> delegate_;
-    std::optional<WallTime> clientStartDate_;
-    std::optional<std::string> clientProcessName_;
     SessionMap clientReportingSessionMap_;
-    std::uint64_t acceptanceOrder_ = 0;
+    bool hasLeft_ = false; ///< what is left in the map is still to be stopped
     bool isUptimeReported_ = false;
     /// The sessions of the message at hand; kept for its memory.
     std::vector<SessionRef> recipients_;

@@ -16,6 +16,9 @@ namespace tamblo {
 
 namespace {
 
+/// How long the requests that have been read may take when the service ends.
+constexpr std::chrono::seconds kShutdownPatience{5};
+
 /// Seconds from the start to the end, either way round; −1 without a start.
 Value uptimeBetween(const std::optional<WallTime>& start, WallTime end, pid_t processIdentifier,
                     const std::string& name) {
@@ -79,10 +82,18 @@ bool ZRReportingService::shouldAcceptNewConnection(ClientConnection& connection)
     if (ZRReportingServiceDelegateCategory().isOn(LogLevel::standard)) {
         log::standard(ZRReportingServiceDelegateCategory(), "newConnection: {}", connection.description());
     }
-    const auto client = std::make_shared<ZRReportingClientServerInstance>(context_, processIdentifier, self_);
+    // Read at once, as a process may be gone by the time that the queue gets to it; from a file of the
+    // kernel's, which is memory. Another process may have got its number while it was read.
+    auto name = context_.platform().processInformation->ProcessNameForPid(processIdentifier);
+    if (!connection.isPeerThere()) {
+        name.reset();
+    }
+    ZRReportingClientServerInstance::Origin origin{connection.peer(), ++lastAcceptanceOrder_,
+                                                   context_.platform().clock->now(), std::move(name)};
+    const auto client = std::make_shared<ZRReportingClientServerInstance>(context_, std::move(origin),
+                                                                          connection.requestQueue(), self_);
     connection.setExportedObject(client);
-    // The process's name is read from a file of the kernel's, which is memory.
-    context_.serverQueue().post(
+    connection.requestQueue()->post(
         whileAlive(std::weak_ptr(self_), [client](auto& service) { service.addClient(client); }));
     setHandlers(connection, client);
     connection.resume();
@@ -112,51 +123,47 @@ void ZRReportingService::setHandlers(ClientConnection& connection, const ClientR
         });
 }
 
-void ZRReportingService::addClient(const ClientRef& client) {
-    client->setAcceptanceOrder(++lastAcceptanceOrder_);
-    clients_.push_back(client);
-    client->setClientStartDate(context_.platform().clock->now());
-    client->setClientProcessName(
-        context_.platform().processInformation->ProcessNameForPid(client->processIdentifier()));
-}
-
-void ZRReportingService::removeClient(ZRReportingClientServerInstance& client) {
-    const auto place = std::lower_bound(
+std::vector<ClientRef>::iterator ZRReportingService::placeOf(const ZRReportingClientServerInstance& client) {
+    return std::lower_bound(
         clients_.begin(), clients_.end(), client.acceptanceOrder(),
         [](const ClientRef& other, std::uint64_t order) { return other->acceptanceOrder() < order; });
-    if (place == clients_.end() || place->get() != &client) {
-        return;
-    }
-    ClientRef removed = std::move(*place);
-    clients_.erase(place);
-    auto sessions = removed->takeSessions();
-    for (const auto& [reporterID, session] : sessions) {
-        sessionChanged(client, reporterID, nullptr);
-    }
-    removed->setAcceptanceOrder(0);
-    leaving_.add(std::move(removed), std::move(sessions));
-    queueFurtherStops();
 }
 
-void ZRReportingService::queueFurtherStops() {
-    if (leaving_.isEmpty() || std::exchange(areStopsQueued_, true)) {
-        return;
+void ZRReportingService::addClient(const ClientRef& client) {
+    clients_.insert(placeOf(*client), client);
+    if (isShuttingDown_) {
+        client->handleConnectionError();
     }
-    context_.serverQueue().post(whileAlive(std::weak_ptr(self_),
-                                           [](auto& service) {
-                                               service.leaving_.stopSome();
-                                               service.areStopsQueued_ = false;
-                                               service.queueFurtherStops();
-                                           }),
-                                Pace::mayBlock);
+}
+
+bool ZRReportingService::removeClient(ZRReportingClientServerInstance& client) {
+    const auto place = placeOf(client);
+    if (place == clients_.end() || place->get() != &client) {
+        return false;
+    }
+    clients_.erase(place);
+    ++leavingClients_;
+    UserAccount& account = accounts_[client.user()];
+    account.sessions -= client.clientReportingSessionMap().size();
+    for (const auto& [reporterID, session] : client.clientReportingSessionMap()) {
+        account.configurationBytes -= heldBytes(session->configuration());
+        sessionChanged(client, reporterID, nullptr);
+    }
+    return true;
+}
+
+void ZRReportingService::clientHasLeft(const ClientRef& client) {
+    --leavingClients_;
+    if (isShuttingDown_) {
+        // Its connection may end when nothing is reported any more.
+        reportClientUptime(context_, client, client->processIdentifier(), context_.platform().clock->now());
+        completeShutdown();
+    }
 }
 
 void ZRReportingService::sessionChanged(const ZRReportingClientServerInstance& client, ReporterID reporterID,
                                         const SessionRef& session) {
-    // A client that has left, or has yet to come, is none whose sessions are found.
-    if (client.acceptanceOrder() != 0) {
-        sessions_.set(reporterID, {client.acceptanceOrder(), client.processIdentifier(), session});
-    }
+    sessions_.set(reporterID, {client.acceptanceOrder(), client.processIdentifier(), session});
 }
 
 std::vector<SessionRef> ZRReportingService::getAllActiveReportingSessions() {
@@ -226,26 +233,39 @@ void ZRReportingService::findReportingSessionsForIDs(std::span<const ReporterID>
 }
 
 void ZRReportingService::shutDown(UniqueFunction<void()> completed) {
-    context_.serverQueue().post(
-        [service = std::weak_ptr(self_), completed = std::move(completed)]() mutable {
-            if (const auto held = service.lock()) {
-                held->endAllClients();
-                held->singleMessages_->stop();
-            }
-            completed();
-        },
-        Pace::mayBlock);
+    context_.serverQueue().post(whileAlive(std::weak_ptr(self_),
+                                           [completed = std::move(completed)](auto& service) mutable {
+                                               service.endAllClients(std::move(completed));
+                                           }),
+                                Pace::mayBlock);
 }
 
-void ZRReportingService::endAllClients() {
-    leaving_.stopAll();
-    // Each leaves the list as it ends.
-    const std::vector<ClientRef> remaining = clients_;
-    for (const ClientRef& client : remaining) {
-        const WallTime end = context_.platform().clock->now();
-        client->endConnection();
-        leaving_.stopAll();
-        reportClientUptime(context_, client, client->processIdentifier(), end);
+void ZRReportingService::endAllClients(UniqueFunction<void()> completed) {
+    isShuttingDown_ = true;
+    shutdownCompleted_ = std::move(completed);
+    shutdownPatience_ = context_.platform().workQueues->callAfter(
+        kShutdownPatience, [&queue = context_.serverQueue(), self = std::weak_ptr(self_)] {
+            queue.post(whileAlive(self, [](auto& service) {
+                for (const ClientRef& client : service.clients_) {
+                    client->endAtOnce();
+                }
+            }));
+        });
+    for (const ClientRef& client : clients_) {
+        client->handleConnectionError();
+    }
+    completeShutdown();
+}
+
+void ZRReportingService::completeShutdown() {
+    if (!clients_.empty() || leavingClients_ != 0) {
+        return;
+    }
+    shutdownPatience_.reset();
+    singleMessages_->stop();
+    // A client whose requests were read before the end, and are carried out after it, comes here again.
+    if (auto completed = std::exchange(shutdownCompleted_, {})) {
+        completed();
     }
 }
 

@@ -2,7 +2,7 @@
 
 #include "base/UniqueFunction.h"
 #include "platform/ConnectionService.h"
-#include "service/LeavingClients.h"
+#include "platform/WorkQueue.h"
 #include "service/SessionRegistry.h"
 #include "service/SingleMessageSessionKeeper.h"
 #include "service/ZRReportingServiceDelegateProtocol.h"
@@ -36,9 +36,9 @@ public:
 
     bool shouldAcceptNewConnection(ClientConnection& connection) override;
 
-    /// Behind what is queued already: ends every client as if its connection had been lost, stops what those
-    /// that have left before have yet to stop, and the single-message session, then calls `completed`, all on
-    /// the reporting server queue. Any thread, once.
+    /// Ends every client, behind its requests, as if its connection had been lost; requests that wait for
+    /// more than five seconds are dropped then, unanswered. Once all clients have left, stops the
+    /// single-message session and calls `completed`, on the reporting server queue. Any thread, once.
     void shutDown(UniqueFunction<void()> completed);
 
     /// While it is off, lookups find nothing and messages are refused. Nothing turns it off: no request, and
@@ -53,7 +53,9 @@ public:
     [[nodiscard]] SessionRef findReportingSessionForID(ReporterID reporterID) override;
     void findReportingSessionsForIDs(std::span<const ReporterID> reporterIDs,
                                      std::vector<SessionRef>& found) override;
-    void removeClient(ZRReportingClientServerInstance& client) override;
+    bool removeClient(ZRReportingClientServerInstance& client) override;
+    void clientHasLeft(const ClientRef& client) override;
+    [[nodiscard]] UserAccount& accountOf(uid_t user) override { return accounts_[user]; }
     void logReportingSessions() override;
     void sessionChanged(const ZRReportingClientServerInstance& client, ReporterID reporterID,
                         const SessionRef& session) override;
@@ -61,20 +63,23 @@ public:
 
 private:
     void addClient(const ClientRef& client);
-    void endAllClients();
-    /// For what clients that have left have yet to stop; one piece of work at a time.
-    void queueFurtherStops();
+    [[nodiscard]] std::vector<ClientRef>::iterator placeOf(const ZRReportingClientServerInstance& client);
+    void endAllClients(UniqueFunction<void()> completed);
+    void completeShutdown();
     void logSessionsOfClients() const;
     void setHandlers(ClientConnection& connection, const ClientRef& client);
 
     Context& context_;
     const ExitProcess exitProcess_;
     std::atomic<bool> reportingEnabled_{true};
+    std::uint64_t lastAcceptanceOrder_ = 0; ///< the listener's thread's
     std::vector<ClientRef> clients_;
-    std::uint64_t lastAcceptanceOrder_ = 0;
+    std::size_t leavingClients_ = 0; ///< whose sessions are still to be stopped
     SessionRegistry sessions_;
-    LeavingClients leaving_;
-    bool areStopsQueued_ = false;
+    UserAccounts accounts_;
+    bool isShuttingDown_ = false;
+    UniqueFunction<void()> shutdownCompleted_; ///< until it has been called
+    std::unique_ptr<DelayedCall> shutdownPatience_;
     const std::shared_ptr<SingleMessageSessionKeeper> singleMessages_;
     /// Clients and queued work hold the service weakly, through this; it owns nothing.
     std::shared_ptr<ZRReportingService> self_;

@@ -1,6 +1,7 @@
 #pragma once
 
 #include "platform/ZRReportingServiceProtocol.h"
+#include "service/UserAccounts.h"
 
 #include <memory>
 #include <span>
@@ -32,9 +33,12 @@ public:
     /// single-message session.
     virtual void findReportingSessionsForIDs(std::span<const ReporterID> reporterIDs,
                                              std::vector<SessionRef>& found) = 0;
-    /// From here on nobody finds the client or a session of its. The sessions are stopped a few at a
-    /// time, the first few before this returns. Nothing when the client is not among the accepted ones.
-    virtual void removeClient(ZRReportingClientServerInstance& client) = 0;
+    /// From here on nobody finds the client or a session of its. False when it is not among the accepted
+    /// ones.
+    virtual bool removeClient(ZRReportingClientServerInstance& client) = 0;
+    /// To be told once the sessions of a removed client are stopped and let go.
+    virtual void clientHasLeft(const ClientRef& client) = 0;
+    [[nodiscard]] virtual UserAccount& accountOf(uid_t user) = 0;
     virtual void logReportingSessions() = 0;
 
     /// To be told after every change of what a client holds under an ID, its sessions' starts and stops

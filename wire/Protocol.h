@@ -26,6 +26,7 @@ enum class FrameKind : std::uint8_t { request = 0, reply = 1, requestWithoutRepl
 
 /// The domain of the protocol's own errors; their codes are those of JSON-RPC 2.0.
 inline constexpr std::string_view kProtocolErrorDomain = "com.vandra.tamblo.protocol";
+inline constexpr std::int64_t kLimitReached = -32000; ///< JSON-RPC leaves it to the server
 inline constexpr std::int64_t kNotWellFormed = -32700;
 inline constexpr std::int64_t kNotARequest = -32600;
 inline constexpr std::int64_t kUnknownMethod = -32601;

@@ -80,7 +80,8 @@ template <typename Unsigned> bool readUnsigned(CborReader& reader, Unsigned& num
     return read.has_value() && *read <= std::numeric_limits<Unsigned>::max();
 }
 
-bool readReporterIDs(CborReader& reader, std::vector<std::int64_t>& numbers) {
+/// Keeps one more than allowed at most: the caller sees that there are too many.
+bool readReporterIDs(CborReader& reader, std::size_t atMost, std::vector<std::int64_t>& numbers) {
     numbers.clear();
     if (reader.readNull()) {
         return true;
@@ -91,7 +92,9 @@ bool readReporterIDs(CborReader& reader, std::vector<std::int64_t>& numbers) {
         if (!number) {
             return false;
         }
-        numbers.push_back(*number);
+        if (numbers.size() <= atMost) {
+            numbers.push_back(*number);
+        }
     }
     return array && reader.error() == CborError::none;
 }
@@ -104,7 +107,7 @@ bool readDictionary(CborReader& reader, Dictionary& dictionary) {
     return read.has_value();
 }
 
-bool readParameter(CborReader& reader, Parameter parameter, Request& request) {
+bool readParameter(CborReader& reader, Parameter parameter, const RequestLimits& limits, Request& request) {
     switch (parameter) {
     case Parameter::none:
         break;
@@ -128,12 +131,32 @@ bool readParameter(CborReader& reader, Parameter parameter, Request& request) {
         return number.has_value();
     }
     case Parameter::reporterIDs:
-        return readReporterIDs(reader, request.reporterIDs);
+        return readReporterIDs(reader, limits.reportersOfMessage, request.reporterIDs);
     }
     return false;
 }
 
-std::optional<Refusal> readParameters(CborReader& reader, CborReader::ArrayHead& array, Request& request) {
+/// The limit that stopped the reader, or that the request is beyond.
+std::optional<Error> limitReachedBy(const CborReader& reader, const RequestLimits& limits,
+                                    const Request& request) {
+    switch (reader.error()) {
+    case CborError::tooManyEntries:
+        return limitReached("entries_of_dictionary", limits.values.entries);
+    case CborError::keyTooLong:
+        return limitReached("key_bytes", limits.values.keyBytes);
+    case CborError::tooLarge:
+        return limitReached("decoded_bytes_of_frame", limits.values.decodedBytes);
+    default:
+        break;
+    }
+    if (request.reporterIDs.size() > limits.reportersOfMessage) {
+        return limitReached("reporters_of_message", limits.reportersOfMessage);
+    }
+    return std::nullopt;
+}
+
+std::optional<Refusal> readParameters(CborReader& reader, CborReader::ArrayHead& array,
+                                      const RequestLimits& limits, Request& request) {
     const MethodRow& method = rowOf(request.method);
     for (const Parameter parameter : parametersOf(request.method)) {
         const auto& [name, wanted] = kParameters[static_cast<std::size_t>(parameter)];
@@ -141,7 +164,10 @@ std::optional<Refusal> readParameters(CborReader& reader, CborReader::ArrayHead&
             return refusal(request, kWrongParameters,
                            formatted("{}: too few parameters: {} is missing", method.name, name));
         }
-        if (!readParameter(reader, parameter, request)) {
+        if (!readParameter(reader, parameter, limits, request)) {
+            if (auto reached = limitReachedBy(reader, limits, request)) {
+                return Refusal{.id = request.id.value_or(0), .error = *std::move(reached)};
+            }
             const bool isNoValue = reader.error() != CborError::none;
             return refusal(request, kWrongParameters,
                            formatted("{}: {}: wanted {}{}{}", method.name, name, wanted,
@@ -151,11 +177,15 @@ std::optional<Refusal> readParameters(CborReader& reader, CborReader::ArrayHead&
     if (reader.moreElements(array)) {
         return refusal(request, kWrongParameters, formatted("{}: too many parameters", method.name));
     }
+    if (auto reached = limitReachedBy(reader, limits, request)) {
+        return Refusal{.id = request.id.value_or(0), .error = *std::move(reached)};
+    }
     return std::nullopt;
 }
 
-std::optional<Refusal> readRequest(CborReader& reader, Request& request) {
+std::optional<Refusal> readRequest(CborReader& reader, const RequestLimits& limits, Request& request) {
     request.id.reset();
+    request.reporterIDs.clear();
     auto frame = reader.readArrayHead();
     if (!frame) {
         return refusal(request, kNotARequest, "the frame is not an array");
@@ -168,7 +198,7 @@ std::optional<Refusal> readRequest(CborReader& reader, Request& request) {
         return refusal(request, kWrongParameters,
                        formatted("{}: params: wanted an array", rowOf(request.method).name));
     }
-    if (auto refused = readParameters(reader, *array, request)) {
+    if (auto refused = readParameters(reader, *array, limits, request)) {
         return refused;
     }
     if (reader.moreElements(*frame)) {
@@ -179,10 +209,15 @@ std::optional<Refusal> readRequest(CborReader& reader, Request& request) {
 
 } // namespace
 
+Error limitReached(std::string_view name, std::size_t limit) {
+    return {std::string(kProtocolErrorDomain), kLimitReached, formatted("{}: at most {}", name, limit)};
+}
+
 std::optional<Refusal> decodeRequest(std::span<const std::uint8_t> item, KeySetCache& keySets,
-                                     Request& request) {
-    CborReader reader(item, &keySets);
-    std::optional<Refusal> refused = readRequest(reader, request);
+                                     Request& request, const RequestLimits& limits) {
+    CborReader reader(item, &keySets, limits.values);
+    std::optional<Refusal> refused = readRequest(reader, limits, request);
+    request.decodedBytes = reader.decodedBytes();
     if (!refused && reader.error() == CborError::none && reader.atEnd()) [[likely]] {
         return std::nullopt;
     }

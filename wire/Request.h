@@ -6,9 +6,11 @@
 #include "wire/Protocol.h"
 #include "wire/Vocabulary.h"
 
+#include <cstddef>
 #include <cstdint>
 #include <optional>
 #include <span>
+#include <string_view>
 #include <vector>
 
 namespace tamblo::wire {
@@ -26,10 +28,18 @@ template <typename Entries, typename Numbers> struct BasicRequest {
     std::uint32_t category = 0;
     std::uint16_t type = 0;
     Numbers reporterIDs{};
+    /// What the values take, about (`CborReader::decodedBytes`).
+    std::size_t decodedBytes = 0;
 };
 /// As the service reads it, and as the client writes it, which copies nothing.
 using Request = BasicRequest<Dictionary, std::vector<std::int64_t>>;
 using RequestView = BasicRequest<const Dictionary&, std::span<const std::int64_t>>;
+
+/// What one request may ask for at most; by the names of the preferences that change them.
+struct RequestLimits {
+    CborLimits values;                                             ///< entries_of_dictionary, key_bytes, ...
+    std::size_t reportersOfMessage = static_cast<std::size_t>(-1); ///< reporters_of_message
+};
 
 /// Why a frame is not carried out.
 struct Refusal {
@@ -41,7 +51,9 @@ struct Refusal {
 /// Reads the CBOR item of one frame. The request may be one that was used before: its memory is reused. On a
 /// refusal the request is left in an unspecified state. Keys of payloads are shared through the cache.
 [[nodiscard]] std::optional<Refusal> decodeRequest(std::span<const std::uint8_t> item, KeySetCache& keySets,
-                                                   Request& request);
+                                                   Request& request, const RequestLimits& limits = {});
+/// That a limit is reached, which the text names.
+[[nodiscard]] Error limitReached(std::string_view name, std::size_t limit);
 
 /// Begins a request's frame: everything before its first parameter. What is answered belongs to
 /// `finishFrame`. An id is written in its longest form, so that `replaceId` can put another one in its place.

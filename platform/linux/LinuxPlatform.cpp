@@ -1,6 +1,8 @@
 #include "platform/linux/LinuxPlatform.h"
 
+#include "base/Format.h"
 #include "os/ServiceManager.h"
+#include "platform/linux/Health.h"
 #include "platform/linux/captures/LinuxBugCaptureService.h"
 #include "platform/linux/captures/LinuxDiagnosticCapture.h"
 #include "platform/linux/captures/LinuxMemoryLog.h"
@@ -118,6 +120,11 @@ struct LinuxPlatform::Services {
     }
     Services(const Services&) = delete;
     Services& operator=(const Services&) = delete;
+    /// What it is doing, in a line for people.
+    [[nodiscard]] std::string status() {
+        const Activity& activity = *platform.activity;
+        return formatted("{} clients, {} sessions", connections.connectionCount(), activity.sessions.load());
+    }
 
     const wire::Directories directories;
     std::optional<SinkFiles> sinkFiles; ///< outlives the services that write them
@@ -138,6 +145,7 @@ struct LinuxPlatform::Services {
         provide<LinuxDeviceProperties>(platform.deviceProperties, directories.deviceProperties(), log);
     LinuxPreferences& preferences =
         provide<LinuxPreferences>(platform.preferences, directories.preferences(), log);
+    const Limits& limits = platform.limits = Limits::read(preferences);
     SinkFiles& sinks = sinkFiles.emplace(directories.logs, log);
     LinuxAnalyticsEventService& analyticsEvents =
         provide<LinuxAnalyticsEventService>(platform.analyticsEvents, sinks, clock, preferences, log);
@@ -156,11 +164,13 @@ struct LinuxPlatform::Services {
         provide<LinuxChanlogFacility>(platform.chanlog, directories.driverChannels(), log);
     LinuxProcessSampling& processSampling = provide<LinuxProcessSampling>(platform.processSampling);
     LinuxAccessories& accessories = provide<LinuxAccessories>(platform.accessories, log);
-    LinuxConnectionService& connections = provide<LinuxConnectionService>(platform.connections, loop, log);
+    LinuxConnectionService& connections =
+        provide<LinuxConnectionService>(platform.connections, loop, clock, log, limits);
     LinuxDiagnosticCapture& diagnosticCapture = provide<LinuxDiagnosticCapture>(
         platform.diagnosticCapture, sinks, clock, workQueues,
         [this] { return connections.clientProcesses(); }, log);
 
+    Health health{loop, [this] { return status(); }};
     Changes notificationChanges{[this] {
         // A post may tell of a preference that was written just before it.
         namedNotifications.deliverPosts([this] { preferences.readChanges(); });
@@ -200,6 +210,11 @@ void LinuxPlatform::run(SerialQueue& requestQueue,
     requestQueue.setBatchEnd([&all] {
         all.sinks.flush();
         all.connections.releaseReplies();
+        all.health.update();
+    });
+    all.loop.setTurns([&all] { return all.connections.readSome(); });
+    all.workQueues.setHelper([&all](std::chrono::milliseconds delay) {
+        all.loop.post([&all, delay] { all.loop.callAfter(delay, [&all] { all.workQueues.help(); }); });
     });
     all.workQueues.setRunEnd([&all] { all.callQuality.flush(); });
     all.connections.setRequestQueue(requestQueue, all.workQueues);
@@ -209,6 +224,7 @@ void LinuxPlatform::run(SerialQueue& requestQueue,
         shutDown([&all] { all.loop.post([&all] { all.loop.stop(); }); });
     });
     notifyServiceManager("READY=1");
+    all.health.watch(requestQueue);
     all.loop.run(all.workQueues);
     all.signals.letEnd();
     // What ended the loop may have left more for the queues, which the service has to outlive.

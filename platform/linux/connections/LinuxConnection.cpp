@@ -7,12 +7,17 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <chrono>
 #include <cstring>
+#include <new>
 #include <system_error>
 #include <utility>
+#include <vector>
 
 #include <sys/epoll.h>
 #include <sys/socket.h>
+#include <sys/syscall.h>
+#include <unistd.h>
 
 namespace tamblo {
 
@@ -20,6 +25,26 @@ namespace {
 
 /// Buffers above this are given back once they are empty.
 constexpr std::size_t kKeptCapacity = 64 * 1024;
+/// What a request takes while it waits, besides its values.
+constexpr std::size_t kRequestBytes = 256;
+/// A piece of the server queue ends once a client has more replies than this to get.
+constexpr std::size_t kRepliesOfPiece = 256 * 1024;
+/// A client's requests wait while its socket has refused more than this; less, where the user's others have
+/// brought together half of the user's limit.
+constexpr std::size_t kUnreadReplies = 1024 * 1024;
+constexpr std::size_t kUnreadRepliesOfMany = 64 * 1024;
+/// A peer that takes nothing for so long does not read.
+constexpr std::chrono::seconds kPatienceWithPeer{1};
+
+static_assert(kLimitErrorDomain == wire::kProtocolErrorDomain && kLimitErrorCode == wire::kLimitReached);
+
+ReplyError outOfMemory() {
+    return {std::string(kLimitErrorDomain), kLimitErrorCode, "memory: the service has none left"};
+}
+
+bool mayKillService(uid_t user) noexcept {
+    return user == 0 || user == ::geteuid();
+}
 
 void giveBackIfLarge(TextBuffer& buffer) noexcept {
     buffer.clear();
@@ -30,41 +55,104 @@ void giveBackIfLarge(TextBuffer& buffer) noexcept {
 
 } // namespace
 
-LinuxConnection::LinuxConnection(Shared& shared, FileDescriptor socket, pid_t peer, Ended ended)
-    : shared_(shared), peer_(peer), ended_(std::move(ended)), socket_(std::move(socket)) {}
+LinuxConnection::LinuxConnection(Shared& shared, FileDescriptor socket, Peer peer,
+                                 std::shared_ptr<ClientUser> user, Ended ended)
+    : shared_(shared),
+      peer_(peer.identity),
+      user_(std::move(user)),
+      peerProcess_(std::move(peer.process)),
+      ended_(std::move(ended)),
+      unfinishedPlace_(shared.unfinished.none()),
+      socket_(std::move(socket)) {}
+
+void LinuxConnection::openQueue() {
+    requests_ = shared_.turns->makeQueue(peer_, [connection = weak_from_this()] {
+        if (const auto self = connection.lock()) {
+            self->shared_.loop.post([self] { self->endBeyond(outOfMemory()); });
+        }
+    });
+}
+
+bool LinuxConnection::isPeerThere() const noexcept {
+    // Signal 0 finds a process that has ended, too, for as long as its number is its own.
+    return !peerProcess_.isOpen() ||
+           ::syscall(SYS_pidfd_send_signal, peerProcess_.get(), 0, nullptr, 0) == 0 || errno == EPERM;
+}
 
 void LinuxConnection::resume() {
+    peerProcess_.reset();
     const MutexLock lock(mutex_);
     wantsInput_ = true;
     watch();
 }
 
 std::string LinuxConnection::description() const {
-    return "<connection from pid " + std::to_string(peer_) + ">";
+    return "<connection from pid " + std::to_string(peer_.process) + ">";
 }
 
 void LinuxConnection::ready(std::uint32_t events) {
-    int socket = -1;
+    bool isReadable = false;
     {
         const MutexLock lock(mutex_);
         if ((events & EPOLLOUT) != 0) {
             send();
         }
         // Another source of this wake-up, a signal, may have ended the reading.
-        if (wantsInput_ && (events & ~static_cast<std::uint32_t>(EPOLLOUT)) != 0) {
-            socket = socket_.get();
-        }
+        isReadable = wantsInput_ && (events & ~static_cast<std::uint32_t>(EPOLLOUT)) != 0;
     }
-    if (socket < 0) {
+    if (isReadable && !std::exchange(isReadable_, true)) {
+        shared_.reading.add(shared_from_this(), user_);
+    }
+}
+
+void LinuxConnection::read() {
+    isReadable_ = false;
+    try {
+        readOnce();
+    } catch (const std::bad_alloc&) {
+        endBeyond(outOfMemory());
+    }
+}
+
+void LinuxConnection::readOnce() {
+    if (ending_ != Ending::none || isHeldBack()) {
         return;
+    }
+    int socket = -1;
+    {
+        const MutexLock lock(mutex_);
+        if (!wantsInput_) {
+            return;
+        }
+        socket = socket_.get();
     }
     std::span<const std::uint8_t> received;
     const Ending ending = receive(socket, received);
+    countUnfinished();
     if (ending != Ending::none) {
         beginEnd(ending);
     } else if (!received.empty()) {
         takeFrames(received);
     }
+}
+
+/// Whether what waits has to be carried out first; the loop then hears nothing of the socket until it is.
+bool LinuxConnection::isHeldBack() {
+    const Limits& limits = shared_.limits;
+    const MutexLock lock(mutex_);
+    bool isHeld = waitingRequests_ > limits.waitingRequests || waitingBytes_ > limits.waitingBytes;
+    if (!isHeld) {
+        const MutexLock userLock(user_->mutex);
+        isHeld = user_->waitingBytes > limits.waitingBytesOfUser;
+        if (isHeld) {
+            user_->heldBack.push_back(shared_from_this());
+        }
+    }
+    if (isHeld) {
+        isFlooded_ = true;
+        watch();
+    }
+    return isHeld;
 }
 
 LinuxConnection::Ending LinuxConnection::receive(int socket, std::span<const std::uint8_t>& received) {
@@ -101,8 +189,9 @@ LinuxConnection::Ending LinuxConnection::receive(int socket, std::span<const std
 void LinuxConnection::takeFrames(std::span<const std::uint8_t> received) {
     wire::FrameSplitter frames(received);
     std::size_t requests = 0;
+    std::size_t bytes = 0;
     for (auto item = frames.next(); item && ending_ == Ending::none; item = frames.next()) {
-        decodeAndDispatch(*item);
+        bytes += decodeAndDispatch(*item);
         ++requests;
     }
     if (ending_ == Ending::none && frames.tooLong()) {
@@ -110,20 +199,16 @@ void LinuxConnection::takeFrames(std::span<const std::uint8_t> received) {
                 .error = {std::string(wire::kProtocolErrorDomain), wire::kNotARequest,
                           "a frame is longer than 1 MiB"}});
     }
-    const std::size_t bytes = received.size() - frames.rest().size();
     keepRest(frames.rest(), frames.wanted());
-    if (requests == 0) {
+    countUnfinished();
+    if (bytes == 0) {
         return;
     }
-    const std::size_t allRequests = waitingRequests_.fetch_add(requests) + requests;
-    const std::size_t allBytes = waitingBytes_.fetch_add(bytes) + bytes;
-    if (allRequests > kMaximumWaitingRequests || allBytes > kMaximumWaitingBytes) {
-        const MutexLock lock(mutex_);
-        isFlooded_ = true;
-        watch();
-    }
-    shared_.intake.endRead(
-        requests, [self = shared_from_this(), requests, bytes] { self->carriedOut(requests, bytes); });
+    waitingRequests_ += requests;
+    waitingBytes_ += bytes;
+    user_->waitingBytes += bytes;
+    requests_->post([self = shared_from_this(), requests, bytes] { self->carriedOut(requests, bytes); });
+    shared_.intake.endRead(requests);
 }
 
 void LinuxConnection::keepRest(std::span<const std::uint8_t> rest, std::size_t wanted) {
@@ -134,12 +219,40 @@ void LinuxConnection::keepRest(std::span<const std::uint8_t> rest, std::size_t w
     unfinishedWants_ = wanted;
 }
 
-void LinuxConnection::decodeAndDispatch(std::span<const std::uint8_t> item) {
+/// Counts the beginning of a frame towards the user's, and has it watched for its progress.
+void LinuxConnection::countUnfinished() {
+    const std::size_t bytes = unfinished_.empty() ? 0 : unfinished_.capacity();
+    user_->unfinishedBytes += bytes - std::exchange(unfinishedCounted_, bytes);
+    if (bytes == 0 || ending_ != Ending::none) {
+        shared_.unfinished.forget(unfinishedPlace_);
+        return;
+    }
+    shared_.unfinished.note(*this, unfinishedPlace_);
+    if (user_->unfinishedBytes > shared_.limits.unfinishedBytesOfUser) {
+        endBeyond(limitReached("unfinished_bytes_of_user", shared_.limits.unfinishedBytesOfUser));
+    }
+}
+
+void LinuxConnection::endUnfinished() {
+    endBeyond({std::string(kLimitErrorDomain), kLimitErrorCode,
+               formatted("frame_seconds: a frame made no progress for {}", shared_.limits.frameSeconds)});
+}
+
+std::size_t LinuxConnection::decodeAndDispatch(std::span<const std::uint8_t> item) {
     if (const auto refusal = shared_.intake.decode(item)) {
         refuse(*refusal);
-    } else {
-        dispatchRequest(*exportedObject_, shared_.intake.request(), shared_from_this());
+        return 0;
     }
+    wire::Request& request = shared_.intake.request();
+    if (request.method == wire::Method::killService && !mayKillService(peer_.user)) {
+        refuse({.id = request.id.value_or(0),
+                .error = {std::string(wire::kProtocolErrorDomain), wire::kLimitReached,
+                          "killService is for root and the service's own user"}});
+        return 0;
+    }
+    const std::size_t bytes = kRequestBytes + request.decodedBytes;
+    dispatchRequest(*exportedObject_, request, shared_from_this());
+    return bytes;
 }
 
 void LinuxConnection::refuse(const wire::Refusal& refusal) {
@@ -148,26 +261,63 @@ void LinuxConnection::refuse(const wire::Refusal& refusal) {
         wire::appendErrorReply(outgoing_, refusal.id, refusal.error);
         send();
     }
+    if (refusal.error.code == wire::kLimitReached) {
+        noteLimit(refusal.error.message);
+    }
     if (refusal.endsConnection) {
         beginEnd(Ending::interrupted);
     }
+}
+
+void LinuxConnection::noteLimit(std::string_view limit) {
+    if (!std::exchange(isLimitNoted_, true)) {
+        shared_.log.report(
+            LogLevel::error, "zrrs",
+            formatted("a client is refused: {}. pid={} uid={}", limit, peer_.process, peer_.user));
+    }
+}
+
+void LinuxConnection::endBeyond(const ReplyError& limit) {
+    if (ending_ == Ending::none) {
+        refuse({.endsConnection = true, .error = {limit.domain, limit.code, limit.message}});
+    }
+}
+
+void LinuxConnection::turnAway(const ReplyError& reason) {
+    refuse({.error = {reason.domain, reason.code, reason.message}});
 }
 
 void LinuxConnection::replied() {
     if (!std::exchange(hasHeldReplies_, true)) {
         shared_.heldReplies.add(shared_from_this());
     }
-    if (held_.size() > kMaximumWaitingReplies) {
-        giveUp();
+    if (held_.size() > kRepliesOfPiece) {
+        // They go before there are more; a client that reads them does not pay for having asked for much.
+        shared_.turns->endPiece();
     }
 }
 
 void LinuxConnection::carriedOut(std::size_t requests, std::size_t bytes) {
-    const std::size_t requestsLeft = waitingRequests_.fetch_sub(requests) - requests;
-    const std::size_t bytesLeft = waitingBytes_.fetch_sub(bytes) - bytes;
+    waitingRequests_ -= requests;
+    waitingBytes_ -= bytes;
+    readOn();
+    if ((user_->waitingBytes -= bytes) > shared_.limits.waitingBytesOfUser) {
+        return;
+    }
+    std::vector<std::shared_ptr<LinuxConnection>> heldBack;
+    {
+        const MutexLock lock(user_->mutex);
+        heldBack.swap(user_->heldBack);
+    }
+    for (const std::shared_ptr<LinuxConnection>& connection : heldBack) {
+        connection->readOn();
+    }
+}
+
+/// Whether it still waits too much is looked at when it is its turn to be read.
+void LinuxConnection::readOn() {
     const MutexLock lock(mutex_);
-    if (isFlooded_ && requestsLeft <= kMaximumWaitingRequests && bytesLeft <= kMaximumWaitingBytes) {
-        isFlooded_ = false;
+    if (std::exchange(isFlooded_, false)) {
         watch();
     }
 }
@@ -185,14 +335,12 @@ void LinuxConnection::releaseReplies() {
 }
 
 void LinuxConnection::send() {
-    if (!socket_.isOpen() || isUnwritable_) {
-        outgoing_.clear();
-        sent_ = 0;
-        return;
+    if (!socket_.isOpen()) {
+        isUnwritable_ = true;
     }
-    while (sent_ != outgoing_.size()) {
-        const ssize_t count = ::send(socket_.get(), outgoing_.data() + sent_, outgoing_.size() - sent_,
-                                     MSG_DONTWAIT | MSG_NOSIGNAL);
+    while (!isUnwritable_ && unsent() != 0) {
+        const ssize_t count =
+            ::send(socket_.get(), outgoing_.data() + sent_, unsent(), MSG_DONTWAIT | MSG_NOSIGNAL);
         if (count < 0 && errno == EINTR) {
             continue;
         }
@@ -202,23 +350,77 @@ void LinuxConnection::send() {
             break;
         }
         sent_ += static_cast<std::size_t>(count);
+        taken_ += static_cast<std::uint64_t>(count);
     }
-    if (sent_ == outgoing_.size() || isUnwritable_) {
+    if (unsent() == 0 || isUnwritable_) {
         giveBackIfLarge(outgoing_);
         sent_ = 0;
-    } else if (outgoing_.size() - sent_ > kMaximumWaitingReplies) {
-        giveUp();
+        isPatienceOver_ = false;
     } else if (sent_ > kKeptCapacity) {
         outgoing_.dropFront(sent_);
         sent_ = 0;
     }
+    countUnsent();
     watch();
+    if (outgoing_.empty() && std::exchange(isWaitingForPeer_, false)) {
+        shared_.loop.post([self = shared_from_this()] { self->end(); });
+    }
+}
+
+/// Counts what the socket has refused towards the user's, and does what its growth asks for.
+void LinuxConnection::countUnsent() {
+    const Limits& limits = shared_.limits;
+    const std::size_t mine = unsent();
+    const std::size_t all = user_->refusedBytes += mine - std::exchange(unsentCounted_, mine);
+    const bool isMuchForUser = all > limits.replyBytesOfUser / 2;
+    if (mine > limits.replyBytes || (mine != 0 && all > limits.replyBytesOfUser)) {
+        giveUp();
+    } else if (mine > (isMuchForUser ? kUnreadRepliesOfMany : kUnreadReplies)) {
+        holdRequests();
+    } else if (mine <= kUnreadReplies / 2) {
+        letRequestsGo();
+    }
+}
+
+void LinuxConnection::holdRequests() {
+    if (!isPatienceOver_ && !std::exchange(areRequestsHeld_, true)) {
+        requests_->suspend();
+        shared_.loop.post([self = shared_from_this()] { self->awaitPeerReads(); });
+    }
+}
+
+void LinuxConnection::letRequestsGo() {
+    if (std::exchange(areRequestsHeld_, false)) {
+        requests_->resume();
+    }
+}
+
+void LinuxConnection::awaitPeerReads() {
+    const MutexLock lock(mutex_);
+    shared_.loop.callAfter(kPatienceWithPeer, [self = shared_from_this(), taken = taken_] {
+        self->lookWhetherPeerReads(taken);
+    });
+}
+
+void LinuxConnection::lookWhetherPeerReads(std::uint64_t takenBefore) {
+    MutexLock lock(mutex_);
+    if (!areRequestsHeld_) {
+        return;
+    }
+    if (taken_ == takenBefore) {
+        isPatienceOver_ = true;
+        letRequestsGo();
+        return;
+    }
+    lock.unlock();
+    awaitPeerReads();
 }
 
 /// Keeps nothing more for the client, and ends the connection.
 void LinuxConnection::giveUp() {
     isUnwritable_ = true;
     held_.reset();
+    letRequestsGo();
     shared_.loop.post([self = shared_from_this()] { self->beginEnd(Ending::interrupted); });
 }
 
@@ -242,7 +444,7 @@ void LinuxConnection::watch() {
         shared_.log.report(
             LogLevel::error, "zrrs",
             formatted("a client is turned away, since its socket cannot be watched: {}. pid={}",
-                      std::generic_category().message(errno), peer_));
+                      std::generic_category().message(errno), peer_.process));
         wantsInput_ = false;
         giveUp();
         return;
@@ -262,15 +464,36 @@ void LinuxConnection::beginEnd(Ending ending) {
     }
     ending_ = ending;
     stopReading();
+    countUnfinished();
     // What was read before is carried out, and answered, first. Replies go at the end of a batch, so the end
     // of the connection waits for the batch after the one that carries out the last request.
-    SerialQueue& queue = shared_.intake.queue();
-    queue.post([&queue, self = shared_from_this()]() mutable {
+    requests_->post([self = shared_from_this()]() mutable {
+        SerialQueue& queue = self->shared_.intake.queue();
         queue.post([self = std::move(self)] { self->shared_.loop.post([self] { self->end(); }); });
     });
 }
 
+/// Whether the peer, which sends no more, is still to take replies.
+bool LinuxConnection::waitsForPeer() {
+    const MutexLock lock(mutex_);
+    isWaitingForPeer_ = ending_ == Ending::orderly && unsent() != 0 && !isUnwritable_ && !isPatienceOver_;
+    return isWaitingForPeer_;
+}
+
 void LinuxConnection::end() {
+    if (!ended_) {
+        return;
+    }
+    if (waitsForPeer()) {
+        shared_.loop.callAfter(kPatienceWithPeer, [self = shared_from_this()] {
+            {
+                const MutexLock lock(self->mutex_);
+                self->isPatienceOver_ = true;
+            }
+            self->end();
+        });
+        return;
+    }
     if (ending_ == Ending::interrupted && interruptionHandler_) {
         interruptionHandler_();
     }
@@ -287,10 +510,12 @@ void LinuxConnection::end() {
         isUnwritable_ = true;
         outgoing_.reset();
         held_.reset();
+        sent_ = 0;
+        countUnsent();
         watch();
         socket_.reset();
     }
-    ended_(shared_from_this());
+    std::exchange(ended_, Ended())(shared_from_this());
 }
 
 } // namespace tamblo

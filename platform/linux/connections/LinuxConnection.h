@@ -4,69 +4,96 @@
 #include "base/TextBuffer.h"
 #include "os/FileDescriptor.h"
 #include "platform/ConnectionService.h"
+#include "platform/Limits.h"
+#include "platform/RequestTurns.h"
 #include "platform/StructuredLog.h"
+#include "platform/linux/connections/ClientUser.h"
 #include "platform/linux/connections/HeldReplies.h"
+#include "platform/linux/connections/ReadTurns.h"
 #include "platform/linux/connections/RequestIntake.h"
+#include "platform/linux/connections/UnfinishedFrames.h"
 #include "platform/linux/loop/EventLoop.h"
 
 #include <atomic>
 #include <cstddef>
 #include <cstdint>
 #include <memory>
+#include <optional>
 #include <span>
 #include <string>
-#include <utility>
+#include <string_view>
 
 namespace tamblo {
 
 // Whom the service trusts. Whoever may open the socket may report; who that is, is the business of the
-// directory that it lies in. Nothing a client sends is believed: not its identity (the kernel reports the
-// peer's process), not a length, a count or a name. One client can cost the others at most the limits below,
-// and its own connection.
-
-/// Reading a connection rests while more than this of it waits to be carried out: a fast client is slowed.
-inline constexpr std::size_t kMaximumWaitingRequests = 1024;
-inline constexpr std::size_t kMaximumWaitingBytes = 4 * 1024 * 1024;
-/// A client is closed once this many bytes of replies wait for their sinks, or for it to read them.
-inline constexpr std::size_t kMaximumWaitingReplies = 4 * 1024 * 1024;
+// directory that it lies in, and of the socket's mode. Nothing a client sends is believed: not its identity
+// (the kernel reports the peer's user and process), not a length, a count or a name. What it may ask for is
+// limited (`Limits`), each limit in one place: those of a frame where it is decoded, those of what waits
+// here, those of sessions and what they hold where these are kept. Within the limits, users and their
+// connections take turns by time (`ReadTurns`, `RequestTurns`). So one client can cost the others a slice of
+// time, and its own connection.
 
 /// One client's socket: splits what arrives into frames, decodes each into a call of the exported object, and
 /// sends the replies.
 ///
-/// Reading, and everything with a handler, happens on the I/O thread; one read for each wake-up, so that
-/// connections take turns. The bytes go through the buffer that all connections share; only the beginning of
-/// an unfinished frame is kept here. A frame that is no request is refused at once and not held back, as
-/// nothing is recorded for it.
+/// Reading, and everything with a handler, happens on the I/O thread; one read for each turn. The bytes go
+/// through the buffer that all connections share; only the beginning of an unfinished frame is kept here. A
+/// frame that is no request, or beyond a limit, is refused at once and not held back, as nothing is recorded
+/// for it.
 ///
 /// A reply may come from any thread, under the lock. It is kept until the sinks are written (`HeldReplies`),
 /// then sent as far as the socket takes it; the loop tells when it takes more. Sending never waits.
 ///
 /// A client can be faster than the service in two ways. Of one that sends too fast, no more is read until
-/// what waits has been carried out, so the kernel holds it back. One whose replies grow beyond their limit,
-/// in one batch or because it does not read them, cannot be held back: its connection ends. It ends, too,
-/// when the peer hangs up or breaks the protocol, and when the kernel refuses to watch the socket.
+/// what waits has been carried out, so the kernel holds it back; likewise of all connections of a user. One
+/// that asks for more than it reads has its requests held back for a moment; when it does not read on, its
+/// replies grow to their limit, and its connection ends. It ends, too, when the peer hangs up or breaks the
+/// protocol, when a frame that has begun gets no further, when there is no memory for it, and when the kernel
+/// refuses to watch the socket.
 ///
-/// An end takes its turn: what was read before is carried out and answered first. Then the handlers are
-/// called and the object is let go, last the socket: a client that sees the end of its connection is one that
-/// the service has let go of. Owned by the connection service until that has happened; replies that come
-/// later keep the object, not the socket.
+/// An end takes its turn: what was read before is carried out and answered first, as far as the peer takes
+/// it. Then the handlers are called and the object is let go, last the socket: a client that sees the end of
+/// its connection is one that the service has let go of. Owned by the connection service until that has
+/// happened; replies that come later keep the object, not the socket.
 class LinuxConnection final : public ClientConnection,
                               public EventSource,
                               public std::enable_shared_from_this<LinuxConnection> {
 public:
     /// What all connections use; outlives them.
     struct Shared {
+        Shared(EventLoop& eventLoop, StructuredLog& lines, const Limits& allowed)
+            : loop(eventLoop),
+              log(lines),
+              limits(allowed),
+              intake(allowed),
+              unfinished(eventLoop, std::chrono::seconds(allowed.frameSeconds)) {}
+
         EventLoop& loop;
         StructuredLog& log;
+        const Limits& limits;
         RequestIntake intake;
         HeldReplies heldReplies;
+        ReadTurns reading;
+        UnfinishedFrames unfinished;
+        std::optional<RequestTurns> turns; ///< before the first connection
+    };
+    struct Peer {
+        ClientIdentity identity;
+        FileDescriptor process; ///< a handle of it, where the kernel gives one
     };
     /// Called once, on the I/O thread, when nothing is left to do for the connection.
     using Ended = UniqueFunction<void(const std::shared_ptr<LinuxConnection>&)>;
 
-    LinuxConnection(Shared& shared, FileDescriptor socket, pid_t peer, Ended ended);
+    LinuxConnection(Shared& shared, FileDescriptor socket, Peer peer, std::shared_ptr<ClientUser> user,
+                    Ended ended);
+    /// Makes the queue of its requests; the first thing after the constructor.
+    void openQueue();
 
-    [[nodiscard]] pid_t peerProcessIdentifier() const noexcept override { return peer_; }
+    [[nodiscard]] ClientIdentity peer() const noexcept override { return peer_; }
+    [[nodiscard]] bool isPeerThere() const noexcept override;
+    [[nodiscard]] const std::shared_ptr<RequestQueue>& requestQueue() const noexcept override {
+        return requests_;
+    }
     void setExportedObject(std::shared_ptr<ZRReportingServiceProtocol> object) override {
         exportedObject_ = std::move(object);
     }
@@ -80,6 +107,12 @@ public:
     [[nodiscard]] std::string description() const override;
 
     void ready(std::uint32_t events) override TAMBLO_EXCLUDES(mutex_);
+    /// Its turn to be read.
+    void read() TAMBLO_EXCLUDES(mutex_);
+    /// A frame that has begun got no further.
+    void endUnfinished() TAMBLO_EXCLUDES(mutex_);
+    /// Refuses the connection as a whole, which is not resumed: the reason is sent.
+    void turnAway(const ReplyError& reason) TAMBLO_EXCLUDES(mutex_);
 
     /// Appends the frame of a reply to those that are held back. From any thread.
     template <typename AppendFrame> void reply(const AppendFrame& appendFrame) TAMBLO_EXCLUDES(mutex_) {
@@ -98,31 +131,53 @@ private:
     /// How the connection comes to its end; anything but an orderly one is an interruption first.
     enum class Ending : std::uint8_t { none, orderly, interrupted };
 
+    void readOnce() TAMBLO_EXCLUDES(mutex_);
     /// What has arrived, beginning with a frame; empty when there is none to begin with yet.
     [[nodiscard]] Ending receive(int socket, std::span<const std::uint8_t>& received);
     void takeFrames(std::span<const std::uint8_t> received) TAMBLO_EXCLUDES(mutex_);
     void keepRest(std::span<const std::uint8_t> rest, std::size_t wanted);
-    void decodeAndDispatch(std::span<const std::uint8_t> item) TAMBLO_EXCLUDES(mutex_);
+    void countUnfinished() TAMBLO_EXCLUDES(mutex_);
+    /// Answers the bytes that the decoded request takes while it waits; 0 for a refused one.
+    [[nodiscard]] std::size_t decodeAndDispatch(std::span<const std::uint8_t> item) TAMBLO_EXCLUDES(mutex_);
     void refuse(const wire::Refusal& refusal) TAMBLO_EXCLUDES(mutex_);
+    /// Ends the connection with an error frame that names the limit.
+    void endBeyond(const ReplyError& limit) TAMBLO_EXCLUDES(mutex_);
+    void noteLimit(std::string_view limit);
+    [[nodiscard]] bool isHeldBack() TAMBLO_EXCLUDES(mutex_);
     void carriedOut(std::size_t requests, std::size_t bytes) TAMBLO_EXCLUDES(mutex_);
+    void readOn() TAMBLO_EXCLUDES(mutex_);
     void beginEnd(Ending ending) TAMBLO_EXCLUDES(mutex_);
     void end() TAMBLO_EXCLUDES(mutex_);
+    [[nodiscard]] bool waitsForPeer() TAMBLO_EXCLUDES(mutex_);
     void replied() TAMBLO_REQUIRES(mutex_);
     void send() TAMBLO_REQUIRES(mutex_);
+    [[nodiscard]] std::size_t unsent() const TAMBLO_REQUIRES(mutex_) { return outgoing_.size() - sent_; }
+    void countUnsent() TAMBLO_REQUIRES(mutex_);
+    void holdRequests() TAMBLO_REQUIRES(mutex_);
+    void letRequestsGo() TAMBLO_REQUIRES(mutex_);
+    void lookWhetherPeerReads(std::uint64_t takenBefore) TAMBLO_EXCLUDES(mutex_);
+    void awaitPeerReads() TAMBLO_EXCLUDES(mutex_);
     void giveUp() TAMBLO_REQUIRES(mutex_);
     void watch() TAMBLO_REQUIRES(mutex_);
 
     Shared& shared_;
-    const pid_t peer_;
+    const ClientIdentity peer_;
+    const std::shared_ptr<ClientUser> user_;
+    std::shared_ptr<RequestQueue> requests_;
 
     // The I/O thread's.
+    FileDescriptor peerProcess_; ///< until the connection is accepted
     Ended ended_;
     std::shared_ptr<ZRReportingServiceProtocol> exportedObject_;
     UniqueFunction<void()> interruptionHandler_;
     UniqueFunction<void()> invalidationHandler_;
     TextBuffer unfinished_; ///< the beginning of a frame
     std::size_t unfinishedWants_ = 0;
+    std::size_t unfinishedCounted_ = 0; ///< with the user
+    UnfinishedFrames::Place unfinishedPlace_;
     Ending ending_ = Ending::none;
+    bool isReadable_ = false; ///< listed for its turn
+    bool isLimitNoted_ = false;
 
     std::atomic<std::size_t> waitingRequests_{0};
     std::atomic<std::size_t> waitingBytes_{0};
@@ -137,6 +192,11 @@ private:
     TextBuffer held_ TAMBLO_GUARDED_BY(mutex_);     ///< replies not yet to be seen
     TextBuffer outgoing_ TAMBLO_GUARDED_BY(mutex_); ///< replies on their way
     std::size_t sent_ TAMBLO_GUARDED_BY(mutex_) = 0;
+    std::size_t unsentCounted_ TAMBLO_GUARDED_BY(mutex_) = 0; ///< with the user
+    std::uint64_t taken_ TAMBLO_GUARDED_BY(mutex_) = 0;       ///< bytes, by the socket, ever
+    bool areRequestsHeld_ TAMBLO_GUARDED_BY(mutex_) = false;
+    bool isPatienceOver_ TAMBLO_GUARDED_BY(mutex_) = false;   ///< with a peer that did not read
+    bool isWaitingForPeer_ TAMBLO_GUARDED_BY(mutex_) = false; ///< at its end, to take what is left
 };
 
 } // namespace tamblo

@@ -5,6 +5,7 @@
 #include "os/LocalAddress.h"
 #include "wire/Protocol.h"
 
+#include <algorithm>
 #include <cerrno>
 #include <chrono>
 #include <cstdlib>
@@ -15,6 +16,7 @@
 
 #include <fcntl.h>
 #include <sys/epoll.h>
+#include <sys/resource.h>
 #include <sys/socket.h>
 #include <unistd.h>
 
@@ -30,6 +32,11 @@ constexpr std::chrono::milliseconds kAcceptPause{100};
 /// How many connections one wake-up accepts, so that those there are get their turn.
 constexpr int kAcceptsPerWakeUp = 64;
 constexpr std::string_view kLogCategory = "zrrs";
+/// Descriptors that no connection gets: for files that are opened while all others are taken.
+constexpr std::size_t kReservedDescriptors = 32;
+#ifndef SO_PEERPIDFD
+constexpr int SO_PEERPIDFD = 77; ///< of Linux 6.5
+#endif
 
 std::string because(const std::string& what, int error) {
     return what + ": " + std::strerror(error);
@@ -46,6 +53,24 @@ bool activatedSocketHas(int option, int wanted) {
     return ::getsockopt(kActivatedSocket, SOL_SOCKET, option, &value, &length) == 0 && value == wanted;
 }
 
+LinuxConnection::Peer peerOf(int socket) {
+    ucred credentials{};
+    socklen_t length = sizeof credentials;
+    ::getsockopt(socket, SOL_SOCKET, SO_PEERCRED, &credentials, &length);
+    int process = -1;
+    length = sizeof process;
+    if (::getsockopt(socket, SOL_SOCKET, SO_PEERPIDFD, &process, &length) != 0) {
+        process = -1;
+    }
+    return {{credentials.uid, credentials.pid}, FileDescriptor(process)};
+}
+
+std::size_t descriptorLimit() noexcept {
+    rlimit limit{};
+    ::getrlimit(RLIMIT_NOFILE, &limit);
+    return std::max<std::size_t>(limit.rlim_cur, 2 * kReservedDescriptors);
+}
+
 /// Whether somebody answers on the socket at this address.
 bool isAnswered(const LocalAddress& address) {
     const FileDescriptor probe(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0));
@@ -53,6 +78,10 @@ bool isAnswered(const LocalAddress& address) {
 }
 
 } // namespace
+
+LinuxConnectionService::LinuxConnectionService(EventLoop& loop, const Clock& clock, StructuredLog& log,
+                                               const Limits& limits)
+    : shared_(loop, log, limits), clock_(clock), descriptors_(descriptorLimit()) {}
 
 LinuxConnectionService::~LinuxConnectionService() {
     removeSocketFile();
@@ -172,18 +201,57 @@ void LinuxConnectionService::stopWatching() {
 }
 
 void LinuxConnectionService::accept(FileDescriptor socket) {
-    ucred credentials{};
-    socklen_t length = sizeof credentials;
-    ::getsockopt(socket.get(), SOL_SOCKET, SO_PEERCRED, &credentials, &length);
-    auto connection = std::make_shared<LinuxConnection>(shared_, std::move(socket), credentials.pid,
-                                                        [this](const auto& ended) {
-                                                            const MutexLock lock(mutex_);
-                                                            connections_.erase(ended);
-                                                        });
-    if (delegate_->shouldAcceptNewConnection(*connection)) {
-        const MutexLock lock(mutex_);
-        connections_.insert(std::move(connection));
+    const int descriptor = socket.get();
+    LinuxConnection::Peer peer = peerOf(descriptor);
+    const std::shared_ptr<ClientUser> user = userNumbered(peer.identity.user);
+    const auto connection =
+        std::make_shared<LinuxConnection>(shared_, std::move(socket), std::move(peer), user,
+                                          [this, user](const auto& gone) { ended(gone, *user); });
+    if (const auto reason = refusalOf(*user, descriptor)) {
+        connection->turnAway(*reason);
+        return;
     }
+    connection->openQueue();
+    if (delegate_->shouldAcceptNewConnection(*connection)) {
+        ++user->connections;
+        const MutexLock lock(mutex_);
+        connections_.insert(connection);
+    }
+}
+
+const std::shared_ptr<ClientUser>& LinuxConnectionService::userNumbered(uid_t user) {
+    std::shared_ptr<ClientUser>& found = users_[user];
+    if (found == nullptr) {
+        found = std::make_shared<ClientUser>(user);
+    }
+    return found;
+}
+
+std::optional<ReplyError> LinuxConnectionService::refusalOf(const ClientUser& user, int descriptor) const {
+    // One user never takes the descriptors of all.
+    const std::size_t most =
+        std::min(shared_.limits.connectionsOfUser, (descriptors_ - kReservedDescriptors) / 4 * 3);
+    if (user.connections >= most) {
+        return limitReached("connections_of_user", most);
+    }
+    // The kernel gives the lowest number that is free.
+    if (static_cast<std::size_t>(descriptor) + kReservedDescriptors >= descriptors_) {
+        return limitReached("descriptors", descriptors_ - kReservedDescriptors);
+    }
+    return std::nullopt;
+}
+
+void LinuxConnectionService::ended(const std::shared_ptr<LinuxConnection>& connection, ClientUser& user) {
+    if (--user.connections == 0) {
+        users_.erase(user.user);
+    }
+    const MutexLock lock(mutex_);
+    connections_.erase(connection);
+}
+
+std::size_t LinuxConnectionService::connectionCount() {
+    const MutexLock lock(mutex_);
+    return connections_.size();
 }
 
 std::vector<pid_t> LinuxConnectionService::clientProcesses() {

@@ -2,11 +2,15 @@
 
 #include "base/Mutex.h"
 #include "os/FileDescriptor.h"
+#include "platform/Clock.h"
 #include "platform/ConnectionService.h"
+#include "platform/Limits.h"
 #include "platform/StructuredLog.h"
 #include "platform/linux/connections/LinuxConnection.h"
 #include "platform/linux/loop/EventLoop.h"
 
+#include <cstddef>
+#include <map>
 #include <memory>
 #include <optional>
 #include <string>
@@ -19,21 +23,25 @@ namespace tamblo {
 
 /// The interprocess connection service: a local stream socket in the runtime directory, or the one that the
 /// process was started with. Listens, accepts, asks the delegate, and keeps the connections until they have
-/// ended; accepting rests while the process has no descriptors left. On the I/O thread, unless said
-/// otherwise.
+/// ended. A user may have so many; and the last descriptors that the process may have are nobody's
+/// connections, so that sinks and settings can always be opened. Accepting rests while the system has none
+/// left. On the I/O thread, unless said otherwise.
 class LinuxConnectionService final : public ConnectionService, public ConnectionListener, public EventSource {
 public:
-    /// Both must outlive the service.
-    LinuxConnectionService(EventLoop& loop, StructuredLog& log) : shared_{loop, log, {}, {}} {}
+    /// All must outlive the service.
+    LinuxConnectionService(EventLoop& loop, const Clock& clock, StructuredLog& log, const Limits& limits);
     ~LinuxConnectionService() override;
 
     /// Takes over the socket of socket activation or binds one in the directory. A text says what is in the
     /// way.
     [[nodiscard]] std::optional<std::string> open(const std::string& runtimeDirectory);
     /// The queue that carries out requests, and its threads. Before the loop runs.
-    void setRequestQueue(SerialQueue& queue, LinuxWorkQueues& threads) noexcept {
+    void setRequestQueue(SerialQueue& queue, LinuxWorkQueues& threads) {
+        shared_.turns.emplace(queue, clock_);
         shared_.intake.setQueue(queue, threads);
     }
+    /// Reads connections that have something to read; whether some are left. Once in a wake-up.
+    [[nodiscard]] bool readSome() { return shared_.reading.readSome(); }
 
     [[nodiscard]] ConnectionListener& listenerForServiceName(std::string_view serviceName) override;
     void setDelegate(ListenerDelegate& delegate) override { delegate_ = &delegate; }
@@ -42,6 +50,8 @@ public:
 
     /// The processes of the clients that are connected, each once. From any thread.
     [[nodiscard]] std::vector<pid_t> clientProcesses() TAMBLO_EXCLUDES(mutex_);
+    /// From any thread.
+    [[nodiscard]] std::size_t connectionCount() TAMBLO_EXCLUDES(mutex_);
     /// Sends what was replied since the last call. From any thread.
     void releaseReplies() { shared_.heldReplies.release(); }
     /// Takes no further connections and reads no more from those there are; the socket file goes.
@@ -53,11 +63,19 @@ private:
     [[nodiscard]] std::optional<std::string> adoptActivatedSocket();
     [[nodiscard]] std::optional<std::string> bindSocket(const std::string& path);
     void accept(FileDescriptor socket) TAMBLO_EXCLUDES(mutex_);
+    [[nodiscard]] const std::shared_ptr<ClientUser>& userNumbered(uid_t user);
+    void ended(const std::shared_ptr<LinuxConnection>& connection, ClientUser& user) TAMBLO_EXCLUDES(mutex_);
+    /// Why a user may have no further connection, if so.
+    [[nodiscard]] std::optional<ReplyError> refusalOf(const ClientUser& user, int descriptor) const;
     void pauseAccepting(int error);
     void stopWatching();
     void removeSocketFile();
 
     LinuxConnection::Shared shared_;
+    const Clock& clock_;
+    /// How many descriptors the process may have.
+    const std::size_t descriptors_;
+    std::map<uid_t, std::shared_ptr<ClientUser>> users_; ///< those with connections
     ListenerDelegate* delegate_ = nullptr;
     FileDescriptor socket_;
     std::string socketPath_; ///< empty with an activated socket

@@ -27,15 +27,30 @@ public:
         return [receiver = receiver_, id = *id_](const ReplyError* error, Result... result) {
             receiver->reply([&](TextBuffer& out) {
                 if (error != nullptr) {
-                    wire::appendErrorReply(out, id, {error->domain, error->code, {}});
+                    appendError(out, id, *error);
                 } else {
                     append(out, id, result...);
                 }
             });
         };
     }
+    /// The same for an operation that may be refused: of a request without reply, too, the client hears that,
+    /// under the id 0.
+    [[nodiscard]] BooleanReply orRefusal() const {
+        if (id_) {
+            return *this;
+        }
+        return [receiver = receiver_](const ReplyError* error, bool) {
+            if (error != nullptr) {
+                receiver->reply([&](TextBuffer& out) { appendError(out, 0, *error); });
+            }
+        };
+    }
 
 private:
+    static void appendError(TextBuffer& out, std::uint64_t id, const ReplyError& error) {
+        wire::appendErrorReply(out, id, {error.domain, error.code, error.message});
+    }
     static void append(TextBuffer& out, std::uint64_t id) { wire::appendNullReply(out, id); }
     static void append(TextBuffer& out, std::uint64_t id, std::same_as<bool> auto result) {
         wire::appendBooleanReply(out, id, result);
@@ -65,13 +80,13 @@ void dispatchRequest(ZRReportingServiceProtocol& object, wire::Request& request,
     const ReplyTo reply(request.id, receiver);
     switch (request.method) {
     case Method::createReportingSession:
-        return object.createReportingSession(reporterID, reply);
+        return object.createReportingSession(reporterID, reply.orRefusal());
     case Method::setServiceType:
         return object.setServiceType(request.serviceType, reporterID, reply);
     case Method::getServiceNameForReporterID:
         return object.getServiceNameForReporterID(reporterID, reply);
     case Method::setConfiguration:
-        return object.setConfiguration(std::move(request.dictionary), reporterID, reply);
+        return object.setConfiguration(std::move(request.dictionary), reporterID, reply.orRefusal());
     case Method::startReportingSessionForID:
         return object.startReportingSessionForID(reporterID, reply);
     case Method::sendMessage:

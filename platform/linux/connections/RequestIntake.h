@@ -1,6 +1,7 @@
 #pragma once
 
 #include "base/KeySetCache.h"
+#include "platform/Limits.h"
 #include "platform/WorkQueue.h"
 #include "platform/linux/loop/LinuxWorkQueues.h"
 #include "wire/Request.h"
@@ -27,7 +28,10 @@ inline constexpr std::size_t kRequestsPerBatch = 256;
 /// that they receive into, the decoder with the key sets that it has met, and the way to the request queue.
 class RequestIntake {
 public:
-    RequestIntake() : buffer_(new std::uint8_t[kSmallRest + kBytesPerRead]) {}
+    explicit RequestIntake(const Limits& limits)
+        : buffer_(new std::uint8_t[kSmallRest + kBytesPerRead]),
+          limits_{.values = {limits.entriesOfDictionary, limits.keyBytes, limits.decodedBytesOfFrame},
+                  .reportersOfMessage = limits.reportersOfMessage} {}
 
     /// The queue that carries requests out, and the threads that it runs on. Before the first read.
     void setQueue(SerialQueue& queue, LinuxWorkQueues& threads) noexcept {
@@ -40,12 +44,11 @@ public:
     [[nodiscard]] std::uint8_t* buffer() noexcept { return buffer_.get(); }
     /// Reads a frame's item into `request`, whose parts the next one replaces.
     [[nodiscard]] std::optional<wire::Refusal> decode(std::span<const std::uint8_t> item) {
-        return wire::decodeRequest(item, keySets_, request_);
+        return wire::decodeRequest(item, keySets_, request_, limits_);
     }
     [[nodiscard]] wire::Request& request() noexcept { return request_; }
-    /// Ends a read of so many requests; `carriedOut` runs behind the last of them.
-    void endRead(std::size_t requests, Work carriedOut) {
-        queue_->post(std::move(carriedOut));
+    /// Ends a read of so many requests.
+    void endRead(std::size_t requests) {
         if (threads_->count(requests) >= kRequestsPerBatch) {
             threads_->drain();
         }
@@ -53,6 +56,7 @@ public:
 
 private:
     const std::unique_ptr<std::uint8_t[]> buffer_;
+    const wire::RequestLimits limits_;
     KeySetCache keySets_;
     wire::Request request_;
     SerialQueue* queue_ = nullptr;

@@ -16,7 +16,7 @@ namespace tamblo {
 namespace {
 
 /// How many descriptors one wake-up serves at most.
-constexpr int kEventsPerWakeUp = 64;
+constexpr int kEventsPerWakeUp = 512;
 
 } // namespace
 
@@ -60,16 +60,15 @@ void EventLoop::post(Task task) {
 }
 
 void EventLoop::callAfter(std::chrono::milliseconds delay, Task task) {
-    deadline_ = std::chrono::steady_clock::now() + delay;
-    delayed_ = std::move(task);
+    delayed_.emplace(std::chrono::steady_clock::now() + delay, std::move(task));
 }
 
 int EventLoop::timeout() const noexcept {
-    if (!deadline_) {
+    if (delayed_.empty()) {
         return -1;
     }
-    const auto left =
-        std::chrono::ceil<std::chrono::milliseconds>(*deadline_ - std::chrono::steady_clock::now());
+    const auto left = std::chrono::ceil<std::chrono::milliseconds>(delayed_.begin()->first -
+                                                                   std::chrono::steady_clock::now());
     return static_cast<int>(std::clamp<std::chrono::milliseconds::rep>(left.count(), 0, 60'000));
 }
 
@@ -85,30 +84,37 @@ void EventLoop::runTasks() {
 }
 
 void EventLoop::runDelayed() {
-    if (deadline_ && std::chrono::steady_clock::now() >= *deadline_) {
-        deadline_.reset();
-        Task task = std::exchange(delayed_, Task());
+    const Deadline now = delayed_.empty() ? Deadline() : std::chrono::steady_clock::now();
+    while (!delayed_.empty() && delayed_.begin()->first <= now) {
+        Task task = std::move(delayed_.begin()->second);
+        delayed_.erase(delayed_.begin());
         task();
+    }
+}
+
+void EventLoop::serve(std::span<const epoll_event> events) {
+    for (const bool first : {true, false}) {
+        for (const epoll_event& event : events) {
+            auto* source = static_cast<EventSource*>(event.data.ptr);
+            if (source != nullptr && source->comesFirst() == first) {
+                source->ready(event.events);
+            }
+        }
     }
 }
 
 void EventLoop::run(LinuxWorkQueues& strands) {
     std::array<epoll_event, kEventsPerWakeUp> events;
+    bool goesOn = false;
     while (!isStopped_) {
-        const int count = ::epoll_wait(epoll_.get(), events.data(), kEventsPerWakeUp, timeout());
+        const int count = ::epoll_wait(epoll_.get(), events.data(), kEventsPerWakeUp, goesOn ? 0 : timeout());
         const auto up = std::span(events).first(static_cast<std::size_t>(std::max(count, 0)));
-        bool hasTasks = false;
+        const bool hasTasks = std::any_of(up.begin(), up.end(),
+                                          [](const epoll_event& event) { return event.data.ptr == nullptr; });
         strands.beginWakeUp();
-        for (const bool first : {true, false}) {
-            for (const epoll_event& event : up) {
-                auto* source = static_cast<EventSource*>(event.data.ptr);
-                if (source != nullptr && source->comesFirst() == first) {
-                    source->ready(event.events);
-                }
-                hasTasks = hasTasks || source == nullptr;
-            }
-        }
-        strands.endWakeUp();
+        serve(up);
+        goesOn = turns_ && turns_();
+        goesOn = strands.endWakeUp() || goesOn;
         if (hasTasks) {
             std::uint64_t ignored;
             [[maybe_unused]] const ssize_t bytes = ::read(wakeUp_.get(), &ignored, sizeof ignored);

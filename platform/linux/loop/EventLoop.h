@@ -6,7 +6,9 @@
 
 #include <chrono>
 #include <cstdint>
-#include <optional>
+#include <map>
+#include <span>
+#include <utility>
 #include <vector>
 
 struct epoll_event;
@@ -30,17 +32,18 @@ public:
 /// A wake-up goes in this order, and each step relies on those before it:
 /// 1. sources that come first. They steer the service (preferences, notifications), so that a preference
 ///    written before a message was sent is in force for that message;
-/// 2. the other sources: connections read and decode, and what they post to the queues is collected;
-/// 3. the quick part of what was collected runs, here, or within step 2 as soon as 256 requests are there:
-///    one frame costs one wake-up, not two, and a batch shares one write of the sinks and one send of the
-///    replies;
+/// 2. the other sources; then the turns of what they have found to do: connections are read and decoded, for
+///    a few milliseconds, and what they post to the queues is collected;
+/// 3. the quick part of what was collected runs for a few milliseconds, here, or within step 2 as soon as 256
+///    requests are there: one frame costs one wake-up, not two, and a batch shares one write of the sinks and
+///    one send of the replies;
 /// 4. tasks: what other threads, or the sources themselves, want done once no source of this wake-up is
 ///    looked at any more, such as the end of a connection;
-/// 5. the delayed task, if its time has come.
+/// 5. the delayed tasks whose time has come.
 ///
-/// Nothing here may block: every client waits for it. What may block is left to the pool in step 3, and a
-/// source reads a bounded piece for each wake-up; what it leaves is reported again, as the watching is
-/// level-triggered, behind the other sources. The loop sleeps without a time-out unless a task is delayed.
+/// Nothing here may block: every client waits for it. What may block is left to the pool in step 3. What the
+/// turns and the queues leave for want of time is gone on with in the next wake-up, which comes at once, with
+/// whatever else has happened. Otherwise the loop sleeps, without a time-out unless a task is delayed.
 ///
 /// The loop owns no source. Whoever does takes the descriptor out before closing it, and lets the source go
 /// in a task, since the events of a wake-up may name it until then. A descriptor that the kernel refuses to
@@ -67,8 +70,10 @@ public:
 
     /// Runs a task on the loop's thread, in the current or the next wake-up. From any thread.
     void post(Task task) TAMBLO_EXCLUDES(mutex_);
-    /// Called on the loop's thread once the time has come, at most once; a second call moves it.
+    /// Runs a task once its time has come. On the loop's thread.
     void callAfter(std::chrono::milliseconds delay, Task task);
+    /// The turns of step 2, which answer whether some are left. Before the loop runs.
+    void setTurns(UniqueFunction<bool()> turns) { turns_ = std::move(turns); }
 
     /// Returns after `stop`, which is called on the loop's thread. Lends its thread to the strands.
     void run(LinuxWorkQueues& strands);
@@ -79,6 +84,7 @@ private:
 
     [[nodiscard]] bool control(int operation, int descriptor, std::uint32_t events, EventSource* source);
     [[nodiscard]] int timeout() const noexcept;
+    void serve(std::span<const epoll_event> events);
     void runTasks() TAMBLO_EXCLUDES(mutex_);
     void runDelayed();
 
@@ -87,8 +93,8 @@ private:
     FileDescriptor wakeUp_;
     bool isOpen_ = false;
     bool isStopped_ = false;
-    std::optional<Deadline> deadline_;
-    Task delayed_;
+    std::multimap<Deadline, Task> delayed_;
+    UniqueFunction<bool()> turns_;
 
     Mutex mutex_;
     std::vector<Task> tasks_ TAMBLO_GUARDED_BY(mutex_);

@@ -13,6 +13,8 @@ namespace {
 /// lasting effect.
 constexpr std::chrono::milliseconds kSlowBatch{25};
 constexpr int kSlowBatchFactor = 4;
+/// A strand has the responsive thread for so long in a wake-up.
+constexpr std::chrono::milliseconds kLentTime{4};
 
 /// A serial queue: its user's hold on a strand, which lives on until it has run what was posted.
 class LinuxSerialQueue final : public SerialQueue {
@@ -57,9 +59,10 @@ std::unique_ptr<DelayedCall> LinuxWorkQueues::callAfter(std::chrono::millisecond
     return std::make_unique<PooledCall>(pool_, delay, std::move(call));
 }
 
-void LinuxWorkQueues::endWakeUp() {
+bool LinuxWorkQueues::endWakeUp() {
     drain();
     collector_ = std::thread::id();
+    return !collected_.empty();
 }
 
 void LinuxWorkQueues::drain() {
@@ -68,11 +71,14 @@ void LinuxWorkQueues::drain() {
         return;
     }
     // Draining one strand may post to others, which then join the list.
+    std::vector<std::shared_ptr<Strand>> left;
     for (std::size_t i = 0; i < collected_.size(); ++i) {
-        const std::shared_ptr<Strand> strand = std::move(collected_[i]);
-        strand->drainQuickly();
+        std::shared_ptr<Strand> strand = std::move(collected_[i]);
+        if (strand->drainQuickly()) {
+            left.push_back(std::move(strand));
+        }
     }
-    collected_.clear();
+    collected_.swap(left);
     endRun();
 }
 
@@ -159,8 +165,9 @@ void Strand::drain() {
     }
 }
 
-void Strand::drainQuickly() {
+bool Strand::drainQuickly() {
     Time started = std::chrono::steady_clock::now();
+    const Time lentUntil = started + kLentTime;
     bool isForPool = started < quickAllowedFrom_;
     while (!isForPool && hasBatch()) {
         runBatch(true);
@@ -170,11 +177,15 @@ void Strand::drainQuickly() {
         }
         const bool isAtBlocking = next_ != batch_.size() && !isSuspended_;
         isForPool = isAtBlocking || ended < quickAllowedFrom_;
+        if (!isForPool && ended >= lentUntil) {
+            return true;
+        }
         started = ended;
     }
     if (isForPool) {
         threads_.scheduleOnPool(shared_from_this());
     }
+    return false;
 }
 
 } // namespace tamblo

@@ -22,7 +22,8 @@ namespace tamblo {
 // Which thread that is. Waking another thread costs more than a message does, so the event loop's thread
 // runs the quick work that it posts itself. It does not run it at once: during a wake-up the strands are
 // collected, and drained together at its end or as soon as 256 requests are there, so that one write of the
-// sinks and one send of the replies serve all that was read. Everything else runs on the pool.
+// sinks and one send of the replies serve all that was read. A strand has that thread for a few milliseconds;
+// what it has left then, it goes on with in the next wake-up. Everything else runs on the pool.
 //
 // Who may block. Nobody on the event loop's thread. A piece that may block goes to the pool, and takes what
 // stands behind it along, as the order is kept. Quick work that turns out slow (a disk that stalls) sends its
@@ -47,10 +48,14 @@ public:
     [[nodiscard]] std::unique_ptr<DelayedCall> callAfter(std::chrono::milliseconds delay,
                                                          UniqueFunction<void()> call) override;
     void workOff() override { pool_.workOff(); }
+    /// For when no thread can be had; see `ThreadPool`.
+    void setHelper(ThreadPool::CallHelper callHelper) { pool_.setHelper(std::move(callHelper)); }
+    void help() { pool_.help(); }
 
     /// What the calling thread posts from now until `endWakeUp` is collected for it. One thread at a time.
     void beginWakeUp() noexcept { collector_ = std::this_thread::get_id(); }
-    void endWakeUp();
+    /// Runs what was collected; whether some is left for the next wake-up, which then is to come at once.
+    [[nodiscard]] bool endWakeUp();
     /// Runs what was collected. On the collecting thread.
     void drain();
     /// Counts what was posted towards a batch; answers how much there is since the last drain.
@@ -87,8 +92,9 @@ public:
 
     /// Runs what there is, and what that posts. By whom it was scheduled for.
     void drain();
-    /// The same, up to a piece that may block or until it takes long: the rest goes to the pool.
-    void drainQuickly();
+    /// The same for a few milliseconds, up to a piece that may block or until it takes long: the rest goes to
+    /// the pool. Answers whether it is to be called again.
+    [[nodiscard]] bool drainQuickly();
 
 private:
     struct Item {

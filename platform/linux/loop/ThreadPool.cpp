@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <chrono>
+#include <system_error>
 #include <utility>
 
 namespace tamblo {
@@ -65,7 +66,48 @@ void ThreadPool::workOff() {
         dropped.clear();
         lock.lock();
         while (!work_.empty() || busy_ != 0) {
-            isWorkedOff_.wait(lock.forWaiting());
+            if (threads_.empty()) {
+                doFirst(lock);
+            } else {
+                isWorkedOff_.wait(lock.forWaiting());
+            }
+        }
+    }
+}
+
+void ThreadPool::help() {
+    MutexLock lock(mutex_);
+    takeDueCalls();
+    if (!threads_.empty()) {
+        return;
+    }
+    if (!work_.empty()) {
+        doFirst(lock);
+    }
+    if (!work_.empty() || !delayed_.empty()) {
+        callThread();
+    }
+}
+
+void ThreadPool::callHelper() {
+    if (!callHelper_) {
+        return;
+    }
+    std::chrono::milliseconds delay{0};
+    if (work_.empty() && !delayed_.empty()) {
+        const auto left = delayed_.begin()->first.first - std::chrono::steady_clock::now();
+        delay = std::max(delay, std::chrono::ceil<std::chrono::milliseconds>(left));
+    }
+    callHelper_(delay);
+}
+
+void ThreadPool::startThread() {
+    try {
+        threads_.emplace_back([this] { run(); });
+    } catch (const std::system_error&) {
+        // Those there are will come to it.
+        if (threads_.empty()) {
+            callHelper();
         }
     }
 }
@@ -81,7 +123,7 @@ void ThreadPool::callThread() {
     }
     joinFinished();
     if (threads_.size() < kMaximumThreads) {
-        threads_.emplace_back([this] { run(); });
+        startThread();
     }
 }
 
@@ -134,22 +176,26 @@ bool ThreadPool::waitForWork(MutexLock& lock) {
 void ThreadPool::run() {
     MutexLock lock(mutex_);
     while (waitForWork(lock)) {
-        UniqueFunction<void()> work = std::move(work_.front());
-        work_.pop_front();
         if (idle_ == 0 && !delayed_.empty()) {
             // While this work blocks, another thread has to wait for the calls to come.
             callThread();
         }
-        ++busy_;
-        lock.unlock();
-        work();
-        work.reset();
-        lock.lock();
-        if (--busy_ == 0 && work_.empty()) {
-            isWorkedOff_.notify_all();
-        }
+        doFirst(lock);
     }
     finished_.push_back(std::this_thread::get_id());
+}
+
+void ThreadPool::doFirst(MutexLock& lock) {
+    UniqueFunction<void()> work = std::move(work_.front());
+    work_.pop_front();
+    ++busy_;
+    lock.unlock();
+    work();
+    work.reset();
+    lock.lock();
+    if (--busy_ == 0 && work_.empty()) {
+        isWorkedOff_.notify_all();
+    }
 }
 
 } // namespace tamblo

@@ -19,6 +19,9 @@ namespace tamblo {
 /// thread is busy, up to a limit, and a thread that finds nothing to do for some seconds ends, but for
 /// one while a call is to come: an idle process has none. The destructor works off what was posted; calls
 /// whose time has not come are dropped.
+///
+/// Where the system refuses the first thread, somebody else's has to do: the helper, a thread that was told
+/// of beforehand, is asked to call `help`. Slow is better than not at all.
 class ThreadPool {
 public:
     static constexpr std::size_t kMaximumThreads = 16;
@@ -30,6 +33,13 @@ public:
     ~ThreadPool();
     ThreadPool(const ThreadPool&) = delete;
     ThreadPool& operator=(const ThreadPool&) = delete;
+
+    /// Asks the helper's thread to call `help` after a delay. Called with the pool's lock held.
+    using CallHelper = UniqueFunction<void(std::chrono::milliseconds delay)>;
+    /// Before the first work.
+    void setHelper(CallHelper callHelper) { callHelper_ = std::move(callHelper); }
+    /// Does a piece of work, unless there are threads for it.
+    void help() TAMBLO_EXCLUDES(mutex_);
 
     void post(UniqueFunction<void()> work) TAMBLO_EXCLUDES(mutex_);
     [[nodiscard]] DelayedKey postAfter(std::chrono::milliseconds delay, UniqueFunction<void()> work)
@@ -46,7 +56,11 @@ private:
     void takeDueCalls() TAMBLO_REQUIRES(mutex_);
     [[nodiscard]] bool waitForWork(MutexLock& lock) TAMBLO_REQUIRES(mutex_);
     void joinFinished() TAMBLO_REQUIRES(mutex_);
+    void startThread() TAMBLO_REQUIRES(mutex_);
+    void callHelper() TAMBLO_REQUIRES(mutex_);
+    void doFirst(MutexLock& lock) TAMBLO_REQUIRES(mutex_);
 
+    CallHelper callHelper_;
     Mutex mutex_;
     std::condition_variable hasWork_;
     std::deque<UniqueFunction<void()>> work_ TAMBLO_GUARDED_BY(mutex_);

@@ -1,0 +1,244 @@
+#include "platform/RequestTurns.h"
+
+#include "base/Mutex.h"
+
+#include <atomic>
+#include <chrono>
+#include <cstddef>
+#include <deque>
+#include <map>
+#include <new>
+#include <utility>
+#include <vector>
+
+namespace tamblo {
+
+namespace {
+
+using Time = std::chrono::steady_clock::time_point;
+
+/// A client's turn ends with the first piece of work that makes it this long.
+constexpr std::chrono::milliseconds kSlice{1};
+/// Turns make one piece of the server queue until they have taken this long together: replies wait for no
+/// longer than that, and whoever lends its thread to the queue has it back.
+constexpr std::chrono::milliseconds kPieceOfTurns{4};
+
+} // namespace
+
+/// Shared with the queues, which may outlive the turns.
+struct RequestTurns::State : std::enable_shared_from_this<State> {
+    using QueueRef = std::shared_ptr<Queue>;
+
+    State(SerialQueue& queue, const Clock& steadyClock) : serverQueue(queue), clock(steadyClock) {}
+
+    /// Puts a queue with work among those that wait, and sees to it that turns are taken.
+    void enlist(const QueueRef& queue, Pace pace) TAMBLO_REQUIRES(mutex);
+    void callForTurns(Pace pace) TAMBLO_REQUIRES(mutex);
+    /// The queue whose turn it is; null when none waits.
+    [[nodiscard]] QueueRef begin() TAMBLO_EXCLUDES(mutex);
+    /// Puts it behind the others, if it has more to run, or before them, if it could not begin.
+    void end(const QueueRef& queue, bool isStillItsTurn) TAMBLO_EXCLUDES(mutex);
+    /// Runs a queue for a slice. Answers whether its next piece may block, which must not happen here.
+    [[nodiscard]] bool takeTurn(Queue& queue, bool mayBlock);
+    /// The piece of the server queue.
+    void takeTurns(bool mayBlock) TAMBLO_EXCLUDES(mutex);
+
+    SerialQueue& serverQueue;
+    const Clock& clock;
+    std::atomic<bool> endsSoon{false};
+
+    Mutex mutex;
+    /// Of each user who waits, the queues that do, in the order of their turns.
+    std::map<uid_t, std::deque<QueueRef>> waiting TAMBLO_GUARDED_BY(mutex);
+    std::deque<uid_t> users TAMBLO_GUARDED_BY(mutex); ///< in the order of their turns
+    bool isCalled TAMBLO_GUARDED_BY(mutex) = false;
+};
+
+/// A client's queue. The fields are guarded by the mutex of the state; but while it is its turn, the batch
+/// and the rest of a request are touched by the turn alone, without it.
+class RequestTurns::Queue final : public RequestQueue, public std::enable_shared_from_this<Queue> {
+public:
+    struct Item {
+        Work work;
+        Pace pace = Pace::quick;
+    };
+
+    Queue(std::shared_ptr<State> state, const ClientIdentity& identity, UniqueFunction<void()> onNoMemory)
+        : client(identity), outOfMemory(std::move(onNoMemory)), state_(std::move(state)) {}
+
+    void post(Work work, Pace pace) override {
+        const MutexLock lock(state_->mutex);
+        pending.push_back({std::move(work), pace});
+        state_->enlist(shared_from_this(), pace);
+    }
+    void postNext(Work work, Pace pace) override { rest = {std::move(work), pace}; }
+    void suspend() override { suspensions.fetch_add(1); }
+    void resume() override {
+        const MutexLock lock(state_->mutex);
+        if (suspensions.fetch_sub(1) == 1) {
+            state_->enlist(shared_from_this(), Pace::quick);
+        }
+    }
+    void abandon() override {
+        std::vector<Item> dropped[2];
+        Item droppedRest;
+        const MutexLock lock(state_->mutex);
+        dropped[0].swap(pending);
+        dropped[1].swap(batch);
+        std::swap(droppedRest, rest);
+        next = 0;
+        suspensions = 0;
+    }
+
+    [[nodiscard]] bool mayRun() const noexcept {
+        return suspensions == 0 && (rest.work || next != batch.size() || !pending.empty());
+    }
+    void fillBatch() {
+        if (next == batch.size()) {
+            batch.clear();
+            next = 0;
+            batch.swap(pending);
+        }
+    }
+    /// The next piece of the turn, or null.
+    [[nodiscard]] Item* front() noexcept {
+        if (rest.work) {
+            return &rest;
+        }
+        return next != batch.size() ? &batch[next] : nullptr;
+    }
+    void runFront() {
+        if (rest.work) {
+            Work work = std::exchange(rest.work, Work());
+            work();
+            return;
+        }
+        // What the work holds is let go before the next runs, as if it had never been queued.
+        Work& work = batch[next].work;
+        ++next;
+        work();
+        work.reset();
+    }
+
+    const ClientIdentity client;
+    UniqueFunction<void()> outOfMemory;
+    std::vector<Item> pending;
+    std::vector<Item> batch;
+    std::size_t next = 0;
+    Item rest;             ///< of the request at hand
+    bool isListed = false; ///< among those that wait, or at its turn
+    std::atomic<std::size_t> suspensions{0};
+
+private:
+    const std::shared_ptr<State> state_;
+};
+
+void RequestTurns::State::enlist(const QueueRef& queue, Pace pace) {
+    if (queue->isListed || !queue->mayRun()) {
+        return;
+    }
+    queue->isListed = true;
+    std::deque<QueueRef>& ofUser = waiting[queue->client.user];
+    if (ofUser.empty()) {
+        users.push_back(queue->client.user);
+    }
+    ofUser.push_back(queue);
+    callForTurns(pace);
+}
+
+void RequestTurns::State::callForTurns(Pace pace) {
+    if (!std::exchange(isCalled, true)) {
+        const auto turns = [self = shared_from_this(), mayBlock = pace == Pace::mayBlock] {
+            self->takeTurns(mayBlock);
+        };
+        serverQueue.post(turns, pace);
+    }
+}
+
+RequestTurns::State::QueueRef RequestTurns::State::begin() {
+    const MutexLock lock(mutex);
+    if (users.empty()) {
+        isCalled = false;
+        return nullptr;
+    }
+    const auto ofUser = waiting.find(users.front());
+    users.pop_front();
+    QueueRef queue = std::move(ofUser->second.front());
+    ofUser->second.pop_front();
+    if (ofUser->second.empty()) {
+        waiting.erase(ofUser);
+    } else {
+        users.push_back(queue->client.user);
+    }
+    queue->fillBatch();
+    return queue;
+}
+
+void RequestTurns::State::end(const QueueRef& queue, bool isStillItsTurn) {
+    const MutexLock lock(mutex);
+    queue->isListed = queue->mayRun();
+    if (!queue->isListed) {
+        return;
+    }
+    std::deque<QueueRef>& ofUser = waiting[queue->client.user];
+    const bool isUserListed = !ofUser.empty();
+    if (!isStillItsTurn) {
+        ofUser.push_back(queue);
+    } else {
+        ofUser.push_front(queue);
+    }
+    if (!isUserListed) {
+        users.push_back(queue->client.user);
+    }
+}
+
+bool RequestTurns::State::takeTurn(Queue& queue, bool mayBlock) {
+    const Time ends = clock.steadyNow() + kSlice;
+    do {
+        const Queue::Item* const item = queue.front();
+        if (item == nullptr || queue.suspensions != 0) {
+            return false;
+        }
+        if (item->pace == Pace::mayBlock && !mayBlock) {
+            return true;
+        }
+        try {
+            queue.runFront();
+        } catch (const std::bad_alloc&) {
+            queue.outOfMemory();
+        }
+    } while (!endsSoon && clock.steadyNow() < ends);
+    return false;
+}
+
+void RequestTurns::State::takeTurns(bool mayBlock) {
+    const Time ends = clock.steadyNow() + kPieceOfTurns;
+    while (const QueueRef queue = begin()) {
+        const bool mustBlock = takeTurn(*queue, mayBlock);
+        end(queue, mustBlock);
+        if (mustBlock || endsSoon.exchange(false) || clock.steadyNow() >= ends) {
+            const MutexLock lock(mutex);
+            isCalled = false;
+            if (!users.empty()) {
+                callForTurns(mustBlock ? Pace::mayBlock : Pace::quick);
+            }
+            return;
+        }
+    }
+}
+
+RequestTurns::RequestTurns(SerialQueue& serverQueue, const Clock& clock)
+    : state_(std::make_shared<State>(serverQueue, clock)) {}
+
+RequestTurns::~RequestTurns() = default;
+
+std::shared_ptr<RequestQueue> RequestTurns::makeQueue(const ClientIdentity& client,
+                                                      UniqueFunction<void()> outOfMemory) {
+    return std::make_shared<Queue>(state_, client, std::move(outOfMemory));
+}
+
+void RequestTurns::endPiece() noexcept {
+    state_->endsSoon = true;
+}
+
+} // namespace tamblo

@@ -1,0 +1,43 @@
+#include "platform/linux/connections/ReadTurns.h"
+
+#include "platform/linux/connections/LinuxConnection.h"
+
+#include <chrono>
+#include <utility>
+
+namespace tamblo {
+
+namespace {
+
+/// Reading and decoding go on for so long before what was read is carried out.
+constexpr std::chrono::milliseconds kReadingTime{2};
+
+} // namespace
+
+void ReadTurns::add(const std::shared_ptr<LinuxConnection>& connection,
+                    const std::shared_ptr<ClientUser>& user) {
+    if (user->readable.empty()) {
+        users_.push_back(user);
+    }
+    user->readable.push_back(connection);
+}
+
+bool ReadTurns::readSome() {
+    if (users_.empty()) {
+        return false;
+    }
+    const auto ends = std::chrono::steady_clock::now() + kReadingTime;
+    do {
+        const std::shared_ptr<ClientUser> user = std::move(users_.front());
+        users_.pop_front();
+        const std::shared_ptr<LinuxConnection> connection = std::move(user->readable.front());
+        user->readable.pop_front();
+        if (!user->readable.empty()) {
+            users_.push_back(user);
+        }
+        connection->read();
+    } while (!users_.empty() && std::chrono::steady_clock::now() < ends);
+    return !users_.empty();
+}
+
+} // namespace tamblo
