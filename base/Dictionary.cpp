@@ -1,5 +1,7 @@
 #include "base/Dictionary.h"
 
+#include "base/AllocatedBytes.h"
+
 #include <algorithm>
 #include <atomic>
 #include <cstring>
@@ -252,6 +254,23 @@ Dictionary Dictionary::fromSorted(std::span<const std::string_view> keys, std::s
     dictionary.block_ = Block::make(values.size() + spare, KeySet::make(keys));
     std::uninitialized_move(values.begin(), values.end(), dictionary.block_->values());
     return dictionary;
+}
+
+std::size_t Dictionary::bytesOfValues(Shared shared) const noexcept {
+    if (block_ == nullptr) {
+        return 0;
+    }
+    std::size_t bytes = allocatedBytes(sizeof(Block) + block_->capacity * sizeof(Value));
+    for (const Value& value : values()) {
+        if (value.ownsBlock()) {
+            bytes += value.bytesOfBlock(shared == Shared::inProportion);
+        }
+    }
+    return bytes;
+}
+
+std::size_t heldBytes(const Dictionary& dictionary) noexcept {
+    return dictionary.bytesOfValues(Dictionary::Shared::inFull) + dictionary.keys().heldBytes();
 }
 
 bool Dictionary::operator==(const Dictionary& other) const noexcept {

@@ -80,6 +80,14 @@ public:
         return block_ == other.block_;
     }
 
+    /// How what several values share is counted.
+    enum class Shared : std::uint8_t { inFull, inProportion };
+    /// Bytes of memory that the block and what its values refer to take, the keys of this dictionary aside.
+    /// In proportion, a short text that others refer to counts half, and so do the keys of a dictionary
+    /// within this one: less would let a client have much memory held for the little that it is charged, once
+    /// those others have gone. Anything else counts in full.
+    [[nodiscard]] std::size_t bytesOfValues(Shared shared) const noexcept;
+
 private:
     friend class Value;
     struct Block;
@@ -92,5 +100,9 @@ private:
 
     Block* block_ = nullptr;
 };
+
+/// Bytes of memory that a dictionary takes, its keys and all that it refers to included, whether or not
+/// others refer to it as well.
+[[nodiscard]] std::size_t heldBytes(const Dictionary& dictionary) noexcept;
 
 } // namespace tamblo

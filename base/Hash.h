@@ -3,6 +3,7 @@
 #include <concepts>
 #include <cstddef>
 #include <cstdint>
+#include <string_view>
 
 namespace tamblo {
 
@@ -21,6 +22,14 @@ struct SeededHash {
         return mixBits(static_cast<std::uint64_t>(number) ^ seed);
     }
     std::uint64_t seed;
+};
+
+/// The same of texts (SipHash-1-3): whoever does not know the seed cannot make texts that collide. Texts of
+/// all kinds may be looked up in a table that has it.
+struct SeededTextHash {
+    using is_transparent = void;
+
+    [[nodiscard]] std::size_t operator()(std::string_view text) const noexcept;
 };
 
 } // namespace tamblo

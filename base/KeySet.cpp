@@ -1,5 +1,6 @@
 #include "base/KeySet.h"
 
+#include "base/AllocatedBytes.h"
 #include "base/Json.h"
 #include "base/TextBuffer.h"
 
@@ -25,6 +26,10 @@ namespace {
 constexpr std::uint32_t kMaximumTransitionsOfOne = 8;
 constexpr std::uint32_t kMaximumTransitionsOfAll = 4096;
 constexpr std::uint32_t kMaximumKeysToRemember = 64;
+
+/// Most dictionaries are small: up to this many keys, a walk over the prefixes is predictable and beats a
+/// binary search.
+constexpr std::uint32_t kMaximumKeysToWalk = 32;
 
 std::atomic<std::uint32_t>& transitionsOfAll() noexcept {
     static std::atomic<std::uint32_t> count{0};
@@ -109,7 +114,15 @@ std::size_t KeySet::find(std::string_view key) const noexcept {
     const std::uint64_t prefix = prefixOf(key);
     const Entry* entry = entries_.get();
     const Entry* const end = entry + count_;
-    // Dictionaries are small: a walk over the prefixes is predictable and beats a binary search.
+    if (count_ > kMaximumKeysToWalk) {
+        entry = std::partition_point(entry, end, [&](const Entry& other) {
+            return other.prefix < prefix ||
+                   (other.prefix == prefix &&
+                    this->key(static_cast<std::size_t>(&other - entries_.get())) < key);
+        });
+        const auto index = static_cast<std::size_t>(entry - entries_.get());
+        return entry != end && is(index, key) ? index : kNotFound;
+    }
     while (entry != end && entry->prefix < prefix) {
         ++entry;
     }
@@ -147,6 +160,12 @@ bool KeySet::operator==(const KeySet& other) const noexcept {
                       [](const Entry& mine, const Entry& theirs) { return mine.length == theirs.length; });
 }
 
+std::size_t KeySet::heldBytes() const noexcept {
+    const std::size_t text =
+        count_ != 0 ? entries_[count_ - 1].jsonOffset + entries_[count_ - 1].jsonLength : 0;
+    return allocatedBytes(sizeof(KeySet)) + allocatedBytes(count_ * sizeof(Entry)) + allocatedBytes(text + 1);
+}
+
 KeySet::Extension KeySet::adding(std::string_view key) const {
     for (const Transition* transition = transitions_.load(std::memory_order_acquire); transition != nullptr;
          transition = transition->next) {
@@ -168,8 +187,14 @@ KeySet::Extension KeySet::adding(std::string_view key) const {
 }
 
 void KeySet::remember(const KeySetRef& target, std::size_t index, bool isRemoval) const {
-    if (count_ >= kMaximumKeysToRemember || !countUpTo(kMaximumTransitionsOfOne, transitionCount_) ||
-        !countUpTo(kMaximumTransitionsOfAll, transitionsOfAll())) {
+    // What is asked for once only, as of the keys of a client that invents them, is not worth a place.
+    const bool wasAsked = wasAsked_.exchange(true, std::memory_order_relaxed);
+    if (!wasAsked || count_ >= kMaximumKeysToRemember ||
+        !countUpTo(kMaximumTransitionsOfOne, transitionCount_)) {
+        return;
+    }
+    if (!countUpTo(kMaximumTransitionsOfAll, transitionsOfAll())) {
+        transitionCount_.fetch_sub(1, std::memory_order_relaxed);
         return;
     }
     auto* transition = new Transition{target, index, isRemoval, transitions_.load(std::memory_order_relaxed)};

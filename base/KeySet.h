@@ -61,12 +61,17 @@ public:
     [[nodiscard]] bool anyKeyHasSpace() const noexcept { return anyKeyHasSpace_; }
     [[nodiscard]] bool operator==(const KeySet& other) const noexcept;
 
+    /// Bytes of memory.
+    [[nodiscard]] std::size_t heldBytes() const noexcept;
+    /// Whether more than one dictionary, or what remembers key sets and a dictionary, refers to it.
+    [[nodiscard]] bool isShared() const noexcept { return references_.load(std::memory_order_relaxed) > 2; }
+
     struct Extension {
         KeySetRef keys;
         std::size_t index; ///< of the added key
     };
     /// The key set with one more key, which it must not hold. The few keys that are added again and again are
-    /// remembered, so that this is a look-up.
+    /// remembered, from the second time on, so that this is a look-up.
     [[nodiscard]] Extension adding(std::string_view key) const;
     /// The key set without the key at an index; remembered likewise.
     [[nodiscard]] KeySetRef removing(std::size_t index) const;
@@ -96,6 +101,7 @@ private:
     mutable std::atomic<std::uint32_t> references_{0};
     std::uint32_t count_ = 0;
     bool anyKeyHasSpace_ = false;
+    mutable std::atomic<bool> wasAsked_{false}; ///< for a key set with a key more or less
     std::unique_ptr<Entry[]> entries_;
     std::unique_ptr<char[]> text_;
     std::uint32_t textLength_ = 0;

@@ -1,5 +1,6 @@
 #include "base/Value.h"
 
+#include "base/AllocatedBytes.h"
 #include "base/Dictionary.h"
 #include "base/NumberText.h"
 
@@ -216,6 +217,36 @@ void Value::releaseBlock() noexcept {
             ::operator delete(block);
         }
         break;
+    }
+    }
+}
+
+std::size_t Value::bytesOfBlock(bool sharesCountHalf) const noexcept {
+    // Longer texts are never shared by the messages that clients send one by one.
+    constexpr std::size_t kLongestSharedText = 96;
+    switch (kind()) {
+    case Kind::array: {
+        const Array& elements = load<const ArrayBlock*>()->elements;
+        std::size_t bytes =
+            allocatedBytes(sizeof(ArrayBlock)) + allocatedBytes(elements.capacity() * sizeof(Value));
+        for (const Value& element : elements) {
+            bytes += element.ownsBlock() ? element.bytesOfBlock(sharesCountHalf) : 0;
+        }
+        return bytes;
+    }
+    case Kind::dictionary: {
+        const Dictionary& inner = dictionaryValue();
+        const std::size_t keys = inner.keys().heldBytes();
+        return sharesCountHalf ? inner.bytesOfValues(Dictionary::Shared::inProportion) +
+                                     (inner.keys().isShared() ? keys / 2 : keys)
+                               : inner.bytesOfValues(Dictionary::Shared::inFull) + keys;
+    }
+    default: {
+        const auto* text = load<const TextBlock*>();
+        const std::size_t bytes = allocatedBytes(sizeof(TextBlock) + text->length);
+        const bool isShared = sharesCountHalf && text->length <= kLongestSharedText &&
+                              text->references.load(std::memory_order_relaxed) > 2;
+        return isShared ? bytes / 2 : bytes;
     }
     }
 }

@@ -96,6 +96,9 @@ public:
 
     [[nodiscard]] bool operator==(const Value& other) const noexcept;
 
+    /// Bytes of memory of what the value refers to, whether or not others refer to it as well.
+    [[nodiscard]] std::size_t heldBytes() const noexcept { return ownsBlock() ? bytesOfBlock(false) : 0; }
+
 private:
     friend class Dictionary;
 
@@ -124,6 +127,7 @@ private:
     void retain() const noexcept;
     void release() noexcept;
     void releaseBlock() noexcept;
+    [[nodiscard]] std::size_t bytesOfBlock(bool sharesCountHalf) const noexcept;
     [[nodiscard]] bool numberEquals(const Value& other) const noexcept;
 
     alignas(8) std::uint8_t bytes_[16];

@@ -6,7 +6,6 @@
 #include <cstddef>
 #include <cstdint>
 #include <unordered_map>
-#include <vector>
 
 namespace tamblo {
 
@@ -19,13 +18,18 @@ public:
         const auto found = last_.find(key(category, type));
         return found != last_.end() ? found->second : nullptr;
     }
-    void add(const ZRReportingSessionMessage& message) {
-        last_[key(message.category(), message.type())] = &message;
+    /// Bytes of memory for one more category and type.
+    static constexpr std::size_t kBytesOfKind = 48;
+
+    /// Whether it is the first of its category and type.
+    bool add(const ZRReportingSessionMessage& message) {
+        return last_.insert_or_assign(key(message.category(), message.type()), &message).second;
     }
-    void rebuild(const std::vector<MessageRef>& messages) {
-        last_.clear();
-        for (const MessageRef& message : messages) {
-            add(*message);
+    /// The message goes from the list.
+    void remove(const ZRReportingSessionMessage& message) {
+        const auto found = last_.find(key(message.category(), message.type()));
+        if (found != last_.end() && found->second == &message) {
+            last_.erase(found);
         }
     }
     void clear() { last_ = Map(); }

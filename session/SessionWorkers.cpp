@@ -57,18 +57,6 @@ bool ZRReportingSession::hasWorkerOf(const WorkerClass& workerClass) const noexc
                        [&](const Worker& worker) { return worker.workerClass == &workerClass; });
 }
 
-void ZRReportingSession::stopWorkers() {
-    forEachWorker(&WorkerRole::producer, &WorkerRole::consumer, [this](const Worker& worker) {
-        if (worker.instance->started()) {
-            worker.instance->stop();
-            worker.instance->setStarted(false);
-            log::debug(ZRReportingSessionCategory(),
-                       "ZRReportingSessionWorker action=stop worker={} reporterID={}", *worker.workerClass,
-                       reporterID_);
-        }
-    });
-}
-
 void ZRReportingSession::deliver(const MessageRef& message) {
     for (const Worker& worker : messageWorkers_) {
         if (!worker.workerClass->role.consumer || !worker.instance->started() ||

@@ -5,6 +5,7 @@
 #include "util/TraceEvents.h"
 
 #include <algorithm>
+#include <cstddef>
 #include <utility>
 
 namespace tamblo {
@@ -27,7 +28,9 @@ ZRReportingSession::ZRReportingSession(Created, Context& context, ReporterID rep
       audioTags_(context.shared<intake::AudioTags>()),
       reporterID_(reporterID),
       processIdentifiers_(std::move(processIdentifiers)),
-      appName_(ZRReportingUtilityRetrieveAppName(configuration_)) {}
+      appName_(ZRReportingUtilityRetrieveAppName(configuration_)),
+      previousValues_(context.platform().limits.previousKeysOfSession),
+      retained_(context.shared<RetainedMessages>(context.platform().limits), *this) {}
 
 ZRReportingSession::~ZRReportingSession() {
     emitTracePoint(context_, TraceEvent::sessionDestroyed);
@@ -61,28 +64,9 @@ void ZRReportingSession::start() {
     startWorkersFromClasses(workerClassLists().valid);
 }
 
-void ZRReportingSession::stop() {
-    recordOwnMessage(AudioEventTypeStop, "stop");
-    log::debug(ZRReportingSessionCategory(), "stop called. reporterID={}", reporterID_);
-    if (!started_) {
-        return;
-    }
-    log::debug(ZRReportingSessionCategory(), "ending session. reporterID={}", reporterID_);
-    emitTracePoint(context_, TraceEvent::sessionStopped);
-    if (ZRReportingSessionMessage::sortMessages(messages_)) {
-        lastMessages_.rebuild(messages_);
-    }
-    stopWorkers();
-    lastMessages_.clear();
-    std::vector<MessageRef>().swap(messages_);
-    totalMessageCount_ = 0;
-    ownRecordCount_ = 0;
-    started_ = false;
-}
-
 void ZRReportingSession::recordOwnMessage(AudioEventType type, std::string_view method) {
     const std::string suffix = "_at_" + std::string(method);
-    const std::size_t count = messages_.size();
+    const std::size_t count = recordedCount();
     Dictionary payload{
         {"method", method},
         {"messages" + suffix, static_cast<std::int64_t>(count)},
@@ -93,16 +77,78 @@ void ZRReportingSession::recordOwnMessage(AudioEventType type, std::string_view 
     auto message = std::make_shared<ZRReportingSessionMessage>(std::move(payload), AudioEventKindSetup, type);
     addMissingDates(*message, context_.platform().clock->now());
     addAudioMessageTag(*message, audioTags_);
-    record(std::move(message));
+    const std::size_t bytes = message->payload().bytesOfValues(Dictionary::Shared::inProportion);
     ++ownRecordCount_;
+    record(std::move(message), bytes);
 }
 
-void ZRReportingSession::record(MessageRef message) {
-    lastMessages_.add(*message);
+void ZRReportingSession::record(MessageRef message, std::size_t bytesOfValues) {
+    const bool isFirstOfKind = lastMessages_.add(*message);
     messages_.push_back(std::move(message));
+    const std::size_t bytes =
+        kBytesOfMessage + bytesOfValues + (isFirstOfKind ? LastMessageIndex::kBytesOfKind : 0);
+    blocks_.add(bytes);
+    retained_.add(bytes);
+}
+
+void ZRReportingSession::remember(const Dictionary& payload, std::size_t bytesOfValues) {
+    const std::size_t before = previousValues_.heldBytes();
+    const bool wasFull = previousValues_.isFull();
+    previousValues_.take(payload, bytesOfValues);
+    if (previousValues_.isFull() && !wasFull) {
+        log::error(ZRReportingSessionCategory(),
+                   "more than {} different keys; further ones are not remembered. reporterID={}",
+                   context_.platform().limits.previousKeysOfSession, reporterID_);
+    }
+    // The keys that messages of the list go on to hold are theirs from now on.
+    const std::size_t keys = messages_.empty() ? 0 : previousValues_.bytesOfKeysLeft();
+    if (keys != 0) {
+        blocks_.addToLast(keys);
+    }
+    const std::size_t after = previousValues_.heldBytes() + keys;
+    if (after >= before) {
+        retained_.add(after - before);
+    } else {
+        retained_.remove(before - after);
+    }
+}
+
+std::size_t ZRReportingSession::letGoOfOldest(std::size_t bytes) {
+    MessageBlocks::Block freed = blocks_.takeFirst(bytes);
+    if (freed.messages != 0) {
+        if (droppedMessageCount_ == 0) {
+            log::error(
+                ZRReportingSessionCategory(),
+                "the user of this session retains too much; its oldest messages are let go. reporterID={}",
+                reporterID_);
+        }
+        const auto end = messages_.begin() + static_cast<std::ptrdiff_t>(freed.messages);
+        std::for_each(messages_.begin(), end,
+                      [this](const MessageRef& message) { lastMessages_.remove(*message); });
+        messages_.erase(messages_.begin(), end);
+        droppedMessageCount_ += freed.messages;
+        retained_.countDropped(freed.messages);
+    }
+    if (messages_.empty() && freed.bytes < bytes) {
+        freed.bytes += previousValues_.heldBytes();
+        previousValues_.clear();
+    }
+    retained_.remove(freed.bytes);
+    return freed.bytes;
 }
 
 void ZRReportingSession::sendMessage(const MessageRef& message, ErrorReply reply) {
+    if (hasToWait()) {
+        keepWaiting(message, std::move(reply));
+        return;
+    }
+    accept(message);
+    if (reply) {
+        reply(nullptr);
+    }
+}
+
+void ZRReportingSession::accept(const MessageRef& message) {
     ++totalMessageCount_;
     normalise(*message);
     emitTracePoint(context_, TraceEvent::sessionMessage);
@@ -111,14 +157,12 @@ void ZRReportingSession::sendMessage(const MessageRef& message, ErrorReply reply
     log::debug(ZRReportingSessionCategory(),
                "ZRReportingSessionWorker action=sendMessage reporterID={} app={} redundant={} message={}",
                reporterID_, appName_, yesOrNo(message->isRedundant), message->payload());
-    previousValues_.merge(message->payload());
+    const std::size_t bytes = message->payload().bytesOfValues(Dictionary::Shared::inProportion);
     if (!message->isRedundant) {
-        record(message);
+        record(message, bytes);
     }
+    remember(message->payload(), bytes);
     deliver(message);
-    if (reply) {
-        reply(nullptr);
-    }
 }
 
 void ZRReportingSession::normalise(ZRReportingSessionMessage& message) const {

@@ -1,10 +1,15 @@
 #pragma once
 
+#include "base/AllocatedBytes.h"
 #include "base/Dictionary.h"
 #include "platform/Clock.h"
 #include "platform/ZRReportingServiceProtocol.h"
 #include "session/LastMessageIndex.h"
+#include "session/MessageBlocks.h"
 #include "session/MessageIntake.h"
+#include "session/PreviousValues.h"
+#include "session/RetainedMessages.h"
+#include "session/SessionStop.h"
 #include "session/WorkerClass.h"
 #include "session/ZRReportingSessionMessage.h"
 #include "session/ZRReportingSessionWorkerProtocol.h"
@@ -52,14 +57,22 @@ public:
     void setClientProcessName(std::optional<std::string> name) { clientProcessName_ = std::move(name); }
     /// Adds the entries to the configuration, which is never replaced.
     void updateConfigurationWithContentsOfConfiguration(const Dictionary& configuration);
-    void addPreviousValues(const Dictionary& values) { previousValues_.merge(values); }
+    void addPreviousValues(const Dictionary& values) { remember(values); }
+    /// To whose budget of retained messages the session's count; at first, the service's own user's.
+    void setUser(uid_t user) { retained_.setUser(user); }
 
     void start();
     /// Normalises the message, records it unless it is redundant, and offers it to the consumer workers,
-    /// whether or not the session is started. May be called by a worker in its `stop`. The reply, which
-    /// nothing here gives yet, is called at the end.
+    /// whether or not the session is started. May be called by a worker in its `stop`. The reply is called at
+    /// the end. A message that comes between two parts of a stop waits for the stop's end, unless too much
+    /// waits already: then the reply says so, and the message is lost.
     void sendMessage(const MessageRef& message, ErrorReply reply = {});
     void stop();
+    /// Does the next part of the stop, some milliseconds of it, and answers whether the session is stopped
+    /// and what came meanwhile is done. Between two parts the queue may do anything but start the session.
+    [[nodiscard]] bool stopSome();
+    /// Whether a stop has begun and is not over.
+    [[nodiscard]] bool isStopping() const noexcept { return stop_ != nullptr; }
 
     /// The start reply that waits for the stop; empty when none does.
     void setTransactionCompleteBlock(BooleanReply reply) { transactionCompleteBlock_ = std::move(reply); }
@@ -81,12 +94,19 @@ public:
     }
     /// In arrival order, from the stop on in the order of their timestamps.
     [[nodiscard]] const std::vector<MessageRef>& messages() const noexcept { return messages_; }
-    [[nodiscard]] const Dictionary& previousValues() const noexcept { return previousValues_; }
+    /// The latest value of each key, put together anew.
+    [[nodiscard]] Dictionary previousValues() const { return previousValues_.values(); }
     [[nodiscard]] std::int64_t totalMessageCount() const noexcept { return totalMessageCount_; }
-    /// How many of `messages` were sent to the session, its own records of start and stop aside.
+    /// How many messages that were sent to the session were recorded since the last stop, its own records of
+    /// start and stop aside, and those included that were let go since.
     [[nodiscard]] std::size_t acceptedMessageCount() const noexcept {
-        return messages_.size() - ownRecordCount_;
+        return recordedCount() - ownRecordCount_;
     }
+    /// Messages that were let go since the last stop, as the user retained too much.
+    [[nodiscard]] std::uint64_t droppedMessageCount() const noexcept { return droppedMessageCount_; }
+    /// Lets go of the oldest messages that have about so many bytes, and of the previous values where no
+    /// message is left. The bytes that are free then. Not while the session is stopping.
+    std::size_t letGoOfOldest(std::size_t bytes);
     /// Nothing here asks for it yet.
     [[nodiscard]] std::size_t workerInstanceCount() const noexcept { return messageWorkers_.size(); }
     [[nodiscard]] std::string description() const;
@@ -107,10 +127,21 @@ private:
         std::shared_ptr<ZRReportingSessionWorkerProtocol> instance;
     };
 
+    /// A message, what `make_shared` adds, and its place in the list, which grows to twice what it needs.
+    static constexpr std::size_t kBytesOfMessage =
+        allocatedBytes(sizeof(ZRReportingSessionMessage) + 2 * sizeof(void*)) + 2 * sizeof(MessageRef);
+
     void startWorkersFromClasses(std::span<const WorkerClass* const> classes);
     void makeWorker(const WorkerClass& workerClass);
     [[nodiscard]] bool hasWorkerOf(const WorkerClass& workerClass) const noexcept;
-    void stopWorkers();
+    void stopNextPart();
+    void orderWorkersToStop();
+    void indexSomeAgain();
+    void stopSomeOfWorkers();
+    void letGoOfSome();
+    void sendSomeWaiting();
+    void keepWaiting(const MessageRef& message, ErrorReply reply);
+    [[nodiscard]] bool hasToWait() const noexcept;
     /// Calls `act` with each worker once: those of the first role, then those of the second, then all others.
     template <typename Act>
     void forEachWorker(bool WorkerRole::*first, bool WorkerRole::*second, Act act) const {
@@ -125,7 +156,16 @@ private:
     }
     /// Records a message of the session's own, which no worker is offered.
     void recordOwnMessage(AudioEventType type, std::string_view method);
-    void record(MessageRef message);
+    void record(MessageRef message, std::size_t bytesOfValues);
+    /// Takes the values into the previous ones; `bytesOfValues` as they count for the user's budget.
+    void remember(const Dictionary& payload, std::size_t bytesOfValues);
+    void remember(const Dictionary& values) {
+        remember(values, values.bytesOfValues(Dictionary::Shared::inProportion));
+    }
+    void accept(const MessageRef& message);
+    [[nodiscard]] std::size_t recordedCount() const noexcept {
+        return messages_.size() + droppedMessageCount_;
+    }
     void normalise(ZRReportingSessionMessage& message) const;
     void deliver(const MessageRef& message);
 
@@ -144,12 +184,17 @@ private:
     BooleanReply transactionCompleteBlock_;
 
     std::vector<MessageRef> messages_;
+    MessageBlocks blocks_; ///< what the messages take
     LastMessageIndex lastMessages_;
-    Dictionary previousValues_;
+    PreviousValues previousValues_;
     std::int64_t totalMessageCount_ = 0;
-    std::size_t ownRecordCount_ = 0; ///< among the messages
+    std::size_t ownRecordCount_ = 0; ///< among those recorded
+    std::uint64_t droppedMessageCount_ = 0;
 
     std::vector<Worker> messageWorkers_; ///< as they were made
+    std::unique_ptr<SessionStop> stop_;  ///< while one is under way
+
+    RetainedMessages::Share retained_;
 };
 
 void appendText(std::string& out, const ZRReportingSession& session);

@@ -1,40 +1,11 @@
 #include "session/ZRReportingSessionMessage.h"
 
-#include "base/KeyPlaces.h"
+#include "session/MessageSort.h"
 #include "util/Log.h"
-#include "util/MessageKeys.h"
 
 #include <algorithm>
-#include <array>
-#include <cmath>
-#include <cstddef>
-#include <string_view>
 
 namespace tamblo {
-
-namespace {
-
-struct TimedMessage {
-    double time;
-    MessageRef message;
-};
-
-/// The time that each message sorts by.
-std::vector<double> sortTimes(const std::vector<MessageRef>& messages) {
-    static constexpr std::array<std::string_view, 1> kKeys{ZRReportingInternalEventEpochTime};
-    KeyPlaces places(kKeys);
-    std::vector<double> times;
-    times.reserve(messages.size());
-    for (const MessageRef& message : messages) {
-        const Dictionary& payload = message->payload();
-        const std::uint32_t place = places.in(payload.keys())[0];
-        const double time = place != KeyPlaces::kAbsent ? payload.valueAt(place).doubleValue() : 0.0;
-        times.push_back(std::isnan(time) ? 0.0 : time);
-    }
-    return times;
-}
-
-} // namespace
 
 DestinationWorkers ZRReportingSessionMessage::destinationWorkers() const {
     return destinationWorkers_ != nullptr ? *destinationWorkers_ : DestinationWorkers{};
@@ -63,20 +34,10 @@ std::string ZRReportingSessionMessage::description() const {
 }
 
 bool ZRReportingSessionMessage::sortMessages(std::vector<MessageRef>& messages) {
-    const std::vector<double> times = sortTimes(messages);
-    if (std::is_sorted(times.begin(), times.end())) {
-        return false;
+    MessageSort sort(messages);
+    while (!sort.sortSome()) {
     }
-    std::vector<TimedMessage> timed;
-    timed.reserve(messages.size());
-    for (std::size_t i = 0; i < messages.size(); ++i) {
-        timed.push_back({times[i], std::move(messages[i])});
-    }
-    std::stable_sort(timed.begin(), timed.end(),
-                     [](const TimedMessage& a, const TimedMessage& b) { return a.time < b.time; });
-    std::transform(timed.begin(), timed.end(), messages.begin(),
-                   [](TimedMessage& entry) { return std::move(entry.message); });
-    return true;
+    return sort.hasChanged();
 }
 
 void appendText(std::string& out, const ZRReportingSessionMessage& message) {

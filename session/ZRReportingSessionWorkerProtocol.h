@@ -35,6 +35,13 @@ public:
     virtual std::optional<bool> start() { return std::nullopt; }
     /// Called only while started. A producer sends its derived messages from here, through the session.
     virtual void stop() {}
+    /// Does the next part of the stop, for a worker that walks all messages of its session; whether it is
+    /// done. Between two parts the server queue does the work of others. The session's messages stay as they
+    /// are.
+    [[nodiscard]] virtual bool stopSome() {
+        stop();
+        return true;
+    }
 
     /// For consumers. One message, which other workers share; what goes wrong with it is the worker's own to
     /// log.

@@ -160,6 +160,76 @@ TEST_F(SessionTest, ProducersSendWhileConsumersStillRun) {
                                                        0x21044830, 0x21044838, 0x21044838, 0x21044834));
 }
 
+TEST_F(SessionTest, AStopInPartsIsTheStopAndWhatComesMeanwhileFollowsIt) {
+    constexpr int kLate = 40;
+    const auto run = [this](bool inParts) {
+        std::mt19937 random(11);
+        const auto session = device.makeSession();
+        session->start();
+        script.atStop["Producer"] = [this](ZRReportingSession& owner) { send(owner, {{"sum", 1}}, 1, 11); };
+        for (int i = 0; i < 3000; ++i) {
+            send(*session, {{"n", i}, {"zrreporting_timestamp", 2e9 + static_cast<double>(random() % 900)}});
+        }
+        (void)script.take();
+        std::string seen;
+        script.atStop["Late"] = [&](ZRReportingSession& owner) {
+            for (const MessageRef& message : owner.messages()) {
+                seen += shown(message->payload(), {"n", "sum", "zrreporting_timestamp"}) + ' ';
+            }
+        };
+        int sent = 0;
+        const auto sendLate = [&] {
+            const int number = sent++;
+            session->sendMessage(messageOf({{"late", number}, {"zrreporting_timestamp", 2e9}}, 3, 11),
+                                 [&seen, number](const ReplyError* error) {
+                                     EXPECT_EQ(error, nullptr);
+                                     seen += formatted("reply {} ", number);
+                                 });
+        };
+        if (inParts) {
+            while (!session->stopSome()) {
+                EXPECT_TRUE(session->isStopping());
+                if (sent < kLate) {
+                    sendLate();
+                }
+            }
+            EXPECT_GT(sent, 5) << "parts";
+        } else {
+            session->stop();
+        }
+        EXPECT_FALSE(session->isStopping());
+        while (sent < kLate) {
+            sendLate();
+        }
+        for (const std::string& event : script.take()) {
+            seen += event + ' ';
+        }
+        for (const MessageRef& message : session->messages()) {
+            EXPECT_FALSE(message->isSessionStarted);
+            seen += shown(message->payload(), {"late"}) + ' ';
+        }
+        script.reset();
+        return seen + session->description();
+    };
+    EXPECT_EQ(run(true), run(false));
+}
+
+TEST_F(SessionTest, WhatWaitsForTheEndOfAStopIsBounded) {
+    const auto session = device.makeSession();
+    session->start();
+    send(*session, {{"text", std::string(200'000, 'x')}});
+    ASSERT_FALSE(session->stopSome());
+    std::vector<std::int64_t> codes;
+    for (int i = 0; i < 6; ++i) {
+        session->sendMessage(
+            messageOf({{"n", i}, {"text", std::string(1'000'000, 'x')}}),
+            [&codes](const ReplyError* error) { codes.push_back(error != nullptr ? error->code : 0); });
+    }
+    EXPECT_THAT(codes, ElementsAre(-32'000, -32'000)) << "the others wait";
+    session->stop();
+    EXPECT_THAT(codes, ElementsAre(-32'000, -32'000, 0, 0, 0, 0));
+}
+
 TEST_F(SessionTest, ConfigurationIsAddedToAndNamesTheApplication) {
     const auto session = device.makeSession(77, {42});
     const std::string key = "HostApplicationDisplayID";

@@ -1,0 +1,106 @@
+#pragma once
+
+#include "platform/Limits.h"
+
+#include <cstddef>
+#include <cstdint>
+#include <map>
+#include <vector>
+
+#include <sys/types.h>
+
+namespace tamblo {
+
+class ZRReportingSession;
+
+/// What all sessions retain, by the user whose client made them, and what happens when that is too much.
+///
+/// A session may last for days, and nobody is to lose a report for that; but its messages are memory. So each
+/// user has a budget of bytes, and all of them have one together. Beyond the first, the oldest messages of
+/// the user's largest sessions are let go, beyond the second, those of the user who has most; enough of them
+/// that it is worth the search for them. A session that is stopping keeps what it has. Let go means: they
+/// have reached their sinks, but what the stop derives begins later. One for all sessions, on the reporting
+/// server queue.
+class RetainedMessages {
+    struct Account;
+
+public:
+    /// Waiting messages of one user's sessions that are stopping.
+    static constexpr std::size_t kMostWaitingBytesOfUser = 4U << 20U;
+
+    /// What one session has a share of; it must not outlive the object that it was made of.
+    class Share {
+    public:
+        /// Belongs to the service's own user at first.
+        Share(RetainedMessages& all, ZRReportingSession& session);
+        ~Share();
+        Share(const Share&) = delete;
+        Share& operator=(const Share&) = delete;
+
+        void setUser(uid_t user);
+        /// More bytes; may let go of messages, the session's own too.
+        void add(std::size_t bytes) {
+            bytes_ += bytes;
+            all_.added(*account_, bytes);
+        }
+        void remove(std::size_t bytes) noexcept;
+        /// The same for messages that wait until the session is stopped. Whether there is room for them.
+        [[nodiscard]] bool addWaiting(std::size_t bytes);
+        void removeWaiting(std::size_t bytes) noexcept;
+        void countDropped(std::size_t messages) noexcept { all_.droppedMessageCount_ += messages; }
+        [[nodiscard]] std::size_t bytes() const noexcept { return bytes_; }
+
+    private:
+        friend class RetainedMessages;
+
+        void join(uid_t user);
+        void leave() noexcept;
+
+        RetainedMessages& all_;
+        ZRReportingSession& session_;
+        Account* account_ = nullptr;
+        std::size_t place_ = 0; ///< among the account's shares
+        std::size_t bytes_ = 0;
+        std::size_t waitingBytes_ = 0;
+    };
+
+    explicit RetainedMessages(const Limits& limits) noexcept
+        : limitOfUser_(limits.retainedBytesOfUser), limit_(limits.retainedBytes), nextRound_(limit_) {}
+    RetainedMessages(const RetainedMessages&) = delete;
+    RetainedMessages& operator=(const RetainedMessages&) = delete;
+
+    /// Bytes of all sessions.
+    [[nodiscard]] std::size_t bytes() const noexcept { return bytes_; }
+    /// Messages of all sessions that were let go for this.
+    [[nodiscard]] std::uint64_t droppedMessageCount() const noexcept { return droppedMessageCount_; }
+
+private:
+    struct Account {
+        uid_t user = 0;
+        std::size_t bytes = 0;
+        std::size_t waitingBytes = 0;
+        std::size_t nextRound = 0; ///< bytes beyond which something is let go
+        std::vector<Share*> shares;
+    };
+
+    void added(Account& account, std::size_t bytes) {
+        account.bytes += bytes;
+        bytes_ += bytes;
+        if (account.bytes > account.nextRound || bytes_ > nextRound_) {
+            makeRoom(account);
+        }
+    }
+    void removed(Account& account, std::size_t bytes) noexcept;
+    void makeRoom(Account& account);
+    /// Lets go of about as many bytes, of the largest sessions first.
+    void letGo(Account& account, std::size_t bytes);
+
+    const std::size_t limitOfUser_;
+    const std::size_t limit_;
+    std::map<uid_t, Account> accounts_; ///< of users who have a session
+    std::size_t bytes_ = 0;
+    std::size_t nextRound_;
+    std::uint64_t droppedMessageCount_ = 0;
+};
+
+} // namespace tamblo
