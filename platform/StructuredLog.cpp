@@ -1,7 +1,5 @@
 #include "platform/StructuredLog.h"
 
-#include "base/Format.h"
-
 #include <cstddef>
 
 namespace tamblo {

@@ -103,7 +103,7 @@ ZRReportingDriverUtility::ZRReportingDriverUtility(ChanlogFacility& facility) : 
         const ChanlogSelection selection{driver.groupName(), driver.subGroupName()};
         const auto found = moment->channelsOf(selection);
         if (const int* error = std::get_if<int>(&found)) {
-            log::error(category, "error {} getting channels for driver {}", *error, driver);
+            log::ownError(category, "error {} getting channels for driver {}", *error, driver);
             continue;
         }
         const auto& channels = std::get<ChanlogChannels>(found);
@@ -113,7 +113,7 @@ ZRReportingDriverUtility::ZRReportingDriverUtility(ChanlogFacility& facility) : 
         }
         auto made = facility_.subscribe(selection, channels);
         if (const int* error = std::get_if<int>(&made)) {
-            log::error(category, "error {} creating subscription for {}", *error, driver);
+            log::ownError(category, "error {} creating subscription for {}", *error, driver);
             continue;
         }
         ioChannelSubscriptions_.emplace_back(driver).setSubscription(

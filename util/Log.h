@@ -6,6 +6,7 @@
 #include "platform/StructuredLog.h"
 #include "util/LogCategories.h"
 
+#include <cstddef>
 #include <cstdint>
 #include <span>
 #include <string>
@@ -19,8 +20,10 @@ void appendText(std::string& out, const Dictionary& dictionary);
 /// A value in a log line: a string as it is, anything else as JSON.
 void appendText(std::string& out, const Value& value);
 
-/// Numbers in a log line: "[1, 2]".
+/// Numbers in a log line: "[1, 2]"; of many, the first ones and how many there are besides.
 struct NumberList {
+    static constexpr std::size_t kMost = 16;
+
     std::span<const std::int64_t> numbers;
 };
 void appendText(std::string& out, const NumberList& list);
@@ -32,28 +35,46 @@ void appendText(std::string& out, const NumberList& list);
 } // namespace tamblo
 
 /// One function per level. A line is the prefix, "%25s:%-5d " of the source unit's name and the line number,
-/// and the formatted text. Arguments become text only when the level is on for the category.
+/// and the formatted text. Arguments become text only when the level is on for the category, and the log has
+/// room for one more such line of the client for whom the thread works (`LogOrigin`).
 namespace tamblo::log {
 
 namespace detail {
 
-void write(const LogCategory& category, LogLevel level, std::string_view line) noexcept;
+/// No text in a line is longer, as no line is written with more.
+inline constexpr std::size_t kLongestText = 8192;
+
+[[nodiscard]] bool admits(const LogKind& kind) noexcept;
+void write(const LogKind& kind, std::string_view line) noexcept;
+
+template <typename Argument> decltype(auto) cut(const Argument& argument) {
+    if constexpr (std::is_convertible_v<const Argument&, std::string_view>) {
+        return std::string_view(argument).substr(0, kLongestText);
+    } else {
+        return argument;
+    }
+}
 
 template <typename... Arguments>
-[[gnu::noinline, gnu::cold]] void writeLine(const LogCategory& category, LogLevel level,
-                                            const FormatString<std::type_identity_t<Arguments>...>& format,
-                                            const Arguments&... arguments) {
+[[gnu::noinline, gnu::cold]] void writeLine(const LogKind& kind, const Arguments&... arguments) {
     std::string line;
-    appendLinePrefix(line, format.location);
-    appendFormatted(line, format.format, arguments...);
-    write(category, level, line);
+    appendLinePrefix(line, kind.place);
+    appendFormatted(line, kind.format, cut(arguments)...);
+    write(kind, line);
+}
+
+template <typename... Arguments>
+[[gnu::noinline, gnu::cold]] void writeIfAdmitted(const LogKind& kind, const Arguments&... arguments) {
+    if (admits(kind)) {
+        writeLine(kind, arguments...);
+    }
 }
 
 template <typename... Arguments>
 void at(LogLevel level, const LogCategory& category,
         const FormatString<std::type_identity_t<Arguments>...>& format, const Arguments&... arguments) {
     if (category.isOn(level)) [[unlikely]] {
-        writeLine<Arguments...>(category, level, format, arguments...);
+        writeIfAdmitted({level, category.code(), format.format, format.location}, arguments...);
     }
 }
 
@@ -82,6 +103,16 @@ template <typename... Arguments>
 void error(const LogCategory& category, FormatString<std::type_identity_t<Arguments>...> format,
            const Arguments&... arguments) {
     detail::at<Arguments...>(LogLevel::error, category, format, arguments...);
+}
+
+/// An error of the service's own, which it says once for each state of things: written even when that shows
+/// while the thread works for a client who has had its share of lines.
+template <typename... Arguments>
+void ownError(const LogCategory& category, FormatString<std::type_identity_t<Arguments>...> format,
+              const Arguments&... arguments) {
+    if (category.isOn(LogLevel::error)) {
+        detail::writeLine({LogLevel::error, category.code(), format.format, format.location}, arguments...);
+    }
 }
 
 template <typename... Arguments>

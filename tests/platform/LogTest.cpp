@@ -3,10 +3,12 @@
 #include "platform/linux/log/LinuxTracePoints.h"
 #include "tests/platform/LinuxServiceSupport.h"
 
+#include <algorithm>
 #include <array>
 #include <deque>
 #include <numeric>
 #include <random>
+#include <regex>
 
 #include <fcntl.h>
 #include <sys/socket.h>
@@ -53,6 +55,60 @@ TEST(LogFilterTest, ReadsLevelsForAllAndForSingleCategories) {
         }
         EXPECT_EQ(read, expected) << words;
     }
+}
+
+TEST(LogLimiterTest, CountsWhatEachUserMayNotHaveWritten) {
+    LogLimiter limiter;
+    LogLimiter::Time now{};
+    const auto kindOf = [](std::string_view format, LogLevel level = LogLevel::standard) {
+        return LogKind{level, "zrrs", format, std::source_location::current()};
+    };
+    const auto admitted = [&](uid_t user, const LogKind& kind, unsigned lines) {
+        unsigned count = 0;
+        for (unsigned line = 0; line < lines; ++line) {
+            count += limiter.admits({user, static_cast<pid_t>(line)}, kind, now) ? 1 : 0;
+        }
+        return count;
+    };
+    const auto told = [&] {
+        std::string text;
+        while (const auto leftOut = limiter.takeLeftOut(now)) {
+            text += formatted("{} {} {} {}; ", leftOut->kind.format, leftOut->lines, leftOut->last.user,
+                              leftOut->last.process);
+        }
+        return text;
+    };
+
+    EXPECT_EQ(admitted(1, kindOf("a"), 200'000), LogLimiter::kLinesOfKind);
+    EXPECT_EQ(admitted(2, kindOf("a"), 5), 5U) << "another user has a share of its own";
+    unsigned all = LogLimiter::kLinesOfKind;
+    for (const char* format : {"b", "c", "d", "e"}) {
+        all += admitted(1, kindOf(format), 11);
+    }
+    EXPECT_EQ(all, LogLimiter::kLinesOfUser);
+    EXPECT_EQ(admitted(1, kindOf("x", LogLevel::error), 9), 9U) << "no stream of others hides an error";
+    EXPECT_EQ(told(), "") << "the second is not over";
+
+    now += LogLimiter::kPeriod;
+    EXPECT_EQ(admitted(1, kindOf("b"), 12), LogLimiter::kLinesOfKind);
+    EXPECT_EQ(told(), "a 199990 1 199999; b 3 1 11; c 1 1 10; d 1 1 10; e 11 1 10; ");
+    EXPECT_FALSE(limiter.hasLeftOut());
+
+    // Many users at a time, and again: whoever has no place shares one, and nothing goes uncounted.
+    for (int second = 0; second < 2; ++second) {
+        now += LogLimiter::kPeriod;
+        unsigned written = 0;
+        for (uid_t user = 0; user < 100; ++user) {
+            written += admitted(user, kindOf("a"), 12);
+        }
+        EXPECT_EQ(written, LogLimiter::kUsers * LogLimiter::kLinesOfKind);
+    }
+    std::uint64_t leftOut = 0;
+    now += LogLimiter::kPeriod;
+    while (const auto taken = limiter.takeLeftOut(now)) {
+        leftOut += taken->lines;
+    }
+    EXPECT_EQ(leftOut, 2U * (100 * 12 - LogLimiter::kUsers * LogLimiter::kLinesOfKind));
 }
 
 /// A pipe or socket that takes the log in.
@@ -120,6 +176,32 @@ TEST(LinuxStructuredLogTest, NeitherWaitsForAReaderNorEndsWithIt) {
         reader.in.reset();
         log.write(LogLevel::info, "zrrs", "to nobody");
     }
+}
+
+TEST(LinuxStructuredLogTest, LimitsWhatClientsCauseAndNothingElse) {
+    const auto linesOf = [](std::string_view filter, std::optional<LogOrigin::Client> client, bool isOwn) {
+        const LogReader reader(false);
+        {
+            LinuxStructuredLog log(reader.out.get(), filter);
+            const LogOrigin outer(LogOrigin::Client{77, 1});
+            const LogOrigin origin(client);
+            for (int line = 0; line < 500; ++line) {
+                isOwn ? log.report(LogLevel::error, "zrrs", "no disk")
+                      : log.reportOfClient(LogLevel::error, "zrrs", "no reporter {}", line);
+            }
+        }
+        return reader.take();
+    };
+    const auto count = [](const std::string& text) { return std::ranges::count(text, '\n'); };
+    const std::string limited = linesOf("", LogOrigin::Client{1000, 4242}, false);
+    std::smatch told;
+    ASSERT_TRUE(std::regex_search(limited, told,
+                                  std::regex("<3>zrrs +LogTest:[0-9]+ +([0-9]+) further lines like "
+                                             "\"no reporter \\{\\}\" were left out. uid=1000 pid=4242\n$")));
+    EXPECT_EQ(count(limited) - 1 + std::stoi(told[1]), 500);
+    EXPECT_EQ(count(linesOf("", LogOrigin::Client{1000, 4242}, true)), 500) << "the service's own";
+    EXPECT_EQ(count(linesOf("", std::nullopt, false)), 500) << "nobody's";
+    EXPECT_EQ(count(linesOf("zrrs=info", LogOrigin::Client{1000, 4242}, false)), 500) << "asked for";
 }
 
 TEST(LinuxTracePointsTest, WritesTheCodeToTheFirstMarkerThereIs) {

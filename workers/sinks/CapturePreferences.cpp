@@ -66,8 +66,8 @@ std::optional<Value> checked(Context& context, std::string_view key, const LogCa
     std::optional<Value> value = capturePreferences(context).value(key);
     const std::optional<Value> wrong = value && !isRight(*value) ? value : std::nullopt;
     if (context.shared<Reported>().isNews(key, wrong)) {
-        log::error(category, "preference {} {}: {} in place of {}; it is read as 0",
-                   kCapturePreferencesDomain, key, kindOf(*value), wanted);
+        log::ownError(category, "preference {} {}: {} in place of {}; it is read as 0",
+                      kCapturePreferencesDomain, key, kindOf(*value), wanted);
     }
     return value;
 }

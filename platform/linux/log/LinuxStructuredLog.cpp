@@ -11,6 +11,7 @@
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
+#include <new>
 #include <source_location>
 
 #include <fcntl.h>
@@ -112,6 +113,11 @@ LinuxStructuredLog::LinuxStructuredLog(int descriptor, std::string_view filter)
     }
 }
 
+LinuxStructuredLog::~LinuxStructuredLog() {
+    tellLeftOut(LogLimiter::Time::max());
+    static_cast<void>(reportDropped());
+}
+
 /// The description behind standard error may be shared with other processes, which must not find it
 /// non-blocking all at once; a pipe or a terminal is opened once more, for a description of our own.
 void LinuxStructuredLog::prepareChannel(int descriptor) {
@@ -144,8 +150,37 @@ LogLevel LinuxStructuredLog::threshold(std::string_view categoryCode) const noex
     return filter_.threshold(categoryCode);
 }
 
+bool LinuxStructuredLog::admits(const LogKind& kind) noexcept {
+    const std::optional<LogOrigin::Client> client = LogOrigin::client();
+    return !client || filter_.threshold(kind.categoryCode) < LogLevel::standard ||
+           limiter_.admits(*client, kind, std::chrono::steady_clock::now());
+}
+
 void LinuxStructuredLog::write(LogLevel level, std::string_view categoryCode,
                                std::string_view line) noexcept {
+    if (limiter_.hasLeftOut()) {
+        tellLeftOut(std::chrono::steady_clock::now());
+    }
+    writeLine(level, categoryCode, line);
+}
+
+void LinuxStructuredLog::tellLeftOut(LogLimiter::Time now) noexcept {
+    while (const std::optional<LogLimiter::LeftOut> leftOut = limiter_.takeLeftOut(now)) {
+        const LogKind& kind = leftOut->kind;
+        try {
+            std::string line;
+            appendLinePrefix(line, kind.place);
+            appendFormatted(line, "{} further lines like \"{}\" were left out. uid={} pid={}", leftOut->lines,
+                            kind.format, leftOut->last.user, leftOut->last.process);
+            writeLine(kind.level, kind.categoryCode, line);
+        } catch (const std::bad_alloc&) {
+            dropped_.fetch_add(1, std::memory_order_relaxed);
+        }
+    }
+}
+
+void LinuxStructuredLog::writeLine(LogLevel level, std::string_view categoryCode,
+                                   std::string_view line) noexcept {
     LineBuffer buffer;
     const std::array<char, 3> prefix{'<', kPriorities[static_cast<std::size_t>(level)], '>'};
     buffer.append({prefix.data(), prefix.size()});
