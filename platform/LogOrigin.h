@@ -9,7 +9,8 @@ namespace tamblo {
 /// The client on whose behalf the calling thread works, while one of these is in scope: set where a client's
 /// bytes are taken in and where its work is carried out, asked by the log, which limits what a client may
 /// have written. An inner one stands in for the outer one until it goes; one without a client says that the
-/// work is the service's own. Not for keeping: it goes on the thread, and in the scope, that it was made in.
+/// work is the service's own. Work that is posted to a queue, and a delayed call, keep that of their poster.
+/// Not for keeping: it goes on the thread, and in the scope, that it was made in.
 class LogOrigin {
 public:
     struct Client {

@@ -167,6 +167,34 @@ TEST(SerialQueue, RunsNothingWhileItIsSuspendedAndAllOfItAfterwards) {
     }
 }
 
+TEST(SerialQueue, WorkIsItsPostersClientsWhereverItRuns) {
+    LinuxWorkQueues queues;
+    const auto queue = queues.makeSerialQueue("origin");
+    std::vector<pid_t> seen; // unguarded: the queue is the guard
+    const auto note = [&seen] { seen.push_back(LogOrigin::client().value_or(LogOrigin::Client{}).process); };
+    std::promise<void> called;
+    std::unique_ptr<DelayedCall> call;
+    queues.beginWakeUp();
+    {
+        const LogOrigin origin(LogOrigin::Client{1000, 7});
+        queue->post(note);
+        queue->post([&] { queue->post(note, Pace::mayBlock); });
+        call = queues.callAfter(milliseconds(0), [&] {
+            called.set_value();
+            queue->post(note);
+        });
+        queue->post([&] {
+            const LogOrigin own(std::nullopt);
+            queue->post(note);
+        });
+    }
+    queue->post(note);
+    queues.endWakeUp();
+    called.get_future().wait();
+    queues.workOff();
+    EXPECT_THAT(seen, UnorderedElementsAre(7, 0, 7, 0, 7));
+}
+
 TEST(DelayedCall, IsMadeOnceItsTimeHasComeUnlessItIsCalledOff) {
     LinuxWorkQueues queues;
     const auto start = std::chrono::steady_clock::now();

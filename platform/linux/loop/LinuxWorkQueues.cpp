@@ -38,7 +38,11 @@ private:
 class PooledCall final : public DelayedCall {
 public:
     PooledCall(ThreadPool& pool, std::chrono::milliseconds delay, UniqueFunction<void()> call)
-        : pool_(pool), key_(pool.postAfter(delay, std::move(call))) {}
+        : pool_(pool),
+          key_(pool.postAfter(delay, [client = LogOrigin::client(), call = std::move(call)]() mutable {
+              const LogOrigin origin(client);
+              call();
+          })) {}
     ~PooledCall() override { pool_.cancel(key_); }
     PooledCall(const PooledCall&) = delete;
     PooledCall& operator=(const PooledCall&) = delete;
@@ -106,7 +110,7 @@ void LinuxWorkQueues::endRun() {
 void Strand::post(Work work, Pace pace) {
     {
         const MutexLock lock(mutex_);
-        pending_.push_back({std::move(work), pace});
+        pending_.push_back({std::move(work), pace, LogOrigin::client()});
         if (std::exchange(isScheduled_, true)) {
             return;
         }
@@ -149,6 +153,7 @@ void Strand::runBatch(bool stopAtBlocking) {
         if (stopAtBlocking && (mayBlock_ || item.pace == Pace::mayBlock)) {
             break;
         }
+        const LogOrigin origin(item.client);
         item.work();
         // What the work holds is let go before the next runs, as if it had never been queued.
         item.work.reset();

@@ -1,6 +1,7 @@
 #pragma once
 
 #include "base/Mutex.h"
+#include "platform/LogOrigin.h"
 #include "platform/WorkQueue.h"
 #include "platform/linux/loop/ThreadPool.h"
 
@@ -8,6 +9,7 @@
 #include <chrono>
 #include <cstddef>
 #include <memory>
+#include <optional>
 #include <string_view>
 #include <thread>
 #include <utility>
@@ -33,6 +35,9 @@ namespace tamblo {
 // before anything else of the queue runs: that is where the sinks are written and then the replies let go.
 // After that, once a thread has done what there was, it calls the end of the run, for what any queue's work
 // may have left to be written and no reply waits for.
+//
+// On whose behalf. What is posted while the thread works for a client is that client's work, wherever it
+// runs, and so are the delayed calls that it asks for (`LogOrigin`).
 //
 // Who owns what. The user owns the queue, and may let it go at any time, in its own work too. The strand is
 // shared by the queue and by whoever drains it, so that what was posted still runs.
@@ -100,6 +105,7 @@ private:
     struct Item {
         Work work;
         Pace pace;
+        std::optional<LogOrigin::Client> client; ///< for whom it was posted
     };
     using Time = std::chrono::steady_clock::time_point;
 
