@@ -139,6 +139,20 @@ TEST(Service, WhatKeepsItFromStartingIsOneClearLine) {
     EXPECT_EQ(contentOf(taken), "somebody's");
 }
 
+TEST(Service, TakesNoArgumentsButThoseThatAskAboutIt) {
+    const std::string refusal = "tamblod: no arguments are taken but --help and --version\n";
+    for (const char* words : {"-h", "''", "serve", "--help --version", "--version 2"}) {
+        const CommandResult result = run(std::string(TAMBLOD_PATH) + " " + words);
+        EXPECT_EQ(result.output, refusal) << words;
+        EXPECT_EQ(result.status, 2) << words;
+    }
+    EXPECT_THAT(run(TAMBLOD_PATH " --version").output,
+                testing::MatchesRegex("tamblod [0-9]+\\.[0-9]+\\.[0-9]+\n"));
+    const CommandResult help = run(TAMBLOD_PATH " --help 2>/dev/null");
+    EXPECT_TRUE(help.output.starts_with("usage: tamblod ")) << help.output;
+    EXPECT_EQ(help.status, 0);
+}
+
 TEST(Service, TakesOverAnActivatedSocketAndTellsItsManager) {
     const TemporaryDirectory directory;
     const std::string path = directory.path("activated");
