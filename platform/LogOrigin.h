@@ -1,8 +1,8 @@
 #pragma once
 
-#include <optional>
+#include "platform/ClientIdentity.h"
 
-#include <sys/types.h>
+#include <optional>
 
 namespace tamblo {
 
@@ -13,10 +13,7 @@ namespace tamblo {
 /// Not for keeping: it goes on the thread, and in the scope, that it was made in.
 class LogOrigin {
 public:
-    struct Client {
-        uid_t user = 0;
-        pid_t process = 0;
-    };
+    using Client = ClientIdentity;
 
     explicit LogOrigin(std::optional<Client> client) noexcept;
     ~LogOrigin();

@@ -1,6 +1,7 @@
 #include "platform/RequestTurns.h"
 
 #include "base/Mutex.h"
+#include "platform/LogOrigin.h"
 
 #include <atomic>
 #include <chrono>
@@ -193,6 +194,7 @@ void RequestTurns::State::end(const QueueRef& queue, bool isStillItsTurn) {
 }
 
 bool RequestTurns::State::takeTurn(Queue& queue, bool mayBlock) {
+    const LogOrigin origin(queue.client);
     const Time ends = clock.steadyNow() + kSlice;
     do {
         const Queue::Item* const item = queue.front();

@@ -17,7 +17,7 @@ constexpr std::string_view ZRReporterProxyKeyReporterID = "reporterID";
 constexpr std::string_view ZRReporterProxyKeyServiceType = "serviceType";
 constexpr std::string_view kErrorDomain = "com.vandra.audio.reporting";
 constexpr std::int64_t kReportingDisabled = 1;
-/// How many sessions of a client that leaves are looked at in one piece of work.
+/// How many sessions of a client that leaves are let go in one piece of work; of started ones, one.
 constexpr std::size_t kSessionsLeftAtOnce = 16;
 constexpr int kExitStatusKilled = 2;
 /// More retained messages than this take a moment to free.
@@ -58,6 +58,7 @@ struct ZRReportingClientServerInstance::Sending {
     std::vector<SessionRef> recipients;
     std::size_t next = 0;
     ErrorReply reply;
+    std::optional<ReplyError> refusal{}; ///< by one that had no room for the message until its stop is over
 
     [[nodiscard]] MessageRef record() const {
         return std::make_shared<ZRReportingSessionMessage>(message, category, type);
@@ -284,7 +285,7 @@ void ZRReportingClientServerInstance::performSend(Dictionary message, std::uint3
     const bool isStopping = std::any_of(recipients_.begin(), recipients_.end(),
                                         [](const SessionRef& session) { return session->isStopping(); });
     if (isStopping || recipients_.size() > kRecipientsAtOnce) {
-        sendSome(std::make_unique<Sending>(Sending{std::move(message), category, type, reporterIDs.empty(),
+        sendSome(std::make_shared<Sending>(Sending{std::move(message), category, type, reporterIDs.empty(),
                                                    std::exchange(recipients_, {}), 0, std::move(reply)}));
         return;
     }
@@ -302,15 +303,19 @@ void ZRReportingClientServerInstance::performSend(Dictionary message, std::uint3
     answer(reply);
 }
 
-void ZRReportingClientServerInstance::sendSome(std::unique_ptr<Sending> sending) {
+void ZRReportingClientServerInstance::sendSome(std::shared_ptr<Sending> sending) {
     const std::size_t end = std::min(sending->recipients.size(), sending->next + kRecipientsAtOnce);
     while (sending->next != end) {
         const SessionRef session = std::move(sending->recipients[sending->next++]);
         if (session->isStopping()) {
             // The session keeps the message for its end, and this client's requests wait for that.
             requests_->suspend();
-            session->sendMessage(sending->record(),
-                                 [requests = requests_](const ReplyError*) { requests->resume(); });
+            session->sendMessage(sending->record(), [sending, requests = requests_](const ReplyError* error) {
+                if (error != nullptr) {
+                    sending->refusal = *error;
+                }
+                requests->resume();
+            });
             break;
         }
         if (session->started() || !sending->isForStartedOnly) {
@@ -318,10 +323,10 @@ void ZRReportingClientServerInstance::sendSome(std::unique_ptr<Sending> sending)
         }
     }
     afterTurnsOfOthers(Pace::quick, [sending = std::move(sending)](auto& client) mutable {
-        if (sending->next == sending->recipients.size()) {
-            answer(sending->reply);
-        } else {
+        if (sending->next != sending->recipients.size()) {
             client.sendSome(std::move(sending));
+        } else if (sending->reply) {
+            sending->reply(sending->refusal ? &*sending->refusal : nullptr);
         }
     });
 }
@@ -459,14 +464,16 @@ void ZRReportingClientServerInstance::endConnection() {
 }
 
 void ZRReportingClientServerInstance::leaveSome() {
-    for (std::size_t i = 0; i != kSessionsLeftAtOnce && !clientReportingSessionMap_.empty(); ++i) {
+    bool hasStopped = false;
+    for (std::size_t i = 0; i != kSessionsLeftAtOnce && !hasStopped && !clientReportingSessionMap_.empty();
+         ++i) {
         // Let go as soon as it is stopped, so that what it holds is not freed all at once in the end.
         const auto entry = clientReportingSessionMap_.begin();
         const SessionRef& session = entry->second;
-        if (session->started() && !session->stopSome()) {
-            break;
+        hasStopped = session->started();
+        if (!hasStopped || session->stopSome()) {
+            clientReportingSessionMap_.erase(entry);
         }
-        clientReportingSessionMap_.erase(entry);
     }
     if (!clientReportingSessionMap_.empty()) {
         afterTurnsOfOthers(Pace::mayBlock, [](auto& client) { client.leaveSome(); });
@@ -504,6 +511,7 @@ void ZRReportingClientServerInstance::storeSession(ReporterID reporterID, Sessio
     countConfiguration(before, heldBytes(place->configuration()));
     if (const Delegate delegate = hasLeft_ || replaced != nullptr ? nullptr : delegate_.lock()) {
         ++delegate->accountOf(user()).sessions;
+        ++context_.platform().activity->sessions;
     }
     if (replaced != nullptr && replaced->messages().size() > kManyMessages) {
         // Freed as a piece of work of its own, which may take its time.
@@ -519,6 +527,7 @@ void ZRReportingClientServerInstance::dropSession(SessionMap::iterator entry) {
     countConfiguration(heldBytes(session->configuration()), 0);
     if (const Delegate delegate = hasLeft_ ? nullptr : delegate_.lock()) {
         --delegate->accountOf(user()).sessions;
+        --context_.platform().activity->sessions;
     }
 }
 

@@ -98,7 +98,7 @@ private:
     void performStart(ReporterID reporterID, BooleanReply reply);
     void performSend(Dictionary message, std::uint32_t category, std::uint16_t type,
                      const std::vector<ReporterID>& reporterIDs, ErrorReply reply);
-    void sendSome(std::unique_ptr<Sending> sending);
+    void sendSome(std::shared_ptr<Sending> sending);
     void performStop(ReporterID reporterID, BooleanReply reply);
     void stopSome(ReporterID reporterID, const SessionRef& session, BooleanReply reply);
     void performDestroy(ReporterID reporterID, BooleanReply reply);

@@ -145,6 +145,7 @@ bool ZRReportingService::removeClient(ZRReportingClientServerInstance& client) {
     ++leavingClients_;
     UserAccount& account = accounts_[client.user()];
     account.sessions -= client.clientReportingSessionMap().size();
+    context_.platform().activity->sessions -= client.clientReportingSessionMap().size();
     for (const auto& [reporterID, session] : client.clientReportingSessionMap()) {
         account.configurationBytes -= heldBytes(session->configuration());
         sessionChanged(client, reporterID, nullptr);
@@ -182,8 +183,10 @@ void ZRReportingService::logSessionsOfClients() const {
         for (auto entry = all.begin(); entry != all.end() && shown.size() != SessionList::kMost; ++entry) {
             shown.push_back(entry->second);
         }
-        log::standard(ZRReportingServiceDelegateCategory(), "sessions for client {} : {}",
-                      client->processIdentifier(), SessionList{shown, all.size()});
+        if (!log::standard(ZRReportingServiceDelegateCategory(), "sessions for client {} : {}",
+                           client->processIdentifier(), SessionList{shown, all.size()})) {
+            return;
+        }
     }
 }
 

@@ -20,9 +20,6 @@ namespace {
 constexpr std::size_t kBytesOfShortStop = 128U << 10U;
 /// Messages that are entered into the index, or let go, in one part.
 constexpr std::size_t kMessagesOfPart = 20'000;
-/// What the client of a message that cannot wait is answered, as with any limit.
-constexpr std::string_view kLimitErrorDomain = "com.vandra.tamblo.protocol";
-constexpr std::int64_t kLimitErrorCode = -32'000;
 /// Messages that came meanwhile and are sent in one part.
 constexpr std::size_t kMessagesSentInPart = 500;
 
@@ -154,7 +151,7 @@ void ZRReportingSession::keepWaiting(const MessageRef& message, ErrorReply reply
                    reporterID_);
     }
     if (reply) {
-        const ReplyError error{.domain = std::string(kLimitErrorDomain), .code = kLimitErrorCode};
+        const ReplyError error = limitReached("waiting_messages", RetainedMessages::kMostWaitingBytesOfUser);
         reply(&error);
     }
 }

@@ -64,18 +64,19 @@ template <typename... Arguments>
 }
 
 template <typename... Arguments>
-[[gnu::noinline, gnu::cold]] void writeIfAdmitted(const LogKind& kind, const Arguments&... arguments) {
-    if (admits(kind)) {
+[[gnu::noinline, gnu::cold]] bool writeIfAdmitted(const LogKind& kind, const Arguments&... arguments) {
+    const bool isAdmitted = admits(kind);
+    if (isAdmitted) {
         writeLine(kind, arguments...);
     }
+    return isAdmitted;
 }
 
 template <typename... Arguments>
-void at(LogLevel level, const LogCategory& category,
+bool at(LogLevel level, const LogCategory& category,
         const FormatString<std::type_identity_t<Arguments>...>& format, const Arguments&... arguments) {
-    if (category.isOn(level)) [[unlikely]] {
-        writeIfAdmitted({level, category.code(), format.format, format.location}, arguments...);
-    }
+    return category.isOn(level) &&
+           writeIfAdmitted({level, category.code(), format.format, format.location}, arguments...);
 }
 
 } // namespace detail
@@ -92,11 +93,11 @@ void info(const LogCategory& category, FormatString<std::type_identity_t<Argumen
     detail::at<Arguments...>(LogLevel::info, category, format, arguments...);
 }
 
-/// The default level.
+/// The default level. Whether the line was written: many in a row may as well end with the first that is not.
 template <typename... Arguments>
-void standard(const LogCategory& category, FormatString<std::type_identity_t<Arguments>...> format,
+bool standard(const LogCategory& category, FormatString<std::type_identity_t<Arguments>...> format,
               const Arguments&... arguments) {
-    detail::at<Arguments...>(LogLevel::standard, category, format, arguments...);
+    return detail::at<Arguments...>(LogLevel::standard, category, format, arguments...);
 }
 
 template <typename... Arguments>

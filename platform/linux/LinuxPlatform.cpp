@@ -220,8 +220,11 @@ void LinuxPlatform::run(SerialQueue& requestQueue,
     all.connections.setRequestQueue(requestQueue, all.workQueues);
     all.signals.setEndWanted([&all, &shutDown] {
         notifyServiceManager("STOPPING=1");
-        all.connections.stop();
-        shutDown([&all] { all.loop.post([&all] { all.loop.stop(); }); });
+        // What clients sent before the signal is read first, as far as it came with the same wake-up.
+        all.loop.post([&all, &shutDown] {
+            all.connections.stop();
+            shutDown([&all] { all.loop.post([&all] { all.loop.stop(); }); });
+        });
     });
     notifyServiceManager("READY=1");
     all.health.watch(requestQueue);

@@ -2,6 +2,7 @@
 
 #include "base/WhileAlive.h"
 #include "platform/Platform.h"
+#include "platform/RequestTurns.h"
 
 #include <array>
 #include <atomic>
@@ -255,9 +256,12 @@ private:
 /// One connection whose client is the test: calls the exported object, breaks off, ends.
 class FakeClientConnection final : public ClientConnection {
 public:
-    explicit FakeClientConnection(pid_t pid) : pid_(pid) {}
+    FakeClientConnection(const ClientIdentity& peer, RequestTurns& turns)
+        : peer_(peer), requests_(turns.makeQueue(peer, [] {})) {}
 
-    pid_t peerProcessIdentifier() const noexcept override { return pid_; }
+    ClientIdentity peer() const noexcept override { return peer_; }
+    bool isPeerThere() const noexcept override { return true; }
+    const std::shared_ptr<RequestQueue>& requestQueue() const noexcept override { return requests_; }
     void setExportedObject(std::shared_ptr<ZRReportingServiceProtocol> object) override {
         object_ = std::move(object);
     }
@@ -268,7 +272,7 @@ public:
         invalidation_ = std::move(handler);
     }
     void resume() override {}
-    std::string description() const override { return "connection of " + std::to_string(pid_); }
+    std::string description() const override { return "connection of " + std::to_string(peer_.process); }
 
     [[nodiscard]] ZRReportingServiceProtocol& object() const noexcept { return *object_; }
     void interrupt() { interruption_(); }
@@ -280,7 +284,8 @@ public:
     void dropObject() { object_.reset(); }
 
 private:
-    const pid_t pid_;
+    const ClientIdentity peer_;
+    const std::shared_ptr<RequestQueue> requests_;
     std::shared_ptr<ZRReportingServiceProtocol> object_;
     UniqueFunction<void()> interruption_;
     UniqueFunction<void()> invalidation_;
@@ -292,8 +297,9 @@ public:
     ConnectionListener& listenerForServiceName(std::string_view) override { return *this; }
 
     /// A new client, or null when it is turned away or nobody listens.
-    [[nodiscard]] std::unique_ptr<FakeClientConnection> connect(pid_t pid) {
-        auto connection = std::make_unique<FakeClientConnection>(pid);
+    [[nodiscard]] std::unique_ptr<FakeClientConnection> connect(const ClientIdentity& peer,
+                                                                RequestTurns& turns) {
+        auto connection = std::make_unique<FakeClientConnection>(peer, turns);
         const bool isAccepted = isResumed_ && delegate_->shouldAcceptNewConnection(*connection);
         return isAccepted ? std::move(connection) : nullptr;
     }

@@ -148,16 +148,13 @@ TEST_F(ServiceTest, LookupsCrossClientsChangesDoNot) {
     EXPECT_FALSE(find(8)->configuration().contains("a"));
 }
 
-TEST_F(ServiceTest, PacesAndTracePoints) {
-    (void)device.serverQueue().takePaces();
+TEST_F(ServiceTest, TracePoints) {
     (void)device.tracePoints.take();
     requests.createReportingSession(7, {});
     requests.startReportingSessionForID(7, {});
     requests.sendMessage({}, 1, 1, {5}, {});
     requests.stopReportingSessionForID(7, {});
     requests.destroyReportingSession(7, {});
-    EXPECT_THAT(device.serverQueue().takePaces(),
-                ElementsAre(Pace::quick, Pace::mayBlock, Pace::quick, Pace::mayBlock, Pace::mayBlock));
     (void)run();
     std::vector<std::uint32_t> codes = device.tracePoints.take();
     std::erase_if(codes, [](std::uint32_t code) { return code > 0x21044824; }); // a session's own
@@ -292,7 +289,7 @@ TEST_F(ServiceTest, ALostClientIsRemovedAndItsUptimeReportedOnce) {
     const Connection fromTheFuture = connect(12);
     device.clock.advance(milliseconds(-1500));
     fromTheFuture->invalidate();
-    const auto nameless = device.connections.connect(99);
+    const auto nameless = device.connections.connect({1000, 99}, turns);
     nameless->invalidate();
     (void)run();
     const Connection gone = connect(11);

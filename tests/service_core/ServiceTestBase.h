@@ -37,9 +37,9 @@ protected:
 
     std::size_t run() { return device.serverQueue().runAll(); }
 
-    Connection connect(pid_t pid) {
+    Connection connect(pid_t pid, uid_t user = 1000) {
         device.processInformation.names.emplace(pid, "app" + std::to_string(pid));
-        Connection connection = device.connections.connect(pid);
+        Connection connection = device.connections.connect({user, pid}, turns);
         (void)run();
         return connection;
     }
@@ -93,6 +93,7 @@ protected:
     static inline int exitStatus = 0;
 
     FakePlatform device;
+    RequestTurns turns{device.serverQueue(), device.clock};
     WorkerScript& script = WorkerScript::current();
     std::vector<std::string> replies;
     std::unique_ptr<ZRReportingService> service =

@@ -1,6 +1,7 @@
 #include "platform/linux/connections/LinuxConnection.h"
 
 #include "base/Format.h"
+#include "platform/LogOrigin.h"
 #include "platform/linux/connections/RequestDispatch.h"
 #include "wire/FrameSplitter.h"
 #include "wire/Reply.h"
@@ -107,6 +108,7 @@ void LinuxConnection::ready(std::uint32_t events) {
 
 void LinuxConnection::read() {
     isReadable_ = false;
+    const LogOrigin origin(peer_);
     try {
         readOnce();
     } catch (const std::bad_alloc&) {
@@ -271,9 +273,9 @@ void LinuxConnection::refuse(const wire::Refusal& refusal) {
 
 void LinuxConnection::noteLimit(std::string_view limit) {
     if (!std::exchange(isLimitNoted_, true)) {
-        shared_.log.report(
-            LogLevel::error, "zrrs",
-            formatted("a client is refused: {}. pid={} uid={}", limit, peer_.process, peer_.user));
+        const LogOrigin origin(peer_);
+        shared_.log.reportOfClient(LogLevel::error, "zrrs", "a client is refused: {}. pid={} uid={}", limit,
+                                   peer_.process, peer_.user);
     }
 }
 
@@ -484,6 +486,7 @@ void LinuxConnection::end() {
     if (!ended_) {
         return;
     }
+    const LogOrigin origin(peer_);
     if (waitsForPeer()) {
         shared_.loop.callAfter(kPatienceWithPeer, [self = shared_from_this()] {
             {

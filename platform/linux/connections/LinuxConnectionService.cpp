@@ -3,6 +3,7 @@
 #include "base/NumberText.h"
 #include "os/Directory.h"
 #include "os/LocalAddress.h"
+#include "platform/LogOrigin.h"
 #include "wire/Protocol.h"
 
 #include <algorithm>
@@ -203,6 +204,7 @@ void LinuxConnectionService::stopWatching() {
 void LinuxConnectionService::accept(FileDescriptor socket) {
     const int descriptor = socket.get();
     LinuxConnection::Peer peer = peerOf(descriptor);
+    const LogOrigin origin(peer.identity);
     const std::shared_ptr<ClientUser> user = userNumbered(peer.identity.user);
     const auto connection =
         std::make_shared<LinuxConnection>(shared_, std::move(socket), std::move(peer), user,
