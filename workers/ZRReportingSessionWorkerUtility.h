@@ -1,26 +1,53 @@
 #pragma once
 
+#include "base/KeyPlaces.h"
 #include "session/ZRReportingSessionMessage.h"
 
 #include <chrono>
+#include <cstddef>
+#include <cstdint>
+#include <optional>
 #include <span>
 #include <string_view>
 #include <vector>
 
 namespace tamblo {
 
+/// Folds bursts, message by message: a setting that a client reports in a few quick messages, each with one
+/// of some related keys, becomes one message. A message counts under the first of the keys that it carries;
+/// one with a key that the burst already has begins a new burst. The first message of a burst takes in the
+/// payloads of those that follow it, each less than the pause after the one before, timestamps included; it
+/// changes in place, in the session's list as well. Messages without any of the keys pass through.
+///
+/// The messages stay their owner's. At most 16 keys, which outlive this. For a session that takes no messages
+/// any longer.
+class RapidMessages {
+public:
+    RapidMessages(std::span<const std::string_view> keys, std::chrono::duration<double> maximumPause)
+        : keyCount_(keys.size()), places_(keys), maximumPause_(maximumPause) {}
+
+    void add(ZRReportingSessionMessage& message);
+    /// Those that were not taken into an earlier one.
+    [[nodiscard]] const std::vector<ZRReportingSessionMessage*>& result() const noexcept { return result_; }
+
+private:
+    [[nodiscard]] std::optional<std::size_t> firstKeyOf(const Dictionary& payload);
+    [[nodiscard]] bool takeIn(ZRReportingSessionMessage& message, std::size_t key);
+
+    const std::size_t keyCount_;
+    KeyPlaces places_;
+    const std::chrono::duration<double> maximumPause_;
+    std::uint32_t seenKeys_ = 0;                  ///< of the burst at hand
+    ZRReportingSessionMessage* anchor_ = nullptr; ///< what takes its others in; null when nothing does
+    std::vector<ZRReportingSessionMessage*> result_;
+};
+
 /// What several workers do with messages.
 class ZRReportingSessionWorkerUtility {
 public:
     ZRReportingSessionWorkerUtility() = delete;
 
-    /// Folds bursts: a setting that a client reports in a few quick messages, each with one of some related
-    /// keys, becomes one message. A message counts under the first of the keys that it carries; one with a
-    /// key that the burst already has begins a new burst. The first message of a burst takes in the payloads
-    /// of those that follow it, each less than the pause after the one before, timestamps included; it
-    /// changes in place, in the session's list as well. Messages without any of the keys pass through.
-    ///
-    /// The messages stay their owner's. At most 16 keys. For a session that takes no messages any longer.
+    /// Folds the bursts among the messages.
     [[nodiscard]] static std::vector<ZRReportingSessionMessage*>
     combineRapidMessages(std::span<const MessageRef> messages,
                          std::span<const std::string_view> keysToCombine,

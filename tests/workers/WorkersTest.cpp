@@ -375,23 +375,22 @@ TEST_F(RtcWorkerTest, TheSummaryJoinsWhatWasSentOnceWhileStarted) {
 }
 
 TEST(LinkmeterSummaryTest, ValuesAreTextsInTheOrderOfTheMessages) {
-    const std::vector<MessageRef> messages{
-        messageOf({{"a", ""}, {"b", true}, {"c", Array{1, "x"}}}),
-        messageOf({{"a", "x"}, {"b", 0.5F}, {"ZR_Session_Summary_Event", "mine"}}),
-        messageOf({{"a", "y,z"}, {"b", NAN}, {"d", Value::date(0)}}),
-        messageOf({{"a", Dictionary{{"k", 1}}}, {"b", ~0ULL}, {"c", Value::data({})}}),
-        messageOf({{"a", "a repeat"}}),
-        messageOf({{"a", "before the start"}})};
-    for (const MessageRef& message : messages) {
-        message->isSessionStarted = message != messages.back();
-    }
-    messages[4]->isRedundant = true;
-    EXPECT_EQ(linkmeterSummary(messages, AudioServiceTypeUnknown),
+    const std::vector<Dictionary> payloads{
+        {{"a", ""}, {"b", true}, {"c", Array{1, "x"}}},
+        {{"a", "x"}, {"b", 0.5F}, {"ZR_Session_Summary_Event", "mine"}},
+        {{"a", "y,z"}, {"b", NAN}, {"d", Value::date(0)}},
+        {{"a", Dictionary{{"k", 1}}}, {"b", ~0ULL}, {"c", Value::data({})}}};
+    EXPECT_EQ(LinkmeterSummary::of(payloads, AudioServiceTypeUnknown).values,
               (Dictionary{{"a", R"(,x,y,z,{"k":1})"},
                           {"b", "true,0.5,null,18446744073709551615"},
                           {"c", R"([1,"x"],"")"},
                           {"d", R"("1970-01-01T00:00:00.000Z")"},
                           {"ZR_Session_Summary_Event", "65535,mine"}}));
+
+    const std::vector<Dictionary> many(30, {{"a", std::string(1U << 20U, 'x')}});
+    const LinkmeterSummary full = LinkmeterSummary::of(many, AudioServiceTypeUnknown);
+    EXPECT_LT(full.values.find("a")->stringValue().size(), 18U << 20U);
+    EXPECT_EQ(full.leftOut, 30 - full.values.find("a")->stringValue().size() / ((1U << 20U) + 1) - 1);
 }
 
 } // namespace

@@ -5,7 +5,6 @@
 #include "util/MessageKeys.h"
 #include "util/NumberBuckets.h"
 #include "util/SummaryBuckets.h"
-#include "workers/ZRReportingSessionWorkerUtility.h"
 
 #include <algorithm>
 #include <array>
@@ -91,15 +90,36 @@ std::vector<MessageRef> DerivedMessages::take() {
     return std::exchange(messages_, {});
 }
 
-std::vector<ZRReportingSessionMessage*> combineSpatialAudioSettings(const std::vector<MessageRef>& messages,
-                                                                    Seconds longestPause) {
+RapidMessages rapidSpatialAudioSettings(Seconds longestPause) {
     static constexpr std::array<std::string_view, 2> kSettings{
         ZRReportingMessageKeySpatialAudioAccessoryFeature, kSpatializationEnabledKey};
-    return ZRReportingSessionWorkerUtility::combineRapidMessages(messages, kSettings, longestPause);
+    return {kSettings, longestPause};
 }
 
 Dictionary previousValuesOf(const std::shared_ptr<ZRReportingSession>& session) {
     return session != nullptr ? session->previousValues() : Dictionary();
+}
+
+Seconds leastLengthOf(const std::shared_ptr<ZRReportingSession>& session) {
+    return ZRReportingUtilityVolumeMinimumPlayingTime(session != nullptr ? session->serviceType()
+                                                                         : AudioServiceTypeUnknown);
+}
+
+DerivedSending::DerivedSending(ZRReportingSession& session, std::string_view what,
+                               std::vector<MessageRef> derived)
+    : derived_(std::move(derived)) {
+    if (!derived_.empty()) {
+        log::standard(ZRReportingSessionCategory(), "sending {} for reporter {}", what, session.reporterID());
+    }
+}
+
+bool DerivedSending::sendSome(ZRReportingSession& session) {
+    constexpr std::size_t kMessagesOfPart = 500;
+    const std::size_t end = std::min(derived_.size(), sent_ + kMessagesOfPart);
+    for (; sent_ < end; ++sent_) {
+        session.sendMessage(derived_[sent_]);
+    }
+    return sent_ == derived_.size();
 }
 
 } // namespace tamblo

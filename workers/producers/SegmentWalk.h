@@ -1,17 +1,22 @@
 #pragma once
 
 #include "base/Dictionary.h"
+#include "base/UniqueFunction.h"
 #include "session/ZRReportingSession.h"
 #include "session/ZRReportingSessionMessage.h"
 #include "util/AudioEvents.h"
-#include "util/Log.h"
+#include "workers/ZRReportingSessionWorkerUtility.h"
 
+#include <algorithm>
 #include <chrono>
+#include <cstddef>
 #include <cstdint>
 #include <memory>
+#include <optional>
 #include <span>
 #include <string>
 #include <string_view>
+#include <utility>
 #include <vector>
 
 /// What the producers of volume, group-session and input summaries have in common. Each walks a session's
@@ -82,38 +87,111 @@ private:
     std::vector<MessageRef> messages_;
 };
 
-/// The messages with each burst of the two spatial-audio settings folded into one.
-[[nodiscard]] std::vector<ZRReportingSessionMessage*>
-combineSpatialAudioSettings(const std::vector<MessageRef>& messages, Seconds longestPause);
+/// What folds bursts of the two spatial-audio settings.
+[[nodiscard]] RapidMessages rapidSpatialAudioSettings(Seconds longestPause);
 
 /// What a walk begins with: what the session's earlier runs left, nothing once the session is gone.
 [[nodiscard]] Dictionary previousValuesOf(const std::shared_ptr<ZRReportingSession>& session);
 
-/// What a walk over these messages derives.
-template <typename Walk, typename Messages>
-[[nodiscard]] std::vector<MessageRef> derivedBy(Walk walk, const Messages& messages) {
-    for (const auto& message : messages) {
-        walk.take(message->payload());
+/// What a walk derives of messages, bursts folded where that is asked for; a part at a time, since a session
+/// may have hundreds of thousands. The messages must not change in between.
+template <typename Walk> class Derivation {
+public:
+    /// Messages that are looked at in one part.
+    static constexpr std::size_t kMessagesOfPart = 10'000;
+
+    Derivation(Walk walk, std::optional<RapidMessages> rapid)
+        : walk_(std::move(walk)), rapid_(std::move(rapid)) {}
+
+    /// Does the next part. Whether all is done.
+    [[nodiscard]] bool deriveSome(std::span<const MessageRef> messages) {
+        if (rapid_ && folded_ < messages.size()) {
+            for (const std::size_t end = endOfPart(folded_, messages.size()); folded_ < end; ++folded_) {
+                rapid_->add(*messages[folded_]);
+            }
+            return false;
+        }
+        const std::size_t count = rapid_ ? rapid_->result().size() : messages.size();
+        for (const std::size_t end = endOfPart(walked_, count); walked_ < end; ++walked_) {
+            walk_.take((rapid_ ? rapid_->result()[walked_] : messages[walked_].get())->payload());
+        }
+        return walked_ == count;
     }
-    return walk.finish();
+    /// What was derived of all.
+    [[nodiscard]] std::vector<MessageRef> finish() { return walk_.finish(); }
+
+private:
+    [[nodiscard]] static std::size_t endOfPart(std::size_t begin, std::size_t count) noexcept {
+        return std::min(count, begin + kMessagesOfPart);
+    }
+
+    Walk walk_;
+    std::optional<RapidMessages> rapid_;
+    std::size_t folded_ = 0;
+    std::size_t walked_ = 0;
+};
+
+/// The least length of a segment that is reported of the session.
+[[nodiscard]] Seconds leastLengthOf(const std::shared_ptr<ZRReportingSession>& session);
+
+/// What a walk over these messages derives.
+template <typename Walk>
+[[nodiscard]] std::vector<MessageRef> derivedBy(Walk walk, std::span<const MessageRef> messages,
+                                                std::optional<RapidMessages> rapid = std::nullopt) {
+    Derivation<Walk> derivation(std::move(walk), std::move(rapid));
+    while (!derivation.deriveSome(messages)) {
+    }
+    return derivation.finish();
 }
 
-/// What a producer does when its session stops: has `derive` make messages of what the session recorded,
-/// given the session and the least length of a segment, and sends them into it as a client would.
-template <typename Derive>
-void deriveAtStop(const std::shared_ptr<ZRReportingSession>& session, std::string_view what, Derive derive) {
-    if (session == nullptr || session->messages().empty()) {
-        return;
+/// The next part of what is left to do of a producer's stop; whether all is done.
+using PartOfStop = UniqueFunction<bool()>;
+
+/// Sends a producer's derived messages into its session as a client would, some hundreds in one part.
+class DerivedSending {
+public:
+    DerivedSending(ZRReportingSession& session, std::string_view what, std::vector<MessageRef> derived);
+    /// Whether all are sent.
+    [[nodiscard]] bool sendSome(ZRReportingSession& session);
+
+private:
+    std::vector<MessageRef> derived_;
+    std::size_t sent_ = 0;
+};
+
+/// What a producer does when its session stops: has a walk make messages of what the session recorded and
+/// sends them into it.
+template <typename Walk>
+[[nodiscard]] PartOfStop derivingStop(std::weak_ptr<ZRReportingSession> session, std::string_view what,
+                                      Walk walk, std::optional<RapidMessages> rapid = std::nullopt) {
+    return [session = std::move(session), what,
+            derivation = std::make_unique<Derivation<Walk>>(std::move(walk), std::move(rapid)),
+            sending = std::optional<DerivedSending>()]() mutable {
+        const std::shared_ptr<ZRReportingSession> owner = session.lock();
+        if (owner == nullptr || (!sending && owner->messages().empty())) {
+            return true;
+        }
+        if (sending) {
+            return sending->sendSome(*owner);
+        }
+        if (derivation->deriveSome(owner->messages())) {
+            sending.emplace(*owner, what, derivation->finish());
+            derivation.reset();
+        }
+        return false;
+    };
+}
+
+/// Goes on with what is left of a stop, which `begin` makes when nothing is. Whether all is done.
+template <typename Begin> [[nodiscard]] bool stopPart(PartOfStop& left, Begin begin) {
+    if (!left) {
+        left = begin();
     }
-    const std::vector<MessageRef> derived =
-        derive(*session, ZRReportingUtilityVolumeMinimumPlayingTime(session->serviceType()));
-    if (derived.empty()) {
-        return;
+    if (!left()) {
+        return false;
     }
-    log::standard(ZRReportingSessionCategory(), "sending {} for reporter {}", what, session->reporterID());
-    for (const MessageRef& message : derived) {
-        session->sendMessage(message);
-    }
+    left.reset();
+    return true;
 }
 
 } // namespace tamblo

@@ -9,6 +9,7 @@
 #include "workers/producers/SegmentWalk.h"
 
 #include <memory>
+#include <optional>
 #include <set>
 #include <string>
 #include <string_view>
@@ -69,8 +70,8 @@ std::string joined(const std::set<std::string>& entries) {
 /// session left opens no segment.
 class InputWalk {
 public:
-    InputWalk(Dictionary previousValues, const Value* process, Seconds minimum)
-        : previousValues_(std::move(previousValues)), process_(process), minimum_(minimum) {
+    InputWalk(Dictionary previousValues, std::optional<Value> process, Seconds minimum)
+        : previousValues_(std::move(previousValues)), process_(std::move(process)), minimum_(minimum) {
         state_ = Fields(defaults(), places_);
         state_.merge(Fields(previousValues_, places_));
     }
@@ -130,7 +131,7 @@ private:
     void endSegment(const Value* timestamp) {
         const Seconds runningTime = start_.until(timestamp);
         derived_.logLength(start_, timestamp);
-        if (timestamp != nullptr && start_.isKnown() && process_ != nullptr && runningTime > minimum_) {
+        if (timestamp != nullptr && start_.isKnown() && process_.has_value() && runningTime > minimum_) {
             derived_.add(summary(runningTime), AudioEventKindInput);
             vocoders_.clear();
         } else {
@@ -154,9 +155,9 @@ private:
         return payload;
     }
 
-    const Dictionary previousValues_;
-    const Value* const process_;
-    const Seconds minimum_;
+    Dictionary previousValues_;
+    std::optional<Value> process_;
+    Seconds minimum_;
     KeyPlaces places_{kKeys};
     /// The latest value of each key, up to the message before the one at hand.
     Fields state_;
@@ -168,17 +169,25 @@ private:
 
 } // namespace
 
-void ZRReportingSessionInputMessagesWorker::stop() {
-    deriveAtStop(session(), "input summary event", [this](const ZRReportingSession& owner, Seconds minimum) {
-        const Value process = ZRReportingUtilityRetrieveAppName(owner.configuration());
-        return createInputMessages(owner.messages(), &process, minimum);
+bool ZRReportingSessionInputMessagesWorker::stopSome() {
+    return stopPart(stopLeft_, [this] {
+        const std::shared_ptr<ZRReportingSession> owner = session();
+        return derivingStop(owner, "input summary event",
+                            InputWalk(previousValuesOf(owner),
+                                      owner != nullptr ? std::optional(ZRReportingUtilityRetrieveAppName(
+                                                             owner->configuration()))
+                                                       : std::nullopt,
+                                      leastLengthOf(owner)),
+                            rapidSpatialAudioSettings(kLongestPauseInBurst));
     });
 }
 
 std::vector<MessageRef> ZRReportingSessionInputMessagesWorker::createInputMessages(
     const std::vector<MessageRef>& messages, const Value* process, Seconds minimumRunningtime) const {
-    return derivedBy(InputWalk(previousValuesOf(session()), process, minimumRunningtime),
-                     combineSpatialAudioSettings(messages, kLongestPauseInBurst));
+    return derivedBy(InputWalk(previousValuesOf(session()),
+                               process != nullptr ? std::optional(*process) : std::nullopt,
+                               minimumRunningtime),
+                     messages, rapidSpatialAudioSettings(kLongestPauseInBurst));
 }
 
 } // namespace tamblo

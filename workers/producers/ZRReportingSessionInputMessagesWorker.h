@@ -1,5 +1,6 @@
 #pragma once
 
+#include "base/UniqueFunction.h"
 #include "session/ZRReportingSessionWorkerProtocol.h"
 
 #include <chrono>
@@ -15,13 +16,20 @@ class ZRReportingSessionInputMessagesWorker final : public ZRReportingSessionWor
 public:
     using ZRReportingSessionWorkerProducerProtocol::ZRReportingSessionWorkerProducerProtocol;
 
-    void stop() override;
+    void stop() override {
+        while (!stopSome()) {
+        }
+    }
+    [[nodiscard]] bool stopSome() override;
 
     /// The summaries of the messages, which must not change meanwhile but for the bursts of spatial-audio
     /// settings that are folded in place. Without a process name, null, there are none.
     [[nodiscard]] std::vector<MessageRef>
     createInputMessages(const std::vector<MessageRef>& messages, const Value* process,
                         std::chrono::duration<double> minimumRunningtime) const;
+
+private:
+    UniqueFunction<bool()> stopLeft_; ///< of a stop that is under way
 };
 
 } // namespace tamblo

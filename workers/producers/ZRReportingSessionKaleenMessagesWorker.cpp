@@ -148,9 +148,9 @@ private:
                 {kMessageIndexKey, derived_.nextIndex()}};
     }
 
-    const Dictionary previousValues_;
-    const Seconds minimum_;
-    const DestinationWorkers destinations_;
+    Dictionary previousValues_;
+    Seconds minimum_;
+    DestinationWorkers destinations_;
     KeyPlaces places_{kKeys};
     /// The latest value of each key, up to the message before the one at hand.
     Fields state_;
@@ -162,9 +162,12 @@ private:
 
 } // namespace
 
-void ZRReportingSessionKaleenMessagesWorker::stop() {
-    deriveAtStop(session(), "kaleen event", [this](const ZRReportingSession& owner, Seconds minimum) {
-        return createKaleenMessages(owner.messages(), minimum);
+bool ZRReportingSessionKaleenMessagesWorker::stopSome() {
+    return stopPart(stopLeft_, [this] {
+        const std::shared_ptr<ZRReportingSession> owner = session();
+        return derivingStop(owner, "kaleen event",
+                            KaleenWalk(previousValuesOf(owner), leastLengthOf(owner),
+                                       destinations(context().isInternalBuild())));
     });
 }
 

@@ -1,5 +1,6 @@
 #pragma once
 
+#include "base/UniqueFunction.h"
 #include "session/ZRReportingSessionWorkerProtocol.h"
 
 #include <chrono>
@@ -14,12 +15,19 @@ class ZRReportingSessionKaleenMessagesWorker final : public ZRReportingSessionWo
 public:
     using ZRReportingSessionWorkerProducerProtocol::ZRReportingSessionWorkerProducerProtocol;
 
-    void stop() override;
+    void stop() override {
+        while (!stopSome()) {
+        }
+    }
+    [[nodiscard]] bool stopSome() override;
 
     /// The summaries of the messages.
     [[nodiscard]] std::vector<MessageRef>
     createKaleenMessages(const std::vector<MessageRef>& messages,
                          std::chrono::duration<double> minimumPlaytime) const;
+
+private:
+    UniqueFunction<bool()> stopLeft_; ///< of a stop that is under way
 };
 
 } // namespace tamblo

@@ -8,6 +8,7 @@
 #include "workers/producers/SegmentWalk.h"
 
 #include <memory>
+#include <optional>
 #include <string_view>
 #include <utility>
 
@@ -65,8 +66,8 @@ const Dictionary& defaults() {
 /// One walk over a session's messages.
 class VolumeWalk {
 public:
-    VolumeWalk(Dictionary previousValues, const Value* process, Seconds minimum)
-        : previousValues_(std::move(previousValues)), process_(process), minimum_(minimum) {
+    VolumeWalk(Dictionary previousValues, std::optional<Value> process, Seconds minimum)
+        : previousValues_(std::move(previousValues)), process_(std::move(process)), minimum_(minimum) {
         state_ = Fields(defaults(), places_);
         state_.merge(Fields(previousValues_, places_));
         if (state_.isTrue(Field::running)) {
@@ -119,7 +120,7 @@ private:
     void endSegment(const Value* timestamp) {
         const Seconds playingTime = start_.until(timestamp);
         derived_.logLength(start_, timestamp);
-        if (timestamp != nullptr && start_.isKnown() && playingTime > minimum_ && process_ != nullptr &&
+        if (timestamp != nullptr && start_.isKnown() && playingTime > minimum_ && process_.has_value() &&
             state_.holds(Field::volume)) {
             derived_.add(summary(playingTime), AudioEventKindVolume);
         } else {
@@ -145,9 +146,9 @@ private:
                 {kMessageIndexKey, derived_.nextIndex()}};
     }
 
-    const Dictionary previousValues_;
-    const Value* const process_;
-    const Seconds minimum_;
+    Dictionary previousValues_;
+    std::optional<Value> process_;
+    Seconds minimum_;
     KeyPlaces places_{kKeys};
     /// The latest value of each key, up to the message before the one at hand.
     Fields state_;
@@ -158,17 +159,24 @@ private:
 
 } // namespace
 
-void ZRReportingSessionVolumeMessagesWorker::stop() {
-    deriveAtStop(session(), "volume event", [this](const ZRReportingSession& owner, Seconds minimum) {
-        const Value process = ZRReportingUtilityRetrieveAppName(owner.configuration());
-        return createVolumeMessages(owner.messages(), &process, minimum);
+bool ZRReportingSessionVolumeMessagesWorker::stopSome() {
+    return stopPart(stopLeft_, [this] {
+        const std::shared_ptr<ZRReportingSession> owner = session();
+        return derivingStop(owner, "volume event",
+                            VolumeWalk(previousValuesOf(owner),
+                                       owner != nullptr ? std::optional(ZRReportingUtilityRetrieveAppName(
+                                                              owner->configuration()))
+                                                        : std::nullopt,
+                                       leastLengthOf(owner)),
+                            rapidSpatialAudioSettings(kLongestPauseInBurst));
     });
 }
 
 std::vector<MessageRef> ZRReportingSessionVolumeMessagesWorker::createVolumeMessages(
     const std::vector<MessageRef>& messages, const Value* process, Seconds minimumPlaytime) const {
-    return derivedBy(VolumeWalk(previousValuesOf(session()), process, minimumPlaytime),
-                     combineSpatialAudioSettings(messages, kLongestPauseInBurst));
+    return derivedBy(VolumeWalk(previousValuesOf(session()),
+                                process != nullptr ? std::optional(*process) : std::nullopt, minimumPlaytime),
+                     messages, rapidSpatialAudioSettings(kLongestPauseInBurst));
 }
 
 } // namespace tamblo

@@ -14,11 +14,20 @@ namespace tamblo {
 namespace {
 
 constexpr std::chrono::seconds kBackendPatience{9};
-/// A summary of more messages than this is no quick work.
-constexpr std::size_t kQuickSummary = 100;
+/// A summary of more than this is no quick work.
+constexpr std::size_t kMostQuickPayloads = 100;
+constexpr std::size_t kMostQuickBytes = 64U << 10U;
 
 constexpr AudioEventCategory kSummaryCategory = 0xFFFFFFFF;
 constexpr AudioEventType kSummaryType = 0xFFFF;
+
+bool isQuick(const std::vector<Dictionary>& payloads) noexcept {
+    std::size_t bytes = 0;
+    for (std::size_t i = 0; i < payloads.size() && i < kMostQuickPayloads; ++i) {
+        bytes += payloads[i].bytesOfValues(Dictionary::Shared::inFull);
+    }
+    return payloads.size() <= kMostQuickPayloads && bytes <= kMostQuickBytes;
+}
 
 } // namespace
 
@@ -59,16 +68,16 @@ void LinkmeterAgent::send(Message message) {
     }
 }
 
-void LinkmeterAgent::stop(std::vector<MessageRef> messages, AudioServiceType serviceType,
+void LinkmeterAgent::stop(std::optional<std::vector<Dictionary>> payloads, AudioServiceType serviceType,
                           ReporterID reporterID) {
     {
         const MutexLock held(mutex_);
         toSend_.reset();
         ++stopsToCome_;
     }
-    const Pace pace = messages.size() > kQuickSummary ? Pace::mayBlock : Pace::quick;
-    post([messages = std::move(messages), serviceType,
-          reporterID](LinkmeterAgent& agent) { agent.finish(messages, serviceType, reporterID); },
+    const Pace pace = !payloads || isQuick(*payloads) ? Pace::quick : Pace::mayBlock;
+    post([payloads = std::move(payloads), serviceType, reporterID](
+             LinkmeterAgent& agent) mutable { agent.finish(std::move(payloads), serviceType, reporterID); },
          pace);
 }
 
@@ -197,7 +206,7 @@ void LinkmeterAgent::sendMessage(Message message) {
     }
 }
 
-void LinkmeterAgent::finish(const std::vector<MessageRef>& messages, AudioServiceType serviceType,
+void LinkmeterAgent::finish(std::optional<std::vector<Dictionary>> payloads, AudioServiceType serviceType,
                             ReporterID reporterID) {
     const LogCategory& category = ZRReportingSessionLinkmeterCategory();
     {
@@ -208,8 +217,8 @@ void LinkmeterAgent::finish(const std::vector<MessageRef>& messages, AudioServic
         log::standard(category, "Session never started. {}", "stop");
         return;
     }
-    if (!messages.empty()) {
-        sendSummary(messages, serviceType, reporterID);
+    if (payloads) {
+        sendSummary(*std::move(payloads), serviceType, reporterID);
     }
     log::debug(category, "entering linkmeter {}", "stop");
     if (linkmeterSession_ != nullptr) {
@@ -220,10 +229,14 @@ void LinkmeterAgent::finish(const std::vector<MessageRef>& messages, AudioServic
     log::debug(category, "stopping and setting session to nil");
 }
 
-void LinkmeterAgent::sendSummary(const std::vector<MessageRef>& messages, AudioServiceType serviceType,
+void LinkmeterAgent::sendSummary(std::vector<Dictionary> payloads, AudioServiceType serviceType,
                                  ReporterID reporterID) {
     const LogCategory& category = ZRReportingSessionLinkmeterCategory();
-    Dictionary summary = linkmeterSummary(messages, serviceType);
+    auto [summary, leftOut] = LinkmeterSummary::of(std::move(payloads), serviceType);
+    if (leftOut != 0) {
+        log::error(category, "{} values are left out of a summary that is full. reporterID={}", leftOut,
+                   reporterID);
+    }
     log::standard(category, "sending rtc summary event. reporterID={}", reporterID);
     for (std::size_t i = 0; i < summary.size() && category.isOn(LogLevel::debug); ++i) {
         log::debug(category, "sending rtc summary event. reporterID={} {}=\"{}\"", reporterID,

@@ -39,8 +39,9 @@ public:
     /// With what the service is told of the session.
     void start(Dictionary sessionInfo, Dictionary userInfo);
     void send(Message message);
-    /// The messages are nobody else's.
-    void stop(std::vector<MessageRef> messages, AudioServiceType serviceType, ReporterID reporterID);
+    /// With the payloads that are summed up; nothing for a session without messages.
+    void stop(std::optional<std::vector<Dictionary>> payloads, AudioServiceType serviceType,
+              ReporterID reporterID);
     /// The worker goes.
     void abandon();
 
@@ -59,9 +60,9 @@ private:
     void waitForBackends();
     void sendAll(const std::shared_ptr<Messages>& messages);
     void sendMessage(Message message);
-    void finish(const std::vector<MessageRef>& messages, AudioServiceType serviceType, ReporterID reporterID);
-    void sendSummary(const std::vector<MessageRef>& messages, AudioServiceType serviceType,
-                     ReporterID reporterID);
+    void finish(std::optional<std::vector<Dictionary>> payloads, AudioServiceType serviceType,
+                ReporterID reporterID);
+    void sendSummary(std::vector<Dictionary> payloads, AudioServiceType serviceType, ReporterID reporterID);
 
     const Context& context_;
     std::unique_ptr<SerialQueue> linkmeterQueue_; ///< made by the first post

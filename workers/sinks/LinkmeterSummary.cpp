@@ -1,5 +1,6 @@
 #include "workers/sinks/LinkmeterSummary.h"
 
+#include "base/BoundedCache.h"
 #include "base/Json.h"
 #include "base/KeySet.h"
 #include "base/TextBuffer.h"
@@ -9,7 +10,6 @@
 #include <map>
 #include <string>
 #include <string_view>
-#include <unordered_map>
 #include <utility>
 #include <vector>
 
@@ -17,6 +17,7 @@ namespace tamblo {
 
 namespace {
 
+constexpr std::size_t kMostTextBytes = 16U << 20U;
 constexpr std::string_view kServiceTypeKey = "ZR_Session_Summary_Event";
 
 struct Joined {
@@ -26,7 +27,6 @@ struct Joined {
 
 class Joiner {
 public:
-    /// The payload must outlive the joiner.
     void add(const Dictionary& payload) {
         const std::vector<Joined*>& joined = joinedOf(payload.keys());
         for (std::size_t i = 0; i < joined.size(); ++i) {
@@ -35,29 +35,41 @@ public:
     }
     void add(std::string_view key, const Value& value) { append(joined_[std::string(key)], value); }
 
-    [[nodiscard]] Dictionary result() const {
+    [[nodiscard]] LinkmeterSummary result() {
         std::vector<std::string_view> keys;
         std::vector<Value> values;
-        for (const auto& [key, joined] : joined_) {
+        for (auto& [key, joined] : joined_) {
             keys.push_back(key);
             values.emplace_back(joined.text.view());
+            joined.text.reset();
         }
-        return Dictionary::fromSorted(keys, values);
+        return {Dictionary::fromSorted(keys, values), leftOut_};
     }
 
 private:
-    /// Most payloads share one of a few key sets: where their values go is found once for each.
+    struct Known {
+        KeySetRef keys; ///< held, so that no other can come to stand at its address
+        std::vector<Joined*> joined;
+    };
+
+    /// Most payloads share one of a few key sets: where their values go is found once for those of late.
     const std::vector<Joined*>& joinedOf(const KeySet& keys) {
-        const auto [found, isNew] = byKeys_.try_emplace(&keys);
-        if (isNew) {
+        const auto build = [&] {
+            Known known{KeySetRef(&keys), {}};
             for (std::size_t i = 0; i < keys.size(); ++i) {
-                found->second.push_back(&joined_[std::string(keys.key(i))]);
+                known.joined.push_back(&joined_[std::string(keys.key(i))]);
             }
-        }
-        return found->second;
+            return known;
+        };
+        return byKeys_.get(reinterpret_cast<std::uintptr_t>(&keys), build).joined;
     }
 
-    static void append(Joined& joined, const Value& value) {
+    void append(Joined& joined, const Value& value) {
+        if (bytes_ > kMostTextBytes) {
+            ++leftOut_;
+            return;
+        }
+        const std::size_t before = joined.text.size();
         if (std::exchange(joined.hasValues, true)) {
             joined.text.append(',');
         }
@@ -66,21 +78,23 @@ private:
         } else {
             appendJson(joined.text, value);
         }
+        bytes_ += joined.text.size() - before;
     }
 
     std::map<std::string, Joined> joined_;
-    std::unordered_map<const KeySet*, std::vector<Joined*>> byKeys_;
+    BoundedCache<Known, 16> byKeys_;
+    std::size_t bytes_ = 0;
+    std::uint64_t leftOut_ = 0;
 };
 
 } // namespace
 
-Dictionary linkmeterSummary(std::span<const MessageRef> messages, AudioServiceType serviceType) {
+LinkmeterSummary LinkmeterSummary::of(std::vector<Dictionary> payloads, AudioServiceType serviceType) {
     Joiner joiner;
     joiner.add(kServiceTypeKey, Value(std::uint64_t{serviceType}));
-    for (const MessageRef& message : messages) {
-        if (message->isSessionStarted && !message->isRedundant) {
-            joiner.add(message->payload());
-        }
+    for (Dictionary& payload : payloads) {
+        joiner.add(payload);
+        payload = Dictionary();
     }
     return joiner.result();
 }

@@ -1,17 +1,24 @@
 #pragma once
 
-#include "session/ZRReportingSessionMessage.h"
+#include "base/Dictionary.h"
 #include "util/AudioEvents.h"
 
-#include <span>
+#include <cstddef>
+#include <cstdint>
+#include <vector>
 
 namespace tamblo {
 
 /// The summary event of a session for the call-quality service: under every key that its messages held, all
 /// of the key's values, joined by commas in the messages' order, and the service type under a key of its own.
-/// Counted are the messages that were sent while the session was started and are no repeats. Where they were
-/// destined does not matter. Its time grows with the values, not with their square: a session may have held
-/// millions of them. On any thread, given copies of the session's messages.
-[[nodiscard]] Dictionary linkmeterSummary(std::span<const MessageRef> messages, AudioServiceType serviceType);
+/// Its time grows with the values, not with their square: a session may have held millions of them. Its
+/// texts have 16 MiB together at most; values that would be beyond are left out. On any thread.
+struct LinkmeterSummary {
+    Dictionary values;
+    std::uint64_t leftOut = 0; ///< values
+
+    /// Of these payloads, which are let go one by one, so that the texts take the memory that they had.
+    [[nodiscard]] static LinkmeterSummary of(std::vector<Dictionary> payloads, AudioServiceType serviceType);
+};
 
 } // namespace tamblo

@@ -4,7 +4,7 @@
 #include "util/MessageKeys.h"
 
 #include <algorithm>
-#include <iterator>
+#include <cstddef>
 #include <string>
 #include <utility>
 #include <vector>
@@ -67,16 +67,28 @@ void ZRReportingSessionRtcWorker::handleMessage(const MessageRef& message) {
     agent_->send({message->payload(), message->category(), message->type()});
 }
 
-void ZRReportingSessionRtcWorker::stop() {
+bool ZRReportingSessionRtcWorker::stopSome() {
+    constexpr std::size_t kMessagesOfPart = 20'000;
     const std::shared_ptr<ZRReportingSession> owner = session();
     if (owner == nullptr) {
-        return;
+        return true;
     }
-    std::vector<MessageRef> messages;
-    messages.reserve(owner->messages().size());
-    std::transform(owner->messages().begin(), owner->messages().end(), std::back_inserter(messages),
-                   [](const MessageRef& message) { return message->copyWithZone(); });
-    agent_->stop(std::move(messages), owner->serviceType(), owner->reporterID());
+    const std::vector<MessageRef>& messages = owner->messages();
+    payloads_.reserve(messages.size());
+    for (const std::size_t end = std::min(messages.size(), looked_ + kMessagesOfPart); looked_ < end;
+         ++looked_) {
+        const ZRReportingSessionMessage& message = *messages[looked_];
+        if (message.isSessionStarted && !message.isRedundant) {
+            payloads_.push_back(message.payload());
+        }
+    }
+    if (looked_ < messages.size()) {
+        return false;
+    }
+    looked_ = 0;
+    agent_->stop(messages.empty() ? std::nullopt : std::optional(std::exchange(payloads_, {})),
+                 owner->serviceType(), owner->reporterID());
+    return true;
 }
 
 } // namespace tamblo

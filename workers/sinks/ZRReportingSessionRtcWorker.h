@@ -4,14 +4,17 @@
 #include "util/AudioEvents.h"
 #include "workers/sinks/LinkmeterAgent.h"
 
+#include <cstddef>
 #include <cstdint>
 #include <memory>
 #include <optional>
+#include <vector>
 
 namespace tamblo {
 
 /// Hands the messages of a started session to the call-quality service, in a session of that service's own,
-/// and at the stop one summary of every key that they held.
+/// and at the stop one summary of every key that those held that were sent while the session was started and
+/// are no repeats, wherever they were destined.
 ///
 /// Here is only taken what the work needs; it is done on a queue of the worker's own, which its agent keeps
 /// and on which setting up may take seconds. A session started again sets up anew.
@@ -34,9 +37,17 @@ public:
     }
     std::optional<bool> start() override;
     void handleMessage(const MessageRef& message) override;
-    void stop() override;
+    void stop() override {
+        while (!stopSome()) {
+        }
+    }
+    [[nodiscard]] bool stopSome() override;
 
 private:
+    /// Of a stop that is under way: what the summary is of, and how many of the messages were looked at.
+    std::vector<Dictionary> payloads_;
+    std::size_t looked_ = 0;
+
     const std::shared_ptr<LinkmeterAgent> agent_ = std::make_shared<LinkmeterAgent>(context());
 };
 

@@ -8,9 +8,13 @@
 #include "util/Log.h"
 #include "workers/ReportFileName.h"
 
+#include <algorithm>
+#include <cstddef>
+#include <cstdint>
 #include <map>
 #include <utility>
 #include <variant>
+#include <vector>
 
 namespace tamblo {
 
@@ -19,6 +23,10 @@ namespace {
 constexpr std::string_view kIsSessionStarted = "isSessionStarted";
 /// Lines are written once this many bytes of them wait.
 constexpr std::size_t kBytesPerWrite = 256U << 10U;
+constexpr std::size_t kMostBytes = 64U << 20U;
+/// One part of a stop ends with these.
+constexpr std::size_t kMessagesOfPart = 5'000;
+constexpr std::size_t kBytesOfPart = 2U << 20U;
 
 } // namespace
 
@@ -60,26 +68,53 @@ ZRReportingSessionSummaryJsonFileWorker::initWithSession(Context& context,
     return std::make_shared<ZRReportingSessionSummaryJsonFileWorker>(context, session);
 }
 
-void ZRReportingSessionSummaryJsonFileWorker::stop() {
+bool ZRReportingSessionSummaryJsonFileWorker::stopSome() {
     const std::shared_ptr<ZRReportingSession> owner = session();
     if (owner == nullptr || owner->messages().empty()) {
-        return;
+        return true;
     }
-    MessageNames names;
-    for (const MessageRef& message : owner->messages()) {
-        if (message->isRedundant) {
-            continue;
-        }
-        if (reportPath_) {
-            writeLine(",");
-        } else {
-            openFile(*owner);
-        }
-        writeMessage(*message, names.next(*message));
+    if (names_ == nullptr) {
+        names_ = std::make_shared<MessageNames>();
+    }
+    const std::vector<MessageRef>& messages = owner->messages();
+    const std::size_t end = std::min(messages.size(), looked_ + kMessagesOfPart);
+    const std::size_t endOfBytes = bytes_ + lines_.size() + kBytesOfPart;
+    for (; looked_ < end && bytes_ + lines_.size() < endOfBytes; ++looked_) {
+        add(*owner, *messages[looked_]);
+    }
+    if (looked_ < messages.size()) {
+        return false;
     }
     closeFile();
     lines_.reset();
     reportPath_.reset();
+    names_.reset();
+    looked_ = 0;
+    return true;
+}
+
+void ZRReportingSessionSummaryJsonFileWorker::add(const ZRReportingSession& session,
+                                                  ZRReportingSessionMessage& message) {
+    if (message.isRedundant) {
+        return;
+    }
+    if (leftOut_ != 0) {
+        ++leftOut_;
+        return;
+    }
+    const bool isFirst = !reportPath_;
+    if (isFirst) {
+        openFile(session);
+    }
+    const std::size_t before = lines_.size();
+    lines_.append(isFirst ? "" : ",\n");
+    writeMessage(message, names_->next(message));
+    if (bytes_ + lines_.size() > kMostBytes) {
+        lines_.truncate(before);
+        leftOut_ = 1;
+    } else if (lines_.size() >= kBytesPerWrite) {
+        writeOut();
+    }
 }
 
 void ZRReportingSessionSummaryJsonFileWorker::writeMessage(ZRReportingSessionMessage& message,
@@ -93,7 +128,7 @@ void ZRReportingSessionSummaryJsonFileWorker::writeMessage(ZRReportingSessionMes
         log::error(ZRReportingSessionCategory(), "dataWithJSONObject: {}", *failure);
         return;
     }
-    writeLine("");
+    lines_.append('\n');
 }
 
 void ZRReportingSessionSummaryJsonFileWorker::openFile(const ZRReportingSession& session) {
@@ -119,20 +154,15 @@ void ZRReportingSessionSummaryJsonFileWorker::openFile(const ZRReportingSession&
     log::info(ZRReportingSessionCategory(), "SummaryJsonFileWorker opened file. action=open file={}",
               *reportPath_);
     isOut_ = false;
-    writeLine("[");
-}
-
-void ZRReportingSessionSummaryJsonFileWorker::writeLine(std::string_view line) {
-    lines_.append(line);
-    lines_.append('\n');
-    if (reportFileHandle_ == nullptr) {
-        lines_.clear();
-    } else if (lines_.size() >= kBytesPerWrite) {
-        writeOut();
-    }
+    lines_.append("[\n");
 }
 
 void ZRReportingSessionSummaryJsonFileWorker::writeOut() {
+    bytes_ += lines_.size();
+    if (reportFileHandle_ == nullptr) {
+        lines_.clear();
+        return;
+    }
     const std::optional<std::string> failure = reportFileHandle_->write(lines_.view());
     lines_.clear();
     if (failure && !isOut_) {
@@ -144,11 +174,19 @@ void ZRReportingSessionSummaryJsonFileWorker::writeOut() {
 }
 
 void ZRReportingSessionSummaryJsonFileWorker::closeFile() {
-    writeLine("]");
+    if (reportPath_) {
+        lines_.append("]\n");
+    }
+    writeOut();
+    bytes_ = 0;
+    if (const std::uint64_t leftOut = std::exchange(leftOut_, 0)) {
+        log::error(ZRReportingSessionCategory(),
+                   "SummaryJsonFileWorker left out messages, as the file is full. file={} messages={}",
+                   *reportPath_, leftOut);
+    }
     if (reportFileHandle_ == nullptr) {
         return;
     }
-    writeOut();
     if (const auto failure = reportFileHandle_->close()) {
         log::error(ZRReportingSessionCategory(),
                    "SummaryJsonFileWorker failed to closed file. action=close file={} error=\"{}\"",

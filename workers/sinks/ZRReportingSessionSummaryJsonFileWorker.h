@@ -4,6 +4,8 @@
 #include "platform/ReportFiles.h"
 #include "session/ZRReportingSessionWorkerProtocol.h"
 
+#include <cstddef>
+#include <cstdint>
 #include <memory>
 #include <optional>
 #include <string>
@@ -15,8 +17,9 @@ namespace tamblo {
 /// stops: for sessions of the service type "test", and on internal builds for all.
 ///
 /// Neither consumer nor producer, it stops behind all workers that are, so that the file holds what they have
-/// derived. The lines are gathered and written some hundred kibibytes at a time. What cannot be written is
-/// lost: one error line tells of it until something can be written again, and the session goes on.
+/// derived. The lines are gathered and written some hundred kibibytes at a time. A file has 64 MiB at most;
+/// one error line tells of the messages that are not in it for that. What cannot be written is lost: one
+/// error line tells of it until something can be written again, and the session goes on.
 class ZRReportingSessionSummaryJsonFileWorker final : public ZRReportingSessionWorkerProtocol {
 public:
     using ZRReportingSessionWorkerProtocol::ZRReportingSessionWorkerProtocol;
@@ -27,15 +30,19 @@ public:
 
     /// Leaves its mark in the session's records: each payload gets the key that says whether the message was
     /// sent while the session was started.
-    void stop() override;
+    void stop() override {
+        while (!stopSome()) {
+        }
+    }
+    [[nodiscard]] bool stopSome() override;
 
 private:
     class MessageNames;
 
+    void add(const ZRReportingSession& session, ZRReportingSessionMessage& message);
     void writeMessage(ZRReportingSessionMessage& message, std::string_view name);
     void openFile(const ZRReportingSession& session);
-    /// Without an open file, nothing.
-    void writeLine(std::string_view line);
+    /// Without an open file, what waits is dropped.
     void writeOut();
     void closeFile();
 
@@ -43,6 +50,10 @@ private:
     std::unique_ptr<ReportFile> reportFileHandle_;
     TextBuffer lines_; ///< not written yet
     bool isOut_ = false;
+    std::shared_ptr<MessageNames> names_; ///< while the file is made
+    std::size_t looked_ = 0;              ///< messages of the session
+    std::size_t bytes_ = 0;               ///< of the file, without the lines that wait
+    std::uint64_t leftOut_ = 0;
 };
 
 } // namespace tamblo
