@@ -13,6 +13,9 @@ namespace tamblo {
 namespace {
 
 constexpr std::chrono::milliseconds kLockRetry{5};
+constexpr int kReadDirectory = O_RDONLY | O_DIRECTORY | O_CLOEXEC;
+/// Of a directory that is removed, at a time.
+constexpr std::size_t kEntriesAtATime = 1024;
 
 } // namespace
 
@@ -61,7 +64,14 @@ FileDescriptor lockDirectory(const std::string& path, std::optional<std::chrono:
 }
 
 DirectoryEntries DirectoryEntries::read(const std::string& path, std::size_t most) {
-    const std::unique_ptr<DIR, int (*)(DIR*)> directory(::opendir(path.c_str()), ::closedir);
+    const FileDescriptor directory(::open(path.c_str(), kReadDirectory));
+    return directory.isOpen() ? read(directory.get(), most) : DirectoryEntries{errno};
+}
+
+DirectoryEntries DirectoryEntries::read(int descriptor, std::size_t most) {
+    // Another place to read from than the descriptor's, which its owner may read from, too.
+    const int own = ::openat(descriptor, ".", kReadDirectory);
+    const std::unique_ptr<DIR, int (*)(DIR*)> directory(own < 0 ? nullptr : ::fdopendir(own), ::closedir);
     if (directory == nullptr) {
         return {errno};
     }
@@ -78,6 +88,50 @@ DirectoryEntries DirectoryEntries::read(const std::string& path, std::size_t mos
         entries.names.emplace_back(name);
     }
     return entries;
+}
+
+int removeTree(int directory, const std::string& name) {
+    if (::unlinkat(directory, name.c_str(), 0) == 0 || errno == ENOENT) {
+        return 0;
+    }
+    if (errno != EISDIR) {
+        return errno;
+    }
+    const FileDescriptor tree(::openat(directory, name.c_str(), kReadDirectory | O_NOFOLLOW));
+    if (!tree.isOpen()) {
+        return errno;
+    }
+    for (bool isMore = true; isMore;) {
+        const DirectoryEntries entries = DirectoryEntries::read(tree.get(), kEntriesAtATime);
+        for (const std::string& entry : entries.names) {
+            if (const int failure = removeTree(tree.get(), entry)) {
+                return failure;
+            }
+        }
+        isMore = entries.isCut;
+    }
+    return ::unlinkat(directory, name.c_str(), AT_REMOVEDIR) == 0 ? 0 : errno;
+}
+
+std::uint64_t sizeOfTree(int directory, const std::string& name, std::size_t& entries) {
+    struct stat status {};
+    if (::fstatat(directory, name.c_str(), &status, AT_SYMLINK_NOFOLLOW) != 0) {
+        return 0;
+    }
+    if (!S_ISDIR(status.st_mode)) {
+        return S_ISREG(status.st_mode) ? static_cast<std::uint64_t>(status.st_size) : 0;
+    }
+    std::uint64_t size = 0;
+    const FileDescriptor tree(::openat(directory, name.c_str(), kReadDirectory | O_NOFOLLOW));
+    if (tree.isOpen()) {
+        for (const std::string& entry : DirectoryEntries::read(tree.get(), entries).names) {
+            if (entries != 0) {
+                --entries;
+                size += sizeOfTree(tree.get(), entry, entries);
+            }
+        }
+    }
+    return size;
 }
 
 } // namespace tamblo

@@ -4,6 +4,7 @@
 
 #include <chrono>
 #include <cstddef>
+#include <cstdint>
 #include <optional>
 #include <string>
 #include <string_view>
@@ -31,10 +32,18 @@ namespace tamblo {
 struct DirectoryEntries {
     /// Of more than `most` entries, any so many.
     [[nodiscard]] static DirectoryEntries read(const std::string& path, std::size_t most);
+    [[nodiscard]] static DirectoryEntries read(int directory, std::size_t most);
 
     int error = 0; ///< 0 or an `errno`
     bool isCut = false;
     std::vector<std::string> names = {};
 };
+
+/// Removes an entry of a directory and, where that is a directory, all that is in it; no symbolic link is
+/// followed. Returns 0 or an `errno`, after which some of it may be gone. No entry is no error.
+[[nodiscard]] int removeTree(int directory, const std::string& name);
+/// The bytes of all regular files in a directory's entry, at whatever depth. `entries` is how many of them
+/// are looked at, and what is left of that.
+[[nodiscard]] std::uint64_t sizeOfTree(int directory, const std::string& name, std::size_t& entries);
 
 } // namespace tamblo

@@ -14,8 +14,9 @@ namespace tamblo {
 
 namespace {
 
-constexpr std::uint32_t kFilesMask = IN_CLOSE_WRITE | IN_MOVED_TO | IN_MOVED_FROM | IN_DELETE |
-                                     IN_DELETE_SELF | IN_MOVE_SELF | IN_ONLYDIR | IN_EXCL_UNLINK;
+constexpr std::uint32_t kWritesMask =
+    IN_CLOSE_WRITE | IN_MOVED_TO | IN_DELETE_SELF | IN_MOVE_SELF | IN_ONLYDIR | IN_EXCL_UNLINK;
+constexpr std::uint32_t kRemovalsMask = IN_MOVED_FROM | IN_DELETE;
 constexpr std::uint32_t kParentMask =
     IN_CREATE | IN_MOVED_TO | IN_MOVED_FROM | IN_DELETE | IN_DELETE_SELF | IN_MOVE_SELF | IN_ONLYDIR;
 /// Bounds one call in case files are written faster than they are told of; what is left keeps the descriptor
@@ -36,8 +37,10 @@ std::string lastNameOf(const std::string& path) {
 
 } // namespace
 
-DirectoryWatcher::DirectoryWatcher(std::string directory)
-    : directory_(std::move(directory)), inotify_(::inotify_init1(IN_NONBLOCK | IN_CLOEXEC)) {
+DirectoryWatcher::DirectoryWatcher(std::string directory, Watched watched)
+    : directory_(std::move(directory)),
+      watched_(watched),
+      inotify_(::inotify_init1(IN_NONBLOCK | IN_CLOEXEC)) {
     if (inotify_.isOpen()) {
         watch();
     } else {
@@ -51,7 +54,8 @@ DirectoryWatcher::DirectoryWatcher(std::string directory)
 void DirectoryWatcher::watch() {
     replaceWatch(parentWatch_, watchNearestParent());
     const int parentError = errno;
-    const int watch = ::inotify_add_watch(inotify_.get(), directory_.c_str(), kFilesMask);
+    const std::uint32_t mask = kWritesMask | (watched_ == Watched::writes ? 0 : kRemovalsMask);
+    const int watch = ::inotify_add_watch(inotify_.get(), directory_.c_str(), mask);
     const bool isMissing = watch < 0 && (errno == ENOENT || errno == ENOTDIR);
     if (isMissing) {
         error_ = parentWatch_ < 0 ? parentError : 0;

@@ -11,7 +11,7 @@ struct inotify_event;
 
 namespace tamblo {
 
-/// Notices files of one directory whose writing has finished, and files that went away.
+/// Notices files of one directory whose writing has finished and, for who wants that, files that went away.
 ///
 /// One descriptor for an event loop: when it is readable, `read` takes in what happened. The directory may be
 /// missing at first, vanish, or be replaced: then its nearest existing parent is watched until it is there
@@ -19,11 +19,14 @@ namespace tamblo {
 /// nothing.
 class DirectoryWatcher {
 public:
-    /// Called with the name of a file that was written, replaced or removed, or with nothing when any file
-    /// may have been: the directory has come or gone, or more happened than the kernel could remember.
+    /// Called with the name of a file that was written or replaced (or removed, where that is watched), or
+    /// with nothing when any file may have been: the directory has come or gone, or more happened than the
+    /// kernel could remember.
     using Handler = std::function<void(std::optional<std::string_view> fileName)>;
 
-    explicit DirectoryWatcher(std::string directory);
+    enum class Watched { writes, writesAndRemovals };
+
+    explicit DirectoryWatcher(std::string directory, Watched watched = Watched::writesAndRemovals);
     DirectoryWatcher(const DirectoryWatcher&) = delete;
     DirectoryWatcher& operator=(const DirectoryWatcher&) = delete;
 
@@ -43,6 +46,7 @@ private:
     [[nodiscard]] bool take(const inotify_event& event, const Handler& handler);
 
     const std::string directory_;
+    const Watched watched_;
     FileDescriptor inotify_;
     int directoryWatch_ = -1;
     int parentWatch_ = -1;

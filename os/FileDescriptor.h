@@ -23,6 +23,8 @@ public:
 
     [[nodiscard]] int get() const noexcept { return descriptor_; }
     [[nodiscard]] bool isOpen() const noexcept { return descriptor_ >= 0; }
+    /// Whoever calls closes it.
+    [[nodiscard]] int release() noexcept { return std::exchange(descriptor_, -1); }
     void reset() noexcept {
         if (descriptor_ >= 0) {
             ::close(std::exchange(descriptor_, -1));

@@ -11,12 +11,15 @@
 
 namespace tamblo {
 
-/// The system calls behind files that are written, as they are: -1 and `errno` on failure. A test derives
-/// from this class and makes single ones fail.
+/// The system calls behind files that are written, as they are: -1 and `errno` on failure. Names are those of
+/// entries of an open directory; a link is looked at, renamed or removed itself. A test derives from this
+/// class and makes single ones fail.
 class FileOperations {
 public:
     virtual ~FileOperations() = default;
-    virtual int open(const char* path, int flags, mode_t mode) noexcept { return ::open(path, flags, mode); }
+    virtual int open(int directory, const char* name, int flags, mode_t mode) noexcept {
+        return ::openat(directory, name, flags, mode);
+    }
     virtual int close(int descriptor) noexcept { return ::close(descriptor); }
     virtual ssize_t write(int descriptor, const void* bytes, std::size_t count) noexcept {
         return ::write(descriptor, bytes, count);
@@ -26,8 +29,13 @@ public:
     }
     virtual int truncate(int descriptor, off_t size) noexcept { return ::ftruncate(descriptor, size); }
     virtual int status(int descriptor, struct stat& status) noexcept { return ::fstat(descriptor, &status); }
-    virtual int status(const char* path, struct stat& status) noexcept { return ::stat(path, &status); }
-    virtual int rename(const char* from, const char* to) noexcept { return ::rename(from, to); }
+    virtual int status(int directory, const char* name, struct stat& status) noexcept {
+        return ::fstatat(directory, name, &status, AT_SYMLINK_NOFOLLOW);
+    }
+    virtual int rename(int directory, const char* from, const char* to) noexcept {
+        return ::renameat(directory, from, directory, to);
+    }
+    virtual int remove(int directory, const char* name) noexcept { return ::unlinkat(directory, name, 0); }
     /// A clock that is cheap to read and advances every few milliseconds.
     virtual std::chrono::nanoseconds coarseTime() noexcept;
 

@@ -3,6 +3,8 @@
 #include <string>
 #include <string_view>
 
+#include <sys/stat.h>
+
 namespace tamblo {
 
 /// What a replaced file outlives: the end of the process, or, after waiting for the disk, a loss of power.
@@ -17,5 +19,9 @@ enum class Durability { process, power };
 /// file is its owner's alone (0600). The directory has to be there. Any thread.
 [[nodiscard]] int replaceFileAtomically(const std::string& path, std::string_view content,
                                         Durability durability = Durability::process);
+/// The same of an entry of an open directory; a new file has this mode.
+[[nodiscard]] int replaceFileAtomically(int directory, const std::string& name, std::string_view content,
+                                        Durability durability = Durability::process,
+                                        mode_t mode = S_IRUSR | S_IWUSR);
 
 } // namespace tamblo

@@ -17,7 +17,7 @@ public:
     [[nodiscard]] virtual bool isEventInUse(std::string_view eventName) = 0;
     /// Another number once `isEventInUse` may answer otherwise: its answers hold for as long as this stays
     /// the same. Never 0. To be read before they are asked for.
-    [[nodiscard]] virtual std::uint64_t inUseGeneration() const noexcept = 0;
+    [[nodiscard]] virtual std::uint64_t inUseGeneration() const = 0;
     /// Records one event. The provider is called at most once, only if the event is recorded, and before this
     /// returns; what it returns is the event's payload as of then.
     virtual void sendEventLazy(std::string_view eventName, const std::function<Dictionary()>& payload) = 0;

@@ -18,7 +18,8 @@ public:
     [[nodiscard]] virtual std::optional<std::string> close() = 0;
 };
 
-/// Where reports are kept that are a file each. Any thread; may block on the disk.
+/// Where reports are kept that are a file each, the newest of each kind. A report's name begins as
+/// `reportFileName` makes it: by that the old ones are known. Any thread; may block on the disk.
 class ReportFiles {
 public:
     virtual ~ReportFiles() = default;
@@ -26,9 +27,9 @@ public:
     [[nodiscard]] virtual std::string reportingLogsDirectory() const = 0;
     /// The directory of performance data, an absolute path.
     [[nodiscard]] virtual std::string performanceLogsDirectory() const = 0;
-    /// Creates the directory with its parents, for everybody to use; answers what went wrong, or nothing.
+    /// Creates one of the two with its parents; answers what went wrong, or nothing.
     [[nodiscard]] virtual std::optional<std::string> createDirectory(const std::string& path) = 0;
-    /// A new empty file in place of any that has the name, or what went wrong.
+    /// A new empty file in one of the two, in place of any that has the name, or what went wrong.
     [[nodiscard]] virtual std::variant<std::unique_ptr<ReportFile>, std::string>
     createFile(const std::string& path) = 0;
 };

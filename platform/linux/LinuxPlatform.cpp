@@ -146,7 +146,8 @@ struct LinuxPlatform::Services {
     LinuxPreferences& preferences =
         provide<LinuxPreferences>(platform.preferences, directories.preferences(), log);
     const Limits& limits = platform.limits = Limits::read(preferences);
-    SinkFiles& sinks = sinkFiles.emplace(directories.logs, log);
+    const FileModes fileModes = FileModes::read(preferences, log);
+    SinkFiles& sinks = sinkFiles.emplace(directories.logs, log, FileOperations::system(), fileModes);
     LinuxAnalyticsEventService& analyticsEvents =
         provide<LinuxAnalyticsEventService>(platform.analyticsEvents, sinks, clock, preferences, log);
     LinuxPowerEventLog& powerEvents = provide<LinuxPowerEventLog>(platform.powerEvents, sinks, clock);
@@ -154,9 +155,10 @@ struct LinuxPlatform::Services {
         provide<LinuxDiagnosticsMetrics>(platform.diagnosticsMetrics, sinks, clock);
     LinuxCallQualityService& callQuality =
         provide<LinuxCallQualityService>(platform.callQuality, sinks, clock, preferences, workQueues, log);
-    LinuxReportFiles& reportFiles = provide<LinuxReportFiles>(platform.reportFiles, directories.logs);
+    LinuxReportFiles& reportFiles = provide<LinuxReportFiles>(
+        platform.reportFiles, directories.logs, clock, log, fileModes, ReportLimits::read(preferences));
     LinuxBugCaptureService& bugCapture = provide<LinuxBugCaptureService>(
-        platform.bugCapture, sinks, directories.logs + "/captures", clock, workQueues, log);
+        platform.bugCapture, sinks, directories.logs + "/captures", clock, workQueues, log, fileModes);
     LinuxBugReportDrafting& bugReportDrafting =
         provide<LinuxBugReportDrafting>(platform.bugReportDrafting, sinks, clock);
     LinuxMemoryLog& memoryLog = provide<LinuxMemoryLog>(platform.memoryLog, sinks, clock, workQueues, log);

@@ -63,7 +63,7 @@ protected:
     TemporaryDirectory directory;
     FakeLog log;
     FakeClock clock;
-    CaptureFolders folders{directory.path("captures"), log, CaptureFolders::Limits{1000}};
+    CaptureFolders folders{directory.path("captures"), log, {}, CaptureFolders::Limits{1000}};
 };
 
 TEST_F(CaptureFoldersTest, OldFoldersAndLeftoversGoWithTheNextCaptureAndNothingElse) {
@@ -139,7 +139,7 @@ class BugCaptureServiceTest : public CapturesTest {
 protected:
     /// For a process 12 that there is, and a process 13 that there is not.
     void makeService() {
-        service.emplace(sinks, root.path("captures"), clock, workQueues, stderrLog,
+        service.emplace(sinks, root.path("captures"), clock, workQueues, stderrLog, FileModes(),
                         CaptureContent(root.path("proc"), root.path("sys")));
         reporter = service->makeReporter(std::array<pid_t, 3>{12, 13, 12});
     }
@@ -306,15 +306,51 @@ TEST_F(StackCaptureTest, ALineHoldsTheSamplesThatEachThreadHad) {
     EXPECT_THAT(log.take(), IsEmpty());
 }
 
-TEST_F(StackCaptureTest, ThoseBeyondTheFourThatWaitAreDroppedAndCounted) {
-    for (int i = 0; i < 6; ++i) {
+TEST_F(StackCaptureTest, ThoseThatWaitShareASamplingAndEachHasItsLine) {
+    for (const char* process : {"6", "7", "8"}) {
+        writeThread(process, process, "S (sleeping)");
+    }
+    int sleeps = 0;
+    clock.whileAsleep = [&] {
+        if (++sleeps == 1) {
+            capture({{"processIDs", 8}}); // while another is made
+            capture();
+        }
+    };
+    clients = {7};
+    capture({{"processIDs", 6}});
+    clients = {8, 6};
+    capture({{"processIDs", 5}});
+    EXPECT_EQ(run(), 2U);
+    EXPECT_EQ(sleeps, 8);
+    std::vector<std::string> processes;
+    for (const std::string& line : test::linesOf(root.path("stack-captures.jsonl"))) {
+        std::string& found = processes.emplace_back();
+        const auto object = nlohmann::json::parse(line);
+        for (const auto& process : object["stacks"]) {
+            found += process["name"].get<std::string>() + process["threads"][0]["samples"].dump();
+        }
+    }
+    const std::string samples = R"-([{"count":5,"state":"S (sleeping)"}])-";
+    EXPECT_THAT(processes, ElementsAre("p6" + samples + "p7" + samples, "p8" + samples + "p6" + samples,
+                                       "p8" + samples + "p6" + samples, "p8" + samples + "p6" + samples));
+}
+
+TEST_F(StackCaptureTest, ThoseBeyondWhatMayWaitAreDroppedAndCounted) {
+    const Dictionary large{{"text", std::string(LinuxDiagnosticCapture::kMaximumWaitingBytes / 2, 'x')}};
+    capture(large);
+    capture(large); // with its key it is too much
+    for (std::size_t i = 0; i < LinuxDiagnosticCapture::kMaximumWaiting; ++i) {
         capture();
     }
-    EXPECT_THAT(log.take(), ElementsAre("3 zrrl 4 stack captures wait; further ones are dropped"));
-    EXPECT_EQ(run(), 4U);
+    EXPECT_THAT(log.take(),
+                ElementsAre(HasSubstr("3 zrrl 256 stack captures, or 8388608 bytes of them, wait;")));
+    EXPECT_EQ(run(), 1U);
     EXPECT_THAT(log.take(), ElementsAre("3 zrrl no stack captures wait any more; 2 were dropped"));
     capture();
     EXPECT_EQ(run(), 1U);
+    EXPECT_EQ(test::linesOf(root.path("stack-captures.jsonl")).size(),
+              LinuxDiagnosticCapture::kMaximumWaiting + 1);
 }
 
 TEST_F(CapturesTest, TheMemoryLogLeavesOutWhoIsGone) {

@@ -68,6 +68,11 @@ TEST_F(LinuxChanlogTest, ChannelsAreReadAndSelected) {
     publish(".hidden.json", simples({{"no", 1}}));
     publish("a.json.new", simples({{"no", 1}}));
     EXPECT_EQ(now(), "a1=1 array -=1 b1=-5 a2=1");
+    publish("c.json", R"([{"name":"c","format":"histogram","min":-3.0,"max":1e3,"buckets":[)"
+                      R"({"lower":0.0,"upper":5,"hits":2.0}]},{"name":"s","format":"state","states":[)"
+                      R"({"name":"on","transitions":4.0,"residency":18446744073709549568.0}]}])");
+    EXPECT_THAT(now(), HasSubstr(" c,0-5:2,-3..1000 s,on:4:18446744073709549568:0.00"));
+    publish("c.json", "[]");
     EXPECT_EQ(textOf(sample({"g", {}})), "b1=-5 a2=1");
     EXPECT_EQ(textOf(sample({{}, "s"})), "a1=1 a2=1");
     EXPECT_EQ(textOf(sample({"g", "s"})), "a2=1");
@@ -111,6 +116,8 @@ TEST_F(LinuxChanlogTest, RubbishCostsItsOwnFileOrChannelAloneAndIsToldOnce) {
         {"7", "it is no object"},
         {R"({"format":"other"})", "format \"other\" is not known"},
         {R"({"format":"simple","value":9223372036854775808})", "value is no signed 64-bit integer"},
+        {R"({"format":"simple","value":9223372036854775808.0})", "value is no signed 64-bit integer"},
+        {R"({"format":"simple","value":3.5})", "value is no signed 64-bit integer"},
         {R"({"format":"simple","value":1,"name":")" + std::string(257, 'n') + R"("})",
          "name is longer than 256 bytes"},
         {state + "5]}", "states 0: it is no object"},
@@ -195,12 +202,15 @@ TEST_F(LinuxChanlogTest, DifferencesAreGains) {
         {{channelOf("s", 0, {{"on", 0, 0}})},
          {channelOf("s", 0, {{"on", 0, UINT64_MAX}})},
          "s=0,on:0:18446744073709551615:1.00"},
-        {{on}, {channelOf("s", 0, {{"on", 0, 11}})}, "", "a counter has run backwards"},
-        {{on}, {channelOf("s", 0, {{"on", 1, 9}})}, "", "a counter has run backwards"},
+        {{on}, {channelOf("s", 0, {{"on", 0, 11}})}, "s=0", "a counter has run backwards"},
+        {{channelOf("s", 0, {{"on", 1, 10}, {"off", 1, 10}})},
+         {channelOf("s", 0, {{"on", 1, 9}, {"off", 2, 14}})},
+         "s=0,off:1:4:1.00",
+         "a counter has run backwards"},
         {{channelOf("h", 1, {}, {{0, 5, 0, 2}, {5, 9, 0, 7}})},
          {channelOf("h", 3, {}, {{5, 9, 0, 8}, {0, 9, 0, 9}})},
          "h,5-9:1,3..3"},
-        {{hit}, {channelOf("h", 1, {}, {{0, 5, 0, 1}})}, "", "run backwards"},
+        {{hit}, {channelOf("h", 1, {}, {{0, 5, 0, 1}})}, "h,1..1", "run backwards"},
     };
     for (const auto& [earlierList, laterList, gained, trouble] : cases) {
         const auto earlier = std::make_shared<const std::vector<ChanlogChannelRef>>(earlierList);

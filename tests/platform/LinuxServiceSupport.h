@@ -47,9 +47,9 @@ public:
     int truncate(int descriptor, off_t size) noexcept override {
         return truncateError != 0 ? fail(truncateError) : FileOperations::truncate(descriptor, size);
     }
-    int rename(const char* from, const char* to) noexcept override {
+    int rename(int directory, const char* from, const char* to) noexcept override {
         const bool fails = renameError != 0 && std::string_view(from).ends_with(".jsonl");
-        return fails ? fail(renameError) : FileOperations::rename(from, to);
+        return fails ? fail(renameError) : FileOperations::rename(directory, from, to);
     }
     std::chrono::nanoseconds coarseTime() noexcept override { return std::chrono::seconds(++time_); }
 

@@ -1,11 +1,13 @@
 #include "os/Directory.h"
 #include "platform/linux/settings/JsonFile.h"
+#include "platform/linux/settings/LinuxDeviceProperties.h"
 #include "platform/linux/settings/LinuxNamedNotifications.h"
 #include "platform/linux/settings/LinuxPreferences.h"
 #include "tests/fakes/FakeWorkQueues.h"
 #include "tests/platform/LinuxServiceSupport.h"
 
 #include <sys/file.h>
+#include <sys/resource.h>
 
 namespace tamblo {
 namespace {
@@ -67,8 +69,43 @@ protected:
     TemporaryDirectory directory_;
     const std::string path_ = directory_.path("preferences");
     FakeLog log_;
-    LinuxPreferences preferences_{path_, log_};
+    std::chrono::steady_clock::time_point now_;
+    LinuxPreferences preferences_{path_, log_, [this] { return now_; }};
 };
+
+TEST_F(LinuxPreferencesTest, WhatCannotBeReadStaysAsItWasAndIsTriedAgainWithoutAChange) {
+    write(R"({"k": 1})");
+    EXPECT_EQ(valueAfterChange(), 1);
+    directory_.write("properties", R"({"p": true})");
+    const LinuxDeviceProperties properties(directory_.path("properties"), log_);
+    EXPECT_EQ(properties.booleanProperty("p"), true);
+    write(R"({"k": 2})");
+    directory_.write("properties", R"({"p": false, "q": 1})");
+    rlimit limit{};
+    ::getrlimit(RLIMIT_NOFILE, &limit);
+    const rlimit standardOnes{3, limit.rlim_max};
+    ::setrlimit(RLIMIT_NOFILE, &standardOnes);
+    EXPECT_EQ(valueAfterChange(), 1);
+    EXPECT_EQ(value(), 1);
+    EXPECT_EQ(properties.booleanProperty("p"), true);
+    ::setrlimit(RLIMIT_NOFILE, &limit);
+    const std::uint64_t before = preferences_.generation();
+    EXPECT_EQ(value(), 1) << "left alone for a while";
+    now_ += std::chrono::seconds(1);
+    EXPECT_NE(preferences_.generation(), before) << "what was worked out is out of date";
+    EXPECT_EQ(value(), 2);
+    EXPECT_EQ(properties.booleanProperty("p"), false);
+    EXPECT_THAT(log_.take(), ElementsAre(HasSubstr("d.json: Too many open files; what was known of it stays"),
+                                         HasSubstr("properties: Too many open files; what was known")));
+
+    fs::remove(path_ + "/d.json");
+    fs::create_symlink("d.json", path_ + "/loop");
+    fs::rename(path_ + "/loop", path_ + "/d.json");
+    EXPECT_EQ(valueAfterChange(), 2);
+    directory_.write("new", R"({"k": 3})");
+    fs::rename(directory_.path("new"), path_ + "/d.json");
+    EXPECT_EQ(valueAfterChange(), 3) << "at once, where there is a change";
+}
 
 TEST_F(LinuxPreferencesTest, FollowTheFiles) {
     EXPECT_EQ(value(), -1);
@@ -192,9 +229,15 @@ TEST_F(NamedNotificationsTest, APostCallsEachRegistrationOfItsName) {
         post("n", word);
         EXPECT_THAT(callsAfterChange(), ElementsAre(first, second));
     }
-    fs::remove(path_ + "/n");
+    directory_.write("new", "2");
+    fs::rename(directory_.path("new"), path_ + "/n");
     EXPECT_THAT(callsAfterChange(), ElementsAre(first, second));
+    // Neither its end nor a name that it gets elsewhere is a post.
+    fs::rename(path_ + "/n", directory_.path("away"));
     EXPECT_EQ(state(second), State(ENOENT, 0));
+    post("other", "2");
+    fs::remove(path_ + "/other");
+    EXPECT_THAT(callsAfterChange(), ElementsAre(other));
     post("nobody", "1");
     post("other", "3");
     EXPECT_THAT(callsAfterChange(), ElementsAre(other));
@@ -278,11 +321,17 @@ TEST_F(NamedNotificationsTest, NoCallFollowsACancellationOrTheirEnd) {
     EXPECT_THAT(callsAfterChange(), ElementsAre(remaining));
 }
 
-TEST_F(NamedNotificationsTest, AnythingMayHaveChangedWhenTheDirectoryComesOrGoes) {
-    const int first = add("a"), second = add("b");
-    fs::remove(path_);
+TEST_F(NamedNotificationsTest, WhatIsThereMayHaveBeenPostedWhenTheDirectoryComesBack) {
+    const int first = add("a");
+    add("b");
+    fs::rename(path_, directory_.path("away"));
+    EXPECT_THAT(callsAfterChange(), IsEmpty());
+    directory_.write("away/a", "1");
+    fs::rename(directory_.path("away"), path_);
+    EXPECT_THAT(callsAfterChange(), ElementsAre(first));
+    fs::remove_all(path_);
     fs::create_symlink("notifications", path_);
-    EXPECT_THAT(callsAfterChange(), ElementsAre(first, second));
+    EXPECT_THAT(callsAfterChange(), IsEmpty());
     EXPECT_EQ(state(first), State(ELOOP, 0));
     EXPECT_THAT(log_.take(), ElementsAre(HasSubstr("/notifications: Too many levels of symbolic links; "),
                                          HasSubstr("/a: Too many levels of symbolic links; ")));

@@ -7,7 +7,9 @@
 #include <future>
 #include <map>
 #include <new>
+#include <set>
 #include <thread>
+#include <tuple>
 
 #include <sys/stat.h>
 
@@ -15,6 +17,7 @@ namespace tamblo {
 namespace {
 
 namespace fs = std::filesystem;
+using namespace std::chrono_literals;
 using namespace testing;
 
 class AppendOnlyFileTest : public Test {
@@ -130,13 +133,125 @@ TEST_F(AppendOnlyFileTest, CutsATornLastLineOffWhenOpened) {
 
 TEST_F(AppendOnlyFileTest, BeginsANewFileBeforeALineWouldMakeItTooLarge) {
     AppendOnlyFile file = open({.fileSize = 10});
-    const std::string large(30, 'L'); // has a file of its own
-    write(file, "1234", "5678", "a", large, "b");
-    EXPECT_THAT(files(), ElementsAre("1234\n5678\n", "a\n", large + "\n", "b\n"));
+    write(file, "1234", "5678", "a", "123456789", "b");
+    EXPECT_THAT(files(), ElementsAre("1234\n5678\n", "a\n", "123456789\n", "b\n"));
     for (const char* line : {"12345678", "123456789", "c"}) {
         write(file, line);
     }
-    EXPECT_THAT(files(), ElementsAre(large + "\n", "b\n", "12345678\n", "123456789\n", "c\n"));
+    EXPECT_THAT(files(), ElementsAre("123456789\n", "b\n", "12345678\n", "123456789\n", "c\n"));
+    directory_.write("sink.jsonl", std::string(20, 'x') + "\n");
+    write(file, "d");
+    EXPECT_THAT(files(), Contains("d\n")) << "others may have made it larger";
+}
+
+TEST_F(AppendOnlyFileTest, ALineThatIsTooLongIsLostAndCounted) {
+    {
+        AppendOnlyFile file = open({.fileSize = 100, .line = 10});
+        for (int i = 0; i < 5; ++i) {
+            write(file, "123456789", "1234567890", "abc");
+        }
+        EXPECT_EQ(open({.fileSize = 8, .line = 10}).longestLine(), 8U);
+        EXPECT_THAT(sinks_.out(), IsEmpty());
+    }
+    std::string all;
+    for (const std::string& content : files()) {
+        all += content;
+    }
+    EXPECT_EQ(all, "123456789\nabc\n123456789\nabc\n123456789\nabc\n123456789\nabc\n123456789\nabc\n");
+    EXPECT_EQ(sinks_.lostLines(), 5U);
+    const std::string told = "sink.jsonl: records of more than 10 bytes are left out, ";
+    EXPECT_THAT(log_.take(), ElementsAre(HasSubstr(told + "1 until now"), HasSubstr(told + "2 until"),
+                                         HasSubstr(told + "4 until")));
+}
+
+/// Fails, fills up and recovers, again and again, while files rotate: every line is there once, or counted.
+TEST_F(AppendOnlyFileTest, OfADiskThatFailsAndRecoversEachLineIsThereOnceOrCounted) {
+    std::vector<std::string> expected;
+    std::size_t lost = 0;
+    std::uint32_t random = 1;
+    const auto next = [&random](std::uint32_t below) {
+        random = random * 1664525 + 1013904223;
+        return (random >> 8U) % below;
+    };
+    {
+        AppendOnlyFile file = open({.fileSize = 5000, .waiting = 300});
+        for (int i = 0; i < 1500; ++i) {
+            operations_.room.reset();
+            operations_.truncateError = operations_.renameError = 0;
+            operations_.interruptions = static_cast<int>(next(3));
+            if (next(3) == 0) {
+                operations_.room = next(40);
+                operations_.truncateError = next(2) == 0 ? EIO : 0;
+                operations_.renameError = next(4) == 0 ? EIO : 0;
+            }
+            const std::uint64_t before = sinks_.lostLines();
+            for (int line = 0; line < 3; ++line) {
+                expected.push_back(std::to_string(i * 3 + line) + std::string(next(20), '.'));
+                append(file, expected.back());
+            }
+            file.flush();
+            // What is lost of a batch are its last lines.
+            const std::uint64_t ofBatch = sinks_.lostLines() - before;
+            lost += ofBatch;
+            expected.resize(expected.size() - ofBatch);
+            EXPECT_EQ(!sinks_.out().empty(), ofBatch != 0);
+            if (i % 100 == 99) {
+                std::string all;
+                for (const std::string& content : files()) {
+                    EXPECT_LE(content.size(), 5000U);
+                    all += content;
+                }
+                std::istringstream text(all.substr(0, all.rfind('\n') + 1));
+                std::vector<std::string> lines;
+                for (std::string line; std::getline(text, line);) {
+                    lines.push_back(line);
+                }
+                ASSERT_THAT(lines,
+                            ElementsAreArray(expected.end() - static_cast<std::ptrdiff_t>(lines.size()),
+                                             expected.end()));
+                EXPECT_GT(lines.size(), 100U);
+            }
+        }
+    }
+    EXPECT_GT(lost, 100U);
+    std::uint64_t told = 0;
+    for (const std::string& line : log_.take()) {
+        told += line.ends_with("records were lost") ? std::stoull(line.substr(line.rfind("; ") + 2)) : 0;
+    }
+    EXPECT_EQ(told, lost);
+}
+
+TEST_F(AppendOnlyFileTest, IsOutWhileItCannotBeWrittenAndFollowsItsDirectory) {
+    AppendOnlyFile file = open();
+    AppendOnlyFile own(sinks_, "own.jsonl", "zrrs", AppendOnlyFile::Flushed::byOwner);
+    write(file, "one");
+    write(own, "one");
+    EXPECT_THAT(sinks_.out(), IsEmpty());
+    const std::string logs = directory_.path();
+    fs::rename(logs, logs + ".away");
+    test::writeFile(logs, "in the way");
+    write(file, "lost", "lost");
+    write(own, "lost");
+    EXPECT_THAT(sinks_.out(), UnorderedElementsAre("sink.jsonl", "own.jsonl"));
+    EXPECT_EQ(sinks_.lostLines(), 3U);
+    fs::remove(logs);
+    write(file, "two"); // makes it anew
+    write(own, "two");
+    EXPECT_THAT(sinks_.out(), IsEmpty());
+    EXPECT_EQ(content(), "two\n");
+    EXPECT_EQ(fs::status(logs).permissions(), fs::perms::owner_all);
+    fs::remove_all(logs);
+    fs::rename(logs + ".away", logs);
+    write(file, "three");
+    EXPECT_EQ(content(), "one\nthree\n");
+    EXPECT_THAT(log_.take(),
+                UnorderedElementsAre(HasSubstr("/sink.jsonl: cannot open its directory: Not a"),
+                                     HasSubstr("/own.jsonl: cannot open its directory: Not a"),
+                                     HasSubstr("; 2 records were lost"), HasSubstr("; 1 records")));
+    fs::rename(file.path(), logs + "/elsewhere");
+    fs::create_symlink("elsewhere", file.path());
+    write(file, "four");
+    EXPECT_EQ(content(), "one\nthree\n") << "not through a link";
 }
 
 TEST_F(AppendOnlyFileTest, KeepsEarlierFilesWhenRenamingFailsAgainAndAgain) {
@@ -145,7 +260,7 @@ TEST_F(AppendOnlyFileTest, KeepsEarlierFilesWhenRenamingFailsAgainAndAgain) {
     ASSERT_THAT(files(), ElementsAre("aaa\n", "bbb\n", "ccc\n", "ddd\n"));
     operations_.renameError = EACCES;
     for (int attempt = 0; attempt < 3; ++attempt) {
-        write(file, "lost");
+        write(file, "xxx");
     }
     operations_.renameError = 0;
     write(file, "eee");
@@ -261,6 +376,7 @@ TEST_F(LinuxAnalyticsEventServiceTest, AnswersWhichEventsAreInUse) {
         {Array{"*"}, "a x", ""},
         {Array{}, "", "a.b c.d"},
         {Array{"a*", "a.b*c", "*d"}, "a a.b", "d xd"},
+        {Array{"b.c*", "b*", "ab*", "b.*", "b.a", "z"}, "b b.c b.z ab abc bz z", "a c aa zz"},
         {"a", "a zz", ""},
         {Array{1, "1x"}, "1x", "1 a"},
     };
@@ -305,66 +421,171 @@ TEST_F(LinuxAnalyticsEventServiceTest, WritesTheEventsThatAreInUse) {
 
 class LinuxReportFilesTest : public Test {
 protected:
-    /// The file's name, or why there is none.
-    std::string create(const std::string& name) {
-        auto created = files.createFile(directory.path(name));
-        if (auto* const refusal = std::get_if<std::string>(&created)) {
-            return *refusal;
+    static std::string nameOf(std::int64_t reporter) {
+        return "20260301-120000+0100-" + std::to_string(reporter) + "-app-test.json";
+    }
+    std::string path(const std::string& name) const { return files->reportingLogsDirectory() + "/" + name; }
+    std::unique_ptr<ReportFile> create(const std::string& name) {
+        auto created = files->createFile(path(name));
+        refusal = "";
+        if (auto* const text = std::get_if<std::string>(&created)) {
+            refusal = std::move(*text);
+            return nullptr;
         }
-        file = std::get<std::unique_ptr<ReportFile>>(std::move(created));
-        return name;
+        return std::get<std::unique_ptr<ReportFile>>(std::move(created));
+    }
+    void report(std::int64_t reporter, std::size_t bytes) {
+        EXPECT_EQ(create(nameOf(reporter))->write(std::string(bytes, 'x')), std::nullopt);
+        clock.advance(1s);
+    }
+    /// Of that age, in days.
+    void leave(const std::string& name, int days, std::size_t bytes = 1) const {
+        test::writeFile(path(name), std::string(bytes, 'x'));
+        const auto time = clock.now() - std::chrono::days(days);
+        fs::last_write_time(path(name), std::chrono::file_clock::from_sys(time));
+    }
+    std::set<std::string> names() const {
+        std::set<std::string> found;
+        for (const auto& entry : fs::directory_iterator(files->reportingLogsDirectory())) {
+            found.insert(entry.path().filename());
+        }
+        return found;
     }
     static fs::perms modeOf(const std::string& path) { return fs::status(path).permissions(); }
 
     TemporaryDirectory directory;
+    FakeLog log;
+    FakeClock clock;
     FaultyOperations operations;
-    LinuxReportFiles files{directory.path(), operations};
-    std::unique_ptr<ReportFile> file;
+    FileModes modes;
+    ReportLimits limits{.files = 4, .bytes = 1000, .fileBytes = 600};
+    std::optional<LinuxReportFiles> files{std::in_place, directory.path(), clock,     log,
+                                          modes,         limits,           operations};
+    std::string refusal;
 };
 
-TEST_F(LinuxReportFilesTest, DirectoriesAreForEverybodyWhateverTheMask) {
-    const std::string reporting = files.reportingLogsDirectory();
-    EXPECT_EQ(reporting, directory.path("DiagnosticLogs/Audio/Reporting"));
-    const mode_t before = ::umask(0077);
-    EXPECT_EQ(files.createDirectory(reporting), std::nullopt);
-    ::umask(before);
-    for (const char* name : {"DiagnosticLogs", "DiagnosticLogs/Audio", "DiagnosticLogs/Audio/Reporting"}) {
-        EXPECT_EQ(modeOf(directory.path(name)), fs::perms::all) << name;
+TEST_F(LinuxReportFilesTest, DirectoriesAndFilesAreTheirOwnersAloneUnlessTheMakerSaysOtherwise) {
+    LinuxPreferences preferences(directory.path("preferences"), log);
+    const mode_t before = ::umask(0027);
+    for (const auto& [file, folder, fileMode, folderMode] :
+         {std::tuple<Value, Value, int, int>(4, "x", 0600, 0700), {"0666", "775", 0666, 0775}}) {
+        fs::remove_all(directory.path("DiagnosticLogs"));
+        preferences.setPreferenceValue("file_mode", "com.vandra.tamblo.sinks", file);
+        preferences.setPreferenceValue("directory_mode", "com.vandra.tamblo.sinks", folder);
+        files.emplace(directory.path(), clock, log, FileModes::read(preferences, log), limits, operations);
+        EXPECT_EQ(files->createDirectory(files->reportingLogsDirectory()), std::nullopt);
+        report(1, 1);
+        for (const char* name :
+             {"DiagnosticLogs", "DiagnosticLogs/Audio", "DiagnosticLogs/Audio/Reporting"}) {
+            EXPECT_EQ(modeOf(directory.path(name)), fs::perms(folderMode)) << name;
+        }
+        EXPECT_EQ(modeOf(path(nameOf(1))), fs::perms(fileMode));
     }
+    ::umask(before);
     EXPECT_EQ(modeOf(directory.path()), fs::perms::owner_all);
+    EXPECT_THAT(log.take(), Contains(HasSubstr("com.vandra.tamblo.sinks: file_mode is no octal text")));
 
+    EXPECT_EQ(files->createDirectory(directory.path()), "not a directory of reports");
     fs::remove_all(directory.path("DiagnosticLogs"));
     directory.write("DiagnosticLogs", "a file");
-    EXPECT_EQ(files.createDirectory(reporting), "Not a directory");
+    EXPECT_EQ(files->createDirectory(files->performanceLogsDirectory()), "Not a directory");
 }
 
-TEST_F(LinuxReportFilesTest, AFileTakesThePlaceOfARegularOneOnly) {
+TEST_F(LinuxReportFilesTest, AFileTakesThePlaceOfARegularOneOnlyAndIsReachedThroughNoLink) {
     operations.largestWrite = 7;
     operations.interruptions = 1000;
-    directory.write("report", "an old and longer report, of which nothing must be left");
-    ASSERT_EQ(create("report"), "report");
-    EXPECT_EQ(directory.read("report"), "");
+    leave(nameOf(1), 0, 100);
+    auto file = create(nameOf(1));
+    EXPECT_EQ(test::contentOf(path(nameOf(1))), "");
     EXPECT_EQ(file->write("written in many pieces, most of them interrupted"), std::nullopt);
     operations.room = 2;
     EXPECT_EQ(file->write("; lost"), "No space left on device");
     operations.room.reset();
     EXPECT_EQ(file->write("."), std::nullopt);
+    EXPECT_EQ(file->write(std::string(600, 'x')), "File too large");
     EXPECT_EQ(file->close(), std::nullopt);
-    const std::string text = "written in many pieces, most of them interrupted; .";
-    EXPECT_EQ(directory.read("report"), text);
+    EXPECT_EQ(test::contentOf(path(nameOf(1))), "written in many pieces, most of them interrupted; .");
 
-    const mode_t before = ::umask(0);
-    EXPECT_EQ(create("new"), "new");
-    ::umask(before);
-    EXPECT_EQ(modeOf(directory.path("new")), fs::perms{0644});
+    directory.write("elsewhere/kept", "text");
+    fs::create_symlink(directory.path("elsewhere/kept"), path("link"));
+    ::mkfifo(path("pipe").c_str(), 0600);
+    for (const auto& [name, reason] :
+         {std::pair("link", "Too many levels of symbolic links"), {"pipe", "No such device or address"}}) {
+        EXPECT_EQ(create(name), nullptr);
+        EXPECT_EQ(refusal, reason);
+    }
+    for (const char* part : {"DiagnosticLogs/Audio/Reporting", "DiagnosticLogs"}) {
+        fs::remove_all(directory.path(part));
+        fs::create_directories(directory.path("elsewhere/Audio/Reporting"));
+        fs::create_symlink(directory.path("elsewhere"), directory.path(part));
+        EXPECT_EQ(create(nameOf(2)), nullptr) << part;
+        EXPECT_EQ(refusal, "Not a directory");
+        fs::remove(directory.path(part));
+        report(3, 1);
+    }
+    EXPECT_EQ(test::entriesOf(directory.path("elsewhere")) +
+                  test::entriesOf(directory.path("elsewhere/Audio/Reporting")),
+              2);
+    EXPECT_EQ(directory.read("elsewhere/kept"), "text");
+}
 
-    fs::create_symlink(directory.path("report"), directory.path("link"));
-    ::mkfifo(directory.path("pipe").c_str(), 0600);
-    EXPECT_EQ(create("link"), "Too many levels of symbolic links");
-    EXPECT_EQ(create("pipe"), "No such device or address");
-    EXPECT_EQ(create("gone/report"), "No such file or directory");
-    EXPECT_EQ(std::get<std::string>(files.createFile("/dev/full")), "not a regular file");
-    EXPECT_EQ(directory.read("report"), text);
+TEST_F(LinuxReportFilesTest, TheNewestAreKeptAndNothingElseIsRemoved) {
+    const std::string strange[] = {"notes.json", nameOf(8) + ".tmp", "20260301-120000+0100-x-app-test.json",
+                                   "20260301-1200000100-7-app-test.json"};
+    for (const std::string& name : strange) {
+        leave(name, 100, 5000);
+    }
+    fs::create_directory(path(nameOf(9))); // no file
+    leave(nameOf(1), 15);
+    leave(nameOf(-2), 13);
+    leave(nameOf(3), -2); // of a time that is still to come
+    const auto kept = [&] {
+        std::set<std::string> found = names();
+        for (const std::string& name : strange) {
+            EXPECT_EQ(found.erase(name), 1U) << name;
+        }
+        EXPECT_EQ(found.erase(nameOf(9)), 1U);
+        return found;
+    };
+    report(4, 1);
+    EXPECT_THAT(kept(), UnorderedElementsAre(nameOf(-2), nameOf(3), nameOf(4))) << "by age";
+    report(5, 1);
+    report(6, 1);
+    EXPECT_THAT(kept(), UnorderedElementsAre(nameOf(-2), nameOf(4), nameOf(5), nameOf(6))) << "by number";
+    report(6, 500);
+    report(7, 499);
+    EXPECT_THAT(kept(), UnorderedElementsAre(nameOf(5), nameOf(6), nameOf(7)));
+    // One that grows makes room, and is never removed for others.
+    auto growing = create(nameOf(10));
+    EXPECT_EQ(growing->write(std::string(400, 'x')), std::nullopt);
+    EXPECT_THAT(kept(), UnorderedElementsAre(nameOf(7), nameOf(10)));
+    clock.advance(24h * 30);
+    report(11, 600);
+    EXPECT_THAT(kept(), UnorderedElementsAre(nameOf(10), nameOf(11)));
+    growing.reset();
+    // What others have taken away is not counted.
+    fs::remove(path(nameOf(11)));
+    report(12, 500);
+    EXPECT_THAT(kept(), UnorderedElementsAre(nameOf(10), nameOf(12)));
+    EXPECT_THAT(log.take(), IsEmpty());
+}
+
+TEST_F(LinuxReportFilesTest, ADirectoryFullOfOtherFilesIsLearntLittleByLittle) {
+    constexpr int kStrange = 2000;
+    for (int i = 0; i < kStrange; ++i) {
+        leave("strange" + std::to_string(i), 0);
+        if (i % 100 == 0) {
+            leave(nameOf(1000 + i), 20);
+        }
+    }
+    const auto reports = [this] { return test::entriesOf(files->reportingLogsDirectory()) - kStrange; };
+    std::ptrdiff_t before = reports();
+    for (int i = 0; i < 5; ++i) {
+        report(i, 1);
+        EXPECT_GT(reports(), before - 15) << "no more than a share of them";
+        before = reports();
+    }
+    EXPECT_EQ(before, 4);
 }
 
 } // namespace

@@ -126,7 +126,11 @@ TEST(Service, WhatKeepsItFromStartingIsOneClearLine) {
         {directory.path("taken"), "no socket: remove it"},
         {directory.path("taken"), "file descriptor 3", announceSocket},
         {first.runtimeDirectory(), "already answers at " + first.socketPath()},
+        {directory.path("locked"), directory.path("locked") + " locked: end it"},
     };
+    std::filesystem::create_directory(directory.path("locked"));
+    const FileDescriptor lock(::open(directory.path("locked").c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+    ASSERT_EQ(::flock(lock.get(), LOCK_EX), 0);
     for (const auto& hindrance : cases) {
         ServiceProcess service({.environment = {{"RUNTIME_DIRECTORY", hindrance.runtimeDirectory}},
                                 .beforeExec = hindrance.beforeExec,
@@ -207,10 +211,11 @@ TEST(Service, OfTwoThatStartAtOnceOneServes) {
     const ServiceProcess::Options options{.environment = {{"RUNTIME_DIRECTORY", before.runtimeDirectory()}},
                                           .awaitsReady = false};
     ServiceProcess one(options), other(options);
-    for (const ServiceProcess* each : {&one, &other}) {
-        const std::string waiting = "-> FLOCK  ADVISORY  WRITE " + std::to_string(each->pid());
-        EXPECT_TRUE(eventually([&] { return countOf(waiting, contentOf("/proc/locks")) > 0; }));
-    }
+    const auto waits = [&](const ServiceProcess& service) {
+        const std::string descriptors = "ls -l /proc/" + std::to_string(service.pid()) + "/fd";
+        return countOf("-> " + before.runtimeDirectory() + "\n", run(descriptors).output) != 0;
+    };
+    EXPECT_TRUE(eventually([&] { return waits(one) && waits(other); }));
     ::close(directory);
     EXPECT_TRUE(eventually([&] {
         return countOf("another tamblod already answers", one.errorOutput() + other.errorOutput()) == 1;

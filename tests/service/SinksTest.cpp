@@ -148,11 +148,15 @@ TEST_F(Sinks, CallQualityIsWrittenByAQueueOfItsOwn) {
 }
 
 TEST_F(Sinks, WithoutABackEndOfCallQualityThereIsNothingToSend) {
-    ServiceProcess service({.preferences = {{kCallQuality, R"({"backends": 5})"}}});
-    EXPECT_TRUE(Session(service.socketPath()).stop());
-    EXPECT_EQ(service.stop(), 0);
-    EXPECT_THAT(callQualityOf(service), ElementsAre(Pair(_, "o")));
-    EXPECT_EQ(countOf("backends is no array; no back end is found", service.errorOutput()), 1U);
+    for (const auto& [backends, operations] : {std::pair("[]", "o"), {"5", "omf"}, {"{}", "omf"}}) {
+        ServiceProcess service(
+            {.preferences = {{kCallQuality, R"({"backends": )" + std::string(backends) + "}"}}});
+        EXPECT_TRUE(Session(service.socketPath()).stop());
+        EXPECT_EQ(service.stop(), 0);
+        EXPECT_THAT(callQualityOf(service), ElementsAre(Pair(_, operations))) << backends;
+        EXPECT_EQ(countOf("backends is no array; \"spool\"", service.errorOutput()),
+                  *backends == '[' ? 0U : 1U);
+    }
 }
 
 TEST_F(Sinks, OfManySessionsNothingIsLostAtTheEndAndTheyShareFewThreads) {

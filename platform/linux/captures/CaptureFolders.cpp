@@ -8,20 +8,18 @@
 #include <algorithm>
 #include <cerrno>
 #include <cstddef>
-#include <filesystem>
 #include <functional>
 #include <system_error>
 #include <tuple>
 #include <utility>
 #include <vector>
 
+#include <fcntl.h>
 #include <sys/stat.h>
 
 namespace tamblo {
 
 namespace {
-
-namespace fs = std::filesystem;
 
 constexpr std::string_view kUnfinished = ".new-";
 /// An identifier with every digit as 0; those behind the time are hexadecimal.
@@ -49,19 +47,9 @@ std::string timeText(WallTime time) {
     return text;
 }
 
-std::uint64_t sizeOf(const std::string& folder) {
-    std::uint64_t size = 0;
-    std::size_t seen = 0;
-    std::error_code error;
-    for (fs::recursive_directory_iterator entry(folder, error), end;
-         !error && entry != end && seen < kMaximumEntries; ++seen, entry.increment(error)) {
-        std::error_code ignored;
-        if (entry->symlink_status(ignored).type() == fs::file_type::regular) {
-            const std::uintmax_t length = entry->file_size(ignored);
-            size += ignored ? 0 : length;
-        }
-    }
-    return size;
+bool isFolder(int directory, const std::string& name) noexcept {
+    struct stat status {};
+    return ::fstatat(directory, name.c_str(), &status, AT_SYMLINK_NOFOLLOW) == 0 && S_ISDIR(status.st_mode);
 }
 
 } // namespace
@@ -70,65 +58,79 @@ std::string CaptureFolders::identifier(WallTime time, std::uint64_t number) {
     return formatted("{}-{}", timeText(time), hexadecimal(number, 8));
 }
 
+CaptureFolders::CaptureFolders(const std::string& directory, StructuredLog& log, FileModes modes,
+                               Limits limits)
+    : directory_(directory.substr(0, directory.rfind('/')), directory.substr(directory.rfind('/') + 1),
+                 modes.directory),
+      log_(log),
+      modes_(modes),
+      limits_(limits) {}
+
 void CaptureFolders::store(std::string_view identifier, std::span<const CaptureFile> files, WallTime now) {
-    // Before, for a disk that is full of old ones; after, as the new one counts too.
-    removeOld(now, identifier);
-    const int error = makeDirectory(directory_);
-    const std::string problem = error != 0 ? failure("make", "it", error) : write(identifier, files);
+    const HeldDirectory::Ref directory = directory_.open();
+    std::string problem = directory == nullptr ? failure("make", "it", errno) : "";
+    if (directory != nullptr) {
+        // Before, for a disk that is full of old ones; after, as the new one counts too.
+        removeOld(directory->get(), now, identifier);
+        problem = write(directory->get(), std::string(identifier), files);
+        removeOld(directory->get(), now, identifier);
+    }
     tell(isWritingOut_, problem, "captures have no folders until it can be written again");
     // Where there is no folder either, one line says it all.
     if (problem.empty()) {
         tell(isKeepingOut_, keepingProblem_, "the service will know nothing of it when it is started again");
     }
-    removeOld(now, identifier);
 }
 
 void CaptureFolders::keep(std::string_view name, std::string_view text) {
     // A directory that there is not is told with the folder.
-    const bool isThere = makeDirectory(directory_) == 0;
-    const int error = isThere ? replaceFileAtomically(formatted("{}/{}", directory_, name), text) : 0;
+    const HeldDirectory::Ref directory = directory_.open();
+    const int error = directory == nullptr ? 0
+                                           : replaceFileAtomically(directory->get(), std::string(name), text,
+                                                                   Durability::process, modes_.file);
     keepingProblem_ = error != 0 ? failure("write", name, error) : "";
 }
 
-std::string CaptureFolders::write(std::string_view identifier, std::span<const CaptureFile> files) const {
+std::string CaptureFolders::write(int directory, const std::string& identifier,
+                                  std::span<const CaptureFile> files) const {
     const std::string name = formatted("{}{}", kUnfinished, identifier);
-    const std::string folder = formatted("{}/{}", directory_, name);
-    std::string problem;
-    if (::mkdir(folder.c_str(), S_IRWXU) != 0) {
+    if (::mkdirat(directory, name.c_str(), modes_.directory) != 0) {
         return failure("make", name, errno);
     }
-    for (const CaptureFile& file : files) {
-        const int error = replaceFileAtomically(formatted("{}/{}", folder, file.name), file.text);
-        if (error != 0) {
-            problem = failure("write", file.name, error);
-            break;
-        }
-    }
-    std::error_code error;
-    if (problem.empty()) {
-        fs::rename(folder, formatted("{}/{}", directory_, identifier), error);
-        problem = error ? failure("rename", name, error.value()) : "";
+    std::string problem = writeFiles(directory, name, files);
+    if (problem.empty() && ::renameat(directory, name.c_str(), directory, identifier.c_str()) != 0) {
+        problem = failure("rename", name, errno);
     }
     if (!problem.empty()) {
-        fs::remove_all(folder, error);
+        (void)removeTree(directory, name);
     }
     return problem;
 }
 
-void CaptureFolders::removeOld(WallTime now, std::string_view latest) {
+std::string CaptureFolders::writeFiles(int directory, const std::string& folder,
+                                       std::span<const CaptureFile> files) const {
+    const FileDescriptor opened(
+        ::openat(directory, folder.c_str(), O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC));
+    if (!opened.isOpen() || ::fchmod(opened.get(), modes_.directory) != 0) {
+        return failure("open", folder, errno);
+    }
+    for (const CaptureFile& file : files) {
+        if (const int error =
+                replaceFileAtomically(opened.get(), file.name, file.text, Durability::process, modes_.file)) {
+            return failure("write", file.name, error);
+        }
+    }
+    return {};
+}
+
+void CaptureFolders::removeOld(int directory, WallTime now, std::string_view latest) {
     std::vector<std::string> removed;
     std::vector<std::string> folders;
-    for (std::string& name : DirectoryEntries::read(directory_, kMaximumEntries).names) {
-        std::error_code error;
-        const fs::file_status status = fs::symlink_status(formatted("{}/{}", directory_, name), error);
-        if (status.type() != fs::file_type::directory) {
-            continue;
-        }
-        if (name.starts_with(kUnfinished) &&
-            isIdentifier(std::string_view(name).substr(kUnfinished.size()))) {
-            removed.push_back(std::move(name));
-        } else if (isIdentifier(name)) {
-            folders.push_back(std::move(name));
+    for (std::string& name : DirectoryEntries::read(directory, kMaximumEntries).names) {
+        const bool isUnfinished =
+            name.starts_with(kUnfinished) && isIdentifier(std::string_view(name).substr(kUnfinished.size()));
+        if ((isUnfinished || isIdentifier(name)) && isFolder(directory, name)) {
+            (isUnfinished ? removed : folders).push_back(std::move(name));
         }
     }
     const std::string oldest = timeText(now - kMaximumAge);
@@ -140,17 +142,17 @@ void CaptureFolders::removeOld(WallTime now, std::string_view latest) {
     std::uint64_t total = 0;
     for (const std::string& name : folders) {
         // Once there is no more room, there is none for those that are older.
-        total += total > limits_.totalSize ? 0 : sizeOf(formatted("{}/{}", directory_, name));
+        std::size_t entries = kMaximumEntries;
+        total += total > limits_.totalSize ? 0 : sizeOfTree(directory, name, entries);
         if (name != latest && (total > limits_.totalSize || name < oldest)) {
             removed.push_back(name);
         }
     }
     std::string problem;
     for (const std::string& name : removed) {
-        std::error_code error;
-        fs::remove_all(formatted("{}/{}", directory_, name), error);
-        if (error && problem.empty()) {
-            problem = failure("remove", name, error.value());
+        const int error = removeTree(directory, name);
+        if (error != 0 && problem.empty()) {
+            problem = failure("remove", name, error);
         }
     }
     tell(isRemovingOut_, problem, "it takes room until it can be removed");
@@ -159,7 +161,8 @@ void CaptureFolders::removeOld(WallTime now, std::string_view latest) {
 void CaptureFolders::tell(bool& isOut, std::string_view problem, std::string_view consequence) {
     const bool wasOut = std::exchange(isOut, !problem.empty());
     if (isOut && !wasOut) {
-        log_.report(LogLevel::error, "zrrb", formatted("{}: {}; {}", directory_, problem, consequence));
+        log_.report(LogLevel::error, "zrrb",
+                    formatted("{}: {}; {}", directory_.path(), problem, consequence));
     }
 }
 

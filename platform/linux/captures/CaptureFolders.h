@@ -1,7 +1,9 @@
 #pragma once
 
+#include "os/HeldDirectory.h"
 #include "platform/Clock.h"
 #include "platform/StructuredLog.h"
+#include "platform/linux/sinks/FileModes.h"
 
 #include <chrono>
 #include <cstdint>
@@ -27,8 +29,9 @@ struct CaptureFile {
 /// The clock may be set in between: the folder that was just written stays, however long ago its capture was
 /// asked for, and folders of a time that is still to come are the first to make room.
 ///
-/// Directory and files are the owner's alone. A directory that cannot be written is one error line in the log
-/// until it can be again. Used by one thread at a time, which waits for the disk.
+/// Directory and files are the owner's alone, unless the modes say otherwise, and the directory is held open
+/// (`HeldDirectory`). One that cannot be written is one error line in the log until it can be again. Used by
+/// one thread at a time, which waits for the disk.
 class CaptureFolders {
 public:
     /// Whoever follows a fault up takes the captures within a few weeks; what they tell of processes is not
@@ -42,10 +45,9 @@ public:
 
     /// The directory is made with the first folder; its parent has to be there. The log must outlive this
     /// object.
-    CaptureFolders(std::string directory, StructuredLog& log)
-        : CaptureFolders(std::move(directory), log, {}) {}
-    CaptureFolders(std::string directory, StructuredLog& log, Limits limits)
-        : directory_(std::move(directory)), log_(log), limits_(limits) {}
+    CaptureFolders(const std::string& directory, StructuredLog& log, FileModes modes = {})
+        : CaptureFolders(directory, log, modes, {}) {}
+    CaptureFolders(const std::string& directory, StructuredLog& log, FileModes modes, Limits limits);
 
     /// An identifier, `20260301T120000.250Z-9f86d081`: sorts by time, is a file name everywhere, and is
     /// unique as the number, of which the last 32 bits are taken, is.
@@ -57,12 +59,16 @@ public:
     void keep(std::string_view name, std::string_view text);
 
 private:
-    [[nodiscard]] std::string write(std::string_view identifier, std::span<const CaptureFile> files) const;
-    void removeOld(WallTime now, std::string_view latest);
+    [[nodiscard]] std::string write(int directory, const std::string& identifier,
+                                    std::span<const CaptureFile> files) const;
+    [[nodiscard]] std::string writeFiles(int directory, const std::string& folder,
+                                         std::span<const CaptureFile> files) const;
+    void removeOld(int directory, WallTime now, std::string_view latest);
     void tell(bool& isOut, std::string_view problem, std::string_view consequence);
 
-    const std::string directory_;
+    HeldDirectory directory_;
     StructuredLog& log_;
+    const FileModes modes_;
     const Limits limits_;
     /// Whether the log knows that no folder can be written, no file beside them, or nothing removed.
     bool isWritingOut_ = false;

@@ -41,13 +41,14 @@ private:
 
 LinuxBugCaptureService::LinuxBugCaptureService(SinkFiles& sinks, const std::string& directory,
                                                const Clock& clock, WorkQueues& workQueues,
-                                               LinuxStructuredLog& log, const CaptureContent& content)
+                                               LinuxStructuredLog& log, FileModes modes,
+                                               const CaptureContent& content)
     : content_(content),
       clock_(clock),
       workQueues_(workQueues),
       log_(log),
       file_(sinks, "bug-captures.jsonl", "zrrb"),
-      folders_(directory, log),
+      folders_(directory, log, modes),
       allowance_(formatted("{}/{}", directory, kAllowanceFile), log),
       lastNumber_(randomNumber()),
       queue_(workQueues, "com.vandra.tamblo.bugcaptures",

@@ -41,7 +41,7 @@ public:
     /// What is referred to must outlive the service, except the queues: before they go, `endSessions` is
     /// called.
     LinuxBugCaptureService(SinkFiles& sinks, const std::string& directory, const Clock& clock,
-                           WorkQueues& workQueues, LinuxStructuredLog& log,
+                           WorkQueues& workQueues, LinuxStructuredLog& log, FileModes modes = {},
                            const CaptureContent& content = CaptureContent());
     ~LinuxBugCaptureService() override { endSessions(); }
 

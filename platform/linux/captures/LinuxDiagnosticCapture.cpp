@@ -1,13 +1,19 @@
 #include "platform/linux/captures/LinuxDiagnosticCapture.h"
 
+#include "base/Format.h"
 #include "platform/ProcessList.h"
+#include "platform/linux/sinks/PayloadSize.h"
 
 #include <algorithm>
+#include <map>
+#include <string_view>
 #include <utility>
 
 namespace tamblo {
 
 namespace {
+
+constexpr std::string_view kLogCategory = "zrrl";
 
 struct RepeatedSample {
     ProcessFiles::ThreadSample sample;
@@ -108,12 +114,32 @@ void appendThread(TextBuffer& line, const ThreadStacks& thread) {
         .array("samples", thread.samples, appendSample);
 }
 
-void appendProcess(TextBuffer& line, const ProcessStacks& process) {
-    JsonObject(line)
-        .number("process", process.process)
-        .text("name", process.name)
-        .array("threads", process.threads, appendThread);
-}
+/// The stacks of processes as they stand in the lines of all captures that are about them.
+class StacksAsText {
+public:
+    explicit StacksAsText(const std::vector<ProcessStacks>& processes) {
+        for (const ProcessStacks& process : processes) {
+            TextBuffer& text = texts_[process.process];
+            JsonObject(text)
+                .number("process", process.process)
+                .text("name", process.name)
+                .array("threads", process.threads, appendThread);
+        }
+    }
+    /// In their order; those that were not found are left out.
+    [[nodiscard]] std::vector<std::string_view> of(const std::vector<pid_t>& processes) const {
+        std::vector<std::string_view> found;
+        for (const pid_t process : processes) {
+            if (const auto text = texts_.find(process); text != texts_.end()) {
+                found.push_back(text->second.view());
+            }
+        }
+        return found;
+    }
+
+private:
+    std::map<pid_t, TextBuffer> texts_;
+};
 
 } // namespace
 
@@ -121,34 +147,90 @@ LinuxDiagnosticCapture::LinuxDiagnosticCapture(SinkFiles& sinks, Clock& clock, W
                                                ClientProcesses clientProcesses, StructuredLog& log,
                                                ProcessFiles files)
     : clock_(clock),
+      workQueues_(workQueues),
+      log_(log),
       clientProcesses_(std::move(clientProcesses)),
       files_(std::move(files)),
-      file_(sinks, "stack-captures.jsonl", "zrrl", AppendOnlyFile::Flushed::byOwner),
-      queue_(workQueues, "com.vandra.tamblo.stackcaptures",
-             {.waiting = kMaximumWaiting, .what = "stack captures", .categoryCode = "zrrl"}, log) {}
+      file_(sinks, "stack-captures.jsonl", kLogCategory, AppendOnlyFile::Flushed::byOwner) {}
 
 void LinuxDiagnosticCapture::captureStacks(StackCaptureRequest request) {
-    queue_.post(
-        [this, request = std::move(request), clients = clientProcesses_()] { capture(request, clients); });
+    Waiting waiting{std::move(request), clientProcesses_()};
+    waiting.clients.resize(std::min(waiting.clients.size(), kMaximumThreads));
+    {
+        const MutexLock lock(mutex_);
+        if (add(std::move(waiting)) || ++dropped_ > 1) {
+            return;
+        }
+    }
+    log_.report(LogLevel::error, kLogCategory,
+                formatted("{} stack captures, or {} bytes of them, wait; further ones are dropped",
+                          kMaximumWaiting, kMaximumWaitingBytes));
 }
 
-void LinuxDiagnosticCapture::capture(const StackCaptureRequest& request, const std::vector<pid_t>& clients) {
-    ProcessList processes(kMaximumThreads);
-    processes.addNamedBy(request.payload);
-    processes.add(clients);
-    std::vector<ProcessStacks> stacks = findThreads(files_, std::move(processes).take());
+bool LinuxDiagnosticCapture::add(Waiting&& waiting) {
+    const std::size_t bytes = payloadSize(waiting.request.payload, sizeof(Value));
+    if (waiting_.size() == kMaximumWaiting || bytes > kMaximumWaitingBytes - waitingBytes_) {
+        return false;
+    }
+    waitingBytes_ += bytes;
+    waiting_.push_back(std::move(waiting));
+    if (waiting_.size() == 1) {
+        if (queue_ == nullptr) {
+            queue_ = workQueues_.makeSerialQueue("com.vandra.tamblo.stackcaptures");
+        }
+        queue_->post([this] { captureWaiting(); }, Pace::mayBlock);
+    }
+    return true;
+}
+
+std::vector<LinuxDiagnosticCapture::Waiting> LinuxDiagnosticCapture::takeWaiting() {
+    std::vector<Waiting> taken;
+    std::uint64_t dropped = 0;
+    {
+        const MutexLock lock(mutex_);
+        taken.swap(waiting_);
+        waitingBytes_ = 0;
+        dropped = std::exchange(dropped_, 0);
+    }
+    if (dropped != 0) {
+        log_.report(LogLevel::error, kLogCategory,
+                    formatted("no stack captures wait any more; {} were dropped", dropped));
+    }
+    return taken;
+}
+
+void LinuxDiagnosticCapture::captureWaiting() {
+    const std::vector<Waiting> captures = takeWaiting();
+    ProcessList all(kMaximumThreads);
+    std::vector<std::vector<pid_t>> ofEach;
+    for (const Waiting& capture : captures) {
+        all.addNamedBy(capture.request.payload);
+        ProcessList own(kMaximumThreads);
+        own.addNamedBy(capture.request.payload);
+        own.add(capture.clients);
+        ofEach.push_back(std::move(own).take());
+    }
+    for (const Waiting& capture : captures) {
+        all.add(capture.clients);
+    }
+    std::vector<ProcessStacks> stacks = findThreads(files_, std::move(all).take());
     const WallTime time = clock_.now();
     sampleAll(files_, clock_, stacks);
-    file_.append([&](TextBuffer& line) {
-        SinkLine(line, time)
-            .text("requester", request.requester)
-            .text("captureType", request.captureType)
-            .text("reason", request.reason)
-            .value("payload", request.payload)
-            .array("options", request.options,
-                   [](TextBuffer& element, std::int32_t option) { appendJson(element, Value(option)); })
-            .array("stacks", stacks, appendProcess);
-    });
+    const StacksAsText texts(stacks);
+    for (std::size_t i = 0; i < captures.size(); ++i) {
+        const StackCaptureRequest& request = captures[i].request;
+        file_.append([&](TextBuffer& line) {
+            SinkLine(line, time)
+                .text("requester", request.requester)
+                .text("captureType", request.captureType)
+                .text("reason", request.reason)
+                .value("payload", request.payload)
+                .array("options", request.options,
+                       [](TextBuffer& element, std::int32_t option) { appendJson(element, Value(option)); })
+                .array("stacks", texts.of(ofEach[i]),
+                       [](TextBuffer& element, std::string_view text) { element.append(text); });
+        });
+    }
     file_.flush();
 }
 

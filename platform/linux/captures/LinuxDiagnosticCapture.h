@@ -1,15 +1,17 @@
 #pragma once
 
+#include "base/Mutex.h"
 #include "platform/Clock.h"
 #include "platform/DiagnosticCaptureService.h"
 #include "platform/WorkQueue.h"
 #include "platform/linux/device/ProcessFiles.h"
-#include "platform/linux/loop/LimitedQueue.h"
 #include "platform/linux/sinks/AppendOnlyFile.h"
 
 #include <chrono>
 #include <cstddef>
+#include <cstdint>
 #include <functional>
+#include <memory>
 #include <string>
 #include <vector>
 
@@ -27,6 +29,9 @@ namespace tamblo {
 /// capture is asked for. All their threads are sampled five times within a tenth of a second, on a queue of
 /// the service's own; samples in a row that are equal are one, with their count. A thread that ends keeps the
 /// samples that it had, one that begins in that time is not seen.
+///
+/// One problem may be noticed in many sessions at once: captures that are asked for while another is made
+/// share the next sampling, and each has a line with the processes that it is about.
 class LinuxDiagnosticCapture final : public DiagnosticCaptureService {
 public:
     using ClientProcesses = std::function<std::vector<pid_t>()>;
@@ -38,12 +43,14 @@ public:
     /// The pause between two samples: longer than an audio device's usual period of ten or
     /// twenty milliseconds, so that a thread that keeps its deadlines has moved on in between.
     static constexpr std::chrono::milliseconds kSampleInterval{25};
-    /// Of all processes together: a sample takes some thirty microseconds, so that those of all threads take
-    /// less than the interval. Where there are more, each process is cut to a number of threads that suits
-    /// all; of more processes than this, those that come last go without.
+    /// Of all processes of a sampling together: a sample takes some thirty microseconds, so that those of all
+    /// threads take less than the interval. Where there are more, each process is cut to a number of threads
+    /// that suits all; of more processes than this, those that come last go without.
     static constexpr std::size_t kMaximumThreads = 512;
-    /// Each takes a tenth of a second, by which it can hold up the service's end.
-    static constexpr std::size_t kMaximumWaiting = 4;
+    /// Captures that wait for the next sampling: a device has some ten sessions that play at a time. Those
+    /// beyond, or with payloads of more bytes in memory, are dropped and counted.
+    static constexpr std::size_t kMaximumWaiting = 256;
+    static constexpr std::size_t kMaximumWaitingBytes = 8U << 20U;
 
     /// What is referred to must outlive the service, except the queues. The client processes are asked for on
     /// any thread.
@@ -54,13 +61,27 @@ public:
     void captureStacks(StackCaptureRequest request) override;
 
 private:
-    void capture(const StackCaptureRequest& request, const std::vector<pid_t>& clients);
+    struct Waiting {
+        StackCaptureRequest request;
+        std::vector<pid_t> clients;
+    };
+
+    [[nodiscard]] bool add(Waiting&& waiting) TAMBLO_REQUIRES(mutex_);
+    [[nodiscard]] std::vector<Waiting> takeWaiting();
+    void captureWaiting();
 
     Clock& clock_;
+    WorkQueues& workQueues_;
+    StructuredLog& log_;
     const ClientProcesses clientProcesses_;
     const ProcessFiles files_;
     AppendOnlyFile file_;
-    LimitedQueue queue_;
+
+    Mutex mutex_;
+    std::vector<Waiting> waiting_ TAMBLO_GUARDED_BY(mutex_);
+    std::size_t waitingBytes_ TAMBLO_GUARDED_BY(mutex_) = 0; ///< of their payloads
+    std::uint64_t dropped_ TAMBLO_GUARDED_BY(mutex_) = 0;    ///< since none waited
+    std::unique_ptr<SerialQueue> queue_ TAMBLO_GUARDED_BY(mutex_);
 };
 
 } // namespace tamblo

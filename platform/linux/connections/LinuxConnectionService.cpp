@@ -28,6 +28,9 @@ namespace {
 constexpr int kActivatedSocket = 3;
 /// Waiting connections beyond this are turned away by the kernel.
 constexpr int kBacklog = 1024;
+/// Another start is done within milliseconds: who has the runtime directory locked for longer is not waited
+/// for.
+constexpr std::chrono::milliseconds kLockPatience{1000};
 /// How long accepting rests when the process has no descriptors left.
 constexpr std::chrono::milliseconds kAcceptPause{100};
 /// How many connections one wake-up accepts, so that those there are get their turn.
@@ -115,7 +118,11 @@ std::optional<std::string> LinuxConnectionService::bindSocket(const std::string&
                "): set RUNTIME_DIRECTORY to a shorter one";
     }
     // Two services that start at the same time must not both take a left-over socket for theirs to replace.
-    const FileDescriptor lock = lockDirectory(path.substr(0, path.rfind('/')));
+    const std::string directory = path.substr(0, path.rfind('/'));
+    const FileDescriptor lock = lockDirectory(directory, kLockPatience);
+    if (!lock.isOpen() && errno == EWOULDBLOCK) {
+        return "another program has " + directory + " locked: end it, or set RUNTIME_DIRECTORY";
+    }
 
     FileDescriptor socket(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0));
     if (::bind(socket.get(), address->get(), address->size()) != 0) {

@@ -3,7 +3,9 @@
 #include "base/Format.h"
 
 #include <array>
+#include <cmath>
 #include <cstdint>
+#include <limits>
 #include <memory>
 #include <optional>
 #include <string_view>
@@ -57,19 +59,10 @@ public:
         return std::move(found).value_or(std::string());
     }
     std::int64_t integer(std::string_view name) {
-        const Value& number = scalar(name);
-        if (number.kind() != Value::Kind::integer) {
-            fail(name, "is no signed 64-bit integer");
-        }
-        return number.integerValue();
+        return wholeNumber<std::int64_t>(name, "is no signed 64-bit integer");
     }
     std::uint64_t count(std::string_view name) {
-        const Value& number = scalar(name);
-        if (number.kind() != Value::Kind::unsignedInteger &&
-            (number.kind() != Value::Kind::integer || number.rawInteger() < 0)) {
-            fail(name, "is no unsigned 64-bit integer");
-        }
-        return number.unsignedValue();
+        return wholeNumber<std::uint64_t>(name, "is no unsigned 64-bit integer");
     }
     std::int64_t signedCount(std::string_view name) {
         const std::int64_t found = integer(name);
@@ -106,6 +99,36 @@ public:
     }
 
 private:
+    /// Also of a number with a fraction of zero, as it comes out of languages that have one kind of number.
+    template <typename Number> Number wholeNumber(std::string_view name, std::string_view otherwise) {
+        using Range = std::numeric_limits<Number>;
+        const Value& number = scalar(name);
+        switch (number.kind()) {
+        case Value::Kind::integer:
+            if (std::in_range<Number>(number.rawInteger())) {
+                return static_cast<Number>(number.rawInteger());
+            }
+            break;
+        case Value::Kind::unsignedInteger:
+            if (std::in_range<Number>(number.unsignedValue())) {
+                return static_cast<Number>(number.unsignedValue());
+            }
+            break;
+        case Value::Kind::doubleFloat: {
+            // The greatest number is no double, the one behind it is.
+            const double exact = number.doubleValue();
+            if (std::trunc(exact) == exact && exact >= static_cast<double>(Range::min()) &&
+                exact < std::ldexp(1.0, Range::digits)) {
+                return static_cast<Number>(exact);
+            }
+            break;
+        }
+        default:
+            break;
+        }
+        fail(name, otherwise);
+        return 0;
+    }
     const JsonItem* find(std::string_view name) const noexcept {
         return isWell() ? object_.find(name) : nullptr;
     }

@@ -11,10 +11,12 @@ namespace tamblo {
 
 namespace {
 
-/// Why a channel's gain cannot be told; null when it can.
+/// What of a channel's gain cannot be told; null when all can.
 using Trouble = const char*;
-constexpr Trouble kBackwards = "a counter has run backwards";
-constexpr Trouble kOverflow = "the value has moved by more than a 64-bit number can tell";
+constexpr Trouble kBackwards = "a counter has run backwards; the states or buckets with such are left out "
+                               "until they have risen from one "
+                               "sample to the next";
+constexpr Trouble kOverflow = "the value has moved by more than a 64-bit number can tell; it is left out";
 
 auto keyOf(const ChanlogChannelRef& channel) noexcept {
     return std::tie(channel->channelName, channel->subGroupName, channel->groupName, channel->driverName,
@@ -64,6 +66,7 @@ private:
 
 Trouble subtractStates(const ChanlogChannel& earlier, const ChanlogChannel& later, ChanlogChannel& gained) {
     Counterparts<ChanlogState> before(earlier.states);
+    Trouble trouble = nullptr;
     double residency = 0;
     gained.states.reserve(later.states.size());
     for (std::size_t i = 0; i < later.states.size(); ++i) {
@@ -73,7 +76,8 @@ Trouble subtractStates(const ChanlogChannel& earlier, const ChanlogChannel& late
             continue;
         }
         if (now.transitions < then->transitions || now.residency < then->residency) {
-            return kBackwards;
+            trouble = kBackwards;
+            continue;
         }
         gained.states.push_back({.name = now.name,
                                  .transitions = now.transitions - then->transitions,
@@ -83,11 +87,12 @@ Trouble subtractStates(const ChanlogChannel& earlier, const ChanlogChannel& late
     for (ChanlogState& state : gained.states) {
         state.dutyCycle = residency > 0 ? static_cast<double>(state.residency) / residency : 0;
     }
-    return nullptr;
+    return trouble;
 }
 
 Trouble subtractBuckets(const ChanlogChannel& earlier, const ChanlogChannel& later, ChanlogChannel& gained) {
     Counterparts<ChanlogBucket> before(earlier.buckets);
+    Trouble trouble = nullptr;
     gained.buckets.reserve(later.buckets.size());
     for (std::size_t i = 0; i < later.buckets.size(); ++i) {
         ChanlogBucket now = later.buckets[i];
@@ -95,15 +100,14 @@ Trouble subtractBuckets(const ChanlogChannel& earlier, const ChanlogChannel& lat
         if (then == nullptr) {
             continue;
         }
-        if (now.hits < then->hits) {
-            return kBackwards;
+        if (now.hits < then->hits) { // neither is negative
+            trouble = kBackwards;
+            continue;
         }
-        if (__builtin_sub_overflow(now.hits, then->hits, &now.hits)) {
-            return kOverflow;
-        }
+        now.hits -= then->hits;
         gained.buckets.push_back(now);
     }
-    return nullptr;
+    return trouble;
 }
 
 Trouble subtract(const ChanlogChannel& earlier, const ChanlogChannel& later, ChanlogChannel& gained) {
@@ -118,8 +122,9 @@ Trouble subtract(const ChanlogChannel& earlier, const ChanlogChannel& later, Cha
     if (__builtin_sub_overflow(later.value, earlier.value, &gained.value)) {
         return kOverflow;
     }
-    const Trouble trouble = subtractStates(earlier, later, gained);
-    return trouble != nullptr ? trouble : subtractBuckets(earlier, later, gained);
+    const Trouble ofStates = subtractStates(earlier, later, gained);
+    const Trouble ofBuckets = subtractBuckets(earlier, later, gained);
+    return ofStates != nullptr ? ofStates : ofBuckets;
 }
 
 std::string nameOf(const ChanlogChannel& channel) {
@@ -148,7 +153,7 @@ ChanlogChannels ChanlogDifference::between(const ChanlogChannels& earlier, const
         if (trouble != nullptr || !troubled_.empty()) {
             report(*now, trouble);
         }
-        if (trouble == nullptr) {
+        if (trouble != kOverflow) {
             channels->push_back(std::move(gained));
         }
     }
@@ -166,9 +171,7 @@ void ChanlogDifference::report(const ChanlogChannel& channel, const char* troubl
     }
     const auto [place, isNew] = troubled_.insert(std::move(name));
     if (isNew) {
-        log_.report(LogLevel::error, "zrrd",
-                    formatted("channel {}: {}; it is left out until it has risen from one sample to the next",
-                              *place, trouble));
+        log_.report(LogLevel::error, "zrrd", formatted("channel {}: {}", *place, trouble));
     }
 }
 

@@ -13,9 +13,10 @@ namespace tamblo {
 ///
 /// Values, transitions, residencies and hits subtract; a state's duty cycle is its share of the residency
 /// gained; minimum and maximum are the later sample's. Channels are the same by driver, group, subgroup, name
-/// and format, states by name, buckets by bounds; what only one sample has is left out. A counter that has
-/// run backwards or a value whose gain is no 64-bit number means that its channel is left out, with one error
-/// line until it can be told again; a simple value may fall. Not thread-safe.
+/// and format, states by name, buckets by bounds; what only one sample has is left out. So is a state or
+/// bucket one of whose counters has run backwards, and a channel whose value has moved by more than a 64-bit
+/// number can tell, with one error line for the channel until all of it can be told again; a simple value may
+/// fall. Not thread-safe.
 class ChanlogDifference {
 public:
     /// Channels whose trouble is remembered; beyond these all are forgotten and may be told anew.

@@ -4,6 +4,7 @@
 #include "base/Json.h"
 #include "os/SmallFile.h"
 
+#include <cerrno>
 #include <variant>
 
 #include <sys/stat.h>
@@ -52,8 +53,12 @@ std::optional<std::string> JsonFile::readText(StructuredLog& log) {
     SmallFile file = SmallFile::read(path_, maximumSize_);
     state_ = file.state;
     isCertain_ = file.isStateOld;
+    // What is too large, or no file, holds nothing; anything else has been kept from being read.
+    const bool isRubbish = file.error == EFBIG || file.error == EISDIR || file.error == EINVAL;
+    isUnreadable_ = file.error != 0 && !file.isMissing() && !isRubbish;
     if (file.error != 0) {
-        report(log, file.isMissing() ? "" : file.reason());
+        report(log, file.isMissing() ? "" : file.reason(),
+               isUnreadable_ ? "what was known of it stays until it can be read" : kNotUsed);
         return std::nullopt;
     }
     return std::move(file.text);
@@ -68,9 +73,9 @@ void JsonFile::report(StructuredLog& log, const JsonError& error) {
     report(log, formatted("line {}, column {}: {}", error.line, error.column, error.message));
 }
 
-void JsonFile::report(StructuredLog& log, std::string_view fault) {
+void JsonFile::report(StructuredLog& log, std::string_view fault, std::string_view consequence) {
     if (told_.isNews(fault, state_)) {
-        log.report(LogLevel::error, "zrrs", formatted("{}: {}; nothing of it is used", path_, fault));
+        log.report(LogLevel::error, "zrrs", formatted("{}: {}; {}", path_, fault, consequence));
     }
 }
 

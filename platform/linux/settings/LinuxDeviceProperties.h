@@ -10,13 +10,14 @@
 #include <optional>
 #include <string>
 #include <string_view>
+#include <utility>
 
 namespace tamblo {
 
 /// Device properties from a file that holds one JSON object.
 ///
 /// The file is looked at whenever a property is asked for, which is rarely, and read again when it may have
-/// changed. Any thread.
+/// changed. What was known of one that cannot be read stays. Any thread.
 class LinuxDeviceProperties final : public DeviceProperties {
 public:
     /// The log must outlive the properties.
@@ -25,7 +26,10 @@ public:
     [[nodiscard]] std::optional<bool> booleanProperty(std::string_view name) const override {
         const MutexLock lock(mutex_);
         if (!file_.isCurrent()) {
-            properties_ = file_.read(log_);
+            auto properties = file_.read(log_);
+            if (!file_.isUnreadable()) {
+                properties_ = std::move(properties);
+            }
         }
         const Value* const value = properties_ ? properties_->find(name) : nullptr;
         if (value == nullptr) {

@@ -13,6 +13,8 @@
 #include <system_error>
 #include <utility>
 
+#include <sys/stat.h>
+
 namespace tamblo {
 
 namespace {
@@ -66,7 +68,7 @@ struct LinuxNamedNotifications::Registered {
 };
 
 LinuxNamedNotifications::LinuxNamedNotifications(std::string directory, StructuredLog& log)
-    : log_(log), watcher_(std::move(directory)) {
+    : log_(log), watcher_(std::move(directory), DirectoryWatcher::Watched::writes) {
     reportUnwatched();
 }
 
@@ -156,12 +158,18 @@ void LinuxNamedNotifications::post(const std::shared_ptr<Registered>& registered
     registered->queue.post(whileAlive(std::weak_ptr(registered), call), Pace::mayBlock);
 }
 
+/// In a time that nothing is known of.
+bool LinuxNamedNotifications::mayHaveBeenPosted(const std::string& name) const noexcept {
+    struct stat status {};
+    return ::lstat(formatted("{}/{}", watcher_.directory(), name).c_str(), &status) == 0;
+}
+
 void LinuxNamedNotifications::deliverPosts(const std::function<void()>& beforeDelivery) {
     watcher_.read([this, &beforeDelivery](std::optional<std::string_view> name) {
         beforeDelivery();
         const MutexLock lock(mutex_);
         for (const auto& [token, registered] : registered_) {
-            if (!name || registered->name == *name) {
+            if (name ? registered->name == *name : mayHaveBeenPosted(registered->name)) {
                 post(registered);
             }
         }

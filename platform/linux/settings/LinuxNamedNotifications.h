@@ -15,12 +15,14 @@
 namespace tamblo {
 
 /// Named notifications as files: `<directory>/<name>` holds the name's state word in decimal, and each
-/// finished write of it is a post. Removing the file is a post too, after which the state cannot be read.
+/// finished write of it (a close after writing, or another file renamed over it) is a post. Removing the file
+/// or renaming it away is none; the state then cannot be read.
 ///
 /// The kernel tells of the writes: the event loop calls `deliverPosts` when the descriptor is readable. Each
 /// registration has at most one call waiting on its queue, however many posts come meanwhile: a call reads
 /// the state when it runs, so that the last one is always seen. A post just before a registration may be told
-/// to it. When the directory comes or goes, any word may have changed, and every handler is called.
+/// to it. When the directory has come back, or more was posted than the kernel could remember, every name
+/// that has a file may have been posted, and counts as such.
 ///
 /// Statuses are `errno` values. Any thread may register, ask and cancel; no handler is called once this
 /// object is gone.
@@ -60,6 +62,7 @@ private:
     };
 
     static void post(const std::shared_ptr<Registered>& registered);
+    [[nodiscard]] bool mayHaveBeenPosted(const std::string& name) const noexcept;
     void reportUnwatched();
     [[nodiscard]] bool isNews(ToldOnce Told::*of, std::string_view name, std::string_view fault);
 

@@ -10,11 +10,13 @@ namespace {
 
 /// An edit takes milliseconds: who has the lock for longer is not waited for.
 constexpr std::chrono::milliseconds kLockPatience{1000};
+/// How long a file that cannot be read is left alone.
+constexpr std::chrono::seconds kRetryInterval{1};
 
 } // namespace
 
-LinuxPreferences::LinuxPreferences(std::string directory, StructuredLog& log)
-    : log_(log), watcher_(std::move(directory)) {
+LinuxPreferences::LinuxPreferences(std::string directory, StructuredLog& log, SteadyNow now)
+    : log_(log), now_(std::move(now)), watcher_(std::move(directory)) {
     reportUnwatched();
 }
 
@@ -54,11 +56,39 @@ std::optional<Value> LinuxPreferences::copyPreferenceValue(std::string_view key,
         return *value;
     }
     if (!entry->isCurrent) {
-        entry->values = entry->file.read(log_);
-        entry->isCurrent = isWatched_.load(std::memory_order_relaxed);
+        read(*entry);
+    } else if (entry->file.isUnreadable()) {
+        readAgain();
     }
     const Value* value = entry->values ? entry->values->find(key) : nullptr;
     return value != nullptr ? std::optional<Value>(*value) : std::nullopt;
+}
+
+void LinuxPreferences::read(Domain& domain) const {
+    auto values = domain.file.read(log_);
+    if (domain.file.isUnreadable()) {
+        isAnyUnreadable_.store(true, std::memory_order_relaxed);
+        triedAt_ = now_();
+        domain.isCurrent = true; // as far as can be known
+        return;
+    }
+    domain.values = std::move(values);
+    domain.isCurrent = isWatched_.load(std::memory_order_relaxed);
+}
+
+void LinuxPreferences::readAgain() const {
+    if (now_() - triedAt_ < kRetryInterval) {
+        return;
+    }
+    bool isAnyLeft = false;
+    for (auto& [name, domain] : domains_) {
+        if (domain.file.isUnreadable()) {
+            read(domain);
+            isAnyLeft = isAnyLeft || domain.file.isUnreadable();
+            generation_.fetch_add(domain.file.isUnreadable() ? 0 : 1, std::memory_order_release);
+        }
+    }
+    isAnyUnreadable_.store(isAnyLeft, std::memory_order_relaxed);
 }
 
 void LinuxPreferences::setPreferenceValue(std::string_view key, std::string_view domain, const Value& value) {

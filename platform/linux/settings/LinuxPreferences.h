@@ -9,7 +9,9 @@
 #include "platform/linux/settings/JsonFile.h"
 
 #include <atomic>
+#include <chrono>
 #include <cstdint>
+#include <functional>
 #include <map>
 #include <optional>
 #include <string>
@@ -24,14 +26,21 @@ namespace tamblo {
 /// of the same wake-up, so that a preference is in force for every message sent after it was written. Any
 /// thread may ask.
 ///
+/// A file that is there and cannot be read (no descriptor is left, the disk fails) leaves its domain as it
+/// was, absent if it was never read. It is tried again when somebody next asks for a value or the generation,
+/// but at most once a second.
+///
 /// A value that is set is in force at once, and is stored when setting it returns: that waits for other
 /// programs that edit the file, within bounds, and for the disk, but nobody who asks waits along. What could
 /// not be stored is one error line for as long as that lasts, and is read back by this process all the same,
 /// until the file changes.
 class LinuxPreferences final : public Preferences {
 public:
+    using SteadyNow = std::function<std::chrono::steady_clock::time_point()>;
+
     /// The log must outlive the preferences.
-    LinuxPreferences(std::string directory, StructuredLog& log);
+    LinuxPreferences(std::string directory, StructuredLog& log,
+                     SteadyNow now = std::chrono::steady_clock::now);
 
     [[nodiscard]] std::optional<Value> copyPreferenceValue(std::string_view key,
                                                            std::string_view domain) const override;
@@ -46,7 +55,11 @@ public:
     void readChanges();
     /// Another number after every change of a preference: what was worked out from preferences holds for as
     /// long as this stays the same. Never 0. Read it before the preferences themselves.
-    [[nodiscard]] std::uint64_t generation() const noexcept {
+    [[nodiscard]] std::uint64_t generation() const {
+        if (isAnyUnreadable_.load(std::memory_order_relaxed)) {
+            const MutexLock lock(mutex_);
+            readAgain();
+        }
         return generation_.load(std::memory_order_acquire);
     }
 
@@ -67,17 +80,23 @@ private:
     };
 
     void reportUnwatched();
+    void read(Domain& domain) const TAMBLO_REQUIRES(mutex_);
+    /// What could not be read, if that was a second ago.
+    void readAgain() const TAMBLO_REQUIRES(mutex_);
     /// Null for a name that no domain can have.
     [[nodiscard]] Domain* domainNamed(std::string_view name) const TAMBLO_REQUIRES(mutex_);
 
     StructuredLog& log_;
-    std::atomic<std::uint64_t> generation_{1};
+    const SteadyNow now_;
+    mutable std::atomic<std::uint64_t> generation_{1};
+    mutable std::atomic<bool> isAnyUnreadable_{false};
     std::atomic<bool> isWatched_{false};
     /// Used by `readChanges` alone.
     DirectoryWatcher watcher_;
     ToldOnce unwatched_;
     mutable Mutex mutex_;
     mutable std::map<std::string, Domain, std::less<>> domains_ TAMBLO_GUARDED_BY(mutex_);
+    mutable std::chrono::steady_clock::time_point triedAt_ TAMBLO_GUARDED_BY(mutex_);
 };
 
 } // namespace tamblo

@@ -4,6 +4,7 @@
 
 #include <algorithm>
 #include <array>
+#include <bit>
 #include <cerrno>
 #include <memory>
 #include <system_error>
@@ -33,23 +34,45 @@ std::size_t wholeLines(std::string_view bytes, std::size_t length) noexcept {
 
 } // namespace
 
-SinkFiles::SinkFiles(std::string directory, StructuredLog& log, FileOperations& operations)
-    : directory_(std::move(directory)), log_(log), operations_(operations) {}
+SinkFiles::SinkFiles(std::string directory, StructuredLog& log, FileOperations& operations, FileModes modes)
+    : directory_(std::move(directory), {}, modes.directory, operations),
+      log_(log),
+      operations_(operations),
+      modes_(modes) {}
 
 void SinkFiles::flush() {
     const MutexLock lock(mutex_);
-    for (AppendOnlyFile* file : files_) {
+    for (AppendOnlyFile* file : flushed_) {
         file->flush();
     }
 }
 
-void SinkFiles::add(AppendOnlyFile& file) {
-    const MutexLock lock(mutex_);
+std::vector<std::string> SinkFiles::out() const {
+    std::vector<std::string> names;
+    const MutexLock lock(listMutex_);
+    for (const AppendOnlyFile* file : files_) {
+        if (file->isOut()) {
+            names.push_back(file->name());
+        }
+    }
+    return names;
+}
+
+void SinkFiles::add(AppendOnlyFile& file, bool isFlushedHere) {
+    if (isFlushedHere) {
+        const MutexLock lock(mutex_);
+        flushed_.push_back(&file);
+    }
+    const MutexLock lock(listMutex_);
     files_.push_back(&file);
 }
 
 void SinkFiles::remove(AppendOnlyFile& file) {
-    const MutexLock lock(mutex_);
+    {
+        const MutexLock lock(mutex_);
+        std::erase(flushed_, &file);
+    }
+    const MutexLock lock(listMutex_);
     std::erase(files_, &file);
 }
 
@@ -57,14 +80,13 @@ AppendOnlyFile::AppendOnlyFile(SinkFiles& sinks, std::string_view name, std::str
                                Flushed flushed, SinkFileLimits limits)
     : sinks_(sinks),
       operations_(sinks.operations_),
-      path_(formatted("{}/{}", sinks.directory_, name)),
+      name_(name),
+      path_(formatted("{}/{}", sinks.directory_.path(), name)),
       categoryCode_(categoryCode),
       limits_(limits) {
     // What fails here fails again with the first line, and is told then.
-    static_cast<void>(openFile(0));
-    if (flushed == Flushed::beforeReplies) {
-        sinks_.add(*this);
-    }
+    static_cast<void>(openFile(IfMissing::fail));
+    sinks_.add(*this, flushed == Flushed::beforeReplies);
 }
 
 AppendOnlyFile::~AppendOnlyFile() {
@@ -94,18 +116,35 @@ void AppendOnlyFile::writeOut() {
             endOutage("it can be written again");
         }
     } else {
-        if (!std::exchange(isOut_, true)) {
-            sinks_.log_.report(
-                LogLevel::error, categoryCode_,
-                formatted("{}: {}; its records are lost until it can be written again", path_, fault_));
+        if (!wasOut) {
+            beginOutage();
         }
-        lostLines_ += countLines(lines);
+        const std::uint64_t lost = countLines(lines);
+        lostLines_ += lost;
+        sinks_.lostLines_.fetch_add(lost, std::memory_order_relaxed);
     }
     if (waiting_.capacity() > kKeptCapacity) {
         waiting_.reset();
     }
     waiting_.clear();
     isWaiting_.store(false, std::memory_order_release);
+}
+
+void AppendOnlyFile::beginOutage() {
+    isOut_ = true;
+    sinks_.log_.report(
+        LogLevel::error, categoryCode_,
+        formatted("{}: {}; its records are lost until it can be written again", path_, fault_));
+}
+
+/// A client can cause such lines: the log does not grow with their number.
+void AppendOnlyFile::countTooLong() {
+    sinks_.lostLines_.fetch_add(1, std::memory_order_relaxed);
+    if (std::has_single_bit(++tooLongLines_)) {
+        sinks_.log_.report(LogLevel::error, categoryCode_,
+                           formatted("{}: records of more than {} bytes are left out, {} until now", path_,
+                                     longestLine(), tooLongLines_));
+    }
 }
 
 void AppendOnlyFile::endOutage(std::string_view ending) {
@@ -121,7 +160,7 @@ bool AppendOnlyFile::writeLines(std::string_view& lines) {
         closeFile();
     }
     while (!lines.empty()) {
-        if (descriptor_ < 0 && !openFile(O_CREAT)) {
+        if (descriptor_ < 0 && !openFile(IfMissing::create)) {
             return false;
         }
         const std::size_t length = linesThatFit(lines);
@@ -138,14 +177,13 @@ bool AppendOnlyFile::writeLines(std::string_view& lines) {
     return true;
 }
 
-/// The length of the lines that the file still takes; at least one line when it is empty.
+/// The length of the lines that the file still takes: no line is longer than an empty one has room for.
 std::size_t AppendOnlyFile::linesThatFit(std::string_view lines) const noexcept {
     const std::uint64_t room = limits_.fileSize - std::min(size_, limits_.fileSize);
     if (lines.size() <= room) {
         return lines.size();
     }
-    const std::size_t fitting = wholeLines(lines, static_cast<std::size_t>(room));
-    return fitting == 0 && size_ == 0 ? lines.find('\n') + 1 : fitting;
+    return wholeLines(lines, static_cast<std::size_t>(room));
 }
 
 bool AppendOnlyFile::writeFully(std::string_view& lines, std::size_t length) {
@@ -185,7 +223,8 @@ bool AppendOnlyFile::isStillInPlace() noexcept {
     }
     pathCheckedAt_ = now;
     struct stat status {};
-    if (operations_.status(path_.c_str(), status) != 0 || status.st_ino != inode_ ||
+    if (sinks_.directory_.open() != directory_ ||
+        operations_.status(directory_->get(), name_.c_str(), status) != 0 || status.st_ino != inode_ ||
         status.st_dev != device_) {
         return false;
     }
@@ -193,9 +232,18 @@ bool AppendOnlyFile::isStillInPlace() noexcept {
     return true;
 }
 
-bool AppendOnlyFile::openFile(int creationFlag) {
-    const int flags = O_RDWR | O_APPEND | O_CLOEXEC | O_NOCTTY | O_NONBLOCK | creationFlag;
-    const int descriptor = operations_.open(path_.c_str(), flags, S_IRUSR | S_IWUSR);
+bool AppendOnlyFile::openFile(IfMissing ifMissing) {
+    constexpr int kFlags = O_RDWR | O_APPEND | O_CLOEXEC | O_NOCTTY | O_NONBLOCK | O_NOFOLLOW;
+    directory_ = sinks_.directory_.open();
+    if (directory_ == nullptr) {
+        return failed("open its directory");
+    }
+    int descriptor = operations_.open(directory_->get(), name_.c_str(), kFlags, 0);
+    if (descriptor < 0 && errno == ENOENT && ifMissing == IfMissing::create) {
+        const mode_t mode = sinks_.modes_.file;
+        descriptor = operations_.open(directory_->get(), name_.c_str(), kFlags | O_CREAT | O_EXCL, mode);
+        static_cast<void>(::fchmod(descriptor, mode)); // whatever the process's mask is
+    }
     if (descriptor < 0) {
         return failed("open");
     }
@@ -263,15 +311,16 @@ bool AppendOnlyFile::findEndOfLastLine(int descriptor, std::uint64_t& end) {
 /// Moves the file out of the way.
 bool AppendOnlyFile::rotate() {
     const auto numbered = [this](int number) {
-        return number == 0 ? path_ : formatted("{}.{}", path_, number);
+        return number == 0 ? name_ : formatted("{}.{}", name_, number);
     };
+    const int directory = directory_->get();
     int free = 1;
     struct stat status {};
-    while (free < kKeptFiles && operations_.status(numbered(free).c_str(), status) == 0) {
+    while (free < kKeptFiles && operations_.status(directory, numbered(free).c_str(), status) == 0) {
         ++free;
     }
     for (int number = free; number > 0; --number) {
-        if (operations_.rename(numbered(number - 1).c_str(), numbered(number).c_str()) != 0) {
+        if (operations_.rename(directory, numbered(number - 1).c_str(), numbered(number).c_str()) != 0) {
             const bool result = failed("rename");
             closeFile();
             return result;

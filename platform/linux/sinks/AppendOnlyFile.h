@@ -4,9 +4,12 @@
 #include "base/Mutex.h"
 #include "base/TextBuffer.h"
 #include "os/FileOperations.h"
+#include "os/HeldDirectory.h"
 #include "platform/Clock.h"
 #include "platform/StructuredLog.h"
+#include "platform/linux/sinks/FileModes.h"
 
+#include <algorithm>
 #include <atomic>
 #include <chrono>
 #include <cstddef>
@@ -26,29 +29,43 @@ class SinkFiles {
 public:
     /// Log and operations must outlive this object.
     SinkFiles(std::string directory, StructuredLog& log,
-              FileOperations& operations = FileOperations::system());
+              FileOperations& operations = FileOperations::system(), FileModes modes = {});
 
     /// Writes out what waits in all files that are written before replies. It costs a look at each file where
     /// nothing waits; returns when what was appended before the call, on any thread, is in the kernel's
     /// hands, or lost and counted.
     void flush();
 
+    /// The names of the files that cannot be written now, in no order. Waits for nobody who writes.
+    [[nodiscard]] std::vector<std::string> out() const;
+    /// How many lines all files have lost since the start, those that were too long among them.
+    [[nodiscard]] std::uint64_t lostLines() const noexcept {
+        return lostLines_.load(std::memory_order_relaxed);
+    }
+
 private:
     friend class AppendOnlyFile;
-    void add(AppendOnlyFile& file);
+    void add(AppendOnlyFile& file, bool isFlushedHere);
     void remove(AppendOnlyFile& file);
 
-    const std::string directory_;
+    HeldDirectory directory_;
     StructuredLog& log_;
     FileOperations& operations_;
+    const FileModes modes_;
 
-    Mutex mutex_;
-    std::vector<AppendOnlyFile*> files_ TAMBLO_GUARDED_BY(mutex_);
+    Mutex mutex_; ///< held while files are written
+    std::vector<AppendOnlyFile*> flushed_ TAMBLO_GUARDED_BY(mutex_);
+    mutable Mutex listMutex_;
+    std::vector<AppendOnlyFile*> files_ TAMBLO_GUARDED_BY(listMutex_);
+    std::atomic<std::uint64_t> lostLines_{0};
 };
 
 struct SinkFileLimits {
     /// A line that would make the file larger begins a new file.
     std::uint64_t fileSize = 64U << 20U;
+    /// A longer line is lost: bounds what one line takes in memory, as text. Two and a half times what comes
+    /// of any one request; only what is derived from all messages of a very long session can be longer.
+    std::size_t line = 16U << 20U;
     /// Waiting bytes that are written without being asked for.
     std::size_t waiting = 256U << 10U;
 };
@@ -67,16 +84,21 @@ struct SinkFileLimits {
 ///
 /// Whole lines, each once, whatever fails. A full disk, or a crash, may tear the last line: its rest is cut
 /// off before anything follows it, at once where that works, else when the file is opened again. What a write
-/// has not brought into the file is lost and counted, as keeping it would take memory without end.
+/// has not brought into the file is lost and counted, as keeping it would take memory without end. So is a
+/// line that is longer than lines may be; the log tells of the first, and then each time that there are twice
+/// as many.
 ///
 /// An outage is two lines in the log, one when it begins and one, with the count, when it ends, lest a full
-/// disk be filled with words about it. Every flush tries again, from opening the file on.
+/// disk be filled with words about it. Every flush tries again, from opening the file on. One that lasts
+/// until the file's owner goes ends then, with its count.
 ///
 /// Rotation. A file that is full becomes NAME.1, the earlier ones move up, NAME.4 goes. They move only as far
 /// as the first free number: a rotation that fails half-way and is tried again pushes none of them out.
 ///
-/// The path is looked up every tenth of a second, since a look costs half of what a small write does: a file
-/// that others remove or rename is begun anew, and what was written in between went with it.
+/// The file is made in the directory that is held open (`HeldDirectory`), and is never reached through a
+/// symbolic link. Directory and file are looked up every tenth of a second, since a look costs half of what a
+/// small write does: a file that others remove or rename is begun anew, and what was written in between went
+/// with it.
 class AppendOnlyFile {
 public:
     enum class Flushed { beforeReplies, byOwner };
@@ -104,15 +126,32 @@ public:
             waiting_.truncate(start);
             throw;
         }
+        if (waiting_.size() - start > longestLine()) {
+            waiting_.truncate(start);
+            countTooLong();
+            return;
+        }
         isWaiting_.store(true, std::memory_order_release);
         if (waiting_.size() >= limits_.waiting) {
             writeOut();
         }
     }
 
+    /// Bytes of a line, with its line end.
+    [[nodiscard]] std::size_t longestLine() const noexcept {
+        return static_cast<std::size_t>(std::min<std::uint64_t>(limits_.line, limits_.fileSize));
+    }
+    /// In place of appending a line of which it is known that it would be too long.
+    void loseTooLong() {
+        const MutexLock lock(mutex_);
+        countTooLong();
+    }
+    [[nodiscard]] bool isOut() const noexcept { return isOut_.load(std::memory_order_relaxed); }
+
     /// Writes out what waits: afterwards it is in the kernel's hands, or lost and counted.
     void flush();
 
+    [[nodiscard]] const std::string& name() const noexcept { return name_; }
     [[nodiscard]] const std::string& path() const noexcept { return path_; }
 
 private:
@@ -122,17 +161,21 @@ private:
     [[nodiscard]] bool writeFully(std::string_view& lines, std::size_t length) TAMBLO_REQUIRES(mutex_);
     void cutTornLine(std::size_t tornBytes) noexcept TAMBLO_REQUIRES(mutex_);
     [[nodiscard]] bool isStillInPlace() noexcept TAMBLO_REQUIRES(mutex_);
-    [[nodiscard]] bool openFile(int creationFlag) TAMBLO_REQUIRES(mutex_);
+    enum class IfMissing { fail, create };
+    [[nodiscard]] bool openFile(IfMissing ifMissing) TAMBLO_REQUIRES(mutex_);
     [[nodiscard]] bool resumeFile(int descriptor) TAMBLO_REQUIRES(mutex_);
     [[nodiscard]] bool findEndOfLastLine(int descriptor, std::uint64_t& end);
     [[nodiscard]] bool rotate() TAMBLO_REQUIRES(mutex_);
     [[nodiscard]] std::size_t linesThatFit(std::string_view lines) const noexcept TAMBLO_REQUIRES(mutex_);
     void closeFile() noexcept TAMBLO_REQUIRES(mutex_);
     [[nodiscard]] bool failed(std::string_view action) TAMBLO_REQUIRES(mutex_);
+    void beginOutage() TAMBLO_REQUIRES(mutex_);
     void endOutage(std::string_view ending) TAMBLO_REQUIRES(mutex_);
+    void countTooLong() TAMBLO_REQUIRES(mutex_);
 
     SinkFiles& sinks_;
     FileOperations& operations_;
+    const std::string name_;
     const std::string path_;
     const std::string_view categoryCode_;
     const SinkFileLimits limits_;
@@ -141,14 +184,16 @@ private:
     std::atomic<bool> isWaiting_{false};
     Mutex mutex_;
     TextBuffer waiting_ TAMBLO_GUARDED_BY(mutex_);
+    HeldDirectory::Ref directory_ TAMBLO_GUARDED_BY(mutex_); ///< that of the open file
     int descriptor_ TAMBLO_GUARDED_BY(mutex_) = -1;
     std::uint64_t size_ TAMBLO_GUARDED_BY(mutex_) = 0;
     dev_t device_ TAMBLO_GUARDED_BY(mutex_) = 0;
     ino_t inode_ TAMBLO_GUARDED_BY(mutex_) = 0;
     /// On the coarse clock.
     std::chrono::nanoseconds pathCheckedAt_ TAMBLO_GUARDED_BY(mutex_){0};
-    bool isOut_ TAMBLO_GUARDED_BY(mutex_) = false;
-    std::uint64_t lostLines_ TAMBLO_GUARDED_BY(mutex_) = 0;
+    std::atomic<bool> isOut_{false};                        ///< written with the lock held
+    std::uint64_t lostLines_ TAMBLO_GUARDED_BY(mutex_) = 0; ///< of the outage
+    std::uint64_t tooLongLines_ TAMBLO_GUARDED_BY(mutex_) = 0;
     std::string fault_ TAMBLO_GUARDED_BY(mutex_);
 };
 

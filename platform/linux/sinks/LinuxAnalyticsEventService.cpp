@@ -5,6 +5,7 @@
 #include <algorithm>
 #include <cstring>
 #include <functional>
+#include <iterator>
 #include <utility>
 
 namespace tamblo {
@@ -29,10 +30,13 @@ LinuxAnalyticsEventService::LinuxAnalyticsEventService(SinkFiles& sinks, const C
                    .key = "events_in_use",
                    .categoryCode = "zrrs",
                    .whenAbsent = {"*"},
-                   .whenNoArray = {"*"},
-                   .noArrayMeans = "all analytics events are in use"},
+                   .absentMeans = "all analytics events are in use"},
                   preferences, log),
-      file_(sinks, "analytics-events.jsonl", "zrrs") {}
+      file_(sinks, "analytics-events.jsonl", "zrrs") {
+    // While there are descriptors for it: what the device forbids stays forbidden when there are none.
+    const MutexLock lock(mutex_);
+    readNamesInUse(preferences.generation());
+}
 
 bool LinuxAnalyticsEventService::isEventInUse(std::string_view eventName) {
     const std::uint64_t generation = preferences_.generation();
@@ -43,9 +47,10 @@ bool LinuxAnalyticsEventService::isEventInUse(std::string_view eventName) {
     if (generation > generation_) {
         readNamesInUse(generation);
     }
+    // No prefix begins with another: the one that the name may begin with is the last that is not behind it.
+    const auto behind = std::upper_bound(prefixes_.begin(), prefixes_.end(), eventName, std::less<>());
     return std::binary_search(names_.begin(), names_.end(), eventName, std::less<>()) ||
-           std::any_of(prefixes_.begin(), prefixes_.end(),
-                       [eventName](const std::string& prefix) { return eventName.starts_with(prefix); });
+           (behind != prefixes_.begin() && eventName.starts_with(*std::prev(behind)));
 }
 
 void LinuxAnalyticsEventService::readNamesInUse(std::uint64_t generation) {
@@ -61,7 +66,12 @@ void LinuxAnalyticsEventService::readNamesInUse(std::uint64_t generation) {
         }
     }
     std::sort(names_.begin(), names_.end());
-    if (std::find(prefixes_.begin(), prefixes_.end(), "") != prefixes_.end()) {
+    std::sort(prefixes_.begin(), prefixes_.end());
+    prefixes_.erase(
+        std::unique(prefixes_.begin(), prefixes_.end(),
+                    [](const std::string& kept, const std::string& next) { return next.starts_with(kept); }),
+        prefixes_.end());
+    if (!prefixes_.empty() && prefixes_.front().empty()) {
         allInUseIn_.store(generation, std::memory_order_relaxed);
     }
 }

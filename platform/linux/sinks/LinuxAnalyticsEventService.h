@@ -33,9 +33,7 @@ public:
                                StructuredLog& log);
 
     [[nodiscard]] bool isEventInUse(std::string_view eventName) override;
-    [[nodiscard]] std::uint64_t inUseGeneration() const noexcept override {
-        return preferences_.generation();
-    }
+    [[nodiscard]] std::uint64_t inUseGeneration() const override { return preferences_.generation(); }
     void sendEventLazy(std::string_view eventName, const std::function<Dictionary()>& payload) override;
 
 private:
@@ -59,8 +57,8 @@ private:
     Mutex mutex_;
     NamesPreference preference_ TAMBLO_GUARDED_BY(mutex_);
     std::uint64_t generation_ TAMBLO_GUARDED_BY(mutex_) = 0;
-    std::vector<std::string> names_ TAMBLO_GUARDED_BY(mutex_); ///< sorted
-    std::vector<std::string> prefixes_ TAMBLO_GUARDED_BY(mutex_);
+    std::vector<std::string> names_ TAMBLO_GUARDED_BY(mutex_);    ///< sorted
+    std::vector<std::string> prefixes_ TAMBLO_GUARDED_BY(mutex_); ///< sorted, none of another
 
     LastLine lastLine_; ///< guarded by the file's lock: touched only while a line is appended
     AppendOnlyFile file_;

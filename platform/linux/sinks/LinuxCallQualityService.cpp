@@ -2,6 +2,7 @@
 
 #include "base/Format.h"
 #include "os/RandomNumber.h"
+#include "platform/linux/sinks/PayloadSize.h"
 
 #include <utility>
 
@@ -29,9 +30,11 @@ LinuxCallQualityService::LinuxCallQualityService(SinkFiles& sinks, const Clock& 
                  .key = "backends",
                  .categoryCode = "zrri",
                  .whenAbsent = {"spool"},
-                 .whenNoArray = {},
-                 .noArrayMeans = "no back end is found"},
-                preferences, log) {}
+                 .absentMeans = "\"spool\" is the only back end"},
+                preferences, log) {
+    // Before there may be no descriptor for it; what the queue is answered later is what was read last.
+    (void)backends_.read();
+}
 
 std::optional<std::string> LinuxCallQualityService::NewHierarchyToken(std::string_view parent) {
     return formatted("{}{}{}.t{}", parent, parent.empty() ? "" : "/", processName_, ++lastToken_);
@@ -67,8 +70,12 @@ std::optional<std::string> LinuxCallQualityService::SendLinkmeterMessage(const S
                                                                          std::uint16_t category,
                                                                          std::uint16_t type,
                                                                          const Dictionary& payload) {
-    // A file that cannot be written is told of by itself, once.
-    if (session != nullptr) {
+    // A file that cannot be written is told of by itself, once. The message at a session's end has the values
+    // of all others: one that is too long is not made into a text first, which would take as much memory
+    // again.
+    if (session != nullptr && payloadSize(payload) > file_.longestLine()) {
+        file_.loseTooLong();
+    } else if (session != nullptr) {
         file_.append([&](TextBuffer& line) {
             SinkLine(line, clock_.now())
                 .text("op", "message")

@@ -20,9 +20,8 @@ public:
         std::string_view domain;
         std::string_view key;
         std::string_view categoryCode;
-        std::vector<std::string> whenAbsent;
-        std::vector<std::string> whenNoArray;
-        std::string_view noArrayMeans; ///< in the log: "no back end is found"
+        std::vector<std::string> whenAbsent; ///< also in place of a value of another kind
+        std::string_view absentMeans;        ///< in the log: "all analytics events are in use"
     };
 
     /// The setting's texts must be constants; preferences and log must outlive this object.
@@ -36,7 +35,7 @@ public:
             reported_.reset();
             return setting_.whenAbsent;
         }
-        std::vector<std::string> names = value->isArray() ? std::vector<std::string>() : setting_.whenNoArray;
+        std::vector<std::string> names = value->isArray() ? std::vector<std::string>() : setting_.whenAbsent;
         bool isMalformed = !value->isArray();
         for (const Value& element : value->arrayValue()) {
             if (element.stringValue().empty()) {
@@ -49,7 +48,7 @@ public:
             log_.report(LogLevel::error, setting_.categoryCode,
                         formatted("{}: {} {}", preferences_.path(setting_.domain), setting_.key,
                                   value->isArray() ? "holds what is no name; that is ignored"
-                                                   : formatted("is no array; {}", setting_.noArrayMeans)));
+                                                   : formatted("is no array; {}", setting_.absentMeans)));
         }
         reported_ = isMalformed ? std::move(value) : std::nullopt;
         return names;

@@ -1,0 +1,255 @@
+#include "platform/linux/sinks/ReportDirectory.h"
+
+#include "base/Format.h"
+#include "platform/Limits.h"
+
+#include <algorithm>
+#include <cerrno>
+#include <system_error>
+#include <tuple>
+#include <utility>
+
+#include <fcntl.h>
+#include <sys/stat.h>
+
+namespace tamblo {
+
+namespace {
+
+/// How many entries of a directory that is not known yet are looked at with each report.
+constexpr std::size_t kEntriesAtATime = 512;
+/// How old what is known of the reports may be when some have to go: others may have removed some meanwhile.
+constexpr std::chrono::seconds kKnowledgeAge{1};
+
+std::string textOf(int error) {
+    return std::generic_category().message(error);
+}
+
+WallTime timeOf(const timespec& time) noexcept {
+    return WallTime(std::chrono::duration_cast<WallTime::duration>(std::chrono::seconds(time.tv_sec) +
+                                                                   std::chrono::nanoseconds(time.tv_nsec)));
+}
+
+/// Whether a name begins with a time and a reporter's number, as
+/// "20260301-120000+0100-7-music-telephony.json".
+bool isReport(std::string_view name) noexcept {
+    constexpr std::string_view kTime = "00000000-000000+0000-";
+    const auto isDigit = [](char character) { return character >= '0' && character <= '9'; };
+    const auto matches = [&](char character, char pattern) {
+        return pattern == '0' ? isDigit(character)
+                              : character == pattern || (pattern == '+' && character == '-');
+    };
+    if (!name.ends_with(".json") || !std::ranges::equal(name.substr(0, kTime.size()), kTime, matches)) {
+        return false;
+    }
+    name.remove_prefix(kTime.size());
+    name.remove_prefix(name.starts_with('-') ? 1 : 0);
+    const auto end = std::ranges::find_if_not(name, isDigit);
+    return end != name.begin() && end != name.end() && *end == '-';
+}
+
+} // namespace
+
+class ReportDirectory::File final : public ReportFile {
+public:
+    File(ReportDirectory& owner, std::string name, int descriptor)
+        : owner_(owner), name_(std::move(name)), descriptor_(descriptor) {}
+    ~File() override {
+        if (descriptor_ >= 0) {
+            (void)close();
+        }
+    }
+    File(const File&) = delete;
+    File& operator=(const File&) = delete;
+
+    std::optional<std::string> write(std::string_view text) override {
+        if (text.size() > owner_.limits_.fileBytes - size_) {
+            return textOf(EFBIG);
+        }
+        owner_.grow(name_, text.size());
+        size_ += text.size();
+        return owner_.operations_.writeAll(descriptor_, text) ? std::nullopt : std::optional(textOf(errno));
+    }
+
+    std::optional<std::string> close() override {
+        owner_.finish(name_);
+        // Closed also when it fails: the descriptor may already be somebody else's.
+        if (owner_.operations_.close(std::exchange(descriptor_, -1)) != 0 && errno != EINTR) {
+            return textOf(errno);
+        }
+        return std::nullopt;
+    }
+
+private:
+    ReportDirectory& owner_;
+    const std::string name_;
+    int descriptor_;
+    std::uint64_t size_ = 0;
+};
+
+ReportLimits ReportLimits::read(const Preferences& preferences) {
+    ReportLimits limits;
+    const auto number = [&preferences](std::string_view key, std::uint64_t otherwise) {
+        const auto value = preferences.copyPreferenceValue(key, kLimitsDomain);
+        return value && value->isNumber() && value->integerValue() > 0 ? value->unsignedValue() : otherwise;
+    };
+    limits.files = static_cast<std::size_t>(number("report_files", limits.files));
+    limits.bytes = number("report_bytes", limits.bytes);
+    limits.fileBytes = std::min(limits.fileBytes, limits.bytes);
+    return limits;
+}
+
+ReportDirectory::ReportDirectory(const std::string& root, std::string_view below, const Clock& clock,
+                                 StructuredLog& log, FileModes modes, ReportLimits limits,
+                                 FileOperations& operations)
+    : clock_(clock),
+      log_(log),
+      modes_(modes),
+      limits_(limits),
+      operations_(operations),
+      directory_(root, below, modes.directory, operations) {}
+
+std::optional<std::string> ReportDirectory::make() {
+    return directory_.open() == nullptr ? std::optional(textOf(errno)) : std::nullopt;
+}
+
+std::variant<std::unique_ptr<ReportFile>, std::string> ReportDirectory::create(const std::string& name) {
+    const HeldDirectory::Ref directory = directory_.open();
+    if (directory == nullptr) {
+        return textOf(errno);
+    }
+    const MutexLock lock(mutex_);
+    use(directory);
+    learnMore();
+    learn(name);
+    makeRoom(reports_.contains(name) ? 0 : 1, 0);
+    // Emptied first when it is known to be a regular file; opening what is none must not wait either.
+    constexpr int kFlags = O_WRONLY | O_CREAT | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC;
+    FileDescriptor file(operations_.open(directory->get(), name.c_str(), kFlags, modes_.file));
+    struct stat status {};
+    if (!file.isOpen() || operations_.status(file.get(), status) != 0) {
+        return textOf(errno);
+    }
+    if (!S_ISREG(status.st_mode)) {
+        return "not a regular file";
+    }
+    if (operations_.truncate(file.get(), 0) != 0) {
+        return textOf(errno);
+    }
+    (void)::fchmod(file.get(), modes_.file); // whatever the process's mask is
+    Report& report = reports_[name];
+    bytes_ -= std::exchange(report.size, 0);
+    report.modified = clock_.now();
+    ++report.writers;
+    return std::make_unique<File>(*this, name, file.release());
+}
+
+void ReportDirectory::grow(const std::string& name, std::size_t bytes) {
+    const MutexLock lock(mutex_);
+    makeRoom(0, bytes);
+    if (const auto report = reports_.find(name); report != reports_.end()) {
+        report->second.size += bytes;
+        bytes_ += bytes;
+    }
+}
+
+void ReportDirectory::finish(const std::string& name) noexcept {
+    const MutexLock lock(mutex_);
+    if (const auto report = reports_.find(name); report != reports_.end() && report->second.writers != 0) {
+        --report->second.writers;
+        report->second.modified = clock_.now();
+    }
+}
+
+void ReportDirectory::use(const HeldDirectory::Ref& directory) {
+    if (known_ == directory) {
+        return;
+    }
+    known_ = directory;
+    reports_.clear();
+    bytes_ = 0;
+    const int own = ::openat(directory->get(), ".", O_RDONLY | O_DIRECTORY | O_CLOEXEC);
+    unread_.reset(own < 0 ? nullptr : ::fdopendir(own));
+}
+
+void ReportDirectory::learnMore() {
+    for (std::size_t i = 0; unread_ != nullptr && i < kEntriesAtATime; ++i) {
+        if (const dirent* const entry = ::readdir(unread_.get())) {
+            learn(entry->d_name);
+        } else {
+            unread_.reset();
+        }
+    }
+}
+
+void ReportDirectory::learn(const std::string& name) {
+    struct stat status {};
+    if (!isReport(name) || reports_.contains(name) ||
+        operations_.status(known_->get(), name.c_str(), status) != 0 || !S_ISREG(status.st_mode)) {
+        return;
+    }
+    const auto size = static_cast<std::uint64_t>(status.st_size);
+    reports_.emplace(name, Report{.modified = timeOf(status.st_mtim), .size = size});
+    bytes_ += size;
+}
+
+/// For so many more files and bytes.
+void ReportDirectory::makeRoom(std::size_t files, std::uint64_t bytes) {
+    const std::chrono::nanoseconds time = operations_.coarseTime();
+    if (isOver(files, bytes) && time - lookedAt_ >= kKnowledgeAge) {
+        lookedAt_ = time;
+        lookAgain();
+    }
+    if (files == 0 && !isOver(files, bytes)) {
+        return; // ages are looked at with each new report
+    }
+    const WallTime now = clock_.now();
+    for (const Reports::iterator report : inOrderOfRemoval(now)) {
+        if (isOver(files, bytes) || report->second.modified < now - limits_.age) {
+            remove(report);
+        }
+    }
+}
+
+std::vector<ReportDirectory::Reports::iterator> ReportDirectory::inOrderOfRemoval(WallTime now) {
+    std::vector<Reports::iterator> order;
+    for (auto report = reports_.begin(); report != reports_.end(); ++report) {
+        if (report->second.writers == 0) {
+            order.push_back(report);
+        }
+    }
+    std::ranges::sort(order, std::less(), [now](const Reports::iterator& report) {
+        const WallTime modified = report->second.modified;
+        return std::tuple(modified <= now, modified, std::string_view(report->first));
+    });
+    return order;
+}
+
+void ReportDirectory::lookAgain() {
+    for (auto report = reports_.begin(); report != reports_.end();) {
+        const auto looked = report++;
+        struct stat status {};
+        if (looked->second.writers == 0 &&
+            operations_.status(known_->get(), looked->first.c_str(), status) != 0) {
+            forget(looked);
+        }
+    }
+}
+
+void ReportDirectory::remove(Reports::iterator report) {
+    const bool isGone = operations_.remove(known_->get(), report->first.c_str()) == 0 || errno == ENOENT;
+    if (!isGone && !isRemovingOut_) {
+        log_.report(LogLevel::error, "zrrr",
+                    formatted("{}/{}: cannot be removed: {}; it takes room that is not counted", path(),
+                              report->first, textOf(errno)));
+    }
+    isRemovingOut_ = !isGone;
+    forget(report);
+}
+
+void ReportDirectory::forget(Reports::iterator report) {
+    bytes_ -= report->second.size;
+    reports_.erase(report);
+}
+
+} // namespace tamblo
