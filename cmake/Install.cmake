@@ -37,6 +37,9 @@ install(FILES "${CMAKE_BINARY_DIR}/tamblo.pc" DESTINATION "${CMAKE_INSTALL_LIBDI
 configure_file(packaging/tamblod.service.in tamblod.service @ONLY)
 install(FILES "${CMAKE_BINARY_DIR}/tamblod.service" packaging/tamblod.socket
     DESTINATION "${CMAKE_INSTALL_PREFIX}/lib/systemd/system")
+# The unit's user, and its configuration directory, which that user owns.
+install(FILES packaging/tamblod.sysusers DESTINATION "${CMAKE_INSTALL_PREFIX}/lib/sysusers.d" RENAME tamblo.conf)
+install(FILES packaging/tamblod.tmpfiles DESTINATION "${CMAKE_INSTALL_PREFIX}/lib/tmpfiles.d" RENAME tamblo.conf)
 install(DIRECTORY examples/ DESTINATION "${CMAKE_INSTALL_DOCDIR}/examples" FILES_MATCHING PATTERN "*.jsonl")
 install(DIRECTORY docs/ DESTINATION "${CMAKE_INSTALL_DOCDIR}" FILES_MATCHING PATTERN "*.md")
 install(FILES packaging/audio_issue_detected.proto DESTINATION "${CMAKE_INSTALL_DATADIR}/tamblo")

@@ -23,7 +23,7 @@ function(tamblo_tests name)
     target_link_libraries(${name} PRIVATE GTest::gmock GTest::gtest_main nlohmann_json::nlohmann_json)
     tamblo_link(${name} PRIVATE ${arg_LIBRARIES})
     # A test runs once for each time that it is built: to optimise it takes longer than it saves.
-    target_compile_options(${name} PRIVATE -O0)
+    target_compile_options(${name} PRIVATE -O0 -U_FORTIFY_SOURCE)
     target_compile_definitions(${name} PRIVATE "EXAMPLES_DIR=\"${CMAKE_SOURCE_DIR}/examples\"")
     add_dependencies(tamblo_all_tests ${name})
     gtest_discover_tests(${name} DISCOVERY_MODE PRE_TEST PROPERTIES LABELS ${arg_LABEL} TIMEOUT 120)

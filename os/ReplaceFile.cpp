@@ -18,11 +18,21 @@ namespace {
 constexpr mode_t kPermissions = 07777;
 constexpr uid_t kSameOwner = static_cast<uid_t>(-1);
 
+/// A new file is the owner's of its directory, as far as that can be had: root writes preferences for a
+/// service that runs as a user of its own.
+void giveToOwnerOf(int directory, int descriptor) {
+    struct stat status {};
+    if (::geteuid() == 0 && ::fstat(directory, &status) == 0) {
+        (void)!::fchown(descriptor, status.st_uid, status.st_gid);
+    }
+}
+
 /// False with the reason in `errno`.
 bool takeOver(int descriptor, int directory, const std::string& replaced, mode_t mode) {
     struct stat status {};
     if (::fstatat(directory, replaced.c_str(), &status, AT_SYMLINK_NOFOLLOW) != 0 ||
         !S_ISREG(status.st_mode)) {
+        giveToOwnerOf(directory, descriptor);
         return ::fchmod(descriptor, mode) == 0;
     }
     // Who may not give a file away may still belong to its group. The mode last, as a new owner changes it.
