@@ -4,10 +4,12 @@
 #include "ResultRow.h"
 #include "ServiceProcess.h"
 
+#include <algorithm>
 #include <cstddef>
 #include <optional>
 #include <string>
 #include <string_view>
+#include <vector>
 
 namespace tamblo::bench {
 
@@ -19,11 +21,17 @@ enum class Placement { oneCore, twoCores, free };
 /// for each placement, when the first scenario asks for them.
 class Bench {
 public:
-    Bench(std::string tamblod, bool quick) : tamblod_(std::move(tamblod)), quick_(quick) {}
+    Bench(std::string tamblod, bool quick, std::vector<std::string> parts)
+        : tamblod_(std::move(tamblod)), quick_(quick), parts_(std::move(parts)) {}
 
     [[nodiscard]] bool quick() const noexcept { return quick_; }
     [[nodiscard]] std::size_t repetitions(std::size_t usual) const noexcept {
         return quick_ ? (usual + 2) / 3 : usual;
+    }
+
+    /// Whether this part of a scenario that has many was asked for, by name or with all the others.
+    [[nodiscard]] bool isWanted(std::string_view part) const {
+        return parts_.empty() || std::find(parts_.begin(), parts_.end(), part) != parts_.end();
     }
 
     /// Puts this thread where the placement has the client, and says how to start the service.
@@ -36,6 +44,7 @@ public:
 private:
     std::string tamblod_;
     bool quick_;
+    std::vector<std::string> parts_;
     bool allMet_ = true;
     std::optional<SocketFloor> socketFloors_[3];
 };
@@ -59,5 +68,9 @@ void stopMany(Bench& bench);
 void summaryJson100k(Bench& bench);
 void idle(Bench& bench);
 void startUp(Bench& bench);
+/// All attacks or those that were named, each against a service of its own.
+void hostile(Bench& bench);
+/// For the usage: one line for each.
+void printAttacks();
 
 } // namespace tamblo::bench

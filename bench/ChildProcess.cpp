@@ -28,6 +28,13 @@ ChildProcess::ChildProcess(int processor, const std::function<void()>& run) : pi
     }
 }
 
+bool ChildProcess::hasEnded() const noexcept {
+    siginfo_t ended{};
+    // Left to be waited for, so that the number is not given to another process.
+    return ::waitid(P_PID, static_cast<id_t>(pid_), &ended, WEXITED | WNOHANG | WNOWAIT) == 0 &&
+           ended.si_pid == pid_;
+}
+
 ChildProcess::~ChildProcess() {
     ::kill(pid_, SIGKILL);
     ::waitpid(pid_, nullptr, 0);

@@ -6,7 +6,7 @@
 
 namespace tamblo::bench {
 
-/// A fork of this process that runs one function on one processor, as the other end of a floor. The
+/// A fork of this process that runs one function on one processor, such as the other end of a floor. The
 /// destructor ends it by its own process identifier; it ends with this process too.
 class ChildProcess {
 public:
@@ -16,6 +16,8 @@ public:
     ChildProcess& operator=(const ChildProcess&) = delete;
 
     [[nodiscard]] pid_t pid() const noexcept { return pid_; }
+    /// Whether the function has returned.
+    [[nodiscard]] bool hasEnded() const noexcept;
 
 private:
     pid_t pid_ = -1;

@@ -29,6 +29,12 @@ FrameChannel::FrameChannel(const std::string& socketPath)
     }
 }
 
+void FrameChannel::limitWaits(std::chrono::seconds longest) const {
+    const timeval limit{.tv_sec = longest.count(), .tv_usec = 0};
+    ::setsockopt(socket_.get(), SOL_SOCKET, SO_RCVTIMEO, &limit, sizeof limit);
+    ::setsockopt(socket_.get(), SOL_SOCKET, SO_SNDTIMEO, &limit, sizeof limit);
+}
+
 void FrameChannel::append(const wire::Request& request) {
     if (!wire::appendRequestFrame(outgoing_, request)) {
         throw std::logic_error("a frame is too long");

@@ -6,6 +6,7 @@
 #include "wire/Reply.h"
 #include "wire/Request.h"
 
+#include <chrono>
 #include <cstddef>
 #include <cstdint>
 #include <optional>
@@ -20,6 +21,9 @@ namespace tamblo::bench {
 class FrameChannel {
 public:
     explicit FrameChannel(const std::string& socketPath);
+
+    /// From now on, what takes longer throws.
+    void limitWaits(std::chrono::seconds longest) const;
 
     /// Requests are gathered until `flush`.
     void queue(wire::Request& request);

@@ -108,6 +108,10 @@ std::size_t residentBytesOf(pid_t process) {
     return numberIn(processFile(process, "smaps_rollup"), "Rss") * 1024;
 }
 
+std::size_t roughResidentBytesOf(pid_t process) {
+    return numberIn(processFile(process, "status"), "VmRSS") * 1024;
+}
+
 std::size_t peakResidentBytesOf(pid_t process) {
     return numberIn(processFile(process, "status"), "VmHWM") * 1024;
 }

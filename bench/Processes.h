@@ -27,6 +27,8 @@ void pinThisThread(int processor);
 
 /// Exact, which the counters of /proc/PID/status are not.
 [[nodiscard]] std::size_t residentBytesOf(pid_t process);
+/// Of any user's process, and late by some pages.
+[[nodiscard]] std::size_t roughResidentBytesOf(pid_t process);
 /// The most that was resident at a time so far.
 [[nodiscard]] std::size_t peakResidentBytesOf(pid_t process);
 [[nodiscard]] std::size_t threadCountOf(pid_t process);

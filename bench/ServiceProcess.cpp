@@ -21,6 +21,7 @@
 #include <poll.h>
 #include <sys/prctl.h>
 #include <sys/socket.h>
+#include <sys/stat.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -92,11 +93,19 @@ ServiceProcess::ServiceProcess(const Settings& settings) {
     if (settings.isInternalBuild) {
         makeInternalBuild(directory_);
     }
+    if (settings.isForOtherUsers) {
+        for (const std::string& path : {directory_.path(), directory_.path() + "/runtime"}) {
+            ::chmod(path.c_str(), 0711);
+        }
+    }
     const std::string notifyPath = directory_.path() + "/notify";
     const FileDescriptor notify = bindNotifySocket(notifyPath);
     start(settings, notifyPath);
     try {
         waitUntilReady(notify.get());
+        if (settings.isForOtherUsers) {
+            ::chmod(socketPath_.c_str(), 0666);
+        }
     } catch (...) {
         ::kill(pid_, SIGKILL);
         ::waitpid(pid_, nullptr, 0);
@@ -143,6 +152,9 @@ void ServiceProcess::start(const Settings& settings, const std::string& notifySo
         fail("fork");
     }
     if (pid_ == 0) {
+        if (settings.beforeExec) {
+            settings.beforeExec(directory_.path());
+        }
         ::prctl(PR_SET_PDEATHSIG, SIGKILL);
         if (::getppid() == parent && ::sched_setaffinity(0, sizeof processors, &processors) == 0 &&
             ::dup2(log.get(), STDERR_FILENO) >= 0) {
@@ -172,23 +184,42 @@ void ServiceProcess::waitUntilReady(int notifySocket) {
     throw std::runtime_error("the service does not get ready: " + logTail());
 }
 
+bool ServiceProcess::isAlive() const noexcept {
+    siginfo_t ended{};
+    return pid_ > 0 && ::waitid(P_PID, static_cast<id_t>(pid_), &ended, WEXITED | WNOHANG | WNOWAIT) == 0 &&
+           ended.si_pid != pid_;
+}
+
+/// Takes the service's end in; kills it when the time is over, and answers false.
+bool ServiceProcess::awaitEnd(std::chrono::seconds limit, int& status) {
+    const pid_t process = std::exchange(pid_, -1);
+    const auto end = std::chrono::steady_clock::now() + limit;
+    while (::waitpid(process, &status, WNOHANG) == 0) {
+        if (std::chrono::steady_clock::now() > end) {
+            ::kill(process, SIGKILL);
+            ::waitpid(process, &status, 0);
+            return false;
+        }
+        std::this_thread::sleep_for(std::chrono::milliseconds(2));
+    }
+    return true;
+}
+
+std::optional<std::chrono::nanoseconds> ServiceProcess::terminate(std::chrono::seconds limit) {
+    const auto begin = std::chrono::steady_clock::now();
+    ::kill(pid_, SIGTERM);
+    int status = 0;
+    const bool isEnded = awaitEnd(limit, status) && WIFEXITED(status) && WEXITSTATUS(status) == 0;
+    return isEnded ? std::optional(std::chrono::steady_clock::now() - begin) : std::nullopt;
+}
+
 void ServiceProcess::stop() {
     if (pid_ < 0) {
         return;
     }
-    const pid_t process = std::exchange(pid_, -1);
-    ::kill(process, SIGTERM);
-    const auto limit = std::chrono::steady_clock::now() + kStopLimit;
+    ::kill(pid_, SIGTERM);
     int status = 0;
-    while (::waitpid(process, &status, WNOHANG) == 0) {
-        if (std::chrono::steady_clock::now() > limit) {
-            ::kill(process, SIGKILL);
-            ::waitpid(process, &status, 0);
-            break;
-        }
-        std::this_thread::sleep_for(std::chrono::milliseconds(2));
-    }
-    if (!WIFEXITED(status) || WEXITSTATUS(status) != 0) {
+    if (!awaitEnd(kStopLimit, status) || !WIFEXITED(status) || WEXITSTATUS(status) != 0) {
         throw std::runtime_error("the service did not end in order: " + logTail());
     }
 }

@@ -4,6 +4,7 @@
 
 #include <chrono>
 #include <cstddef>
+#include <functional>
 #include <optional>
 #include <string>
 #include <string_view>
@@ -24,6 +25,10 @@ public:
         std::optional<std::string> eventsInUse = std::nullopt;
         /// With everything on that an internal build can have, and some two hundred driver channels.
         bool isInternalBuild = false;
+        /// Whether other users may connect.
+        bool isForOtherUsers = false;
+        /// Called in the child before it becomes the service.
+        std::function<void(const std::string& directory)> beforeExec = nullptr;
     };
 
     explicit ServiceProcess(const Settings& settings);
@@ -46,6 +51,9 @@ public:
     /// From just before the fork until now.
     [[nodiscard]] std::chrono::nanoseconds age() const noexcept;
 
+    [[nodiscard]] bool isAlive() const noexcept;
+    /// SIGTERM; how long it took to end, or nothing when it was killed in the end.
+    std::optional<std::chrono::nanoseconds> terminate(std::chrono::seconds limit);
     /// SIGTERM, and throws when the service does not end by itself with status 0.
     void stop();
 
@@ -53,6 +61,7 @@ private:
     void start(const Settings& settings, const std::string& notifySocket);
     void waitUntilReady(int notifySocket);
     [[nodiscard]] std::string logTail() const;
+    [[nodiscard]] bool awaitEnd(std::chrono::seconds limit, int& status);
 
     TemporaryDirectory directory_;
     std::string socketPath_;

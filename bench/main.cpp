@@ -1,5 +1,6 @@
 #include "Bench.h"
 
+#include <algorithm>
 #include <array>
 #include <cstdio>
 #include <cstring>
@@ -16,6 +17,7 @@ struct Scenario {
     std::string_view name;
     std::string_view what;
     void (*run)(Bench& bench);
+    bool isRunUnasked = true;
 };
 
 constexpr std::array kScenarios{
@@ -38,23 +40,34 @@ constexpr std::array kScenarios{
     Scenario{"summary_json_100k", "the summary file of a session with 100,000 messages", summaryJson100k},
     Scenario{"idle", "nothing connected", idle},
     Scenario{"start_up", "from exec to the first accepted connection", startUp},
+    Scenario{"hostile", "each attack on its own, with another user's client beside it", hostile, false},
 };
 
 struct Options {
     std::string tamblod = TAMBLOD_PATH;
     bool quick = false;
     std::vector<const Scenario*> scenarios;
+    std::vector<std::string> attacks;
 };
 
 int usage() {
-    std::fputs("usage: tamblo_bench [--quick] [--tamblod PATH] [SCENARIO...]\n\n"
+    std::fputs("usage: tamblo_bench [--quick] [--tamblod PATH] [SCENARIO | hostile:ATTACK...]\n\n"
                "Prints one JSON object per row. Exit status: 0 when all ran, whether or not they met their\n"
                "targets; 1 when one could not run; 2 for a wrong command line.\n\n",
                stderr);
     for (const Scenario& scenario : kScenarios) {
         std::fprintf(stderr, "  %-19s%s\n", scenario.name.data(), scenario.what.data());
     }
+    printAttacks();
     return 2;
+}
+
+/// Several attacks of one scenario make it run once.
+void add(const Scenario& scenario, Options& options) {
+    auto& chosen = options.scenarios;
+    if (scenario.isRunUnasked || std::find(chosen.begin(), chosen.end(), &scenario) == chosen.end()) {
+        chosen.push_back(&scenario);
+    }
 }
 
 bool parse(int count, char** arguments, Options& options) {
@@ -66,20 +79,27 @@ bool parse(int count, char** arguments, Options& options) {
             options.tamblod = arguments[++i];
         } else {
             bool known = false;
+            const std::size_t colon = argument.find(':');
+            const std::string_view name = argument.substr(0, colon);
             for (const Scenario& scenario : kScenarios) {
-                if (scenario.name == argument) {
-                    options.scenarios.push_back(&scenario);
+                if (scenario.name == name) {
+                    add(scenario, options);
                     known = true;
                 }
             }
-            if (!known) {
+            if (!known || (colon != argument.npos && name != "hostile")) {
                 return false;
+            }
+            if (colon != argument.npos) {
+                options.attacks.emplace_back(argument.substr(colon + 1));
             }
         }
     }
     if (options.scenarios.empty()) {
         for (const Scenario& scenario : kScenarios) {
-            options.scenarios.push_back(&scenario);
+            if (scenario.isRunUnasked) {
+                options.scenarios.push_back(&scenario);
+            }
         }
     }
     return true;
@@ -92,7 +112,7 @@ int main(int count, char** arguments) {
     if (!parse(count, arguments, options)) {
         return usage();
     }
-    Bench bench(options.tamblod, options.quick);
+    Bench bench(options.tamblod, options.quick, options.attacks);
     bool allRan = true;
     for (const Scenario* scenario : options.scenarios) {
         try {

@@ -1,7 +1,7 @@
 # tamblo_bench drives the real tamblod end to end; tamblo_microbench measures single steps of a message's
 # path in process, and is left out where Google Benchmark is missing.
 
-tamblo_program(tamblo_bench GLOB bench/*.cpp LIBRARIES client wire os base)
+tamblo_program(tamblo_bench GLOB bench/*.cpp bench/hostile/*.cpp LIBRARIES client wire os base)
 if(TARGET tamblo_bench)
     target_compile_definitions(tamblo_bench PRIVATE
         "TAMBLOD_PATH=\"${CMAKE_RUNTIME_OUTPUT_DIRECTORY}/tamblod\""
