@@ -1,5 +1,5 @@
-# tamblo_unit_tests (every folder, against the in-memory platform of tests/fakes) and tamblo_service_tests
-# (the real tamblod and tambloctl). Left out, with a notice, on a machine without the test libraries.
+# tamblo_unit_tests (every folder, against the in-memory platform of tests/fakes), tamblo_service_tests (the
+# real tamblod and tambloctl) and tamblo_hostile_tests (clients that mean harm). Left out, with a notice, on a machine without the test libraries.
 
 find_package(GTest QUIET)
 find_package(nlohmann_json QUIET)
@@ -33,7 +33,8 @@ file(GLOB_RECURSE unit_sources CONFIGURE_DEPENDS RELATIVE "${CMAKE_SOURCE_DIR}" 
 file(GLOB_RECURSE core_sources CONFIGURE_DEPENDS RELATIVE "${CMAKE_SOURCE_DIR}"
     tests/session/*.cpp tests/service_core/*.cpp)
 file(GLOB_RECURSE service_sources CONFIGURE_DEPENDS RELATIVE "${CMAKE_SOURCE_DIR}" tests/service/*.cpp)
-list(FILTER unit_sources EXCLUDE REGEX "^tests/(service|service_core|session|fakes)/")
+file(GLOB_RECURSE hostile_sources CONFIGURE_DEPENDS RELATIVE "${CMAKE_SOURCE_DIR}" tests/hostile/*.cpp)
+list(FILTER unit_sources EXCLUDE REGEX "^tests/(service|service_core|session|fakes|hostile)/")
 
 tamblo_tests(tamblo_unit_tests LABEL unit SOURCES ${unit_sources}
     LIBRARIES tests/fakes service workers system platform/linux tools client wire metrics)
@@ -41,13 +42,18 @@ tamblo_tests(tamblo_unit_tests LABEL unit SOURCES ${unit_sources}
 tamblo_tests(tamblo_core_tests LABEL unit SOURCES ${core_sources} LIBRARIES tests/fakes service session)
 tamblo_tests(tamblo_service_tests LABEL service SOURCES ${service_sources} LIBRARIES client wire base)
 
-if(TARGET tamblo_service_tests)
-    target_compile_definitions(tamblo_service_tests PRIVATE
-        "TAMBLOD_PATH=\"${CMAKE_RUNTIME_OUTPUT_DIRECTORY}/tamblod\""
-        "TAMBLOCTL_PATH=\"${CMAKE_RUNTIME_OUTPUT_DIRECTORY}/tambloctl\"")
-    foreach(program tamblod tambloctl)
-        if(TARGET ${program})
-            add_dependencies(tamblo_service_tests ${program})
-        endif()
-    endforeach()
-endif()
+# What one client may cost the others, by the real tamblod.
+tamblo_tests(tamblo_hostile_tests LABEL hostile SOURCES ${hostile_sources} LIBRARIES wire base)
+
+foreach(tests tamblo_service_tests tamblo_hostile_tests)
+    if(TARGET ${tests})
+        target_compile_definitions(${tests} PRIVATE
+            "TAMBLOD_PATH=\"${CMAKE_RUNTIME_OUTPUT_DIRECTORY}/tamblod\""
+            "TAMBLOCTL_PATH=\"${CMAKE_RUNTIME_OUTPUT_DIRECTORY}/tambloctl\"")
+        foreach(program tamblod tambloctl)
+            if(TARGET ${program})
+                add_dependencies(${tests} ${program})
+            endif()
+        endforeach()
+    endif()
+endforeach()

@@ -1,0 +1,227 @@
+#include "tests/hostile/HostileTest.h"
+
+#include <list>
+
+#include <grp.h>
+
+// What one client could do to the others, each at a small scale and with the limits as they are shipped. What
+// it costs is asserted in bytes, lines, memory and shares of processor time, never in time by the clock.
+
+namespace tamblo::test {
+namespace {
+
+using testing::Each;
+using testing::HasSubstr;
+using testing::Le;
+
+std::vector<wire::Request> messages(std::size_t count,
+                                    const std::function<wire::Request(std::size_t)>& make) {
+    std::vector<wire::Request> made;
+    for (std::size_t i = 0; i < count; ++i) {
+        made.push_back(make(i));
+    }
+    return made;
+}
+
+TEST_F(Hostile, MessagesThatEachBringAKeyCostTheSameAtTheEnd) {
+    ServiceProcess& service = start();
+    Session client(service.socketPath());
+    const auto costOf = [&](std::size_t first) {
+        const auto batch = messages(2'000, [&](std::size_t i) {
+            return message({{"key" + std::to_string(first + i), 1}});
+        });
+        return cpuSecondsOf([&] { EXPECT_TRUE(callAll(client, batch)); });
+    };
+    const double early = costOf(0);
+    for (std::size_t first = 2'000; first < 10'000; first += 2'000) {
+        costOf(first);
+    }
+    EXPECT_LT(costOf(10'000), 4 * early);
+}
+
+TEST_F(Hostile, KindsThatWouldCollideInATableCostWhatOthersDo) {
+    ServiceProcess& service = start();
+    Session client(service.socketPath(), 7, 11);
+    const auto costOfStop = [&](std::uint64_t step) {
+        client.start(7, 11);
+        EXPECT_TRUE(callAll(client, messages(20'000, [&](std::uint64_t i) {
+                                return message({}, {7}, static_cast<std::uint32_t>((i + 1) * step >> 16U),
+                                               static_cast<std::uint16_t>((i + 1) * step));
+                            })));
+        return cpuSecondsOf([&] { client.call(Method::stopReportingSessionForID, 7); });
+    };
+    const double usual = costOfStop(20'755);
+    // The size of a table of the standard library's that has so many entries.
+    EXPECT_LT(costOfStop(20'753), 3 * usual);
+}
+
+TEST_F(Hostile, ListsThatNobodyAwaitsAreNotMade) {
+    ServiceProcess& service = start();
+    RawClient client(service.socketPath());
+    ASSERT_TRUE(callAll(client, messages(10'000, [](std::size_t i) {
+                            return request(Method::createReportingSession, static_cast<std::int64_t>(i + 1));
+                        })));
+    TextBuffer unawaited;
+    for (int i = 0; i < 300; ++i) {
+        ASSERT_TRUE(wire::appendRequestFrame(unawaited, request(Method::getAllReporters)));
+    }
+    const double awaitedCost = cpuSecondsOf([&] {
+        EXPECT_TRUE(
+            callAll(client, messages(300, [](std::size_t) { return request(Method::getAllReporters); })));
+    });
+    const double unawaitedCost = cpuSecondsOf([&] {
+        client.send(unawaited.view());
+        client.call(Method::reporterID, 1);
+    });
+    EXPECT_LT(unawaitedCost, awaitedCost / 4);
+}
+
+TEST_F(Hostile, UnfinishedFramesTakeBoundedMemory) {
+    ServiceProcess& service = start();
+    std::list<RawClient> clients;
+    const std::string unfinished = std::string("\0\0\x10\0", 4) + std::string(1'000'000, 'x');
+    for (int i = 0; i < 100; ++i) {
+        clients.emplace_back(service.socketPath()).send(unfinished);
+        ASSERT_TRUE(bystanderIsServed());
+    }
+    if (kMemoryIsThatOfTheService) {
+        EXPECT_LT(peakBytes(), 48U << 20U);
+    }
+}
+
+TEST_F(Hostile, LinesOfTheLogAreFewerThanWhatClientsDo) {
+    ServiceProcess& service = start();
+    RawClient client(service.socketPath());
+    std::list<RawClient> idle;
+    for (int i = 0; i < 100; ++i) {
+        idle.emplace_back(service.socketPath());
+    }
+    ASSERT_THAT(idle.back().call(Method::getAllReporters), IsDone());
+    ASSERT_TRUE(callAll(client, messages(100, [](std::size_t i) {
+                            return message({{"n", i}}, std::vector<std::int64_t>(200, 12'345));
+                        })));
+    ASSERT_TRUE(callAll(client, messages(100, [](std::size_t i) { return message({{"n", i}}, {}); })));
+    for (int i = 0; i < 300; ++i) {
+        EXPECT_THAT(RawClient(service.socketPath()).call(Method::reporterID, 7), IsDone());
+        client.send(std::string("\x01\0\0\0\xA0", 5));
+        EXPECT_TRUE(client.receive());
+    }
+    EXPECT_LT(logLines(), 500U);
+    EXPECT_LT(service.errorOutput().size(), 200'000U);
+}
+
+TEST_F(Hostile, WithoutDescriptorsWhatIsAnsweredIsInItsFileAndWhatIsForbiddenIsNot) {
+    const std::string domain = "com.vandra.tamblo.analytics";
+    ServiceProcess& service =
+        start({}, {.preferences = {{domain, R"({"events_in_use": ["com.vandra.tamblo.Playback.Start"]})"}}});
+    const std::filesystem::path sink = service.logs() / "analytics-events.jsonl";
+    ASSERT_TRUE(bystanderIsServed());
+    service.limit(RLIMIT_NOFILE, 40);
+    std::list<RawClient> clients;
+    for (int i = 0; i < 60; ++i) {
+        clients.emplace_back(service.socketPath());
+    }
+    ASSERT_TRUE(
+        eventually([&] { return countOf("accepting connections rests", service.errorOutput()) > 0; }));
+    // The file is moved away, as a shipper does, and the preferences are written anew.
+    const std::filesystem::path moved = service.logs() / "analytics-events.jsonl.moved";
+    std::filesystem::rename(sink, moved);
+    writeFile(service.preferenceFile(domain), R"({"events_in_use": ["com.vandra.tamblo.Playback.Start"] })");
+    ::usleep(150'000); // after which the file's place is looked up again
+    std::size_t answered = 0;
+    for (int i = 0; i < 20; ++i) {
+        answered += bystanderIsServed() ? 1U : 0U;
+        (void)bystander_->call(message({{"forbidden", i}}, {kBystander}, 4, 2));
+    }
+    clients.clear();
+    const std::string lines = contentOf(moved) + contentOf(sink);
+    EXPECT_EQ(countOf("\"bystander\":", lines), 1 + answered);
+    EXPECT_EQ(countOf("\"forbidden\":", lines), 0U);
+    EXPECT_EQ(answered, 20U);
+}
+
+TEST_F(Hostile, NoThreadIsNoReasonToEnd) {
+    // Root is not held to the limit on threads, so the service is somebody else's.
+    constexpr uid_t kSomebody = 65'534;
+    const auto becomeSomebody = [] {
+        if (::geteuid() == 0) {
+            const auto all = std::filesystem::path(::getenv("RUNTIME_DIRECTORY")).parent_path();
+            (void)std::system(("chown -R 65534:65534 " + all.string()).c_str());
+            (void)(::setgroups(0, nullptr) == 0 && ::setgid(kSomebody) == 0 && ::setuid(kSomebody) == 0);
+        }
+    };
+    ServiceProcess& service = start({}, {.beforeExec = becomeSomebody});
+    service.limit(RLIMIT_NPROC, 1);
+    for (int i = 0; i < 50; ++i) {
+        Session client(service.socketPath(), 7, 11);
+        EXPECT_THAT(client.call(message({{"n", i}})), IsDone());
+        EXPECT_TRUE(i % 2 == 0 || client.stop());
+        EXPECT_TRUE(bystanderIsServed());
+    }
+}
+
+TEST_F(Hostile, FilesKeepTheirBoundWhateverTheLine) {
+    ServiceProcess& service = start();
+    Session client(service.socketPath());
+    const std::string text(900'000, 'x');
+    for (int i = 0; i < 80; ++i) {
+        ASSERT_THAT(client.call(message({{"n", i}, {"text", text}})), IsDone());
+    }
+    EXPECT_TRUE(client.stop());
+    ::usleep(300'000); // the call-quality file follows within a quarter of a second
+    for (const auto& file : std::filesystem::recursive_directory_iterator(service.logs())) {
+        if (file.is_regular_file()) {
+            EXPECT_LE(file.file_size(), 64U << 20U) << file.path();
+        }
+    }
+}
+
+TEST_F(Hostile, WhatSomebodyHasReportedAndTakenAwayMakesNobodyElsesMessagesDearer) {
+    ServiceProcess& service = start();
+    const auto costOfOthers = [&] {
+        Session other(service.socketPath(), 8);
+        const auto batch = messages(3'000, [](std::size_t i) {
+            Dictionary payload{{"text", "headphones-wireless"}, {"n", i}};
+            for (const char key : std::string("abcdefghij")) {
+                payload.set(std::string(i % 4 + 3, key), i);
+            }
+            return message(std::move(payload), {8});
+        });
+        (void)callAll(other, batch);
+        return cpuSecondsOf([&] { EXPECT_TRUE(callAll(other, batch)); });
+    };
+    const double before = costOfOthers();
+    {
+        Session client(service.socketPath());
+        ASSERT_TRUE(callAll(client, messages(12'000, [](std::size_t i) {
+                                const std::string suffix = std::to_string(i);
+                                return message({{"key" + suffix, i}, {"other" + suffix, 1}});
+                            })));
+    }
+    EXPECT_LT(costOfOthers(), 2 * before);
+}
+
+TEST_F(Hostile, OnlyRootAndTheServicesOwnUserMayEndIt) {
+    ServiceProcess& service = start();
+    if (::geteuid() == 0) {
+        // The kernel tells of the user who connects.
+        ::chmod(service.socketPath().c_str(), 0666);
+        ::chmod(service.runtimeDirectory().c_str(), 0711);
+        ::chmod(std::filesystem::path(service.runtimeDirectory()).parent_path().c_str(), 0711);
+        ASSERT_EQ(::seteuid(65'534), 0);
+        RawClient other(service.socketPath());
+        ASSERT_EQ(::seteuid(0), 0);
+        const auto reply = other.call(Method::killService);
+        EXPECT_TRUE(reply && reply->error && reply->error->code == -32000);
+        EXPECT_THAT(other.call(Method::getAllReporters), IsDone());
+        ASSERT_TRUE(bystanderIsServed());
+    }
+    RawClient own(service.socketPath());
+    own.send(framesOf(request(Method::killService)));
+    EXPECT_EQ(service.awaitEnd(), 2);
+    service.start();
+    bystander_.emplace(service.socketPath(), kBystander);
+}
+
+} // namespace
+} // namespace tamblo::test
