@@ -11,6 +11,22 @@ if(TARGET tamblo_bench)
     endif()
 endif()
 
+# tamblo_crash kills the real tamblod, over and over.
+tamblo_program(tamblo_crash
+    GLOB bench/crash/*.cpp SOURCES bench/ResultRow.cpp bench/TemporaryDirectory.cpp LIBRARIES wire os base)
+if(TARGET tamblo_crash)
+    add_library(tamblo_shifted_clock MODULE bench/crash/ShiftedClock.c)
+    target_link_libraries(tamblo_crash PRIVATE Threads::Threads)
+    target_compile_definitions(tamblo_crash PRIVATE
+        "TAMBLOD_PATH=\"${CMAKE_RUNTIME_OUTPUT_DIRECTORY}/tamblod\""
+        "SHIFTED_CLOCK_PATH=\"$<TARGET_FILE:tamblo_shifted_clock>\""
+        "BENCH_DIRECTORY=\"${CMAKE_BINARY_DIR}\"")
+    add_dependencies(tamblo_crash tamblo_shifted_clock)
+    if(TARGET tamblod)
+        add_dependencies(tamblo_crash tamblod)
+    endif()
+endif()
+
 find_package(benchmark QUIET)
 if(benchmark_FOUND)
     if(NOT TARGET tamblo_tests_fakes)
