@@ -1,3 +1,4 @@
+#include "os/FileDescriptor.h"
 #include "tests/service/RealService.h"
 
 #include <gmock/gmock.h>

@@ -148,7 +148,7 @@ TEST_F(Sinks, CallQualityIsWrittenByAQueueOfItsOwn) {
 }
 
 TEST_F(Sinks, WithoutABackEndOfCallQualityThereIsNothingToSend) {
-    for (const auto& [backends, operations] : {std::pair("[]", "o"), {"5", "omf"}, {"{}", "omf"}}) {
+    for (const auto& [backends, operations] : {std::pair("[]", "o"), {"5", "ommf"}, {"{}", "ommf"}}) {
         ServiceProcess service(
             {.preferences = {{kCallQuality, R"({"backends": )" + std::string(backends) + "}"}}});
         EXPECT_TRUE(Session(service.socketPath()).stop());
