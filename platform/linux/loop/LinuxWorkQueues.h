@@ -60,7 +60,7 @@ public:
     /// What the calling thread posts from now until `endWakeUp` is collected for it. One thread at a time.
     void beginWakeUp() noexcept { collector_ = std::this_thread::get_id(); }
     /// Runs what was collected; whether some is left for the next wake-up, which then is to come at once.
-    [[nodiscard]] bool endWakeUp();
+    bool endWakeUp();
     /// Runs what was collected. On the collecting thread.
     void drain();
     /// Counts what was posted towards a batch; answers how much there is since the last drain.
