@@ -1,5 +1,7 @@
 #pragma once
 
+#include "base/Hash.h"
+
 #include <array>
 #include <bit>
 #include <cstddef>
@@ -49,10 +51,12 @@ private:
     };
 
     /// Only the highest bits of the product depend on every bit of the key.
-    static std::size_t indexOf(std::uint64_t key) noexcept {
-        return (key * 0x9E3779B97F4A7C15ULL) >> (64U - kSetBits);
+    [[nodiscard]] std::size_t indexOf(std::uint64_t key) const noexcept {
+        return ((key ^ seed_) * 0x9E3779B97F4A7C15ULL) >> (64U - kSetBits);
     }
 
+    /// Keys may be a client's choice.
+    std::uint64_t seed_ = SeededHash().seed;
     std::array<Set, Sets> sets_{};
 };
 

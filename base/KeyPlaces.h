@@ -32,6 +32,12 @@ public:
     /// The index of each key in the key set, `kAbsent` for those that it does not hold. Lives until the next
     /// call.
     [[nodiscard]] const Places& in(const KeySet& keySet) {
+        if (keySet.size() > kMostRememberedKeys || keySet.heldBytes() > kMostRememberedBytes) {
+            // Of an ordinary message's size, or not remembered: it would be held for as long as this is
+            // there.
+            once_ = find(keySet).places;
+            return once_;
+        }
         return known_.get(reinterpret_cast<std::uintptr_t>(&keySet), [&] { return find(keySet); }).places;
     }
 
@@ -50,7 +56,11 @@ private:
         return known;
     }
 
+    static constexpr std::size_t kMostRememberedKeys = 256;
+    static constexpr std::size_t kMostRememberedBytes = 64U << 10U;
+
     const std::span<const std::string_view> keys_;
+    Places once_{};
     BoundedCache<Known, 8> known_;
 };
 

@@ -1,5 +1,6 @@
 #include "base/KeySetCache.h"
 
+#include "base/Hash.h"
 #include "base/Utf8.h"
 
 #include <algorithm>
@@ -22,7 +23,8 @@ std::uint64_t mix(std::uint64_t hash, std::uint64_t word) noexcept {
 /// A hash of texts in their order, good enough to tell the kinds of messages apart: of each text its length
 /// and up to sixteen of its bytes. What is found by it is verified text by text.
 std::uint64_t hashKeys(std::span<const std::string_view> keys) noexcept {
-    std::uint64_t hash = keys.size();
+    static const std::uint64_t seed = SeededHash().seed;
+    std::uint64_t hash = seed + keys.size();
     for (const std::string_view key : keys) {
         std::uint64_t first = 0;
         std::uint64_t last = 0;

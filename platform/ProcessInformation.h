@@ -33,6 +33,8 @@ public:
     /// How many processes were running or waiting for a disk, averaged over 1, 5 and 15 minutes; 0 where that
     /// is not known.
     [[nodiscard]] virtual std::array<double, 3> loadAverages() const = 0;
+    /// Gives memory that this process has freed back to the system, which takes milliseconds.
+    virtual void giveBackMemory() const noexcept = 0;
 };
 
 } // namespace tamblo

@@ -1,5 +1,7 @@
 #include "session/SessionStop.h"
 
+#include "session/BlockingWork.h"
+
 #include "session/ZRReportingSession.h"
 #include "util/Log.h"
 #include "util/TraceEvents.h"
@@ -102,6 +104,7 @@ void ZRReportingSession::stopSomeOfWorkers() {
     if (workers.empty()) {
         stop_->step = SessionStop::Step::letGo;
         stop_->past.swap(messages_);
+        stop_->isLarge = stop_->past.size() > kManyMessages;
         lastMessages_.clear();
         return;
     }
@@ -132,6 +135,9 @@ void ZRReportingSession::letGoOfSome() {
     droppedMessageCount_ = 0;
     started_ = false;
     stop_->step = SessionStop::Step::waiting;
+    if (stop_->isLarge) {
+        context_.shared<BlockingWork>(context_.platform()).giveBackMemorySoon();
+    }
 }
 
 bool ZRReportingSession::hasToWait() const noexcept {

@@ -32,6 +32,7 @@ struct SessionStop {
     std::size_t indexed = 0;          ///< messages entered into the index
     std::vector<std::size_t> workers; ///< places of those that are to be stopped, the next one last
     std::vector<MessageRef> past;     ///< messages that are to be let go
+    bool isLarge = false;             ///< what is let go
     std::deque<Waiting> waiting;
     bool hasRefused = false;
     /// What is sent comes from the worker that is stopping, or has waited.

@@ -1,5 +1,7 @@
 #include "session/ZRReportingSession.h"
 
+#include "base/Utf8.h"
+#include "session/BlockingWork.h"
 #include "util/Log.h"
 #include "util/MessageKeys.h"
 #include "util/TraceEvents.h"
@@ -34,6 +36,9 @@ ZRReportingSession::ZRReportingSession(Created, Context& context, ReporterID rep
 
 ZRReportingSession::~ZRReportingSession() {
     emitTracePoint(context_, TraceEvent::sessionDestroyed);
+    if (messages_.size() > kManyMessages) {
+        context_.shared<BlockingWork>(context_.platform()).giveBackMemorySoon();
+    }
     log::info(ZRReportingSessionCategory(), "deallocing this session {}", reporterID_);
 }
 
@@ -142,10 +147,27 @@ void ZRReportingSession::sendMessage(const MessageRef& message, ErrorReply reply
         keepWaiting(message, std::move(reply));
         return;
     }
+    const std::shared_ptr<HeldReply> outer = std::exchange(heldReply_, nullptr);
     accept(message);
+    if (heldReply_ != nullptr) {
+        heldReply_->reply = std::move(reply);
+    } else if (reply) {
+        reply(nullptr);
+    }
+    heldReply_ = outer;
+}
+
+ZRReportingSession::HeldReply::~HeldReply() {
     if (reply) {
         reply(nullptr);
     }
+}
+
+std::shared_ptr<const void> ZRReportingSession::holdReply() {
+    if (heldReply_ == nullptr) {
+        heldReply_ = std::make_shared<HeldReply>();
+    }
+    return heldReply_;
 }
 
 void ZRReportingSession::accept(const MessageRef& message) {
@@ -213,15 +235,34 @@ double ZRReportingSession::getEpochTimeFromZRReportingStateMessage(
     return intake::epochTime(message.payload());
 }
 
+namespace {
+
+/// A client's choice in a line: what is longer than somebody reads is cut before it is made into text.
+struct Shortened {
+    const Value& value;
+};
+void appendText(std::string& out, Shortened name) {
+    constexpr std::size_t kMostBytes = 256;
+    if (name.value.isString()) {
+        out += cutUtf8(name.value.stringValue(), kMostBytes);
+    } else if (name.value.heldBytes() <= kMostBytes) {
+        appendFormatted(out, "{}", name.value);
+    } else {
+        out += "(...)";
+    }
+}
+
+} // namespace
+
 void appendText(std::string& out, const ZRReportingSession& session) {
     const std::vector<pid_t>& owners = session.processIdentifiers();
+    const Value appName = ZRReportingUtilityRetrieveAppName(session.configuration());
     appendFormatted(
         out,
         "reporterID={},serviceName={},ownerPid={},clientProcessName={},HostApplicationDisplayID={},"
         "started={},singleMessageSession={}",
         session.reporterID(), session.serviceName(), owners.empty() ? pid_t{0} : owners.front(),
-        session.clientProcessName(), ZRReportingUtilityRetrieveAppName(session.configuration()),
-        session.started(), session.isSingleMessageSession());
+        session.clientProcessName(), Shortened{appName}, session.started(), session.isSingleMessageSession());
 }
 
 void appendText(std::string& out, const SessionList& list) {

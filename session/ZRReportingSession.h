@@ -67,6 +67,9 @@ public:
     /// the end. A message that comes between two parts of a stop waits for the stop's end, unless too much
     /// waits already: then the reply says so, and the message is lost.
     void sendMessage(const MessageRef& message, ErrorReply reply = {});
+    /// Keeps back the reply of the message that is being handled, for a worker that has something to do for
+    /// it on another queue: until what this returns, and whatever else it returned for the message, is gone.
+    [[nodiscard]] std::shared_ptr<const void> holdReply();
     void stop();
     /// Does the next part of the stop, some milliseconds of it, and answers whether the session is stopped
     /// and what came meanwhile is done. Between two parts the queue may do anything but start the session.
@@ -122,6 +125,15 @@ public:
     getEpochTimeFromZRReportingStateMessage(const ZRReportingSessionMessage& message) noexcept;
 
 private:
+    /// Called as this goes.
+    struct HeldReply {
+        HeldReply() = default;
+        ~HeldReply();
+        HeldReply(const HeldReply&) = delete;
+        HeldReply& operator=(const HeldReply&) = delete;
+
+        ErrorReply reply;
+    };
     struct Worker {
         const WorkerClass* workerClass;
         std::shared_ptr<ZRReportingSessionWorkerProtocol> instance;
@@ -130,6 +142,9 @@ private:
     /// A message, what `make_shared` adds, and its place in the list, which grows to twice what it needs.
     static constexpr std::size_t kBytesOfMessage =
         allocatedBytes(sizeof(ZRReportingSessionMessage) + 2 * sizeof(void*)) + 2 * sizeof(MessageRef);
+
+    /// Freeing so many is worth giving the memory back to the system.
+    static constexpr std::size_t kManyMessages = 10'000;
 
     void startWorkersFromClasses(std::span<const WorkerClass* const> classes);
     void makeWorker(const WorkerClass& workerClass);
@@ -191,8 +206,9 @@ private:
     std::size_t ownRecordCount_ = 0; ///< among those recorded
     std::uint64_t droppedMessageCount_ = 0;
 
-    std::vector<Worker> messageWorkers_; ///< as they were made
-    std::unique_ptr<SessionStop> stop_;  ///< while one is under way
+    std::vector<Worker> messageWorkers_;   ///< as they were made
+    std::shared_ptr<HeldReply> heldReply_; ///< of the message that is being handled, once one is held
+    std::unique_ptr<SessionStop> stop_;    ///< while one is under way
 
     RetainedMessages::Share retained_;
 };

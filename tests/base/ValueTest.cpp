@@ -265,6 +265,21 @@ TEST(Dictionary, AllocatesOnlyForWhatIsNew) {
     EXPECT_EQ(&previous.keys(), &first.keys());
 }
 
+TEST(KeySet, FindsAmongManyKeysWithOnePrefix) {
+    for (const std::size_t count : {1U, 31U, 32U, 33U, 500U}) {
+        std::map<std::string, Value> entries;
+        for (std::size_t i = 0; i < count; ++i) {
+            entries.emplace((i % 3 == 0 ? "a common prefix " : "k") + std::to_string(i), Value(i));
+        }
+        const Dictionary dictionary = Dictionary::fromMap(entries);
+        for (const auto& [key, value] : entries) {
+            ASSERT_EQ(*dictionary.find(key), value);
+            ASSERT_EQ(dictionary.find(key + "x"), nullptr);
+            ASSERT_EQ(dictionary.find(key.substr(1)), nullptr);
+        }
+    }
+}
+
 TEST(KeySet, IsSharedBetweenThreads) {
     const Dictionary base{{"a", 1}, {"b", 2}};
     std::vector<std::jthread> threads;

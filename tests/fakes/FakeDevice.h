@@ -96,10 +96,12 @@ public:
     std::chrono::microseconds processorTime() const noexcept override { return consumed; }
     std::variant<std::uint64_t, QueryError> physicalFootprint() const override { return footprint; }
     std::array<double, 3> loadAverages() const override { return {0.5, 0.25, 0.125}; }
+    void giveBackMemory() const noexcept override { ++timesGivenBack; }
 
     std::map<pid_t, std::string> names;
     std::chrono::duration<double> uptime{1000.0};
     std::chrono::microseconds consumed{0};
+    mutable int timesGivenBack = 0;
     std::variant<std::uint64_t, QueryError> footprint = std::uint64_t{3} << 20U;
 };
 

@@ -85,6 +85,19 @@ TEST_F(RetainedTest, BeyondTheLimitOfAllTheUserWhoHasMostLosesAndNoSessionThatSt
     EXPECT_EQ(all().bytes(), 0U);
 }
 
+TEST_F(RetainedTest, MemoryIsGivenBackOnceAfterStopsOfManyMessages) {
+    device.services().limits.retainedBytesOfUser = device.services().limits.retainedBytes = 100U << 20U;
+    for (const int count : {10'100, 9'000, 10'100}) {
+        const auto session = sessionOf(1);
+        session->start();
+        send(*session, count, 1);
+        session->stop();
+    }
+    device.workQueues.elapse(std::chrono::seconds(3));
+    device.workQueues.run("com.vandra.tamblo.reporting.blocking");
+    EXPECT_EQ(device.processInformation.timesGivenBack, 1);
+}
+
 TEST_F(RetainedTest, PreviousValuesGoWithTheLastMessages) {
     const auto session = sessionOf(1);
     for (int i = 0; i < 3000; ++i) {

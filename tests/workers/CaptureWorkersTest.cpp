@@ -47,9 +47,14 @@ protected:
                       worker->handleMessage(
                           messageOf({{isOther ? "Tvac_invalid_x" : "tvac_invalid_x", 1},
                                      {"zrreporting_timestamp", 1e9 + std::stod(word.substr(isOther))}}));
+                      runQueues();
                       made += device.bugReportDrafting.requests.size() == before ? "." : "d";
                   });
         return made;
+    }
+    void runQueues() {
+        device.workQueues.run("com.vandra.tamblo.reporting.blocking");
+        device.serverQueue().runAll();
     }
     /// Whether an overload with these is captured.
     bool isCaptured(Worker& worker, const Dictionary& payload, AudioEventType type = 6,
@@ -116,6 +121,31 @@ TEST_F(CaptureWorkersTest, DraftsFiveSecondsAfterTheFirstMessageOnceInARunAndInA
     EXPECT_EQ(requests.back().processName, "");
 }
 
+TEST_F(CaptureWorkersTest, TheBeginningOfABackOffIsStoredBeforeTheDraftAndTheDraftMadeBeforeTheReply) {
+    const auto other = makeSession();
+    std::string seen;
+    for (const auto& each : {session, other}) {
+        each->start();
+        for (const double after : {0.0, 6.0}) {
+            each->sendMessage(
+                messageOf({{"tvac_invalid_x", 1}, {"zrreporting_timestamp", device.clock.seconds() + after}}),
+                [&seen](const ReplyError*) { seen += "reply "; });
+        }
+        seen += each == session ? "; " : "";
+    }
+    EXPECT_EQ(seen, "reply ; reply reply ") << "the other session is within the period";
+    const auto stored = [this] {
+        return device.preferences.copyPreferenceValue("TalvixInvalidXyQLTlastRun", kDomain);
+    };
+    EXPECT_EQ(stored(), std::nullopt);
+    device.workQueues.run("com.vandra.tamblo.reporting.blocking");
+    EXPECT_EQ(stored(), Value(device.clock.seconds()));
+    EXPECT_THAT(device.bugReportDrafting.requests, IsEmpty());
+    device.serverQueue().runAll();
+    EXPECT_THAT(device.bugReportDrafting.requests, SizeIs(1));
+    EXPECT_EQ(seen, "reply ; reply reply reply ");
+}
+
 TEST_F(CaptureWorkersTest, CapturesOverloadsOfLargeBuffersAndCycles) {
     EXPECT_FALSE(isCaptured(*tryToMake<Worker>(), overload, 6, 0x08000007));
     EXPECT_FALSE(isCaptured(*tryToMake<Worker>(), overload, 5, 7));
@@ -153,6 +183,8 @@ TEST_F(CaptureWorkersTest, NamesTheApplicationAndWaitsForMoreThanTenSeconds) {
     EXPECT_EQ(requests[0].payload, payload);
     EXPECT_EQ(requests[0].reason, "com.a");
     EXPECT_EQ(requests[1].reason, "(null)");
+    EXPECT_THAT(device.namedNotifications.posted, IsEmpty()) << "that writes a file";
+    runQueues();
     const std::string posted = "com.vandra.tamblo.dropped-stackburst";
     EXPECT_THAT(device.namedNotifications.posted, ElementsAre(posted, posted, posted));
 }

@@ -27,7 +27,20 @@ Seconds SegmentStart::until(const Value* timestamp) const noexcept {
 }
 
 bool differAsTexts(const Value* left, const Value* right) noexcept {
-    return left != nullptr && right != nullptr && left->stringValue() != right->stringValue();
+    if (left == nullptr || right == nullptr) {
+        return false;
+    }
+    if (left->isNumber() && right->isNumber()) {
+        return !(*left == *right);
+    }
+    // A number beside a text stands for the text that it is written as; anything else for an empty one.
+    const auto isAsText = [](const Value& number, const Value& text) {
+        return formatted("{}", number) == text.stringValue();
+    };
+    if (left->isNumber() || right->isNumber()) {
+        return left->isNumber() ? !isAsText(*left, *right) : !isAsText(*right, *left);
+    }
+    return left->stringValue() != right->stringValue();
 }
 
 bool differAsNumbers(const Value* left, const Value* right) noexcept {

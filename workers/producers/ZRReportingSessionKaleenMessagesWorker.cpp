@@ -72,8 +72,9 @@ bool watchedFieldChangeInMessage(const Fields& message, const Fields& previous) 
                std::invoke(read, *message[field]) != std::invoke(read, *previous[field]);
     };
     return differ(Field::running, &Value::boolValue) || differ(Field::group, &Value::integerValue) ||
-           differ(Field::channels, &Value::integerValue) || differ(Field::formatID, &Value::stringValue) ||
-           differ(Field::devices, &Value::stringValue);
+           differ(Field::channels, &Value::integerValue) ||
+           differAsTexts(message[Field::formatID], previous[Field::formatID]) ||
+           differAsTexts(message[Field::devices], previous[Field::devices]);
 }
 
 /// One walk over a session's messages.

@@ -6,6 +6,7 @@
 #include "workers/sinks/LinkmeterSummary.h"
 #include "workers/sinks/ZRReportingSessionRtcWorker.h"
 
+#include <atomic>
 #include <chrono>
 #include <utility>
 
@@ -31,6 +32,18 @@ bool isQuick(const std::vector<Dictionary>& payloads) noexcept {
 
 } // namespace
 
+/// Of all sessions. Any thread.
+struct LinkmeterAgent::WaitingBytes {
+    std::atomic<std::size_t> count{0};
+};
+
+LinkmeterAgent::Messages::~Messages() {
+    all.count.fetch_sub(bytes, std::memory_order_relaxed);
+}
+
+LinkmeterAgent::LinkmeterAgent(Context& context)
+    : context_(context), waiting_(context.shared<WaitingBytes>()) {}
+
 template <typename Piece> void LinkmeterAgent::post(Piece piece, Pace pace) {
     if (linkmeterQueue_ == nullptr) {
         linkmeterQueue_ =
@@ -49,6 +62,8 @@ void LinkmeterAgent::start(Dictionary sessionInfo, Dictionary userInfo) {
     {
         const MutexLock held(mutex_);
         toSend_.reset();
+        isSetUp_ = false;
+        isFullTold_ = false;
     }
     post([sessionInfo = std::move(sessionInfo), userInfo = std::move(userInfo)](
              LinkmeterAgent& agent) mutable { agent.setUp(std::move(sessionInfo), userInfo); });
@@ -58,14 +73,31 @@ void LinkmeterAgent::send(Message message) {
     MutexLock held(mutex_);
     const bool isFirst = toSend_ == nullptr;
     if (isFirst) {
-        toSend_ = std::make_shared<Messages>();
+        toSend_ = std::make_shared<Messages>(waiting_);
     }
-    toSend_->push_back(std::move(message));
+    if (isSetUp_ || addWaiting(message)) {
+        toSend_->list.push_back(std::move(message));
+    }
     if (isFirst) {
         const std::shared_ptr<Messages> messages = toSend_;
         held.unlock();
         post([messages](LinkmeterAgent& agent) { agent.sendAll(messages); });
     }
+}
+
+bool LinkmeterAgent::addWaiting(const Message& message) {
+    const std::size_t bytes =
+        sizeof(Message) + message.payload.bytesOfValues(Dictionary::Shared::inProportion);
+    if (waiting_.count.fetch_add(bytes, std::memory_order_relaxed) + bytes <= kMostWaitingBytes) {
+        toSend_->bytes += bytes;
+        return true;
+    }
+    waiting_.count.fetch_sub(bytes, std::memory_order_relaxed);
+    if (!std::exchange(isFullTold_, true)) {
+        log::error(ZRReportingSessionLinkmeterCategory(),
+                   "too many messages wait for back ends; what comes until they are found is lost");
+    }
+    return false;
 }
 
 void LinkmeterAgent::stop(std::optional<std::vector<Dictionary>> payloads, AudioServiceType serviceType,
@@ -100,6 +132,8 @@ void LinkmeterAgent::setUp(Dictionary sessionInfo, const Dictionary& userInfo) {
         log::error(category,
                    "newHierarchyTokenFromParentToken returned nil. Will skip rtc for this session. {}",
                    "start");
+        const MutexLock held(mutex_);
+        isSetUp_ = true;
         return;
     }
     sessionInfo.set(linkmeter::HierarchyToken, *token);
@@ -116,6 +150,7 @@ void LinkmeterAgent::waitForBackends() {
     const MutexLock held(mutex_);
     if (signals_ != 0) {
         --signals_;
+        isSetUp_ = true;
         tellWhatWasFound();
     } else if (isAbandoned_ && stopsToCome_ == 0) {
         isDropped_ = true;
@@ -142,6 +177,7 @@ void LinkmeterAgent::backendsFound(const std::optional<std::vector<std::string>>
     const MutexLock held(mutex_);
     if (isWaiting_) {
         isWaiting_ = false;
+        isSetUp_ = true;
         timeOut_.reset();
         tellWhatWasFound();
         linkmeterQueue_->resume();
@@ -159,6 +195,7 @@ void LinkmeterAgent::timeOut(std::uint64_t waitNumber) {
     const MutexLock held(mutex_);
     if (isWaiting_ && waitNumber_ == waitNumber) {
         isWaiting_ = false;
+        isSetUp_ = true;
         // Back ends that are found later still turn the worker on. It then has no session to send to, and
         // what it sends is lost quietly; this is meant.
         log::standard(ZRReportingSessionLinkmeterCategory(), "timed out waiting for backends");
@@ -174,7 +211,7 @@ void LinkmeterAgent::sendAll(const std::shared_ptr<Messages>& messages) {
             toSend_.reset();
         }
     }
-    for (Message& message : *messages) {
+    for (Message& message : messages->list) {
         if (linkmeterSessionStarted_) {
             sendMessage(std::move(message));
         } else {

@@ -31,7 +31,11 @@ public:
         AudioEventType type;
     };
 
-    explicit LinkmeterAgent(const Context& context) noexcept : context_(context) {}
+    /// Payloads of all sessions that wait until back ends are found; what comes beyond is lost, which one
+    /// error line for each run of a session tells.
+    static constexpr std::size_t kMostWaitingBytes = 16U << 20U;
+
+    explicit LinkmeterAgent(Context& context);
     LinkmeterAgent(const LinkmeterAgent&) = delete;
     LinkmeterAgent& operator=(const LinkmeterAgent&) = delete;
 
@@ -46,7 +50,21 @@ public:
     void abandon();
 
 private:
-    using Messages = std::vector<Message>;
+    struct WaitingBytes;
+    /// What one piece of work sends.
+    struct Messages {
+        explicit Messages(WaitingBytes& waiting) : all(waiting) {}
+        ~Messages();
+        Messages(const Messages&) = delete;
+        Messages& operator=(const Messages&) = delete;
+
+        std::vector<Message> list;
+        std::size_t bytes = 0; ///< that count as waiting
+        WaitingBytes& all;
+    };
+
+    /// Whether there is room for one more that has to wait.
+    [[nodiscard]] bool addWaiting(const Message& message) TAMBLO_REQUIRES(mutex_);
 
     template <typename Piece> void post(Piece piece, Pace pace = Pace::quick);
 
@@ -65,6 +83,7 @@ private:
     void sendSummary(std::vector<Dictionary> payloads, AudioServiceType serviceType, ReporterID reporterID);
 
     const Context& context_;
+    WaitingBytes& waiting_;
     std::unique_ptr<SerialQueue> linkmeterQueue_; ///< made by the first post
     std::atomic<bool> linkmeterSessionStarted_{false};
     std::atomic<bool> isDropped_{false}; ///< nobody will hear of the session any more
@@ -75,6 +94,8 @@ private:
     bool isAbandoned_ TAMBLO_GUARDED_BY(mutex_) = false;
     std::size_t stopsToCome_ TAMBLO_GUARDED_BY(mutex_) = 0;
     bool isWaiting_ TAMBLO_GUARDED_BY(mutex_) = false;
+    bool isSetUp_ TAMBLO_GUARDED_BY(mutex_) = false; ///< the wait of the latest run is over
+    bool isFullTold_ TAMBLO_GUARDED_BY(mutex_) = false;
     std::uint64_t waitNumber_ TAMBLO_GUARDED_BY(mutex_) = 0;
     std::unique_ptr<DelayedCall> timeOut_ TAMBLO_GUARDED_BY(mutex_);
     /// What the piece that was posted last will send, until it begins: of messages that many may wait, for

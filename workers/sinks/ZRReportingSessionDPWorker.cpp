@@ -1,6 +1,7 @@
 #include "workers/sinks/ZRReportingSessionDPWorker.h"
 
 #include "base/Format.h"
+#include "session/BlockingWork.h"
 #include "session/ZRReportingSession.h"
 #include "util/AudioEvents.h"
 #include "util/Log.h"
@@ -134,9 +135,10 @@ void ZRReportingSessionDPWorker::capture(ZRReportingSessionMessage& message, dou
                                                  .reason = std::move(reason),
                                                  .payload = std::move(payload),
                                                  .options = {1, 1, 0, 0, 0}});
-    // Whether somebody could be told changes nothing here.
-    static_cast<void>(
-        platform().namedNotifications->PostNamedNotification("com.vandra.tamblo.dropped-stackburst"));
+    // Posting writes a file. Whether somebody could be told changes nothing here.
+    context().shared<BlockingWork>(platform()).post([&notifications = *platform().namedNotifications] {
+        static_cast<void>(notifications.PostNamedNotification("com.vandra.tamblo.dropped-stackburst"));
+    });
     log::info(ZRReportingDPLogCategory(), "Dropped stackburst");
     lastMessageTime_ = now;
 }

@@ -1,10 +1,14 @@
 #include "workers/sinks/ZRReportingSessionQuilletWorker.h"
 
+#include "base/Mutex.h"
+#include "session/BlockingWork.h"
 #include "session/ZRReportingSession.h"
 #include "util/Log.h"
 #include "workers/ZRReportingSessionWorkerUtility.h"
 #include "workers/sinks/CapturePreferences.h"
 
+#include <functional>
+#include <map>
 #include <optional>
 #include <string>
 #include <utility>
@@ -38,6 +42,36 @@ void draftCreated(const std::optional<std::string>& error) {
 
 } // namespace
 
+/// The beginnings of back-off periods, by the preference's key, that are being stored. Any thread.
+struct ZRReportingSessionQuilletWorker::Beginnings {
+    struct Beginning {
+        double time = 0.0;
+        unsigned count = 0; ///< that are being stored
+    };
+
+    [[nodiscard]] std::optional<Value> find(std::string_view key) {
+        const MutexLock lock(mutex);
+        const auto found = underWay.find(key);
+        return found != underWay.end() ? std::optional<Value>(found->second.time) : std::nullopt;
+    }
+    void begin(std::string_view key, double time) {
+        const MutexLock lock(mutex);
+        Beginning& beginning = underWay[std::string(key)];
+        beginning.time = time;
+        ++beginning.count;
+    }
+    void stored(std::string_view key) {
+        const MutexLock lock(mutex);
+        const auto found = underWay.find(key);
+        if (--found->second.count == 0) {
+            underWay.erase(found);
+        }
+    }
+
+    Mutex mutex;
+    std::map<std::string, Beginning, std::less<>> underWay TAMBLO_GUARDED_BY(mutex);
+};
+
 std::shared_ptr<ZRReportingSessionWorkerProtocol>
 ZRReportingSessionQuilletWorker::initWithSession(Context& context,
                                                  const std::shared_ptr<ZRReportingSession>& session) {
@@ -57,7 +91,9 @@ ZRReportingSessionQuilletWorker::initWithSession(Context& context,
 ZRReportingSessionQuilletWorker::ZRReportingSessionQuilletWorker(Context& context,
                                                                  std::weak_ptr<ZRReportingSession> session,
                                                                  std::chrono::duration<double> backOffTime)
-    : ZRReportingSessionWorkerConsumerProtocol(context, std::move(session)), backOffTime_(backOffTime) {}
+    : ZRReportingSessionWorkerConsumerProtocol(context, std::move(session)),
+      beginnings_(context.shared<Beginnings>()),
+      backOffTime_(backOffTime) {}
 
 void ZRReportingSessionQuilletWorker::handleMessage(const MessageRef& message) {
     if (message == nullptr || !interestedInMessage(*message)) {
@@ -76,8 +112,17 @@ void ZRReportingSessionQuilletWorker::handleMessage(const MessageRef& message) {
     // Empty for a process that had exited before its name could be had.
     const std::string processName =
         owner != nullptr ? owner->clientProcessName().value_or(std::string()) : std::string();
-    platform().bugReportDrafting->createDraft(tikletDraftForTalvixXYerror(), processName, kDisplayReason,
-                                              draftCreated);
+    // Behind the storing of the period's beginning; then on the server queue, whose batches are written out
+    // before replies go.
+    context()
+        .shared<BlockingWork>(platform())
+        .post([&context = context(), processName,
+               reply = owner != nullptr ? owner->holdReply() : nullptr]() mutable {
+            context.serverQueue().post([&context, processName, reply = std::move(reply)] {
+                context.platform().bugReportDrafting->createDraft(tikletDraftForTalvixXYerror(), processName,
+                                                                  kDisplayReason, draftCreated);
+            });
+        });
 }
 
 void ZRReportingSessionQuilletWorker::stop() {
@@ -101,14 +146,23 @@ bool ZRReportingSessionQuilletWorker::interestedInMessage(const ZRReportingSessi
 bool ZRReportingSessionQuilletWorker::hasRunInTimeframe(std::chrono::duration<double> backOff,
                                                         std::string_view defaultsKey) {
     const double now = secondsSince1970(platform().clock->now());
-    const auto lastRun = numberPreference(context(), defaultsKey, ZRReportingSessionCategory());
+    auto lastRun = beginnings_.find(defaultsKey);
+    if (!lastRun) {
+        lastRun = numberPreference(context(), defaultsKey, ZRReportingSessionCategory());
+    }
     if (lastRun && lastRun->doubleValue() > now - backOff.count()) {
         log::debug(ZRReportingSessionCategory(), "Quillet has run. key={} lastRun={}", defaultsKey, *lastRun);
         return true;
     }
     log::debug(ZRReportingSessionCategory(), "Quillet has not run. key={} backoffSeconds={}", defaultsKey,
                backOff.count());
-    capturePreferences(context()).setValue(defaultsKey, now);
+    beginnings_.begin(defaultsKey, now);
+    context()
+        .shared<BlockingWork>(platform())
+        .post([&context = context(), &beginnings = beginnings_, key = std::string(defaultsKey), now] {
+            capturePreferences(context).setValue(key, now);
+            beginnings.stored(key);
+        });
     return false;
 }
 

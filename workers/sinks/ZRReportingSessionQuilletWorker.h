@@ -15,7 +15,8 @@ namespace tamblo {
 ///
 /// A session's first message arms the worker: it looks at messages from five seconds after that one on. The
 /// period begins when a message is of interest, before the draft is asked for, so that one that fails is not
-/// asked for again.
+/// asked for again. Storing its beginning may wait for a disk and is done on another queue; the draft, and
+/// the reply to the message, come when that is done.
 class ZRReportingSessionQuilletWorker final : public ZRReportingSessionWorkerConsumerProtocol {
 public:
     ZRReportingSessionQuilletWorker(Context& context, std::weak_ptr<ZRReportingSession> session,
@@ -30,11 +31,15 @@ public:
 
     /// Whether the message is worth a draft. Arms the worker, or begins the back-off period.
     [[nodiscard]] bool interestedInMessage(const ZRReportingSessionMessage& message);
-    /// Whether the time under the key is less than the back-off ago; if not, it is set to now.
+    /// Whether the time under the key is less than the back-off ago; if not, it is set to now,
+    /// for whoever asks here; soon for others.
     [[nodiscard]] bool hasRunInTimeframe(std::chrono::duration<double> backOff, std::string_view defaultsKey);
     [[nodiscard]] static BugReportDraft tikletDraftForTalvixXYerror();
 
 private:
+    struct Beginnings;
+
+    Beginnings& beginnings_;
     const std::chrono::duration<double> backOffTime_;
     double minimumMessageTime_ = -1.0; ///< seconds since 1970; armed when above 0
     bool hasRun_ = false;

@@ -15,10 +15,12 @@ using Fields = PayloadFields<Field>;
 constexpr Fields::Keys kKeys{ZRReportingInternalEventEpochTime, kOutputRunningKey, kInputRunningKey,
                              ZRReportingMessageKeySessionDuration, kIssueTypeKey};
 
+} // namespace
+
 /// One walk over a session's messages.
-class MarkWalk {
+class MarkSearch::Walk {
 public:
-    explicit MarkWalk(SessionTrace& trace) : trace_(trace) {}
+    explicit Walk(SessionTrace& trace) : trace_(trace) {}
 
     void take(const ZRReportingSessionMessage& message) {
         const Fields fields(message.payload(), places_);
@@ -41,7 +43,7 @@ public:
 private:
     /// Whether one of output and input runs, and since when.
     struct Running {
-        void take(MarkWalk& walk, const Fields& message, WallTime time) {
+        void take(Walk& walk, const Fields& message, WallTime time) {
             const bool runs = message.holds(field) ? message.isTrue(field)
                                                    : since.has_value() && !message.holds(Field::duration);
             if (!runs) {
@@ -50,7 +52,7 @@ private:
                 since = time;
             }
         }
-        void end(MarkWalk& walk, WallTime time) {
+        void end(Walk& walk, WallTime time) {
             if (since && *since < time && walk.hasRoom()) {
                 stretches.push_back({*since, time});
             }
@@ -87,14 +89,24 @@ private:
     Running input_{Field::input, trace_.input};
 };
 
-} // namespace
+MarkSearch::MarkSearch(SessionTrace& trace) : walk_(std::make_unique<Walk>(trace)) {}
+
+MarkSearch::~MarkSearch() = default;
+
+void MarkSearch::take(const ZRReportingSessionMessage& message) {
+    walk_->take(message);
+}
+
+void MarkSearch::finish() {
+    walk_->finish();
+}
 
 void addMarks(SessionTrace& trace, std::span<const MessageRef> messages) {
-    MarkWalk walk(trace);
+    MarkSearch search(trace);
     for (const MessageRef& message : messages) {
-        walk.take(*message);
+        search.take(*message);
     }
-    walk.finish();
+    search.finish();
 }
 
 } // namespace tamblo

@@ -7,6 +7,7 @@
 
 #include <cstddef>
 #include <cstdint>
+#include <memory>
 #include <optional>
 #include <span>
 #include <string>
@@ -51,5 +52,22 @@ struct SessionTrace {
 /// ends both. Times outside the recording are moved to its begin or end, and stretches without length are
 /// left out.
 void addMarks(SessionTrace& trace, std::span<const MessageRef> messages);
+
+/// The same for messages that come a few at a time. The trace must stay where it is.
+class MarkSearch {
+public:
+    explicit MarkSearch(SessionTrace& trace);
+    ~MarkSearch();
+    MarkSearch(const MarkSearch&) = delete;
+    MarkSearch& operator=(const MarkSearch&) = delete;
+
+    void take(const ZRReportingSessionMessage& message);
+    /// After the last one.
+    void finish();
+
+private:
+    class Walk;
+    const std::unique_ptr<Walk> walk_;
+};
 
 } // namespace tamblo

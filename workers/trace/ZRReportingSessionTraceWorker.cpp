@@ -5,6 +5,8 @@
 #include "workers/ReportFileName.h"
 #include "workers/trace/ChromeTrace.h"
 
+#include <algorithm>
+#include <cstddef>
 #include <string>
 #include <utility>
 #include <variant>
@@ -74,23 +76,44 @@ std::optional<bool> ZRReportingSessionTraceWorker::start() {
     return recording_ != nullptr;
 }
 
-void ZRReportingSessionTraceWorker::stop() {
+std::unique_ptr<ZRReportingSessionTraceWorker::Ending>
+ZRReportingSessionTraceWorker::end(const ZRReportingSession& session) {
+    auto ending = std::make_unique<Ending>();
+    ending->stoppedAt = platform().clock->now();
+    SessionTrace& trace = ending->trace;
+    trace.reporterID = session.reporterID();
+    trace.serviceName = session.serviceName();
+    trace.applicationName = ZRReportingUtilityRetrieveAppName(session.configuration());
+    trace.recorded = recording_->take(ending->stoppedAt);
+    trace.processNames = {session.clientProcessName().value_or("")};
+    trace.processNames.resize(trace.recorded.processes.size());
+    return ending;
+}
+
+bool ZRReportingSessionTraceWorker::stopSome() {
+    constexpr std::size_t kMessagesOfPart = 20'000;
     const std::shared_ptr<ZRReportingSession> owner = session();
-    const std::unique_ptr<ProcessSampler::Recording> recording = std::move(recording_);
-    if (owner == nullptr || recording == nullptr) {
-        return;
+    if (owner == nullptr || recording_ == nullptr) {
+        recording_.reset();
+        return true;
     }
-    const WallTime now = platform().clock->now();
-    auto trace = std::make_unique<SessionTrace>();
-    trace->reporterID = owner->reporterID();
-    trace->serviceName = owner->serviceName();
-    trace->applicationName = ZRReportingUtilityRetrieveAppName(owner->configuration());
-    trace->recorded = recording->take(now);
-    trace->processNames = {owner->clientProcessName().value_or("")};
-    trace->processNames.resize(trace->recorded.processes.size());
-    addMarks(*trace, owner->messages());
-    recording->runLater(
-        [&device = platform(), trace = std::move(trace), now] { deliver(device, *trace, now); });
+    if (ending_ == nullptr) {
+        ending_ = end(*owner);
+    }
+    const std::vector<MessageRef>& messages = owner->messages();
+    const std::size_t last = std::min(messages.size(), ending_->looked + kMessagesOfPart);
+    for (; ending_->looked < last; ++ending_->looked) {
+        ending_->search.take(*messages[ending_->looked]);
+    }
+    if (ending_->looked < messages.size()) {
+        return false;
+    }
+    ending_->search.finish();
+    recording_->runLater([&device = platform(), ending = std::move(ending_)] {
+        deliver(device, ending->trace, ending->stoppedAt);
+    });
+    recording_.reset();
+    return true;
 }
 
 } // namespace tamblo

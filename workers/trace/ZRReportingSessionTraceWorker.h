@@ -2,7 +2,9 @@
 
 #include "session/ZRReportingSessionWorkerProtocol.h"
 #include "workers/trace/ProcessSampler.h"
+#include "workers/trace/SessionTrace.h"
 
+#include <cstddef>
 #include <memory>
 #include <optional>
 
@@ -24,9 +26,24 @@ public:
     initWithSession(Context& context, const std::shared_ptr<ZRReportingSession>& session);
 
     std::optional<bool> start() override;
-    void stop() override;
+    void stop() override {
+        while (!stopSome()) {
+        }
+    }
+    [[nodiscard]] bool stopSome() override;
 
 private:
+    /// What there is of the file while the stop is under way.
+    struct Ending {
+        SessionTrace trace;
+        WallTime stoppedAt;
+        MarkSearch search{trace};
+        std::size_t looked = 0; ///< messages of the session
+    };
+
+    [[nodiscard]] std::unique_ptr<Ending> end(const ZRReportingSession& session);
+
+    std::unique_ptr<Ending> ending_;
     std::unique_ptr<ProcessSampler::Recording> recording_;
 };
 

@@ -32,6 +32,7 @@ public:
     /// them at any time and read them again. An error's code is an `errno`.
     [[nodiscard]] std::variant<std::uint64_t, QueryError> physicalFootprint() const override;
     [[nodiscard]] std::array<double, 3> loadAverages() const override;
+    void giveBackMemory() const noexcept override;
 
 private:
     const ProcessFiles files_;
