@@ -245,7 +245,10 @@ TEST(ConnectionService, EndsAClientWhoseSocketCannotBeWatchedAndServesTheOthers)
     FakeLog log;
     additions = 0;
     EventLoop loop(refusingControl);
-    LinuxConnectionService service(loop, log);
+    const FakeClock clock;
+    const Limits limits;
+    LinuxConnectionService service(loop, clock, log, limits);
+    loop.setTurns([&] { return service.readSome(); });
     LinuxWorkQueues queues;
     const auto requests = queues.makeSerialQueue("requests");
     Delegate delegate;
