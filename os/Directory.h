@@ -32,7 +32,7 @@ namespace tamblo {
 struct DirectoryEntries {
     /// Of more than `most` entries, any so many.
     [[nodiscard]] static DirectoryEntries read(const std::string& path, std::size_t most);
-    [[nodiscard]] static DirectoryEntries read(int directory, std::size_t most);
+    [[nodiscard]] static DirectoryEntries read(int descriptor, std::size_t most);
 
     int error = 0; ///< 0 or an `errno`
     bool isCut = false;

@@ -171,6 +171,19 @@ TEST_F(LinuxChanlogTest, LimitsHoldAndAreToldOnce) {
     EXPECT_THAT(log.take(), ElementsAre(HasSubstr("/c1256.json: more than 256 files")));
 }
 
+TEST_F(LinuxChanlogTest, WhatCannotBeReadCountsAsItWas) {
+    publish("a.json", simples({{"a", 1}}));
+    EXPECT_EQ(now(), "a=1");
+    const std::string path = root.path("chanlog/a.json");
+    std::filesystem::remove(path);
+    std::filesystem::create_symlink("a.json", path);
+    std::filesystem::rename(root.path("chanlog"), root.path("away"));
+    std::filesystem::create_symlink("chanlog", root.path("chanlog"));
+    EXPECT_EQ(now(), "a=1");
+    EXPECT_EQ(now(), "a=1");
+    EXPECT_THAT(log.take(), ElementsAre(HasSubstr("symbolic links; what was read there before counts")));
+}
+
 /// A histogram where there are buckets, else a simple channel, which may have states, too.
 std::shared_ptr<ChanlogChannel> channelOf(const char* name, std::int64_t value,
                                           std::vector<ChanlogState> states = {},

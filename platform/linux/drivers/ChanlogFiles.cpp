@@ -35,10 +35,14 @@ bool ChanlogFiles::read(StructuredLog& log) {
         return readFiles(entries.names, log);
     }
     const bool isMissing = entries.error == ENOENT || entries.error == ENOTDIR;
-    const std::string fault = entries.isCut ? formatted("more than {} entries", kMaximumEntries)
-                                            : std::generic_category().message(entries.error);
+    if (entries.error != 0 && !isMissing) {
+        report(log, formatted("{}: {}; what was read there before counts until it can be read", directory_,
+                              std::generic_category().message(entries.error)));
+        return false;
+    }
     report(log, isMissing ? std::string()
-                          : formatted("{}: {}; no driver statistics are had from there", directory_, fault));
+                          : formatted("{}: more than {} entries; no driver statistics are had from there",
+                                      directory_, kMaximumEntries));
     return !std::exchange(files_, {}).empty();
 }
 
@@ -75,10 +79,13 @@ bool ChanlogFiles::readFile(File& file, const FileState& state, StructuredLog& l
     if (file.json.isCurrent(state)) {
         return false;
     }
-    const bool hadChannels = !file.channels.empty();
-    file.channels.clear();
+    auto earlier = std::exchange(file.channels, {});
     readChannels(file, log);
-    return hadChannels || !file.channels.empty();
+    if (file.json.isUnreadable()) {
+        file.channels = std::move(earlier);
+        return false;
+    }
+    return !earlier.empty() || !file.channels.empty();
 }
 
 void ChanlogFiles::readChannels(File& file, StructuredLog& log) {

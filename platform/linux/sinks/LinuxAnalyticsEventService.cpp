@@ -87,8 +87,8 @@ void LinuxAnalyticsEventService::sendEventLazy(std::string_view eventName,
 }
 
 void LinuxAnalyticsEventService::format(TextBuffer& lines, std::string_view eventName, Dictionary&& payload) {
-    // Of the lines that wait, if any, the last one is the one that was formatted last.
-    if (!lines.empty() && payload.sharesStorageWith(lastLine_.payload)) {
+    // The line that was formatted last stands there unless it was written out, or taken back as too long.
+    if (lastLine_.end < lines.size() && payload.sharesStorageWith(lastLine_.payload)) {
         appendAgain(lines, lastLine_.begin, lastLine_.nameBegin);
         appendJsonString(lines, eventName);
         appendAgain(lines, lastLine_.nameEnd, lastLine_.end);
