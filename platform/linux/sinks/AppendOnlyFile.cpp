@@ -242,7 +242,9 @@ bool AppendOnlyFile::openFile(IfMissing ifMissing) {
     if (descriptor < 0 && errno == ENOENT && ifMissing == IfMissing::create) {
         const mode_t mode = sinks_.modes_.file;
         descriptor = operations_.open(directory_->get(), name_.c_str(), kFlags | O_CREAT | O_EXCL, mode);
-        static_cast<void>(::fchmod(descriptor, mode)); // whatever the process's mask is
+        if (descriptor >= 0) {
+            static_cast<void>(::fchmod(descriptor, mode)); // whatever the process's mask is
+        }
     }
     if (descriptor < 0) {
         return failed("open");
