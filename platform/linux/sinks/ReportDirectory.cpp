@@ -6,7 +6,6 @@
 #include <algorithm>
 #include <cerrno>
 #include <system_error>
-#include <tuple>
 #include <utility>
 
 #include <fcntl.h>
@@ -204,25 +203,30 @@ void ReportDirectory::makeRoom(std::size_t files, std::uint64_t bytes) {
         return; // ages are looked at with each new report
     }
     const WallTime now = clock_.now();
-    for (const Reports::iterator report : inOrderOfRemoval(now)) {
-        if (isOver(files, bytes) || report->second.modified < now - limits_.age) {
-            remove(report);
+    for (;;) {
+        const bool isTooMuch = isOver(files, bytes);
+        // By age alone, what is of a time to come is the youngest.
+        const auto report = firstToGo(isTooMuch ? now : WallTime::max());
+        if (report == reports_.end() || (!isTooMuch && report->second.modified >= now - limits_.age)) {
+            return;
         }
+        remove(report);
     }
 }
 
-std::vector<ReportDirectory::Reports::iterator> ReportDirectory::inOrderOfRemoval(WallTime now) {
-    std::vector<Reports::iterator> order;
+/// Of those that nobody writes: what is of a time after `now`, then the oldest.
+ReportDirectory::Reports::iterator ReportDirectory::firstToGo(WallTime now) {
+    auto first = reports_.end();
+    const auto rank = [now](const Report& report) {
+        return std::pair(report.modified <= now, report.modified);
+    };
     for (auto report = reports_.begin(); report != reports_.end(); ++report) {
-        if (report->second.writers == 0) {
-            order.push_back(report);
+        if (report->second.writers == 0 &&
+            (first == reports_.end() || rank(report->second) < rank(first->second))) {
+            first = report;
         }
     }
-    std::ranges::sort(order, std::less(), [now](const Reports::iterator& report) {
-        const WallTime modified = report->second.modified;
-        return std::tuple(modified <= now, modified, std::string_view(report->first));
-    });
-    return order;
+    return first;
 }
 
 void ReportDirectory::lookAgain() {

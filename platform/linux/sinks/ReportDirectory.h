@@ -17,7 +17,6 @@
 #include <string>
 #include <string_view>
 #include <variant>
-#include <vector>
 
 #include <dirent.h>
 
@@ -80,7 +79,7 @@ private:
     [[nodiscard]] bool isOver(std::size_t files, std::uint64_t bytes) const TAMBLO_REQUIRES(mutex_) {
         return reports_.size() + files > limits_.files || bytes_ + bytes > limits_.bytes;
     }
-    [[nodiscard]] std::vector<Reports::iterator> inOrderOfRemoval(WallTime now) TAMBLO_REQUIRES(mutex_);
+    [[nodiscard]] Reports::iterator firstToGo(WallTime now) TAMBLO_REQUIRES(mutex_);
     void lookAgain() TAMBLO_REQUIRES(mutex_);
     void remove(Reports::iterator report) TAMBLO_REQUIRES(mutex_);
     void forget(Reports::iterator report) TAMBLO_REQUIRES(mutex_);
