@@ -39,16 +39,13 @@ add_link_options(-Wl,--gc-sections)
 # Log lines and assertions name files as the checkout does, wherever it was built.
 add_compile_options("-fmacro-prefix-map=${CMAKE_SOURCE_DIR}/=")
 
-# Hardened as Debian hardens what it builds. Sanitizers look for more than this finds, and get in its way.
+# Hardened as Debian hardens what it builds. Not the marked targets of jumps and calls (-fcf-protection): they cost an
+# instruction in each function, and protect nothing where the C library is built without. Sanitizers look for more than
+# all this finds, and get in its way.
 if(NOT TAMBLO_SANITIZE AND NOT TAMBLO_FUZZ)
     include(CheckPIESupported)
     check_pie_supported()
     add_compile_options(-fstack-protector-strong -fstack-clash-protection -Wformat -Werror=format-security)
-    if(CMAKE_SYSTEM_PROCESSOR MATCHES "x86_64|AMD64|i[3-6]86")
-        add_compile_options(-fcf-protection)
-    elseif(CMAKE_SYSTEM_PROCESSOR MATCHES "aarch64|arm64")
-        add_compile_options(-mbranch-protection=standard)
-    endif()
     # The C library's checks need the optimiser.
     add_compile_options("$<$<NOT:$<CONFIG:Debug>>:-U_FORTIFY_SOURCE;-D_FORTIFY_SOURCE=2>")
     add_link_options(-Wl,-z,relro,-z,now)
