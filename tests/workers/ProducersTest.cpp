@@ -128,7 +128,8 @@ TEST_F(ProducersTest, GroupSessionSegments) {
             {"a number beside a text, and another number, are changes; the same written otherwise is none",
              "0 out group=1 formatID=aac; 10 formatID=2; 20 formatID=\"2\"; 30 formatID=2; 40 formatID=1;"
              "50 formatID=1.0 devices=1; 60 devices=\"1\"; 70 devices=2; 80 out=false",
-             "10.0 aac -1 unknown 1 5; 30.0 2 -1 unknown 2 5; 30.0 1 -1 unknown 3 5; 10.0 1.0 -1 unknown 4 5"},
+             "10.0 aac -1 unknown 1 4; 30.0 2 -1 unknown 2 4; 30.0 1.0 -1 unknown 3 4; 10.0 1.0 -1 unknown 4 "
+             "4"},
             {"joining and leaving while output runs, as it did before; exactly the minimum is too short",
              "-50 out | 0 out; 10 group=1; 20 group=0; 30 group=1; 35 group=0; 60 length=1",
              "10.0 unknown -1 unknown 1 1"},

@@ -120,10 +120,10 @@ TEST_F(SessionFilesTest, ASummaryIsBoundedAndMadeInParts) {
         ++parts;
     }
     EXPECT_EQ(parts, 16) << "each of one message, as large as it is; those that are left out need none";
-    const std::string& summary = files.files.begin()->second;
-    EXPECT_LT(summary.size(), kMost);
-    EXPECT_GT(summary.size(), kMost - text.size() - 1000);
-    EXPECT_TRUE(summary.ends_with("}\n]\n"));
+    const std::string& written = files.files.begin()->second;
+    EXPECT_LT(written.size(), kMost);
+    EXPECT_GT(written.size(), kMost - text.size() - 1000);
+    EXPECT_TRUE(written.ends_with("}\n]\n"));
     EXPECT_EQ(device.log.count("SummaryJsonFileWorker left out messages, as the file is full. file=" +
                                files.files.begin()->first + " messages=3"),
               1U);
