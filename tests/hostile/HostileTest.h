@@ -50,14 +50,9 @@ protected:
 
     /// In the analytics sink's files, wherever they were moved, under the first of its messages' two names.
     [[nodiscard]] std::size_t bystandersLines() const {
-        std::size_t count = 0;
-        for (const auto& file : std::filesystem::directory_iterator(service_->logs())) {
-            for (const std::string& line : linesOf(file.is_regular_file() ? file.path() : "")) {
-                count +=
-                    line.find("com.vandra.tamblo.Playback.Start") < 64 && countOf("\"bystander\":", line);
-            }
-        }
-        return count;
+        return std::stoul(run("cat " + (service_->logs() / "analytics-events.jsonl*").string() +
+                              " | grep -a '\"bystander\":' | grep -ac tamblo.Playback.Start")
+                              .output);
     }
     [[nodiscard]] std::size_t peakBytes() const {
         const std::string status = contentOf("/proc/" + std::to_string(service_->pid()) + "/status");

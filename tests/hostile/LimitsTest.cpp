@@ -14,6 +14,8 @@ struct Refused {
     int value;
     std::vector<wire::Request> within;
     wire::Request beyond;
+
+    friend void PrintTo(const Refused& row, std::ostream* out) { *out << row.limit; }
 };
 
 wire::Request configuration(std::string key, std::size_t bytes, std::int64_t reporterID = 7) {
@@ -129,29 +131,33 @@ TEST_F(Hostile, ConnectionsBeyondTheUsersAreToldSoAndEnd) {
 }
 
 TEST_F(Hostile, FramesThatDoNotGoOnEndTheirConnectionsByName) {
-    ServiceProcess& service = start("\"unfinished_bytes_of_user\": 100000, \"frame_seconds\": 1");
-    RawClient slow(service.socketPath()), first(service.socketPath()), second(service.socketPath());
+    ServiceProcess& service = start("\"unfinished_bytes_of_user\": 1000000, \"frame_seconds\": 1");
     const auto expectEnd = [](RawClient& client, std::string_view limit) {
         const auto reply = client.receive();
         EXPECT_THAT(reply, RefusesBy(limit));
         EXPECT_EQ(reply ? reply->id : 1, 0U);
         EXPECT_TRUE(client.isClosedByService());
     };
-    // What fits for one of a user does not for two.
-    const std::string unfinished = std::string("\0\0\x10\0", 4) + std::string(70'000, 'x');
-    first.send(unfinished);
+    // What fits for some of a user does not for all.
+    const std::string unfinished = std::string("\x80\x38\x01\0", 4) + std::string(70'000, 'x');
+    std::list<RawClient> clients;
+    for (int i = 0; i < 16; ++i) {
+        clients.emplace_back(service.socketPath()).send(unfinished);
+        ASSERT_TRUE(bystanderIsServed());
+    }
+    expectEnd(clients.back(), "unfinished_bytes_of_user");
+    EXPECT_FALSE(clients.front().isReadable(0));
+    clients.erase(std::next(clients.begin()), clients.end());
     ASSERT_TRUE(bystanderIsServed());
-    second.send(unfinished);
-    expectEnd(second, "unfinished_bytes_of_user");
-    EXPECT_FALSE(first.isReadable(0));
     // One that goes on may take longer.
+    RawClient slow(service.socketPath());
     const std::string frame = framesOf(request(Method::getAllReporters));
     for (const char byte : frame) {
         slow.send({&byte, 1});
         ::usleep(static_cast<useconds_t>(1'500'000 / frame.size()));
     }
     EXPECT_THAT(slow.receive(), IsDone());
-    expectEnd(first, "frame_seconds");
+    expectEnd(clients.front(), "frame_seconds");
 }
 
 TEST_F(Hostile, RepliesThatNobodyReadsEndTheirConnection) {
