@@ -3,6 +3,7 @@
 #include "Demand.h"
 #include "platform/linux/device/BluetoothRecord.h"
 
+#include <algorithm>
 #include <cstdint>
 
 extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* bytes, std::size_t size) {
@@ -11,7 +12,7 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* bytes, std::size_t siz
     const BluetoothRecord record = BluetoothRecord::parse(text);
     const std::string model = record.model();
     fuzz::demand(model.empty() != record.identity.has_value());
-    fuzz::demand(model.empty() || model.starts_with("bluetooth:"));
+    fuzz::demand(std::ranges::count(model, ':') == (model.empty() ? 0 : 3));
     fuzz::demand(record.deviceClass || record.appearance || !record.isEarbud());
     // What is said once counts as often as it is said.
     const BluetoothRecord again = BluetoothRecord::parse(std::string(text) + "\n[General]\nIgnored=1\n");

@@ -7,6 +7,7 @@
 #include <cerrno>
 #include <charconv>
 #include <csignal>
+#include <filesystem>
 #include <fstream>
 #include <stdexcept>
 #include <string_view>
@@ -137,6 +138,12 @@ std::uint64_t CrashedService::toldLosses() const {
         }
     }
     return told;
+}
+
+std::uint64_t CrashedService::bytesLogged() const {
+    std::error_code ignored;
+    const auto size = std::filesystem::file_size(directory_.path() + "/log", ignored);
+    return ignored ? 0 : size;
 }
 
 void CrashedService::limitFiles(std::uint64_t bytes) const {

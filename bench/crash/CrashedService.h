@@ -30,6 +30,7 @@ public:
     [[nodiscard]] std::string logsDirectory() const { return directory_.path() + "/logs"; }
     /// How many lost records the log has told of so far.
     [[nodiscard]] std::uint64_t toldLosses() const;
+    [[nodiscard]] std::uint64_t bytesLogged() const;
 
     /// No file grows beyond this from now on.
     void limitFiles(std::uint64_t bytes) const;

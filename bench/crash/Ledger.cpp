@@ -1,6 +1,14 @@
 #include "Ledger.h"
 
+#include <cstdio>
+
 namespace tamblo::bench {
+
+namespace {
+
+constexpr std::uint64_t kMostTold = 20;
+
+} // namespace
 
 Ledger::Ledger() : states_(new std::atomic<std::uint8_t>[kClients * kMostRecords]()) {}
 
@@ -35,7 +43,14 @@ const Ledger::Verdict& Ledger::judge() {
             ++verdict_.answered;
             const unsigned wanted = kFoundEvent | (makesPowerEvent(number) ? kFoundPower : 0U);
             if ((state & wanted) != wanted) {
-                ++((state & kMayBeLost) != 0 ? verdict_.excused : verdict_.missing);
+                const bool isExcused = (state & kMayBeLost) != 0;
+                ++(isExcused ? verdict_.excused : verdict_.missing);
+                if (!isExcused && verdict_.missing <= kMostTold) {
+                    std::fprintf(stderr, "tamblo_crash: record %llu of client %zu is missing (found: %s%s)\n",
+                                 static_cast<unsigned long long>(number), client,
+                                 (state & kFoundEvent) != 0 ? "event " : "",
+                                 (state & kFoundPower) != 0 ? "power event" : "");
+                }
             }
         }
         lastJudged_[client] = lastSent_[client];

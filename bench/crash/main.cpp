@@ -8,6 +8,7 @@
 #include "SinkReader.h"
 #include "os/FileDescriptor.h"
 
+#include <algorithm>
 #include <array>
 #include <charconv>
 #include <chrono>
@@ -71,6 +72,13 @@ private:
         std::this_thread::sleep_for(microseconds(below(mostMicroseconds)));
     }
 
+    void require(bool holds, const char* otherwise) {
+        if (!holds) {
+            std::fprintf(stderr, "tamblo_crash: %s\n", otherwise);
+            isGood_ = false;
+        }
+    }
+
     /// One life of the service, with all that may happen in it.
     void live() {
         CrashControl control;
@@ -94,7 +102,7 @@ private:
         endInOrder_ = below(10) == 0;
         if (endInOrder_) {
             control.isOver = true;
-            isGood_ = service_.stop() && isGood_;
+            require(service_.stop(), "the service does not end in order");
         } else {
             service_.kill();
             ++kills_;
@@ -125,9 +133,13 @@ private:
         struct stat status {};
         const std::string& path = readers_[below(readers_.size())].path();
         if (::stat(path.c_str(), &status) == 0) {
-            ++control.roomChanges;
+            control.roomChanges += CrashControl::hasRoom(control.roomChanges) ? 1U : 0U;
             ++outages_;
-            service_.limitFiles(static_cast<std::uint64_t>(status.st_size) + below(100'000));
+            // The log, too, is a file, and shall tell.
+            constexpr std::uint64_t kRoomOfLog = 64U << 10U;
+            service_.limitFiles(
+                std::max(static_cast<std::uint64_t>(status.st_size), service_.bytesLogged() + kRoomOfLog) +
+                below(100'000));
             sleepFor(20'000);
             if (below(3) != 0) { // else it is killed while the disk is full
                 service_.liftLimit();
@@ -157,8 +169,7 @@ private:
         }
         service_.start();
         if (!service_.awaitReady()) {
-            std::fprintf(stderr, "tamblo_crash: the service does not start again\n");
-            isGood_ = false;
+            require(false, "the service does not start again");
             return;
         }
         for (std::size_t i = 0; i < readers_.size(); ++i) {
@@ -166,12 +177,13 @@ private:
         }
         verdict_ = ledger_.judge();
         const std::uint64_t broken = readers_[0].brokenLines() + readers_[1].brokenLines();
-        isGood_ = isGood_ && verdict_.missing == 0 && verdict_.strange == 0 && broken == 0;
+        require(verdict_.missing == 0, "answered records are missing");
+        require(verdict_.strange == 0, "records stand twice or out of order");
+        require(broken == 0, "lines are broken");
         // What is lost without a word is lost with the process that would have told.
         const std::uint64_t told = service_.toldLosses();
-        if (endInOrder_) {
-            isGood_ = isGood_ && verdict_.excused - excusedBefore_ <= told - toldBefore_;
-        }
+        require(!endInOrder_ || verdict_.excused - excusedBefore_ <= told - toldBefore_,
+                "records are lost of which nothing was told");
         excusedBefore_ = verdict_.excused;
         toldBefore_ = told;
     }
