@@ -24,6 +24,8 @@ namespace {
 // Remembering stops at these limits, so that a client that invents keys cannot make the process grow; what is
 // not remembered is made anew each time.
 constexpr std::uint32_t kMaximumTransitionsOfOne = 8;
+/// Dictionaries that the service itself builds begin with one of some dozens of keys.
+constexpr std::uint32_t kMaximumTransitionsOfEmpty = 64;
 constexpr std::uint32_t kMaximumTransitionsOfAll = 4096;
 constexpr std::uint32_t kMaximumKeysToRemember = 64;
 
@@ -190,7 +192,7 @@ void KeySet::remember(const KeySetRef& target, std::size_t index, bool isRemoval
     // What is asked for once only, as of the keys of a client that invents them, is not worth a place.
     const bool wasAsked = wasAsked_.exchange(true, std::memory_order_relaxed);
     if (!wasAsked || count_ >= kMaximumKeysToRemember ||
-        !countUpTo(kMaximumTransitionsOfOne, transitionCount_)) {
+        !countUpTo(count_ == 0 ? kMaximumTransitionsOfEmpty : kMaximumTransitionsOfOne, transitionCount_)) {
         return;
     }
     if (!countUpTo(kMaximumTransitionsOfAll, transitionsOfAll())) {

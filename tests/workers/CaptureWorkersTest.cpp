@@ -127,9 +127,9 @@ TEST_F(CaptureWorkersTest, TheBeginningOfABackOffIsStoredBeforeTheDraftAndTheDra
     for (const auto& each : {session, other}) {
         each->start();
         for (const double after : {0.0, 6.0}) {
-            each->sendMessage(
-                messageOf({{"tvac_invalid_x", 1}, {"zrreporting_timestamp", device.clock.seconds() + after}}),
-                [&seen](const ReplyError*) { seen += "reply "; });
+            each->sendMessage(messageOf({{"tvac_invalid_x", after},
+                                         {"zrreporting_timestamp", device.clock.seconds() + after}}),
+                              [&seen](const ReplyError*) { seen += "reply "; });
         }
         seen += each == session ? "; " : "";
     }

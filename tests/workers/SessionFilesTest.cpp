@@ -109,26 +109,6 @@ TEST_F(SessionFilesTest, SummariesHaveOneObjectForEachMessage) {
     EXPECT_TRUE(summary().ends_with("}\n,\n]\n")) << "what has no form leaves its separator";
 }
 
-TEST_F(SessionFilesTest, ASummaryIsBoundedAndMadeInParts) {
-    constexpr std::size_t kMost = 64U << 20U;
-    const std::string text(4U << 20U, 'x');
-    for (int i = 0; i < 18; ++i) {
-        sendVolume({{"n", i}, {"text", text}});
-    }
-    int parts = 1;
-    while (!worker->stopSome()) {
-        ++parts;
-    }
-    EXPECT_EQ(parts, 16) << "each of one message, as large as it is; those that are left out need none";
-    const std::string& written = files.files.begin()->second;
-    EXPECT_LT(written.size(), kMost);
-    EXPECT_GT(written.size(), kMost - text.size() - 1000);
-    EXPECT_TRUE(written.ends_with("}\n]\n"));
-    EXPECT_EQ(device.log.count("SummaryJsonFileWorker left out messages, as the file is full. file=" +
-                               files.files.begin()->first + " messages=3"),
-              1U);
-}
-
 TEST_F(SessionFilesTest, EachFailedStepIsTold) {
     const struct {
         std::optional<std::string> FakeReportFiles::*failure;
