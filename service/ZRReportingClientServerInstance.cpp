@@ -49,17 +49,30 @@ std::size_t applicationNameBytes(const Dictionary& configuration) {
 
 } // namespace
 
-/// A message on its way to many sessions.
+/// A message on its way to several sessions. Whoever still has to do with it holds it; the client is answered
+/// once nobody does, if all sessions have had it. One whose rest was dropped is not answered.
 struct ZRReportingClientServerInstance::Sending {
     Dictionary message;
     std::uint32_t category;
     std::uint16_t type;
     bool isForStartedOnly; ///< those that are stopped meanwhile are left out
     std::vector<SessionRef> recipients;
-    std::size_t next = 0;
     ErrorReply reply;
-    std::optional<ReplyError> refusal{}; ///< by one that had no room for the message until its stop is over
+    std::size_t next = 0;
+    std::size_t answered = 0; ///< of the recipients
+    std::optional<ReplyError> refusal{};
 
+    ~Sending() {
+        if (reply && answered == recipients.size()) {
+            reply(refusal ? &*refusal : nullptr);
+        }
+    }
+    void noteAnswer(const ReplyError* error) {
+        ++answered;
+        if (error != nullptr) {
+            refusal = *error;
+        }
+    }
     [[nodiscard]] MessageRef record() const {
         return std::make_shared<ZRReportingSessionMessage>(message, category, type);
     }
@@ -282,25 +295,18 @@ void ZRReportingClientServerInstance::performSend(Dictionary message, std::uint3
         return;
     }
     delegate->findReportingSessionsForIDs(reporterIDs, recipients_);
-    const bool isStopping = std::any_of(recipients_.begin(), recipients_.end(),
-                                        [](const SessionRef& session) { return session->isStopping(); });
-    if (isStopping || recipients_.size() > kRecipientsAtOnce) {
-        sendSome(std::make_shared<Sending>(Sending{std::move(message), category, type, reporterIDs.empty(),
-                                                   std::exchange(recipients_, {}), 0, std::move(reply)}));
-        return;
+    if (recipients_.empty()) {
+        answer(reply);
+    } else if (recipients_.size() == 1 && !recipients_.front()->isStopping()) {
+        // It is given the payload itself, which spares it a copy when it is normalised.
+        recipients_.front()->sendMessage(
+            std::make_shared<ZRReportingSessionMessage>(std::move(message), category, type),
+            std::move(reply));
+        recipients_.clear();
+    } else {
+        sendSome(std::shared_ptr<Sending>(new Sending{std::move(message), category, type, reporterIDs.empty(),
+                                                      std::exchange(recipients_, {}), std::move(reply)}));
     }
-    const auto sendTo = [category, type](const SessionRef& session, Dictionary payload) {
-        session->sendMessage(std::make_shared<ZRReportingSessionMessage>(std::move(payload), category, type));
-    };
-    // The last one is given the payload itself, which spares it a copy when it is normalised.
-    for (std::size_t i = 1; i < recipients_.size(); ++i) {
-        sendTo(recipients_[i - 1], message);
-    }
-    if (!recipients_.empty()) {
-        sendTo(recipients_.back(), std::move(message));
-    }
-    recipients_.clear();
-    answer(reply);
 }
 
 void ZRReportingClientServerInstance::sendSome(std::shared_ptr<Sending> sending) {
@@ -311,24 +317,23 @@ void ZRReportingClientServerInstance::sendSome(std::shared_ptr<Sending> sending)
             // The session keeps the message for its end, and this client's requests wait for that.
             requests_->suspend();
             session->sendMessage(sending->record(), [sending, requests = requests_](const ReplyError* error) {
-                if (error != nullptr) {
-                    sending->refusal = *error;
-                }
+                sending->noteAnswer(error);
                 requests->resume();
             });
             break;
         }
         if (session->started() || !sending->isForStartedOnly) {
-            session->sendMessage(sending->record());
+            session->sendMessage(sending->record(),
+                                 [sending](const ReplyError* error) { sending->noteAnswer(error); });
+        } else {
+            sending->noteAnswer(nullptr);
         }
     }
-    afterTurnsOfOthers(Pace::quick, [sending = std::move(sending)](auto& client) mutable {
-        if (sending->next != sending->recipients.size()) {
+    if (sending->next != sending->recipients.size()) {
+        afterTurnsOfOthers(Pace::quick, [sending = std::move(sending)](auto& client) mutable {
             client.sendSome(std::move(sending));
-        } else if (sending->reply) {
-            sending->reply(sending->refusal ? &*sending->refusal : nullptr);
-        }
-    });
+        });
+    }
 }
 
 void ZRReportingClientServerInstance::stopReportingSessionForID(ReporterID reporterID, BooleanReply reply) {
