@@ -123,13 +123,17 @@ void largeValuesUnderNewKeys(const Assault& assault) {
     });
 }
 
-/// The messages of one that has no better name for what it counts, retained; then it goes.
+/// The messages of one that has no better name for what it counts, retained in some sessions; then it goes.
 void distinctKeysThatAreGone(const Assault& assault) {
+    constexpr int kMessagesOfSession = 500;
     HostileClient client(assault);
-    addSession(client, kReporterID);
     for (int number = 0; number < 12'000; ++number) {
+        const std::int64_t reporterID = kReporterID + number / kMessagesOfSession;
+        if (number % kMessagesOfSession == 0) {
+            addSession(client, reporterID);
+        }
         const std::string suffix = std::to_string(number);
-        client.add(messageFor(kReporterID, {{"key " + suffix, number}, {"other " + suffix, 1}}));
+        client.add(messageFor(reporterID, {{"key " + suffix, number}, {"other " + suffix, 1}}));
         if (client.waitingBytes() >= kBytesPerSend && !client.send()) {
             return;
         }
