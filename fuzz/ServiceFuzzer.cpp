@@ -35,6 +35,7 @@ public:
         demand(reply.has_value());
         ++counts_[reply->id];
     }
+    static void noteLimit(std::string_view limit) { demand(!limit.empty()); }
     [[nodiscard]] int count(std::uint64_t id) const {
         const auto found = counts_.find(id);
         return found == counts_.end() ? 0 : found->second;
@@ -78,7 +79,8 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* bytes, std::size_t siz
     ConnectionListener& listener = device.connections.listenerForServiceName("fuzzed");
     listener.setDelegate(service);
     listener.resume();
-    const auto connection = device.connections.connect(42);
+    RequestTurns turns(device.serverQueue(), device.clock);
+    const auto connection = device.connections.connect({1000, 42}, turns);
     device.serverQueue().runAll();
     feed(device, *connection, {bytes, size});
     if (size % 3 == 0) {

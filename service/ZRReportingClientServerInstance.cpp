@@ -114,8 +114,6 @@ void ZRReportingClientServerInstance::performCreate(ReporterID reporterID, Boole
     emitTracePoint(context_, TraceEvent::createReportingSession);
     if (!clientReportingSessionMap_.contains(reporterID)) {
         if (const auto refused = beyondLimitOfSessions()) {
-            log::error(ZRReportingServiceDelegateCategory(), "a session is refused: {}. pid={} uid={}",
-                       refused->message, processIdentifier(), user());
             refuse(reply, *refused);
             return;
         }
@@ -201,8 +199,6 @@ void ZRReportingClientServerInstance::performSetConfiguration(const Dictionary& 
         const std::size_t before = heldBytes(session->configuration());
         const std::size_t after = heldBytes(merged);
         if (const auto refused = beyondLimitOfConfiguration(configuration, before, after)) {
-            log::error(ZRReportingServiceDelegateCategory(), "a configuration is refused: {}. pid={} uid={}",
-                       refused->message, processIdentifier(), user());
             refuse(reply, *refused);
             return;
         }

@@ -92,7 +92,8 @@ void RetainedMessages::removed(Account& account, std::size_t bytes) noexcept {
 
 void RetainedMessages::makeRoom(Account& account) {
     if (account.bytes > account.nextRound) {
-        letGo(account, account.bytes - (limitOfUser_ - limitOfUser_ / kPartMadeFree));
+        letGo(account, account.bytes - (limitOfUser_ - limitOfUser_ / kPartMadeFree),
+              "retained_bytes_of_user");
         account.nextRound = nextRoundFor(account.bytes, limitOfUser_);
     }
     if (bytes_ <= nextRound_) {
@@ -107,13 +108,13 @@ void RetainedMessages::makeRoom(Account& account) {
     const std::size_t goal = limit_ - limit_ / kPartMadeFree;
     for (Account* const other : accounts) {
         if (bytes_ > goal) {
-            letGo(*other, bytes_ - goal);
+            letGo(*other, bytes_ - goal, "retained_bytes");
         }
     }
     nextRound_ = nextRoundFor(bytes_, limit_);
 }
 
-void RetainedMessages::letGo(Account& account, std::size_t bytes) {
+void RetainedMessages::letGo(Account& account, std::size_t bytes, std::string_view limit) {
     std::vector<std::pair<std::size_t, ZRReportingSession*>> sessions;
     for (const Share* const share : account.shares) {
         if (!share->session_.isStopping()) {
@@ -123,7 +124,7 @@ void RetainedMessages::letGo(Account& account, std::size_t bytes) {
     std::make_heap(sessions.begin(), sessions.end());
     for (std::size_t freed = 0; freed < bytes && !sessions.empty(); sessions.pop_back()) {
         std::pop_heap(sessions.begin(), sessions.end());
-        freed += sessions.back().second->letGoOfOldest(bytes - freed);
+        freed += sessions.back().second->letGoOfOldest(bytes - freed, limit);
     }
 }
 

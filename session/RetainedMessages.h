@@ -5,6 +5,7 @@
 #include <cstddef>
 #include <cstdint>
 #include <map>
+#include <string_view>
 #include <vector>
 
 #include <sys/types.h>
@@ -93,7 +94,7 @@ private:
     void removed(Account& account, std::size_t bytes) noexcept;
     void makeRoom(Account& account);
     /// Lets go of about as many bytes, of the largest sessions first.
-    void letGo(Account& account, std::size_t bytes);
+    static void letGo(Account& account, std::size_t bytes, std::string_view limit);
 
     const std::size_t limitOfUser_;
     const std::size_t limit_;

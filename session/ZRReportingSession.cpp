@@ -118,14 +118,13 @@ void ZRReportingSession::remember(const Dictionary& payload, std::size_t bytesOf
     }
 }
 
-std::size_t ZRReportingSession::letGoOfOldest(std::size_t bytes) {
+std::size_t ZRReportingSession::letGoOfOldest(std::size_t bytes, std::string_view limit) {
     MessageBlocks::Block freed = blocks_.takeFirst(bytes);
     if (freed.messages != 0) {
         if (droppedMessageCount_ == 0) {
-            log::error(
-                ZRReportingSessionCategory(),
-                "the user of this session retains too much; its oldest messages are let go. reporterID={}",
-                reporterID_);
+            log::error(ZRReportingSessionCategory(),
+                       "{} is reached: the oldest messages of a session are let go. reporterID={} pid={}",
+                       limit, reporterID_, processIdentifiers_.empty() ? 0 : processIdentifiers_.front());
         }
         const auto end = messages_.begin() + static_cast<std::ptrdiff_t>(freed.messages);
         std::for_each(messages_.begin(), end,
@@ -133,6 +132,7 @@ std::size_t ZRReportingSession::letGoOfOldest(std::size_t bytes) {
         messages_.erase(messages_.begin(), end);
         droppedMessageCount_ += freed.messages;
         retained_.countDropped(freed.messages);
+        context_.platform().activity->droppedRecords += freed.messages;
     }
     if (messages_.empty() && freed.bytes < bytes) {
         freed.bytes += previousValues_.heldBytes();

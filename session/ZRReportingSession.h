@@ -109,7 +109,7 @@ public:
     [[nodiscard]] std::uint64_t droppedMessageCount() const noexcept { return droppedMessageCount_; }
     /// Lets go of the oldest messages that have about so many bytes, and of the previous values where no
     /// message is left. The bytes that are free then. Not while the session is stopping.
-    std::size_t letGoOfOldest(std::size_t bytes);
+    std::size_t letGoOfOldest(std::size_t bytes, std::string_view limit);
     /// Nothing here asks for it yet.
     [[nodiscard]] std::size_t workerInstanceCount() const noexcept { return messageWorkers_.size(); }
     [[nodiscard]] std::string description() const;

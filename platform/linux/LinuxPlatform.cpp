@@ -123,7 +123,18 @@ struct LinuxPlatform::Services {
     /// What it is doing, in a line for people.
     [[nodiscard]] std::string status() {
         const Activity& activity = *platform.activity;
-        return formatted("{} clients, {} sessions", connections.connectionCount(), activity.sessions.load());
+        std::string text =
+            formatted("{} clients, {} sessions", connections.connectionCount(), activity.sessions.load());
+        if (const auto dropped = activity.droppedRecords.load(); dropped != 0) {
+            appendFormatted(text, ", {} retained records let go", dropped);
+        }
+        if (const auto lost = sinkFiles->lostLines(); lost != 0) {
+            appendFormatted(text, ", {} lines lost", lost);
+        }
+        for (const std::string& sink : sinkFiles->out()) {
+            appendFormatted(text, ", {} is out", sink);
+        }
+        return text;
     }
 
     const wire::Directories directories;

@@ -23,6 +23,7 @@ struct ClientUser {
 
     // The I/O thread's.
     std::size_t connections = 0;
+    bool isTurnedAway = false;                               ///< since its last connection ended
     std::size_t unfinishedBytes = 0;                         ///< of frames that have begun
     std::deque<std::shared_ptr<LinuxConnection>> readable{}; ///< in the order of their turns
 

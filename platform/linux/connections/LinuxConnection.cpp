@@ -223,9 +223,10 @@ void LinuxConnection::keepRest(std::span<const std::uint8_t> rest, std::size_t w
 
 /// Counts the beginning of a frame towards the user's, and has it watched for its progress.
 void LinuxConnection::countUnfinished() {
-    const std::size_t bytes = unfinished_.empty() ? 0 : unfinished_.capacity();
+    const bool isUnfinished = ending_ == Ending::none && !unfinished_.empty();
+    const std::size_t bytes = isUnfinished ? unfinished_.capacity() : 0;
     user_->unfinishedBytes += bytes - std::exchange(unfinishedCounted_, bytes);
-    if (bytes == 0 || ending_ != Ending::none) {
+    if (!isUnfinished) {
         shared_.unfinished.forget(unfinishedPlace_);
         return;
     }
@@ -272,7 +273,7 @@ void LinuxConnection::refuse(const wire::Refusal& refusal) {
 }
 
 void LinuxConnection::noteLimit(std::string_view limit) {
-    if (!std::exchange(isLimitNoted_, true)) {
+    if (!isLimitNoted_.exchange(true)) {
         const LogOrigin origin(peer_);
         shared_.log.reportOfClient(LogLevel::error, "zrrs", "a client is refused: {}. pid={} uid={}", limit,
                                    peer_.process, peer_.user);
@@ -286,6 +287,8 @@ void LinuxConnection::endBeyond(const ReplyError& limit) {
 }
 
 void LinuxConnection::turnAway(const ReplyError& reason) {
+    // One line tells of all that are turned away until the user has fewer.
+    isLimitNoted_ = std::exchange(user_->isTurnedAway, true);
     refuse({.error = {reason.domain, reason.code, reason.message}});
 }
 
@@ -375,7 +378,11 @@ void LinuxConnection::countUnsent() {
     const std::size_t mine = unsent();
     const std::size_t all = user_->refusedBytes += mine - std::exchange(unsentCounted_, mine);
     const bool isMuchForUser = all > limits.replyBytesOfUser / 2;
-    if (mine > limits.replyBytes || (mine != 0 && all > limits.replyBytesOfUser)) {
+    if (mine > limits.replyBytes) {
+        noteLimit(limitReached("reply_bytes", limits.replyBytes).message);
+        giveUp();
+    } else if (mine != 0 && all > limits.replyBytesOfUser) {
+        noteLimit(limitReached("reply_bytes_of_user", limits.replyBytesOfUser).message);
         giveUp();
     } else if (mine > (isMuchForUser ? kUnreadRepliesOfMany : kUnreadReplies)) {
         holdRequests();

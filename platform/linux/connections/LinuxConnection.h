@@ -122,6 +122,8 @@ public:
             replied();
         }
     }
+    /// Tells the log, once, that the client has reached a limit. From any thread.
+    void noteLimit(std::string_view limit);
     /// Sends the replies that are held back. From any thread.
     void releaseReplies() TAMBLO_EXCLUDES(mutex_);
     /// Reads no more; for the service's shutdown.
@@ -142,7 +144,6 @@ private:
     void refuse(const wire::Refusal& refusal) TAMBLO_EXCLUDES(mutex_);
     /// Ends the connection with an error frame that names the limit.
     void endBeyond(const ReplyError& limit) TAMBLO_EXCLUDES(mutex_);
-    void noteLimit(std::string_view limit);
     [[nodiscard]] bool isHeldBack() TAMBLO_EXCLUDES(mutex_);
     void carriedOut(std::size_t requests, std::size_t bytes) TAMBLO_EXCLUDES(mutex_);
     void readOn() TAMBLO_EXCLUDES(mutex_);
@@ -177,8 +178,8 @@ private:
     UnfinishedFrames::Place unfinishedPlace_;
     Ending ending_ = Ending::none;
     bool isReadable_ = false; ///< listed for its turn
-    bool isLimitNoted_ = false;
 
+    std::atomic<bool> isLimitNoted_{false};
     std::atomic<std::size_t> waitingRequests_{0};
     std::atomic<std::size_t> waitingBytes_{0};
 

@@ -251,6 +251,7 @@ std::optional<ReplyError> LinuxConnectionService::refusalOf(const ClientUser& us
 }
 
 void LinuxConnectionService::ended(const std::shared_ptr<LinuxConnection>& connection, ClientUser& user) {
+    user.isTurnedAway = false;
     if (--user.connections == 0) {
         users_.erase(user.user);
     }

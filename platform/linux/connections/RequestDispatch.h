@@ -25,13 +25,11 @@ public:
             return {};
         }
         return [receiver = receiver_, id = *id_](const ReplyError* error, Result... result) {
-            receiver->reply([&](TextBuffer& out) {
-                if (error != nullptr) {
-                    appendError(out, id, *error);
-                } else {
-                    append(out, id, result...);
-                }
-            });
+            if (error != nullptr) {
+                refuse(*receiver, id, *error);
+            } else {
+                receiver->reply([&](TextBuffer& out) { append(out, id, result...); });
+            }
         };
     }
     /// The same for an operation that may be refused: of a request without reply, too, the client hears that,
@@ -42,14 +40,19 @@ public:
         }
         return [receiver = receiver_](const ReplyError* error, bool) {
             if (error != nullptr) {
-                receiver->reply([&](TextBuffer& out) { appendError(out, 0, *error); });
+                refuse(*receiver, 0, *error);
             }
         };
     }
 
 private:
-    static void appendError(TextBuffer& out, std::uint64_t id, const ReplyError& error) {
-        wire::appendErrorReply(out, id, {error.domain, error.code, error.message});
+    static void refuse(Receiver& receiver, std::uint64_t id, const ReplyError& error) {
+        if (error.code == wire::kLimitReached) {
+            receiver.noteLimit(error.message);
+        }
+        receiver.reply([&](TextBuffer& out) {
+            wire::appendErrorReply(out, id, {error.domain, error.code, error.message});
+        });
     }
     static void append(TextBuffer& out, std::uint64_t id) { wire::appendNullReply(out, id); }
     static void append(TextBuffer& out, std::uint64_t id, std::same_as<bool> auto result) {
@@ -71,7 +74,8 @@ private:
 
 /// Calls the object's operation for a request, whose parts are moved from. Each reply, whenever it comes and
 /// from whatever thread, is handed to `receiver->reply` as a callable that appends its frame to a
-/// `TextBuffer&`; the replies share the receiver's ownership.
+/// `TextBuffer&`, and the name of a limit that is reached to `receiver->noteLimit`; the replies share the
+/// receiver's ownership.
 template <typename Receiver>
 void dispatchRequest(ZRReportingServiceProtocol& object, wire::Request& request,
                      const std::shared_ptr<Receiver>& receiver) {
