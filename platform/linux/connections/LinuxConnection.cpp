@@ -28,12 +28,13 @@ namespace {
 constexpr std::size_t kKeptCapacity = 64 * 1024;
 /// What a request takes while it waits, besides its values.
 constexpr std::size_t kRequestBytes = 256;
-/// A piece of the server queue ends once a client has more replies than this to get.
-constexpr std::size_t kRepliesOfPiece = 256 * 1024;
-/// A client's requests wait while its socket has refused more than this; less, where the user's others have
-/// brought together half of the user's limit.
-constexpr std::size_t kUnreadReplies = 1024 * 1024;
-constexpr std::size_t kUnreadRepliesOfMany = 64 * 1024;
+/// A piece of the server queue ends once a client has more replies to get than this part of what its socket
+/// may refuse.
+constexpr std::size_t kPartOfPiece = 16;
+/// A client's requests wait while its socket has refused more than this part of what it may; a smaller one,
+/// where the user's connections have brought together half of the user's limit.
+constexpr std::size_t kUnreadPart = 4;
+constexpr std::size_t kUnreadPartOfMany = 64;
 /// A peer that takes nothing for so long does not read.
 constexpr std::chrono::seconds kPatienceWithPeer{1};
 
@@ -296,7 +297,7 @@ void LinuxConnection::replied() {
     if (!std::exchange(hasHeldReplies_, true)) {
         shared_.heldReplies.add(shared_from_this());
     }
-    if (held_.size() > kRepliesOfPiece) {
+    if (held_.size() > shared_.limits.replyBytes / kPartOfPiece) {
         // They go before there are more; a client that reads them does not pay for having asked for much.
         shared_.turns->endPiece();
     }
@@ -384,9 +385,9 @@ void LinuxConnection::countUnsent() {
     } else if (mine != 0 && all > limits.replyBytesOfUser) {
         noteLimit(limitReached("reply_bytes_of_user", limits.replyBytesOfUser).message);
         giveUp();
-    } else if (mine > (isMuchForUser ? kUnreadRepliesOfMany : kUnreadReplies)) {
+    } else if (mine > limits.replyBytes / (isMuchForUser ? kUnreadPartOfMany : kUnreadPart)) {
         holdRequests();
-    } else if (mine <= kUnreadReplies / 2) {
+    } else if (mine <= limits.replyBytes / kUnreadPart / 2) {
         letRequestsGo();
     }
 }
