@@ -38,9 +38,9 @@ ServiceProcess::Settings settingsFor(const Bench& bench, const Attack& attack) {
         // The limit on threads is none for root.
         settings.beforeExec = [](const std::string& directory) {
             for (const auto& entry : std::filesystem::recursive_directory_iterator(directory)) {
-                (void)::lchown(entry.path().c_str(), kServiceUser, kServiceUser);
+                (void)!::lchown(entry.path().c_str(), kServiceUser, kServiceUser);
             }
-            (void)::lchown(directory.c_str(), kServiceUser, kServiceUser);
+            (void)!::lchown(directory.c_str(), kServiceUser, kServiceUser);
             becomeUser(kServiceUser);
             const rlimit none{.rlim_cur = 1, .rlim_max = 1};
             ::setrlimit(RLIMIT_NPROC, &none);

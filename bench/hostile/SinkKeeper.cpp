@@ -18,7 +18,7 @@ void SinkKeeper::keep() const {
     struct stat status {};
     if (::stat(file.c_str(), &status) == 0) {
         // Fails for one that is kept already.
-        (void)::link(file.c_str(), (kept_ + "/" + std::to_string(status.st_ino)).c_str());
+        (void)!::link(file.c_str(), (kept_ + "/" + std::to_string(status.st_ino)).c_str());
     }
 }
 
