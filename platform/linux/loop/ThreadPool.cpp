@@ -67,7 +67,7 @@ void ThreadPool::workOff() {
         lock.lock();
         while (!work_.empty() || busy_ != 0) {
             if (threads_.empty()) {
-                doFirst(lock);
+                doFirst();
             } else {
                 isWorkedOff_.wait(lock.forWaiting());
             }
@@ -82,7 +82,7 @@ void ThreadPool::help() {
         return;
     }
     if (!work_.empty()) {
-        doFirst(lock);
+        doFirst();
     }
     if (!work_.empty() || !delayed_.empty()) {
         callThread();
@@ -180,19 +180,19 @@ void ThreadPool::run() {
             // While this work blocks, another thread has to wait for the calls to come.
             callThread();
         }
-        doFirst(lock);
+        doFirst();
     }
     finished_.push_back(std::this_thread::get_id());
 }
 
-void ThreadPool::doFirst(MutexLock& lock) {
+void ThreadPool::doFirst() {
     UniqueFunction<void()> work = std::move(work_.front());
     work_.pop_front();
     ++busy_;
-    lock.unlock();
+    mutex_.unlock();
     work();
     work.reset();
-    lock.lock();
+    mutex_.lock();
     if (--busy_ == 0 && work_.empty()) {
         isWorkedOff_.notify_all();
     }

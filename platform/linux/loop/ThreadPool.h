@@ -58,7 +58,8 @@ private:
     void joinFinished() TAMBLO_REQUIRES(mutex_);
     void startThread() TAMBLO_REQUIRES(mutex_);
     void callHelper() TAMBLO_REQUIRES(mutex_);
-    void doFirst(MutexLock& lock) TAMBLO_REQUIRES(mutex_);
+    /// Lets the mutex go while the work runs.
+    void doFirst() TAMBLO_REQUIRES(mutex_);
 
     CallHelper callHelper_;
     Mutex mutex_;
