@@ -246,6 +246,7 @@ void LinuxPlatform::run(SerialQueue& requestQueue,
     // What ended the loop may have left more for the queues, which the service has to outlive.
     all.workQueues.workOff();
     all.connections.letGo();
+    all.loop.dropTasks();
     all.sinks.flush();
 }
 

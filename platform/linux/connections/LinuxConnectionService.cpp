@@ -284,6 +284,12 @@ void LinuxConnectionService::stop() {
 }
 
 void LinuxConnectionService::letGo() {
+    // The lists of a user hold its connections, and these the user.
+    for (const auto& [number, user] : users_) {
+        user->readable.clear();
+        const MutexLock lock(user->mutex);
+        user->heldBack.clear();
+    }
     MutexLock lock(mutex_);
     const auto connections = std::exchange(connections_, {});
     lock.unlock();

@@ -83,6 +83,13 @@ void EventLoop::runTasks() {
     }
 }
 
+void EventLoop::dropTasks() {
+    delayed_.clear();
+    std::vector<Task> tasks;
+    const MutexLock lock(mutex_);
+    tasks.swap(tasks_);
+}
+
 void EventLoop::runDelayed() {
     const Deadline now = delayed_.empty() ? Deadline() : std::chrono::steady_clock::now();
     while (!delayed_.empty() && delayed_.begin()->first <= now) {

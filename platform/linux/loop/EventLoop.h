@@ -78,6 +78,8 @@ public:
     /// Returns after `stop`, which is called on the loop's thread. Lends its thread to the strands.
     void run(LinuxWorkQueues& strands);
     void stop() noexcept { isStopped_ = true; }
+    /// Lets go of the tasks that have not run, and of what these hold. Once the loop has ended.
+    void dropTasks() TAMBLO_EXCLUDES(mutex_);
 
 private:
     using Deadline = std::chrono::steady_clock::time_point;
