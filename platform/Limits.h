@@ -21,7 +21,7 @@ inline constexpr std::string_view kLimitsDomain = "com.vandra.tamblo.limits";
 /// the preferences, in snake case there (`reporters_of_message`).
 struct Limits {
     // Of one request.
-    std::size_t reportersOfMessage = 256;
+    std::size_t reportersOfMessage = 128;
     std::size_t entriesOfDictionary = 1'024; ///< of a payload or configuration, inner maps included
     std::size_t keyBytes = 1'024;
     std::size_t decodedBytesOfFrame = 4U << 20U; ///< as values in memory

@@ -22,8 +22,9 @@ constexpr std::size_t kSessionsLeftAtOnce = 16;
 constexpr int kExitStatusKilled = 2;
 /// More retained messages than this take a moment to free.
 constexpr std::size_t kManyMessages = 10'000;
-/// A message to more sessions than this is sent to so many at a time.
+/// A message to several sessions is sent to so many at a time, and to fewer when it is large.
 constexpr std::size_t kRecipientsAtOnce = 32;
+constexpr std::size_t kBytesAtOnce = 64 * 1024;
 
 template <typename Reply, typename... Result> void answer(Reply& reply, const Result&... result) {
     if (reply) {
@@ -306,7 +307,9 @@ void ZRReportingClientServerInstance::performSend(Dictionary message, std::uint3
 }
 
 void ZRReportingClientServerInstance::sendSome(std::shared_ptr<Sending> sending) {
-    const std::size_t end = std::min(sending->recipients.size(), sending->next + kRecipientsAtOnce);
+    const std::size_t fitting = kBytesAtOnce / std::max<std::size_t>(heldBytes(sending->message), 1);
+    const std::size_t atOnce = std::clamp<std::size_t>(fitting, 1, kRecipientsAtOnce);
+    const std::size_t end = std::min(sending->recipients.size(), sending->next + atOnce);
     while (sending->next != end) {
         const SessionRef session = std::move(sending->recipients[sending->next++]);
         if (session->isStopping()) {
