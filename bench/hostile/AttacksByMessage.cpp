@@ -195,7 +195,7 @@ void longLists(const Assault& assault) {
     const Dictionary payload{{"text", std::string(10'000, 'x')}};
     do {
         client.addRaw(wire::Method::sendMessage,
-                      [&](CborWriter& writer) { writeMessage(writer, payload, 256, kReporterID); });
+                      [&](CborWriter& writer) { writeMessage(writer, payload, 128, kReporterID); });
     } while (client.send());
 }
 
@@ -203,7 +203,7 @@ constexpr std::array kAttacks{
     Attack{"many_keys", "each message brings a new key", manyKeys},
     Attack{"keys_100k", "a frame with 100,000 keys, then small messages", hundredThousandKeys},
     Attack{"repeated_identifier", "a reporter named 10,000 times in a frame", repeatedIdentifier},
-    Attack{"long_lists", "a reporter named 256 times in a frame", longLists},
+    Attack{"long_lists", "a reporter named 128 times in a frame", longLists},
     Attack{"unknown_identifiers", "200,000 unknown reporters in a frame", unknownIdentifiers},
     Attack{"large_messages", "messages of 0.9 MB", largeMessages},
     Attack{"empty_arrays", "900,000 empty arrays in a frame, eight frames at once", emptyArrays},

@@ -87,7 +87,7 @@ INSTANTIATE_TEST_SUITE_P(
         Refused{"sessions_of_connection", 3, {creation(8), creation(9), creation(9)}, creation(10)},
         Refused{"sessions_of_user", 3, {creation(8)}, creation(9)},
         // As they are shipped, what has done harm.
-        Refused{"reporters_of_message", 256, {}, message({}, std::vector<std::int64_t>(10'000, 7), 4, 6)},
+        Refused{"reporters_of_message", 128, {}, message({}, std::vector<std::int64_t>(10'000, 7), 4, 6)},
         Refused{"entries_of_dictionary", 1'024, {message(entries(1'024))}, message(entries(1'100))},
         Refused{"decoded_bytes_of_frame", 4 << 20, {}, arrays(900'000)},
         Refused{"application_name_bytes", 512, {}, configuration("HostApplicationDisplayID", 900'000)}),
