@@ -387,10 +387,13 @@ TEST(LinkmeterSummaryTest, ValuesAreTextsInTheOrderOfTheMessages) {
                           {"d", R"("1970-01-01T00:00:00.000Z")"},
                           {"ZR_Session_Summary_Event", "65535,mine"}}));
 
-    const std::vector<Dictionary> many(30, {{"a", std::string(1U << 20U, 'x')}});
+    const std::string large(1U << 20U, 'x');
+    const std::vector<Dictionary> many(
+        3, {{"a", large}, {"b", large}, {"c", large}, {"d", large}, {"e", "beyond all"}});
     const LinkmeterSummary full = LinkmeterSummary::of(many, AudioServiceTypeUnknown);
-    EXPECT_LT(full.values.find("a")->stringValue().size(), 18U << 20U);
-    EXPECT_EQ(full.leftOut, 30 - full.values.find("a")->stringValue().size() / ((1U << 20U) + 1) - 1);
+    EXPECT_EQ(full.values.find("d")->stringValue(), large + ",(...)");
+    EXPECT_EQ(*full.values.find("e"), Value("(...)"));
+    EXPECT_EQ(full.leftOut, 4U * 2 + 3);
 }
 
 } // namespace

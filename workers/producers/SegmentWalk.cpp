@@ -103,10 +103,10 @@ std::vector<MessageRef> DerivedMessages::take() {
     return std::exchange(messages_, {});
 }
 
-RapidMessages rapidSpatialAudioSettings(Seconds longestPause) {
+std::unique_ptr<RapidMessages> rapidSpatialAudioSettings(Seconds longestPause) {
     static constexpr std::array<std::string_view, 2> kSettings{
         ZRReportingMessageKeySpatialAudioAccessoryFeature, kSpatializationEnabledKey};
-    return {kSettings, longestPause};
+    return std::make_unique<RapidMessages>(kSettings, longestPause);
 }
 
 Dictionary previousValuesOf(const std::shared_ptr<ZRReportingSession>& session) {

@@ -88,7 +88,7 @@ private:
 };
 
 /// What folds bursts of the two spatial-audio settings.
-[[nodiscard]] RapidMessages rapidSpatialAudioSettings(Seconds longestPause);
+[[nodiscard]] std::unique_ptr<RapidMessages> rapidSpatialAudioSettings(Seconds longestPause);
 
 /// What a walk begins with: what the session's earlier runs left, nothing once the session is gone.
 [[nodiscard]] Dictionary previousValuesOf(const std::shared_ptr<ZRReportingSession>& session);
@@ -100,7 +100,7 @@ public:
     /// Messages that are looked at in one part.
     static constexpr std::size_t kMessagesOfPart = 10'000;
 
-    Derivation(Walk walk, std::optional<RapidMessages> rapid)
+    Derivation(Walk walk, std::unique_ptr<RapidMessages> rapid)
         : walk_(std::move(walk)), rapid_(std::move(rapid)) {}
 
     /// Does the next part. Whether all is done.
@@ -126,7 +126,7 @@ private:
     }
 
     Walk walk_;
-    std::optional<RapidMessages> rapid_;
+    std::unique_ptr<RapidMessages> rapid_; ///< null: nothing is folded
     std::size_t folded_ = 0;
     std::size_t walked_ = 0;
 };
@@ -137,7 +137,7 @@ private:
 /// What a walk over these messages derives.
 template <typename Walk>
 [[nodiscard]] std::vector<MessageRef> derivedBy(Walk walk, std::span<const MessageRef> messages,
-                                                std::optional<RapidMessages> rapid = std::nullopt) {
+                                                std::unique_ptr<RapidMessages> rapid = nullptr) {
     Derivation<Walk> derivation(std::move(walk), std::move(rapid));
     while (!derivation.deriveSome(messages)) {
     }
@@ -163,7 +163,7 @@ private:
 /// sends them into it.
 template <typename Walk>
 [[nodiscard]] PartOfStop derivingStop(std::weak_ptr<ZRReportingSession> session, std::string_view what,
-                                      Walk walk, std::optional<RapidMessages> rapid = std::nullopt) {
+                                      Walk walk, std::unique_ptr<RapidMessages> rapid = nullptr) {
     return [session = std::move(session), what,
             derivation = std::make_unique<Derivation<Walk>>(std::move(walk), std::move(rapid)),
             sending = std::optional<DerivedSending>()]() mutable {

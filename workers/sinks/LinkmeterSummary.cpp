@@ -17,12 +17,17 @@ namespace tamblo {
 
 namespace {
 
-constexpr std::size_t kMostTextBytes = 16U << 20U;
+/// Beyond these, values are left out: of a key's text, and of all of them.
+constexpr std::size_t kMostBytesOfKey = 1U << 20U;
+constexpr std::size_t kMostBytes = 4U << 20U;
+/// Stands where the first value is left out.
+constexpr std::string_view kLeftOutMark = "(...)";
 constexpr std::string_view kServiceTypeKey = "ZR_Session_Summary_Event";
 
 struct Joined {
     TextBuffer text;
     bool hasValues = false;
+    bool isFull = false;
 };
 
 class Joiner {
@@ -65,13 +70,19 @@ private:
     }
 
     void append(Joined& joined, const Value& value) {
-        if (bytes_ > kMostTextBytes) {
+        if (joined.isFull) {
             ++leftOut_;
             return;
         }
         const std::size_t before = joined.text.size();
         if (std::exchange(joined.hasValues, true)) {
             joined.text.append(',');
+        }
+        if (before >= kMostBytesOfKey || bytes_ >= kMostBytes) {
+            joined.text.append(kLeftOutMark);
+            joined.isFull = true;
+            ++leftOut_;
+            return;
         }
         if (value.isString()) {
             joined.text.append(value.stringValue());

@@ -11,8 +11,9 @@ namespace tamblo {
 
 /// The summary event of a session for the call-quality service: under every key that its messages held, all
 /// of the key's values, joined by commas in the messages' order, and the service type under a key of its own.
-/// Its time grows with the values, not with their square: a session may have held millions of them. Its
-/// texts have 16 MiB together at most; values that would be beyond are left out. On any thread.
+/// Its time grows with the values, not with their square: a session may have held millions of them. Once a
+/// key's text has 1 MiB, or all have 4 MiB, further values are left out, with "(...)" in place of the first.
+/// On any thread.
 struct LinkmeterSummary {
     Dictionary values;
     std::uint64_t leftOut = 0; ///< values
