@@ -73,10 +73,15 @@ public:
         state_->enlist(shared_from_this(), pace);
     }
     void postNext(Work work, Pace pace) override { rest = {std::move(work), pace}; }
-    void suspend() override { suspensions.fetch_add(1); }
+    void suspend() override {
+        const MutexLock lock(state_->mutex);
+        if (!isAbandoned) {
+            ++suspensions;
+        }
+    }
     void resume() override {
         const MutexLock lock(state_->mutex);
-        if (suspensions.fetch_sub(1) == 1) {
+        if (!isAbandoned && --suspensions == 0) {
             state_->enlist(shared_from_this(), Pace::quick);
         }
     }
@@ -88,6 +93,7 @@ public:
         dropped[1].swap(batch);
         std::swap(droppedRest, rest);
         next = 0;
+        isAbandoned = true;
         suspensions = 0;
     }
 
@@ -128,6 +134,8 @@ public:
     std::size_t next = 0;
     Item rest;             ///< of the request at hand
     bool isListed = false; ///< among those that wait, or at its turn
+    bool isAbandoned = false;
+    /// Of an abandoned queue none count, nor their ends, which may come late.
     std::atomic<std::size_t> suspensions{0};
 
 private:

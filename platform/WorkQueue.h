@@ -55,8 +55,8 @@ public:
     /// No further piece begins until each `suspend` has had its `resume`. From any thread.
     virtual void suspend() = 0;
     virtual void resume() = 0;
-    /// Drops what waits, the rest of a request too, without running it, and takes back every `suspend`. On
-    /// the reporting server queue, outside the queue's own work.
+    /// Drops what waits, the rest of a request too, without running it. Runs what is posted later, whoever
+    /// has suspended it, or will. On the reporting server queue, outside the queue's own work.
     virtual void abandon() = 0;
 };
 

@@ -14,11 +14,14 @@ namespace tamblo::bench {
 namespace fs = std::filesystem;
 
 void SinkKeeper::keep() const {
-    const std::string file = logs_ + "/analytics-events.jsonl";
-    struct stat status {};
-    if (::stat(file.c_str(), &status) == 0) {
-        // Fails for one that is kept already.
-        (void)!::link(file.c_str(), (kept_ + "/" + std::to_string(status.st_ino)).c_str());
+    // A flood may have the file turned over twice in the time between two looks.
+    for (const char* const name : {"analytics-events.jsonl.1", "analytics-events.jsonl"}) {
+        const std::string file = logs_ + "/" + name;
+        struct stat status {};
+        if (::stat(file.c_str(), &status) == 0) {
+            // Fails for one that is kept already.
+            (void)!::link(file.c_str(), (kept_ + "/" + std::to_string(status.st_ino)).c_str());
+        }
     }
 }
 

@@ -109,8 +109,9 @@ TEST_F(RequestTurnsTest, TheRestOfARequestComesBeforeTheNextAndOthersInBetween) 
     first->post(work('a'));
     EXPECT_EQ(run(), "");
     first->abandon();
+    first->resume();
     first->post(work('b'));
-    EXPECT_EQ(run(), "b") << "neither what waited nor the suspension is left";
+    EXPECT_EQ(run(), "b") << "neither what waited nor the suspension is left, whose end comes late";
 }
 
 TEST_F(RequestTurnsTest, WithoutMemoryThePieceIsLostAndTheClientIsTold) {
