@@ -72,7 +72,11 @@ public:
         pending.push_back({std::move(work), pace});
         state_->enlist(shared_from_this(), pace);
     }
-    void postNext(Work work, Pace pace) override { rest = {std::move(work), pace}; }
+    void postNext(Work work, Pace pace) override {
+        const MutexLock lock(state_->mutex);
+        rest = {std::move(work), pace};
+        state_->enlist(shared_from_this(), pace);
+    }
     void suspend() override {
         const MutexLock lock(state_->mutex);
         if (!isAbandoned) {
@@ -98,7 +102,7 @@ public:
     }
 
     [[nodiscard]] bool mayRun() const noexcept {
-        return suspensions == 0 && (rest.work || next != batch.size() || !pending.empty());
+        return rest.work || (suspensions == 0 && (next != batch.size() || !pending.empty()));
     }
     void fillBatch() {
         if (next == batch.size()) {
@@ -112,7 +116,7 @@ public:
         if (rest.work) {
             return &rest;
         }
-        return next != batch.size() ? &batch[next] : nullptr;
+        return suspensions == 0 && next != batch.size() ? &batch[next] : nullptr;
     }
     void runFront() {
         if (rest.work) {
@@ -206,7 +210,7 @@ bool RequestTurns::State::takeTurn(Queue& queue, bool mayBlock) {
     const Time ends = clock.steadyNow() + kSlice;
     do {
         const Queue::Item* const item = queue.front();
-        if (item == nullptr || queue.suspensions != 0) {
+        if (item == nullptr) {
             return false;
         }
         if (item->pace == Pace::mayBlock && !mayBlock) {

@@ -49,8 +49,9 @@ public:
     virtual ~RequestQueue() = default;
     /// From any thread, without blocking. The work runs later, never inside this call.
     virtual void post(Work work, Pace pace = Pace::quick) = 0;
-    /// From the queue's own work: the rest of a request that takes long. Runs before whatever was posted,
-    /// once other clients have had their turns; one for each piece of work.
+    /// The rest of a request that takes long, or has waited: runs before whatever was posted, once other
+    /// clients have had their turns, and even while the queue is suspended, since what has begun ends. On the
+    /// reporting server queue; one for each piece of work.
     virtual void postNext(Work work, Pace pace = Pace::quick) = 0;
     /// No further piece begins until each `suspend` has had its `resume`. From any thread.
     virtual void suspend() = 0;

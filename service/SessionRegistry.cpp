@@ -8,7 +8,7 @@ namespace tamblo {
 
 void SessionRegistry::set(ReporterID reporterID, const Entry& entry) {
     const auto startedKey = std::pair(entry.clientOrder, reporterID);
-    if (entry.session != nullptr && entry.session->started()) {
+    if (entry.session != nullptr && entry.session->started() && !entry.session->isStopping()) {
         started_.insert_or_assign(startedKey, entry.session);
     } else {
         started_.erase(startedKey);

@@ -195,16 +195,14 @@ void ZRReportingClientServerInstance::performSetConfiguration(const Dictionary& 
                                                               ReporterID reporterID, BooleanReply reply) {
     log::debug(ZRReportingServiceDelegateCategory(), "setting configuration");
     if (const SessionRef session = findReportingSessionForID(reporterID, false)) {
-        Dictionary merged = session->configuration();
-        merged.merge(configuration);
-        const std::size_t before = heldBytes(session->configuration());
-        const std::size_t after = heldBytes(merged);
+        const std::size_t before = session->configurationBytes();
+        const std::size_t after = heldBytes(session->configurationWith(configuration));
         if (const auto refused = beyondLimitOfConfiguration(configuration, before, after)) {
             refuse(reply, *refused);
             return;
         }
         session->updateConfigurationWithContentsOfConfiguration(configuration);
-        countConfiguration(before, after);
+        countConfiguration(before, session->configurationBytes());
     }
     answer(reply, true);
 }
@@ -291,6 +289,7 @@ void ZRReportingClientServerInstance::performSend(Dictionary message, std::uint3
         }
         return;
     }
+    recipients_.clear(); // of what a request without memory has left
     delegate->findReportingSessionsForIDs(reporterIDs, recipients_);
     if (recipients_.empty()) {
         answer(reply);
@@ -306,33 +305,39 @@ void ZRReportingClientServerInstance::performSend(Dictionary message, std::uint3
     }
 }
 
-void ZRReportingClientServerInstance::sendSome(std::shared_ptr<Sending> sending) {
+void ZRReportingClientServerInstance::sendSome(const std::shared_ptr<Sending>& sending) {
     const std::size_t fitting = kBytesAtOnce / std::max<std::size_t>(heldBytes(sending->message), 1);
     const std::size_t atOnce = std::clamp<std::size_t>(fitting, 1, kRecipientsAtOnce);
     const std::size_t end = std::min(sending->recipients.size(), sending->next + atOnce);
     while (sending->next != end) {
-        const SessionRef session = std::move(sending->recipients[sending->next++]);
-        if (session->isStopping()) {
-            // The session keeps the message for its end, and this client's requests wait for that.
-            requests_->suspend();
-            session->sendMessage(sending->record(), [sending, requests = requests_](const ReplyError* error) {
-                sending->noteAnswer(error);
-                requests->resume();
-            });
-            break;
+        const SessionRef& recipient = sending->recipients[sending->next];
+        const bool isLeftOut =
+            sending->isForStartedOnly && (!recipient->started() || recipient->isStopping());
+        if (!isLeftOut && recipient->isStopping()) {
+            goOnWhenStopped(*recipient, sending);
+            return;
         }
-        if (session->started() || !sending->isForStartedOnly) {
+        const SessionRef session = std::move(sending->recipients[sending->next++]);
+        if (isLeftOut) {
+            sending->noteAnswer(nullptr);
+        } else {
             session->sendMessage(sending->record(),
                                  [sending](const ReplyError* error) { sending->noteAnswer(error); });
-        } else {
-            sending->noteAnswer(nullptr);
         }
     }
     if (sending->next != sending->recipients.size()) {
-        afterTurnsOfOthers(Pace::quick, [sending = std::move(sending)](auto& client) mutable {
-            client.sendSome(std::move(sending));
-        });
+        afterTurnsOfOthers(Pace::quick, [sending](auto& client) { client.sendSome(sending); });
     }
+}
+
+/// The message follows the stop, and what this client asks next follows the message.
+void ZRReportingClientServerInstance::goOnWhenStopped(ZRReportingSession& session,
+                                                      const std::shared_ptr<Sending>& sending) {
+    session.whenStopped([client = shared_from_this(), sending] {
+        client->afterTurnsOfOthers(Pace::quick, [sending](auto& sender) { sender.sendSome(sending); });
+        client->requests_->resume();
+    });
+    requests_->suspend();
 }
 
 void ZRReportingClientServerInstance::stopReportingSessionForID(ReporterID reporterID, BooleanReply reply) {
@@ -350,7 +355,12 @@ void ZRReportingClientServerInstance::performStop(ReporterID reporterID, Boolean
     }
     const SessionRef session = findReportingSessionForID(reporterID, false);
     if (session != nullptr && session->started()) {
-        stopSome(reporterID, session, std::move(reply));
+        stopThen(session, [reporterID, session, reply = std::move(reply)](auto& client) mutable {
+            client.finishStop(reporterID, session, std::move(reply));
+        });
+        if (session->isStopping()) {
+            sessionChanged(reporterID, session);
+        }
         return;
     }
     log::debug(ZRReportingServiceDelegateCategory(),
@@ -361,21 +371,25 @@ void ZRReportingClientServerInstance::performStop(ReporterID reporterID, Boolean
     answer(reply, true);
 }
 
-void ZRReportingClientServerInstance::stopSome(ReporterID reporterID, const SessionRef& session,
-                                               BooleanReply reply) {
-    if (!session->stopSome()) {
-        afterTurnsOfOthers(Pace::mayBlock,
-                           [reporterID, session, reply = std::move(reply)](auto& client) mutable {
-                               client.stopSome(reporterID, session, std::move(reply));
-                           });
-        return;
-    }
+void ZRReportingClientServerInstance::finishStop(ReporterID reporterID, const SessionRef& session,
+                                                 BooleanReply reply) {
     sessionChanged(reporterID, session);
     BooleanReply held = session->takeTransactionCompleteBlock();
     answer(held, true);
     logReportingSessions();
     log::standard(ZRReportingServiceDelegateCategory(), "stopping {}", reporterID);
     answer(reply, true);
+}
+
+template <typename Finish>
+void ZRReportingClientServerInstance::stopThen(const SessionRef& session, Finish finish) {
+    if (session->stopSome()) {
+        finish(*this);
+        return;
+    }
+    afterTurnsOfOthers(Pace::mayBlock, [session, finish = std::move(finish)](auto& client) mutable {
+        client.stopThen(session, std::move(finish));
+    });
 }
 
 void ZRReportingClientServerInstance::destroyReportingSession(ReporterID reporterID, BooleanReply reply) {
@@ -391,20 +405,22 @@ void ZRReportingClientServerInstance::performDestroy(ReporterID reporterID, Bool
         answer(reply, true);
         return;
     }
-    destroySome(reporterID, findReportingSessionForID(reporterID, false), std::move(reply));
-}
-
-void ZRReportingClientServerInstance::destroySome(ReporterID reporterID, const SessionRef& session,
-                                                  BooleanReply reply) {
-    if (session != nullptr && session->started() && !session->stopSome()) {
-        afterTurnsOfOthers(Pace::mayBlock,
-                           [reporterID, session, reply = std::move(reply)](auto& client) mutable {
-                               client.destroySome(reporterID, session, std::move(reply));
-                           });
+    const SessionRef session = findReportingSessionForID(reporterID, false);
+    if (session == nullptr || !session->started()) {
+        finishDestroy(reporterID, std::move(reply));
         return;
     }
-    if (session != nullptr) {
-        dropSession(clientReportingSessionMap_.find(reporterID));
+    // From the first part on, the ID is its next holder's.
+    sessionChanged(reporterID, nullptr);
+    stopThen(session, [reporterID, reply = std::move(reply)](auto& client) mutable {
+        client.finishDestroy(reporterID, std::move(reply));
+    });
+}
+
+void ZRReportingClientServerInstance::finishDestroy(ReporterID reporterID, BooleanReply reply) {
+    const auto entry = clientReportingSessionMap_.find(reporterID);
+    if (entry != clientReportingSessionMap_.end()) {
+        dropSession(entry);
     }
     log::standard(ZRReportingServiceDelegateCategory(), "destroying {}", reporterID);
     logReportingSessions();
@@ -511,8 +527,8 @@ void ZRReportingClientServerInstance::storeSession(ReporterID reporterID, Sessio
     SessionRef& place = clientReportingSessionMap_[reporterID];
     SessionRef replaced = std::exchange(place, std::move(session));
     sessionChanged(reporterID, place);
-    const std::size_t before = replaced != nullptr ? heldBytes(replaced->configuration()) : 0;
-    countConfiguration(before, heldBytes(place->configuration()));
+    const std::size_t before = replaced != nullptr ? replaced->configurationBytes() : 0;
+    countConfiguration(before, place->configurationBytes());
     if (const Delegate delegate = hasLeft_ || replaced != nullptr ? nullptr : delegate_.lock()) {
         ++delegate->accountOf(user()).sessions;
         ++context_.platform().activity->sessions;
@@ -528,7 +544,7 @@ void ZRReportingClientServerInstance::dropSession(SessionMap::iterator entry) {
     const ReporterID reporterID = entry->first;
     clientReportingSessionMap_.erase(entry);
     sessionChanged(reporterID, nullptr);
-    countConfiguration(heldBytes(session->configuration()), 0);
+    countConfiguration(session->configurationBytes(), 0);
     if (const Delegate delegate = hasLeft_ ? nullptr : delegate_.lock()) {
         --delegate->accountOf(user()).sessions;
         --context_.platform().activity->sessions;

@@ -98,11 +98,14 @@ private:
     void performStart(ReporterID reporterID, BooleanReply reply);
     void performSend(Dictionary message, std::uint32_t category, std::uint16_t type,
                      const std::vector<ReporterID>& reporterIDs, ErrorReply reply);
-    void sendSome(std::shared_ptr<Sending> sending);
+    void sendSome(const std::shared_ptr<Sending>& sending);
+    void goOnWhenStopped(ZRReportingSession& session, const std::shared_ptr<Sending>& sending);
     void performStop(ReporterID reporterID, BooleanReply reply);
-    void stopSome(ReporterID reporterID, const SessionRef& session, BooleanReply reply);
+    void finishStop(ReporterID reporterID, const SessionRef& session, BooleanReply reply);
     void performDestroy(ReporterID reporterID, BooleanReply reply);
-    void destroySome(ReporterID reporterID, const SessionRef& session, BooleanReply reply);
+    void finishDestroy(ReporterID reporterID, BooleanReply reply);
+    /// Stops the session, in parts if it is large, and calls `finish` with this client.
+    template <typename Finish> void stopThen(const SessionRef& session, Finish finish);
     void endConnection();
     void leaveSome();
 

@@ -147,7 +147,7 @@ bool ZRReportingService::removeClient(ZRReportingClientServerInstance& client) {
     account.sessions -= client.clientReportingSessionMap().size();
     context_.platform().activity->sessions -= client.clientReportingSessionMap().size();
     for (const auto& [reporterID, session] : client.clientReportingSessionMap()) {
-        account.configurationBytes -= heldBytes(session->configuration());
+        account.configurationBytes -= session->configurationBytes();
         sessionChanged(client, reporterID, nullptr);
     }
     return true;

@@ -39,7 +39,6 @@ void RetainedMessages::Share::join(uid_t user) {
     account_ = &account;
     place_ = account.shares.size();
     account.shares.push_back(this);
-    account.waitingBytes += waitingBytes_;
     all_.added(account, bytes_);
 }
 
@@ -48,7 +47,6 @@ void RetainedMessages::Share::leave() noexcept {
     account.shares.back()->place_ = place_;
     std::swap(account.shares[place_], account.shares.back());
     account.shares.pop_back();
-    account.waitingBytes -= waitingBytes_;
     all_.removed(account, bytes_);
     if (account.shares.empty()) {
         all_.accounts_.erase(account.user);
@@ -65,22 +63,6 @@ void RetainedMessages::Share::setUser(uid_t user) {
 void RetainedMessages::Share::remove(std::size_t bytes) noexcept {
     bytes_ -= bytes;
     all_.removed(*account_, bytes);
-}
-
-bool RetainedMessages::Share::addWaiting(std::size_t bytes) {
-    if (account_->waitingBytes + bytes > kMostWaitingBytesOfUser) {
-        return false;
-    }
-    waitingBytes_ += bytes;
-    account_->waitingBytes += bytes;
-    add(bytes);
-    return true;
-}
-
-void RetainedMessages::Share::removeWaiting(std::size_t bytes) noexcept {
-    waitingBytes_ -= bytes;
-    account_->waitingBytes -= bytes;
-    remove(bytes);
 }
 
 void RetainedMessages::removed(Account& account, std::size_t bytes) noexcept {

@@ -26,9 +26,6 @@ class RetainedMessages {
     struct Account;
 
 public:
-    /// Waiting messages of one user's sessions that are stopping.
-    static constexpr std::size_t kMostWaitingBytesOfUser = 4U << 20U;
-
     /// What one session has a share of; it must not outlive the object that it was made of.
     class Share {
     public:
@@ -45,9 +42,6 @@ public:
             all_.added(*account_, bytes);
         }
         void remove(std::size_t bytes) noexcept;
-        /// The same for messages that wait until the session is stopped. Whether there is room for them.
-        [[nodiscard]] bool addWaiting(std::size_t bytes);
-        void removeWaiting(std::size_t bytes) noexcept;
         void countDropped(std::size_t messages) noexcept { all_.droppedMessageCount_ += messages; }
         [[nodiscard]] std::size_t bytes() const noexcept { return bytes_; }
 
@@ -62,7 +56,6 @@ public:
         Account* account_ = nullptr;
         std::size_t place_ = 0; ///< among the account's shares
         std::size_t bytes_ = 0;
-        std::size_t waitingBytes_ = 0;
     };
 
     explicit RetainedMessages(const Limits& limits) noexcept
@@ -79,7 +72,6 @@ private:
     struct Account {
         uid_t user = 0;
         std::size_t bytes = 0;
-        std::size_t waitingBytes = 0;
         std::size_t nextRound = 0; ///< bytes beyond which something is let go
         std::vector<Share*> shares;
     };

@@ -1,16 +1,13 @@
 #include "session/SessionStop.h"
 
 #include "session/BlockingWork.h"
-
 #include "session/ZRReportingSession.h"
 #include "util/Log.h"
 #include "util/TraceEvents.h"
 
 #include <algorithm>
 #include <cstddef>
-#include <cstdint>
-#include <string>
-#include <string_view>
+#include <memory>
 #include <utility>
 #include <vector>
 
@@ -22,8 +19,6 @@ namespace {
 constexpr std::size_t kBytesOfShortStop = 128U << 10U;
 /// Messages that are entered into the index, or let go, in one part.
 constexpr std::size_t kMessagesOfPart = 20'000;
-/// Messages that came meanwhile and are sent in one part.
-constexpr std::size_t kMessagesSentInPart = 500;
 
 } // namespace
 
@@ -49,7 +44,10 @@ bool ZRReportingSession::stopSome() {
     if (stop_->step != SessionStop::Step::done) {
         return false;
     }
-    stop_.reset();
+    const std::unique_ptr<SessionStop> past = std::move(stop_);
+    for (UniqueFunction<void()>& call : past->waiting) {
+        call();
+    }
     return true;
 }
 
@@ -70,9 +68,6 @@ void ZRReportingSession::stopNextPart() {
         break;
     case SessionStop::Step::letGo:
         letGoOfSome();
-        break;
-    case SessionStop::Step::waiting:
-        sendSomeWaiting();
         break;
     case SessionStop::Step::done:
         break;
@@ -109,10 +104,7 @@ void ZRReportingSession::stopSomeOfWorkers() {
         return;
     }
     const Worker& worker = messageWorkers_[workers.back()];
-    stop_->isSending = true;
-    const bool isStopped = worker.instance->stopSome();
-    stop_->isSending = false;
-    if (isStopped) {
+    if (worker.instance->stopSome()) {
         worker.instance->setStarted(false);
         log::debug(ZRReportingSessionCategory(),
                    "ZRReportingSessionWorker action=stop worker={} reporterID={}", *worker.workerClass,
@@ -134,46 +126,14 @@ void ZRReportingSession::letGoOfSome() {
     ownRecordCount_ = 0;
     droppedMessageCount_ = 0;
     started_ = false;
-    stop_->step = SessionStop::Step::waiting;
+    stop_->step = SessionStop::Step::done;
     if (stop_->isLarge) {
         context_.shared<BlockingWork>(context_.platform()).giveBackMemorySoon();
     }
 }
 
-bool ZRReportingSession::hasToWait() const noexcept {
-    return stop_ != nullptr && !stop_->isSending;
-}
-
-void ZRReportingSession::keepWaiting(const MessageRef& message, ErrorReply reply) {
-    addMissingDates(*message, context_.platform().clock->now());
-    const std::size_t bytes = kBytesOfMessage + heldBytes(message->payload());
-    if (retained_.addWaiting(bytes)) {
-        stop_->waiting.push_back({message, std::move(reply), bytes});
-        return;
-    }
-    if (!std::exchange(stop_->hasRefused, true)) {
-        log::error(ZRReportingSessionCategory(),
-                   "too many messages wait for the end of a stop, and more are refused. reporterID={}",
-                   reporterID_);
-    }
-    if (reply) {
-        const ReplyError error = limitReached("waiting_messages", RetainedMessages::kMostWaitingBytesOfUser);
-        reply(&error);
-    }
-}
-
-void ZRReportingSession::sendSomeWaiting() {
-    stop_->isSending = true;
-    for (std::size_t i = 0; i < kMessagesSentInPart && !stop_->waiting.empty(); ++i) {
-        SessionStop::Waiting next = std::move(stop_->waiting.front());
-        stop_->waiting.pop_front();
-        retained_.removeWaiting(next.bytes);
-        sendMessage(next.message, std::move(next.reply));
-    }
-    stop_->isSending = false;
-    if (stop_->waiting.empty()) {
-        stop_->step = SessionStop::Step::done;
-    }
+void ZRReportingSession::whenStopped(UniqueFunction<void()> call) {
+    stop_->waiting.push_back(std::move(call));
 }
 
 } // namespace tamblo

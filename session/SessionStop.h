@@ -1,12 +1,11 @@
 #pragma once
 
-#include "platform/ZRReportingServiceProtocol.h"
+#include "base/UniqueFunction.h"
 #include "session/MessageSort.h"
 #include "session/ZRReportingSessionMessage.h"
 
 #include <cstddef>
 #include <cstdint>
-#include <deque>
 #include <optional>
 #include <vector>
 
@@ -14,13 +13,7 @@ namespace tamblo {
 
 /// How far the stop of a session has come, in whose parts other work of the queue runs in between.
 struct SessionStop {
-    enum class Step : std::uint8_t { sort, index, workers, letGo, waiting, done };
-    /// A message that came meanwhile.
-    struct Waiting {
-        MessageRef message;
-        ErrorReply reply;
-        std::size_t bytes;
-    };
+    enum class Step : std::uint8_t { sort, index, workers, letGo, done };
 
     SessionStop(std::vector<MessageRef>& messages, bool isShortStop) : isShort(isShortStop) {
         sort.emplace(messages);
@@ -33,10 +26,7 @@ struct SessionStop {
     std::vector<std::size_t> workers; ///< places of those that are to be stopped, the next one last
     std::vector<MessageRef> past;     ///< messages that are to be let go
     bool isLarge = false;             ///< what is let go
-    std::deque<Waiting> waiting;
-    bool hasRefused = false;
-    /// What is sent comes from the worker that is stopping, or has waited.
-    bool isSending = false;
+    std::vector<UniqueFunction<void()>> waiting; ///< for the end
 };
 
 } // namespace tamblo

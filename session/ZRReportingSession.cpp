@@ -49,11 +49,18 @@ void ZRReportingSession::setServiceType(AudioServiceType serviceType) {
 }
 
 void ZRReportingSession::updateConfigurationWithContentsOfConfiguration(const Dictionary& configuration) {
-    if (const Value* name = configuration.find(ZRReportingMessageQVHostApplicationDisplayID)) {
-        configuration_.set(ZRReportingApplicationName, *name);
-    }
-    configuration_.merge(configuration);
+    configuration_ = configurationWith(configuration);
+    configurationBytes_ = heldBytes(configuration_);
     appName_ = ZRReportingUtilityRetrieveAppName(configuration_);
+}
+
+Dictionary ZRReportingSession::configurationWith(const Dictionary& configuration) const {
+    Dictionary merged = configuration_;
+    if (const Value* name = configuration.find(ZRReportingMessageQVHostApplicationDisplayID)) {
+        merged.set(ZRReportingApplicationName, *name);
+    }
+    merged.merge(configuration);
+    return merged;
 }
 
 void ZRReportingSession::start() {
@@ -143,10 +150,6 @@ std::size_t ZRReportingSession::letGoOfOldest(std::size_t bytes, std::string_vie
 }
 
 void ZRReportingSession::sendMessage(const MessageRef& message, ErrorReply reply) {
-    if (hasToWait()) {
-        keepWaiting(message, std::move(reply));
-        return;
-    }
     const std::shared_ptr<HeldReply> outer = std::exchange(heldReply_, nullptr);
     accept(message);
     if (heldReply_ != nullptr) {

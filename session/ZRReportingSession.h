@@ -57,25 +57,28 @@ public:
     void setClientProcessName(std::optional<std::string> name) { clientProcessName_ = std::move(name); }
     /// Adds the entries to the configuration, which is never replaced.
     void updateConfigurationWithContentsOfConfiguration(const Dictionary& configuration);
+    /// What the configuration would be after that.
+    [[nodiscard]] Dictionary configurationWith(const Dictionary& configuration) const;
     void addPreviousValues(const Dictionary& values) { remember(values); }
     /// To whose budget of retained messages the session's count; at first, the service's own user's.
     void setUser(uid_t user) { retained_.setUser(user); }
 
     void start();
     /// Normalises the message, records it unless it is redundant, and offers it to the consumer workers,
-    /// whether or not the session is started. May be called by a worker in its `stop`. The reply is called at
-    /// the end. A message that comes between two parts of a stop waits for the stop's end, unless too much
-    /// waits already: then the reply says so, and the message is lost.
+    /// whether or not the session is started. The reply is called at the end. Between the parts of a stop,
+    /// only by workers in their own `stop`: what others have to send waits until it is over.
     void sendMessage(const MessageRef& message, ErrorReply reply = {});
     /// Keeps back the reply of the message that is being handled, for a worker that has something to do for
     /// it on another queue: until what this returns, and whatever else it returned for the message, is gone.
     [[nodiscard]] std::shared_ptr<const void> holdReply();
     void stop();
-    /// Does the next part of the stop, some milliseconds of it, and answers whether the session is stopped
-    /// and what came meanwhile is done. Between two parts the queue may do anything but start the session.
+    /// Does the next part of the stop, some milliseconds of it, and answers whether the session is stopped.
+    /// Between two parts the queue may do anything but start the session and send it messages.
     [[nodiscard]] bool stopSome();
     /// Whether a stop has begun and is not over.
     [[nodiscard]] bool isStopping() const noexcept { return stop_ != nullptr; }
+    /// Calls back once the stop that is under way is over.
+    void whenStopped(UniqueFunction<void()> call);
 
     /// The start reply that waits for the stop; empty when none does.
     void setTransactionCompleteBlock(BooleanReply reply) { transactionCompleteBlock_ = std::move(reply); }
@@ -88,6 +91,8 @@ public:
     [[nodiscard]] AudioServiceType serviceType() const noexcept { return serviceType_; }
     [[nodiscard]] std::string_view serviceName() const noexcept { return serviceName_; }
     [[nodiscard]] const Dictionary& configuration() const noexcept { return configuration_; }
+    /// What it takes, and goes on to take until it is next updated.
+    [[nodiscard]] std::size_t configurationBytes() const noexcept { return configurationBytes_; }
     [[nodiscard]] ReporterID reporterID() const noexcept { return reporterID_; }
     [[nodiscard]] const std::vector<pid_t>& processIdentifiers() const noexcept {
         return processIdentifiers_;
@@ -154,9 +159,6 @@ private:
     void indexSomeAgain();
     void stopSomeOfWorkers();
     void letGoOfSome();
-    void sendSomeWaiting();
-    void keepWaiting(const MessageRef& message, ErrorReply reply);
-    [[nodiscard]] bool hasToWait() const noexcept;
     /// Calls `act` with each worker once: those of the first role, then those of the second, then all others.
     template <typename Act>
     void forEachWorker(bool WorkerRole::*first, bool WorkerRole::*second, Act act) const {
@@ -194,6 +196,7 @@ private:
     std::string_view serviceName_ = ZRReportingServiceNameUnknown;
     std::optional<std::string> clientProcessName_;
     Dictionary configuration_;
+    std::size_t configurationBytes_ = 0;
     /// What the configuration names as the application; payloads share it.
     Value appName_;
     BooleanReply transactionCompleteBlock_;

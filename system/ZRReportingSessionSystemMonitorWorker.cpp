@@ -48,7 +48,8 @@ void ZRReportingSessionSystemMonitorWorker::handleChange(Dictionary featureState
         featureState.remove(ZRReportingInternalEventSystemUptimeSec);
     }
     const std::shared_ptr<ZRReportingSession> owner = session();
-    if (featureState.empty() || owner == nullptr) {
+    // A change amid the session's stop comes too late for whoever would have it.
+    if (featureState.empty() || owner == nullptr || owner->isStopping()) {
         return;
     }
     owner->sendMessage(std::make_shared<ZRReportingSessionMessage>(std::move(featureState),

@@ -144,6 +144,42 @@ TEST_F(TurnsTest, AMessageToASessionThatIsBeingStoppedWaitsAndSoDoWhatTheClientA
     EXPECT_EQ(script.count("message Init 14/11"), 2U + 40U) << "the one to all is for started ones";
 }
 
+TEST_F(TurnsTest, AnEndInPartsIsTheEndFromTheFirstPartOn) {
+    stopTime = milliseconds(10);
+    for (const ReporterID id : {7, 8}) {
+        const Connection owner = connect(10), next = connect(11), sender = connect(12);
+        open(owner, id);
+        next->object().createReportingSession(id, {});
+        fill(id);
+        if (id == 7) {
+            owner->object().destroyReportingSession(id, note<bool>("destroy"));
+        } else {
+            owner->interrupt();
+        }
+        for (stopped.clear(); stopped.empty() && device.serverQueue().runOne();) {
+        }
+        ASSERT_NE(find(id), nullptr);
+        EXPECT_EQ(find(id)->processIdentifiers().front(), 11) << "the next holder's";
+        sender->object().sendMessage({{"n", id}}, 14, 11, {id}, note<>("to the ID"));
+        sender->object().sendMessage({{"n", id}}, 14, 11, {}, note<>("to all"));
+        EXPECT_THAT(answers(), testing::IsSupersetOf({"to the ID", "to all"}));
+        EXPECT_EQ(find(id)->messages().size(), 1U);
+        EXPECT_EQ(service->singleMessageSession()->acceptedMessageCount(), std::size_t(id - 6));
+    }
+}
+
+TEST_F(TurnsTest, WhatHasBegunEndsThoughItsClientIsHeldUp) {
+    const Connection owner = connect(10), sender = connect(11);
+    open(owner, 7);
+    fill(7);
+    stopTime = milliseconds(10);
+    owner->object().stopReportingSessionForID(7, note<bool>("stop"));
+    (void)device.serverQueue().runOne();
+    owner->requestQueue()->suspend();
+    sender->object().sendMessage({{"n", 1}}, 14, 11, {7}, note<>("send"));
+    EXPECT_THAT(answers(), ElementsAre("stop true", "send"));
+}
+
 TEST_F(TurnsTest, LimitsOfAUserAreNobodyElses) {
     Limits& limits = device.services().limits;
     limits.sessionsOfConnection = 3;
@@ -174,14 +210,18 @@ TEST_F(TurnsTest, LimitsOfAUserAreNobodyElses) {
     EXPECT_FALSE(configure(first, 1, {{"HostApplicationDisplayID", "com.example.player"}}));
     EXPECT_TRUE(configure(first, 1, {{"a", text}}) && configure(first, 1, {{"a", text}})) << "the same key";
     EXPECT_FALSE(configure(first, 1, {{"b", text}})) << "of the session";
+    for (int i = 0; i < 40; ++i) {
+        EXPECT_TRUE(configure(first, 1, {{"a", text}, {"QVHostApplicationDisplayID", "a.b"}}));
+    }
     EXPECT_FALSE(configure(first, 2, {{"a", text}})) << "of the user";
     EXPECT_TRUE(configure(stranger, 1, {{"a", text}}));
-    EXPECT_EQ(find(1)->configuration().size(), 1U);
+    EXPECT_EQ(find(1)->configuration().size(), 3U);
 
     first->invalidate();
     first.reset();
     (void)run();
     EXPECT_TRUE(configure(second, 1, {{"a", text}})) << "what has left gives back";
+    EXPECT_FALSE(configure(second, 1, {{"a", text}, {"b", text}})) << "and no more than it had";
     EXPECT_THAT(create(second, 2, 3), ElementsAre("create true", "create true"));
     EXPECT_EQ(device.services().activity->sessions, 4U);
 }
