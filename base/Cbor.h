@@ -30,6 +30,7 @@ enum class CborError : std::uint8_t {
     // What the reader's limits forbid.
     tooManyEntries,
     keyTooLong,
+    keysTooLong,
     tooLarge,
 };
 
@@ -41,6 +42,7 @@ enum class CborError : std::uint8_t {
 struct CborLimits {
     std::size_t entries = static_cast<std::size_t>(-1); ///< of all maps together
     std::size_t keyBytes = static_cast<std::size_t>(-1);
+    std::size_t bytesOfKeys = static_cast<std::size_t>(-1); ///< of all maps together
     std::size_t decodedBytes = static_cast<std::size_t>(-1);
 };
 
@@ -167,6 +169,7 @@ private:
     const CborLimits limits_;
     std::size_t decodedBytes_ = 0;
     std::size_t entriesRead_ = 0;
+    std::size_t keyBytesRead_ = 0;
     MapEntries ownEntries_; ///< without a cache
     CborError error_ = CborError::none;
 };

@@ -47,7 +47,7 @@ float halfToSingle(std::uint16_t half) noexcept {
 } // namespace
 
 std::string_view describe(CborError error) noexcept {
-    constexpr std::array<std::string_view, 14> texts{
+    constexpr std::array<std::string_view, 15> texts{
         "no error",
         "the item ends too early",
         "not well-formed",
@@ -61,6 +61,7 @@ std::string_view describe(CborError error) noexcept {
         "an integer below -2^63",
         "too many entries",
         "a key that is too long",
+        "keys that are too long together",
         "values that take too much memory",
     };
     static_assert(texts.size() == static_cast<std::size_t>(CborError::tooLarge) + 1);
@@ -422,6 +423,9 @@ bool CborReader::readEntries(const Head& head, int depth) {
         }
         if (key.size() > limits_.keyBytes) {
             return fail(CborError::keyTooLong);
+        }
+        if ((keyBytesRead_ += key.size()) > limits_.bytesOfKeys) {
+            return fail(CborError::keysTooLong);
         }
         if (!charge(kEntryBytes)) {
             return false;

@@ -24,7 +24,10 @@ struct Limits {
     std::size_t reportersOfMessage = 128;
     std::size_t entriesOfDictionary = 1'024; ///< of a payload or configuration, inner maps included
     std::size_t keyBytes = 1'024;
+    std::size_t bytesOfKeys = 64U << 10U;        ///< of all of a frame
     std::size_t decodedBytesOfFrame = 4U << 20U; ///< as values in memory
+    std::size_t deliveredBytesOfMessage = 16U
+                                          << 20U; ///< as values in memory, for each reporter that it names
     std::size_t applicationNameBytes = 512;
 
     // Of one session, connection or user.
@@ -42,7 +45,7 @@ struct Limits {
     std::size_t waitingBytes = 4U << 20U;          ///< of a connection, as values in memory
     std::size_t waitingBytesOfUser = 8U << 20U;    ///< likewise
     std::size_t unfinishedBytesOfUser = 8U << 20U; ///< frames that have begun
-    std::size_t frameSeconds = 10;                 ///< without progress of a frame that has begun
+    std::size_t frameSeconds = 10;                 ///< until a frame that has begun is finished
     std::size_t replyBytes = 4U << 20U;            ///< that a connection's socket has refused
     std::size_t replyBytesOfUser = 16U << 20U;     ///< likewise
 

@@ -150,21 +150,22 @@ void RequestTurns::State::enlist(const QueueRef& queue, Pace pace) {
     if (queue->isListed || !queue->mayRun()) {
         return;
     }
-    queue->isListed = true;
     std::deque<QueueRef>& ofUser = waiting[queue->client.user];
-    if (ofUser.empty()) {
+    ofUser.push_back(queue);
+    if (ofUser.size() == 1) {
         users.push_back(queue->client.user);
     }
-    ofUser.push_back(queue);
+    queue->isListed = true;
     callForTurns(pace);
 }
 
 void RequestTurns::State::callForTurns(Pace pace) {
-    if (!std::exchange(isCalled, true)) {
+    if (!isCalled) {
         const auto turns = [self = shared_from_this(), mayBlock = pace == Pace::mayBlock] {
             self->takeTurns(mayBlock);
         };
         serverQueue.post(turns, pace);
+        isCalled = true;
     }
 }
 

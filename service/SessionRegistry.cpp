@@ -9,7 +9,10 @@ namespace tamblo {
 void SessionRegistry::set(ReporterID reporterID, const Entry& entry) {
     const auto startedKey = std::pair(entry.clientOrder, reporterID);
     if (entry.session != nullptr && entry.session->started() && !entry.session->isStopping()) {
-        started_.insert_or_assign(startedKey, entry.session);
+        Started& started = started_[startedKey];
+        if (started.session != entry.session) {
+            started = {entry.session, ++lastStart_};
+        }
     } else {
         started_.erase(startedKey);
     }
@@ -37,13 +40,22 @@ const SessionRegistry::Entry* SessionRegistry::find(ReporterID reporterID) const
     return held != holders_.end() ? &held->second.front() : nullptr;
 }
 
-std::vector<SessionRef> SessionRegistry::startedSessions(std::size_t atMost) const {
-    std::vector<SessionRef> sessions;
-    sessions.reserve(std::min(atMost, started_.size()));
-    for (auto started = started_.begin(); started != started_.end() && sessions.size() != atMost; ++started) {
-        sessions.push_back(started->second);
+std::optional<StartedWalk> SessionRegistry::findStarted(const std::optional<StartedWalk>& walk,
+                                                        std::size_t atMost,
+                                                        std::vector<SessionRef>& found) const {
+    StartedWalk reached{.last = {}, .newest = walk ? walk->newest : lastStart_};
+    auto place = walk ? started_.upper_bound(walk->last) : started_.begin();
+    for (std::size_t left = atMost; place != started_.end(); ++place) {
+        if (place->second.number > reached.newest) {
+            continue;
+        }
+        if (left-- == 0) {
+            return reached;
+        }
+        found.push_back(place->second.session);
+        reached.last = place->first;
     }
-    return sessions;
+    return std::nullopt;
 }
 
 } // namespace tamblo

@@ -6,6 +6,7 @@
 #include <cstddef>
 #include <cstdint>
 #include <map>
+#include <optional>
 #include <unordered_map>
 #include <utility>
 #include <vector>
@@ -29,15 +30,21 @@ public:
     void set(ReporterID reporterID, const Entry& entry);
     /// The entry of the first client in order of acceptance that has the ID, or null.
     [[nodiscard]] const Entry* find(ReporterID reporterID) const noexcept;
-    /// Client by client in order of acceptance, by ID within each; the first of them when fewer are wanted.
-    [[nodiscard]] std::vector<SessionRef>
-    startedSessions(std::size_t atMost = static_cast<std::size_t>(-1)) const;
+    /// Appends the started ones: client by client in order of acceptance, by ID within each. Without a walk
+    /// from the first on. Where they end; nothing when no further one can be there.
+    std::optional<StartedWalk> findStarted(const std::optional<StartedWalk>& walk, std::size_t atMost,
+                                           std::vector<SessionRef>& found) const;
     [[nodiscard]] std::size_t startedCount() const noexcept { return started_.size(); }
 
 private:
     /// Almost always one client holds an ID; more are in order of acceptance.
     std::unordered_map<ReporterID, std::vector<Entry>, SeededHash> holders_;
-    std::map<std::pair<std::uint64_t, ReporterID>, SessionRef> started_;
+    struct Started {
+        SessionRef session;
+        std::uint64_t number = 0; ///< in the order of their starts
+    };
+    std::map<std::pair<std::uint64_t, ReporterID>, Started> started_;
+    std::uint64_t lastStart_ = 0;
 };
 
 } // namespace tamblo

@@ -7,6 +7,7 @@
 #include "util/TraceEvents.h"
 
 #include <algorithm>
+#include <new>
 #include <utility>
 
 namespace tamblo {
@@ -20,8 +21,6 @@ constexpr std::int64_t kReportingDisabled = 1;
 /// How many sessions of a client that leaves are let go in one piece of work; of started ones, one.
 constexpr std::size_t kSessionsLeftAtOnce = 16;
 constexpr int kExitStatusKilled = 2;
-/// More retained messages than this take a moment to free.
-constexpr std::size_t kManyMessages = 10'000;
 /// A message to several sessions is sent to so many at a time, and to fewer when it is large.
 constexpr std::size_t kRecipientsAtOnce = 32;
 constexpr std::size_t kBytesAtOnce = 64 * 1024;
@@ -43,9 +42,20 @@ std::size_t applicationNameBytes(const Dictionary& configuration) {
     std::size_t longest = 0;
     for (const auto key : {ZRReportingApplicationName, ZRReportingMessageQVHostApplicationDisplayID}) {
         const Value* const name = configuration.find(key);
-        longest = std::max(longest, name != nullptr ? name->stringValue().size() : 0);
+        if (name != nullptr) {
+            longest = std::max(longest, name->isString() ? name->stringValue().size() : name->heldBytes());
+        }
     }
     return longest;
+}
+
+/// One that was never stopped may retain hundreds of thousands of messages.
+void letGoInParts(Context& context, SessionRef session) {
+    if (!session->letGoSome()) {
+        context.serverQueue().post([&context, session = std::move(session)]() mutable {
+            letGoInParts(context, std::move(session));
+        });
+    }
 }
 
 } // namespace
@@ -58,16 +68,20 @@ struct ZRReportingClientServerInstance::Sending {
     std::uint16_t type;
     bool isForStartedOnly; ///< those that are stopped meanwhile are left out
     std::vector<SessionRef> recipients;
+    std::optional<StartedWalk> further; ///< recipients that are still to be found
     ErrorReply reply;
-    std::size_t next = 0;
-    std::size_t answered = 0; ///< of the recipients
+    std::size_t next = 0; ///< of the recipients
+    std::size_t begun = 0;
+    std::size_t answered = 0;
+    bool isWhole = false; ///< all recipients have been begun with
     std::optional<ReplyError> refusal{};
 
     ~Sending() {
-        if (reply && answered == recipients.size()) {
+        if (reply && isWhole && answered == begun) {
             reply(refusal ? &*refusal : nullptr);
         }
     }
+    /// On the server queue, whoever holds a reply back.
     void noteAnswer(const ReplyError* error) {
         ++answered;
         if (error != nullptr) {
@@ -226,7 +240,7 @@ ZRReportingClientServerInstance::beyondLimitOfConfiguration(const Dictionary& ad
 }
 
 void ZRReportingClientServerInstance::countConfiguration(std::size_t before, std::size_t after) const {
-    if (const Delegate delegate = hasLeft_ ? nullptr : delegate_.lock()) {
+    if (const Delegate delegate = delegate_.lock()) {
         delegate->accountOf(user()).configurationBytes += after - before;
     }
 }
@@ -290,7 +304,12 @@ void ZRReportingClientServerInstance::performSend(Dictionary message, std::uint3
         return;
     }
     recipients_.clear(); // of what a request without memory has left
-    delegate->findReportingSessionsForIDs(reporterIDs, recipients_);
+    std::optional<StartedWalk> further;
+    if (reporterIDs.empty()) {
+        further = delegate->findFirstStarted(recipients_);
+    } else {
+        delegate->findReportingSessionsForIDs(reporterIDs, recipients_);
+    }
     if (recipients_.empty()) {
         answer(reply);
     } else if (recipients_.size() == 1 && !recipients_.front()->isStopping()) {
@@ -300,16 +319,20 @@ void ZRReportingClientServerInstance::performSend(Dictionary message, std::uint3
             std::move(reply));
         recipients_.clear();
     } else {
-        sendSome(std::shared_ptr<Sending>(new Sending{std::move(message), category, type, reporterIDs.empty(),
-                                                      std::exchange(recipients_, {}), std::move(reply)}));
+        sendSome(
+            std::shared_ptr<Sending>(new Sending{std::move(message), category, type, reporterIDs.empty(),
+                                                 std::exchange(recipients_, {}), further, std::move(reply)}));
     }
 }
 
 void ZRReportingClientServerInstance::sendSome(const std::shared_ptr<Sending>& sending) {
     const std::size_t fitting = kBytesAtOnce / std::max<std::size_t>(heldBytes(sending->message), 1);
     const std::size_t atOnce = std::clamp<std::size_t>(fitting, 1, kRecipientsAtOnce);
-    const std::size_t end = std::min(sending->recipients.size(), sending->next + atOnce);
-    while (sending->next != end) {
+    for (std::size_t left = atOnce; left != 0; --left) {
+        if (!findRecipients(*sending)) {
+            sending->isWhole = true;
+            return;
+        }
         const SessionRef& recipient = sending->recipients[sending->next];
         const bool isLeftOut =
             sending->isForStartedOnly && (!recipient->started() || recipient->isStopping());
@@ -318,23 +341,37 @@ void ZRReportingClientServerInstance::sendSome(const std::shared_ptr<Sending>& s
             return;
         }
         const SessionRef session = std::move(sending->recipients[sending->next++]);
-        if (isLeftOut) {
-            sending->noteAnswer(nullptr);
-        } else {
+        if (!isLeftOut) {
+            ++sending->begun;
             session->sendMessage(sending->record(),
                                  [sending](const ReplyError* error) { sending->noteAnswer(error); });
         }
     }
-    if (sending->next != sending->recipients.size()) {
-        afterTurnsOfOthers(Pace::quick, [sending](auto& client) { client.sendSome(sending); });
+    afterTurnsOfOthers(Pace::quick, [sending](auto& client) { client.sendSome(sending); });
+}
+
+/// Sees to it that the next recipient is known, if there is one.
+bool ZRReportingClientServerInstance::findRecipients(Sending& sending) const {
+    if (sending.next != sending.recipients.size()) {
+        return true;
     }
+    const Delegate delegate = delegate_.lock();
+    if (!sending.further || delegate == nullptr) {
+        return false;
+    }
+    sending.recipients.clear();
+    sending.next = 0;
+    sending.further = delegate->findNextStarted(*sending.further, sending.recipients);
+    return !sending.recipients.empty();
 }
 
 /// The message follows the stop, and what this client asks next follows the message.
 void ZRReportingClientServerInstance::goOnWhenStopped(ZRReportingSession& session,
                                                       const std::shared_ptr<Sending>& sending) {
     session.whenStopped([client = shared_from_this(), sending] {
-        client->afterTurnsOfOthers(Pace::quick, [sending](auto& sender) { sender.sendSome(sending); });
+        if (!client->hasLeft_) {
+            client->afterTurnsOfOthers(Pace::quick, [sending](auto& sender) { sender.sendSome(sending); });
+        }
         client->requests_->resume();
     });
     requests_->suspend();
@@ -420,7 +457,8 @@ void ZRReportingClientServerInstance::performDestroy(ReporterID reporterID, Bool
 void ZRReportingClientServerInstance::finishDestroy(ReporterID reporterID, BooleanReply reply) {
     const auto entry = clientReportingSessionMap_.find(reporterID);
     if (entry != clientReportingSessionMap_.end()) {
-        dropSession(entry);
+        sessionChanged(reporterID, nullptr);
+        letGoOf(entry);
     }
     log::standard(ZRReportingServiceDelegateCategory(), "destroying {}", reporterID);
     logReportingSessions();
@@ -469,6 +507,12 @@ void ZRReportingClientServerInstance::handleConnectionError() {
     onServerQueue(Pace::mayBlock, [](auto& client) { client.endConnection(); });
 }
 
+std::size_t ZRReportingClientServerInstance::abandon() {
+    requests_->abandon();
+    const auto isStarted = [](const auto& entry) { return entry.second->started(); };
+    return static_cast<std::size_t>(std::ranges::count_if(clientReportingSessionMap_, isStarted));
+}
+
 void ZRReportingClientServerInstance::endAtOnce() {
     requests_->abandon();
     handleConnectionError();
@@ -489,10 +533,18 @@ void ZRReportingClientServerInstance::leaveSome() {
          ++i) {
         // Let go as soon as it is stopped, so that what it holds is not freed all at once in the end.
         const auto entry = clientReportingSessionMap_.begin();
-        const SessionRef& session = entry->second;
+        const SessionRef session = entry->second;
         hasStopped = session->started();
-        if (!hasStopped || session->stopSome()) {
-            clientReportingSessionMap_.erase(entry);
+        bool isOver = !hasStopped;
+        try {
+            isOver = isOver || session->stopSome();
+        } catch (const std::bad_alloc&) {
+            log::ownError(ZRReportingServiceDelegateCategory(),
+                          "no memory to stop the session of reporter {}", entry->first);
+            isOver = true;
+        }
+        if (isOver) {
+            letGoOf(entry);
         }
     }
     if (!clientReportingSessionMap_.empty()) {
@@ -529,26 +581,25 @@ void ZRReportingClientServerInstance::storeSession(ReporterID reporterID, Sessio
     sessionChanged(reporterID, place);
     const std::size_t before = replaced != nullptr ? replaced->configurationBytes() : 0;
     countConfiguration(before, place->configurationBytes());
-    if (const Delegate delegate = hasLeft_ || replaced != nullptr ? nullptr : delegate_.lock()) {
+    if (replaced != nullptr) {
+        letGoInParts(context_, std::move(replaced));
+        return;
+    }
+    if (const Delegate delegate = delegate_.lock()) {
         ++delegate->accountOf(user()).sessions;
-        ++context_.platform().activity->sessions;
     }
-    if (replaced != nullptr && replaced->messages().size() > kManyMessages) {
-        // Freed as a piece of work of its own, which may take its time.
-        context_.serverQueue().post([session = std::move(replaced)] {}, Pace::mayBlock);
-    }
+    ++context_.platform().activity->sessions;
 }
 
-void ZRReportingClientServerInstance::dropSession(SessionMap::iterator entry) {
-    const SessionRef session = std::move(entry->second);
-    const ReporterID reporterID = entry->first;
+void ZRReportingClientServerInstance::letGoOf(SessionMap::iterator entry) {
+    SessionRef session = std::move(entry->second);
     clientReportingSessionMap_.erase(entry);
-    sessionChanged(reporterID, nullptr);
     countConfiguration(session->configurationBytes(), 0);
-    if (const Delegate delegate = hasLeft_ ? nullptr : delegate_.lock()) {
+    if (const Delegate delegate = delegate_.lock()) {
         --delegate->accountOf(user()).sessions;
-        --context_.platform().activity->sessions;
     }
+    --context_.platform().activity->sessions;
+    letGoInParts(context_, std::move(session));
 }
 
 void ZRReportingClientServerInstance::sessionChanged(ReporterID reporterID, const SessionRef& session) const {

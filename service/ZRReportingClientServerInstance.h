@@ -68,6 +68,9 @@ public:
     void handleConnectionError();
     /// The same without the requests that wait: those are dropped. On the server queue.
     void endAtOnce();
+    /// Drops whatever is left to do for the client. How many sessions are not stopped for that. On the server
+    /// queue.
+    std::size_t abandon();
 
     [[nodiscard]] SessionRef findReportingSessionForID(ReporterID reporterID, bool acrossAllClients) const;
 
@@ -99,6 +102,7 @@ private:
     void performSend(Dictionary message, std::uint32_t category, std::uint16_t type,
                      const std::vector<ReporterID>& reporterIDs, ErrorReply reply);
     void sendSome(const std::shared_ptr<Sending>& sending);
+    [[nodiscard]] bool findRecipients(Sending& sending) const;
     void goOnWhenStopped(ZRReportingSession& session, const std::shared_ptr<Sending>& sending);
     void performStop(ReporterID reporterID, BooleanReply reply);
     void finishStop(ReporterID reporterID, const SessionRef& session, BooleanReply reply);
@@ -108,11 +112,11 @@ private:
     template <typename Finish> void stopThen(const SessionRef& session, Finish finish);
     void endConnection();
     void leaveSome();
+    /// Takes the session out of what the client and its user have, and lets it go.
+    void letGoOf(SessionMap::iterator entry);
 
     [[nodiscard]] SessionRef makeSession(ReporterID reporterID) const;
     void storeSession(ReporterID reporterID, SessionRef session);
-    /// Takes the session out of the map. It is the client's no more, and nobody finds it.
-    void dropSession(SessionMap::iterator entry);
     /// Notes in the user's account how the bytes of a configuration have changed.
     void countConfiguration(std::size_t before, std::size_t after) const;
     [[nodiscard]] std::optional<ReplyError> beyondLimitOfSessions() const;

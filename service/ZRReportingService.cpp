@@ -16,8 +16,11 @@ namespace tamblo {
 
 namespace {
 
-/// How long the requests that have been read may take when the service ends.
-constexpr std::chrono::seconds kShutdownPatience{5};
+/// How long the requests that have been read may take when the service ends, and then what is left of stops.
+constexpr std::chrono::seconds kPatienceWithRequests{5};
+constexpr std::chrono::seconds kPatienceWithStops{3};
+/// A message to all started sessions looks for so many of them at a time.
+constexpr std::size_t kSessionsFoundAtOnce = 32;
 
 /// Seconds from the start to the end, either way round; −1 without a start.
 Value uptimeBetween(const std::optional<WallTime>& start, WallTime end, pid_t processIdentifier,
@@ -141,20 +144,16 @@ bool ZRReportingService::removeClient(ZRReportingClientServerInstance& client) {
     if (place == clients_.end() || place->get() != &client) {
         return false;
     }
+    leavingClients_.emplace(client.acceptanceOrder(), *place);
     clients_.erase(place);
-    ++leavingClients_;
-    UserAccount& account = accounts_[client.user()];
-    account.sessions -= client.clientReportingSessionMap().size();
-    context_.platform().activity->sessions -= client.clientReportingSessionMap().size();
     for (const auto& [reporterID, session] : client.clientReportingSessionMap()) {
-        account.configurationBytes -= session->configurationBytes();
         sessionChanged(client, reporterID, nullptr);
     }
     return true;
 }
 
 void ZRReportingService::clientHasLeft(const ClientRef& client) {
-    --leavingClients_;
+    leavingClients_.erase(client->acceptanceOrder());
     if (isShuttingDown_) {
         // Its connection may end when nothing is reported any more.
         reportClientUptime(context_, client, client->processIdentifier(), context_.platform().clock->now());
@@ -169,7 +168,9 @@ void ZRReportingService::sessionChanged(const ZRReportingClientServerInstance& c
 
 std::vector<SessionRef> ZRReportingService::getAllActiveReportingSessions() {
     logSessionsOfClients();
-    return sessions_.startedSessions();
+    std::vector<SessionRef> sessions;
+    (void)sessions_.findStarted(std::nullopt, sessions_.startedCount(), sessions);
+    return sessions;
 }
 
 void ZRReportingService::logSessionsOfClients() const {
@@ -196,7 +197,8 @@ void ZRReportingService::logReportingSessions() {
     }
     // A client may have ten thousand of them and start one more: what the line does not show is not gathered.
     logSessionsOfClients();
-    const std::vector<SessionRef> shown = sessions_.startedSessions(SessionList::kMost);
+    std::vector<SessionRef> shown;
+    (void)sessions_.findStarted(std::nullopt, SessionList::kMost, shown);
     const std::size_t count = sessions_.startedCount();
     log::standard(ZRReportingServiceDelegateCategory(), "{} active reporting session(s) {}", count,
                   SessionList{shown, count});
@@ -223,16 +225,25 @@ void ZRReportingService::findReportingSessionsForIDs(std::span<const ReporterID>
             found.push_back(std::move(session));
         }
     }
-    if (!reporterIDs.empty()) {
-        return;
+    auto walk = reporterIDs.empty() ? findFirstStarted(found) : std::nullopt;
+    while (walk) {
+        walk = findNextStarted(*walk, found);
     }
-    std::vector<SessionRef> active = getAllActiveReportingSessions();
+}
+
+std::optional<StartedWalk> ZRReportingService::findFirstStarted(std::vector<SessionRef>& found) {
+    logSessionsOfClients();
     logReportingSessions();
-    if (active.empty()) {
+    if (sessions_.startedCount() == 0) {
         found.push_back(singleMessages_->retrieve());
-    } else {
-        found.insert(found.end(), active.begin(), active.end());
+        return std::nullopt;
     }
+    return sessions_.findStarted(std::nullopt, kSessionsFoundAtOnce, found);
+}
+
+std::optional<StartedWalk> ZRReportingService::findNextStarted(const StartedWalk& walk,
+                                                               std::vector<SessionRef>& found) {
+    return sessions_.findStarted(walk, kSessionsFoundAtOnce, found);
 }
 
 void ZRReportingService::shutDown(UniqueFunction<void()> completed) {
@@ -246,22 +257,49 @@ void ZRReportingService::shutDown(UniqueFunction<void()> completed) {
 void ZRReportingService::endAllClients(UniqueFunction<void()> completed) {
     isShuttingDown_ = true;
     shutdownCompleted_ = std::move(completed);
-    shutdownPatience_ = context_.platform().workQueues->callAfter(
-        kShutdownPatience, [&queue = context_.serverQueue(), self = std::weak_ptr(self_)] {
-            queue.post(whileAlive(self, [](auto& service) {
-                for (const ClientRef& client : service.clients_) {
-                    client->endAtOnce();
-                }
-            }));
-        });
+    callInShutdown(kPatienceWithRequests, &ZRReportingService::dropRequests);
     for (const ClientRef& client : clients_) {
         client->handleConnectionError();
     }
     completeShutdown();
 }
 
+void ZRReportingService::callInShutdown(std::chrono::milliseconds delay,
+                                        void (ZRReportingService::*function)()) {
+    shutdownPatience_ = context_.platform().workQueues->callAfter(
+        delay, [&queue = context_.serverQueue(), function, self = std::weak_ptr(self_)] {
+            queue.post(whileAlive(self, [function](auto& service) {
+                if (service.shutdownCompleted_) {
+                    (service.*function)();
+                }
+            }));
+        });
+}
+
+void ZRReportingService::dropRequests() {
+    for (const ClientRef& client : clients_) {
+        client->endAtOnce();
+    }
+    callInShutdown(kPatienceWithStops, &ZRReportingService::dropClients);
+}
+
+void ZRReportingService::dropClients() {
+    for (const ClientRef& client : std::exchange(clients_, {})) {
+        leavingClients_.emplace(client->acceptanceOrder(), client);
+    }
+    std::size_t sessions = 0;
+    for (const auto& [order, client] : leavingClients_) {
+        sessions += client->abandon();
+        reportClientUptime(context_, client, client->processIdentifier(), context_.platform().clock->now());
+    }
+    log::ownError(ZRReportingServiceDelegateCategory(),
+                  "{} sessions were not stopped in time, and go without", sessions);
+    leavingClients_.clear();
+    completeShutdown();
+}
+
 void ZRReportingService::completeShutdown() {
-    if (!clients_.empty() || leavingClients_ != 0) {
+    if (!clients_.empty() || !leavingClients_.empty()) {
         return;
     }
     shutdownPatience_.reset();

@@ -37,8 +37,9 @@ public:
     bool shouldAcceptNewConnection(ClientConnection& connection) override;
 
     /// Ends every client, behind its requests, as if its connection had been lost; requests that wait for
-    /// more than five seconds are dropped then, unanswered. Once all clients have left, stops the
-    /// single-message session and calls `completed`, on the reporting server queue. Any thread, once.
+    /// more than five seconds are dropped then, unanswered, and sessions that are not stopped three seconds
+    /// later go without. Once all clients have left, stops the single-message session and calls `completed`,
+    /// on the reporting server queue. Any thread, once.
     void shutDown(UniqueFunction<void()> completed);
 
     /// While it is off, lookups find nothing and messages are refused. Nothing turns it off: no request, and
@@ -53,6 +54,9 @@ public:
     [[nodiscard]] SessionRef findReportingSessionForID(ReporterID reporterID) override;
     void findReportingSessionsForIDs(std::span<const ReporterID> reporterIDs,
                                      std::vector<SessionRef>& found) override;
+    [[nodiscard]] std::optional<StartedWalk> findFirstStarted(std::vector<SessionRef>& found) override;
+    [[nodiscard]] std::optional<StartedWalk> findNextStarted(const StartedWalk& walk,
+                                                             std::vector<SessionRef>& found) override;
     bool removeClient(ZRReportingClientServerInstance& client) override;
     void clientHasLeft(const ClientRef& client) override;
     [[nodiscard]] UserAccount& accountOf(uid_t user) override { return accounts_[user]; }
@@ -65,6 +69,10 @@ private:
     void addClient(const ClientRef& client);
     [[nodiscard]] std::vector<ClientRef>::iterator placeOf(const ZRReportingClientServerInstance& client);
     void endAllClients(UniqueFunction<void()> completed);
+    void dropRequests();
+    void dropClients();
+    /// Calls the function on the server queue, if the shutdown still lasts by then.
+    void callInShutdown(std::chrono::milliseconds delay, void (ZRReportingService::*function)());
     void completeShutdown();
     void logSessionsOfClients() const;
     void setHandlers(ClientConnection& connection, const ClientRef& client);
@@ -74,7 +82,7 @@ private:
     std::atomic<bool> reportingEnabled_{true};
     std::uint64_t lastAcceptanceOrder_ = 0; ///< the listener's thread's
     std::vector<ClientRef> clients_;
-    std::size_t leavingClients_ = 0; ///< whose sessions are still to be stopped
+    std::map<std::uint64_t, ClientRef> leavingClients_; ///< whose sessions are still to be stopped
     SessionRegistry sessions_;
     UserAccounts accounts_;
     bool isShuttingDown_ = false;

@@ -3,8 +3,11 @@
 #include "platform/ZRReportingServiceProtocol.h"
 #include "service/UserAccounts.h"
 
+#include <cstdint>
 #include <memory>
+#include <optional>
 #include <span>
+#include <utility>
 #include <vector>
 
 namespace tamblo {
@@ -14,6 +17,13 @@ class ZRReportingSession;
 
 using SessionRef = std::shared_ptr<ZRReportingSession>;
 using ClientRef = std::shared_ptr<ZRReportingClientServerInstance>;
+
+/// Where a walk over the started sessions is, client by client. Those that are started after its beginning
+/// are not its own, those that are stopped before it comes to them no more.
+struct StartedWalk {
+    std::pair<std::uint64_t, ReporterID> last; ///< order of acceptance of the client, and ID
+    std::uint64_t newest = 0;                  ///< start among those at its beginning
+};
 
 /// What a client instance needs of the service. On the reporting server queue, except the two that say
 /// otherwise.
@@ -33,6 +43,11 @@ public:
     /// single-message session.
     virtual void findReportingSessionsForIDs(std::span<const ReporterID> reporterIDs,
                                              std::vector<SessionRef>& found) = 0;
+    /// The same without any ID, for whoever goes on to the next sessions later: appends the first ones, some
+    /// dozens, and returns where they end; nothing when these are all.
+    [[nodiscard]] virtual std::optional<StartedWalk> findFirstStarted(std::vector<SessionRef>& found) = 0;
+    [[nodiscard]] virtual std::optional<StartedWalk> findNextStarted(const StartedWalk& walk,
+                                                                     std::vector<SessionRef>& found) = 0;
     /// From here on nobody finds the client or a session of its. False when it is not among the accepted
     /// ones.
     virtual bool removeClient(ZRReportingClientServerInstance& client) = 0;

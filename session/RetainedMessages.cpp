@@ -1,5 +1,6 @@
 #include "session/RetainedMessages.h"
 
+#include "session/BlockingWork.h"
 #include "session/ZRReportingSession.h"
 
 #include <algorithm>
@@ -14,6 +15,9 @@ namespace {
 /// Once a limit is passed, this part of it is made free, so that the search costs little for each message.
 constexpr std::size_t kPartMadeFree = 16;
 
+/// So much memory is worth being given back to the system.
+constexpr std::size_t kMuchMemory = 8U << 20U;
+
 /// The bytes beyond which the next search begins: where nothing can be let go, not with each message.
 std::size_t nextRoundFor(std::size_t bytes, std::size_t limit) noexcept {
     return std::max(limit, bytes + (bytes > limit ? limit / kPartMadeFree : 0));
@@ -27,6 +31,8 @@ RetainedMessages::Share::Share(RetainedMessages& all, ZRReportingSession& sessio
 }
 
 RetainedMessages::Share::~Share() {
+    removeDerived(derivedBytes_);
+    all_.freed(bytes_);
     leave();
 }
 
@@ -65,6 +71,30 @@ void RetainedMessages::Share::remove(std::size_t bytes) noexcept {
     all_.removed(*account_, bytes);
 }
 
+void RetainedMessages::Share::removeDerived(std::size_t bytes) noexcept {
+    derivedBytes_ -= bytes;
+    account_->derivedBytes -= bytes;
+    all_.derivedBytes_ -= bytes;
+}
+
+void RetainedMessages::Share::removeFreed(std::size_t bytes) {
+    remove(bytes);
+    all_.freed(bytes);
+}
+
+RetainedMessages::RetainedMessages(Context& context) noexcept
+    : context_(context),
+      limitOfUser_(context.platform().limits.retainedBytesOfUser),
+      limit_(context.platform().limits.retainedBytes),
+      nextRound_(limit_) {}
+
+void RetainedMessages::freed(std::size_t bytes) {
+    if ((freedBytes_ += bytes) >= kMuchMemory) {
+        freedBytes_ = 0;
+        context_.shared<BlockingWork>(context_.platform()).giveBackMemorySoon();
+    }
+}
+
 void RetainedMessages::removed(Account& account, std::size_t bytes) noexcept {
     account.bytes -= bytes;
     bytes_ -= bytes;
@@ -88,9 +118,11 @@ void RetainedMessages::makeRoom(Account& account) {
     std::sort(accounts.begin(), accounts.end(),
               [](const Account* a, const Account* b) { return a->bytes > b->bytes; });
     const std::size_t goal = limit_ - limit_ / kPartMadeFree;
+    // Who has less than his share pays for nobody.
+    const std::size_t share = goal / accounts.size();
     for (Account* const other : accounts) {
-        if (bytes_ > goal) {
-            letGo(*other, bytes_ - goal, "retained_bytes");
+        if (bytes_ > goal && other->bytes > share) {
+            letGo(*other, std::min(bytes_ - goal, other->bytes - share), "retained_bytes");
         }
     }
     nextRound_ = nextRoundFor(bytes_, limit_);

@@ -1,6 +1,6 @@
 #pragma once
 
-#include "platform/Limits.h"
+#include "util/Context.h"
 
 #include <cstddef>
 #include <cstdint>
@@ -42,6 +42,18 @@ public:
             all_.added(*account_, bytes);
         }
         void remove(std::size_t bytes) noexcept;
+        /// The same for what is free now: once much is, the system is given it back soon.
+        void removeFreed(std::size_t bytes);
+        /// What a stop derives, which nothing is let go for: what more would be has to be left out instead.
+        void addDerived(std::size_t bytes) noexcept {
+            derivedBytes_ += bytes;
+            account_->derivedBytes += bytes;
+            all_.derivedBytes_ += bytes;
+        }
+        void removeDerived(std::size_t bytes) noexcept;
+        [[nodiscard]] bool hasRoomForDerived() const noexcept {
+            return account_->derivedBytes < kMostDerivedBytesOfUser && all_.derivedBytes_ < kMostDerivedBytes;
+        }
         void countDropped(std::size_t messages) noexcept { all_.droppedMessageCount_ += messages; }
         [[nodiscard]] std::size_t bytes() const noexcept { return bytes_; }
 
@@ -56,10 +68,13 @@ public:
         Account* account_ = nullptr;
         std::size_t place_ = 0; ///< among the account's shares
         std::size_t bytes_ = 0;
+        std::size_t derivedBytes_ = 0;
     };
 
-    explicit RetainedMessages(const Limits& limits) noexcept
-        : limitOfUser_(limits.retainedBytesOfUser), limit_(limits.retainedBytes), nextRound_(limit_) {}
+    static constexpr std::size_t kMostDerivedBytesOfUser = 64U << 20U;
+    static constexpr std::size_t kMostDerivedBytes = 96U << 20U;
+
+    explicit RetainedMessages(Context& context) noexcept;
     RetainedMessages(const RetainedMessages&) = delete;
     RetainedMessages& operator=(const RetainedMessages&) = delete;
 
@@ -72,6 +87,7 @@ private:
     struct Account {
         uid_t user = 0;
         std::size_t bytes = 0;
+        std::size_t derivedBytes = 0;
         std::size_t nextRound = 0; ///< bytes beyond which something is let go
         std::vector<Share*> shares;
     };
@@ -84,15 +100,19 @@ private:
         }
     }
     void removed(Account& account, std::size_t bytes) noexcept;
+    void freed(std::size_t bytes);
     void makeRoom(Account& account);
     /// Lets go of about as many bytes, of the largest sessions first.
     static void letGo(Account& account, std::size_t bytes, std::string_view limit);
 
+    Context& context_;
     const std::size_t limitOfUser_;
     const std::size_t limit_;
     std::map<uid_t, Account> accounts_; ///< of users who have a session
     std::size_t bytes_ = 0;
+    std::size_t derivedBytes_ = 0;
     std::size_t nextRound_;
+    std::size_t freedBytes_ = 0; ///< since the system was given some back
     std::uint64_t droppedMessageCount_ = 0;
 };
 

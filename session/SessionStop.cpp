@@ -1,6 +1,5 @@
 #include "session/SessionStop.h"
 
-#include "session/BlockingWork.h"
 #include "session/ZRReportingSession.h"
 #include "util/Log.h"
 #include "util/TraceEvents.h"
@@ -19,6 +18,8 @@ namespace {
 constexpr std::size_t kBytesOfShortStop = 128U << 10U;
 /// Messages that are entered into the index, or let go, in one part.
 constexpr std::size_t kMessagesOfPart = 20'000;
+/// A message that a worker has derived and is still to send, about.
+constexpr std::size_t kBytesOfDerivedMessage = 512;
 
 } // namespace
 
@@ -67,7 +68,7 @@ void ZRReportingSession::stopNextPart() {
         stopSomeOfWorkers();
         break;
     case SessionStop::Step::letGo:
-        letGoOfSome();
+        letGoOfPast();
         break;
     case SessionStop::Step::done:
         break;
@@ -99,7 +100,6 @@ void ZRReportingSession::stopSomeOfWorkers() {
     if (workers.empty()) {
         stop_->step = SessionStop::Step::letGo;
         stop_->past.swap(messages_);
-        stop_->isLarge = stop_->past.size() > kManyMessages;
         lastMessages_.clear();
         return;
     }
@@ -113,23 +113,49 @@ void ZRReportingSession::stopSomeOfWorkers() {
     }
 }
 
-void ZRReportingSession::letGoOfSome() {
-    std::vector<MessageRef>& past = stop_->past;
-    past.resize(past.size() - std::min(past.size(), kMessagesOfPart));
-    if (!past.empty()) {
+bool ZRReportingSession::holdsDerived(std::size_t messages) {
+    if (stop_ == nullptr) {
+        return true; // a worker that is stopped by itself
+    }
+    const std::size_t bytes = messages * kBytesOfDerivedMessage;
+    retained_.removeDerived(std::exchange(stop_->heldBytes, bytes));
+    retained_.addDerived(bytes);
+    const bool hasRoom = retained_.hasRoomForDerived();
+    if (!hasRoom && !std::exchange(stop_->isFullTold, true)) {
+        log::error(ZRReportingSessionCategory(),
+                   "too much is derived of a session at its stop, and more is left out. reporterID={} pid={}",
+                   reporterID_, processIdentifiers_.empty() ? 0 : processIdentifiers_.front());
+    }
+    return hasRoom;
+}
+
+bool ZRReportingSession::letGoSome() {
+    lastMessages_.clear();
+    return letGoSomeOf(messages_);
+}
+
+bool ZRReportingSession::letGoSomeOf(std::vector<MessageRef>& messages) {
+    messages.resize(messages.size() - std::min(messages.size(), kMessagesOfPart));
+    if (!messages.empty()) {
+        return false;
+    }
+    std::vector<MessageRef>().swap(messages);
+    const std::size_t derived = stop_ != nullptr ? std::exchange(stop_->derivedBytes, 0) : 0;
+    retained_.removeDerived(derived);
+    retained_.removeFreed(blocks_.bytes() - derived);
+    blocks_.clear();
+    return true;
+}
+
+void ZRReportingSession::letGoOfPast() {
+    if (!letGoSomeOf(stop_->past)) {
         return;
     }
-    std::vector<MessageRef>().swap(past);
-    retained_.remove(blocks_.bytes());
-    blocks_.clear();
     totalMessageCount_ = 0;
     ownRecordCount_ = 0;
     droppedMessageCount_ = 0;
     started_ = false;
     stop_->step = SessionStop::Step::done;
-    if (stop_->isLarge) {
-        context_.shared<BlockingWork>(context_.platform()).giveBackMemorySoon();
-    }
 }
 
 void ZRReportingSession::whenStopped(UniqueFunction<void()> call) {

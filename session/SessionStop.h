@@ -25,7 +25,9 @@ struct SessionStop {
     std::size_t indexed = 0;          ///< messages entered into the index
     std::vector<std::size_t> workers; ///< places of those that are to be stopped, the next one last
     std::vector<MessageRef> past;     ///< messages that are to be let go
-    bool isLarge = false;             ///< what is let go
+    std::size_t derivedBytes = 0;     ///< of messages that workers sent
+    std::size_t heldBytes = 0;        ///< of those that they are still to send
+    bool isFullTold = false;
     std::vector<UniqueFunction<void()>> waiting; ///< for the end
 };
 

@@ -1,7 +1,6 @@
 #include "session/ZRReportingSession.h"
 
 #include "base/Utf8.h"
-#include "session/BlockingWork.h"
 #include "util/Log.h"
 #include "util/MessageKeys.h"
 #include "util/TraceEvents.h"
@@ -32,13 +31,10 @@ ZRReportingSession::ZRReportingSession(Created, Context& context, ReporterID rep
       processIdentifiers_(std::move(processIdentifiers)),
       appName_(ZRReportingUtilityRetrieveAppName(configuration_)),
       previousValues_(context.platform().limits.previousKeysOfSession),
-      retained_(context.shared<RetainedMessages>(context.platform().limits), *this) {}
+      retained_(context.shared<RetainedMessages>(context), *this) {}
 
 ZRReportingSession::~ZRReportingSession() {
     emitTracePoint(context_, TraceEvent::sessionDestroyed);
-    if (messages_.size() > kManyMessages) {
-        context_.shared<BlockingWork>(context_.platform()).giveBackMemorySoon();
-    }
     log::info(ZRReportingSessionCategory(), "deallocing this session {}", reporterID_);
 }
 
@@ -100,7 +96,12 @@ void ZRReportingSession::record(MessageRef message, std::size_t bytesOfValues) {
     const std::size_t bytes =
         kBytesOfMessage + bytesOfValues + (isFirstOfKind ? LastMessageIndex::kBytesOfKind : 0);
     blocks_.add(bytes);
-    retained_.add(bytes);
+    if (stop_ != nullptr) {
+        stop_->derivedBytes += bytes;
+        retained_.addDerived(bytes);
+    } else {
+        retained_.add(bytes);
+    }
 }
 
 void ZRReportingSession::remember(const Dictionary& payload, std::size_t bytesOfValues) {

@@ -77,6 +77,9 @@ public:
     [[nodiscard]] bool stopSome();
     /// Whether a stop has begun and is not over.
     [[nodiscard]] bool isStopping() const noexcept { return stop_ != nullptr; }
+    /// For workers in their stop: so many messages that the worker has derived are still to be sent. Whether
+    /// there is room for more, of what all stops of the user derive.
+    [[nodiscard]] bool holdsDerived(std::size_t messages);
     /// Calls back once the stop that is under way is over.
     void whenStopped(UniqueFunction<void()> call);
 
@@ -115,6 +118,9 @@ public:
     /// Lets go of the oldest messages that have about so many bytes, and of the previous values where no
     /// message is left. The bytes that are free then. Not while the session is stopping.
     std::size_t letGoOfOldest(std::size_t bytes, std::string_view limit);
+    /// Lets go of some thousand messages of a session that is about to go, and is not stopping. Whether none
+    /// is left.
+    [[nodiscard]] bool letGoSome();
     /// Nothing here asks for it yet.
     [[nodiscard]] std::size_t workerInstanceCount() const noexcept { return messageWorkers_.size(); }
     [[nodiscard]] std::string description() const;
@@ -148,9 +154,6 @@ private:
     static constexpr std::size_t kBytesOfMessage =
         allocatedBytes(sizeof(ZRReportingSessionMessage) + 2 * sizeof(void*)) + 2 * sizeof(MessageRef);
 
-    /// Freeing so many is worth giving the memory back to the system.
-    static constexpr std::size_t kManyMessages = 10'000;
-
     void startWorkersFromClasses(std::span<const WorkerClass* const> classes);
     void makeWorker(const WorkerClass& workerClass);
     [[nodiscard]] bool hasWorkerOf(const WorkerClass& workerClass) const noexcept;
@@ -158,7 +161,8 @@ private:
     void orderWorkersToStop();
     void indexSomeAgain();
     void stopSomeOfWorkers();
-    void letGoOfSome();
+    void letGoOfPast();
+    [[nodiscard]] bool letGoSomeOf(std::vector<MessageRef>& messages);
     /// Calls `act` with each worker once: those of the first role, then those of the second, then all others.
     template <typename Act>
     void forEachWorker(bool WorkerRole::*first, bool WorkerRole::*second, Act act) const {

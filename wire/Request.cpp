@@ -144,6 +144,8 @@ std::optional<Error> limitReachedBy(const CborReader& reader, const RequestLimit
         return limitReached("entries_of_dictionary", limits.values.entries);
     case CborError::keyTooLong:
         return limitReached("key_bytes", limits.values.keyBytes);
+    case CborError::keysTooLong:
+        return limitReached("bytes_of_keys", limits.values.bytesOfKeys);
     case CborError::tooLarge:
         return limitReached("decoded_bytes_of_frame", limits.values.decodedBytes);
     default:
@@ -151,6 +153,10 @@ std::optional<Error> limitReachedBy(const CborReader& reader, const RequestLimit
     }
     if (request.reporterIDs.size() > limits.reportersOfMessage) {
         return limitReached("reporters_of_message", limits.reportersOfMessage);
+    }
+    if (request.reporterIDs.size() > 1 &&
+        reader.decodedBytes() > limits.deliveredBytesOfMessage / request.reporterIDs.size()) {
+        return limitReached("delivered_bytes_of_message", limits.deliveredBytesOfMessage);
     }
     return std::nullopt;
 }

@@ -39,6 +39,7 @@ using RequestView = BasicRequest<const Dictionary&, std::span<const std::int64_t
 struct RequestLimits {
     CborLimits values;                                             ///< entries_of_dictionary, key_bytes, ...
     std::size_t reportersOfMessage = static_cast<std::size_t>(-1); ///< reporters_of_message
+    std::size_t deliveredBytesOfMessage = static_cast<std::size_t>(-1); ///< its values, for each reporter
 };
 
 /// Why a frame is not carried out.

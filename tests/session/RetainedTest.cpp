@@ -35,7 +35,7 @@ protected:
         }
     }
 
-    RetainedMessages& all() { return device.context().shared<RetainedMessages>(device.services().limits); }
+    RetainedMessages& all() { return device.context().shared<RetainedMessages>(device.context()); }
 
     FakePlatform device;
 };

@@ -119,6 +119,7 @@ public:
     }
     /// What was derived of all.
     [[nodiscard]] std::vector<MessageRef> finish() { return walk_.finish(); }
+    [[nodiscard]] std::size_t derivedCount() const noexcept { return walk_.derivedCount(); }
 
 private:
     [[nodiscard]] static std::size_t endOfPart(std::size_t begin, std::size_t count) noexcept {
@@ -153,6 +154,7 @@ public:
     DerivedSending(ZRReportingSession& session, std::string_view what, std::vector<MessageRef> derived);
     /// Whether all are sent.
     [[nodiscard]] bool sendSome(ZRReportingSession& session);
+    [[nodiscard]] std::size_t leftCount() const noexcept { return derived_.size() - sent_; }
 
 private:
     std::vector<MessageRef> derived_;
@@ -172,9 +174,13 @@ template <typename Walk>
             return true;
         }
         if (sending) {
-            return sending->sendSome(*owner);
+            const bool isDone = sending->sendSome(*owner);
+            (void)owner->holdsDerived(sending->leftCount());
+            return isDone;
         }
-        if (derivation->deriveSome(owner->messages())) {
+        const bool isDone = derivation->deriveSome(owner->messages());
+        // Where there is no room for more, what the rest would have added is left out.
+        if (!owner->holdsDerived(derivation->derivedCount()) || isDone) {
             sending.emplace(*owner, what, derivation->finish());
             derivation.reset();
         }

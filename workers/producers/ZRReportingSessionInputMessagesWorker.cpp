@@ -97,6 +97,7 @@ public:
         state_.merge(message);
     }
 
+    [[nodiscard]] std::size_t derivedCount() const noexcept { return derived_.count(); }
     [[nodiscard]] std::vector<MessageRef> finish() {
         log::debug(ZRReportingSessionCategory(),
                    "returning input messages { func={}, action=return, count={} }", kWords.function,

@@ -92,6 +92,7 @@ public:
         state_.merge(message);
     }
 
+    [[nodiscard]] std::size_t derivedCount() const noexcept { return derived_.count(); }
     [[nodiscard]] std::vector<MessageRef> finish() { return derived_.take(); }
 
 private:

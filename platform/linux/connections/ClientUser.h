@@ -32,7 +32,9 @@ struct ClientUser {
 
     Mutex mutex{};
     /// Read no further until less waits.
-    std::vector<std::shared_ptr<LinuxConnection>> heldBack TAMBLO_GUARDED_BY(mutex){};
+    std::deque<std::shared_ptr<LinuxConnection>> heldBack TAMBLO_GUARDED_BY(mutex){};
+    /// Whose peers have read nothing of what waits for them for a second.
+    std::vector<std::weak_ptr<LinuxConnection>> silent TAMBLO_GUARDED_BY(mutex){};
 };
 
 } // namespace tamblo

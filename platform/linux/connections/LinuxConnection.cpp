@@ -1,6 +1,7 @@
 #include "platform/linux/connections/LinuxConnection.h"
 
 #include "base/Format.h"
+#include "base/WhileAlive.h"
 #include "platform/LogOrigin.h"
 #include "platform/linux/connections/RequestDispatch.h"
 #include "wire/FrameSplitter.h"
@@ -15,7 +16,9 @@
 #include <utility>
 #include <vector>
 
+#include <linux/sockios.h>
 #include <sys/epoll.h>
+#include <sys/ioctl.h>
 #include <sys/socket.h>
 #include <sys/syscall.h>
 #include <unistd.h>
@@ -35,6 +38,10 @@ constexpr std::size_t kPartOfPiece = 16;
 /// where the user's connections have brought together half of the user's limit.
 constexpr std::size_t kUnreadPart = 4;
 constexpr std::size_t kUnreadPartOfMany = 64;
+/// A client whose requests wait for it to read is itself read no further than to this.
+constexpr std::size_t kWaitingBytesOfSuspended = 64 * 1024;
+/// Connections that are read on when one of the user's requests has been carried out.
+constexpr int kReadOnAtOnce = 16;
 /// A peer that takes nothing for so long does not read.
 constexpr std::chrono::seconds kPatienceWithPeer{1};
 
@@ -96,7 +103,7 @@ void LinuxConnection::ready(std::uint32_t events) {
     bool isReadable = false;
     {
         const MutexLock lock(mutex_);
-        if ((events & EPOLLOUT) != 0) {
+        if ((events & (EPOLLOUT | EPOLLHUP | EPOLLERR)) != 0) {
             send();
         }
         // Another source of this wake-up, a signal, may have ended the reading.
@@ -121,6 +128,7 @@ void LinuxConnection::readOnce() {
     if (ending_ != Ending::none || isHeldBack()) {
         return;
     }
+    const std::size_t waiting = waitingRequests_;
     int socket = -1;
     {
         const MutexLock lock(mutex_);
@@ -137,13 +145,18 @@ void LinuxConnection::readOnce() {
     } else if (!received.empty()) {
         takeFrames(received);
     }
+    if (waitingRequests_ <= waiting) {
+        // Nothing was read that calls others of the user when it has been carried out.
+        readOnOthers();
+    }
 }
 
 /// Whether what waits has to be carried out first; the loop then hears nothing of the socket until it is.
 bool LinuxConnection::isHeldBack() {
     const Limits& limits = shared_.limits;
     const MutexLock lock(mutex_);
-    bool isHeld = waitingRequests_ > limits.waitingRequests || waitingBytes_ > limits.waitingBytes;
+    bool isHeld = waitingRequests_ > limits.waitingRequests ||
+                  waitingBytes_ > (areRequestsHeld_ ? kWaitingBytesOfSuspended : limits.waitingBytes);
     if (!isHeld) {
         const MutexLock userLock(user_->mutex);
         isHeld = user_->waitingBytes > limits.waitingBytesOfUser;
@@ -197,11 +210,15 @@ void LinuxConnection::takeFrames(std::span<const std::uint8_t> received) {
         bytes += decodeAndDispatch(*item);
         ++requests;
     }
+    if (requests != 0) {
+        shared_.unfinished.forget(unfinishedPlace_); // what is left is another frame
+    }
     if (ending_ == Ending::none && frames.tooLong()) {
         refuse({.endsConnection = true,
                 .error = {std::string(wire::kProtocolErrorDomain), wire::kNotARequest,
                           "a frame is longer than 1 MiB"}});
     }
+    sendRefusals();
     keepRest(frames.rest(), frames.wanted());
     countUnfinished();
     if (bytes == 0) {
@@ -238,8 +255,18 @@ void LinuxConnection::countUnfinished() {
 }
 
 void LinuxConnection::endUnfinished() {
-    endBeyond({std::string(kLimitErrorDomain), kLimitErrorCode,
-               formatted("frame_seconds: a frame made no progress for {}", shared_.limits.frameSeconds)});
+    {
+        const MutexLock lock(mutex_);
+        if (isFlooded_ || isReadable_) {
+            // The client is not the one who is slow.
+            shared_.unfinished.forget(unfinishedPlace_);
+            shared_.unfinished.note(*this, unfinishedPlace_);
+            return;
+        }
+    }
+    endBeyond(
+        {std::string(kLimitErrorDomain), kLimitErrorCode,
+         formatted("frame_seconds: a frame was not finished within {} s", shared_.limits.frameSeconds)});
 }
 
 std::size_t LinuxConnection::decodeAndDispatch(std::span<const std::uint8_t> item) {
@@ -263,13 +290,21 @@ void LinuxConnection::refuse(const wire::Refusal& refusal) {
     {
         const MutexLock lock(mutex_);
         wire::appendErrorReply(outgoing_, refusal.id, refusal.error);
-        send();
+        hasRefusals_ = true;
     }
     if (refusal.error.code == wire::kLimitReached) {
         noteLimit(refusal.error.message);
     }
     if (refusal.endsConnection) {
         beginEnd(Ending::interrupted);
+    }
+}
+
+/// Once for all of a read: a system call each would make refusals dearer than requests.
+void LinuxConnection::sendRefusals() {
+    const MutexLock lock(mutex_);
+    if (std::exchange(hasRefusals_, false)) {
+        send();
     }
 }
 
@@ -284,6 +319,7 @@ void LinuxConnection::noteLimit(std::string_view limit) {
 void LinuxConnection::endBeyond(const ReplyError& limit) {
     if (ending_ == Ending::none) {
         refuse({.endsConnection = true, .error = {limit.domain, limit.code, limit.message}});
+        sendRefusals();
     }
 }
 
@@ -291,6 +327,7 @@ void LinuxConnection::turnAway(const ReplyError& reason) {
     // One line tells of all that are turned away until the user has fewer.
     isLimitNoted_ = std::exchange(user_->isTurnedAway, true);
     refuse({.error = {reason.domain, reason.code, reason.message}});
+    sendRefusals();
 }
 
 void LinuxConnection::replied() {
@@ -306,17 +343,28 @@ void LinuxConnection::replied() {
 void LinuxConnection::carriedOut(std::size_t requests, std::size_t bytes) {
     waitingRequests_ -= requests;
     waitingBytes_ -= bytes;
+    user_->waitingBytes -= bytes;
     readOn();
-    if ((user_->waitingBytes -= bytes) > shared_.limits.waitingBytesOfUser) {
+    readOnOthers();
+}
+
+/// Lets some of the user's connections be read on that were held back, if there is room: what each brings
+/// calls the next of them, so that thousands are not woken for the room of one.
+void LinuxConnection::readOnOthers() {
+    if (user_->waitingBytes > shared_.limits.waitingBytesOfUser) {
         return;
     }
-    std::vector<std::shared_ptr<LinuxConnection>> heldBack;
-    {
-        const MutexLock lock(user_->mutex);
-        heldBack.swap(user_->heldBack);
-    }
-    for (const std::shared_ptr<LinuxConnection>& connection : heldBack) {
-        connection->readOn();
+    for (int i = 0; i < kReadOnAtOnce; ++i) {
+        std::shared_ptr<LinuxConnection> next;
+        {
+            const MutexLock lock(user_->mutex);
+            if (user_->heldBack.empty()) {
+                return;
+            }
+            next = std::move(user_->heldBack.front());
+            user_->heldBack.pop_front();
+        }
+        next->readOn();
     }
 }
 
@@ -383,8 +431,13 @@ void LinuxConnection::countUnsent() {
         noteLimit(limitReached("reply_bytes", limits.replyBytes).message);
         giveUp();
     } else if (mine != 0 && all > limits.replyBytesOfUser) {
-        noteLimit(limitReached("reply_bytes_of_user", limits.replyBytesOfUser).message);
-        giveUp();
+        if (isPatienceOver_ || all > 2 * limits.replyBytesOfUser) {
+            noteLimit(limitReached("reply_bytes_of_user", limits.replyBytesOfUser).message);
+            giveUp();
+        } else {
+            endSilentOfUser();
+            holdRequests();
+        }
     } else if (mine > limits.replyBytes / (isMuchForUser ? kUnreadPartOfMany : kUnreadPart)) {
         holdRequests();
     } else if (mine <= limits.replyBytes / kUnreadPart / 2) {
@@ -405,25 +458,66 @@ void LinuxConnection::letRequestsGo() {
     }
 }
 
+/// What the peer has read, but for a constant: the socket takes more only once most of what it holds is read.
+std::int64_t LinuxConnection::readByPeer() const {
+    int unread = 0;
+    (void)::ioctl(socket_.get(), SIOCOUTQ, &unread);
+    return static_cast<std::int64_t>(taken_) - unread;
+}
+
 void LinuxConnection::awaitPeerReads() {
     const MutexLock lock(mutex_);
-    shared_.loop.callAfter(kPatienceWithPeer, [self = shared_from_this(), taken = taken_] {
-        self->lookWhetherPeerReads(taken);
+    shared_.loop.callAfter(kPatienceWithPeer, [self = shared_from_this(), read = readByPeer()] {
+        self->lookWhetherPeerReads(read);
     });
 }
 
-void LinuxConnection::lookWhetherPeerReads(std::uint64_t takenBefore) {
-    MutexLock lock(mutex_);
-    if (!areRequestsHeld_) {
-        return;
+void LinuxConnection::lookWhetherPeerReads(std::int64_t readBefore) {
+    {
+        const MutexLock lock(mutex_);
+        if (!areRequestsHeld_) {
+            return;
+        }
+        if (readByPeer() == readBefore) {
+            isPatienceOver_ = true;
+            noteSilent();
+            letRequestsGo();
+            return;
+        }
     }
-    if (taken_ == takenBefore) {
-        isPatienceOver_ = true;
-        letRequestsGo();
-        return;
-    }
-    lock.unlock();
     awaitPeerReads();
+}
+
+void LinuxConnection::noteSilent() {
+    const MutexLock lock(user_->mutex);
+    auto& silent = user_->silent;
+    if (silent.size() > 2 * user_->connections) {
+        std::erase_if(silent, [](const auto& connection) { return connection.expired(); });
+    }
+    if (!std::exchange(isNotedSilent_, true)) {
+        silent.push_back(weak_from_this());
+    }
+}
+
+/// Those of the user's connections that keep replies from the others.
+void LinuxConnection::endSilentOfUser() {
+    std::vector<std::weak_ptr<LinuxConnection>> silent;
+    {
+        const MutexLock lock(user_->mutex);
+        silent.swap(user_->silent);
+    }
+    for (const std::weak_ptr<LinuxConnection>& connection : silent) {
+        shared_.loop.post(whileAlive(connection, [](LinuxConnection& other) { other.endIfSilent(); }));
+    }
+}
+
+void LinuxConnection::endIfSilent() {
+    const MutexLock lock(mutex_);
+    isNotedSilent_ = false;
+    if (isPatienceOver_ && unsent() != 0) {
+        noteLimit(limitReached("reply_bytes_of_user", shared_.limits.replyBytesOfUser).message);
+        giveUp();
+    }
 }
 
 /// Keeps nothing more for the client, and ends the connection.
@@ -496,10 +590,11 @@ void LinuxConnection::end() {
     }
     const LogOrigin origin(peer_);
     if (waitsForPeer()) {
-        shared_.loop.callAfter(kPatienceWithPeer, [self = shared_from_this()] {
+        const MutexLock lock(mutex_);
+        shared_.loop.callAfter(kPatienceWithPeer, [self = shared_from_this(), read = readByPeer()] {
             {
-                const MutexLock lock(self->mutex_);
-                self->isPatienceOver_ = true;
+                const MutexLock held(self->mutex_);
+                self->isPatienceOver_ = self->readByPeer() == read;
             }
             self->end();
         });
@@ -526,6 +621,7 @@ void LinuxConnection::end() {
         watch();
         socket_.reset();
     }
+    readOnOthers();
     std::exchange(ended_, Ended())(shared_from_this());
 }
 

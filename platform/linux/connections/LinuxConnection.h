@@ -141,12 +141,15 @@ private:
     void countUnfinished() TAMBLO_EXCLUDES(mutex_);
     /// Answers the bytes that the decoded request takes while it waits; 0 for a refused one.
     [[nodiscard]] std::size_t decodeAndDispatch(std::span<const std::uint8_t> item) TAMBLO_EXCLUDES(mutex_);
+    /// Appends the refusal to what is sent, and notes and ends what it asks for.
     void refuse(const wire::Refusal& refusal) TAMBLO_EXCLUDES(mutex_);
+    void sendRefusals() TAMBLO_EXCLUDES(mutex_);
     /// Ends the connection with an error frame that names the limit.
     void endBeyond(const ReplyError& limit) TAMBLO_EXCLUDES(mutex_);
     [[nodiscard]] bool isHeldBack() TAMBLO_EXCLUDES(mutex_);
     void carriedOut(std::size_t requests, std::size_t bytes) TAMBLO_EXCLUDES(mutex_);
     void readOn() TAMBLO_EXCLUDES(mutex_);
+    void readOnOthers() TAMBLO_EXCLUDES(mutex_);
     void beginEnd(Ending ending) TAMBLO_EXCLUDES(mutex_);
     void end() TAMBLO_EXCLUDES(mutex_);
     [[nodiscard]] bool waitsForPeer() TAMBLO_EXCLUDES(mutex_);
@@ -156,7 +159,11 @@ private:
     void countUnsent() TAMBLO_REQUIRES(mutex_);
     void holdRequests() TAMBLO_REQUIRES(mutex_);
     void letRequestsGo() TAMBLO_REQUIRES(mutex_);
-    void lookWhetherPeerReads(std::uint64_t takenBefore) TAMBLO_EXCLUDES(mutex_);
+    [[nodiscard]] std::int64_t readByPeer() const TAMBLO_REQUIRES(mutex_);
+    void lookWhetherPeerReads(std::int64_t readBefore) TAMBLO_EXCLUDES(mutex_);
+    void noteSilent() TAMBLO_REQUIRES(mutex_);
+    void endSilentOfUser() TAMBLO_REQUIRES(mutex_);
+    void endIfSilent() TAMBLO_EXCLUDES(mutex_);
     void awaitPeerReads() TAMBLO_EXCLUDES(mutex_);
     void giveUp() TAMBLO_REQUIRES(mutex_);
     void watch() TAMBLO_REQUIRES(mutex_);
@@ -190,12 +197,14 @@ private:
     bool isFlooded_ TAMBLO_GUARDED_BY(mutex_) = false; ///< until what waits has been carried out
     bool isUnwritable_ TAMBLO_GUARDED_BY(mutex_) = false;
     bool hasHeldReplies_ TAMBLO_GUARDED_BY(mutex_) = false;
-    TextBuffer held_ TAMBLO_GUARDED_BY(mutex_);     ///< replies not yet to be seen
-    TextBuffer outgoing_ TAMBLO_GUARDED_BY(mutex_); ///< replies on their way
+    bool hasRefusals_ TAMBLO_GUARDED_BY(mutex_) = false; ///< that are still to be sent
+    TextBuffer held_ TAMBLO_GUARDED_BY(mutex_);          ///< replies not yet to be seen
+    TextBuffer outgoing_ TAMBLO_GUARDED_BY(mutex_);      ///< replies on their way
     std::size_t sent_ TAMBLO_GUARDED_BY(mutex_) = 0;
     std::size_t unsentCounted_ TAMBLO_GUARDED_BY(mutex_) = 0; ///< with the user
     std::uint64_t taken_ TAMBLO_GUARDED_BY(mutex_) = 0;       ///< bytes, by the socket, ever
     bool areRequestsHeld_ TAMBLO_GUARDED_BY(mutex_) = false;
+    bool isNotedSilent_ TAMBLO_GUARDED_BY(mutex_) = false;    ///< with the user
     bool isPatienceOver_ TAMBLO_GUARDED_BY(mutex_) = false;   ///< with a peer that did not read
     bool isWaitingForPeer_ TAMBLO_GUARDED_BY(mutex_) = false; ///< at its end, to take what is left
 };

@@ -11,6 +11,7 @@
 #include <chrono>
 #include <cstdlib>
 #include <cstring>
+#include <new>
 #include <set>
 #include <string_view>
 #include <utility>
@@ -177,7 +178,12 @@ void LinuxConnectionService::ready(std::uint32_t) {
             if (std::exchange(isPaused_, false)) {
                 shared_.log.report(LogLevel::error, kLogCategory, "accepting connections again");
             }
-            accept(std::move(socket));
+            try {
+                accept(std::move(socket));
+            } catch (const std::bad_alloc&) {
+                shared_.log.report(LogLevel::error, kLogCategory,
+                                   "a client is turned away: no memory is left");
+            }
             continue;
         }
         if (errno == EMFILE || errno == ENFILE || errno == ENOBUFS || errno == ENOMEM) {
@@ -221,10 +227,16 @@ void LinuxConnectionService::accept(FileDescriptor socket) {
         return;
     }
     connection->openQueue();
-    if (delegate_->shouldAcceptNewConnection(*connection)) {
-        ++user->connections;
+    {
+        // Before it can be used: whoever is in the loop is held here.
         const MutexLock lock(mutex_);
         connections_.insert(connection);
+    }
+    if (delegate_->shouldAcceptNewConnection(*connection)) {
+        ++user->connections;
+    } else {
+        const MutexLock lock(mutex_);
+        connections_.erase(connection);
     }
 }
 

@@ -30,8 +30,12 @@ class RequestIntake {
 public:
     explicit RequestIntake(const Limits& limits)
         : buffer_(new std::uint8_t[kSmallRest + kBytesPerRead]),
-          limits_{.values = {limits.entriesOfDictionary, limits.keyBytes, limits.decodedBytesOfFrame},
-                  .reportersOfMessage = limits.reportersOfMessage} {}
+          limits_{.values = {.entries = limits.entriesOfDictionary,
+                             .keyBytes = limits.keyBytes,
+                             .bytesOfKeys = limits.bytesOfKeys,
+                             .decodedBytes = limits.decodedBytesOfFrame},
+                  .reportersOfMessage = limits.reportersOfMessage,
+                  .deliveredBytesOfMessage = limits.deliveredBytesOfMessage} {}
 
     /// The queue that carries requests out, and the threads that it runs on. Before the first read.
     void setQueue(SerialQueue& queue, LinuxWorkQueues& threads) noexcept {

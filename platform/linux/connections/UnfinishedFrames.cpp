@@ -5,14 +5,10 @@
 namespace tamblo {
 
 void UnfinishedFrames::note(LinuxConnection& connection, Place& place) {
-    const Time now = std::chrono::steady_clock::now();
     if (place == none()) {
-        place = entries_.insert(entries_.end(), {&connection, now});
-    } else {
-        place->progress = now;
-        entries_.splice(entries_.end(), entries_, place);
+        place = entries_.insert(entries_.end(), {&connection, std::chrono::steady_clock::now()});
+        startTimer();
     }
-    startTimer();
 }
 
 void UnfinishedFrames::forget(Place& place) {
@@ -27,7 +23,7 @@ void UnfinishedFrames::startTimer() {
         return;
     }
     isTimerRunning_ = true;
-    const auto left = entries_.front().progress + patience_ - std::chrono::steady_clock::now();
+    const auto left = entries_.front().begun + patience_ - std::chrono::steady_clock::now();
     loop_.callAfter(std::chrono::ceil<std::chrono::milliseconds>(left), [this] {
         isTimerRunning_ = false;
         endOverdue();
@@ -37,8 +33,8 @@ void UnfinishedFrames::startTimer() {
 
 void UnfinishedFrames::endOverdue() {
     const Time latest = std::chrono::steady_clock::now() - patience_;
-    while (!entries_.empty() && entries_.front().progress <= latest) {
-        // Forgets itself.
+    while (!entries_.empty() && entries_.front().begun <= latest) {
+        // Forgets itself, or begins anew.
         entries_.front().connection->endUnfinished();
     }
 }
