@@ -45,6 +45,9 @@ TEST(Tambloctl, ExitStatusSaysWhoWasWrong) {
         {"notify com.example.news 0x10", 0, ""},
         {"notify a/b", 2, "no notification name"},
         {"preference set d key 5", 0, ""},
+        {"preference set d other text", 0, ""},
+        {"preference get d", 0, "{\"key\":5,\"other\":\"text\"}\n"},
+        {"preference unset d other", 0, ""},
         {"preference get d key", 0, "5\n"},
         {"preference get d other", 1, "has no key \"other\""},
         {"preference get broken", 1, "it is left as it is"},
@@ -96,23 +99,6 @@ TEST(Tambloctl, TailGoesOnThroughARotation) {
     writeFile(file, line(6));
     EXPECT_EQ(next(2), line(5) + line(6));
     EXPECT_EQ(WEXITSTATUS(::pclose(follower)), 0) << "it ends with its reader";
-}
-
-TEST(Tambloctl, PreferenceIsInForceForTheNextMessage) {
-    ServiceProcess service;
-    Session client(service.socketPath());
-    const auto file = service.preferenceFile(kAnalytics);
-    const auto preference = [&](const std::string& act, const std::string& rest) {
-        return service.tambloctl("preference " + act + " " + kAnalytics + " " + rest).status;
-    };
-    EXPECT_EQ(preference("set", R"(events_in_use '["com.vandra.telephony.*"]')"), 0);
-    EXPECT_EQ(preference("set", "other text"), 0);
-    EXPECT_EQ(contentOf(file), "{\"events_in_use\":[\"com.vandra.telephony.*\"],\"other\":\"text\"}\n");
-    client.call(message({{"n", 1}}));
-    EXPECT_EQ(service.countEvents("Playback.Start"), 1U);
-    EXPECT_EQ(preference("unset", "events_in_use"), 0);
-    client.call(message({{"n", 2}}));
-    EXPECT_EQ(service.countEvents("Playback.Start"), 3U);
 }
 
 TEST(Tambloctl, ShowsTheSummariesOfTheSessionItPlays) {

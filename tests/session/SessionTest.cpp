@@ -88,7 +88,8 @@ TEST_F(SessionTest, MessagesReachTheConsumersThatMaySeeThem) {
     session->sendMessage(message, [&](const ReplyError* error) { isAnswered = error == nullptr; });
     EXPECT_THAT(script.take(), ElementsAre("message Late 5/6"));
     EXPECT_TRUE(isAnswered);
-    EXPECT_TRUE(message->copyWithZone()->destinationWorkers().empty());
+    const auto copy = message->copyWithZone();
+    EXPECT_TRUE(copy->isSessionStarted && copy->destinationWorkers().empty());
 }
 
 TEST_F(SessionTest, CountsAndPreviousValuesFollowEveryMessageTheListOnlyTheAccepted) {
@@ -352,18 +353,6 @@ TEST_F(SessionTest, SortingKeepsTheOrderOfEqualTimesAndTakesNoNumberForZero) {
     }
     EXPECT_EQ(order, "5367214");
     EXPECT_FALSE(ZRReportingSessionMessage::sortMessages(messages));
-}
-
-TEST(ZRReportingSessionMessage, ACopyHasItsFlagsAndUnknownNumbersHaveNames) {
-    const auto message = messageOf({{"n", 1}}, AudioEventCategoryUnknown, 999);
-    for (const bool flag : {false, true}) {
-        message->isRedundant = flag;
-        message->isSessionStarted = !flag;
-        const auto copy = message->copyWithZone();
-        EXPECT_EQ(copy->isRedundant, flag);
-        EXPECT_EQ(copy->isSessionStarted, !flag);
-        EXPECT_EQ(copy->description(), formatted("category=Undefined type=Generic {}", message->payload()));
-    }
 }
 
 } // namespace
