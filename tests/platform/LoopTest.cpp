@@ -97,24 +97,6 @@ TEST(SerialQueue, WorkThatMayBlockLeavesThePosterAndTakesWhatFollowsAlong) {
     }
 }
 
-TEST(SerialQueue, ManyQueuesShareFewThreadsThatGrowWhileWorkBlocks) {
-    LinuxWorkQueues queues;
-    std::latch allBlock(8);
-    std::atomic<int> ran{0};
-    for (int i = 0; i < 10'000; ++i) {
-        queues.makeSerialQueue("one of many")->post([&, isBlocking = i < 8] {
-            if (isBlocking) {
-                allBlock.arrive_and_wait();
-            }
-            ++ran;
-        });
-    }
-    const std::filesystem::directory_iterator threads("/proc/self/task");
-    EXPECT_LE(std::distance(threads, {}), static_cast<std::ptrdiff_t>(ThreadPool::kMaximumThreads) + 4);
-    queues.workOff();
-    EXPECT_EQ(ran, 10'000);
-}
-
 TEST(SerialQueue, WhatWasPostedRunsAfterItIsDestroyed) {
     std::atomic<int> ran{0};
     {

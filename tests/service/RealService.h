@@ -264,23 +264,28 @@ public:
         pollfd descriptor{.fd = socket_, .events = POLLIN, .revents = 0};
         return ::poll(&descriptor, 1, milliseconds) == 1;
     }
-    /// The next reply, waiting at most some seconds; nothing at the end of the connection.
-    std::optional<wire::Reply> receive() {
+    /// The next frame, waiting at most some seconds; empty at the end of the connection.
+    std::vector<std::uint8_t> receiveFrame() {
         for (;;) {
             wire::FrameSplitter frames(received_);
-            if (const auto item = frames.next()) {
-                auto reply = wire::decodeReply(*item);
-                received_.erase(received_.begin(),
-                                received_.end() - static_cast<std::ptrdiff_t>(frames.rest().size()));
-                return reply;
+            if (frames.next()) {
+                const auto end = received_.end() - static_cast<std::ptrdiff_t>(frames.rest().size());
+                std::vector<std::uint8_t> frame(received_.begin(), end);
+                received_.erase(received_.begin(), end);
+                return frame;
             }
             std::array<std::uint8_t, 65536> bytes;
             const ssize_t count = isReadable(20'000) ? ::recv(socket_, bytes.data(), bytes.size(), 0) : 0;
             if (count <= 0) {
-                return std::nullopt;
+                return {};
             }
             received_.insert(received_.end(), bytes.begin(), bytes.begin() + count);
         }
+    }
+    /// What it says; nothing at the end of the connection.
+    std::optional<wire::Reply> receive() {
+        const std::vector<std::uint8_t> frame = receiveFrame();
+        return frame.empty() ? std::nullopt : wire::decodeReply(std::span(frame).subspan(wire::kLengthBytes));
     }
     /// The number of replies to the end of the connection.
     std::size_t receiveAll() {

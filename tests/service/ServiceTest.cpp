@@ -19,37 +19,6 @@ void announceSocket() {
     ::setenv("LISTEN_FDS", "1", 1);
 }
 
-TEST(Service, MessageOfAStartedSessionBecomesTwoEvents) {
-    ServiceProcess service;
-    RawClient client(service.socketPath());
-    for (const wire::Request& next : {request(Method::createReportingSession, 7),
-                                      {.method = Method::setServiceType, .reporterID = 7, .serviceType = 7},
-                                      {.method = Method::setConfiguration,
-                                      .reporterID = 7,
-                                      .dictionary = {{"HostApplicationDisplayID", "com.example.music"}}}}) {
-        EXPECT_EQ(client.call(next)->result, Value(true));
-    }
-    EXPECT_EQ(client.call(Method::getServiceNameForReporterID, 7)->result, Value(7));
-    EXPECT_EQ(client.call(Method::getAllReporters)->result, Value(Array{7}));
-
-    client.send(framesOf(request(Method::startReportingSessionForID, 7), 77));
-    const Dictionary payload{{"route name", "Speaker"}, {"level", 0.25F}, {"zrreporting_timestamp", 4e9}};
-    const auto answered = client.call(message(payload, {7}, 0x08000004));
-    EXPECT_TRUE(answered && !answered->error && !answered->result);
-    EXPECT_EQ(service.countEvents(R"(,"event":"com.vandra.longformaudio.Session_Playback.Start","payload":{)"
-                                  R"("HostApplicationDisplayID":"com.example.music",)"
-                                  R"("audiotag":"Session_PlaybackStart","level":0.25,"route_name":"Speaker",)"
-                                  R"("zrreporting_timestamp":4000000000.0}})"),
-              1U);
-    // The stop answers the held start first.
-    const auto held = client.call(Method::stopReportingSessionForID, 7);
-    EXPECT_EQ(held->id, 77U);
-    EXPECT_EQ(held->result, Value(true));
-    EXPECT_EQ(client.receive()->result, Value(true));
-    EXPECT_EQ(client.call(Method::destroyReportingSession, 7)->result, Value(true));
-    EXPECT_EQ(client.call(Method::getServiceNameForReporterID, 7)->result, Value(65535));
-}
-
 TEST(Service, EndsAsAskedTo) {
     ServiceProcess service;
     {
@@ -119,20 +88,6 @@ TEST(Service, WhatKeepsItFromStartingIsOneClearLine) {
     }
     EXPECT_TRUE(RawClient(first.socketPath()).call(Method::getAllReporters));
     EXPECT_EQ(contentOf(taken), "somebody's");
-}
-
-TEST(Service, TakesNoArgumentsButThoseThatAskAboutIt) {
-    const std::string refusal = "tamblod: no arguments are taken but --help and --version\n";
-    for (const char* words : {"-h", "''", "serve", "--help --version", "--version 2"}) {
-        const CommandResult result = run(std::string(TAMBLOD_PATH) + " " + words);
-        EXPECT_EQ(result.output, refusal) << words;
-        EXPECT_EQ(result.status, 2) << words;
-    }
-    EXPECT_THAT(run(TAMBLOD_PATH " --version").output,
-                testing::MatchesRegex("tamblod [0-9]+\\.[0-9]+\\.[0-9]+\n"));
-    const CommandResult help = run(TAMBLOD_PATH " --help 2>/dev/null");
-    EXPECT_TRUE(help.output.starts_with("usage: tamblod ")) << help.output;
-    EXPECT_EQ(help.status, 0);
 }
 
 TEST(Service, TakesOverAnActivatedSocketAndTellsItsManager) {
