@@ -206,24 +206,19 @@ TEST_F(Hostile, FilesKeepTheirBoundWhateverTheLine) {
 
 TEST_F(Hostile, OnlyRootAndTheServicesOwnUserMayEndIt) {
     ServiceProcess& service = start();
-    if (::geteuid() == 0) {
-        // The kernel tells of the user who connects.
-        ::chmod(service.socketPath().c_str(), 0666);
-        ::chmod(service.runtimeDirectory().c_str(), 0711);
-        ::chmod(std::filesystem::path(service.runtimeDirectory()).parent_path().c_str(), 0711);
-        ASSERT_EQ(::seteuid(65'534), 0);
-        RawClient other(service.socketPath());
-        ASSERT_EQ(::seteuid(0), 0);
-        const auto reply = other.call(Method::killService);
-        EXPECT_TRUE(reply && reply->error && reply->error->code == -32000);
-        EXPECT_THAT(other.call(Method::getAllReporters), IsDone());
-        ASSERT_TRUE(bystanderIsServed());
+    if (::geteuid() != 0) {
+        GTEST_SKIP() << "nobody else can be had";
     }
-    RawClient own(service.socketPath());
-    own.send(framesOf(request(Method::killService)));
-    EXPECT_EQ(service.awaitEnd(), 2);
-    service.start();
-    bystander_.emplace(service.socketPath(), kBystander);
+    // The kernel tells of the user who connects.
+    ::chmod(service.socketPath().c_str(), 0666);
+    ::chmod(service.runtimeDirectory().c_str(), 0711);
+    ::chmod(std::filesystem::path(service.runtimeDirectory()).parent_path().c_str(), 0711);
+    ASSERT_EQ(::seteuid(65'534), 0);
+    RawClient other(service.socketPath());
+    ASSERT_EQ(::seteuid(0), 0);
+    const auto reply = other.call(Method::killService);
+    EXPECT_TRUE(reply && reply->error && reply->error->code == -32000);
+    EXPECT_THAT(other.call(Method::getAllReporters), IsDone());
 }
 
 } // namespace

@@ -93,24 +93,6 @@ INSTANTIATE_TEST_SUITE_P(
         Refused{"application_name_bytes", 512, {}, configuration("HostApplicationDisplayID", 900'000)}),
     [](const auto& test) { return test.param.limit + "_" + std::to_string(test.index); });
 
-TEST_F(Hostile, SessionsThatAreGoneMakeRoom) {
-    ServiceProcess& service = start("\"sessions_of_connection\": 3, \"sessions_of_user\": 4");
-    RawClient client(service.socketPath());
-    for (std::int64_t round = 0; round < 20; ++round) {
-        RawClient other(service.socketPath());
-        EXPECT_THAT(other.call(creation(50)), IsDone());
-        for (const std::int64_t id : {1, 2}) {
-            EXPECT_THAT(client.call(creation(10 * round + id)), IsDone());
-        }
-        EXPECT_THAT(client.call(creation(10 * round + 3)), RefusesBy("sessions_of_user"));
-        for (const std::int64_t id : {1, 2}) {
-            EXPECT_THAT(client.call(Method::destroyReportingSession, 10 * round + id), IsDone());
-        }
-        ::shutdown(other.descriptor(), SHUT_RDWR);
-        EXPECT_TRUE(other.isClosedByService());
-    }
-}
-
 TEST_F(Hostile, ConnectionsBeyondTheUsersAreToldSoAndEnd) {
     ServiceProcess& service = start("\"connections_of_user\": 6");
     std::list<RawClient> clients;
@@ -205,12 +187,8 @@ INSTANTIATE_TEST_SUITE_P(Hostile, RepliesThatNobodyReads,
                                          Unread{"reply_bytes_of_user", 1'000'000, 6, 60}),
                          [](const auto& test) { return test.param.limit + std::to_string(test.index); });
 
-struct Bound {
-    std::string limit;
-    std::size_t value;
-
-    friend void PrintTo(const Bound& row, std::ostream* out) { *out << row.limit; }
-};
+/// A limit and its value.
+using Bound = std::pair<std::string, int>;
 
 /// How much of this the service takes, without a reply being read, before it holds the sender back.
 std::size_t acceptedOf(const RawClient& client, std::string_view bytes) {
@@ -228,7 +206,7 @@ class WaitingRequests : public Hostile, public testing::WithParamInterface<Bound
 
 TEST_P(WaitingRequests, HoldTheirSendersBackAndAreCarriedOutInFull) {
     ServiceProcess& service =
-        start("\"" + GetParam().limit + "\": " + std::to_string(GetParam().value),
+        start("\"" + GetParam().first + "\": " + std::to_string(GetParam().second),
               {.isInternalBuild = true,
                .preferences = {{kCaptures, R"({"enable_stackburst": true, "wait_time": 3e6})"}},
                .environment = {{"TAMBLO_LOG", "error"}}});
@@ -249,7 +227,7 @@ TEST_P(WaitingRequests, HoldTheirSendersBackAndAreCarriedOutInFull) {
     EXPECT_LT(taken[0] + taken[1], all.size());
     // What no session has to do with is answered meanwhile, unless it is the user who has to wait.
     other.send(std::string("\x08\0\0\0\x84\0\x01\x63xyz\x80", 12));
-    EXPECT_EQ(other.isReadable(100), GetParam().limit != "waiting_bytes_of_user");
+    EXPECT_EQ(other.isReadable(100), GetParam().first != "waiting_bytes_of_user");
     EXPECT_FALSE(client.isReadable(0)) << "the machine was too slow to tell";
 
     EXPECT_EQ(client.receive()->id, 99U);
@@ -265,12 +243,12 @@ TEST_P(WaitingRequests, HoldTheirSendersBackAndAreCarriedOutInFull) {
 INSTANTIATE_TEST_SUITE_P(Hostile, WaitingRequests,
                          testing::Values(Bound{"waiting_requests", 20}, Bound{"waiting_bytes", 200'000},
                                          Bound{"waiting_bytes_of_user", 200'000}),
-                         [](const auto& test) { return test.param.limit; });
+                         [](const auto& test) { return test.param.first; });
 
 class RetainedBytes : public Hostile, public testing::WithParamInterface<Bound> {};
 
 TEST_P(RetainedBytes, LetGoOfTheLargestSessionsOldestMessages) {
-    ServiceProcess& service = start("\"" + GetParam().limit + "\": " + std::to_string(GetParam().value));
+    ServiceProcess& service = start("\"" + GetParam().first + "\": " + std::to_string(GetParam().second));
     Session client(service.socketPath(), 7, 11);
     client.start(8, 11);
     constexpr std::size_t kMessages = 2'000;
@@ -282,12 +260,13 @@ TEST_P(RetainedBytes, LetGoOfTheLargestSessionsOldestMessages) {
     }
     EXPECT_TRUE(client.stop(8) && client.stop(7));
     EXPECT_EQ(service.countEvents("\"n\":"), 2 * (kMessages + 50));
-    EXPECT_EQ(countOf(GetParam().limit + " is reached", service.errorOutput()), 1U);
-    const std::string all =
-        run("cat " + (service.logs() / "DiagnosticLogs/Audio/Reporting/*-7-*").string()).output;
-    const std::string small =
-        run("cat " + (service.logs() / "DiagnosticLogs/Audio/Reporting/*-8-*").string()).output;
-    EXPECT_EQ(countOf("\"n\":", small), 50U);
+    EXPECT_EQ(countOf(GetParam().first + " is reached", service.errorOutput()), 1U);
+    const auto retained = [&service](const std::string& id) {
+        return run("cat " + (service.logs() / "DiagnosticLogs/Audio/Reporting/*-").string() + id + "-*")
+            .output;
+    };
+    const std::string all = retained("7");
+    EXPECT_EQ(countOf("\"n\":", retained("8")), 50U);
     EXPECT_EQ(countOf("\"n\": 10000,", all), 0U);
     EXPECT_EQ(countOf("\"n\": 11999,", all), 1U);
     // The record of its start went, too.
@@ -305,7 +284,7 @@ TEST_P(RetainedBytes, LetGoOfTheLargestSessionsOldestMessages) {
 INSTANTIATE_TEST_SUITE_P(Hostile, RetainedBytes,
                          testing::Values(Bound{"retained_bytes_of_user", 1'000'000},
                                          Bound{"retained_bytes", 1'000'000}),
-                         [](const auto& test) { return test.param.limit; });
+                         [](const auto& test) { return test.param.first; });
 
 TEST_F(Hostile, KeysBeyondThoseThatAreRememberedAreRecordedAllTheSame) {
     ServiceProcess& service = start("\"previous_keys_of_session\": 100");

@@ -208,15 +208,13 @@ int refusingControl(int epoll, int operation, int descriptor, epoll_event* event
     return ::epoll_ctl(epoll, operation, descriptor, event);
 }
 
-/// Accepts everybody and notes what becomes of them, on the loop's thread.
 struct Delegate final : ListenerDelegate {
     bool shouldAcceptNewConnection(ClientConnection& connection) override {
-        connection.setInterruptionHandler([this] { trace += "interrupted "; });
-        connection.setInvalidationHandler([this] { trace += "invalidated "; });
+        connection.setInvalidationHandler([this] { ++ended; });
         connection.resume();
         return true;
     }
-    std::string trace;
+    std::atomic<int> ended{0};
 };
 
 TEST(ConnectionService, EndsAClientWhoseSocketCannotBeWatchedAndServesTheOthers) {
@@ -251,7 +249,7 @@ TEST(ConnectionService, EndsAClientWhoseSocketCannotBeWatchedAndServesTheOthers)
         loop.stop();
     });
     thread.join();
-    EXPECT_EQ(delegate.trace, "interrupted invalidated ");
+    EXPECT_EQ(delegate.ended, 1);
     EXPECT_THAT(log.take(), ElementsAre("3 zrrs accepting connections rests: No space left on device",
                                         "3 zrrs accepting connections again",
                                         HasSubstr("since its socket cannot be watched: No space left on")));

@@ -23,7 +23,6 @@ TEST(Tambloctl, ExitStatusSaysWhoWasWrong) {
     } cases[] = {
         {"", 2, "usage: tambloctl COMMAND"},
         {"help", 0, "usage: tambloctl COMMAND"},
-        {"help tail", 0, "usage: tambloctl tail"},
         {"nonsense", 2, "unknown command \"nonsense\""},
         {"tail nothing", 1, "there is no "},
         {"send --category Volume --reporter 7 n=5", 0, "sent"},
@@ -32,16 +31,12 @@ TEST(Tambloctl, ExitStatusSaysWhoWasWrong) {
          R"(Z com.vandra.tamblo.Volume.Generic {)"},
         {"tail --summary --event com.vandra.tamblo.Volume* --key n", 0, " 1  in all\n"},
         {"tail --summary --event com.vandra.tamblo.Volume", 0, " 0  in all\n"},
-        {"tail --summary --key n --key missing", 0, " 0  in all\n"},
-        {"tail --lines x", 2, "--lines needs a number"},
         {"tail --lines", 2, "option \"--lines\" needs a value"},
-        {"tail --summary=1", 2, "option \"--summary\" takes no value"},
         {"tail --other", 2, "unknown option \"--other\""},
         {"reporters", 0, "7 telephony\n"},
         {"validate 7", 0, "7 telephony\n"},
         {"validate 99", 1, "99 is not a reporter"},
         {"session --reporter 9 --quiet", 0, ""},
-        {"session", 2, "--reporter needs"},
         {"notify com.example.news 0x10", 0, ""},
         {"notify a/b", 2, "no notification name"},
         {"preference set d key 5", 0, ""},
@@ -55,12 +50,9 @@ TEST(Tambloctl, ExitStatusSaysWhoWasWrong) {
         {"preference lose d", 2, "preference needs"},
         {"decode EAIaATMiAW4qA2NvbQ==", 0, "  issuetype: \"3\""},
         {"decode --kind=line EAIaATMiAW4qA2NvbQ==", 2, "tambloctl: line 1: not usable JSON: "},
-        {"decode --kind frames x", 2, "\"frames\" is no kind"},
-        {"decode '?'", 2, "not Base64\ntambloctl: it was taken for a record; --kind names another"},
         {"decode --file /nowhere/x", 2, "cannot read /nowhere/x: No such file"},
         {"kill", 0, ""},
         {"kill --timeout 0", 3, "no service answers at "},
-        {"kill --timeout 5s", 2, "--timeout needs a number of seconds"},
     };
     for (const auto& row : cases) {
         const CommandResult done = service.tambloctl(row.arguments);

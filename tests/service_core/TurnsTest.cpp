@@ -161,6 +161,8 @@ TEST_F(TurnsTest, LimitsOfAUserAreNobodyElses) {
     EXPECT_THAT(areDone(second, 1, 2),
                 ElementsAre("create true", "set" + refused, "create" + refused, "set true"));
     EXPECT_THAT(areDone(stranger, 1, 1), ElementsAre("create true", "set true"));
+    second->object().destroyReportingSession(1, {});
+    EXPECT_THAT(areDone(first, 2, 2), ElementsAre("create true", "set" + refused));
     first->invalidate();
     first.reset();
     EXPECT_THAT(areDone(second, 1, 2), ElementsAre("create true", "set true", "create true", "set" + refused))
