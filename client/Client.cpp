@@ -1,7 +1,7 @@
 #include "client/Client.h"
 
-#include "client/Directories.h"
 #include "client/PumpThread.h"
+#include "wire/Directories.h"
 #include "wire/Request.h"
 
 #include <limits>
@@ -121,7 +121,7 @@ wire::RequestView messageView(const Dictionary& payload, EventCategory category,
 
 Engine::Options engineOptions(Client::Options& options) {
     const bool isBackground = options.threading == Client::Threading::background;
-    return {.socketPath = options.socketPath.empty() ? Directories::ofThisProcess().socketFile()
+    return {.socketPath = options.socketPath.empty() ? wire::Directories::ofThisProcess().socketFile()
                                                      : std::move(options.socketPath),
             .queueCapacity = options.queueCapacity,
             .reconnect = options.reconnect,

@@ -56,7 +56,7 @@ public:
     enum class Threading : std::uint8_t { background, caller };
 
     struct Options {
-        /// Empty: the service's usual place, see `Directories`.
+        /// Empty: the service's usual place, see `wire::Directories`.
         std::string socketPath{};
         Threading threading = Threading::background;
         /// Requests that may wait to be sent; each takes some 1,200 bytes from the start.

@@ -24,7 +24,7 @@ endfunction()
 
 # The client library's headers are included as they are in this tree: "client/Client.h" below
 # include/tamblo, which the pkg-config file names. What only its own sources include stays here.
-foreach(entry client/Client.h client/Directories.h client/tamblo.h)
+foreach(entry client/Client.h wire/Directories.h client/tamblo.h)
     tamblo_add_header_with_includes(${entry})
 endforeach()
 foreach(header IN LISTS headers)

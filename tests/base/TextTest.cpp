@@ -1,16 +1,12 @@
 #include "base/Base64.h"
 #include "base/Format.h"
 #include "base/Rfc3339.h"
-#include "base/UniqueFunction.h"
 #include "base/Utf8.h"
-#include "tests/base/AllocationCount.h"
 #include "tests/base/Samples.h"
 
 #include <gtest/gtest.h>
 
-#include <array>
 #include <limits>
-#include <memory>
 #include <sstream>
 #include <string>
 #include <vector>
@@ -73,25 +69,6 @@ TEST(Rfc3339, WritesTimes) {
         EXPECT_EQ(formatRfc3339(seconds).value_or("none"), expected) << seconds;
         EXPECT_EQ(formatRfc3339Date(seconds).value_or("none"), expected.substr(0, 10)) << seconds;
     }
-}
-
-TEST(UniqueFunction, HoldsMovesAndDestroysItsTarget) {
-    using Function = UniqueFunction<int(std::unique_ptr<int>)>;
-    const auto token = std::make_shared<int>(1);
-    const auto small = [token](auto add) { return ++*token + *add; };
-    const auto large = [small, ballast = std::array<char, 100>{}](auto add) {
-        return small(std::move(add)) + ballast[99];
-    };
-    Function function;
-    EXPECT_EQ(test::allocationsOf([&] { function = small; }).blocks, 0U);
-    Function moved = std::move(function);
-    EXPECT_FALSE(function);
-    EXPECT_EQ(moved(std::make_unique<int>(10)), 12);
-    moved = Function(large);
-    EXPECT_EQ(token.use_count(), 4) << "this one, small's, large's and the function's";
-    EXPECT_EQ(moved(std::make_unique<int>(10)), 13);
-    moved = Function();
-    EXPECT_EQ(token.use_count(), 3);
 }
 
 } // namespace

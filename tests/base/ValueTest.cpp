@@ -85,25 +85,9 @@ TEST(Value, ReadingANumberNeverFails) {
     }
 }
 
-TEST(Value, KeepsItsContent) {
-    // Lengths on both sides of what lies in the value itself, through copy and move.
-    for (const std::size_t length : {0U, 1U, 14U, 15U, 254U, 255U, 256U, 70'000U}) {
-        std::string text(length, 'x');
-        text[length / 2] = '\0';
-        Value value(text);
-        const Value copy = value;
-        const Value moved = std::move(value);
-        EXPECT_EQ(copy.stringValue(), text);
-        EXPECT_EQ(moved, copy);
-        EXPECT_NE(moved, Value(text + "y"));
-        const std::vector<std::uint8_t> bytes(text.begin(), text.end());
-        const Value data = Value::data(bytes);
-        EXPECT_TRUE(std::ranges::equal(bytes, data.dataValue()));
-        EXPECT_NE(data, copy);
-    }
-}
-
 using Model = std::map<std::string, Value>;
+
+constexpr std::array<std::uint8_t, 20> kSomeBytes{0, 1, 255};
 
 /// Keys that differ late, early, only in length, or only in bytes that are 0 or above ASCII.
 const std::vector<std::string>& someKeys() {
@@ -135,6 +119,8 @@ void expectHolds(const Dictionary& dictionary, const Model& model) {
     for (const auto& [key, value] : model) {
         ASSERT_EQ(dictionary.keyAt(index), key);
         ASSERT_EQ(dictionary.valueAt(index++), value);
+        ASSERT_EQ(*dictionary.find(key), value);
+        ASSERT_EQ(dictionary.find(key + "x") != nullptr, model.contains(key + "x"));
         anyHasSpace = anyHasSpace || key.find(' ') != key.npos;
     }
     ASSERT_EQ(dictionary.size(), index);
@@ -155,8 +141,10 @@ protected:
     const std::string& key() { return someKeys()[below(someKeys().size())]; }
 
     void change(Dictionary& dictionary, Model& model) {
-        const Value values[] = {0, 0.0, 1, "short", "a text that does not lie in the value itself", Array{1}};
-        const Value& value = values[below(6)];
+        // Texts of lengths on both sides of what lies in the value itself, and of what a byte can say.
+        const std::string text(below(4) == 0 ? below(300) : below(20), 'x');
+        const Value values[] = {0, 0.0, 1, text, text, Array{1}, Value::data({&kSomeBytes[0], below(20)})};
+        const Value& value = values[below(std::size(values))];
         const std::string& name = key();
         const std::size_t other = below(kChanging + 1);
         const std::size_t place = below(std::max<std::size_t>(model.size(), 1));
@@ -177,7 +165,7 @@ protected:
         case 3: {
             // More new keys than are added one by one, among those that are there.
             Dictionary many;
-            for (char letter = 'A'; letter < 'h'; letter = static_cast<char>(letter + 1 + below(4))) {
+            for (char letter = '0'; letter < 'p'; letter = static_cast<char>(letter + 1 + below(9))) {
                 many.set({&letter, 1}, value);
                 model.insert_or_assign(std::string(1, letter), value);
             }
@@ -213,7 +201,7 @@ protected:
 };
 
 TEST_P(DictionaryModelTest, DoesWhatASortedMapDoes) {
-    for (int step = 0; step < 3000; ++step) {
+    for (int step = 0; step < 1000; ++step) {
         const std::size_t a = below(kChanging);
         const std::size_t b = below(kChanging);
         ASSERT_NO_FATAL_FAILURE(change(dictionaries_[a], models_[a]));
@@ -263,21 +251,6 @@ TEST(Dictionary, AllocatesOnlyForWhatIsNew) {
     }
     EXPECT_LE(test::allocationsOf([&] { previous.set("zrreporting_timestamp", 2.5); }).blocks, 1U);
     EXPECT_EQ(&previous.keys(), &first.keys());
-}
-
-TEST(KeySet, FindsAmongManyKeysWithOnePrefix) {
-    for (const std::size_t count : {1U, 31U, 32U, 33U, 500U}) {
-        std::map<std::string, Value> entries;
-        for (std::size_t i = 0; i < count; ++i) {
-            entries.emplace((i % 3 == 0 ? "a common prefix " : "k") + std::to_string(i), Value(i));
-        }
-        const Dictionary dictionary = Dictionary::fromMap(entries);
-        for (const auto& [key, value] : entries) {
-            ASSERT_EQ(*dictionary.find(key), value);
-            ASSERT_EQ(dictionary.find(key + "x"), nullptr);
-            ASSERT_EQ(dictionary.find(key.substr(1)), nullptr);
-        }
-    }
 }
 
 TEST(KeySet, IsSharedBetweenThreads) {

@@ -63,12 +63,10 @@ public:
 class FakeDeviceProperties final : public DeviceProperties {
 public:
     std::optional<bool> booleanProperty(std::string_view name) const override {
-        return lookUp(properties_, name);
+        return lookUp(properties, name);
     }
-    void set(const std::string& name, bool value) { properties_[name] = value; }
 
-private:
-    std::map<std::string, bool, std::less<>> properties_;
+    std::map<std::string, bool, std::less<>> properties;
 };
 
 class FakePreferences final : public Preferences {
@@ -107,12 +105,9 @@ public:
 
 class FakeProcessSampling final : public ProcessSampling {
 public:
-    std::optional<ProcessSample> sample(pid_t pid) const override { return lookUp(samples_, pid); }
-    void set(pid_t pid, const ProcessSample& sample) { samples_[pid] = sample; }
-    void end(pid_t pid) { samples_.erase(pid); }
+    std::optional<ProcessSample> sample(pid_t pid) const override { return lookUp(samples, pid); }
 
-private:
-    std::map<pid_t, ProcessSample> samples_;
+    std::map<pid_t, ProcessSample> samples;
 };
 
 class FakeAccessories final : public Accessories {
@@ -128,12 +123,9 @@ public:
 
 class FakeTracePoints final : public TracePoints {
 public:
-    void EmitTracePoint(std::uint32_t traceCode) noexcept override { codes_.push_back(traceCode); }
-    /// The codes since the last call.
-    [[nodiscard]] std::vector<std::uint32_t> take() { return std::exchange(codes_, {}); }
+    void EmitTracePoint(std::uint32_t traceCode) noexcept override { codes.push_back(traceCode); }
 
-private:
-    std::vector<std::uint32_t> codes_;
+    std::vector<std::uint32_t> codes;
 };
 
 /// Channels and failures as a test sets them. What has been gained between two samples is what the later one

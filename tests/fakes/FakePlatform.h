@@ -47,7 +47,7 @@ public:
     }
     /// Restarts the process on another build.
     void setInternalBuild(bool isInternalBuild) {
-        deviceProperties.set("InternalBuild", isInternalBuild);
+        deviceProperties.properties["InternalBuild"] = isInternalBuild;
         restart();
     }
     /// As if the process were started anew: posted work is done, and nothing that sessions share is left.

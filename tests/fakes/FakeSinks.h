@@ -25,30 +25,29 @@ public:
     bool isEventInUse(std::string_view eventName) override { return !inUse_ || inUse_->contains(eventName); }
     std::uint64_t inUseGeneration() const noexcept override { return generation_; }
     void sendEventLazy(std::string_view eventName, const std::function<Dictionary()>& payload) override {
-        events_.push_back({std::string(eventName), payload()});
+        events.push_back({std::string(eventName), payload()});
     }
 
     void setEventsInUse(std::optional<std::set<std::string, std::less<>>> names) {
         inUse_ = std::move(names);
         ++generation_;
     }
-    [[nodiscard]] const std::vector<Event>& events() const noexcept { return events_; }
     /// The payloads of the events of this name.
     [[nodiscard]] std::vector<Dictionary> payloads(std::string_view eventName) const {
         std::vector<Dictionary> found;
-        for (const Event& event : events_) {
+        for (const Event& event : events) {
             if (event.name == eventName) {
                 found.push_back(event.payload);
             }
         }
         return found;
     }
-    void clear() noexcept { events_.clear(); }
+
+    std::vector<Event> events;
 
 private:
     std::uint64_t generation_ = 1;
     std::optional<std::set<std::string, std::less<>>> inUse_;
-    std::vector<Event> events_;
 };
 
 /// Keeps what its reporters ask for; accepts as a test says, and answers when it does.

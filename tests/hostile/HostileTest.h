@@ -90,6 +90,15 @@ MATCHER(IsDone, "") {
     return arg && !arg->error;
 }
 
+inline std::vector<wire::Request> messages(std::size_t count,
+                                           const std::function<wire::Request(std::size_t)>& make) {
+    std::vector<wire::Request> made;
+    for (std::size_t i = 0; i < count; ++i) {
+        made.push_back(make(i));
+    }
+    return made;
+}
+
 /// Sends some at a time; whether all are answered.
 inline bool callAll(RawClient& client, const std::vector<wire::Request>& requests) {
     constexpr std::size_t kAtATime = 100;

@@ -93,24 +93,6 @@ INSTANTIATE_TEST_SUITE_P(
         Refused{"application_name_bytes", 512, {}, configuration("HostApplicationDisplayID", 900'000)}),
     [](const auto& test) { return test.param.limit + "_" + std::to_string(test.index); });
 
-TEST_F(Hostile, SessionsThatAreGoneMakeRoom) {
-    ServiceProcess& service = start("\"sessions_of_connection\": 3, \"sessions_of_user\": 4");
-    RawClient client(service.socketPath());
-    for (std::int64_t round = 0; round < 20; ++round) {
-        RawClient other(service.socketPath());
-        EXPECT_THAT(other.call(creation(50)), IsDone());
-        for (const std::int64_t id : {1, 2}) {
-            EXPECT_THAT(client.call(creation(10 * round + id)), IsDone());
-        }
-        EXPECT_THAT(client.call(creation(10 * round + 3)), RefusesBy("sessions_of_user"));
-        for (const std::int64_t id : {1, 2}) {
-            EXPECT_THAT(client.call(Method::destroyReportingSession, 10 * round + id), IsDone());
-        }
-        ::shutdown(other.descriptor(), SHUT_RDWR);
-        EXPECT_TRUE(other.isClosedByService());
-    }
-}
-
 TEST_F(Hostile, ConnectionsBeyondTheUsersAreToldSoAndEnd) {
     ServiceProcess& service = start("\"connections_of_user\": 6");
     std::list<RawClient> clients;
@@ -160,39 +142,192 @@ TEST_F(Hostile, FramesThatDoNotGoOnEndTheirConnectionsByName) {
     expectEnd(clients.front(), "frame_seconds");
 }
 
-TEST_F(Hostile, RepliesThatNobodyReadsEndTheirConnection) {
-    ServiceProcess& service = start("\"reply_bytes\": 100000");
-    RawClient owner(service.socketPath()), reader(service.socketPath()), other(service.socketPath());
-    std::vector<wire::Request> creations;
-    for (int i = 0; i < 1'000; ++i) {
-        creations.push_back(creation(1'000'000'000'000 + i));
+struct Unread {
+    std::string limit;
+    std::size_t value;
+    int clients;
+    std::size_t requests; ///< of each, with replies of 10 kB
+
+    friend void PrintTo(const Unread& row, std::ostream* out) { *out << row.limit; }
+};
+
+class RepliesThatNobodyReads : public Hostile, public testing::WithParamInterface<Unread> {};
+
+TEST_P(RepliesThatNobodyReads, EndTheirConnection) {
+    const auto& [limit, value, clients, requests] = GetParam();
+    ServiceProcess& service = start("\"" + limit + "\": " + std::to_string(value));
+    RawClient owner(service.socketPath()), reader(service.socketPath());
+    ASSERT_TRUE(callAll(owner, messages(1'000, [](std::size_t i) {
+                            return creation(1'000'000'000'000 + static_cast<std::int64_t>(i));
+                        })));
+    std::list<RawClient> others;
+    for (int i = 0; i < clients; ++i) {
+        others.emplace_back(service.socketPath());
     }
-    ASSERT_TRUE(callAll(owner, creations));
-    // Half a megabyte of replies by one batch, for somebody who reads.
+    // All that is asked for comes with one read, also of somebody who reads the replies.
+    service.signal(SIGSTOP);
+    for (RawClient& other : others) {
+        other.send(framesOf(request(Method::getAllReporters), 1, requests));
+    }
     reader.send(framesOf(request(Method::getAllReporters), 1, 60));
+    service.signal(SIGCONT);
     for (int i = 0; i < 60; ++i) {
         ASSERT_THAT(reader.receive(), IsDone());
     }
-    other.send(framesOf(request(Method::getAllReporters), 1, 500));
-    EXPECT_TRUE(other.isHungUp());
-    EXPECT_EQ(countOf("reply_bytes", service.errorOutput()), 1U);
+    EXPECT_TRUE(eventually([&] { return countOf(limit + ": at most", service.errorOutput()) > 0; }));
+    EXPECT_TRUE(std::ranges::any_of(others, &RawClient::isHungUp));
+    if (kMemoryIsThatOfTheService) {
+        EXPECT_LT(peakBytes(), 32U << 20U);
+    }
 }
 
-TEST_F(Hostile, RetainedMessagesBeyondTheBudgetAreLetGoAndTold) {
-    ServiceProcess& service = start("\"retained_bytes_of_user\": 1000000");
-    Session client(service.socketPath());
-    constexpr std::size_t kMessages = 2'000;
-    std::vector<wire::Request> messages;
-    for (std::size_t i = 0; i < kMessages; ++i) {
-        messages.push_back(message({{"n", i}, {"text", std::string(1'000, 'x')}}));
+INSTANTIATE_TEST_SUITE_P(Hostile, RepliesThatNobodyReads,
+                         testing::Values(Unread{"reply_bytes", 100'000, 1, 500},
+                                         Unread{"reply_bytes", 4U << 20U, 1, 6'000},
+                                         Unread{"reply_bytes_of_user", 1'000'000, 6, 60}),
+                         [](const auto& test) { return test.param.limit + std::to_string(test.index); });
+
+/// A limit and its value.
+using Bound = std::pair<std::string, int>;
+
+/// How much of this the service takes, without a reply being read, before it holds the sender back.
+std::size_t acceptedOf(const RawClient& client, std::string_view bytes) {
+    std::size_t sent = 0;
+    pollfd writable{.fd = client.descriptor(), .events = POLLOUT, .revents = 0};
+    while (sent < bytes.size() && ::poll(&writable, 1, 100) == 1) {
+        const ssize_t count = ::send(client.descriptor(), bytes.data() + sent, bytes.size() - sent,
+                                     MSG_DONTWAIT | MSG_NOSIGNAL);
+        sent += count > 0 ? static_cast<std::size_t>(count) : 0U;
     }
-    ASSERT_TRUE(callAll(client, messages));
-    EXPECT_TRUE(client.stop());
-    EXPECT_EQ(service.countEvents("\"n\":"), 2 * kMessages);
-    EXPECT_EQ(countOf("retained_bytes_of_user", service.errorOutput()), 1U);
+    return sent;
+}
+
+class WaitingRequests : public Hostile, public testing::WithParamInterface<Bound> {};
+
+TEST_P(WaitingRequests, HoldTheirSendersBackAndAreCarriedOutInFull) {
+    ServiceProcess& service =
+        start("\"" + GetParam().first + "\": " + std::to_string(GetParam().second),
+              {.isInternalBuild = true,
+               .preferences = {{kCaptures, R"({"enable_stackburst": true, "wait_time": 3e6})"}},
+               .environment = {{"TAMBLO_LOG", "error"}}});
+    Session client(service.socketPath());
+    std::list<Session> senders;
+    for (const std::int64_t id : {8, 9}) {
+        senders.emplace_back(service.socketPath(), id);
+    }
+    RawClient other(service.socketPath());
+    client.send(framesOf(message({{"smallest_buffer_frame_size", 512}}, {7}, 7, 6), 99));
+    constexpr std::size_t kRequests = 300; // of which fewer may wait, though not as they are shipped
+    // Errors, which are recorded however often they are said.
+    const std::string all = framesOf(message({{"k", std::string(10'000, 'x')}}, {8}, 4, 6), 1, kRequests);
+    std::vector<std::size_t> taken;
+    for (const Session& sender : senders) {
+        taken.push_back(acceptedOf(sender, all));
+    }
+    EXPECT_LT(taken[0] + taken[1], all.size());
+    // What no session has to do with is answered meanwhile, unless it is the user who has to wait.
+    other.send(std::string("\x08\0\0\0\x84\0\x01\x63xyz\x80", 12));
+    EXPECT_EQ(other.isReadable(100), GetParam().first != "waiting_bytes_of_user");
+    EXPECT_FALSE(client.isReadable(0)) << "the machine was too slow to tell";
+
+    EXPECT_EQ(client.receive()->id, 99U);
+    for (Session& sender : senders) {
+        EXPECT_TRUE(sender.send(all.substr(taken[&sender == &senders.back()])));
+        for (std::size_t i = 0; i < kRequests; ++i) {
+            ASSERT_THAT(sender.receive(), IsDone());
+        }
+    }
+    EXPECT_EQ(service.countEvents("\"k\":"), 2 * 2 * kRequests);
+}
+
+INSTANTIATE_TEST_SUITE_P(Hostile, WaitingRequests,
+                         testing::Values(Bound{"waiting_requests", 20}, Bound{"waiting_bytes", 200'000},
+                                         Bound{"waiting_bytes_of_user", 200'000}),
+                         [](const auto& test) { return test.param.first; });
+
+class RetainedBytes : public Hostile, public testing::WithParamInterface<Bound> {};
+
+TEST_P(RetainedBytes, LetGoOfTheLargestSessionsOldestMessages) {
+    ServiceProcess& service = start("\"" + GetParam().first + "\": " + std::to_string(GetParam().second));
+    Session client(service.socketPath(), 7, 11);
+    client.start(8, 11);
+    constexpr std::size_t kMessages = 2'000;
+    const std::string text(1'000, 'x');
+    for (const auto& [id, count] : {std::pair(8, std::size_t{50}), {7, kMessages}}) {
+        ASSERT_TRUE(callAll(client, messages(count, [&](std::size_t i) {
+                                return message({{"n", 10'000 + i}, {"text", text}}, {id});
+                            })));
+    }
+    EXPECT_TRUE(client.stop(8) && client.stop(7));
+    EXPECT_EQ(service.countEvents("\"n\":"), 2 * (kMessages + 50));
+    EXPECT_EQ(countOf(GetParam().first + " is reached", service.errorOutput()), 1U);
+    const auto retained = [&service](const std::string& id) {
+        return run("cat " + (service.logs() / "DiagnosticLogs/Audio/Reporting/*-").string() + id + "-*")
+            .output;
+    };
+    const std::string all = retained("7");
+    EXPECT_EQ(countOf("\"n\":", retained("8")), 50U);
+    EXPECT_EQ(countOf("\"n\": 10000,", all), 0U);
+    EXPECT_EQ(countOf("\"n\": 11999,", all), 1U);
+    // The record of its start went, too.
+    const std::size_t letGo = kMessages - countOf("\"n\":", all);
+    EXPECT_GT(letGo, kMessages / 4);
+    std::string told;
+    while (told.find("let go") == told.npos && !(told = service.told()).empty()) {
+    }
+    EXPECT_THAT(told, testing::HasSubstr(", " + std::to_string(letGo + 1) + " retained records let go"));
     if (kMemoryIsThatOfTheService) {
         EXPECT_LT(peakBytes(), 16U << 20U);
     }
+}
+
+INSTANTIATE_TEST_SUITE_P(Hostile, RetainedBytes,
+                         testing::Values(Bound{"retained_bytes_of_user", 1'000'000},
+                                         Bound{"retained_bytes", 1'000'000}),
+                         [](const auto& test) { return test.param.first; });
+
+TEST_F(Hostile, KeysBeyondThoseThatAreRememberedAreRecordedAllTheSame) {
+    ServiceProcess& service = start("\"previous_keys_of_session\": 100");
+    Session client(service.socketPath());
+    ASSERT_TRUE(callAll(client, messages(300, [](std::size_t i) {
+                            return message({{"key" + std::to_string(i), 1}});
+                        })));
+    EXPECT_EQ(service.countEvents("\"key"), 2 * 300U);
+    EXPECT_EQ(countOf("more than 100 different keys", service.errorOutput()), 1U);
+    // What the next run is told to have been before.
+    EXPECT_THAT(client.call(message({{"active_devices", "late"}})), IsDone());
+    EXPECT_TRUE(client.stop());
+    client.start(7);
+    EXPECT_THAT(
+        client.call(message(
+            {{"session_output_running", true}, {"QVSessionVolume", 1}, {"zrreporting_timestamp", 4e9}})),
+        IsDone());
+    EXPECT_THAT(client.call(message({{"session_duration", 90}, {"zrreporting_timestamp", 4e9 + 90}})),
+                IsDone());
+    EXPECT_TRUE(client.stop());
+    EXPECT_EQ(service.countEvents("Volume.Summary"), 2U);
+    EXPECT_EQ(service.countEvents("\"active_devices\":\"unknown\""), 2U);
+}
+
+TEST_F(Hostile, ReportsAreKeptWithinAgeNumberAndBytes) {
+    ServiceProcess& service = start("\"report_files\": 3, \"report_bytes\": 40000");
+    const auto reports = service.logs() / "DiagnosticLogs/Audio/Reporting";
+    const auto old = reports / "20200101-120000+0000-1-app-test.json";
+    writeFile(old, "[]");
+    writeFile(reports / "notes.json", "somebody's");
+    std::filesystem::last_write_time(old,
+                                     std::filesystem::file_time_type::clock::now() - std::chrono::days(15));
+    Session client(service.socketPath());
+    for (std::int64_t id = 1; id <= 8; ++id) {
+        client.start(id, 11);
+        EXPECT_THAT(client.call(message({{"text", std::string(id <= 4 ? 10 : 15'000, 'x')}}, {id})),
+                    IsDone());
+        EXPECT_TRUE(client.stop(id));
+        EXPECT_EQ(entriesOf(reports), 1 + std::min<std::ptrdiff_t>(id, id <= 6 ? 3 : 2)) << id;
+        EXPECT_EQ(run("ls " + (reports / ("*-" + std::to_string(id) + "-*")).string()).status, 0) << id;
+    }
+    EXPECT_FALSE(std::filesystem::exists(old));
+    EXPECT_EQ(contentOf(reports / "notes.json"), "somebody's");
 }
 
 } // namespace

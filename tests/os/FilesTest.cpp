@@ -1,5 +1,4 @@
 #include "os/DirectoryWatcher.h"
-#include "os/LocalAddress.h"
 #include "os/PreferenceFile.h"
 #include "os/SmallFile.h"
 #include "tests/platform/LinuxServiceSupport.h"
@@ -45,12 +44,6 @@ TEST(SmallFile, IsReadUpToItsLimitAndOnlyWhenItIsRegular) {
     EXPECT_EQ(SmallFile::read(directory.path("link"), 10'000).text.size(), 10'000U);
     EXPECT_EQ(SmallFile::read(directory.path("link"), 10'000, SmallFile::Links::refused).error, ELOOP);
     EXPECT_EQ((SmallFile{.text = " a b\r\n"}).trimmed(), "a b");
-}
-
-TEST(LocalAddress, HoldsWhatTheSystemTakes) {
-    EXPECT_FALSE(LocalAddress::of(""));
-    EXPECT_TRUE(LocalAddress::of(std::string(107, 'x')));
-    EXPECT_FALSE(LocalAddress::of(std::string(108, 'x')));
 }
 
 class DirectoryWatcherTest : public testing::Test {

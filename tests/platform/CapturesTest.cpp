@@ -238,16 +238,7 @@ TEST_F(BugCaptureServiceTest, RequestsOutsideTheLimitsMakeNoLine) {
     }
     EXPECT_THAT(replies, IsEmpty());
     EXPECT_TRUE(reporter->startSession(signature, 3600s, keep));
-    for (std::uint64_t more = 1; more < DailyAllowance::kCapturesADay; ++more) {
-        EXPECT_TRUE(reporter->snapshot(signature, 0s, {}, keep));
-    }
-    gather();
-    makeService(); // a restart begins no new day
-    EXPECT_TRUE(reporter->snapshot(signature, 0s, {}, keep));
-    EXPECT_EQ(replies.back(), (Dictionary{{glarn::kReplySuccess, false},
-                                          {glarn::kReplyReason, int{kGlarnErrorDailyLimitExceeded}}}));
-    gather();
-    EXPECT_THAT(lines(), SizeIs(21)) << "one of them for the session that the service's end has cancelled";
+    EXPECT_THAT(replies, SizeIs(1));
 }
 
 class StackCaptureTest : public CapturesTest {

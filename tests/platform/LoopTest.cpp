@@ -97,24 +97,6 @@ TEST(SerialQueue, WorkThatMayBlockLeavesThePosterAndTakesWhatFollowsAlong) {
     }
 }
 
-TEST(SerialQueue, ManyQueuesShareFewThreadsThatGrowWhileWorkBlocks) {
-    LinuxWorkQueues queues;
-    std::latch allBlock(8);
-    std::atomic<int> ran{0};
-    for (int i = 0; i < 10'000; ++i) {
-        queues.makeSerialQueue("one of many")->post([&, isBlocking = i < 8] {
-            if (isBlocking) {
-                allBlock.arrive_and_wait();
-            }
-            ++ran;
-        });
-    }
-    const std::filesystem::directory_iterator threads("/proc/self/task");
-    EXPECT_LE(std::distance(threads, {}), static_cast<std::ptrdiff_t>(ThreadPool::kMaximumThreads) + 4);
-    queues.workOff();
-    EXPECT_EQ(ran, 10'000);
-}
-
 TEST(SerialQueue, WhatWasPostedRunsAfterItIsDestroyed) {
     std::atomic<int> ran{0};
     {
@@ -226,15 +208,13 @@ int refusingControl(int epoll, int operation, int descriptor, epoll_event* event
     return ::epoll_ctl(epoll, operation, descriptor, event);
 }
 
-/// Accepts everybody and notes what becomes of them, on the loop's thread.
 struct Delegate final : ListenerDelegate {
     bool shouldAcceptNewConnection(ClientConnection& connection) override {
-        connection.setInterruptionHandler([this] { trace += "interrupted "; });
-        connection.setInvalidationHandler([this] { trace += "invalidated "; });
+        connection.setInvalidationHandler([this] { ++ended; });
         connection.resume();
         return true;
     }
-    std::string trace;
+    std::atomic<int> ended{0};
 };
 
 TEST(ConnectionService, EndsAClientWhoseSocketCannotBeWatchedAndServesTheOthers) {
@@ -269,7 +249,7 @@ TEST(ConnectionService, EndsAClientWhoseSocketCannotBeWatchedAndServesTheOthers)
         loop.stop();
     });
     thread.join();
-    EXPECT_EQ(delegate.trace, "interrupted invalidated ");
+    EXPECT_EQ(delegate.ended, 1);
     EXPECT_THAT(log.take(), ElementsAre("3 zrrs accepting connections rests: No space left on device",
                                         "3 zrrs accepting connections again",
                                         HasSubstr("since its socket cannot be watched: No space left on")));

@@ -1,5 +1,6 @@
 #pragma once
 
+#include "os/FileDescriptor.h"
 #include "tests/Files.h"
 #include "tests/Sockets.h"
 #include "wire/FrameSplitter.h"
@@ -102,20 +103,27 @@ public:
 
     /// Starts it (again), in the same directories.
     void start() {
-        // On which the service says that it is ready, as it would to a service manager.
-        std::filesystem::remove(directory_.path("ready"));
-        pollfd ready{.fd = boundSocket(SOCK_DGRAM, directory_.path("ready")), .events = POLLIN, .revents = 0};
+        // On which the service says how it is, as it would to a service manager.
+        std::filesystem::remove(directory_.path("manager"));
+        manager_ = FileDescriptor(boundSocket(SOCK_DGRAM, directory_.path("manager")));
         pid_ = ::fork();
         if (pid_ == 0) {
             prepareChild();
             ::execl(TAMBLOD_PATH, "tamblod", nullptr);
             ::_exit(127);
         }
-        const bool isReady = !options_.awaitsReady || ::poll(&ready, 1, kPatience.count()) == 1;
-        ::close(ready.fd);
-        if (!isReady) {
+        if (options_.awaitsReady && told() != "READY=1") {
             throw std::runtime_error("tamblod does not get ready: " + errorOutput());
         }
+    }
+    /// The next of what it says to its service manager, waiting at most some seconds.
+    [[nodiscard]] std::string told() const {
+        pollfd ready{.fd = manager_.get(), .events = POLLIN, .revents = 0};
+        char text[256] = {};
+        return ::poll(&ready, 1, kPatience.count()) == 1 &&
+                       ::recv(manager_.get(), text, sizeof text - 1, 0) > 0
+                   ? text
+                   : "";
     }
     /// Nothing to a service that has ended.
     void signal(int number) const {
@@ -180,7 +188,7 @@ private:
         ::setenv("RUNTIME_DIRECTORY", runtimeDirectory().c_str(), 1);
         ::setenv("CONFIGURATION_DIRECTORY", directory_.path("config").c_str(), 1);
         ::setenv("LOGS_DIRECTORY", logs().c_str(), 1);
-        ::setenv("NOTIFY_SOCKET", directory_.path("ready").c_str(), 1);
+        ::setenv("NOTIFY_SOCKET", directory_.path("manager").c_str(), 1);
         ::unsetenv("TAMBLO_LOG");
         for (const auto& [name, value] : options_.environment) {
             ::setenv(name.c_str(), value.c_str(), 1);
@@ -193,6 +201,7 @@ private:
 
     const TemporaryDirectory directory_;
     const Options options_;
+    FileDescriptor manager_;
     pid_t pid_ = -1;
 };
 
@@ -255,23 +264,28 @@ public:
         pollfd descriptor{.fd = socket_, .events = POLLIN, .revents = 0};
         return ::poll(&descriptor, 1, milliseconds) == 1;
     }
-    /// The next reply, waiting at most some seconds; nothing at the end of the connection.
-    std::optional<wire::Reply> receive() {
+    /// The next frame, waiting at most some seconds; empty at the end of the connection.
+    std::vector<std::uint8_t> receiveFrame() {
         for (;;) {
             wire::FrameSplitter frames(received_);
-            if (const auto item = frames.next()) {
-                auto reply = wire::decodeReply(*item);
-                received_.erase(received_.begin(),
-                                received_.end() - static_cast<std::ptrdiff_t>(frames.rest().size()));
-                return reply;
+            if (frames.next()) {
+                const auto end = received_.end() - static_cast<std::ptrdiff_t>(frames.rest().size());
+                std::vector<std::uint8_t> frame(received_.begin(), end);
+                received_.erase(received_.begin(), end);
+                return frame;
             }
             std::array<std::uint8_t, 65536> bytes;
             const ssize_t count = isReadable(20'000) ? ::recv(socket_, bytes.data(), bytes.size(), 0) : 0;
             if (count <= 0) {
-                return std::nullopt;
+                return {};
             }
             received_.insert(received_.end(), bytes.begin(), bytes.begin() + count);
         }
+    }
+    /// What it says; nothing at the end of the connection.
+    std::optional<wire::Reply> receive() {
+        const std::vector<std::uint8_t> frame = receiveFrame();
+        return frame.empty() ? std::nullopt : wire::decodeReply(std::span(frame).subspan(wire::kLengthBytes));
     }
     /// The number of replies to the end of the connection.
     std::size_t receiveAll() {

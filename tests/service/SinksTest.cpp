@@ -192,6 +192,28 @@ TEST_F(Sinks, WhatASessionLeavesIsThereWhenItsStopIsAnswered) {
                          R"(,.*"name":"memory .bytes.","pid":)" + me}});
 }
 
+TEST_F(Sinks, AFullDiskCostsTheLinesOfItsTimeAndNothingElse) {
+    constexpr std::size_t kMessages = 210;
+    ServiceProcess service({.environment = {{"TAMBLO_LOG", "error"}}});
+    service.limit(RLIMIT_FSIZE, 20'000);
+    Session client(service.socketPath());
+    for (std::size_t i = 0; i < kMessages; ++i) {
+        if (i == kMessages - 10) {
+            service.limit(RLIMIT_FSIZE, RLIM_INFINITY);
+        }
+        const auto reply = client.call(message({{"n", 1000 + i}}));
+        ASSERT_TRUE(reply && !reply->error);
+    }
+    const auto lines = linesOf(service.logs() / "analytics-events.jsonl");
+    EXPECT_TRUE(std::ranges::all_of(lines, [](auto& line) { return nlohmann::json::accept(line); }));
+    EXPECT_THAT(lines.back(), HasSubstr("\"n\":1209"));
+    const std::string lost = std::to_string(2 * kMessages - service.countEvents("\"n\":1"));
+    for (const std::string& line :
+         {std::string("cannot write: "), "it can be written again; " + lost + " records were lost\n"}) {
+        EXPECT_EQ(countOf("analytics-events.jsonl: " + line, service.errorOutput()), 1U) << line;
+    }
+}
+
 TEST_F(Sinks, ASessionIsToldWhatItsTimeHasAddedToTheDrivers) {
     ServiceProcess service;
     const auto publish = [&](const std::string& count) {

@@ -29,26 +29,18 @@ std::string named(std::initializer_list<Number> numbers, Name name) {
 }
 
 TEST(VocabularyTest, NamesOfNumbers) {
-    EXPECT_EQ(named<AudioEventCategory>({0, 1, 2, 3, 4, 5, 6, 7, 8, 9, 10, 11, 12, 13, 14, 15, 16, 17, 18},
-                                        ZRReportingUtilityCategoryString),
-              "Undefined Generic Record Input Playback Output PlaybackAndRecord IO Setup ClientRequest "
-              "RouteChange Error Chanlog Performance Volume Kaleen HearingHealth Wirrels Undefined ");
-    EXPECT_EQ(named<AudioEventCategory>({0xFFFF, 0xFFFFFFFF, 0x04000006, 0x08000004, 0x10000003, 0x2000000B,
-                                         0x40000010, 0x80000011, 0x00030001, 0x0C000001, 0x0800FFFF},
-                                        ZRReportingUtilityCategoryString),
-              "Undefined Undefined MIDI_PlaybackAndRecord Session_Playback DSP_Input HAL_Error "
-              "Routing_HearingHealth Toolbox_Wirrels _Generic _Generic Session_Undefined ");
-    EXPECT_EQ(named<AudioEventType>(
-                  {0, 1, 2, 3, 4, 5, 6, 7, 8, 9, 10, 11, 12, 13, 14, 15, 16, 17, 18, 19, 20, 65534, 65535},
-                  ZRReportingUtilityTypeString),
-              "Generic Start Stop Activate Deactivate Setup Error IssueDetector Joulery AudioUnitUsage "
-              "MIDIDriver Summary HeadphoneAudioExposure AudioExposure Listeningenhancement Pulsedeck Simple "
-              "Histogram State MemoryLog Generic Generic Unknown ");
     EXPECT_EQ(
-        named<AudioServiceType>({0, 1, 2, 3, 4, 5, 6, 7, 8, 9, 10, 11, 12, 13, 14, 65535},
-                                ZRReportingUtilityGenerateServiceNameFromServiceType),
-        "generic velka telephony haptics alarms standalone soundautoconfig longformaudio nonlongformaudio "
-        "audiodeviceusage alerts test apiusage systemsounds unknown unknown ");
+        named<AudioEventCategory>({0, 1, 17, 18, 0xFFFF, 0xFFFFFFFF, 0x04000006, 0x08000004, 0x10000003,
+                                   0x2000000B, 0x40000010, 0x80000011, 0x00030001, 0x0C000001, 0x0800FFFF},
+                                  ZRReportingUtilityCategoryString),
+        "Undefined Generic Wirrels Undefined Undefined Undefined MIDI_PlaybackAndRecord Session_Playback "
+        "DSP_Input HAL_Error "
+        "Routing_HearingHealth Toolbox_Wirrels _Generic _Generic Session_Undefined ");
+    EXPECT_EQ(named<AudioEventType>({0, 19, 20, 65534, 65535}, ZRReportingUtilityTypeString),
+              "Generic MemoryLog Generic Generic Unknown ");
+    EXPECT_EQ(
+        named<AudioServiceType>({0, 13, 14, 65535}, ZRReportingUtilityGenerateServiceNameFromServiceType),
+        "generic systemsounds unknown unknown ");
 }
 
 TEST(VocabularyTest, NumbersOfNames) {

@@ -24,7 +24,7 @@ class CaptureWorkersTest : public WorkerTest {
 protected:
     using Worker = ZRReportingSessionDPWorker;
     CaptureWorkersTest() : WorkerTest(LogLevel::debug, true) {
-        device.deviceProperties.set("HapticLeakCapture", true);
+        device.deviceProperties.properties["HapticLeakCapture"] = true;
         prefer("TalvixInvalidXyBackOffSeconds", "60.5 s");
         prefer("enable_stackburst", "YES");
     }

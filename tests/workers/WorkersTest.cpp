@@ -72,10 +72,10 @@ TEST_F(WorkersTest, AnalyticsEventsHaveAGeneralNameAndOneOfTheService) {
         session->setServiceType(service);
         worker->handleMessage(messageOf({}, category, type));
         std::string names;
-        for (const auto& event : device.analyticsEvents.events()) {
+        for (const auto& event : device.analyticsEvents.events) {
             names += event.name.substr(event.name.find("com.vandra.") + 11) + " ";
         }
-        device.analyticsEvents.clear();
+        device.analyticsEvents.events.clear();
         return names;
     };
     for (int i = 0; i < 2; ++i) { // the names are remembered
