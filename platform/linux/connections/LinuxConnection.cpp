@@ -239,7 +239,7 @@ void LinuxConnection::countUnfinished() {
 
 void LinuxConnection::endUnfinished() {
     endBeyond({std::string(kLimitErrorDomain), kLimitErrorCode,
-               formatted("frame_seconds: a frame made no progress for {}", shared_.limits.frameSeconds)});
+               formatted("frame_seconds: a frame made no progress for {} s", shared_.limits.frameSeconds)});
 }
 
 std::size_t LinuxConnection::decodeAndDispatch(std::span<const std::uint8_t> item) {
@@ -249,9 +249,7 @@ std::size_t LinuxConnection::decodeAndDispatch(std::span<const std::uint8_t> ite
     }
     wire::Request& request = shared_.intake.request();
     if (request.method == wire::Method::killService && !mayKillService(peer_.user)) {
-        refuse({.id = request.id.value_or(0),
-                .error = {std::string(wire::kProtocolErrorDomain), wire::kLimitReached,
-                          "killService is for root and the service's own user"}});
+        refuseKill(request.id.value_or(0));
         return 0;
     }
     const std::size_t bytes = kRequestBytes + request.decodedBytes;
@@ -259,12 +257,25 @@ std::size_t LinuxConnection::decodeAndDispatch(std::span<const std::uint8_t> ite
     return bytes;
 }
 
-void LinuxConnection::refuse(const wire::Refusal& refusal) {
-    {
-        const MutexLock lock(mutex_);
-        wire::appendErrorReply(outgoing_, refusal.id, refusal.error);
-        send();
+void LinuxConnection::sendError(std::uint64_t id, const wire::Error& error) {
+    const MutexLock lock(mutex_);
+    wire::appendErrorReply(outgoing_, id, error);
+    send();
+}
+
+void LinuxConnection::refuseKill(std::uint64_t id) {
+    // The code is that of a limit, but none is reached.
+    sendError(id, {std::string(wire::kProtocolErrorDomain), wire::kLimitReached,
+                   "killService is for root and the service's own user"});
+    if (!std::exchange(isKillNoted_, true)) {
+        shared_.log.reportOfClient(LogLevel::error, "zrrs",
+                                   "a client may not end the service, and tried to. pid={} uid={}",
+                                   peer_.process, peer_.user);
     }
+}
+
+void LinuxConnection::refuse(const wire::Refusal& refusal) {
+    sendError(refusal.id, refusal.error);
     if (refusal.error.code == wire::kLimitReached) {
         noteLimit(refusal.error.message);
     }

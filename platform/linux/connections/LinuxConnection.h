@@ -141,7 +141,9 @@ private:
     void countUnfinished() TAMBLO_EXCLUDES(mutex_);
     /// Answers the bytes that the decoded request takes while it waits; 0 for a refused one.
     [[nodiscard]] std::size_t decodeAndDispatch(std::span<const std::uint8_t> item) TAMBLO_EXCLUDES(mutex_);
+    void sendError(std::uint64_t id, const wire::Error& error) TAMBLO_EXCLUDES(mutex_);
     void refuse(const wire::Refusal& refusal) TAMBLO_EXCLUDES(mutex_);
+    void refuseKill(std::uint64_t id) TAMBLO_EXCLUDES(mutex_);
     /// Ends the connection with an error frame that names the limit.
     void endBeyond(const ReplyError& limit) TAMBLO_EXCLUDES(mutex_);
     [[nodiscard]] bool isHeldBack() TAMBLO_EXCLUDES(mutex_);
@@ -177,7 +179,8 @@ private:
     std::size_t unfinishedCounted_ = 0; ///< with the user
     UnfinishedFrames::Place unfinishedPlace_;
     Ending ending_ = Ending::none;
-    bool isReadable_ = false; ///< listed for its turn
+    bool isReadable_ = false;  ///< listed for its turn
+    bool isKillNoted_ = false; ///< in the log
 
     std::atomic<bool> isLimitNoted_{false};
     std::atomic<std::size_t> waitingRequests_{0};
