@@ -30,10 +30,9 @@ namespace tamblo {
 /// One reporter's session: its identity, service type and configuration, the messages accepted since its
 /// start, and one worker of each applicable class.
 ///
-/// Owned by a client instance, or by `LeavingClients` once the client has left; the single-message session by
-/// its keeper. Created (the start-on-init workers run) → started (all workers run) → stopped (messages
-/// emptied, workers kept) → started again …; letting it go stops nothing. Used on the reporting server queue
-/// alone.
+/// Owned by a client instance; the single-message session by its keeper. Created (the start-on-init workers
+/// run) → started (all workers run) → stopped (messages emptied, workers kept) → started again …; letting it
+/// go stops nothing. Used on the reporting server queue alone.
 class ZRReportingSession : public std::enable_shared_from_this<ZRReportingSession> {
     struct Created {
         explicit Created() = default;
@@ -49,7 +48,7 @@ public:
     ZRReportingSession(const ZRReportingSession&) = delete;
     ZRReportingSession& operator=(const ZRReportingSession&) = delete;
 
-    /// Nothing here asks for them yet.
+    /// The rows of all worker classes, whether or not a session may have one.
     [[nodiscard]] static std::span<const WorkerClass> getAllWorkerClasses() { return workerClassList(); }
 
     void setServiceType(AudioServiceType serviceType);
@@ -67,8 +66,9 @@ public:
     /// the end. A message that comes between two parts of a stop waits for the stop's end, unless too much
     /// waits already: then the reply says so, and the message is lost.
     void sendMessage(const MessageRef& message, ErrorReply reply = {});
-    /// Keeps back the reply of the message that is being handled, for a worker that has something to do for
-    /// it on another queue: until what this returns, and whatever else it returned for the message, is gone.
+    /// For a worker that has to do something for the message at hand on another queue: keeps back the
+    /// message's reply until the worker lets go of the token that this returns. Each call for one message
+    /// returns the same token.
     [[nodiscard]] std::shared_ptr<const void> holdReply();
     void stop();
     /// Does the next part of the stop, some milliseconds of it, and answers whether the session is stopped
@@ -110,7 +110,7 @@ public:
     /// Lets go of the oldest messages that have about so many bytes, and of the previous values where no
     /// message is left. The bytes that are free then. Not while the session is stopping.
     std::size_t letGoOfOldest(std::size_t bytes, std::string_view limit);
-    /// Nothing here asks for it yet.
+    /// How many workers the session has made, started or not.
     [[nodiscard]] std::size_t workerInstanceCount() const noexcept { return messageWorkers_.size(); }
     [[nodiscard]] std::string description() const;
 

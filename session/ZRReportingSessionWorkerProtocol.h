@@ -24,7 +24,8 @@ public:
 
     /// Null once the session is gone.
     [[nodiscard]] std::shared_ptr<ZRReportingSession> session() const noexcept { return session_.lock(); }
-    /// Nothing here calls it yet: a worker is made for its session.
+    /// Gives the worker to another session. Sessions make their workers for themselves and have no need of
+    /// it.
     void setSession(std::weak_ptr<ZRReportingSession> session) noexcept { session_ = std::move(session); }
     /// Set by the session alone, after `start` and `stop`.
     [[nodiscard]] bool started() const noexcept { return started_; }
