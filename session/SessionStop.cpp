@@ -1,16 +1,12 @@
 #include "session/SessionStop.h"
 
 #include "session/BlockingWork.h"
-
 #include "session/ZRReportingSession.h"
 #include "util/Log.h"
 #include "util/TraceEvents.h"
 
 #include <algorithm>
 #include <cstddef>
-#include <cstdint>
-#include <string>
-#include <string_view>
 #include <utility>
 #include <vector>
 
