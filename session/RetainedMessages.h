@@ -19,9 +19,9 @@ class ZRReportingSession;
 /// A session may last for days, and nobody is to lose a report for that; but its messages are memory. So each
 /// user has a budget of bytes, and all of them have one together. Beyond the first, the oldest messages of
 /// the user's largest sessions are let go, beyond the second, those of the user who has most; enough of them
-/// that it is worth the search for them. A session that is stopping keeps what it has. Let go means: they
-/// have reached their sinks, but what the stop derives begins later. One for all sessions, on the reporting
-/// server queue.
+/// that it is worth the search for them. A session that is stopping keeps what it has. A message that is let
+/// go has reached its sinks, but what is derived at the stop is derived without it. One for all sessions, on
+/// the reporting server queue.
 class RetainedMessages {
     struct Account;
 
