@@ -28,12 +28,12 @@ namespace {
 constexpr std::size_t kKeptCapacity = 64 * 1024;
 /// What a request takes while it waits, besides its values.
 constexpr std::size_t kRequestBytes = 256;
-/// A piece of the server queue ends once a client has more replies to get than this part of what its socket
-/// may refuse.
+// Parts of the limit of what a connection's socket may refuse (`reply_bytes`, 4 MiB by default).
+/// A piece of the server queue ends once a client has more replies to get than this: 256 KiB.
 constexpr std::size_t kPartOfPiece = 16;
-/// A client's requests wait while its socket has refused more than this part of what it may; a smaller one,
-/// where the user's connections have brought together half of the user's limit.
+/// A client's requests wait while its socket has refused more than this: 1 MiB.
 constexpr std::size_t kUnreadPart = 4;
+/// The same once the sockets of the user have refused half of the user's limit together: 64 KiB.
 constexpr std::size_t kUnreadPartOfMany = 64;
 /// A peer that takes nothing for so long does not read.
 constexpr std::chrono::seconds kPatienceWithPeer{1};
@@ -118,7 +118,7 @@ void LinuxConnection::read() {
 }
 
 void LinuxConnection::readOnce() {
-    if (ending_ != Ending::none || isHeldBack()) {
+    if (ending_ != Ending::none || holdBackIfFlooded()) {
         return;
     }
     int socket = -1;
@@ -139,8 +139,9 @@ void LinuxConnection::readOnce() {
     }
 }
 
-/// Whether what waits has to be carried out first; the loop then hears nothing of the socket until it is.
-bool LinuxConnection::isHeldBack() {
+/// Where what waits has to be carried out first, the loop hears nothing of the socket until it is. Whether
+/// so.
+bool LinuxConnection::holdBackIfFlooded() {
     const Limits& limits = shared_.limits;
     const MutexLock lock(mutex_);
     bool isHeld = waitingRequests_ > limits.waitingRequests || waitingBytes_ > limits.waitingBytes;
@@ -489,13 +490,13 @@ void LinuxConnection::beginEnd(Ending ending) {
     // What was read before is carried out, and answered, first. Replies go at the end of a batch, so the end
     // of the connection waits for the batch after the one that carries out the last request.
     requests_->post([self = shared_from_this()]() mutable {
-        SerialQueue& queue = self->shared_.intake.queue();
+        SerialQueue& queue = self->shared_.intake.serverQueue();
         queue.post([self = std::move(self)] { self->shared_.loop.post([self] { self->end(); }); });
     });
 }
 
-/// Whether the peer, which sends no more, is still to take replies.
-bool LinuxConnection::waitsForPeer() {
+/// Waits for a peer that sends no more and is still to take replies. Whether it is.
+bool LinuxConnection::beginWaitForPeer() {
     const MutexLock lock(mutex_);
     isWaitingForPeer_ = ending_ == Ending::orderly && unsent() != 0 && !isUnwritable_ && !isPatienceOver_;
     return isWaitingForPeer_;
@@ -506,7 +507,7 @@ void LinuxConnection::end() {
         return;
     }
     const LogOrigin origin(peer_);
-    if (waitsForPeer()) {
+    if (beginWaitForPeer()) {
         shared_.loop.callAfter(kPatienceWithPeer, [self = shared_from_this()] {
             {
                 const MutexLock lock(self->mutex_);

@@ -2,6 +2,7 @@
 
 #include "base/Mutex.h"
 #include "base/TextBuffer.h"
+#include "base/UniqueFunction.h"
 #include "os/FileDescriptor.h"
 #include "platform/ConnectionService.h"
 #include "platform/Limits.h"
@@ -15,6 +16,7 @@
 #include "platform/linux/loop/EventLoop.h"
 
 #include <atomic>
+#include <chrono>
 #include <cstddef>
 #include <cstdint>
 #include <memory>
@@ -146,12 +148,12 @@ private:
     void refuseKill(std::uint64_t id) TAMBLO_EXCLUDES(mutex_);
     /// Ends the connection with an error frame that names the limit.
     void endBeyond(const ReplyError& limit) TAMBLO_EXCLUDES(mutex_);
-    [[nodiscard]] bool isHeldBack() TAMBLO_EXCLUDES(mutex_);
+    [[nodiscard]] bool holdBackIfFlooded() TAMBLO_EXCLUDES(mutex_);
     void carriedOut(std::size_t requests, std::size_t bytes) TAMBLO_EXCLUDES(mutex_);
     void readOn() TAMBLO_EXCLUDES(mutex_);
     void beginEnd(Ending ending) TAMBLO_EXCLUDES(mutex_);
     void end() TAMBLO_EXCLUDES(mutex_);
-    [[nodiscard]] bool waitsForPeer() TAMBLO_EXCLUDES(mutex_);
+    [[nodiscard]] bool beginWaitForPeer() TAMBLO_EXCLUDES(mutex_);
     void replied() TAMBLO_REQUIRES(mutex_);
     void send() TAMBLO_REQUIRES(mutex_);
     [[nodiscard]] std::size_t unsent() const TAMBLO_REQUIRES(mutex_) { return outgoing_.size() - sent_; }
