@@ -26,7 +26,7 @@ Seconds SegmentStart::until(const Value* timestamp) const noexcept {
     return Seconds(secondsOf(timestamp) - secondsOf(timestamp_));
 }
 
-bool differAsTexts(const Value* left, const Value* right) noexcept {
+bool settingsDiffer(const Value* left, const Value* right) noexcept {
     if (left == nullptr || right == nullptr) {
         return false;
     }

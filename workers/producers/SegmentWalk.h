@@ -14,7 +14,6 @@
 #include <memory>
 #include <optional>
 #include <span>
-#include <string>
 #include <string_view>
 #include <utility>
 #include <vector>
@@ -47,8 +46,10 @@ private:
     const Value* timestamp_ = nullptr;
 };
 
-/// Wherever two values are compared, one that is absent is unchanged.
-[[nodiscard]] bool differAsTexts(const Value* left, const Value* right) noexcept;
+// Wherever two values are compared, one that is absent is unchanged.
+/// Two numbers are compared as numbers, a number with a text as it is written, anything else as texts.
+[[nodiscard]] bool settingsDiffer(const Value* left, const Value* right) noexcept;
+/// Anything but a number by the number that it reads as.
 [[nodiscard]] bool differAsNumbers(const Value* left, const Value* right) noexcept;
 
 /// A length of time as summaries carry it, in single precision.

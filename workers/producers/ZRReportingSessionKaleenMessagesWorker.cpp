@@ -73,8 +73,8 @@ bool watchedFieldChangeInMessage(const Fields& message, const Fields& previous) 
     };
     return differ(Field::running, &Value::boolValue) || differ(Field::group, &Value::integerValue) ||
            differ(Field::channels, &Value::integerValue) ||
-           differAsTexts(message[Field::formatID], previous[Field::formatID]) ||
-           differAsTexts(message[Field::devices], previous[Field::devices]);
+           settingsDiffer(message[Field::formatID], previous[Field::formatID]) ||
+           settingsDiffer(message[Field::devices], previous[Field::devices]);
 }
 
 /// One walk over a session's messages.

@@ -110,8 +110,8 @@ private:
     }
 
     [[nodiscard]] bool isSettingChanged(const Fields& message) const {
-        return differAsTexts(message[Field::format], state_[Field::format]) ||
-               differAsTexts(message[Field::devices], state_[Field::devices]) ||
+        return settingsDiffer(message[Field::format], state_[Field::format]) ||
+               settingsDiffer(message[Field::devices], state_[Field::devices]) ||
                differAsNumbers(message[Field::spatialized], state_[Field::spatialized]) ||
                differAsNumbers(message[Field::ringer], state_[Field::ringer]) ||
                differAsNumbers(message[Field::volume], state_[Field::volume]);
