@@ -80,10 +80,10 @@ struct ZRReportingClientServerInstance::Sending {
 };
 
 ZRReportingClientServerInstance::ZRReportingClientServerInstance(
-    Context& context, Origin origin, std::shared_ptr<RequestQueue> requests,
+    Context& context, Acceptance acceptance, std::shared_ptr<RequestQueue> requests,
     std::weak_ptr<ZRReportingServiceDelegateProtocol> delegate)
     : context_(context),
-      origin_(std::move(origin)),
+      acceptance_(std::move(acceptance)),
       requests_(std::move(requests)),
       delegate_(std::move(delegate)) {
     log::standard(ZRReportingServiceDelegateCategory(), "new client with pid {}", processIdentifier());

@@ -37,14 +37,15 @@ public:
     using SessionMap = std::map<ReporterID, SessionRef>;
 
     /// What is known of a client when it connects.
-    struct Origin {
+    struct Acceptance {
         ClientIdentity identity;
-        std::uint64_t acceptanceOrder; ///< the client's place in the order of acceptance, from 1
+        std::uint64_t order; ///< the client's place in the order of acceptance, from 1
         WallTime startDate;
         std::optional<std::string> processName;
     };
 
-    ZRReportingClientServerInstance(Context& context, Origin origin, std::shared_ptr<RequestQueue> requests,
+    ZRReportingClientServerInstance(Context& context, Acceptance acceptance,
+                                    std::shared_ptr<RequestQueue> requests,
                                     std::weak_ptr<ZRReportingServiceDelegateProtocol> delegate);
     ~ZRReportingClientServerInstance() override;
     ZRReportingClientServerInstance(const ZRReportingClientServerInstance&) = delete;
@@ -71,18 +72,18 @@ public:
 
     [[nodiscard]] SessionRef findReportingSessionForID(ReporterID reporterID, bool acrossAllClients) const;
 
-    [[nodiscard]] pid_t processIdentifier() const noexcept { return origin_.identity.process; }
-    [[nodiscard]] uid_t user() const noexcept { return origin_.identity.user; }
+    [[nodiscard]] pid_t processIdentifier() const noexcept { return acceptance_.identity.process; }
+    [[nodiscard]] uid_t user() const noexcept { return acceptance_.identity.user; }
     [[nodiscard]] const SessionMap& clientReportingSessionMap() const noexcept {
         return clientReportingSessionMap_;
     }
-    [[nodiscard]] std::optional<WallTime> clientStartDate() const noexcept { return origin_.startDate; }
+    [[nodiscard]] std::optional<WallTime> clientStartDate() const noexcept { return acceptance_.startDate; }
     [[nodiscard]] const std::optional<std::string>& clientProcessName() const noexcept {
-        return origin_.processName;
+        return acceptance_.processName;
     }
     /// True for the first caller alone, who then reports how long the client was there.
     [[nodiscard]] bool claimUptimeReport() noexcept { return !std::exchange(isUptimeReported_, true); }
-    [[nodiscard]] std::uint64_t acceptanceOrder() const noexcept { return origin_.acceptanceOrder; }
+    [[nodiscard]] std::uint64_t acceptanceOrder() const noexcept { return acceptance_.order; }
 
 private:
     using Delegate = std::shared_ptr<ZRReportingServiceDelegateProtocol>;
@@ -120,7 +121,7 @@ private:
     [[nodiscard]] bool isReportingEnabled() const noexcept;
 
     Context& context_;
-    const Origin origin_;
+    const Acceptance acceptance_;
     const std::shared_ptr<RequestQueue> requests_;
     const std::weak_ptr<ZRReportingServiceDelegateProtocol> delegate_;
     SessionMap clientReportingSessionMap_;
