@@ -27,7 +27,7 @@ public:
 
     void handleMessage(const MessageRef& message) override;
     /// The next run of the session may have a draft again.
-    void stop() override;
+    [[nodiscard]] bool stopSome() override;
 
     /// Whether the message is worth a draft. Arms the worker, or begins the back-off period.
     [[nodiscard]] bool interestedInMessage(const ZRReportingSessionMessage& message);
