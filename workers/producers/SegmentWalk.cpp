@@ -113,6 +113,11 @@ Dictionary previousValuesOf(const std::shared_ptr<ZRReportingSession>& session) 
     return session != nullptr ? session->previousValues() : Dictionary();
 }
 
+std::optional<Value> applicationOf(const std::shared_ptr<ZRReportingSession>& session) {
+    return session != nullptr ? std::optional(ZRReportingUtilityRetrieveAppName(session->configuration()))
+                              : std::nullopt;
+}
+
 Seconds leastLengthOf(const std::shared_ptr<ZRReportingSession>& session) {
     return ZRReportingUtilityVolumeMinimumPlayingTime(session != nullptr ? session->serviceType()
                                                                          : AudioServiceTypeUnknown);

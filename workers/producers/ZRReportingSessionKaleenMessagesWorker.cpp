@@ -161,23 +161,26 @@ private:
     DerivedMessages derived_{kWords};
 };
 
+/// One walk for the session.
+Derivation<KaleenWalk> walk(const Context& context, const std::shared_ptr<ZRReportingSession>& session,
+                            Seconds minimum) {
+    return Derivation(
+        KaleenWalk(previousValuesOf(session), minimum, destinations(context.isInternalBuild())));
+}
+
 } // namespace
 
 bool ZRReportingSessionKaleenMessagesWorker::stopSome() {
     return stopPart(stopLeft_, [this] {
         const std::shared_ptr<ZRReportingSession> owner = session();
-        return derivingStop(owner, "kaleen event",
-                            KaleenWalk(previousValuesOf(owner), leastLengthOf(owner),
-                                       destinations(context().isInternalBuild())));
+        return derivingStop(owner, "kaleen event", walk(context(), owner, leastLengthOf(owner)));
     });
 }
 
 std::vector<MessageRef>
 ZRReportingSessionKaleenMessagesWorker::createKaleenMessages(const std::vector<MessageRef>& messages,
                                                              Seconds minimumPlaytime) const {
-    return derivedBy(
-        KaleenWalk(previousValuesOf(session()), minimumPlaytime, destinations(context().isInternalBuild())),
-        messages);
+    return derivedBy(walk(context(), session(), minimumPlaytime), messages);
 }
 
 } // namespace tamblo

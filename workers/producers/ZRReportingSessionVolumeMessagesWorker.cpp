@@ -157,26 +157,27 @@ private:
     DerivedMessages derived_{kWords};
 };
 
+/// One walk for the session, with bursts folded.
+Derivation<VolumeWalk> walk(const std::shared_ptr<ZRReportingSession>& session, std::optional<Value> process,
+                            Seconds minimum) {
+    return Derivation(VolumeWalk(previousValuesOf(session), std::move(process), minimum),
+                      rapidSpatialAudioSettings(kLongestPauseInBurst));
+}
+
 } // namespace
 
 bool ZRReportingSessionVolumeMessagesWorker::stopSome() {
     return stopPart(stopLeft_, [this] {
         const std::shared_ptr<ZRReportingSession> owner = session();
-        return derivingStop(owner, "volume event",
-                            VolumeWalk(previousValuesOf(owner),
-                                       owner != nullptr ? std::optional(ZRReportingUtilityRetrieveAppName(
-                                                              owner->configuration()))
-                                                        : std::nullopt,
-                                       leastLengthOf(owner)),
-                            rapidSpatialAudioSettings(kLongestPauseInBurst));
+        return derivingStop(owner, "volume event", walk(owner, applicationOf(owner), leastLengthOf(owner)));
     });
 }
 
 std::vector<MessageRef> ZRReportingSessionVolumeMessagesWorker::createVolumeMessages(
     const std::vector<MessageRef>& messages, const Value* process, Seconds minimumPlaytime) const {
-    return derivedBy(VolumeWalk(previousValuesOf(session()),
-                                process != nullptr ? std::optional(*process) : std::nullopt, minimumPlaytime),
-                     messages, rapidSpatialAudioSettings(kLongestPauseInBurst));
+    return derivedBy(
+        walk(session(), process != nullptr ? std::optional(*process) : std::nullopt, minimumPlaytime),
+        messages);
 }
 
 } // namespace tamblo
