@@ -3,7 +3,6 @@
 #include "platform/Limits.h"
 
 #include <cstddef>
-#include <cstdint>
 #include <map>
 #include <string_view>
 #include <vector>
@@ -48,8 +47,6 @@ public:
         /// The same for messages that wait until the session is stopped. Whether there is room for them.
         [[nodiscard]] bool addWaiting(std::size_t bytes);
         void removeWaiting(std::size_t bytes) noexcept;
-        void countDropped(std::size_t messages) noexcept { all_.droppedMessageCount_ += messages; }
-        [[nodiscard]] std::size_t bytes() const noexcept { return bytes_; }
 
     private:
         friend class RetainedMessages;
@@ -72,8 +69,6 @@ public:
 
     /// Bytes of all sessions.
     [[nodiscard]] std::size_t bytes() const noexcept { return bytes_; }
-    /// Messages of all sessions that were let go for this.
-    [[nodiscard]] std::uint64_t droppedMessageCount() const noexcept { return droppedMessageCount_; }
 
 private:
     struct Account {
@@ -101,7 +96,6 @@ private:
     std::map<uid_t, Account> accounts_; ///< of users who have a session
     std::size_t bytes_ = 0;
     std::size_t nextRound_;
-    std::uint64_t droppedMessageCount_ = 0;
 };
 
 } // namespace tamblo
