@@ -38,6 +38,11 @@ void refuse(BooleanReply& reply, const ReplyError& error) {
     }
 }
 
+/// Whether a stop is to begin or to go on: one that has begun may have messages that wait for its end.
+bool isToStop(const ZRReportingSession& session) noexcept {
+    return session.started() || session.isStopping();
+}
+
 /// The bytes of the longest name of the application that a configuration gives.
 std::size_t applicationNameBytes(const Dictionary& configuration) {
     std::size_t longest = 0;
@@ -396,7 +401,7 @@ void ZRReportingClientServerInstance::performDestroy(ReporterID reporterID, Bool
 
 void ZRReportingClientServerInstance::destroySome(ReporterID reporterID, const SessionRef& session,
                                                   BooleanReply reply) {
-    if (session != nullptr && session->started() && !session->stopSome()) {
+    if (session != nullptr && isToStop(*session) && !session->stopSome()) {
         afterTurnsOfOthers(Pace::mayBlock,
                            [reporterID, session, reply = std::move(reply)](auto& client) mutable {
                                client.destroySome(reporterID, session, std::move(reply));
@@ -474,7 +479,7 @@ void ZRReportingClientServerInstance::leaveSome() {
         // Let go as soon as it is stopped, so that what it holds is not freed all at once in the end.
         const auto entry = clientReportingSessionMap_.begin();
         const SessionRef& session = entry->second;
-        hasStopped = session->started();
+        hasStopped = isToStop(*session);
         if (!hasStopped || session->stopSome()) {
             clientReportingSessionMap_.erase(entry);
         }

@@ -144,6 +144,21 @@ TEST_F(TurnsTest, AMessageToASessionThatIsBeingStoppedWaitsAndSoDoWhatTheClientA
     EXPECT_EQ(script.count("message Init 14/11"), 2U + 40U) << "the one to all is for started ones";
 }
 
+TEST_F(TurnsTest, AMessageThatWaitsForTheStopOfADestroyedSessionIsHandled) {
+    const Connection owner = connect(10), sender = connect(11);
+    open(owner, 7);
+    fill(7);
+    stopTime = milliseconds(10);
+    script.atStop["Init"] = [this](ZRReportingSession&) { device.clock.advance(stopTime); };
+    owner->object().destroyReportingSession(7, note<bool>("destroy"));
+    (void)device.serverQueue().runOne();
+    ASSERT_TRUE(find(7)->isStopping());
+    sender->object().sendMessage({{"n", 1}}, 14, 11, {7}, note<>("send"));
+    sender->object().reporterID(7, note<Dictionary>("next"));
+    EXPECT_THAT(answers(),
+                ElementsAre("send", "destroy true", R"(next {"reporterID":0,"serviceType":65535})"));
+}
+
 TEST_F(TurnsTest, LimitsOfAUserAreNobodyElses) {
     Limits& limits = device.services().limits;
     limits.sessionsOfConnection = 3;
