@@ -20,8 +20,6 @@ constexpr std::int64_t kReportingDisabled = 1;
 /// How many sessions of a client that leaves are let go in one piece of work; of started ones, one.
 constexpr std::size_t kSessionsLeftAtOnce = 16;
 constexpr int kExitStatusKilled = 2;
-/// More retained messages than this take a moment to free.
-constexpr std::size_t kManyMessages = 10'000;
 /// A message to several sessions is sent to so many at a time, and to fewer when it is large.
 constexpr std::size_t kRecipientsAtOnce = 32;
 constexpr std::size_t kBytesAtOnce = 64 * 1024;
@@ -134,8 +132,8 @@ std::optional<ReplyError> ZRReportingClientServerInstance::beyondLimitOfSessions
     if (clientReportingSessionMap_.size() >= limits.sessionsOfConnection) {
         return limitReached("sessions_of_connection", limits.sessionsOfConnection);
     }
-    const Delegate delegate = delegate_.lock();
-    if (delegate != nullptr && delegate->accountOf(user()).sessions >= limits.sessionsOfUser) {
+    const UserAccount* const all = account();
+    if (all != nullptr && all->sessions() >= limits.sessionsOfUser) {
         return limitReached("sessions_of_user", limits.sessionsOfUser);
     }
     return std::nullopt;
@@ -209,7 +207,9 @@ void ZRReportingClientServerInstance::performSetConfiguration(const Dictionary& 
             return;
         }
         session->updateConfigurationWithContentsOfConfiguration(configuration);
-        countConfiguration(before, after);
+        if (UserAccount* const all = account()) {
+            all->changeConfiguration(before, after);
+        }
     }
     answer(reply, true);
 }
@@ -224,18 +224,17 @@ ZRReportingClientServerInstance::beyondLimitOfConfiguration(const Dictionary& ad
     if (after > limits.configurationBytesOfSession) {
         return limitReached("configuration_bytes_of_session", limits.configurationBytesOfSession);
     }
-    const Delegate delegate = delegate_.lock();
-    const std::size_t all = delegate != nullptr ? delegate->accountOf(user()).configurationBytes : 0;
+    const UserAccount* const account = this->account();
+    const std::size_t all = account != nullptr ? account->configurationBytes() : 0;
     if (after > before && all + (after - before) > limits.configurationBytesOfUser) {
         return limitReached("configuration_bytes_of_user", limits.configurationBytesOfUser);
     }
     return std::nullopt;
 }
 
-void ZRReportingClientServerInstance::countConfiguration(std::size_t before, std::size_t after) const {
-    if (const Delegate delegate = hasLeft_ ? nullptr : delegate_.lock()) {
-        delegate->accountOf(user()).configurationBytes += after - before;
-    }
+UserAccount* ZRReportingClientServerInstance::account() const {
+    const Delegate delegate = presentDelegate();
+    return delegate != nullptr ? &delegate->accountOf(user()) : nullptr;
 }
 
 void ZRReportingClientServerInstance::startReportingSessionForID(ReporterID reporterID, BooleanReply reply) {
@@ -253,7 +252,7 @@ void ZRReportingClientServerInstance::performStart(ReporterID reporterID, Boolea
         return;
     }
     if (session->started()) {
-        return;
+        return; // meant: the start of a started session is never answered
     }
     session->start();
     sessionChanged(reporterID, session);
@@ -355,7 +354,9 @@ void ZRReportingClientServerInstance::performStop(ReporterID reporterID, Boolean
     }
     const SessionRef session = findReportingSessionForID(reporterID, false);
     if (session != nullptr && session->started()) {
-        stopSome(reporterID, session, std::move(reply));
+        stopThen(session, [reporterID, session, reply = std::move(reply)](auto& client) mutable {
+            client.finishStop(reporterID, session, std::move(reply));
+        });
         return;
     }
     log::debug(ZRReportingServiceDelegateCategory(),
@@ -366,15 +367,19 @@ void ZRReportingClientServerInstance::performStop(ReporterID reporterID, Boolean
     answer(reply, true);
 }
 
-void ZRReportingClientServerInstance::stopSome(ReporterID reporterID, const SessionRef& session,
-                                               BooleanReply reply) {
-    if (!session->stopSome()) {
-        afterTurnsOfOthers(Pace::mayBlock,
-                           [reporterID, session, reply = std::move(reply)](auto& client) mutable {
-                               client.stopSome(reporterID, session, std::move(reply));
-                           });
+template <typename Finish>
+void ZRReportingClientServerInstance::stopThen(const SessionRef& session, Finish finish) {
+    if (isToStop(*session) && !session->stopSome()) {
+        afterTurnsOfOthers(Pace::mayBlock, [session, finish = std::move(finish)](auto& client) mutable {
+            client.stopThen(session, std::move(finish));
+        });
         return;
     }
+    finish(*this);
+}
+
+void ZRReportingClientServerInstance::finishStop(ReporterID reporterID, const SessionRef& session,
+                                                 BooleanReply reply) {
     sessionChanged(reporterID, session);
     BooleanReply held = session->takeTransactionCompleteBlock();
     answer(held, true);
@@ -396,21 +401,18 @@ void ZRReportingClientServerInstance::performDestroy(ReporterID reporterID, Bool
         answer(reply, true);
         return;
     }
-    destroySome(reporterID, findReportingSessionForID(reporterID, false), std::move(reply));
-}
-
-void ZRReportingClientServerInstance::destroySome(ReporterID reporterID, const SessionRef& session,
-                                                  BooleanReply reply) {
-    if (session != nullptr && isToStop(*session) && !session->stopSome()) {
-        afterTurnsOfOthers(Pace::mayBlock,
-                           [reporterID, session, reply = std::move(reply)](auto& client) mutable {
-                               client.destroySome(reporterID, session, std::move(reply));
-                           });
+    const SessionRef session = findReportingSessionForID(reporterID, false);
+    if (session == nullptr) {
+        finishDestroy(reporterID, std::move(reply));
         return;
     }
-    if (session != nullptr) {
-        dropSession(clientReportingSessionMap_.find(reporterID));
-    }
+    stopThen(session, [reporterID, reply = std::move(reply)](auto& client) mutable {
+        client.dropSession(client.clientReportingSessionMap_.find(reporterID));
+        client.finishDestroy(reporterID, std::move(reply));
+    });
+}
+
+void ZRReportingClientServerInstance::finishDestroy(ReporterID reporterID, BooleanReply reply) {
     log::standard(ZRReportingServiceDelegateCategory(), "destroying {}", reporterID);
     logReportingSessions();
     answer(reply, true);
@@ -516,13 +518,15 @@ void ZRReportingClientServerInstance::storeSession(ReporterID reporterID, Sessio
     SessionRef& place = clientReportingSessionMap_[reporterID];
     SessionRef replaced = std::exchange(place, std::move(session));
     sessionChanged(reporterID, place);
-    const std::size_t before = replaced != nullptr ? heldBytes(replaced->configuration()) : 0;
-    countConfiguration(before, heldBytes(place->configuration()));
-    if (const Delegate delegate = hasLeft_ || replaced != nullptr ? nullptr : delegate_.lock()) {
-        ++delegate->accountOf(user()).sessions;
-        ++context_.platform().activity->sessions;
+    if (UserAccount* const all = account()) {
+        const std::size_t bytes = heldBytes(place->configuration());
+        if (replaced != nullptr) {
+            all->changeConfiguration(heldBytes(replaced->configuration()), bytes);
+        } else {
+            all->addSession(bytes);
+        }
     }
-    if (replaced != nullptr && replaced->messages().size() > kManyMessages) {
+    if (replaced != nullptr && replaced->messages().size() > ZRReportingSession::kManyMessages) {
         // Freed as a piece of work of its own, which may take its time.
         context_.serverQueue().post([session = std::move(replaced)] {}, Pace::mayBlock);
     }
@@ -533,16 +537,13 @@ void ZRReportingClientServerInstance::dropSession(SessionMap::iterator entry) {
     const ReporterID reporterID = entry->first;
     clientReportingSessionMap_.erase(entry);
     sessionChanged(reporterID, nullptr);
-    countConfiguration(heldBytes(session->configuration()), 0);
-    if (const Delegate delegate = hasLeft_ ? nullptr : delegate_.lock()) {
-        --delegate->accountOf(user()).sessions;
-        --context_.platform().activity->sessions;
+    if (UserAccount* const all = account()) {
+        all->removeSession(heldBytes(session->configuration()));
     }
 }
 
 void ZRReportingClientServerInstance::sessionChanged(ReporterID reporterID, const SessionRef& session) const {
-    // A client that has left is none whose sessions are found.
-    if (const Delegate delegate = hasLeft_ ? nullptr : delegate_.lock()) {
+    if (const Delegate delegate = presentDelegate()) {
         delegate->sessionChanged(*this, reporterID, session);
     }
 }

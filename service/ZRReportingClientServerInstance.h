@@ -101,9 +101,11 @@ private:
                      const std::vector<ReporterID>& reporterIDs, ErrorReply reply);
     void sendSome(std::shared_ptr<Sending> sending);
     void performStop(ReporterID reporterID, BooleanReply reply);
-    void stopSome(ReporterID reporterID, const SessionRef& session, BooleanReply reply);
+    /// Stops a session, in parts, unless it is stopped; then calls `finish` with the client.
+    template <typename Finish> void stopThen(const SessionRef& session, Finish finish);
+    void finishStop(ReporterID reporterID, const SessionRef& session, BooleanReply reply);
     void performDestroy(ReporterID reporterID, BooleanReply reply);
-    void destroySome(ReporterID reporterID, const SessionRef& session, BooleanReply reply);
+    void finishDestroy(ReporterID reporterID, BooleanReply reply);
     void endConnection();
     void leaveSome();
 
@@ -111,8 +113,11 @@ private:
     void storeSession(ReporterID reporterID, SessionRef session);
     /// Takes the session out of the map. It is the client's no more, and nobody finds it.
     void dropSession(SessionMap::iterator entry);
-    /// Notes in the user's account how the bytes of a configuration have changed.
-    void countConfiguration(std::size_t before, std::size_t after) const;
+    /// The service for as long as the client is one of its own: the sessions of one that has left are neither
+    /// found nor counted. Then null.
+    [[nodiscard]] Delegate presentDelegate() const { return hasLeft_ ? nullptr : delegate_.lock(); }
+    /// What the user's clients hold; null for a client that has left. For the piece of work at hand.
+    [[nodiscard]] UserAccount* account() const;
     [[nodiscard]] std::optional<ReplyError> beyondLimitOfSessions() const;
     [[nodiscard]] std::optional<ReplyError>
     beyondLimitOfConfiguration(const Dictionary& added, std::size_t before, std::size_t after) const;

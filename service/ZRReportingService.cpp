@@ -143,11 +143,9 @@ bool ZRReportingService::removeClient(ZRReportingClientServerInstance& client) {
     }
     clients_.erase(place);
     ++leavingClients_;
-    UserAccount& account = accounts_[client.user()];
-    account.sessions -= client.clientReportingSessionMap().size();
-    context_.platform().activity->sessions -= client.clientReportingSessionMap().size();
+    UserAccount& account = accountOf(client.user());
     for (const auto& [reporterID, session] : client.clientReportingSessionMap()) {
-        account.configurationBytes -= heldBytes(session->configuration());
+        account.removeSession(heldBytes(session->configuration()));
         sessionChanged(client, reporterID, nullptr);
     }
     return true;

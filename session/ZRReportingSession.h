@@ -39,6 +39,9 @@ class ZRReportingSession : public std::enable_shared_from_this<ZRReportingSessio
     };
 
 public:
+    /// To free more messages than this takes a moment, and is worth giving the memory back to the system.
+    static constexpr std::size_t kManyMessages = 10'000;
+
     /// A session whose start-on-init workers are made and started.
     [[nodiscard]] static std::shared_ptr<ZRReportingSession>
     initWithID(Context& context, ReporterID reporterID, std::vector<pid_t> processIdentifiers);
@@ -142,9 +145,6 @@ private:
     /// A message, what `make_shared` adds, and its place in the list, which grows to twice what it needs.
     static constexpr std::size_t kBytesOfMessage =
         allocatedBytes(sizeof(ZRReportingSessionMessage) + 2 * sizeof(void*)) + 2 * sizeof(MessageRef);
-
-    /// Freeing so many is worth giving the memory back to the system.
-    static constexpr std::size_t kManyMessages = 10'000;
 
     void startWorkersFromClasses(std::span<const WorkerClass* const> classes);
     void makeWorker(const WorkerClass& workerClass);
