@@ -38,10 +38,8 @@ constexpr std::size_t kUnreadPartOfMany = 64;
 /// A peer that takes nothing for so long does not read.
 constexpr std::chrono::seconds kPatienceWithPeer{1};
 
-static_assert(kLimitErrorDomain == wire::kProtocolErrorDomain && kLimitErrorCode == wire::kLimitReached);
-
 ReplyError outOfMemory() {
-    return {std::string(kLimitErrorDomain), kLimitErrorCode, "memory: the service has none left"};
+    return {std::string(kProtocolErrorDomain), kLimitReached, "memory: the service has none left"};
 }
 
 bool mayKillService(uid_t user) noexcept {
@@ -139,8 +137,7 @@ void LinuxConnection::readOnce() {
     }
 }
 
-/// Where what waits has to be carried out first, the loop hears nothing of the socket until it is. Whether
-/// so.
+/// Has the loop hear nothing of the socket where too much waits, until that is carried out. Whether it does.
 bool LinuxConnection::holdBackIfFlooded() {
     const Limits& limits = shared_.limits;
     const MutexLock lock(mutex_);
@@ -200,7 +197,7 @@ void LinuxConnection::takeFrames(std::span<const std::uint8_t> received) {
     }
     if (ending_ == Ending::none && frames.tooLong()) {
         refuse({.endsConnection = true,
-                .error = {std::string(wire::kProtocolErrorDomain), wire::kNotARequest,
+                .error = {std::string(kProtocolErrorDomain), wire::kNotARequest,
                           "a frame is longer than 1 MiB"}});
     }
     keepRest(frames.rest(), frames.wanted());
@@ -239,7 +236,7 @@ void LinuxConnection::countUnfinished() {
 }
 
 void LinuxConnection::endUnfinished() {
-    endBeyond({std::string(kLimitErrorDomain), kLimitErrorCode,
+    endBeyond({std::string(kProtocolErrorDomain), kLimitReached,
                formatted("frame_seconds: a frame made no progress for {} s", shared_.limits.frameSeconds)});
 }
 
@@ -258,7 +255,7 @@ std::size_t LinuxConnection::decodeAndDispatch(std::span<const std::uint8_t> ite
     return bytes;
 }
 
-void LinuxConnection::sendError(std::uint64_t id, const wire::Error& error) {
+void LinuxConnection::sendError(std::uint64_t id, const ReplyError& error) {
     const MutexLock lock(mutex_);
     wire::appendErrorReply(outgoing_, id, error);
     send();
@@ -266,7 +263,7 @@ void LinuxConnection::sendError(std::uint64_t id, const wire::Error& error) {
 
 void LinuxConnection::refuseKill(std::uint64_t id) {
     // The code is that of a limit, but none is reached.
-    sendError(id, {std::string(wire::kProtocolErrorDomain), wire::kLimitReached,
+    sendError(id, {std::string(kProtocolErrorDomain), kLimitReached,
                    "killService is for root and the service's own user"});
     if (!std::exchange(isKillNoted_, true)) {
         shared_.log.reportOfClient(LogLevel::error, "zrrs",
@@ -277,7 +274,7 @@ void LinuxConnection::refuseKill(std::uint64_t id) {
 
 void LinuxConnection::refuse(const wire::Refusal& refusal) {
     sendError(refusal.id, refusal.error);
-    if (refusal.error.code == wire::kLimitReached) {
+    if (refusal.error.code == kLimitReached) {
         noteLimit(refusal.error.message);
     }
     if (refusal.endsConnection) {
@@ -295,14 +292,14 @@ void LinuxConnection::noteLimit(std::string_view limit) {
 
 void LinuxConnection::endBeyond(const ReplyError& limit) {
     if (ending_ == Ending::none) {
-        refuse({.endsConnection = true, .error = {limit.domain, limit.code, limit.message}});
+        refuse({.endsConnection = true, .error = limit});
     }
 }
 
 void LinuxConnection::turnAway(const ReplyError& reason) {
     // One line tells of all that are turned away until the user has fewer.
     isLimitNoted_ = std::exchange(user_->isTurnedAway, true);
-    refuse({.error = {reason.domain, reason.code, reason.message}});
+    refuse({.error = reason});
 }
 
 void LinuxConnection::replied() {

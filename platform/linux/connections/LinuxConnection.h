@@ -143,7 +143,7 @@ private:
     void countUnfinished() TAMBLO_EXCLUDES(mutex_);
     /// Answers the bytes that the decoded request takes while it waits; 0 for a refused one.
     [[nodiscard]] std::size_t decodeAndDispatch(std::span<const std::uint8_t> item) TAMBLO_EXCLUDES(mutex_);
-    void sendError(std::uint64_t id, const wire::Error& error) TAMBLO_EXCLUDES(mutex_);
+    void sendError(std::uint64_t id, const ReplyError& error) TAMBLO_EXCLUDES(mutex_);
     void refuse(const wire::Refusal& refusal) TAMBLO_EXCLUDES(mutex_);
     void refuseKill(std::uint64_t id) TAMBLO_EXCLUDES(mutex_);
     /// Ends the connection with an error frame that names the limit.
