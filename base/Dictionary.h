@@ -83,9 +83,9 @@ public:
     /// How what several values share is counted.
     enum class Shared : std::uint8_t { inFull, inProportion };
     /// Bytes of memory that the block and what its values refer to take, the keys of this dictionary aside.
-    /// In proportion, a short text that others refer to counts half, and so do the keys of a dictionary
-    /// within this one: less would let a client have much memory held for the little that it is charged, once
-    /// those others have gone. Anything else counts in full.
+    /// In proportion, short texts and the keys of inner dictionaries count half where others refer to them as
+    /// well, and anything else in full. They never count less: once the others have gone, this dictionary
+    /// alone keeps that memory, and its owner must not have been charged next to nothing for it.
     [[nodiscard]] std::size_t bytesOfValues(Shared shared) const noexcept;
 
 private:

@@ -33,8 +33,8 @@ public:
     /// call.
     [[nodiscard]] const Places& in(const KeySet& keySet) {
         if (keySet.size() > kMostRememberedKeys || keySet.heldBytes() > kMostRememberedBytes) {
-            // Of an ordinary message's size, or not remembered: it would be held for as long as this is
-            // there.
+            // What is remembered is held for as long as this is there: larger ones than messages commonly
+            // have are not.
             once_ = find(keySet).places;
             return once_;
         }

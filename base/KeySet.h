@@ -63,7 +63,7 @@ public:
 
     /// Bytes of memory.
     [[nodiscard]] std::size_t heldBytes() const noexcept;
-    /// Whether more than one dictionary, or what remembers key sets and a dictionary, refers to it.
+    /// Whether more refer to it than the dictionary that asks and one other, such as what remembers key sets.
     [[nodiscard]] bool isShared() const noexcept { return references_.load(std::memory_order_relaxed) > 2; }
 
     struct Extension {

@@ -1,5 +1,6 @@
 # tamblo_unit_tests (every folder, against the in-memory platform of tests/fakes), tamblo_service_tests (the
-# real tamblod and tambloctl) and tamblo_hostile_tests (clients that mean harm). Left out, with a notice, on a machine without the test libraries.
+# real tamblod and tambloctl) and tamblo_hostile_tests (clients that mean harm). Left out, with a notice, on a
+# machine without the test libraries.
 
 find_package(GTest QUIET)
 find_package(nlohmann_json QUIET)

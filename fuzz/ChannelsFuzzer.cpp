@@ -5,7 +5,6 @@
 #include "platform/linux/drivers/LinuxChanlogFacility.h"
 
 #include <cstdint>
-#include <span>
 #include <variant>
 
 namespace tamblo {

@@ -5,6 +5,7 @@
 #include "RunningService.h"
 #include "base/Cbor.h"
 #include "os/LocalAddress.h"
+#include "platform/Limits.h"
 #include "wire/FrameSplitter.h"
 #include "wire/Reply.h"
 #include "wire/Request.h"
@@ -28,8 +29,6 @@ using fuzz::RunningService;
 using wire::Method;
 
 constexpr std::size_t kClients = 6;
-/// The most deliveries that a message is granted.
-constexpr std::size_t kMostReporters = 256;
 /// The type of messages that are no repetitions, whatever they say.
 constexpr std::uint16_t kError = 6;
 constexpr int kPatienceMilliseconds = 60'000;
@@ -345,7 +344,7 @@ private:
                               .type = input_.ConsumeBool() ? kError : std::uint16_t{1},
                               .reporterIDs = std::vector<std::int64_t>(times, reporterID())};
         add(request);
-        bill_.delivers(std::min(times, kMostReporters), text.size() + 200);
+        bill_.delivers(std::min(times, Limits{}.reportersOfMessage), text.size() + 200);
     }
     void addArrays() {
         const std::size_t times = count(900'000);
@@ -365,7 +364,7 @@ private:
         (void)wire::finishFrame(frames_, start);
         bill_.delivers(1, 200);
     }
-    /// A configuration, and messages that it may come with.
+    /// A configuration of one long text.
     void addText() {
         wire::Request request{.method = Method::setConfiguration,
                               .reporterID = reporterID(),

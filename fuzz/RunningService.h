@@ -7,7 +7,6 @@
 #include "wire/Protocol.h"
 
 #include <cstdint>
-#include <ctime>
 #include <memory>
 #include <thread>
 
@@ -67,7 +66,7 @@ private:
                                S_IRUSR | S_IWUSR);
         demand(::dup2(log, STDERR_FILENO) == STDERR_FILENO);
         ::close(log);
-        std::thread([this] { run(); }).detach();
+        thread_ = std::thread([this] { run(); });
         while (!std::filesystem::exists(socketPath())) {
             std::this_thread::sleep_for(std::chrono::milliseconds(1));
         }
@@ -94,6 +93,7 @@ private:
     }
 
     const ScratchDirectory directory_;
+    std::thread thread_; ///< never joined: this object never goes
 };
 
 } // namespace tamblo::fuzz

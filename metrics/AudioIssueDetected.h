@@ -33,7 +33,7 @@ struct AudioIssueDetected {
 };
 
 void swap(AudioIssueDetected& first, AudioIssueDetected& second) noexcept;
-/// Equal records have equal values. Nothing here hashes a record yet.
+/// Equal records have equal values. For sets and tables of records.
 [[nodiscard]] std::size_t hash_value(const AudioIssueDetected& record) noexcept;
 
 } // namespace tamblo::qmxmetrics

@@ -2,11 +2,13 @@
 
 #include <cerrno>
 #include <memory>
+#include <string_view>
 #include <thread>
 
 #include <dirent.h>
 #include <fcntl.h>
 #include <sys/file.h>
+#include <sys/stat.h>
 
 namespace tamblo {
 
@@ -17,10 +19,8 @@ constexpr int kReadDirectory = O_RDONLY | O_DIRECTORY | O_CLOEXEC;
 /// Of a directory that is removed, at a time.
 constexpr std::size_t kEntriesAtATime = 1024;
 
-} // namespace
-
-int makeDirectory(const std::string& path, mode_t mode) {
-    if (::mkdir(path.c_str(), mode) != 0) {
+int makeDirectory(const std::string& path) {
+    if (::mkdir(path.c_str(), S_IRWXU) != 0) {
         // On a read-only file system the error need not say that the directory is there.
         const int failure = errno;
         struct stat status {};
@@ -30,21 +30,19 @@ int makeDirectory(const std::string& path, mode_t mode) {
         return S_ISDIR(status.st_mode) ? 0 : ENOTDIR;
     }
     const FileDescriptor made(::open(path.c_str(), O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC));
-    return made.isOpen() && ::fchmod(made.get(), mode) == 0 ? 0 : errno;
+    return made.isOpen() && ::fchmod(made.get(), S_IRWXU) == 0 ? 0 : errno;
 }
 
-int makeDirectories(const std::string& path, mode_t mode, std::string_view root) {
-    const int failure = makeDirectory(path, mode);
+} // namespace
+
+int makeDirectories(const std::string& path) {
+    const int failure = makeDirectory(path);
     const std::size_t slash = path.find_last_of('/');
     if (failure != ENOENT || slash == std::string::npos || slash == 0) {
         return failure;
     }
-    const std::string parent = path.substr(0, slash);
-    if (parent == root) {
-        return failure;
-    }
-    const int parentFailure = makeDirectories(parent, mode, root);
-    return parentFailure != 0 ? parentFailure : makeDirectory(path, mode);
+    const int parentFailure = makeDirectories(path.substr(0, slash));
+    return parentFailure != 0 ? parentFailure : makeDirectory(path);
 }
 
 FileDescriptor lockDirectory(const std::string& path, std::optional<std::chrono::milliseconds> patience) {

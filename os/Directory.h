@@ -7,18 +7,13 @@
 #include <cstdint>
 #include <optional>
 #include <string>
-#include <string_view>
 #include <vector>
-
-#include <sys/stat.h>
 
 namespace tamblo {
 
-/// Makes a directory, with its mode whatever the process's mask is; one that is there stays as it is. Returns
-/// 0 or an `errno`.
-[[nodiscard]] int makeDirectory(const std::string& path, mode_t mode = S_IRWXU);
-/// Makes a directory and those on the way to it, up to `root`, which has to be there.
-[[nodiscard]] int makeDirectories(const std::string& path, mode_t mode = S_IRWXU, std::string_view root = {});
+/// Makes a directory and those on the way to it, for their owner alone, whatever the process's mask is; what
+/// is there stays as it is. Returns 0 or an `errno`.
+[[nodiscard]] int makeDirectories(const std::string& path);
 
 /// Takes a directory's advisory lock (`flock`), waiting for whoever has it, at most so long if that is said:
 /// it lasts as long as the descriptor. Not open, with the reason in `errno`, when it cannot be had;

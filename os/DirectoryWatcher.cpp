@@ -37,7 +37,7 @@ std::string lastNameOf(const std::string& path) {
 
 } // namespace
 
-DirectoryWatcher::DirectoryWatcher(std::string directory, Watched watched)
+DirectoryWatcher::DirectoryWatcher(std::string directory, Watch watched)
     : directory_(std::move(directory)),
       watched_(watched),
       inotify_(::inotify_init1(IN_NONBLOCK | IN_CLOEXEC)) {
@@ -54,7 +54,7 @@ DirectoryWatcher::DirectoryWatcher(std::string directory, Watched watched)
 void DirectoryWatcher::watch() {
     replaceWatch(parentWatch_, watchNearestParent());
     const int parentError = errno;
-    const std::uint32_t mask = kWritesMask | (watched_ == Watched::writes ? 0 : kRemovalsMask);
+    const std::uint32_t mask = kWritesMask | (watched_ == Watch::writes ? 0 : kRemovalsMask);
     const int watch = ::inotify_add_watch(inotify_.get(), directory_.c_str(), mask);
     const bool isMissing = watch < 0 && (errno == ENOENT || errno == ENOTDIR);
     if (isMissing) {

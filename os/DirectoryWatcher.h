@@ -24,9 +24,9 @@ public:
     /// kernel could remember.
     using Handler = std::function<void(std::optional<std::string_view> fileName)>;
 
-    enum class Watched { writes, writesAndRemovals };
+    enum class Watch { writes, writesAndRemovals };
 
-    explicit DirectoryWatcher(std::string directory, Watched watched = Watched::writesAndRemovals);
+    explicit DirectoryWatcher(std::string directory, Watch watched = Watch::writesAndRemovals);
     DirectoryWatcher(const DirectoryWatcher&) = delete;
     DirectoryWatcher& operator=(const DirectoryWatcher&) = delete;
 
@@ -46,7 +46,7 @@ private:
     [[nodiscard]] bool take(const inotify_event& event, const Handler& handler);
 
     const std::string directory_;
-    const Watched watched_;
+    const Watch watched_;
     FileDescriptor inotify_;
     int directoryWatch_ = -1;
     int parentWatch_ = -1;

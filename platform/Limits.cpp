@@ -1,11 +1,9 @@
 #include "platform/Limits.h"
 
-#include "base/Format.h"
 #include "platform/Preferences.h"
 
 #include <array>
 #include <optional>
-#include <string>
 #include <utility>
 
 namespace tamblo {
@@ -50,10 +48,6 @@ Limits Limits::read(const Preferences& preferences) {
         }
     }
     return limits;
-}
-
-ReplyError limitReached(std::string_view name, std::size_t limit) {
-    return {std::string(kLimitErrorDomain), kLimitErrorCode, formatted("{}: at most {}", name, limit)};
 }
 
 } // namespace tamblo

@@ -1,9 +1,6 @@
 #pragma once
 
-#include "platform/ZRReportingServiceProtocol.h"
-
 #include <cstddef>
-#include <cstdint>
 #include <string_view>
 
 namespace tamblo {
@@ -51,11 +48,5 @@ struct Limits {
 
     [[nodiscard]] static Limits read(const Preferences& preferences);
 };
-
-/// How a request beyond a limit is refused; the message names the limit as its preference is named. The
-/// domain and the code are those of the protocol's own errors.
-inline constexpr std::string_view kLimitErrorDomain = "com.vandra.tamblo.protocol";
-inline constexpr std::int64_t kLimitErrorCode = -32000;
-[[nodiscard]] ReplyError limitReached(std::string_view name, std::size_t limit);
 
 } // namespace tamblo

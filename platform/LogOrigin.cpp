@@ -12,14 +12,14 @@ constinit thread_local const LogOrigin* innermost = nullptr;
 
 } // namespace
 
-LogOrigin::LogOrigin(std::optional<Client> client) noexcept
+LogOrigin::LogOrigin(std::optional<ClientIdentity> client) noexcept
     : client_(client), outer_(std::exchange(innermost, this)) {}
 
 LogOrigin::~LogOrigin() {
     innermost = outer_;
 }
 
-std::optional<LogOrigin::Client> LogOrigin::client() noexcept {
+std::optional<ClientIdentity> LogOrigin::client() noexcept {
     return innermost != nullptr ? innermost->client_ : std::nullopt;
 }
 

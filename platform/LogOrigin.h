@@ -13,18 +13,16 @@ namespace tamblo {
 /// Not for keeping: it goes on the thread, and in the scope, that it was made in.
 class LogOrigin {
 public:
-    using Client = ClientIdentity;
-
-    explicit LogOrigin(std::optional<Client> client) noexcept;
+    explicit LogOrigin(std::optional<ClientIdentity> client) noexcept;
     ~LogOrigin();
     LogOrigin(const LogOrigin&) = delete;
     LogOrigin& operator=(const LogOrigin&) = delete;
 
     /// That of the calling thread, for work that is handed to another one.
-    [[nodiscard]] static std::optional<Client> client() noexcept;
+    [[nodiscard]] static std::optional<ClientIdentity> client() noexcept;
 
 private:
-    const std::optional<Client> client_;
+    const std::optional<ClientIdentity> client_;
     const LogOrigin* const outer_;
 };
 

@@ -35,11 +35,15 @@ public:
     /// One line, without its line end; control characters in it are the implementation's to make harmless.
     virtual void write(LogLevel level, std::string_view categoryCode, std::string_view line) noexcept = 0;
 
-    /// A line of a platform service's own: gives the text its prefix, and writes it when its level is on,
-    /// whoever the thread works for.
+    // Here the plain name is without a limit, as platform services mostly speak for themselves; in
+    // `util/Log.h` it is the other way round.
+
+    /// A line of a platform service's own, never limited: gives the text its prefix, and writes it when its
+    /// level is on, whoever the thread works for.
     void report(LogLevel level, std::string_view categoryCode, std::string_view text,
                 const std::source_location& place = std::source_location::current());
-    /// A line of a platform service's that a client causes as often as it likes: within what is admitted.
+    /// A line of a platform service's that a client causes as often as it likes, limited: within what is
+    /// admitted.
     template <typename... Arguments>
     void reportOfClient(LogLevel level, std::string_view categoryCode,
                         const FormatString<std::type_identity_t<Arguments>...>& format,

@@ -1,20 +1,13 @@
 #pragma once
 
 #include "base/Dictionary.h"
+#include "base/ReplyError.h"
 #include "base/UniqueFunction.h"
 
 #include <cstdint>
-#include <string>
 #include <vector>
 
 namespace tamblo {
-
-/// Why a request was refused, as the client sees it.
-struct ReplyError {
-    std::string domain;
-    std::int64_t code = 0;
-    std::string message{}; ///< for people; empty: absent
-};
 
 /// Replies: the error, null when there is none, then the result. A reply may be called from any thread, more
 /// than once or never, and after its connection is gone; it may be empty, when the client asked for no

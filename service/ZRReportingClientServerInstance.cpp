@@ -94,10 +94,10 @@ struct ZRReportingClientServerInstance::Sending {
 };
 
 ZRReportingClientServerInstance::ZRReportingClientServerInstance(
-    Context& context, Origin origin, std::shared_ptr<RequestQueue> requests,
+    Context& context, Acceptance acceptance, std::shared_ptr<RequestQueue> requests,
     std::weak_ptr<ZRReportingServiceDelegateProtocol> delegate)
     : context_(context),
-      origin_(std::move(origin)),
+      acceptance_(std::move(acceptance)),
       requests_(std::move(requests)),
       delegate_(std::move(delegate)) {
     log::standard(ZRReportingServiceDelegateCategory(), "new client with pid {}", processIdentifier());
@@ -143,8 +143,8 @@ std::optional<ReplyError> ZRReportingClientServerInstance::beyondLimitOfSessions
     if (clientReportingSessionMap_.size() >= limits.sessionsOfConnection) {
         return limitReached("sessions_of_connection", limits.sessionsOfConnection);
     }
-    const Delegate delegate = delegate_.lock();
-    if (delegate != nullptr && delegate->accountOf(user()).sessions >= limits.sessionsOfUser) {
+    const UserAccount* const all = account();
+    if (all != nullptr && all->sessions() >= limits.sessionsOfUser) {
         return limitReached("sessions_of_user", limits.sessionsOfUser);
     }
     return std::nullopt;
@@ -216,7 +216,9 @@ void ZRReportingClientServerInstance::performSetConfiguration(const Dictionary& 
             return;
         }
         session->updateConfigurationWithContentsOfConfiguration(configuration);
-        countConfiguration(before, session->configurationBytes());
+        if (UserAccount* const all = account()) {
+            all->changeConfiguration(before, session->configurationBytes());
+        }
     }
     answer(reply, true);
 }
@@ -231,18 +233,17 @@ ZRReportingClientServerInstance::beyondLimitOfConfiguration(const Dictionary& ad
     if (after > limits.configurationBytesOfSession) {
         return limitReached("configuration_bytes_of_session", limits.configurationBytesOfSession);
     }
-    const Delegate delegate = delegate_.lock();
-    const std::size_t all = delegate != nullptr ? delegate->accountOf(user()).configurationBytes : 0;
+    const UserAccount* const account = this->account();
+    const std::size_t all = account != nullptr ? account->configurationBytes() : 0;
     if (after > before && all + (after - before) > limits.configurationBytesOfUser) {
         return limitReached("configuration_bytes_of_user", limits.configurationBytesOfUser);
     }
     return std::nullopt;
 }
 
-void ZRReportingClientServerInstance::countConfiguration(std::size_t before, std::size_t after) const {
-    if (const Delegate delegate = delegate_.lock()) {
-        delegate->accountOf(user()).configurationBytes += after - before;
-    }
+UserAccount* ZRReportingClientServerInstance::account() const {
+    const Delegate delegate = delegate_.lock();
+    return delegate != nullptr ? &delegate->accountOf(user()) : nullptr;
 }
 
 void ZRReportingClientServerInstance::startReportingSessionForID(ReporterID reporterID, BooleanReply reply) {
@@ -260,7 +261,7 @@ void ZRReportingClientServerInstance::performStart(ReporterID reporterID, Boolea
         return;
     }
     if (session->started()) {
-        return;
+        return; // meant: the start of a started session is never answered
     }
     session->start();
     sessionChanged(reporterID, session);
@@ -579,32 +580,28 @@ void ZRReportingClientServerInstance::storeSession(ReporterID reporterID, Sessio
     SessionRef& place = clientReportingSessionMap_[reporterID];
     SessionRef replaced = std::exchange(place, std::move(session));
     sessionChanged(reporterID, place);
-    const std::size_t before = replaced != nullptr ? replaced->configurationBytes() : 0;
-    countConfiguration(before, place->configurationBytes());
+    UserAccount* const all = account();
     if (replaced != nullptr) {
+        if (all != nullptr) {
+            all->changeConfiguration(replaced->configurationBytes(), place->configurationBytes());
+        }
         letGoInParts(context_, std::move(replaced));
-        return;
+    } else if (all != nullptr) {
+        all->addSession(place->configurationBytes());
     }
-    if (const Delegate delegate = delegate_.lock()) {
-        ++delegate->accountOf(user()).sessions;
-    }
-    ++context_.platform().activity->sessions;
 }
 
 void ZRReportingClientServerInstance::letGoOf(SessionMap::iterator entry) {
     SessionRef session = std::move(entry->second);
     clientReportingSessionMap_.erase(entry);
-    countConfiguration(session->configurationBytes(), 0);
-    if (const Delegate delegate = delegate_.lock()) {
-        --delegate->accountOf(user()).sessions;
+    if (UserAccount* const all = account()) {
+        all->removeSession(session->configurationBytes());
     }
-    --context_.platform().activity->sessions;
     letGoInParts(context_, std::move(session));
 }
 
 void ZRReportingClientServerInstance::sessionChanged(ReporterID reporterID, const SessionRef& session) const {
-    // A client that has left is none whose sessions are found.
-    if (const Delegate delegate = hasLeft_ ? nullptr : delegate_.lock()) {
+    if (const Delegate delegate = presentDelegate()) {
         delegate->sessionChanged(*this, reporterID, session);
     }
 }

@@ -37,14 +37,15 @@ public:
     using SessionMap = std::map<ReporterID, SessionRef>;
 
     /// What is known of a client when it connects.
-    struct Origin {
+    struct Acceptance {
         ClientIdentity identity;
-        std::uint64_t acceptanceOrder; ///< the client's place in the order of acceptance, from 1
+        std::uint64_t order; ///< the client's place in the order of acceptance, from 1
         WallTime startDate;
         std::optional<std::string> processName;
     };
 
-    ZRReportingClientServerInstance(Context& context, Origin origin, std::shared_ptr<RequestQueue> requests,
+    ZRReportingClientServerInstance(Context& context, Acceptance acceptance,
+                                    std::shared_ptr<RequestQueue> requests,
                                     std::weak_ptr<ZRReportingServiceDelegateProtocol> delegate);
     ~ZRReportingClientServerInstance() override;
     ZRReportingClientServerInstance(const ZRReportingClientServerInstance&) = delete;
@@ -74,18 +75,18 @@ public:
 
     [[nodiscard]] SessionRef findReportingSessionForID(ReporterID reporterID, bool acrossAllClients) const;
 
-    [[nodiscard]] pid_t processIdentifier() const noexcept { return origin_.identity.process; }
-    [[nodiscard]] uid_t user() const noexcept { return origin_.identity.user; }
+    [[nodiscard]] pid_t processIdentifier() const noexcept { return acceptance_.identity.process; }
+    [[nodiscard]] uid_t user() const noexcept { return acceptance_.identity.user; }
     [[nodiscard]] const SessionMap& clientReportingSessionMap() const noexcept {
         return clientReportingSessionMap_;
     }
-    [[nodiscard]] std::optional<WallTime> clientStartDate() const noexcept { return origin_.startDate; }
+    [[nodiscard]] std::optional<WallTime> clientStartDate() const noexcept { return acceptance_.startDate; }
     [[nodiscard]] const std::optional<std::string>& clientProcessName() const noexcept {
-        return origin_.processName;
+        return acceptance_.processName;
     }
     /// True for the first caller alone, who then reports how long the client was there.
     [[nodiscard]] bool claimUptimeReport() noexcept { return !std::exchange(isUptimeReported_, true); }
-    [[nodiscard]] std::uint64_t acceptanceOrder() const noexcept { return origin_.acceptanceOrder; }
+    [[nodiscard]] std::uint64_t acceptanceOrder() const noexcept { return acceptance_.order; }
 
 private:
     using Delegate = std::shared_ptr<ZRReportingServiceDelegateProtocol>;
@@ -117,8 +118,11 @@ private:
 
     [[nodiscard]] SessionRef makeSession(ReporterID reporterID) const;
     void storeSession(ReporterID reporterID, SessionRef session);
-    /// Notes in the user's account how the bytes of a configuration have changed.
-    void countConfiguration(std::size_t before, std::size_t after) const;
+    /// The service for as long as the client is one of its own: the sessions of one that has left are not
+    /// found. Then null.
+    [[nodiscard]] Delegate presentDelegate() const { return hasLeft_ ? nullptr : delegate_.lock(); }
+    /// What the user's clients hold, or null. For the piece of work at hand.
+    [[nodiscard]] UserAccount* account() const;
     [[nodiscard]] std::optional<ReplyError> beyondLimitOfSessions() const;
     [[nodiscard]] std::optional<ReplyError>
     beyondLimitOfConfiguration(const Dictionary& added, std::size_t before, std::size_t after) const;
@@ -127,7 +131,7 @@ private:
     [[nodiscard]] bool isReportingEnabled() const noexcept;
 
     Context& context_;
-    const Origin origin_;
+    const Acceptance acceptance_;
     const std::shared_ptr<RequestQueue> requests_;
     const std::weak_ptr<ZRReportingServiceDelegateProtocol> delegate_;
     SessionMap clientReportingSessionMap_;

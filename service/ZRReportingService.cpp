@@ -91,9 +91,9 @@ bool ZRReportingService::shouldAcceptNewConnection(ClientConnection& connection)
     if (!connection.isPeerThere()) {
         name.reset();
     }
-    ZRReportingClientServerInstance::Origin origin{connection.peer(), ++lastAcceptanceOrder_,
-                                                   context_.platform().clock->now(), std::move(name)};
-    const auto client = std::make_shared<ZRReportingClientServerInstance>(context_, std::move(origin),
+    ZRReportingClientServerInstance::Acceptance acceptance{connection.peer(), ++lastAcceptanceOrder_,
+                                                           context_.platform().clock->now(), std::move(name)};
+    const auto client = std::make_shared<ZRReportingClientServerInstance>(context_, std::move(acceptance),
                                                                           connection.requestQueue(), self_);
     connection.setExportedObject(client);
     connection.requestQueue()->post(

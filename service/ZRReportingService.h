@@ -59,7 +59,9 @@ public:
                                                              std::vector<SessionRef>& found) override;
     bool removeClient(ZRReportingClientServerInstance& client) override;
     void clientHasLeft(const ClientRef& client) override;
-    [[nodiscard]] UserAccount& accountOf(uid_t user) override { return accounts_[user]; }
+    [[nodiscard]] UserAccount& accountOf(uid_t user) override {
+        return accounts_.try_emplace(user, *context_.platform().activity).first->second;
+    }
     void logReportingSessions() override;
     void sessionChanged(const ZRReportingClientServerInstance& client, ReporterID reporterID,
                         const SessionRef& session) override;

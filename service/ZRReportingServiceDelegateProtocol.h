@@ -53,7 +53,9 @@ public:
     virtual bool removeClient(ZRReportingClientServerInstance& client) = 0;
     /// To be told once the sessions of a removed client are stopped and let go.
     virtual void clientHasLeft(const ClientRef& client) = 0;
+    /// What the user's clients hold together; they keep it up to date. Stays where it is.
     [[nodiscard]] virtual UserAccount& accountOf(uid_t user) = 0;
+    /// Writes each client's sessions, and the started ones of all, to the log.
     virtual void logReportingSessions() = 0;
 
     /// To be told after every change of what a client holds under an ID, its sessions' starts and stops

@@ -1,6 +1,7 @@
 #include "platform/linux/LinuxPlatform.h"
 #include "service/ZRReportingService.h"
 #include "util/Context.h"
+#include "wire/Protocol.h"
 
 #include <cstdio>
 #include <cstdlib>
@@ -67,8 +68,7 @@ int main(int argc, char* argv[]) {
     LinuxPlatform& linuxPlatform = *std::get<std::unique_ptr<LinuxPlatform>>(opened);
     Context context(linuxPlatform.services());
     ZRReportingService service(context);
-    ConnectionListener& listener =
-        context.platform().connections->listenerForServiceName("com.vandra.tamblo.reporting");
+    ConnectionListener& listener = context.platform().connections->listenerForServiceName(wire::kServiceName);
     listener.setDelegate(service);
     listener.resume();
     linuxPlatform.run(context.serverQueue(),

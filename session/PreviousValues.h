@@ -5,8 +5,8 @@
 
 #include <cstddef>
 #include <functional>
-#include <optional>
 #include <string>
+#include <string_view>
 #include <unordered_map>
 #include <vector>
 
@@ -38,8 +38,8 @@ public:
     [[nodiscard]] Dictionary values() const;
     /// Bytes of memory.
     [[nodiscard]] std::size_t heldBytes() const noexcept { return bytes_; }
-    /// Bytes of the keys of the key set that fell out with the latest payload, which messages may still
-    /// share; 0 when none did.
+    /// The bytes of the keys of the key set that the latest payload has pushed out, which messages may go on
+    /// to share; 0 when it has pushed none out.
     [[nodiscard]] std::size_t bytesOfKeysLeft() const noexcept { return bytesOfKeysLeft_; }
     /// Whether keys were left out.
     [[nodiscard]] bool isFull() const noexcept { return isFull_; }

@@ -3,7 +3,6 @@
 #include "util/Context.h"
 
 #include <cstddef>
-#include <cstdint>
 #include <map>
 #include <string_view>
 #include <vector>
@@ -19,9 +18,9 @@ class ZRReportingSession;
 /// A session may last for days, and nobody is to lose a report for that; but its messages are memory. So each
 /// user has a budget of bytes, and all of them have one together. Beyond the first, the oldest messages of
 /// the user's largest sessions are let go, beyond the second, those of the user who has most; enough of them
-/// that it is worth the search for them. A session that is stopping keeps what it has. Let go means: they
-/// have reached their sinks, but what the stop derives begins later. One for all sessions, on the reporting
-/// server queue.
+/// that it is worth the search for them. A session that is stopping keeps what it has. A message that is let
+/// go has reached its sinks, but what is derived at the stop is derived without it. One for all sessions, on
+/// the reporting server queue.
 class RetainedMessages {
     struct Account;
 
@@ -54,8 +53,6 @@ public:
         [[nodiscard]] bool hasRoomForDerived() const noexcept {
             return account_->derivedBytes < kMostDerivedBytesOfUser && all_.derivedBytes_ < kMostDerivedBytes;
         }
-        void countDropped(std::size_t messages) noexcept { all_.droppedMessageCount_ += messages; }
-        [[nodiscard]] std::size_t bytes() const noexcept { return bytes_; }
 
     private:
         friend class RetainedMessages;
@@ -80,8 +77,6 @@ public:
 
     /// Bytes of all sessions.
     [[nodiscard]] std::size_t bytes() const noexcept { return bytes_; }
-    /// Messages of all sessions that were let go for this.
-    [[nodiscard]] std::uint64_t droppedMessageCount() const noexcept { return droppedMessageCount_; }
 
 private:
     struct Account {
@@ -113,7 +108,6 @@ private:
     std::size_t derivedBytes_ = 0;
     std::size_t nextRound_;
     std::size_t freedBytes_ = 0; ///< since the system was given some back
-    std::uint64_t droppedMessageCount_ = 0;
 };
 
 } // namespace tamblo

@@ -11,7 +11,7 @@
 
 namespace tamblo {
 
-/// How far the stop of a session has come, in whose parts other work of the queue runs in between.
+/// How far the stop of a session has come. It is done in parts, between which the queue does other work.
 struct SessionStop {
     enum class Step : std::uint8_t { sort, index, workers, letGo, done };
 

@@ -139,7 +139,6 @@ std::size_t ZRReportingSession::letGoOfOldest(std::size_t bytes, std::string_vie
                       [this](const MessageRef& message) { lastMessages_.remove(*message); });
         messages_.erase(messages_.begin(), end);
         droppedMessageCount_ += freed.messages;
-        retained_.countDropped(freed.messages);
         context_.platform().activity->droppedRecords += freed.messages;
     }
     if (messages_.empty() && freed.bytes < bytes) {

@@ -30,10 +30,9 @@ namespace tamblo {
 /// One reporter's session: its identity, service type and configuration, the messages accepted since its
 /// start, and one worker of each applicable class.
 ///
-/// Owned by a client instance, or by `LeavingClients` once the client has left; the single-message session by
-/// its keeper. Created (the start-on-init workers run) → started (all workers run) → stopped (messages
-/// emptied, workers kept) → started again …; letting it go stops nothing. Used on the reporting server queue
-/// alone.
+/// Owned by a client instance; the single-message session by its keeper. Created (the start-on-init workers
+/// run) → started (all workers run) → stopped (messages emptied, workers kept) → started again …; letting it
+/// go stops nothing. Used on the reporting server queue alone.
 class ZRReportingSession : public std::enable_shared_from_this<ZRReportingSession> {
     struct Created {
         explicit Created() = default;
@@ -49,7 +48,7 @@ public:
     ZRReportingSession(const ZRReportingSession&) = delete;
     ZRReportingSession& operator=(const ZRReportingSession&) = delete;
 
-    /// Nothing here asks for them yet.
+    /// The rows of all worker classes, whether or not a session may have one.
     [[nodiscard]] static std::span<const WorkerClass> getAllWorkerClasses() { return workerClassList(); }
 
     void setServiceType(AudioServiceType serviceType);
@@ -68,8 +67,9 @@ public:
     /// whether or not the session is started. The reply is called at the end. Between the parts of a stop,
     /// only by workers in their own `stop`: what others have to send waits until it is over.
     void sendMessage(const MessageRef& message, ErrorReply reply = {});
-    /// Keeps back the reply of the message that is being handled, for a worker that has something to do for
-    /// it on another queue: until what this returns, and whatever else it returned for the message, is gone.
+    /// For a worker that has to do something for the message at hand on another queue: keeps back the
+    /// message's reply until the worker lets go of the token that this returns. Each call for one message
+    /// returns the same token.
     [[nodiscard]] std::shared_ptr<const void> holdReply();
     void stop();
     /// Does the next part of the stop, some milliseconds of it, and answers whether the session is stopped.
@@ -121,7 +121,7 @@ public:
     /// Lets go of some thousand messages of a session that is about to go, and is not stopping. Whether none
     /// is left.
     [[nodiscard]] bool letGoSome();
-    /// Nothing here asks for it yet.
+    /// How many workers the session has made, started or not.
     [[nodiscard]] std::size_t workerInstanceCount() const noexcept { return messageWorkers_.size(); }
     [[nodiscard]] std::string description() const;
 

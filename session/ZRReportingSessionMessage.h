@@ -40,7 +40,8 @@ public:
     /// Changes the payload in place; `edit` is given the dictionary.
     template <typename Edit> void editPayload(Edit&& edit) { edit(message_); }
 
-    /// The only consumer workers that are to see the message; empty for all of them. Nothing here asks yet.
+    /// The only consumer workers that are to see the message; empty for all of them. A copy: what is asked of
+    /// each message is `isFor`.
     [[nodiscard]] DestinationWorkers destinationWorkers() const;
     void setDestinationWorkers(DestinationWorkers workers);
     /// Whether a consumer worker of this class is to see it.

@@ -24,7 +24,7 @@ public:
 
     /// Null once the session is gone.
     [[nodiscard]] std::shared_ptr<ZRReportingSession> session() const noexcept { return session_.lock(); }
-    /// Nothing here calls it yet: a worker is made for its session.
+    /// Gives the worker another session; it is made with its own.
     void setSession(std::weak_ptr<ZRReportingSession> session) noexcept { session_ = std::move(session); }
     /// Set by the session alone, after `start` and `stop`.
     [[nodiscard]] bool started() const noexcept { return started_; }
@@ -33,14 +33,15 @@ public:
     /// Whether the worker is started now; nothing from a worker that has nothing to do at its start, which
     /// then is.
     virtual std::optional<bool> start() { return std::nullopt; }
-    /// Called only while started. A producer sends its derived messages from here, through the session.
-    virtual void stop() {}
-    /// Does the next part of the stop, for a worker that walks all messages of its session; whether it is
-    /// done. Between two parts the server queue does the work of others. The session's messages stay as they
-    /// are.
-    [[nodiscard]] virtual bool stopSome() {
-        stop();
-        return true;
+    /// Does the next part of the stop; whether it is done. Called only while started. A producer sends its
+    /// derived messages from here, through the session. Some milliseconds at most: a worker that walks all
+    /// messages of its session does so in parts, between which the server queue does the work of others. The
+    /// session's messages stay as they are meanwhile.
+    [[nodiscard]] virtual bool stopSome() { return true; }
+    /// The whole stop at once.
+    void stop() {
+        while (!stopSome()) {
+        }
     }
 
     /// For consumers. One message, which other workers share; what goes wrong with it is the worker's own to

@@ -86,7 +86,7 @@ public:
     ZRReportingDriverUtility(const ZRReportingDriverUtility&) = delete;
     ZRReportingDriverUtility& operator=(const ZRReportingDriverUtility&) = delete;
 
-    /// Nothing here asks for them yet.
+    /// One for each driver that had channels.
     [[nodiscard]] const std::vector<ZRReportingIOChannelSubscription>&
     ioChannelSubscriptions() const noexcept {
         return ioChannelSubscriptions_;

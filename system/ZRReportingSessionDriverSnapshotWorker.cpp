@@ -7,9 +7,10 @@ std::optional<bool> ZRReportingSessionDriverSnapshotWorker::start() {
     return true;
 }
 
-void ZRReportingSessionDriverSnapshotWorker::stop() {
+bool ZRReportingSessionDriverSnapshotWorker::stopSome() {
     utility().sendDriverLogsForSession(session(), driverSnapShot_ ? &*driverSnapShot_ : nullptr);
     driverSnapShot_.reset();
+    return true;
 }
 
 const ZRReportingDriverUtility& ZRReportingSessionDriverSnapshotWorker::utility() const {

@@ -15,7 +15,7 @@ public:
     using ZRReportingSessionWorkerProducerProtocol::ZRReportingSessionWorkerProducerProtocol;
 
     std::optional<bool> start() override;
-    void stop() override;
+    [[nodiscard]] bool stopSome() override;
 
 private:
     [[nodiscard]] const ZRReportingDriverUtility& utility() const;

@@ -32,8 +32,9 @@ std::optional<bool> ZRReportingSessionSystemMonitorWorker::start() {
     return true;
 }
 
-void ZRReportingSessionSystemMonitorWorker::stop() {
+bool ZRReportingSessionSystemMonitorWorker::stopSome() {
     observations_.clear();
+    return true;
 }
 
 void ZRReportingSessionSystemMonitorWorker::keyValueChanged(std::string_view key) {

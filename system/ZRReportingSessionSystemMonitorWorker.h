@@ -22,7 +22,7 @@ public:
     ZRReportingSessionSystemMonitorWorker(Context& context, std::weak_ptr<ZRReportingSession> session);
 
     std::optional<bool> start() override;
-    void stop() override;
+    [[nodiscard]] bool stopSome() override;
     void keyValueChanged(std::string_view key) override;
 
 private:

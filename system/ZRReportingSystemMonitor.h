@@ -34,7 +34,7 @@ public:
     /// as the process. Any thread.
     [[nodiscard]] static std::vector<std::string_view> getSystemMonitorKeys(Context& context);
     /// Drops the context's monitor; its snapshot changes no more. On the monitor's queue, or when that is at
-    /// rest. Nothing here calls it yet.
+    /// rest. The next `initializeWithQueue` makes another.
     static void reset(Context& context);
 
     /// A monitor whose snapshot is filled, and which listens. The queue must outlive its registrations.
@@ -45,10 +45,10 @@ public:
     ZRReportingSystemMonitor(const ZRReportingSystemMonitor&) = delete;
     ZRReportingSystemMonitor& operator=(const ZRReportingSystemMonitor&) = delete;
 
-    /// The preferences that say how to report, as they are now: "disable_reporting", which turns nothing off
-    /// yet, and "device_name" where there is one.
+    /// The preferences that say how to report, as they are now: "disable_reporting", which turns nothing off,
+    /// and "device_name" where there is one.
     [[nodiscard]] static Dictionary ZRReportingDefaults(const Platform& platform);
-    /// The same as they were when the monitor was made. Nothing here asks for them yet.
+    /// The same as they were when the monitor was made.
     [[nodiscard]] const Dictionary& getDefaults() const noexcept { return defaults_; }
     /// The feature table as it is logged: a dictionary for each feature's name.
     [[nodiscard]] Dictionary features() const;

@@ -65,8 +65,8 @@ inline constexpr std::string_view ZRReportingServiceNameUnknown = "unknown";
 /// the separator. The unknown category is "Undefined", which `ZRReportingUtilityCategoryFromString` does not
 /// know.
 [[nodiscard]] std::string ZRReportingUtilityCategoryString(AudioEventCategory category);
-/// Knows the kinds 1 to 16 without a subsystem, and "Unknown"; anything else is the unknown category. Nothing
-/// here calls the functions that read a name yet.
+/// Knows the kinds 1 to 16 without a subsystem, and "Unknown"; anything else is the unknown category. For
+/// settings and tools that give a category or type by its name.
 [[nodiscard]] AudioEventCategory ZRReportingUtilityCategoryFromString(std::string_view name) noexcept;
 /// A value without a name is "Generic".
 [[nodiscard]] std::string_view ZRReportingUtilityTypeString(AudioEventType type) noexcept;

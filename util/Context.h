@@ -59,7 +59,7 @@ private:
     std::vector<std::pair<std::type_index, std::shared_ptr<void>>> shared_ TAMBLO_GUARDED_BY(mutex_);
 };
 
-/// The same of the context of the process. Nothing here calls them yet.
+/// The same of the context of the process, for code that is handed no context.
 [[nodiscard]] inline SerialQueue& ZRReportingUtilityGetReportingServerQueue() noexcept {
     return Context::current().serverQueue();
 }

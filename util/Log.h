@@ -37,6 +37,9 @@ void appendText(std::string& out, const NumberList& list);
 /// One function per level. A line is the prefix, "%25s:%-5d " of the source unit's name and the line number,
 /// and the formatted text. Arguments become text only when the level is on for the category, and the log has
 /// room for one more such line of the client for whom the thread works (`LogOrigin`).
+///
+/// So the plain names are limited here, as most work is done for a client, and `ownError` alone is not; with
+/// the platform's `StructuredLog` it is the other way round.
 namespace tamblo::log {
 
 namespace detail {

@@ -8,8 +8,8 @@
 
 namespace tamblo {
 
-// Small functions of the vocabulary. Nothing here calls those named `ZRReportingUtility…` yet: they are for
-// workers to come. Any thread.
+// Small functions for workers. Those named `ZRReportingUtility…` are vocabulary that every worker may count
+// on, whether or not one of this tree calls them. Any thread.
 
 /// Whether both values are there and differ.
 [[nodiscard]] inline bool isPresentAndHasChanged(const Value* before, const Value* after) noexcept {

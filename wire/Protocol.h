@@ -1,5 +1,6 @@
 #pragma once
 
+#include "base/ReplyError.h"
 #include "base/TextBuffer.h"
 
 #include <cstddef>
@@ -24,20 +25,13 @@ inline constexpr std::size_t kMaximumFrameBytes = 1024 * 1024;
 
 enum class FrameKind : std::uint8_t { request = 0, reply = 1, requestWithoutReply = 2 };
 
-/// The domain of the protocol's own errors; their codes are those of JSON-RPC 2.0.
-inline constexpr std::string_view kProtocolErrorDomain = "com.vandra.tamblo.protocol";
-inline constexpr std::int64_t kLimitReached = -32000; ///< JSON-RPC leaves it to the server
+using Error = ReplyError;
+using tamblo::kLimitReached;
+using tamblo::kProtocolErrorDomain;
 inline constexpr std::int64_t kNotWellFormed = -32700;
 inline constexpr std::int64_t kNotARequest = -32600;
 inline constexpr std::int64_t kUnknownMethod = -32601;
 inline constexpr std::int64_t kWrongParameters = -32602;
-
-/// An error as a reply brings it: of the service's own domain, the protocol's, or the client library's.
-struct Error {
-    std::string domain;
-    std::int64_t code = 0;
-    std::string message; ///< empty: absent
-};
 
 /// Begins a frame at the end of the buffer: leaves room for its length, behind which the item is written.
 /// What is answered belongs to `finishFrame`.

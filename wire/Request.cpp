@@ -215,10 +215,6 @@ std::optional<Refusal> readRequest(CborReader& reader, const RequestLimits& limi
 
 } // namespace
 
-Error limitReached(std::string_view name, std::size_t limit) {
-    return {std::string(kProtocolErrorDomain), kLimitReached, formatted("{}: at most {}", name, limit)};
-}
-
 std::optional<Refusal> decodeRequest(std::span<const std::uint8_t> item, KeySetCache& keySets,
                                      Request& request, const RequestLimits& limits) {
     CborReader reader(item, &keySets, limits.values);

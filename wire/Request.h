@@ -53,8 +53,6 @@ struct Refusal {
 /// refusal the request is left in an unspecified state. Keys of payloads are shared through the cache.
 [[nodiscard]] std::optional<Refusal> decodeRequest(std::span<const std::uint8_t> item, KeySetCache& keySets,
                                                    Request& request, const RequestLimits& limits = {});
-/// That a limit is reached, which the text names.
-[[nodiscard]] Error limitReached(std::string_view name, std::size_t limit);
 
 /// Begins a request's frame: everything before its first parameter. What is answered belongs to
 /// `finishFrame`. An id is written in its longest form, so that `replaceId` can put another one in its place.

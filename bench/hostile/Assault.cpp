@@ -4,7 +4,6 @@
 
 #include "os/LocalAddress.h"
 #include "wire/FrameSplitter.h"
-#include "wire/Reply.h"
 
 #include <cerrno>
 #include <thread>

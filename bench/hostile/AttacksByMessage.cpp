@@ -123,7 +123,7 @@ void largeValuesUnderNewKeys(const Assault& assault) {
     });
 }
 
-/// The messages of one that has no better name for what it counts, retained in some sessions; then it goes.
+/// Messages with two keys each that no other has, retained in some sessions; then the client goes.
 void distinctKeysThatAreGone(const Assault& assault) {
     constexpr int kMessagesOfSession = 500;
     HostileClient client(assault);

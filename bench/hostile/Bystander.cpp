@@ -5,6 +5,7 @@
 #include "Assault.h"
 #include "Users.h"
 
+#include <stdexcept>
 #include <thread>
 
 namespace tamblo::bench {

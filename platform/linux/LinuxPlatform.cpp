@@ -120,6 +120,10 @@ struct LinuxPlatform::Services {
     }
     Services(const Services&) = delete;
     Services& operator=(const Services&) = delete;
+    [[nodiscard]] const Limits& readLimits() {
+        platform.limits = Limits::read(preferences);
+        return platform.limits;
+    }
     /// What it is doing, in a line for people.
     [[nodiscard]] std::string status() {
         const Activity& activity = *platform.activity;
@@ -156,7 +160,7 @@ struct LinuxPlatform::Services {
         provide<LinuxDeviceProperties>(platform.deviceProperties, directories.deviceProperties(), log);
     LinuxPreferences& preferences =
         provide<LinuxPreferences>(platform.preferences, directories.preferences(), log);
-    const Limits& limits = platform.limits = Limits::read(preferences);
+    const Limits& limits = readLimits();
     const FileModes fileModes = FileModes::read(preferences, log);
     SinkFiles& sinks = sinkFiles.emplace(directories.logs, log, FileOperations::system(), fileModes);
     LinuxAnalyticsEventService& analyticsEvents =
@@ -217,10 +221,10 @@ const Platform& LinuxPlatform::services() const noexcept {
     return services_->platform;
 }
 
-void LinuxPlatform::run(SerialQueue& requestQueue,
+void LinuxPlatform::run(SerialQueue& serverQueue,
                         const std::function<void(std::function<void()> completion)>& shutDown) {
     Services& all = *services_;
-    requestQueue.setBatchEnd([&all] {
+    serverQueue.setBatchEnd([&all] {
         all.sinks.flush();
         all.connections.releaseReplies();
         all.health.update();
@@ -230,7 +234,7 @@ void LinuxPlatform::run(SerialQueue& requestQueue,
         all.loop.post([&all, delay] { all.loop.callAfter(delay, [&all] { all.workQueues.help(); }); });
     });
     all.workQueues.setRunEnd([&all] { all.callQuality.flush(); });
-    all.connections.setRequestQueue(requestQueue, all.workQueues);
+    all.connections.setServerQueue(serverQueue, all.workQueues);
     all.signals.setEndWanted([&all, &shutDown] {
         notifyServiceManager("STOPPING=1");
         // What clients sent before the signal is read first, as far as it came with the same wake-up.
@@ -240,7 +244,7 @@ void LinuxPlatform::run(SerialQueue& requestQueue,
         });
     });
     notifyServiceManager("READY=1");
-    all.health.watch(requestQueue);
+    all.health.watch(serverQueue);
     all.loop.run(all.workQueues);
     all.signals.letEnd();
     // What ended the loop may have left more for the queues, which the service has to outlive.

@@ -25,11 +25,10 @@ public:
     [[nodiscard]] const Platform& services() const noexcept;
 
     /// Carries out requests until the first SIGTERM or SIGINT, then `shutDown`, and returns once that has
-    /// called the completion that it is given, with the queues at rest and every connection gone. The request
+    /// called the completion that it is given, with the queues at rest and every connection gone. The server
     /// queue is written out and answered batch by batch: first what a batch recorded goes to the sinks'
     /// files, then its replies go to the clients.
-    void run(SerialQueue& requestQueue,
-             const std::function<void(std::function<void()> completion)>& shutDown);
+    void run(SerialQueue& serverQueue, const std::function<void(std::function<void()> completion)>& shutDown);
 
 private:
     class Signals;

@@ -1,4 +1,5 @@
 #include "os/FileDescriptor.h"
+#include "platform/LogOrigin.h"
 #include "platform/linux/log/LinuxStructuredLog.h"
 #include "platform/linux/log/LinuxTracePoints.h"
 #include "tests/platform/LinuxServiceSupport.h"
@@ -179,11 +180,11 @@ TEST(LinuxStructuredLogTest, NeitherWaitsForAReaderNorEndsWithIt) {
 }
 
 TEST(LinuxStructuredLogTest, LimitsWhatClientsCauseAndNothingElse) {
-    const auto linesOf = [](std::string_view filter, std::optional<LogOrigin::Client> client, bool isOwn) {
+    const auto linesOf = [](std::string_view filter, std::optional<ClientIdentity> client, bool isOwn) {
         const LogReader reader(false);
         {
             LinuxStructuredLog log(reader.out.get(), filter);
-            const LogOrigin outer(LogOrigin::Client{77, 1});
+            const LogOrigin outer(ClientIdentity{77, 1});
             const LogOrigin origin(client);
             for (int line = 0; line < 500; ++line) {
                 isOwn ? log.report(LogLevel::error, "zrrs", "no disk")
@@ -193,15 +194,15 @@ TEST(LinuxStructuredLogTest, LimitsWhatClientsCauseAndNothingElse) {
         return reader.take();
     };
     const auto count = [](const std::string& text) { return std::ranges::count(text, '\n'); };
-    const std::string limited = linesOf("", LogOrigin::Client{1000, 4242}, false);
+    const std::string limited = linesOf("", ClientIdentity{1000, 4242}, false);
     std::smatch told;
     ASSERT_TRUE(std::regex_search(limited, told,
                                   std::regex("<3>zrrs +LogTest:[0-9]+ +([0-9]+) further lines like "
                                              "\"no reporter \\{\\}\" were left out. uid=1000 pid=4242\n$")));
     EXPECT_EQ(count(limited) - 1 + std::stoi(told[1]), 500);
-    EXPECT_EQ(count(linesOf("", LogOrigin::Client{1000, 4242}, true)), 500) << "the service's own";
+    EXPECT_EQ(count(linesOf("", ClientIdentity{1000, 4242}, true)), 500) << "the service's own";
     EXPECT_EQ(count(linesOf("", std::nullopt, false)), 500) << "nobody's";
-    EXPECT_EQ(count(linesOf("zrrs=info", LogOrigin::Client{1000, 4242}, false)), 500) << "asked for";
+    EXPECT_EQ(count(linesOf("zrrs=info", ClientIdentity{1000, 4242}, false)), 500) << "asked for";
 }
 
 TEST(LinuxTracePointsTest, WritesTheCodeToTheFirstMarkerThereIs) {

@@ -153,12 +153,12 @@ TEST(SerialQueue, WorkIsItsPostersClientsWhereverItRuns) {
     LinuxWorkQueues queues;
     const auto queue = queues.makeSerialQueue("origin");
     std::vector<pid_t> seen; // unguarded: the queue is the guard
-    const auto note = [&seen] { seen.push_back(LogOrigin::client().value_or(LogOrigin::Client{}).process); };
+    const auto note = [&seen] { seen.push_back(LogOrigin::client().value_or(ClientIdentity{}).process); };
     std::promise<void> called;
     std::unique_ptr<DelayedCall> call;
     queues.beginWakeUp();
     {
-        const LogOrigin origin(LogOrigin::Client{1000, 7});
+        const LogOrigin origin(ClientIdentity{1000, 7});
         queue->post(note);
         queue->post([&] { queue->post(note, Pace::mayBlock); });
         call = queues.callAfter(milliseconds(0), [&] {
@@ -232,7 +232,7 @@ TEST(ConnectionService, EndsAClientWhoseSocketCannotBeWatchedAndServesTheOthers)
     LinuxWorkQueues queues;
     const auto requests = queues.makeSerialQueue("requests");
     Delegate delegate;
-    service.setRequestQueue(*requests, queues);
+    service.setServerQueue(*requests, queues);
     service.setDelegate(delegate);
     ASSERT_EQ(service.open(directory.path()), std::nullopt);
     service.resume(); // nor can the listener's own socket, for a moment

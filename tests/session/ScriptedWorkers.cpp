@@ -28,11 +28,12 @@ public:
         script.saw("start " + name_);
         return !script.notStarting.contains(name_);
     }
-    void stop() override {
+    bool stopSome() override {
         script.saw("stop " + name_);
         if (script.atStop.contains(name_)) {
             script.atStop[name_](*session());
         }
+        return true;
     }
     void handleMessage(const MessageRef& message) override {
         script.saw(formatted("message {} {}/{}", name_, message->category(), message->type()));

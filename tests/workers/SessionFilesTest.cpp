@@ -246,7 +246,11 @@ SessionTrace marksOf(const std::string& messages, AudioEventType type = AudioEve
     SessionTrace trace;
     trace.recorded.begin = kStart;
     trace.recorded.end = kStart + 10s;
-    addMarks(trace, messagesOf(messages, secondsSince1970(kStart), type));
+    MarkSearch search(trace);
+    for (const MessageRef& message : messagesOf(messages, secondsSince1970(kStart), type)) {
+        search.take(*message);
+    }
+    search.finish();
     return trace;
 }
 

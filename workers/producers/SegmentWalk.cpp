@@ -26,7 +26,7 @@ Seconds SegmentStart::until(const Value* timestamp) const noexcept {
     return Seconds(secondsOf(timestamp) - secondsOf(timestamp_));
 }
 
-bool differAsTexts(const Value* left, const Value* right) noexcept {
+bool settingsDiffer(const Value* left, const Value* right) noexcept {
     if (left == nullptr || right == nullptr) {
         return false;
     }
@@ -111,6 +111,11 @@ std::unique_ptr<RapidMessages> rapidSpatialAudioSettings(Seconds longestPause) {
 
 Dictionary previousValuesOf(const std::shared_ptr<ZRReportingSession>& session) {
     return session != nullptr ? session->previousValues() : Dictionary();
+}
+
+std::optional<Value> applicationOf(const std::shared_ptr<ZRReportingSession>& session) {
+    return session != nullptr ? std::optional(ZRReportingUtilityRetrieveAppName(session->configuration()))
+                              : std::nullopt;
 }
 
 Seconds leastLengthOf(const std::shared_ptr<ZRReportingSession>& session) {

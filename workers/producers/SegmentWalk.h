@@ -14,7 +14,6 @@
 #include <memory>
 #include <optional>
 #include <span>
-#include <string>
 #include <string_view>
 #include <utility>
 #include <vector>
@@ -47,8 +46,10 @@ private:
     const Value* timestamp_ = nullptr;
 };
 
-/// Wherever two values are compared, one that is absent is unchanged.
-[[nodiscard]] bool differAsTexts(const Value* left, const Value* right) noexcept;
+// Wherever two values are compared, one that is absent is unchanged.
+/// Two numbers are compared as numbers, a number with a text as it is written, anything else as texts.
+[[nodiscard]] bool settingsDiffer(const Value* left, const Value* right) noexcept;
+/// Anything but a number by the number that it reads as.
 [[nodiscard]] bool differAsNumbers(const Value* left, const Value* right) noexcept;
 
 /// A length of time as summaries carry it, in single precision.
@@ -92,15 +93,17 @@ private:
 
 /// What a walk begins with: what the session's earlier runs left, nothing once the session is gone.
 [[nodiscard]] Dictionary previousValuesOf(const std::shared_ptr<ZRReportingSession>& session);
+/// The application that the session's summaries name; none once the session is gone.
+[[nodiscard]] std::optional<Value> applicationOf(const std::shared_ptr<ZRReportingSession>& session);
 
-/// What a walk derives of messages, bursts folded where that is asked for; a part at a time, since a session
-/// may have hundreds of thousands. The messages must not change in between.
+/// A walk and what it derives of messages, bursts folded where that is asked for; a part at a time, since a
+/// session may have hundreds of thousands. The messages must not change in between.
 template <typename Walk> class Derivation {
 public:
     /// Messages that are looked at in one part.
     static constexpr std::size_t kMessagesOfPart = 10'000;
 
-    Derivation(Walk walk, std::unique_ptr<RapidMessages> rapid)
+    explicit Derivation(Walk walk, std::unique_ptr<RapidMessages> rapid = nullptr)
         : walk_(std::move(walk)), rapid_(std::move(rapid)) {}
 
     /// Does the next part. Whether all is done.
@@ -135,11 +138,10 @@ private:
 /// The least length of a segment that is reported of the session.
 [[nodiscard]] Seconds leastLengthOf(const std::shared_ptr<ZRReportingSession>& session);
 
-/// What a walk over these messages derives.
+/// All that is derived of these messages.
 template <typename Walk>
-[[nodiscard]] std::vector<MessageRef> derivedBy(Walk walk, std::span<const MessageRef> messages,
-                                                std::unique_ptr<RapidMessages> rapid = nullptr) {
-    Derivation<Walk> derivation(std::move(walk), std::move(rapid));
+[[nodiscard]] std::vector<MessageRef> derivedBy(Derivation<Walk> derivation,
+                                                std::span<const MessageRef> messages) {
     while (!derivation.deriveSome(messages)) {
     }
     return derivation.finish();
@@ -161,13 +163,13 @@ private:
     std::size_t sent_ = 0;
 };
 
-/// What a producer does when its session stops: has a walk make messages of what the session recorded and
-/// sends them into it.
+/// What a producer does when its session stops: derives messages of what the session recorded and sends them
+/// into it.
 template <typename Walk>
 [[nodiscard]] PartOfStop derivingStop(std::weak_ptr<ZRReportingSession> session, std::string_view what,
-                                      Walk walk, std::unique_ptr<RapidMessages> rapid = nullptr) {
+                                      Derivation<Walk> ofSession) {
     return [session = std::move(session), what,
-            derivation = std::make_unique<Derivation<Walk>>(std::move(walk), std::move(rapid)),
+            derivation = std::make_unique<Derivation<Walk>>(std::move(ofSession)),
             sending = std::optional<DerivedSending>()]() mutable {
         const std::shared_ptr<ZRReportingSession> owner = session.lock();
         if (owner == nullptr || (!sending && owner->messages().empty())) {

@@ -168,27 +168,28 @@ private:
     DerivedMessages derived_{kWords};
 };
 
+/// One walk for the session, with bursts folded.
+Derivation<InputWalk> walk(const std::shared_ptr<ZRReportingSession>& session, std::optional<Value> process,
+                           Seconds minimum) {
+    return Derivation(InputWalk(previousValuesOf(session), std::move(process), minimum),
+                      rapidSpatialAudioSettings(kLongestPauseInBurst));
+}
+
 } // namespace
 
 bool ZRReportingSessionInputMessagesWorker::stopSome() {
     return stopPart(stopLeft_, [this] {
         const std::shared_ptr<ZRReportingSession> owner = session();
         return derivingStop(owner, "input summary event",
-                            InputWalk(previousValuesOf(owner),
-                                      owner != nullptr ? std::optional(ZRReportingUtilityRetrieveAppName(
-                                                             owner->configuration()))
-                                                       : std::nullopt,
-                                      leastLengthOf(owner)),
-                            rapidSpatialAudioSettings(kLongestPauseInBurst));
+                            walk(owner, applicationOf(owner), leastLengthOf(owner)));
     });
 }
 
 std::vector<MessageRef> ZRReportingSessionInputMessagesWorker::createInputMessages(
     const std::vector<MessageRef>& messages, const Value* process, Seconds minimumRunningtime) const {
-    return derivedBy(InputWalk(previousValuesOf(session()),
-                               process != nullptr ? std::optional(*process) : std::nullopt,
-                               minimumRunningtime),
-                     messages, rapidSpatialAudioSettings(kLongestPauseInBurst));
+    return derivedBy(
+        walk(session(), process != nullptr ? std::optional(*process) : std::nullopt, minimumRunningtime),
+        messages);
 }
 
 } // namespace tamblo

@@ -16,10 +16,6 @@ class ZRReportingSessionInputMessagesWorker final : public ZRReportingSessionWor
 public:
     using ZRReportingSessionWorkerProducerProtocol::ZRReportingSessionWorkerProducerProtocol;
 
-    void stop() override {
-        while (!stopSome()) {
-        }
-    }
     [[nodiscard]] bool stopSome() override;
 
     /// The summaries of the messages, which must not change meanwhile but for the bursts of spatial-audio

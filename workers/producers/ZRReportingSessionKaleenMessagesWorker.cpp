@@ -73,8 +73,8 @@ bool watchedFieldChangeInMessage(const Fields& message, const Fields& previous) 
     };
     return differ(Field::running, &Value::boolValue) || differ(Field::group, &Value::integerValue) ||
            differ(Field::channels, &Value::integerValue) ||
-           differAsTexts(message[Field::formatID], previous[Field::formatID]) ||
-           differAsTexts(message[Field::devices], previous[Field::devices]);
+           settingsDiffer(message[Field::formatID], previous[Field::formatID]) ||
+           settingsDiffer(message[Field::devices], previous[Field::devices]);
 }
 
 /// One walk over a session's messages.
@@ -162,23 +162,26 @@ private:
     DerivedMessages derived_{kWords};
 };
 
+/// One walk for the session.
+Derivation<KaleenWalk> walk(const Context& context, const std::shared_ptr<ZRReportingSession>& session,
+                            Seconds minimum) {
+    return Derivation(
+        KaleenWalk(previousValuesOf(session), minimum, destinations(context.isInternalBuild())));
+}
+
 } // namespace
 
 bool ZRReportingSessionKaleenMessagesWorker::stopSome() {
     return stopPart(stopLeft_, [this] {
         const std::shared_ptr<ZRReportingSession> owner = session();
-        return derivingStop(owner, "kaleen event",
-                            KaleenWalk(previousValuesOf(owner), leastLengthOf(owner),
-                                       destinations(context().isInternalBuild())));
+        return derivingStop(owner, "kaleen event", walk(context(), owner, leastLengthOf(owner)));
     });
 }
 
 std::vector<MessageRef>
 ZRReportingSessionKaleenMessagesWorker::createKaleenMessages(const std::vector<MessageRef>& messages,
                                                              Seconds minimumPlaytime) const {
-    return derivedBy(
-        KaleenWalk(previousValuesOf(session()), minimumPlaytime, destinations(context().isInternalBuild())),
-        messages);
+    return derivedBy(walk(context(), session(), minimumPlaytime), messages);
 }
 
 } // namespace tamblo

@@ -15,10 +15,6 @@ class ZRReportingSessionKaleenMessagesWorker final : public ZRReportingSessionWo
 public:
     using ZRReportingSessionWorkerProducerProtocol::ZRReportingSessionWorkerProducerProtocol;
 
-    void stop() override {
-        while (!stopSome()) {
-        }
-    }
     [[nodiscard]] bool stopSome() override;
 
     /// The summaries of the messages.

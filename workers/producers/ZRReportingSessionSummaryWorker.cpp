@@ -69,11 +69,12 @@ void ZRReportingSessionSummaryWorker::handleMessage(const MessageRef& message) {
     }
 }
 
-void ZRReportingSessionSummaryWorker::stop() {
+bool ZRReportingSessionSummaryWorker::stopSome() {
     if (const std::shared_ptr<ZRReportingSession> owner = session()) {
         owner->sendMessage(std::make_shared<ZRReportingSessionMessage>(
             summaryOf(*owner), AudioEventSubsystemSession | AudioEventKindGeneric, AudioEventTypeSummary));
     }
+    return true;
 }
 
 Dictionary ZRReportingSessionSummaryWorker::summaryOf(const ZRReportingSession& session) const {

@@ -20,7 +20,7 @@ public:
 
     std::optional<bool> start() override { return true; }
     void handleMessage(const MessageRef& message) override;
-    void stop() override;
+    [[nodiscard]] bool stopSome() override;
 
 private:
     struct Places;

@@ -111,8 +111,8 @@ private:
     }
 
     [[nodiscard]] bool isSettingChanged(const Fields& message) const {
-        return differAsTexts(message[Field::format], state_[Field::format]) ||
-               differAsTexts(message[Field::devices], state_[Field::devices]) ||
+        return settingsDiffer(message[Field::format], state_[Field::format]) ||
+               settingsDiffer(message[Field::devices], state_[Field::devices]) ||
                differAsNumbers(message[Field::spatialized], state_[Field::spatialized]) ||
                differAsNumbers(message[Field::ringer], state_[Field::ringer]) ||
                differAsNumbers(message[Field::volume], state_[Field::volume]);
@@ -158,26 +158,27 @@ private:
     DerivedMessages derived_{kWords};
 };
 
+/// One walk for the session, with bursts folded.
+Derivation<VolumeWalk> walk(const std::shared_ptr<ZRReportingSession>& session, std::optional<Value> process,
+                            Seconds minimum) {
+    return Derivation(VolumeWalk(previousValuesOf(session), std::move(process), minimum),
+                      rapidSpatialAudioSettings(kLongestPauseInBurst));
+}
+
 } // namespace
 
 bool ZRReportingSessionVolumeMessagesWorker::stopSome() {
     return stopPart(stopLeft_, [this] {
         const std::shared_ptr<ZRReportingSession> owner = session();
-        return derivingStop(owner, "volume event",
-                            VolumeWalk(previousValuesOf(owner),
-                                       owner != nullptr ? std::optional(ZRReportingUtilityRetrieveAppName(
-                                                              owner->configuration()))
-                                                        : std::nullopt,
-                                       leastLengthOf(owner)),
-                            rapidSpatialAudioSettings(kLongestPauseInBurst));
+        return derivingStop(owner, "volume event", walk(owner, applicationOf(owner), leastLengthOf(owner)));
     });
 }
 
 std::vector<MessageRef> ZRReportingSessionVolumeMessagesWorker::createVolumeMessages(
     const std::vector<MessageRef>& messages, const Value* process, Seconds minimumPlaytime) const {
-    return derivedBy(VolumeWalk(previousValuesOf(session()),
-                                process != nullptr ? std::optional(*process) : std::nullopt, minimumPlaytime),
-                     messages, rapidSpatialAudioSettings(kLongestPauseInBurst));
+    return derivedBy(
+        walk(session(), process != nullptr ? std::optional(*process) : std::nullopt, minimumPlaytime),
+        messages);
 }
 
 } // namespace tamblo

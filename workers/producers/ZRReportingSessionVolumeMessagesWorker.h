@@ -17,10 +17,6 @@ class ZRReportingSessionVolumeMessagesWorker final : public ZRReportingSessionWo
 public:
     using ZRReportingSessionWorkerProducerProtocol::ZRReportingSessionWorkerProducerProtocol;
 
-    void stop() override {
-        while (!stopSome()) {
-        }
-    }
     [[nodiscard]] bool stopSome() override;
 
     /// The summaries of the messages, which must not change meanwhile but for the bursts of spatial-audio

@@ -3,7 +3,6 @@
 #include "base/Dictionary.h"
 #include "util/AudioEvents.h"
 
-#include <cstddef>
 #include <cstdint>
 #include <vector>
 

@@ -125,11 +125,12 @@ void ZRReportingSessionQuilletWorker::handleMessage(const MessageRef& message) {
         });
 }
 
-void ZRReportingSessionQuilletWorker::stop() {
+bool ZRReportingSessionQuilletWorker::stopSome() {
     const std::shared_ptr<ZRReportingSession> owner = session();
     log::debug(ZRReportingSessionCategory(), "Resetting hasRun to false. reporterID={}",
                owner != nullptr ? owner->reporterID() : ReporterID{0});
     hasRun_ = false;
+    return true;
 }
 
 bool ZRReportingSessionQuilletWorker::interestedInMessage(const ZRReportingSessionMessage& message) {

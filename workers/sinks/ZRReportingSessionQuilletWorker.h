@@ -27,12 +27,12 @@ public:
 
     void handleMessage(const MessageRef& message) override;
     /// The next run of the session may have a draft again.
-    void stop() override;
+    [[nodiscard]] bool stopSome() override;
 
     /// Whether the message is worth a draft. Arms the worker, or begins the back-off period.
     [[nodiscard]] bool interestedInMessage(const ZRReportingSessionMessage& message);
-    /// Whether the time under the key is less than the back-off ago; if not, it is set to now,
-    /// for whoever asks here; soon for others.
+    /// Whether the time that is stored under the key is less than the back-off ago. If it is not, now takes
+    /// its place: at once for all sessions, and a moment later in the preferences.
     [[nodiscard]] bool hasRunInTimeframe(std::chrono::duration<double> backOff, std::string_view defaultsKey);
     [[nodiscard]] static BugReportDraft tikletDraftForTalvixXYerror();
 

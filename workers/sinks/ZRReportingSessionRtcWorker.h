@@ -37,10 +37,6 @@ public:
     }
     std::optional<bool> start() override;
     void handleMessage(const MessageRef& message) override;
-    void stop() override {
-        while (!stopSome()) {
-        }
-    }
     [[nodiscard]] bool stopSome() override;
 
 private:

@@ -30,10 +30,6 @@ public:
 
     /// Leaves its mark in the session's records: each payload gets the key that says whether the message was
     /// sent while the session was started.
-    void stop() override {
-        while (!stopSome()) {
-        }
-    }
     [[nodiscard]] bool stopSome() override;
 
 private:

@@ -80,10 +80,11 @@ std::optional<bool> ZRReportingSessionZephWorker::start() {
     return true;
 }
 
-void ZRReportingSessionZephWorker::stop() {
+bool ZRReportingSessionZephWorker::stopSome() {
     for (const Instance& instance : instances_) {
         instance.detector->stop();
     }
+    return true;
 }
 
 void ZRReportingSessionZephWorker::handleMessage(const MessageRef& message) {

@@ -34,7 +34,7 @@ public:
     std::optional<bool> start() override;
     void handleMessage(const MessageRef& message) override;
     [[nodiscard]] bool handleRedundantMessages() const override { return true; }
-    void stop() override;
+    [[nodiscard]] bool stopSome() override;
 
     /// The capture session's identifier in a reply, or "NONE_RETURNED". Any thread.
     [[nodiscard]] static std::string getSessionIdentifierFromResponse(const Dictionary& response);

@@ -101,12 +101,4 @@ void MarkSearch::finish() {
     walk_->finish();
 }
 
-void addMarks(SessionTrace& trace, std::span<const MessageRef> messages) {
-    MarkSearch search(trace);
-    for (const MessageRef& message : messages) {
-        search.take(*message);
-    }
-    search.finish();
-}
-
 } // namespace tamblo

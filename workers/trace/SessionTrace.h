@@ -9,7 +9,6 @@
 #include <cstdint>
 #include <memory>
 #include <optional>
-#include <span>
 #include <string>
 #include <string_view>
 #include <vector>
@@ -47,13 +46,10 @@ struct SessionTrace {
     std::uint64_t droppedMarks = 0;
 };
 
-/// Finds the stretches and issues of a stopped session in one pass over its messages, which are in the order
+/// Finds the stretches and issues of a stopped session in one pass over its messages, which come in the order
 /// of their times. Whether output and input run is read as the summaries' workers do: a `session_duration`
 /// ends both. Times outside the recording are moved to its begin or end, and stretches without length are
-/// left out.
-void addMarks(SessionTrace& trace, std::span<const MessageRef> messages);
-
-/// The same for messages that come a few at a time. The trace must stay where it is.
+/// left out. The trace must stay where it is.
 class MarkSearch {
 public:
     explicit MarkSearch(SessionTrace& trace);

@@ -26,10 +26,6 @@ public:
     initWithSession(Context& context, const std::shared_ptr<ZRReportingSession>& session);
 
     std::optional<bool> start() override;
-    void stop() override {
-        while (!stopSome()) {
-        }
-    }
     [[nodiscard]] bool stopSome() override;
 
 private:

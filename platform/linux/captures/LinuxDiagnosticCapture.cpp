@@ -2,7 +2,6 @@
 
 #include "base/Format.h"
 #include "platform/ProcessList.h"
-#include "platform/linux/sinks/PayloadSize.h"
 
 #include <algorithm>
 #include <map>
@@ -168,7 +167,7 @@ void LinuxDiagnosticCapture::captureStacks(StackCaptureRequest request) {
 }
 
 bool LinuxDiagnosticCapture::add(Waiting&& waiting) {
-    const std::size_t bytes = payloadSize(waiting.request.payload, sizeof(Value));
+    const std::size_t bytes = heldBytes(waiting.request.payload);
     if (waiting_.size() == kMaximumWaiting || bytes > kMaximumWaitingBytes - waitingBytes_) {
         return false;
     }

@@ -31,12 +31,12 @@ namespace {
 constexpr std::size_t kKeptCapacity = 64 * 1024;
 /// What a request takes while it waits, besides its values.
 constexpr std::size_t kRequestBytes = 256;
-/// A piece of the server queue ends once a client has more replies to get than this part of what its socket
-/// may refuse.
+// Parts of the limit of what a connection's socket may refuse (`reply_bytes`, 4 MiB by default).
+/// A piece of the server queue ends once a client has more replies to get than this: 256 KiB.
 constexpr std::size_t kPartOfPiece = 16;
-/// A client's requests wait while its socket has refused more than this part of what it may; a smaller one,
-/// where the user's connections have brought together half of the user's limit.
+/// A client's requests wait while its socket has refused more than this: 1 MiB.
 constexpr std::size_t kUnreadPart = 4;
+/// The same once the sockets of the user have refused half of the user's limit together: 64 KiB.
 constexpr std::size_t kUnreadPartOfMany = 64;
 /// A client whose requests wait for it to read is itself read no further than to this.
 constexpr std::size_t kWaitingBytesOfSuspended = 64 * 1024;
@@ -45,10 +45,8 @@ constexpr int kReadOnAtOnce = 16;
 /// A peer that takes nothing for so long does not read.
 constexpr std::chrono::seconds kPatienceWithPeer{1};
 
-static_assert(kLimitErrorDomain == wire::kProtocolErrorDomain && kLimitErrorCode == wire::kLimitReached);
-
 ReplyError outOfMemory() {
-    return {std::string(kLimitErrorDomain), kLimitErrorCode, "memory: the service has none left"};
+    return {std::string(kProtocolErrorDomain), kLimitReached, "memory: the service has none left"};
 }
 
 bool mayKillService(uid_t user) noexcept {
@@ -125,7 +123,7 @@ void LinuxConnection::read() {
 }
 
 void LinuxConnection::readOnce() {
-    if (ending_ != Ending::none || isHeldBack()) {
+    if (ending_ != Ending::none || holdBackIfFlooded()) {
         return;
     }
     const std::size_t waiting = waitingRequests_;
@@ -151,8 +149,8 @@ void LinuxConnection::readOnce() {
     }
 }
 
-/// Whether what waits has to be carried out first; the loop then hears nothing of the socket until it is.
-bool LinuxConnection::isHeldBack() {
+/// Has the loop hear nothing of the socket where too much waits, until that is carried out. Whether it does.
+bool LinuxConnection::holdBackIfFlooded() {
     const Limits& limits = shared_.limits;
     const MutexLock lock(mutex_);
     bool isHeld = waitingRequests_ > limits.waitingRequests ||
@@ -215,7 +213,7 @@ void LinuxConnection::takeFrames(std::span<const std::uint8_t> received) {
     }
     if (ending_ == Ending::none && frames.tooLong()) {
         refuse({.endsConnection = true,
-                .error = {std::string(wire::kProtocolErrorDomain), wire::kNotARequest,
+                .error = {std::string(kProtocolErrorDomain), wire::kNotARequest,
                           "a frame is longer than 1 MiB"}});
     }
     sendRefusals();
@@ -265,7 +263,7 @@ void LinuxConnection::endUnfinished() {
         }
     }
     endBeyond(
-        {std::string(kLimitErrorDomain), kLimitErrorCode,
+        {std::string(kProtocolErrorDomain), kLimitReached,
          formatted("frame_seconds: a frame was not finished within {} s", shared_.limits.frameSeconds)});
 }
 
@@ -276,9 +274,7 @@ std::size_t LinuxConnection::decodeAndDispatch(std::span<const std::uint8_t> ite
     }
     wire::Request& request = shared_.intake.request();
     if (request.method == wire::Method::killService && !mayKillService(peer_.user)) {
-        refuse({.id = request.id.value_or(0),
-                .error = {std::string(wire::kProtocolErrorDomain), wire::kLimitReached,
-                          "killService is for root and the service's own user"}});
+        refuseKill(request.id.value_or(0));
         return 0;
     }
     const std::size_t bytes = kRequestBytes + request.decodedBytes;
@@ -286,13 +282,26 @@ std::size_t LinuxConnection::decodeAndDispatch(std::span<const std::uint8_t> ite
     return bytes;
 }
 
-void LinuxConnection::refuse(const wire::Refusal& refusal) {
-    {
-        const MutexLock lock(mutex_);
-        wire::appendErrorReply(outgoing_, refusal.id, refusal.error);
-        hasRefusals_ = true;
+void LinuxConnection::addError(std::uint64_t id, const ReplyError& error) {
+    const MutexLock lock(mutex_);
+    wire::appendErrorReply(outgoing_, id, error);
+    hasRefusals_ = true;
+}
+
+void LinuxConnection::refuseKill(std::uint64_t id) {
+    // The code is that of a limit, but none is reached.
+    addError(id, {std::string(kProtocolErrorDomain), kLimitReached,
+                  "killService is for root and the service's own user"});
+    if (!std::exchange(isKillNoted_, true)) {
+        shared_.log.reportOfClient(LogLevel::error, "zrrs",
+                                   "a client may not end the service, and tried to. pid={} uid={}",
+                                   peer_.process, peer_.user);
     }
-    if (refusal.error.code == wire::kLimitReached) {
+}
+
+void LinuxConnection::refuse(const wire::Refusal& refusal) {
+    addError(refusal.id, refusal.error);
+    if (refusal.error.code == kLimitReached) {
         noteLimit(refusal.error.message);
     }
     if (refusal.endsConnection) {
@@ -318,7 +327,7 @@ void LinuxConnection::noteLimit(std::string_view limit) {
 
 void LinuxConnection::endBeyond(const ReplyError& limit) {
     if (ending_ == Ending::none) {
-        refuse({.endsConnection = true, .error = {limit.domain, limit.code, limit.message}});
+        refuse({.endsConnection = true, .error = limit});
         sendRefusals();
     }
 }
@@ -326,7 +335,7 @@ void LinuxConnection::endBeyond(const ReplyError& limit) {
 void LinuxConnection::turnAway(const ReplyError& reason) {
     // One line tells of all that are turned away until the user has fewer.
     isLimitNoted_ = std::exchange(user_->isTurnedAway, true);
-    refuse({.error = {reason.domain, reason.code, reason.message}});
+    refuse({.error = reason});
     sendRefusals();
 }
 
@@ -572,13 +581,13 @@ void LinuxConnection::beginEnd(Ending ending) {
     // What was read before is carried out, and answered, first. Replies go at the end of a batch, so the end
     // of the connection waits for the batch after the one that carries out the last request.
     requests_->post([self = shared_from_this()]() mutable {
-        SerialQueue& queue = self->shared_.intake.queue();
+        SerialQueue& queue = self->shared_.intake.serverQueue();
         queue.post([self = std::move(self)] { self->shared_.loop.post([self] { self->end(); }); });
     });
 }
 
-/// Whether the peer, which sends no more, is still to take replies.
-bool LinuxConnection::waitsForPeer() {
+/// Waits for a peer that sends no more and is still to take replies. Whether it is.
+bool LinuxConnection::beginWaitForPeer() {
     const MutexLock lock(mutex_);
     isWaitingForPeer_ = ending_ == Ending::orderly && unsent() != 0 && !isUnwritable_ && !isPatienceOver_;
     return isWaitingForPeer_;
@@ -589,7 +598,7 @@ void LinuxConnection::end() {
         return;
     }
     const LogOrigin origin(peer_);
-    if (waitsForPeer()) {
+    if (beginWaitForPeer()) {
         const MutexLock lock(mutex_);
         shared_.loop.callAfter(kPatienceWithPeer, [self = shared_from_this(), read = readByPeer()] {
             {

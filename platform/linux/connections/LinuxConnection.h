@@ -2,6 +2,7 @@
 
 #include "base/Mutex.h"
 #include "base/TextBuffer.h"
+#include "base/UniqueFunction.h"
 #include "os/FileDescriptor.h"
 #include "platform/ConnectionService.h"
 #include "platform/Limits.h"
@@ -15,6 +16,7 @@
 #include "platform/linux/loop/EventLoop.h"
 
 #include <atomic>
+#include <chrono>
 #include <cstddef>
 #include <cstdint>
 #include <memory>
@@ -141,18 +143,21 @@ private:
     void countUnfinished() TAMBLO_EXCLUDES(mutex_);
     /// Answers the bytes that the decoded request takes while it waits; 0 for a refused one.
     [[nodiscard]] std::size_t decodeAndDispatch(std::span<const std::uint8_t> item) TAMBLO_EXCLUDES(mutex_);
-    /// Appends the refusal to what is sent, and notes and ends what it asks for.
+    /// Adds an error to what `sendRefusals` sends.
+    void addError(std::uint64_t id, const ReplyError& error) TAMBLO_EXCLUDES(mutex_);
+    /// The same for a request, and notes and ends what the refusal asks for.
     void refuse(const wire::Refusal& refusal) TAMBLO_EXCLUDES(mutex_);
+    void refuseKill(std::uint64_t id) TAMBLO_EXCLUDES(mutex_);
     void sendRefusals() TAMBLO_EXCLUDES(mutex_);
     /// Ends the connection with an error frame that names the limit.
     void endBeyond(const ReplyError& limit) TAMBLO_EXCLUDES(mutex_);
-    [[nodiscard]] bool isHeldBack() TAMBLO_EXCLUDES(mutex_);
+    [[nodiscard]] bool holdBackIfFlooded() TAMBLO_EXCLUDES(mutex_);
     void carriedOut(std::size_t requests, std::size_t bytes) TAMBLO_EXCLUDES(mutex_);
     void readOn() TAMBLO_EXCLUDES(mutex_);
     void readOnOthers() TAMBLO_EXCLUDES(mutex_);
     void beginEnd(Ending ending) TAMBLO_EXCLUDES(mutex_);
     void end() TAMBLO_EXCLUDES(mutex_);
-    [[nodiscard]] bool waitsForPeer() TAMBLO_EXCLUDES(mutex_);
+    [[nodiscard]] bool beginWaitForPeer() TAMBLO_EXCLUDES(mutex_);
     void replied() TAMBLO_REQUIRES(mutex_);
     void send() TAMBLO_REQUIRES(mutex_);
     [[nodiscard]] std::size_t unsent() const TAMBLO_REQUIRES(mutex_) { return outgoing_.size() - sent_; }
@@ -184,7 +189,8 @@ private:
     std::size_t unfinishedCounted_ = 0; ///< with the user
     UnfinishedFrames::Place unfinishedPlace_;
     Ending ending_ = Ending::none;
-    bool isReadable_ = false; ///< listed for its turn
+    bool isReadable_ = false;  ///< listed for its turn
+    bool isKillNoted_ = false; ///< in the log
 
     std::atomic<bool> isLimitNoted_{false};
     std::atomic<std::size_t> waitingRequests_{0};

@@ -36,9 +36,9 @@ public:
     /// way.
     [[nodiscard]] std::optional<std::string> open(const std::string& runtimeDirectory);
     /// The queue that carries out requests, and its threads. Before the loop runs.
-    void setRequestQueue(SerialQueue& queue, LinuxWorkQueues& threads) {
+    void setServerQueue(SerialQueue& queue, LinuxWorkQueues& threads) {
         shared_.turns.emplace(queue, clock_);
-        shared_.intake.setQueue(queue, threads);
+        shared_.intake.setServerQueue(queue, threads);
     }
     /// Reads connections that have something to read; whether some are left. Once in a wake-up.
     [[nodiscard]] bool readSome() { return shared_.reading.readSome(); }

@@ -47,12 +47,10 @@ public:
 
 private:
     static void refuse(Receiver& receiver, std::uint64_t id, const ReplyError& error) {
-        if (error.code == wire::kLimitReached) {
+        if (error.code == kLimitReached) {
             receiver.noteLimit(error.message);
         }
-        receiver.reply([&](TextBuffer& out) {
-            wire::appendErrorReply(out, id, {error.domain, error.code, error.message});
-        });
+        receiver.reply([&](TextBuffer& out) { wire::appendErrorReply(out, id, error); });
     }
     static void append(TextBuffer& out, std::uint64_t id) { wire::appendNullReply(out, id); }
     static void append(TextBuffer& out, std::uint64_t id, std::same_as<bool> auto result) {

@@ -11,7 +11,6 @@
 #include <memory>
 #include <optional>
 #include <span>
-#include <utility>
 
 namespace tamblo {
 
@@ -25,7 +24,7 @@ inline constexpr std::size_t kSmallRest = 16 * 1024;
 inline constexpr std::size_t kRequestsPerBatch = 256;
 
 /// What the connections of a service share to take requests in, one at a time, on the I/O thread: the buffer
-/// that they receive into, the decoder with the key sets that it has met, and the way to the request queue.
+/// that they receive into, the decoder with the key sets that it has met, and the way to the server queue.
 class RequestIntake {
 public:
     explicit RequestIntake(const Limits& limits)
@@ -38,11 +37,11 @@ public:
                   .deliveredBytesOfMessage = limits.deliveredBytesOfMessage} {}
 
     /// The queue that carries requests out, and the threads that it runs on. Before the first read.
-    void setQueue(SerialQueue& queue, LinuxWorkQueues& threads) noexcept {
-        queue_ = &queue;
+    void setServerQueue(SerialQueue& queue, LinuxWorkQueues& threads) noexcept {
+        serverQueue_ = &queue;
         threads_ = &threads;
     }
-    [[nodiscard]] SerialQueue& queue() noexcept { return *queue_; }
+    [[nodiscard]] SerialQueue& serverQueue() noexcept { return *serverQueue_; }
 
     /// Room for a small rest and a read.
     [[nodiscard]] std::uint8_t* buffer() noexcept { return buffer_.get(); }
@@ -63,7 +62,7 @@ private:
     const wire::RequestLimits limits_;
     KeySetCache keySets_;
     wire::Request request_;
-    SerialQueue* queue_ = nullptr;
+    SerialQueue* serverQueue_ = nullptr;
     LinuxWorkQueues* threads_ = nullptr;
 };
 

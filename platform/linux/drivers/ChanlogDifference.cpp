@@ -14,8 +14,7 @@ namespace {
 /// What of a channel's gain cannot be told; null when all can.
 using Trouble = const char*;
 constexpr Trouble kBackwards = "a counter has run backwards; the states or buckets with such are left out "
-                               "until they have risen from one "
-                               "sample to the next";
+                               "until they have risen from one sample to the next";
 constexpr Trouble kOverflow = "the value has moved by more than a 64-bit number can tell; it is left out";
 
 auto keyOf(const ChanlogChannelRef& channel) noexcept {

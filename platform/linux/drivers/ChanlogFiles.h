@@ -16,9 +16,8 @@ namespace tamblo {
 ///
 /// A file is read when it has changed; what was read is kept only while the file is certain to be the same.
 /// One that is missing, or goes, is no error: its channels are absent. One that cannot be read for another
-/// reason keeps its channels. What is wrong with a file is one error
-/// line for each state of it, what is wrong with a channel one for as long as it stays wrong; the other files
-/// and channels count on. Not thread-safe.
+/// reason keeps its channels. What is wrong with a file is one error line for each state of it, what is wrong
+/// with a channel one for as long as it stays wrong; the other files and channels count on. Not thread-safe.
 class ChanlogFiles {
 public:
     /// A device has a few drivers with some hundred channels; this is far above, and still read in

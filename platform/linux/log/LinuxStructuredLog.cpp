@@ -2,6 +2,7 @@
 
 #include "base/Format.h"
 #include "base/Utf8.h"
+#include "platform/LogOrigin.h"
 
 #include <algorithm>
 #include <array>
@@ -151,7 +152,7 @@ LogLevel LinuxStructuredLog::threshold(std::string_view categoryCode) const noex
 }
 
 bool LinuxStructuredLog::admits(const LogKind& kind) noexcept {
-    const std::optional<LogOrigin::Client> client = LogOrigin::client();
+    const std::optional<ClientIdentity> client = LogOrigin::client();
     return !client || filter_.threshold(kind.categoryCode) < LogLevel::standard ||
            limiter_.admits(*client, kind, std::chrono::steady_clock::now());
 }

@@ -5,7 +5,7 @@
 
 namespace tamblo {
 
-bool LogLimiter::admits(LogOrigin::Client client, const LogKind& kind, Time now) noexcept {
+bool LogLimiter::admits(ClientIdentity client, const LogKind& kind, Time now) noexcept {
     const MutexLock lock(mutex_);
     User& user = userOf(client.user, now);
     Tally& tally = tallyOf(user, kind);

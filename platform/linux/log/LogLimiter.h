@@ -1,7 +1,7 @@
 #pragma once
 
 #include "base/Mutex.h"
-#include "platform/LogOrigin.h"
+#include "platform/ClientIdentity.h"
 #include "platform/StructuredLog.h"
 
 #include <array>
@@ -35,13 +35,13 @@ public:
     /// Lines of one kind that were not admitted.
     struct LeftOut {
         LogKind kind;
-        LogOrigin::Client last; ///< who would have caused the last of them
+        ClientIdentity last; ///< who would have caused the last of them
         std::uint64_t lines = 0;
     };
 
     LogLimiter() { users_.reserve(kUsers); }
 
-    [[nodiscard]] bool admits(LogOrigin::Client client, const LogKind& kind, Time now) noexcept
+    [[nodiscard]] bool admits(ClientIdentity client, const LogKind& kind, Time now) noexcept
         TAMBLO_EXCLUDES(mutex_);
     /// Whether there is anything to take, now or later. Costs one load.
     [[nodiscard]] bool hasLeftOut() const noexcept { return leftOut_.load(std::memory_order_relaxed) != 0; }

@@ -1,6 +1,6 @@
 #include "platform/linux/loop/LinuxWorkQueues.h"
 
-#include <string>
+#include <string_view>
 #include <utility>
 
 namespace tamblo {

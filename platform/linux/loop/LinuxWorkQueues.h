@@ -105,7 +105,7 @@ private:
     struct Item {
         Work work;
         Pace pace;
-        std::optional<LogOrigin::Client> client; ///< for whom it was posted
+        std::optional<ClientIdentity> client; ///< for whom it was posted
     };
     using Time = std::chrono::steady_clock::time_point;
 

@@ -68,7 +68,7 @@ struct LinuxNamedNotifications::Registered {
 };
 
 LinuxNamedNotifications::LinuxNamedNotifications(std::string directory, StructuredLog& log)
-    : log_(log), watcher_(std::move(directory), DirectoryWatcher::Watched::writes) {
+    : log_(log), watcher_(std::move(directory), DirectoryWatcher::Watch::writes) {
     reportUnwatched();
 }
 

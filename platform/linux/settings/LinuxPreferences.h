@@ -54,7 +54,9 @@ public:
     [[nodiscard]] int fileDescriptor() const noexcept { return watcher_.fileDescriptor(); }
     void readChanges();
     /// Another number after every change of a preference: what was worked out from preferences holds for as
-    /// long as this stays the same. Never 0. Read it before the preferences themselves.
+    /// long as this stays the same. Never 0. Read it before the preferences themselves. While a file cannot
+    /// be read, it is tried again from here, under the lock: at most once a second, asking waits for the
+    /// disk.
     [[nodiscard]] std::uint64_t generation() const {
         if (isAnyUnreadable_.load(std::memory_order_relaxed)) {
             const MutexLock lock(mutex_);

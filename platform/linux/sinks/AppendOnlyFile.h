@@ -64,7 +64,7 @@ struct SinkFileLimits {
     /// A line that would make the file larger begins a new file.
     std::uint64_t fileSize = 64U << 20U;
     /// A longer line is lost: bounds what one line takes in memory, as text. Two and a half times what comes
-    /// of any one request; only what is derived from all messages of a very long session can be longer.
+    /// of any one request; what is derived from several may be longer (`docs/sinks.md` says what).
     std::size_t line = 16U << 20U;
     /// Waiting bytes that are written without being asked for.
     std::size_t waiting = 256U << 10U;

@@ -70,9 +70,9 @@ std::optional<std::string> LinuxCallQualityService::SendLinkmeterMessage(const S
                                                                          std::uint16_t category,
                                                                          std::uint16_t type,
                                                                          const Dictionary& payload) {
-    // A file that cannot be written is told of by itself, once. The message at a session's end has the values
-    // of all others: one that is too long is not made into a text first, which would take as much memory
-    // again.
+    // A file that cannot be written is told of by itself, once. The message at a session's end has the keys
+    // of all others, and much of their values: one that is too long is not made into a text first, which
+    // would take as much memory again.
     if (session != nullptr && payloadSize(payload) > file_.longestLine()) {
         file_.loseTooLong();
     } else if (session != nullptr) {

@@ -13,9 +13,10 @@ constexpr const char* kElsewhere = "not a directory of reports";
 
 LinuxReportFiles::LinuxReportFiles(const std::string& logsDirectory, const Clock& clock, StructuredLog& log,
                                    FileModes modes, ReportLimits limits, FileOperations& operations)
-    : reporting_(logsDirectory, "DiagnosticLogs/Audio/Reporting", clock, log, modes, limits, operations),
-      performance_(logsDirectory, "DiagnosticLogs/Audio/Performance", clock, log, modes, limits, operations) {
-}
+    : reporting_(logsDirectory, "DiagnosticLogs/Audio/Reporting", "zrrr", clock, log, modes, limits,
+                 operations),
+      performance_(logsDirectory, "DiagnosticLogs/Audio/Performance", "zrrt", clock, log, modes, limits,
+                   operations) {}
 
 ReportDirectory* LinuxReportFiles::directoryAt(std::string_view path) noexcept {
     return path == reporting_.path() ? &reporting_ : path == performance_.path() ? &performance_ : nullptr;

@@ -6,32 +6,32 @@ namespace tamblo {
 
 namespace {
 
-std::size_t valueSize(const Value& value, std::size_t ofEachValue) {
+std::size_t valueSize(const Value& value) {
     switch (value.kind()) {
     case Value::Kind::string:
-        return ofEachValue + value.stringValue().size();
+        return value.stringValue().size();
     case Value::Kind::data:
-        return ofEachValue + value.dataValue().size();
+        return value.dataValue().size();
     case Value::Kind::array: {
-        std::size_t size = ofEachValue;
+        std::size_t size = 0;
         for (const Value& element : value.arrayValue()) {
-            size += valueSize(element, ofEachValue);
+            size += valueSize(element);
         }
         return size;
     }
     case Value::Kind::dictionary:
-        return ofEachValue + payloadSize(value.dictionaryValue(), ofEachValue);
+        return payloadSize(value.dictionaryValue());
     default:
-        return ofEachValue;
+        return 0;
     }
 }
 
 } // namespace
 
-std::size_t payloadSize(const Dictionary& payload, std::size_t ofEachValue) {
+std::size_t payloadSize(const Dictionary& payload) {
     std::size_t size = 0;
     for (std::size_t i = 0; i < payload.size(); ++i) {
-        size += payload.keyAt(i).size() + valueSize(payload.valueAt(i), ofEachValue);
+        size += payload.keyAt(i).size() + valueSize(payload.valueAt(i));
     }
     return size;
 }

@@ -98,10 +98,11 @@ ReportLimits ReportLimits::read(const Preferences& preferences) {
     return limits;
 }
 
-ReportDirectory::ReportDirectory(const std::string& root, std::string_view below, const Clock& clock,
-                                 StructuredLog& log, FileModes modes, ReportLimits limits,
-                                 FileOperations& operations)
-    : clock_(clock),
+ReportDirectory::ReportDirectory(const std::string& root, std::string_view below,
+                                 std::string_view categoryCode, const Clock& clock, StructuredLog& log,
+                                 FileModes modes, ReportLimits limits, FileOperations& operations)
+    : categoryCode_(categoryCode),
+      clock_(clock),
       log_(log),
       modes_(modes),
       limits_(limits),
@@ -243,7 +244,7 @@ void ReportDirectory::lookAgain() {
 void ReportDirectory::remove(Reports::iterator report) {
     const bool isGone = operations_.remove(known_->get(), report->first.c_str()) == 0 || errno == ENOENT;
     if (!isGone && !isRemovingOut_) {
-        log_.report(LogLevel::error, "zrrr",
+        log_.report(LogLevel::error, categoryCode_,
                     formatted("{}/{}: cannot be removed: {}; it takes room that is not counted", path(),
                               report->first, textOf(errno)));
     }

@@ -49,8 +49,10 @@ struct ReportLimits {
 class ReportDirectory {
 public:
     /// Clock, log and operations must outlive this object, as this must its files.
-    ReportDirectory(const std::string& root, std::string_view below, const Clock& clock, StructuredLog& log,
-                    FileModes modes, ReportLimits limits, FileOperations& operations);
+    /// The category code, under which failures are logged, must be a constant.
+    ReportDirectory(const std::string& root, std::string_view below, std::string_view categoryCode,
+                    const Clock& clock, StructuredLog& log, FileModes modes, ReportLimits limits,
+                    FileOperations& operations);
 
     [[nodiscard]] const std::string& path() const noexcept { return directory_.path(); }
     /// Makes the directory; answers what went wrong, or nothing.
@@ -84,6 +86,7 @@ private:
     void remove(Reports::iterator report) TAMBLO_REQUIRES(mutex_);
     void forget(Reports::iterator report) TAMBLO_REQUIRES(mutex_);
 
+    const std::string_view categoryCode_;
     const Clock& clock_;
     StructuredLog& log_;
     const FileModes modes_;

@@ -178,7 +178,7 @@ public:
 };
 
 /// Holds the place of a detector for the record queue of the voice controller: no message tells of its
-/// destruction yet, so it is never interested.
+/// destruction, so it is never interested.
 class ZRReportingZephWorkerInstanceVocapDestroyRecordQueue final
     : public ZRReportingSessionZephWorkerInstance {
 public:
