@@ -375,5 +375,22 @@ TEST_F(CapturesTest, TheMemoryLogLeavesOutWhoIsGone) {
               "\n");
 }
 
+TEST_F(CapturesTest, OfTheMemoryRecordsThatWaitNoUserHasMoreThanAQuarter) {
+    LinuxMemoryLog memory(sinks, clock, workQueues, log, files());
+    const auto ask = [&memory](uid_t user, std::size_t times) {
+        const LogOrigin origin(LogOrigin::Client{user, 1});
+        for (; times != 0; --times) {
+            memory.logMemory(7, {});
+        }
+    };
+    for (int i = 0; i < 2; ++i) {
+        ask(8, 256);
+        ask(9, 1);
+        EXPECT_EQ(workQueues.run("com.vandra.tamblo.memorylog"), 65U);
+        EXPECT_THAT(log.take(), ElementsAre(HasSubstr("64 memory records of user 8 wait; further ones are"),
+                                            HasSubstr("wait any more; 192 were dropped")));
+    }
+}
+
 } // namespace
 } // namespace tamblo

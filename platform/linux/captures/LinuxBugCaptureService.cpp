@@ -52,7 +52,11 @@ LinuxBugCaptureService::LinuxBugCaptureService(SinkFiles& sinks, const std::stri
       allowance_(formatted("{}/{}", directory, kAllowanceFile), log),
       lastNumber_(randomNumber()),
       queue_(workQueues, "com.vandra.tamblo.bugcaptures",
-             {.waiting = kMaximumWaiting, .what = "pieces of bug captures", .categoryCode = "zrrb"}, log) {}
+             {.waiting = kMaximumWaiting,
+              .ofUser = kMaximumWaiting,
+              .what = "pieces of bug captures",
+              .categoryCode = "zrrb"},
+             log) {}
 
 std::unique_ptr<GlarnReporter> LinuxBugCaptureService::makeReporter(std::span<const pid_t> processes) {
     ProcessList eachOnce;
