@@ -49,7 +49,7 @@ LinuxBugCaptureService::LinuxBugCaptureService(SinkFiles& sinks, const std::stri
       log_(log),
       file_(sinks, "bug-captures.jsonl", "zrrb"),
       folders_(directory, log, modes),
-      allowance_(formatted("{}/{}", directory, kAllowanceFile), log),
+      allowance_(folders_.kept(kAllowanceFile), formatted("{}/{}", folders_.path(), kAllowanceFile), log),
       lastNumber_(randomNumber()),
       queue_(workQueues, "com.vandra.tamblo.bugcaptures",
              {.waiting = kMaximumWaiting,

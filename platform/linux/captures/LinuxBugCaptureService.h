@@ -47,6 +47,8 @@ public:
     ~LinuxBugCaptureService() override { endSessions(); }
 
     [[nodiscard]] std::unique_ptr<GlarnReporter> makeReporter(std::span<const pid_t> processes) override;
+    /// Whether the last capture's folder could not be written.
+    [[nodiscard]] bool isOut() const noexcept { return folders_.isOut(); }
     /// Cancels the captures that run, and makes no others.
     void endSessions();
 
