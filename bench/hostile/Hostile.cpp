@@ -9,6 +9,8 @@
 #include <algorithm>
 #include <filesystem>
 #include <fstream>
+#include <optional>
+#include <system_error>
 #include <thread>
 
 #include <sys/resource.h>
@@ -25,6 +27,12 @@ constexpr std::chrono::seconds kEndLimit{12};
 constexpr std::int64_t kThirdReporterID = 4'711'000'002;
 constexpr std::size_t kMeasuredMessages = 2'000;
 constexpr rlim_t kFewDescriptors = 64;
+
+// What the service keeps on a build that is not internal: eight sinks, each of five files of 64 MiB, one
+// more that is moved away, and the summary files.
+constexpr double kMostSummaryFiles = 256;
+constexpr double kMostSinkFiles = 8 * 5 + 1;
+constexpr double kMostKeptMebibytes = kMostSinkFiles * 64 + 256;
 
 void limit(pid_t process, __rlimit_resource resource, rlim_t most) {
     const rlimit limits{.rlim_cur = most, .rlim_max = most};
@@ -55,6 +63,24 @@ std::size_t countLinesOf(const std::string& file) {
         std::count(std::istreambuf_iterator<char>(lines), std::istreambuf_iterator<char>(), '\n'));
 }
 
+/// What lies in a directory and below it.
+struct Kept {
+    std::uint64_t files = 0;
+    std::uint64_t bytes = 0;
+};
+
+Kept keptIn(const std::string& directory) {
+    Kept kept;
+    std::error_code ignored;
+    for (const auto& entry : std::filesystem::recursive_directory_iterator(directory, ignored)) {
+        if (entry.is_regular_file(ignored)) {
+            ++kept.files;
+            kept.bytes += entry.file_size(ignored);
+        }
+    }
+    return kept;
+}
+
 /// One attack against a service of its own, and what is measured beside it.
 class Trial {
 public:
@@ -70,10 +96,13 @@ public:
         row.set("attack", attack_.name);
         row.set("users", mayChangeUser() ? "two" : "one");
         bystander_.send(Bystander::Phase::before);
+        const Meter meter(service_.pid());
         calmly(kCalm);
+        calmShare_ = secondsOf(meter.service()) / secondsOf(meter.wall());
         bystander_.rest();
         row.set("before_p50_ms", quantile(bystander_.milliseconds(Bystander::Phase::before), 0.5));
-        row.set("message_cpu_us_before", messageCost());
+        messageCostBefore_ = messageCost();
+        row.set("message_cpu_us_before", messageCostBefore_);
         attack(row);
         if (service_.isAlive()) {
             quiet(row);
@@ -136,6 +165,7 @@ private:
 
     void attack(ResultRow& row) {
         takeAway();
+        double seconds = 0;
         const Meter meter(service_.pid());
         bystander_.send(Bystander::Phase::during);
         {
@@ -152,7 +182,8 @@ private:
             }
             bystander_.rest();
             if (service_.isAlive()) {
-                row.set("service_cpu_s", secondsOf(meter.service()));
+                seconds = secondsOf(meter.service());
+                row.set("service_cpu_s", seconds);
             }
             keeper_.keep();
         }
@@ -166,6 +197,9 @@ private:
         row.set("sent_mib", mebibytes(marks_->sentBytes));
         row.set("refusals", marks_->refusals.load());
         row.set("ended_connections", marks_->endedConnections.load());
+        // An attack that only connects has nothing but the work that it makes.
+        isFelt_ = marks_->sentBytes + marks_->refusals + marks_->endedConnections > 0 ||
+                  seconds > 2 * calmShare_ * secondsOf(time_);
         isAlive_ = service_.isAlive();
     }
 
@@ -181,7 +215,8 @@ private:
             row.set("retained_mib", mebibytes(marks_->residentBytes));
         }
         if (!bystander_.hasGivenUp()) {
-            row.set("message_cpu_us_after", messageCost());
+            messageCostAfter_ = messageCost();
+            row.set("message_cpu_us_after", *messageCostAfter_);
             bystander_.send(Bystander::Phase::after);
             calmly(kCalm);
             bystander_.rest();
@@ -218,11 +253,24 @@ private:
         const auto twice = std::count_if(counts.begin(), counts.end(), [](auto count) { return count > 1; });
         row.set("missing_records", static_cast<std::uint64_t>(missing));
         row.set("double_records", static_cast<std::uint64_t>(twice));
+        const std::string logs = service_.logsDirectory();
+        const Kept all = keptIn(logs);
+        row.set("summary_files", keptIn(logs + "/DiagnosticLogs/Audio/Reporting").files);
+        row.set("kept_files", all.files);
+        row.set("kept_mib", mebibytes(all.bytes));
         row.atMost("p99_ms", 50);
         row.atMost("worst_ms", 250);
         row.atMost("missing_records", 0);
         row.atMost("double_records", 0);
         row.atMost("largest_file_mib", 64);
+        row.atMost("summary_files", kMostSummaryFiles);
+        row.atMost("kept_files", kMostSinkFiles + kMostSummaryFiles);
+        row.atMost("kept_mib", kMostKeptMebibytes);
+        row.require("the attack is felt", isFelt_);
+        if (messageCostAfter_) {
+            row.require("0 < message_cpu_us_after <= 2 * message_cpu_us_before + 3",
+                        *messageCostAfter_ > 0 && *messageCostAfter_ <= 2 * messageCostBefore_ + 3);
+        }
         row.require("the service lives", isAlive_ && !bystander_.hasGivenUp());
         row.require("log_lines <= 50 a second", static_cast<double>(lines_) <= 50 * seconds_);
         if (peak_ > 0) {
@@ -244,7 +292,11 @@ private:
     const SinkKeeper keeper_;
     SharedMemory<AssaultMarks> marks_;
     Bystander bystander_;
+    double calmShare_ = 0; ///< of a processor, that the service takes for the other user's client alone
+    double messageCostBefore_ = 0;
+    std::optional<double> messageCostAfter_;
     double peak_ = 0;
+    bool isFelt_ = false;
     bool isAlive_ = true;
     std::size_t lines_ = 0;
     double seconds_ = 0;

@@ -48,6 +48,7 @@ void Health::giveSign(SerialQueue& serverQueue) {
     // From the loop to the queue and back: the sign that follows shows that both are alive.
     serverQueue.post([this, &serverQueue] {
         loop_.post([this, &serverQueue] {
+            tellNews(); // such as an outage that no batch of the server queue has told of
             notifyServiceManager("WATCHDOG=1");
             loop_.callAfter(std::chrono::duration_cast<std::chrono::milliseconds>(*period_ / 2),
                             [this, &serverQueue] { giveSign(serverQueue); });
@@ -57,12 +58,16 @@ void Health::giveSign(SerialQueue& serverQueue) {
 
 void Health::update() {
     if (isManaged_ && !isTellingDue_.exchange(true)) {
-        loop_.post([this] { loop_.callAfter(kTellingInterval, [this] { tell(); }); });
+        loop_.post([this] {
+            loop_.callAfter(kTellingInterval, [this] {
+                isTellingDue_ = false;
+                tellNews();
+            });
+        });
     }
 }
 
-void Health::tell() {
-    isTellingDue_ = false;
+void Health::tellNews() {
     std::string now = status_();
     if (now != told_) {
         told_ = std::move(now);

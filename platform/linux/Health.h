@@ -11,11 +11,11 @@
 
 namespace tamblo {
 
-/// Tells the service manager how the service is: a line of what it is doing, when that has changed, at most
-/// once a second; and, where the manager runs a watchdog, a sign of life twice in each of its periods, for
-/// which both the loop and the server queue have to get to a piece of work, so that a stall of either is
-/// noticed. Without a manager it does nothing, and no timer runs. Used on the loop's thread, but for
-/// `update`.
+/// Tells the service manager how the service is. A line of what it is doing, when that has changed: a second
+/// after it was said that it may have, and with each sign of life. Where the manager runs a watchdog, that
+/// sign, twice in each of its periods, for which both the loop and the server queue have to get to a piece of
+/// work, so that a stall of either is noticed. Without a manager it does nothing, and no timer runs. Used on
+/// the loop's thread, but for `update`.
 class Health {
 public:
     /// What is to be told now. Called on the loop's thread.
@@ -30,7 +30,7 @@ public:
 
 private:
     void giveSign(SerialQueue& serverQueue);
-    void tell();
+    void tellNews();
 
     EventLoop& loop_;
     Status status_;

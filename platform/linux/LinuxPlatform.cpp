@@ -135,7 +135,14 @@ struct LinuxPlatform::Services {
         if (const auto lost = sinkFiles->lostLines(); lost != 0) {
             appendFormatted(text, ", {} lines lost", lost);
         }
-        for (const std::string& sink : sinkFiles->out()) {
+        std::vector<std::string> out = sinkFiles->out();
+        if (reportFiles.isOut()) {
+            out.emplace_back("DiagnosticLogs/");
+        }
+        if (bugCapture.isOut()) {
+            out.emplace_back("captures/");
+        }
+        for (const std::string& sink : out) {
             appendFormatted(text, ", {} is out", sink);
         }
         return text;

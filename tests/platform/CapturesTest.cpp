@@ -23,8 +23,9 @@ TEST(DailyAllowanceTest, LastsForADayOfUtcAndOutlivesTheProcess) {
     const TemporaryDirectory directory;
     FakeLog log;
     const std::string path = directory.path("allowance.json");
+    const auto read = [&] { return DailyAllowance(SmallFile::read(path, 4096), path, log); };
     const WallTime midnight = std::chrono::sys_days(std::chrono::year(2026) / 3 / 2);
-    DailyAllowance allowance(path, log);
+    DailyAllowance allowance = read();
     for (const WallTime time : {midnight - 1ms, midnight, midnight - 1ms}) { // the clock may be set back
         for (std::uint64_t capture = 0; capture < DailyAllowance::kCapturesADay; ++capture) {
             EXPECT_TRUE(allowance.take(time));
@@ -32,11 +33,11 @@ TEST(DailyAllowanceTest, LastsForADayOfUtcAndOutlivesTheProcess) {
         EXPECT_FALSE(allowance.take(time));
     }
     directory.write("allowance.json", allowance.text());
-    EXPECT_FALSE(DailyAllowance(path, log).take(midnight - 1ms));
+    EXPECT_FALSE(read().take(midnight - 1ms));
     EXPECT_THAT(log.take(), IsEmpty());
     for (const char* rubbish : {"[]", R"({"day":1,"captures":20})", R"({"day":"","captures":-1})"}) {
         directory.write("allowance.json", rubbish);
-        EXPECT_TRUE(DailyAllowance(path, log).take(midnight)) << rubbish;
+        EXPECT_TRUE(read().take(midnight)) << rubbish;
         EXPECT_THAT(log.take(), ElementsAre(HasSubstr(path + ": "))) << rubbish;
     }
 }
@@ -108,8 +109,10 @@ TEST_F(CaptureFoldersTest, AnOutageIsOneLineAndLeavesNoHalfFolder) {
     store(identifier(0s, 2));
     EXPECT_THAT(log.take(),
                 ElementsAre(HasSubstr("captures: cannot make it: Not a directory; captures have")));
+    EXPECT_TRUE(folders.isOut());
     fs::remove(directory.path("captures"));
     const std::string stored = store(identifier(0s, 3));
+    EXPECT_FALSE(folders.isOut());
     const CaptureFile impossible[] = {{"a", "b"}, {"no/such/place", ""}};
     folders.store(identifier(0s, 4), impossible, clock.now());
     EXPECT_THAT(names(), ElementsAre(stored));
@@ -238,7 +241,22 @@ TEST_F(BugCaptureServiceTest, RequestsOutsideTheLimitsMakeNoLine) {
     }
     EXPECT_THAT(replies, IsEmpty());
     EXPECT_TRUE(reporter->startSession(signature, 3600s, keep));
-    EXPECT_THAT(replies, SizeIs(1));
+    for (std::uint64_t more = 1; more < DailyAllowance::kCapturesADay; ++more) {
+        EXPECT_TRUE(reporter->snapshot(signature, 0s, {}, keep));
+    }
+    gather();
+    makeService(); // a restart begins no new day
+    EXPECT_TRUE(reporter->snapshot(signature, 0s, {}, keep));
+    EXPECT_EQ(replies.back(), (Dictionary{{glarn::kReplySuccess, false},
+                                          {glarn::kReplyReason, int{kGlarnErrorDailyLimitExceeded}}}));
+    fs::rename(root.path("captures/allowance.json"), root.path("elsewhere"));
+    fs::create_symlink(root.path("elsewhere"), root.path("captures/allowance.json"));
+    makeService();
+    EXPECT_TRUE(reporter->snapshot(signature, 0s, {}, keep));
+    EXPECT_TRUE(replies.back().find(glarn::kReplySuccess)->boolValue()) << "a link is not followed";
+    gather();
+    EXPECT_FALSE(fs::is_symlink(root.path("captures/allowance.json")));
+    EXPECT_THAT(lines(), SizeIs(22)) << "one of them for the session that the service's end has cancelled";
 }
 
 class StackCaptureTest : public CapturesTest {
@@ -364,6 +382,23 @@ TEST_F(CapturesTest, TheMemoryLogLeavesOutWhoIsGone) {
               R"("slab":3072,"slabReclaimable":4096,"slabUnreclaimable":0,"pageTables":7168,)"
               R"("kernelStack":6144}})"
               "\n");
+}
+
+TEST_F(CapturesTest, OfTheMemoryRecordsThatWaitNoUserHasMoreThanAQuarter) {
+    LinuxMemoryLog memory(sinks, clock, workQueues, log, files());
+    const auto ask = [&memory](uid_t user, std::size_t times) {
+        const LogOrigin origin(LogOrigin::Client{user, 1});
+        for (; times != 0; --times) {
+            memory.logMemory(7, {});
+        }
+    };
+    for (int i = 0; i < 2; ++i) {
+        ask(8, 256);
+        ask(9, 1);
+        EXPECT_EQ(workQueues.run("com.vandra.tamblo.memorylog"), 65U);
+        EXPECT_THAT(log.take(), ElementsAre(HasSubstr("64 memory records of user 8 wait; further ones are"),
+                                            HasSubstr("wait any more; 192 were dropped")));
+    }
 }
 
 } // namespace

@@ -27,9 +27,14 @@ public:
     int interruptions = 0; ///< of writes to come, every second one
     int truncateError = 0;
     int renameError = 0; ///< of the newest file of a rotation, which is the last to be moved
+    int refusedDirectories = 0;
     int writes = 0;
     std::function<void()> beforeWrite = [] {};
 
+    int open(int directory, const char* name, int flags, mode_t mode) noexcept override {
+        const bool fails = (flags & O_DIRECTORY) != 0 && refusedDirectories-- > 0;
+        return fails ? fail(EMFILE) : FileOperations::open(directory, name, flags, mode);
+    }
     ssize_t write(int descriptor, const void* bytes, std::size_t count) noexcept override {
         beforeWrite();
         ++writes;

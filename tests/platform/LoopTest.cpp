@@ -1,9 +1,12 @@
+#include "platform/linux/Health.h"
 #include "platform/linux/connections/LinuxConnectionService.h"
 #include "platform/linux/loop/LinuxWorkQueues.h"
 #include "tests/Sockets.h"
+#include "tests/fakes/FakeWorkQueues.h"
 #include "tests/platform/LinuxServiceSupport.h"
 #include "wire/Protocol.h"
 
+#include <array>
 #include <cctype>
 #include <future>
 #include <latch>
@@ -195,6 +198,42 @@ TEST(DelayedCall, IsMadeOnceItsTimeHasComeUnlessItIsCalledOff) {
     EXPECT_GE(std::chrono::steady_clock::now() - start, milliseconds(60));
     EXPECT_TRUE(isSoonMade);
     mayGoOn.count_down();
+}
+
+TEST(Health, GivesASignOnceTheQueueHasGotToItAndTellsWhatIsNew) {
+    const TemporaryDirectory directory;
+    const FileDescriptor manager(test::boundSocket(SOCK_DGRAM, directory.path("notify")));
+    const auto told = [&manager] {
+        std::array<char, 64> text{};
+        (void)(isReadable(manager.get(), 20'000) && ::recv(manager.get(), text.data(), text.size() - 1, 0));
+        return std::string(text.data());
+    };
+    ::setenv("NOTIFY_SOCKET", directory.path("notify").c_str(), 1);
+    ::setenv("WATCHDOG_USEC", "2000", 1);
+    EventLoop loop;
+    std::atomic<int> state{1};
+    Health health(loop, [&state] { return std::to_string(state); });
+    LinuxWorkQueues queues;
+    FakeSerialQueue queue("server");
+    const auto sign = [&] { // asked for by the loop a millisecond after the last one
+        for (int i = 0; i < 20'000 && !queue.runOne(); ++i) {
+            std::this_thread::sleep_for(milliseconds(1));
+        }
+        return told();
+    };
+    health.watch(queue);
+    std::thread thread([&] { loop.run(queues); });
+    EXPECT_EQ(told(), "STATUS=1") << "no sign in the second before, as the queue got to nothing";
+    EXPECT_EQ(sign(), "WATCHDOG=1");
+    EXPECT_EQ(sign(), "WATCHDOG=1");
+    state = 2;
+    EXPECT_EQ(sign(), "STATUS=2");
+    EXPECT_EQ(told(), "WATCHDOG=1");
+    EXPECT_EQ(sign(), "WATCHDOG=1");
+    loop.post([&loop] { loop.stop(); });
+    thread.join();
+    ::unsetenv("NOTIFY_SOCKET");
+    ::unsetenv("WATCHDOG_USEC");
 }
 
 std::atomic<int> additions{0};

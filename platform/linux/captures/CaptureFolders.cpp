@@ -91,6 +91,20 @@ void CaptureFolders::keep(std::string_view name, std::string_view text) {
     keepingProblem_ = error != 0 ? failure("write", name, error) : "";
 }
 
+SmallFile CaptureFolders::kept(std::string_view name) {
+    constexpr std::size_t kLongest = 4096;
+    struct stat status {};
+    if (::lstat(path().c_str(), &status) != 0) {
+        return {.error = errno};
+    }
+    const HeldDirectory::Ref directory = directory_.open();
+    const FileDescriptor file(directory == nullptr
+                                  ? -1
+                                  : ::openat(directory->get(), std::string(name).c_str(),
+                                             O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC));
+    return file.isOpen() ? SmallFile::read(file.get(), kLongest) : SmallFile{.error = errno};
+}
+
 std::string CaptureFolders::write(int directory, const std::string& identifier,
                                   std::span<const CaptureFile> files) const {
     const std::string name = formatted("{}{}", kUnfinished, identifier);
@@ -158,9 +172,9 @@ void CaptureFolders::removeOld(int directory, WallTime now, std::string_view lat
     tell(isRemovingOut_, problem, "it takes room until it can be removed");
 }
 
-void CaptureFolders::tell(bool& isOut, std::string_view problem, std::string_view consequence) {
-    const bool wasOut = std::exchange(isOut, !problem.empty());
-    if (isOut && !wasOut) {
+void CaptureFolders::tell(std::atomic<bool>& isOut, std::string_view problem, std::string_view consequence) {
+    const bool wasOut = isOut.exchange(!problem.empty());
+    if (!problem.empty() && !wasOut) {
         log_.report(LogLevel::error, "zrrb",
                     formatted("{}: {}; {}", directory_.path(), problem, consequence));
     }

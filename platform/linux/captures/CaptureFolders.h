@@ -1,10 +1,12 @@
 #pragma once
 
 #include "os/HeldDirectory.h"
+#include "os/SmallFile.h"
 #include "platform/Clock.h"
 #include "platform/StructuredLog.h"
 #include "platform/linux/sinks/FileModes.h"
 
+#include <atomic>
 #include <chrono>
 #include <cstdint>
 #include <span>
@@ -57,6 +59,11 @@ public:
     void store(std::string_view identifier, std::span<const CaptureFile> files, WallTime now);
     /// Replaces a file beside the folders. That it cannot be written is told with the next folder that can.
     void keep(std::string_view name, std::string_view text);
+    /// What such a file, of some kilobytes at most, holds. Makes no directory where there is none.
+    [[nodiscard]] SmallFile kept(std::string_view name);
+    [[nodiscard]] const std::string& path() const noexcept { return directory_.path(); }
+    /// Whether the last folder could not be written. Any thread.
+    [[nodiscard]] bool isOut() const noexcept { return isWritingOut_; }
 
 private:
     [[nodiscard]] std::string write(int directory, const std::string& identifier,
@@ -64,17 +71,17 @@ private:
     [[nodiscard]] std::string writeFiles(int directory, const std::string& folder,
                                          std::span<const CaptureFile> files) const;
     void removeOld(int directory, WallTime now, std::string_view latest);
-    void tell(bool& isOut, std::string_view problem, std::string_view consequence);
+    void tell(std::atomic<bool>& isOut, std::string_view problem, std::string_view consequence);
 
     HeldDirectory directory_;
     StructuredLog& log_;
     const FileModes modes_;
     const Limits limits_;
     /// Whether the log knows that no folder can be written, no file beside them, or nothing removed.
-    bool isWritingOut_ = false;
-    bool isKeepingOut_ = false;
+    std::atomic<bool> isWritingOut_{false};
+    std::atomic<bool> isKeepingOut_{false};
     std::string keepingProblem_; ///< the last try's
-    bool isRemovingOut_ = false;
+    std::atomic<bool> isRemovingOut_{false};
 };
 
 } // namespace tamblo

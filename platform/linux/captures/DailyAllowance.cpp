@@ -3,9 +3,9 @@
 #include "base/Format.h"
 #include "base/Json.h"
 #include "base/Rfc3339.h"
-#include "platform/linux/settings/JsonFile.h"
 
 #include <utility>
+#include <variant>
 
 namespace tamblo {
 
@@ -16,17 +16,20 @@ constexpr std::string_view kCaptures = "captures";
 
 } // namespace
 
-DailyAllowance::DailyAllowance(const std::string& path, StructuredLog& log) {
-    const auto content = JsonFile(path).read(log);
-    if (!content) {
+DailyAllowance::DailyAllowance(const SmallFile& file, std::string_view path, StructuredLog& log) {
+    if (file.isMissing()) {
         return;
     }
-    const Value* const day = content->find(kDay);
-    const Value* const taken = content->find(kCaptures);
+    const std::variant<Value, JsonError> content = readJson(file.text);
+    const Value* const object = std::get_if<Value>(&content);
+    const bool isObject = object != nullptr && object->isDictionary();
+    const Value* const day = isObject ? object->dictionaryValue().find(kDay) : nullptr;
+    const Value* const taken = isObject ? object->dictionaryValue().find(kCaptures) : nullptr;
     if (day == nullptr || !day->isString() || taken == nullptr || !taken->isNumber() ||
         taken->doubleValue() < 0) {
         log.report(LogLevel::error, "zrrb",
-                   formatted("{}: no day and number of captures; they are counted from 0", path));
+                   formatted("{}: {}; captures are counted from 0", path,
+                             file.error != 0 ? file.reason() : "no day and number of captures"));
         return;
     }
     day_ = day->stringValue();

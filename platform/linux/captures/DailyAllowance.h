@@ -1,11 +1,13 @@
 #pragma once
 
 #include "base/Mutex.h"
+#include "os/SmallFile.h"
 #include "platform/Clock.h"
 #include "platform/StructuredLog.h"
 
 #include <cstdint>
 #include <string>
+#include <string_view>
 
 namespace tamblo {
 
@@ -20,9 +22,9 @@ class DailyAllowance {
 public:
     static constexpr std::uint64_t kCapturesADay = 20;
 
-    /// Reads what the file holds: nothing, when there is none; with rubbish in it, there is an error line,
-    /// and the count begins at 0.
-    DailyAllowance(const std::string& path, StructuredLog& log);
+    /// Goes on from what the file holds. The count begins at 0 where there is none; and, with an error line
+    /// that names the path, where it cannot be read or holds something else.
+    DailyAllowance(const SmallFile& file, std::string_view path, StructuredLog& log);
 
     /// Takes one capture of the day, if there is one left.
     [[nodiscard]] bool take(WallTime now);

@@ -49,10 +49,14 @@ LinuxBugCaptureService::LinuxBugCaptureService(SinkFiles& sinks, const std::stri
       log_(log),
       file_(sinks, "bug-captures.jsonl", "zrrb"),
       folders_(directory, log, modes),
-      allowance_(formatted("{}/{}", directory, kAllowanceFile), log),
+      allowance_(folders_.kept(kAllowanceFile), formatted("{}/{}", folders_.path(), kAllowanceFile), log),
       lastNumber_(randomNumber()),
       queue_(workQueues, "com.vandra.tamblo.bugcaptures",
-             {.waiting = kMaximumWaiting, .what = "pieces of bug captures", .categoryCode = "zrrb"}, log) {}
+             {.waiting = kMaximumWaiting,
+              .ofUser = kMaximumWaiting,
+              .what = "pieces of bug captures",
+              .categoryCode = "zrrb"},
+             log) {}
 
 std::unique_ptr<GlarnReporter> LinuxBugCaptureService::makeReporter(std::span<const pid_t> processes) {
     ProcessList eachOnce;

@@ -35,7 +35,8 @@ class LinuxBugCaptureService final : public BugCaptureService {
 public:
     /// A capture that runs longer tells nothing about what it was begun for; requests for one are refused.
     static constexpr std::chrono::hours kMaximumDuration{1};
-    /// Pieces of work, two for each capture: those of two days, which may meet at midnight.
+    /// Pieces of work, two for each capture: those of two days, which may meet at midnight. One user may have
+    /// them all, as what is dropped of a capture that was granted helps nobody: the day has no others.
     static constexpr std::size_t kMaximumWaiting = 4 * DailyAllowance::kCapturesADay;
 
     /// What is referred to must outlive the service, except the queues: before they go, `endSessions` is
@@ -46,6 +47,8 @@ public:
     ~LinuxBugCaptureService() override { endSessions(); }
 
     [[nodiscard]] std::unique_ptr<GlarnReporter> makeReporter(std::span<const pid_t> processes) override;
+    /// Whether the last capture's folder could not be written.
+    [[nodiscard]] bool isOut() const noexcept { return folders_.isOut(); }
     /// Cancels the captures that run, and makes no others.
     void endSessions();
 

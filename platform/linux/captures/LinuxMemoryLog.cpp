@@ -47,7 +47,11 @@ LinuxMemoryLog::LinuxMemoryLog(SinkFiles& sinks, const Clock& clock, WorkQueues&
       files_(std::move(files)),
       file_(sinks, "memory-log.jsonl", "zrrs", AppendOnlyFile::Flushed::byOwner),
       queue_(workQueues, "com.vandra.tamblo.memorylog",
-             {.waiting = kMaximumWaiting, .what = "memory records", .categoryCode = "zrrs"}, log) {}
+             {.waiting = kMaximumWaiting,
+              .ofUser = kMaximumWaitingOfUser,
+              .what = "memory records",
+              .categoryCode = "zrrs"},
+             log) {}
 
 void LinuxMemoryLog::logMemory(std::int64_t reporterID, std::vector<pid_t> processes) {
     queue_.post([this, reporterID, processes = std::move(processes)] { record(reporterID, processes); });

@@ -20,8 +20,10 @@ namespace tamblo {
 /// microseconds. A process that is gone by then is left out; `kernel` is empty where it cannot be read.
 class LinuxMemoryLog final : public MemoryLog {
 public:
-    /// Each session asks once a second at most; so many wait only when the device is far behind.
+    /// Each session asks once a second at most; so many wait only when the device is far behind, or somebody
+    /// has thousands of sessions.
     static constexpr std::size_t kMaximumWaiting = 256;
+    static constexpr std::size_t kMaximumWaitingOfUser = kMaximumWaiting / 4;
 
     /// What is referred to must outlive the log, except the queues.
     LinuxMemoryLog(SinkFiles& sinks, const Clock& clock, WorkQueues& workQueues, StructuredLog& log,

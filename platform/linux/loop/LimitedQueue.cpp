@@ -7,34 +7,47 @@
 namespace tamblo {
 
 void LimitedQueue::post(Work work) {
-    std::uint64_t dropped = 0;
+    const std::optional<LogOrigin::Client> client = LogOrigin::client();
+    const User user = client ? User(client->user) : std::nullopt;
+    bool isUserFull = false;
     {
         const MutexLock lock(mutex_);
-        if (waiting_ < limit_.waiting) {
+        const auto ofUser = waitingOf_.find(user);
+        const bool isFull = waiting_ == limit_.waiting;
+        isUserFull = !isFull && ofUser != waitingOf_.end() && ofUser->second == limit_.ofUser;
+        if (!isFull && !isUserFull) {
             ++waiting_;
+            ++waitingOf_[user];
             if (queue_ == nullptr) {
                 queue_ = workQueues_.makeSerialQueue(label_);
             }
             queue_->post(
-                [this, work = std::move(work)]() mutable {
-                    begin();
+                [this, user, work = std::move(work)]() mutable {
+                    begin(user);
                     work();
                 },
                 Pace::mayBlock);
             return;
         }
-        dropped = ++dropped_;
+        if (++dropped_ > 1) {
+            return;
+        }
     }
-    if (dropped == 1) {
-        log_.report(LogLevel::error, limit_.categoryCode,
-                    formatted("{} {} wait; further ones are dropped", limit_.waiting, limit_.what));
-    }
+    const std::string whose = !isUserFull ? ""
+                              : user      ? formatted(" of user {}", *user)
+                                          : " of the service itself";
+    log_.report(LogLevel::error, limit_.categoryCode,
+                formatted("{} {}{} wait; further ones are dropped",
+                          isUserFull ? limit_.ofUser : limit_.waiting, limit_.what, whose));
 }
 
-void LimitedQueue::begin() {
+void LimitedQueue::begin(User user) {
     std::uint64_t dropped = 0;
     {
         const MutexLock lock(mutex_);
+        if (--waitingOf_[user] == 0) {
+            waitingOf_.erase(user);
+        }
         if (--waiting_ == 0) {
             dropped = std::exchange(dropped_, 0);
         }

@@ -1,24 +1,29 @@
 #pragma once
 
 #include "base/Mutex.h"
+#include "platform/LogOrigin.h"
 #include "platform/StructuredLog.h"
 #include "platform/WorkQueue.h"
 
 #include <cstddef>
 #include <cstdint>
+#include <map>
 #include <memory>
+#include <optional>
 #include <string>
 #include <string_view>
 
 namespace tamblo {
 
 /// A serial queue for work that takes its time, made with the first piece, on which only so many pieces may
-/// wait: those beyond are dropped and counted. That is one error line when it begins and one, with the count,
-/// once no piece waits any more. Member of a platform service, which outlives the queues; any thread.
+/// wait, and only so many of one user's (`LogOrigin`), so that a user who asks for many leaves room for the
+/// others: those beyond are dropped and counted. That is one error line when it begins and one, with the
+/// count, once no piece waits any more. Member of a platform service, which outlives the queues; any thread.
 class LimitedQueue {
 public:
     struct Limit {
         std::size_t waiting;   ///< besides the piece that runs
+        std::size_t ofUser;    ///< of those
         std::string_view what; ///< the pieces' name in the log: "stack captures"
         std::string_view categoryCode;
     };
@@ -30,7 +35,8 @@ public:
     void post(Work work) TAMBLO_EXCLUDES(mutex_);
 
 private:
-    void begin() TAMBLO_EXCLUDES(mutex_);
+    using User = std::optional<uid_t>; ///< none: the service itself
+    void begin(User user) TAMBLO_EXCLUDES(mutex_);
 
     const Limit limit_;
     const std::string label_;
@@ -39,7 +45,8 @@ private:
 
     Mutex mutex_;
     std::size_t waiting_ TAMBLO_GUARDED_BY(mutex_) = 0;
-    std::uint64_t dropped_ TAMBLO_GUARDED_BY(mutex_) = 0; ///< since none waited
+    std::map<User, std::size_t> waitingOf_ TAMBLO_GUARDED_BY(mutex_); ///< each user's, unless none
+    std::uint64_t dropped_ TAMBLO_GUARDED_BY(mutex_) = 0;             ///< since none waited
     std::unique_ptr<SerialQueue> queue_ TAMBLO_GUARDED_BY(mutex_);
 };
 

@@ -23,6 +23,8 @@ public:
     [[nodiscard]] std::optional<std::string> createDirectory(const std::string& path) override;
     [[nodiscard]] std::variant<std::unique_ptr<ReportFile>, std::string>
     createFile(const std::string& path) override;
+    /// Whether the last report of either kind could not be made or written.
+    [[nodiscard]] bool isOut() const noexcept { return reporting_.isOut() || performance_.isOut(); }
 
 private:
     /// Null for any other place.

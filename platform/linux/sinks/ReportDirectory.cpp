@@ -61,17 +61,27 @@ public:
     File(const File&) = delete;
     File& operator=(const File&) = delete;
 
+    [[nodiscard]] const std::string& name() const noexcept { return name_; }
+
     std::optional<std::string> write(std::string_view text) override {
         if (text.size() > owner_.limits_.fileBytes - size_) {
             return textOf(EFBIG);
         }
-        owner_.grow(name_, text.size());
+        owner_.grow(*this, text.size());
         size_ += text.size();
-        return owner_.operations_.writeAll(descriptor_, text) ? std::nullopt : std::optional(textOf(errno));
+        const bool isWritten = owner_.operations_.writeAll(descriptor_, text);
+        const int error = errno;
+        owner_.isOut_ = !isWritten;
+        if (isWritten) {
+            return std::nullopt;
+        }
+        owner_.shrink(*this, text.size());
+        size_ -= text.size();
+        return textOf(error);
     }
 
     std::optional<std::string> close() override {
-        owner_.finish(name_);
+        owner_.finish(*this);
         // Closed also when it fails: the descriptor may already be somebody else's.
         if (owner_.operations_.close(std::exchange(descriptor_, -1)) != 0 && errno != EINTR) {
             return textOf(errno);
@@ -110,10 +120,22 @@ ReportDirectory::ReportDirectory(const std::string& root, std::string_view below
       directory_(root, below, modes.directory, operations) {}
 
 std::optional<std::string> ReportDirectory::make() {
-    return directory_.open() == nullptr ? std::optional(textOf(errno)) : std::nullopt;
+    if (directory_.open() == nullptr) {
+        isOut_ = true;
+        return textOf(errno);
+    }
+    return std::nullopt;
 }
 
 std::variant<std::unique_ptr<ReportFile>, std::string> ReportDirectory::create(const std::string& name) {
+    auto opened = open(name);
+    if (std::holds_alternative<std::string>(opened)) {
+        isOut_ = true;
+    }
+    return opened;
+}
+
+std::variant<std::unique_ptr<ReportFile>, std::string> ReportDirectory::open(const std::string& name) {
     const HeldDirectory::Ref directory = directory_.open();
     if (directory == nullptr) {
         return textOf(errno);
@@ -123,60 +145,82 @@ std::variant<std::unique_ptr<ReportFile>, std::string> ReportDirectory::create(c
     learnMore();
     learn(name);
     makeRoom(reports_.contains(name) ? 0 : 1, 0);
-    // Emptied first when it is known to be a regular file; opening what is none must not wait either.
-    constexpr int kFlags = O_WRONLY | O_CREAT | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC;
-    FileDescriptor file(operations_.open(directory->get(), name.c_str(), kFlags, modes_.file));
-    struct stat status {};
-    if (!file.isOpen() || operations_.status(file.get(), status) != 0) {
+    if (const auto former = reports_.find(name); former != reports_.end()) {
+        // Removed and not emptied: it may still be written.
+        if (operations_.remove(directory->get(), name.c_str()) != 0 && errno != ENOENT) {
+            return textOf(errno);
+        }
+        forget(former);
+    }
+    constexpr int kFlags = O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC;
+    FileDescriptor opened(operations_.open(directory->get(), name.c_str(), kFlags, modes_.file));
+    if (!opened.isOpen()) {
         return textOf(errno);
     }
-    if (!S_ISREG(status.st_mode)) {
-        return "not a regular file";
-    }
-    if (operations_.truncate(file.get(), 0) != 0) {
-        return textOf(errno);
-    }
-    (void)::fchmod(file.get(), modes_.file); // whatever the process's mask is
+    (void)::fchmod(opened.get(), modes_.file); // whatever the process's mask is
     Report& report = reports_[name];
-    bytes_ -= std::exchange(report.size, 0);
     report.modified = clock_.now();
-    ++report.writers;
-    return std::make_unique<File>(*this, name, file.release());
+    auto file = std::make_unique<File>(*this, name, opened.release());
+    report.writer = file.get();
+    return file;
 }
 
-void ReportDirectory::grow(const std::string& name, std::size_t bytes) {
+ReportDirectory::Report* ReportDirectory::reportOf(const File& file) noexcept {
+    const auto report = reports_.find(file.name());
+    return report != reports_.end() && report->second.writer == &file ? &report->second : nullptr;
+}
+
+void ReportDirectory::grow(const File& file, std::size_t bytes) {
     const MutexLock lock(mutex_);
     makeRoom(0, bytes);
-    if (const auto report = reports_.find(name); report != reports_.end()) {
-        report->second.size += bytes;
+    if (Report* const report = reportOf(file)) {
+        report->size += bytes;
         bytes_ += bytes;
     }
 }
 
-void ReportDirectory::finish(const std::string& name) noexcept {
+void ReportDirectory::shrink(const File& file, std::size_t bytes) noexcept {
     const MutexLock lock(mutex_);
-    if (const auto report = reports_.find(name); report != reports_.end() && report->second.writers != 0) {
-        --report->second.writers;
-        report->second.modified = clock_.now();
+    if (Report* const report = reportOf(file)) {
+        report->size -= bytes;
+        bytes_ -= bytes;
+    }
+}
+
+void ReportDirectory::finish(const File& file) noexcept {
+    const MutexLock lock(mutex_);
+    if (Report* const report = reportOf(file)) {
+        report->writer = nullptr;
+        report->modified = clock_.now();
     }
 }
 
 void ReportDirectory::use(const HeldDirectory::Ref& directory) {
-    if (known_ == directory) {
+    if (known_ != directory) {
+        known_ = directory;
+        reports_.clear();
+        bytes_ = 0;
+        unread_.reset();
+        isRead_ = false;
+    }
+    if (isRead_ || unread_ != nullptr) {
         return;
     }
-    known_ = directory;
-    reports_.clear();
-    bytes_ = 0;
-    const int own = ::openat(directory->get(), ".", O_RDONLY | O_DIRECTORY | O_CLOEXEC);
-    unread_.reset(own < 0 ? nullptr : ::fdopendir(own));
+    // What cannot be opened now, for want of a descriptor, is tried again with the next report.
+    FileDescriptor own(operations_.open(directory->get(), ".", O_RDONLY | O_DIRECTORY | O_CLOEXEC, 0));
+    unread_.reset(own.isOpen() ? ::fdopendir(own.get()) : nullptr);
+    if (unread_ != nullptr) {
+        (void)own.release();
+    }
 }
 
 void ReportDirectory::learnMore() {
     for (std::size_t i = 0; unread_ != nullptr && i < kEntriesAtATime; ++i) {
+        errno = 0;
         if (const dirent* const entry = ::readdir(unread_.get())) {
             learn(entry->d_name);
         } else {
+            isRead_ = errno == 0;
             unread_.reset();
         }
     }
@@ -222,7 +266,7 @@ ReportDirectory::Reports::iterator ReportDirectory::firstToGo(WallTime now) {
         return std::pair(report.modified <= now, report.modified);
     };
     for (auto report = reports_.begin(); report != reports_.end(); ++report) {
-        if (report->second.writers == 0 &&
+        if (report->second.writer == nullptr &&
             (first == reports_.end() || rank(report->second) < rank(first->second))) {
             first = report;
         }
@@ -234,7 +278,7 @@ void ReportDirectory::lookAgain() {
     for (auto report = reports_.begin(); report != reports_.end();) {
         const auto looked = report++;
         struct stat status {};
-        if (looked->second.writers == 0 &&
+        if (looked->second.writer == nullptr &&
             operations_.status(known_->get(), looked->first.c_str(), status) != 0) {
             forget(looked);
         }
