@@ -335,20 +335,6 @@ TEST_F(LinuxAnalyticsEventServiceTest, AnswersWhichEventsAreInUse) {
                                          HasSubstr("analytics.json: events_in_use holds what is no name")));
 }
 
-TEST_F(LinuxAnalyticsEventServiceTest, AnEventWhoseFellowIsTooLongIsWhole) {
-    const Dictionary most{{"k", std::string(SinkFileLimits().line - 80, 'x')}};
-    const std::string name(100, 'e');
-    events_.sendEventLazy("a", [] { return Dictionary(); });
-    events_.sendEventLazy(name, [&most] { return most; });
-    events_.sendEventLazy("f", [&most] { return most; });
-    sinks_.flush();
-    EXPECT_EQ(sinks_.lostLines(), 1U);
-    EXPECT_THAT(test::linesOf(directory_.path("analytics-events.jsonl")),
-                ElementsAre(HasSubstr(R"("event":"a","payload":{}})"),
-                            AllOf(StartsWith("{\"time\":1772366400"), EndsWith("xxx\"}}"),
-                                  HasSubstr(R"("event":"f","payload":{"k":"xxx)"))));
-}
-
 TEST_F(LinuxAnalyticsEventServiceTest, WritesTheEventsThatAreInUse) {
     useEvents(Array{"e1", "e\"2"});
     Dictionary payload{{"k", 1}, {"t", "x\ny"}};
@@ -521,24 +507,6 @@ TEST_F(LinuxReportFilesTest, TheNewestAreKeptAndNothingElseIsRemoved) {
     report(12, 500);
     EXPECT_THAT(kept(), UnorderedElementsAre(nameOf(10), nameOf(12)));
     EXPECT_THAT(log.take(), IsEmpty());
-}
-
-TEST_F(LinuxReportFilesTest, ADirectoryFullOfOtherFilesIsLearntLittleByLittle) {
-    constexpr int kStrange = 2000;
-    for (int i = 0; i < kStrange; ++i) {
-        leave("strange" + std::to_string(i), 0);
-        if (i % 100 == 0) {
-            leave(nameOf(1000 + i), 20);
-        }
-    }
-    const auto reports = [this] { return test::entriesOf(files->reportingLogsDirectory()) - kStrange; };
-    std::ptrdiff_t before = reports();
-    for (int i = 0; i < 5; ++i) {
-        report(i, 1);
-        EXPECT_GT(reports(), before - 15) << "no more than a share of them";
-        before = reports();
-    }
-    EXPECT_EQ(before, 4);
 }
 
 } // namespace
