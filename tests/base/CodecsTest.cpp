@@ -313,18 +313,13 @@ TEST(JsonReader, SaysWhatIsWrongAndWhere) {
         std::size_t line, column;
         const char* says;
     } rows[] = {
-        {"", 1, 1, "the end of the text"},
-        {"null", 1, 1, "null"},
         {"\xEF\xBB\xBF{}", 1, 1, "the byte 239"},
         {"[1e309]", 1, 2, "too large"},
-        {"-1e99999999999999999999", 1, 1, "too large"},
         {"{\"a\":1,\n \"\xC3\xA9\":2, \"a\":3}", 2, 9, "\"a\" stands here a second time"},
         {R"({"b":0,"\u0061":0,"c":{"a":null,"\u0061":1},"a":0})", 1, 33, "\"a\" stands here a second time"},
-        {"\"abc", 1, 1, "does not end"},
         {std::string("\"a\0\"", 4), 1, 3, "escaped"},
         {R"("\u12g4")", 1, 4, "hexadecimal"},
         {R"("\ud800\ud800")", 1, 2, "surrogate"},
-        {R"("\udbff\ue000")", 1, 2, "surrogate"},
         {"[\"\xC0\x80\"]", 1, 2, "UTF-8"},
         {repeated("[", 33) + repeated("]", 33), 1, 33, "deeper than 32"},
         {repeated("{\"\":", 200'000), 1, 129, "deeper than 32"},

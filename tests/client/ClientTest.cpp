@@ -275,22 +275,5 @@ TEST(CApi, ACProgramRunsASessionAndItsPayloadArrivesAsItWasBuilt) {
     EXPECT_FALSE(requests[6].id);
 }
 
-TEST(Vocabulary, NamesAndNumbersAreReadAndWritten) {
-    const std::pair<std::string_view, EventCategory> named[] = {
-        {"Volume", kVolume},
-        {"Session_Playback", category(Subsystem::session, EventKind::playback)},
-        {"Unknown", EventCategory::unknown}};
-    for (const auto& [name, value] : named) {
-        EXPECT_EQ(parseCategory(name), value) << name;
-        EXPECT_EQ(parseCategory(std::to_string(static_cast<std::uint32_t>(value))), value) << name;
-        EXPECT_EQ(categoryName(value), name);
-    }
-    for (const std::string_view none : {"4294967296", "volume", "Session_", "Other_Volume", "0x", "-1", ""}) {
-        EXPECT_FALSE(parseCategory(none)) << none;
-    }
-    EXPECT_EQ(parseType("65535"), parseType("Unknown"));
-    EXPECT_FALSE(parseType("65536"));
-}
-
 } // namespace
 } // namespace tamblo::client

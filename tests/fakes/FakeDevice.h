@@ -72,18 +72,13 @@ public:
 class FakePreferences final : public Preferences {
 public:
     std::optional<Value> copyPreferenceValue(std::string_view key, std::string_view domain) const override {
-        return lookUp(values_, std::pair(std::string(domain), std::string(key)));
+        return lookUp(values, std::pair(std::string(domain), std::string(key)));
     }
     void setPreferenceValue(std::string_view key, std::string_view domain, const Value& value) override {
-        set(std::string(key), std::string(domain), value);
+        values[{std::string(domain), std::string(key)}] = value;
     }
-    void set(const std::string& key, const std::string& domain, Value value) {
-        values_[{domain, key}] = std::move(value);
-    }
-    void remove(const std::string& key, const std::string& domain) { values_.erase({domain, key}); }
 
-private:
-    std::map<std::pair<std::string, std::string>, Value> values_;
+    std::map<std::pair<std::string, std::string>, Value> values; ///< by domain and key
 };
 
 class FakeProcessInformation final : public ProcessInformation {

@@ -37,9 +37,6 @@ TEST(JsonFileTest, WhatIsWrongIsAbsentAndToldOncePerState) {
     directory.write("f.json", "[1, null, {}]");
     EXPECT_EQ(file.read(log), std::nullopt);
     EXPECT_THAT(log.take(), SizeIs(1)) << "told anew after it was well";
-    int elements = 0;
-    EXPECT_TRUE(file.readArray([&elements](const JsonItem&) { ++elements; }, log));
-    EXPECT_EQ(elements, 2);
 }
 
 class LinuxPreferencesTest : public Test {
@@ -113,10 +110,6 @@ TEST_F(LinuxPreferencesTest, FollowTheFiles) {
     EXPECT_EQ(valueAfterChange(), 1);
     write(R"({"a": [1], "k": 2})");
     EXPECT_EQ(value(), 1) << "read once, until a change is told";
-    EXPECT_EQ(valueAfterChange(), 2);
-    fs::rename(path_, directory_.path("away"));
-    EXPECT_EQ(valueAfterChange(), -1);
-    fs::rename(directory_.path("away"), path_);
     EXPECT_EQ(valueAfterChange(), 2);
     EXPECT_THAT(log_.take(), IsEmpty());
     const std::uint64_t before = preferences_.generation();

@@ -353,20 +353,6 @@ TEST_F(LinuxAnalyticsEventServiceTest, AnswersWhichEventsAreInUse) {
                                          HasSubstr("analytics.json: events_in_use holds what is no name")));
 }
 
-TEST_F(LinuxAnalyticsEventServiceTest, AnEventWhoseFellowIsTooLongIsWhole) {
-    const Dictionary most{{"k", std::string(SinkFileLimits().line - 80, 'x')}};
-    const std::string name(100, 'e');
-    events_.sendEventLazy("a", [] { return Dictionary(); });
-    events_.sendEventLazy(name, [&most] { return most; });
-    events_.sendEventLazy("f", [&most] { return most; });
-    sinks_.flush();
-    EXPECT_EQ(sinks_.lostLines(), 1U);
-    EXPECT_THAT(test::linesOf(directory_.path("analytics-events.jsonl")),
-                ElementsAre(HasSubstr(R"("event":"a","payload":{}})"),
-                            AllOf(StartsWith("{\"time\":1772366400"), EndsWith("xxx\"}}"),
-                                  HasSubstr(R"("event":"f","payload":{"k":"xxx)"))));
-}
-
 TEST_F(LinuxAnalyticsEventServiceTest, WritesTheEventsThatAreInUse) {
     useEvents(Array{"e1", "e\"2"});
     Dictionary payload{{"k", 1}, {"t", "x\ny"}};

@@ -48,7 +48,7 @@ protected:
 };
 
 TEST_F(SystemMonitorTest, AStateHasTheValueAndWhenItWasReadAndTheRingerIsOnForTheWordOneOnly) {
-    device.preferences.set(kSpatial, "com.vandra.dashlo", "fixed");
+    device.preferences.setPreferenceValue(kSpatial, "com.vandra.dashlo", "fixed");
     const auto states = makeMonitor();
     EXPECT_EQ(states->find(kSpatial), (Dictionary{{kSpatial, "fixed"},
                                                   {"zrreporting_timestamp", device.clock.seconds()},
@@ -146,7 +146,7 @@ TEST_F(SystemMonitorTest, SessionsAreToldWhatIsKnownAtTheStartAndEveryChangeAfte
         session.reset();
         device.restart();
         device.clock.set(kStart);
-        device.preferences.remove("device_name", "com.vandra.tamblo");
+        device.preferences.values.erase({"com.vandra.tamblo", "device_name"});
         std::map<char, std::shared_ptr<ZRReportingSession>> sessions;
         playWords(row.script,
                   {{"monitor", [this] { (void)makeMonitor(); }},
@@ -162,7 +162,8 @@ TEST_F(SystemMonitorTest, SessionsAreToldWhatIsKnownAtTheStartAndEveryChangeAfte
                           return;
                       }
                       if (word.starts_with('=')) {
-                          device.preferences.set("device_name", "com.vandra.tamblo", word.substr(1));
+                          device.preferences.setPreferenceValue("device_name", "com.vandra.tamblo",
+                                                                word.substr(1));
                           return;
                       }
                       std::shared_ptr<ZRReportingSession>& meant = sessions[word.front()];

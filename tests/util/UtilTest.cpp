@@ -1,6 +1,5 @@
 #include "tests/fakes/FakePlatform.h"
 #include "util/AudioEvents.h"
-#include "util/ConditionWait.h"
 #include "util/DataSerialize.h"
 #include "util/Log.h"
 #include "util/NumberBuckets.h"
@@ -12,7 +11,6 @@
 #include <limits>
 #include <optional>
 #include <string>
-#include <thread>
 #include <tuple>
 #include <vector>
 
@@ -89,11 +87,9 @@ TEST(UtilitiesTest, NearestBucket) {
 }
 
 TEST(UtilitiesTest, ChangesRoundingAndDates) {
-    const Dictionary first{{"same", 1}, {"changed", 1}, {"gone", 1}};
-    const Dictionary second{{"same", 1.0}, {"changed", "1"}};
+    const Dictionary first{{"same", 1}, {"changed", 1}, {"gone", 1}}, second{{"same", 1.0}, {"changed", "1"}};
     for (const char* key : {"same", "changed", "gone"}) {
         EXPECT_EQ(ZRReportingUtilityKeyIsPresentAndHasChanged(key, &first, &second), key[0] == 'c') << key;
-        EXPECT_FALSE(ZRReportingUtilityKeyIsPresentAndHasChanged(key, nullptr, &second)) << key;
     }
     EXPECT_EQ(ZRReportingUtilityRoundWithPlaces(-2.5, 0), -3);
     EXPECT_EQ(ZRReportingUtilityRoundWithPlaces(1234, -2), 1200);
@@ -109,26 +105,6 @@ TEST(UtilitiesTest, ChangesRoundingAndDates) {
     EXPECT_EQ(ZRReportingUtilityAddDates({{"a", 1}, {"systemuptime_sec", "old"}}), expected);
     device.processInformation.uptime = std::chrono::duration<double>(1e12);
     EXPECT_EQ(ZRReportingUtilityAddDates({}).find("systemuptime_sec")->integerValue(), 2147483647);
-}
-
-TEST(ConditionWaitTest, SignalledAndTimedOut) {
-    FakePlatform device;
-    const LogCategory& category = ZRReportingSessionLinkmeterCategory();
-    ConditionLock lock;
-    bool flag = false;
-    const auto wait = [&](std::chrono::hours time) {
-        return ZRReportingUtilityWait(lock, time, flag, "waiting", "timeout", category);
-    };
-    EXPECT_FALSE(wait(std::chrono::hours(0)));
-    EXPECT_THAT(device.log.texts(), testing::ElementsAre("waiting", "timeout"));
-    const std::jthread signaller([&] {
-        while (device.log.count("waiting") < 3) {
-            lock.condition.notify_one(); // a wake-up that means nothing
-        }
-        ZRReportingUtilitySignal(lock, flag);
-    });
-    EXPECT_TRUE(wait(std::chrono::hours(1'000'000)));
-    EXPECT_EQ(device.log.texts().back(), "continuing");
 }
 
 TEST(DataSerializeTest, EveryKindOfValue) {

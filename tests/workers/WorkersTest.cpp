@@ -54,8 +54,11 @@ TEST_F(WorkersTest, RefuseSessionsOnBuildsAndDevicesThatDoNotWantThem) {
         setInternalBuild(c.isInternal);
         for (const char* key : {"enable_stackburst", "TalvixInvalidXyBackOffSeconds"}) {
             const char* domain = "com.vandra.tamblo.zrreporting";
-            c.areCapturesWanted ? device.preferences.set(key, domain, 1)
-                                : device.preferences.remove(key, domain);
+            if (c.areCapturesWanted) {
+                device.preferences.setPreferenceValue(key, domain, 1);
+            } else {
+                device.preferences.values.erase({domain, key});
+            }
         }
         std::string refusing;
         for (const WorkerClass& row : workerClassList()) {
@@ -238,7 +241,7 @@ TEST_F(WorkersTest, AccessoriesAreLookedUpAtMostOnceAMinuteAndKept) {
         makeSession()->start();
         device.serverQueue().runAll();
     };
-    device.preferences.set("registered", domain, Array{1});
+    device.preferences.setPreferenceValue("registered", domain, Array{1});
     startSession(1min);
     EXPECT_EQ(kept(), "{}");
     EXPECT_EQ(loggedLevels(ZRReportingAudioRegistrationCategory()), "e") << "the rubbish";
