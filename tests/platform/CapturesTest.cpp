@@ -387,7 +387,7 @@ TEST_F(CapturesTest, TheMemoryLogLeavesOutWhoIsGone) {
 TEST_F(CapturesTest, OfTheMemoryRecordsThatWaitNoUserHasMoreThanAQuarter) {
     LinuxMemoryLog memory(sinks, clock, workQueues, log, files());
     const auto ask = [&memory](uid_t user, std::size_t times) {
-        const LogOrigin origin(LogOrigin::Client{user, 1});
+        const LogOrigin origin(ClientIdentity{user, 1});
         for (; times != 0; --times) {
             memory.logMemory(7, {});
         }

@@ -7,7 +7,7 @@
 namespace tamblo {
 
 void LimitedQueue::post(Work work) {
-    const std::optional<LogOrigin::Client> client = LogOrigin::client();
+    const std::optional<ClientIdentity> client = LogOrigin::client();
     const User user = client ? User(client->user) : std::nullopt;
     bool isUserFull = false;
     {
