@@ -114,6 +114,17 @@ void unknownMethods(const Assault& assault) {
     } while (client.send());
 }
 
+void smallestFrames(const Assault& assault) {
+    HostileClient client(assault);
+    std::string frames;
+    for (int i = 0; i < 10'000; ++i) {
+        frames += std::string("\x01\0\0\0\x07", 5);
+    }
+    do {
+        client.addBytes(frames);
+    } while (client.send());
+}
+
 void frameThatIsNone(const Assault& assault) {
     while (!assault.isOver()) {
         HostileClient client(assault);
@@ -158,6 +169,7 @@ constexpr std::array kAttacks{
     Attack{"connections", "connections made and ended", connectionsInALoop},
     Attack{"never_reading", "50 clients that do not read the lists that they ask for", neverReading},
     Attack{"unknown_methods", "small frames that are refused", unknownMethods},
+    Attack{"smallest_frames", "frames of five bytes that are refused", smallestFrames},
     Attack{"no_frames", "connections that end with a frame that is none", frameThatIsNone},
     Attack{"many_senders", "500 connections that send as fast as they can", manySenders},
     Attack{"kill_service", "the request to end", killService},

@@ -91,6 +91,16 @@ void largeMessages(const Assault& assault) {
     });
 }
 
+/// Six bytes each in a line of a sink.
+void largeEscapedMessages(const Assault& assault) {
+    HostileClient client(assault);
+    addSession(client, kReporterID);
+    const std::string text(kLarge, '\x01');
+    flood(client, [&](std::uint64_t number) {
+        return messageFor(kReporterID, {{"count", number}, {"text", text}});
+    });
+}
+
 /// Each a byte on the wire, and a value in memory.
 void emptyArrays(const Assault& assault) {
     HostileClient client(assault);
@@ -206,6 +216,8 @@ constexpr std::array kAttacks{
     Attack{"long_lists", "a reporter named 128 times in a frame", longLists},
     Attack{"unknown_identifiers", "200,000 unknown reporters in a frame", unknownIdentifiers},
     Attack{"large_messages", "messages of 0.9 MB", largeMessages},
+    Attack{"escaped_messages", "messages of 0.9 MB that takes six times as much in a line",
+           largeEscapedMessages},
     Attack{"empty_arrays", "900,000 empty arrays in a frame, eight frames at once", emptyArrays},
     Attack{"large_values", "0.9 MB under a new key in each message", largeValuesUnderNewKeys},
     Attack{"distinct_keys_gone", "12,000 messages with keys of their own, then the end of their client",

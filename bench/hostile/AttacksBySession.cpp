@@ -1,7 +1,9 @@
 #include "Attacks.h"
 
 #include <array>
+#include <memory>
 #include <string>
+#include <vector>
 
 namespace tamblo::bench {
 
@@ -192,6 +194,66 @@ void neverStarted(const Assault& assault) {
     }
 }
 
+/// Each connection has one message to all under way.
+void broadcastsOfMany(const Assault& assault) {
+    HostileClient first(assault), second(assault);
+    makeSessions(first, 8'000, true);
+    makeSessions(second, 8'000, true);
+    wire::Request message = messageFor(0, {});
+    message.reporterIDs.clear();
+    std::vector<std::unique_ptr<HostileClient>> clients;
+    while (clients.size() < 1'000 && !assault.isOver()) {
+        clients.push_back(std::make_unique<HostileClient>(assault));
+        message.dictionary = Dictionary{{"count", std::int64_t(clients.size())}};
+        clients.back()->add(message);
+        clients.back()->send();
+    }
+    assault.sleepUntilOver();
+}
+
+/// Each message ends a stretch of what is derived at the stop.
+void shortStretches(const Assault& assault) {
+    HostileClient client(assault);
+    addSession(client, kReporterID);
+    for (int number = 0; number < 200'000; ++number) {
+        client.add(messageFor(kReporterID, {{"zrreporting_timestamp", 2e9 + 2 * number},
+                                            {"active_devices", std::to_string(number)},
+                                            {"session_running", true}}));
+        if (!sendIfMany(client)) {
+            return;
+        }
+    }
+    client.add({.method = Method::stopReportingSessionForID, .reporterID = kReporterID});
+    client.settle();
+    assault.sleepUntilOver();
+}
+
+/// Sessions whose client is gone before they are stopped.
+void sessionsLeft(const Assault& assault) {
+    while (!assault.isOver()) {
+        HostileClient client(assault);
+        for (std::int64_t id = 1; id <= 3'000 && !assault.isOver(); ++id) {
+            addSession(client, id);
+            client.add(messageFor(id, {{"count", id}}));
+        }
+        client.settle();
+    }
+}
+
+void largeSessionDestroyed(const Assault& assault) {
+    HostileClient client(assault);
+    do {
+        client.add({.method = Method::createReportingSession, .reporterID = kReporterID});
+        for (int number = 0; number < 100'000; ++number) {
+            client.add(messageFor(kReporterID, {{"count", number}}));
+            if (!sendIfMany(client)) {
+                return;
+            }
+        }
+        client.add({.method = Method::destroyReportingSession, .reporterID = kReporterID});
+    } while (client.settle());
+}
+
 /// Every list is read, and asked for again.
 void listsRead(const Assault& assault) {
     HostileClient client(assault);
@@ -217,6 +279,11 @@ constexpr std::array kAttacks{
     Attack{"large_session", "a session of 200,000 messages stopped", largeSessionStopped, Shortage::none,
            std::chrono::seconds(10)},
     Attack{"never_started", "messages to a session that is never started", neverStarted},
+    Attack{"broadcasts_of_many", "a message to 16,000 started sessions of each of 1,000 clients",
+           broadcastsOfMany},
+    Attack{"short_stretches", "a session of 200,000 stretches stopped", shortStretches},
+    Attack{"sessions_left", "3,000 started sessions of a client that goes", sessionsLeft},
+    Attack{"large_session_destroyed", "100,000 messages, destroyed without a start", largeSessionDestroyed},
     Attack{"lists_read", "850 lists of 1,000 reporters asked for at once, and read", listsRead},
 };
 
