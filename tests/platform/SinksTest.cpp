@@ -206,6 +206,7 @@ TEST_F(AppendOnlyFileTest, OfADiskThatFailsAndRecoversEachLineIsThereOnceOrCount
                 append(file, expected.back());
             }
             file.flush();
+            EXPECT_TRUE(operations_.truncateError != 0 || ("\n" + content()).ends_with('\n')) << "torn";
             // What is lost of a batch are its last lines.
             const std::uint64_t ofBatch = sinks_.lostLines() - before;
             lost += ofBatch;

@@ -51,12 +51,10 @@ TEST_F(RetainedTest, TheOldestOfTheLargestGoesAndNothingElse) {
     send(*large, 2000, 1000);
     EXPECT_EQ(small->messages().size(), 50U);
     EXPECT_EQ(others->messages().size(), 300U);
-    EXPECT_GT(large->droppedMessageCount(), 1500U);
     EXPECT_EQ(large->droppedMessageCount(), device.services().activity->droppedRecords);
     EXPECT_EQ(large->messages().size() + large->droppedMessageCount(), 2002U);
     EXPECT_EQ(large->acceptedMessageCount(), 2001U);
     EXPECT_LE(all().bytes(), 2 * kLimitOfUser);
-    EXPECT_EQ(large->messages().back()->payload().find("n")->integerValue(), 1999);
     const auto again = messageOf({{"n", 0}, {"text", std::string(10, 'x')}}, 14, 12);
     large->sendMessage(again);
     EXPECT_FALSE(again->isRedundant) << "what it repeats is not there any more";

@@ -28,8 +28,8 @@ protected:
         prefer("TalvixInvalidXyBackOffSeconds", "60.5 s");
         prefer("enable_stackburst", "YES");
     }
-    void prefer(const std::string& key, Value value) {
-        device.preferences.setPreferenceValue(key, kDomain, std::move(value));
+    void prefer(const std::string& key, const Value& value) {
+        device.preferences.setPreferenceValue(key, kDomain, value);
     }
     /// What a new worker makes of messages, which are told by their times: a "d" for each that is drafted,
     /// a "." for each that is not. "x" has another key, "+" sets the clock on.

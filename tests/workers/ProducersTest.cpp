@@ -135,9 +135,6 @@ TEST_F(ProducersTest, GroupSessionSegments) {
              "0 out group=1 formatID=F1; 10 out=false; 100 out; 110 length=1 out; 120 out; 130 formatID=F2;"
              "140 group=1; 150 length=1",
              "10.0 F1 -1 unknown 1 3; 10.0 F1 -1 unknown 2 3; 10.0 F2 -1 unknown 3 3"},
-            {"what was before counts from its own time",
-             "2 out group=1 formatID=F1 | 10 formatID=F2; 17 length=1",
-             "8.0 F1 -1 unknown 1 2; 7.0 F2 -1 unknown 2 2"},
         });
 }
 

@@ -304,7 +304,6 @@ TEST(ChromeTraceTest, IsTheObjectForm) {
         {2, R"({"args":{"name":"output 7"},"name":"thread_name","ph":"M","pid":77,"tid":4194327})"},
         {4, R"({"args":{"reporterID":7,"serviceName":"velka"},"dur":10000000,"name":"session","ph":"X",)"
             R"("pid":77,"tid":4194326,"ts":1772366400000000})"},
-        {6, R"({"dur":8000000,"name":"input","ph":"X","pid":77,"tid":4194328,"ts":1772366402000000})"},
         {7, R"({"args":{"category":"Generic","type":"Error"},"name":"Generic_Error","ph":"i",)"
             R"("pid":77,"s":"p","tid":77,"ts":1772366402000000})"}};
     for (const auto& [place, event] : expected) {

@@ -54,10 +54,9 @@ TEST_F(WorkersTest, RefuseSessionsOnBuildsAndDevicesThatDoNotWantThem) {
         setInternalBuild(c.isInternal);
         for (const char* key : {"enable_stackburst", "TalvixInvalidXyBackOffSeconds"}) {
             const char* domain = "com.vandra.tamblo.zrreporting";
+            device.preferences.values.erase({domain, key});
             if (c.areCapturesWanted) {
                 device.preferences.setPreferenceValue(key, domain, 1);
-            } else {
-                device.preferences.values.erase({domain, key});
             }
         }
         std::string refusing;
