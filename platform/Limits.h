@@ -42,7 +42,7 @@ struct Limits {
     std::size_t waitingBytes = 4U << 20U;          ///< of a connection, as values in memory
     std::size_t waitingBytesOfUser = 8U << 20U;    ///< likewise
     std::size_t unfinishedBytesOfUser = 8U << 20U; ///< frames that have begun
-    std::size_t frameSeconds = 10;                 ///< until a frame that has begun is finished
+    std::size_t frameSeconds = 10;                 ///< without progress of a frame that has begun
     std::size_t replyBytes = 4U << 20U;            ///< that a connection's socket has refused
     std::size_t replyBytesOfUser = 16U << 20U;     ///< likewise
 

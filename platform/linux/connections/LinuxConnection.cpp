@@ -208,9 +208,6 @@ void LinuxConnection::takeFrames(std::span<const std::uint8_t> received) {
         bytes += decodeAndDispatch(*item);
         ++requests;
     }
-    if (requests != 0) {
-        shared_.unfinished.forget(unfinishedPlace_); // what is left is another frame
-    }
     if (ending_ == Ending::none && frames.tooLong()) {
         refuse({.endsConnection = true,
                 .error = {std::string(kProtocolErrorDomain), wire::kNotARequest,
@@ -257,14 +254,12 @@ void LinuxConnection::endUnfinished() {
         const MutexLock lock(mutex_);
         if (isFlooded_ || isReadable_) {
             // The client is not the one who is slow.
-            shared_.unfinished.forget(unfinishedPlace_);
             shared_.unfinished.note(*this, unfinishedPlace_);
             return;
         }
     }
-    endBeyond(
-        {std::string(kProtocolErrorDomain), kLimitReached,
-         formatted("frame_seconds: a frame was not finished within {} s", shared_.limits.frameSeconds)});
+    endBeyond({std::string(kProtocolErrorDomain), kLimitReached,
+               formatted("frame_seconds: a frame made no progress for {} s", shared_.limits.frameSeconds)});
 }
 
 std::size_t LinuxConnection::decodeAndDispatch(std::span<const std::uint8_t> item) {

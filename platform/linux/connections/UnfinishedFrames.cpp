@@ -5,10 +5,14 @@
 namespace tamblo {
 
 void UnfinishedFrames::note(LinuxConnection& connection, Place& place) {
+    const Time now = std::chrono::steady_clock::now();
     if (place == none()) {
-        place = entries_.insert(entries_.end(), {&connection, std::chrono::steady_clock::now()});
-        startTimer();
+        place = entries_.insert(entries_.end(), {&connection, now});
+    } else {
+        place->progress = now;
+        entries_.splice(entries_.end(), entries_, place);
     }
+    startTimer();
 }
 
 void UnfinishedFrames::forget(Place& place) {
@@ -23,7 +27,7 @@ void UnfinishedFrames::startTimer() {
         return;
     }
     isTimerRunning_ = true;
-    const auto left = entries_.front().begun + patience_ - std::chrono::steady_clock::now();
+    const auto left = entries_.front().progress + patience_ - std::chrono::steady_clock::now();
     loop_.callAfter(std::chrono::ceil<std::chrono::milliseconds>(left), [this] {
         isTimerRunning_ = false;
         endOverdue();
@@ -33,8 +37,8 @@ void UnfinishedFrames::startTimer() {
 
 void UnfinishedFrames::endOverdue() {
     const Time latest = std::chrono::steady_clock::now() - patience_;
-    while (!entries_.empty() && entries_.front().begun <= latest) {
-        // Forgets itself, or begins anew.
+    while (!entries_.empty() && entries_.front().progress <= latest) {
+        // Forgets itself.
         entries_.front().connection->endUnfinished();
     }
 }

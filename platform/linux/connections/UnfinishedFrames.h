@@ -9,14 +9,14 @@ namespace tamblo {
 
 class LinuxConnection;
 
-/// The connections that have sent the beginning of a frame, the oldest first; one that is not finished within
-/// the time allowed is ended. While there are none, no timer runs. On the I/O thread.
+/// The connections that have sent the beginning of a frame, the one whose last progress is longest ago first;
+/// one that makes none for the time allowed is ended. While there are none, no timer runs. On the I/O thread.
 class UnfinishedFrames {
 public:
     using Time = std::chrono::steady_clock::time_point;
     struct Entry {
         LinuxConnection* connection;
-        Time begun;
+        Time progress;
     };
     /// A connection's place here; the end of the list while it has none.
     using Place = std::list<Entry>::iterator;
@@ -24,7 +24,7 @@ public:
     UnfinishedFrames(EventLoop& loop, std::chrono::seconds patience) : loop_(loop), patience_(patience) {}
 
     [[nodiscard]] Place none() noexcept { return entries_.end(); }
-    /// Notes that a frame has begun; nothing for one that is noted.
+    /// Notes that a frame has begun, or has got further.
     void note(LinuxConnection& connection, Place& place);
     void forget(Place& place);
 
