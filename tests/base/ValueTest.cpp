@@ -43,7 +43,8 @@ TEST(Value, NumbersAreEqualByValueAcrossKinds) {
         {Value(Dictionary{})},
         {Value(Array{1, "a"}), Value(Array{1.0, "a"})},
         {Value(Dictionary{{"a", 1}}), Value(Dictionary{{"a", true}})},
-        {Value(Dictionary{{"b", 1}})}};
+        {Value(Dictionary{{"a", 1}, {"b", 1}})},
+        {Value(Dictionary{{"", 1}, {"ab", 1}})}};
     for (const auto& some : classes) {
         for (const auto& others : classes) {
             for (const Value& a : some) {
