@@ -424,7 +424,8 @@ bool CborReader::readEntries(const Head& head, int depth) {
         if (key.size() > limits_.keyBytes) {
             return fail(CborError::keyTooLong);
         }
-        if ((keyBytesRead_ += key.size()) > limits_.bytesOfKeys) {
+        keyBytesRead_ += key.size();
+        if (keyBytesRead_ > limits_.bytesOfKeys) {
             return fail(CborError::keysTooLong);
         }
         if (!charge(kEntryBytes)) {

@@ -69,18 +69,33 @@ std::size_t copyPlain(char* to, std::string_view text) noexcept {
     return i;
 }
 
-char* writeEscaped(char* to, char character) noexcept {
+/// What a byte becomes in a text: copied as a whole, of which as many bytes count as `size` says.
+struct Escaped {
+    std::array<char, 7> text{};
+    std::uint8_t size = 0;
+};
+constexpr std::size_t kLongestEscaped = 6;
+constexpr std::array<Escaped, 256> kEscaped = [] {
     constexpr std::string_view hex = "0123456789abcdef";
-    *to++ = '\\';
-    *to++ = escapeOf(character);
-    if (to[-1] == 'u') {
-        const auto code = static_cast<unsigned char>(character);
-        *to++ = '0';
-        *to++ = '0';
-        *to++ = hex[code >> 4U];
-        *to++ = hex[code & 0xFU];
+    std::array<Escaped, 256> all{};
+    for (std::size_t code = 0; code < all.size(); ++code) {
+        const char escape = kEscapes[code];
+        if (escape == 'u') {
+            all[code] = {{'\\', 'u', '0', '0', hex[code >> 4U], hex[code & 0xFU]}, kLongestEscaped};
+        } else if (escape != 0) {
+            all[code] = {{'\\', escape}, 2};
+        } else {
+            all[code] = {{static_cast<char>(code)}, 1};
+        }
     }
-    return to;
+    return all;
+}();
+
+/// Needs room for eight bytes.
+char* writeEscaped(char* to, char character) noexcept {
+    const Escaped& escaped = kEscaped[static_cast<unsigned char>(character)];
+    std::memcpy(to, &escaped, sizeof escaped);
+    return to + escaped.size;
 }
 
 char* writeText(char* to, std::string_view text) noexcept {
@@ -195,11 +210,17 @@ void appendQuoted(TextBuffer& out, std::string_view lead, std::string_view text)
     std::size_t plain = copyPlain(at, text);
     at += plain;
     while (plain != text.size()) {
-        // Rare: from here on each step asks for the most room that it can need.
+        // Rare, but who wants it to cost much sends nothing else: some bytes at a time, in the room that they
+        // can need at most.
+        constexpr std::size_t kRun = 64;
         out.commit(static_cast<std::size_t>(at - out.data()) - out.size());
         text.remove_prefix(plain);
-        at = writeEscaped(out.room(text.size() + 8), text.front());
-        text.remove_prefix(1);
+        const std::string_view run = text.substr(0, kRun);
+        text.remove_prefix(run.size());
+        at = out.room(kLongestEscaped * run.size() + sizeof(Escaped) + text.size() + 1);
+        for (const char character : run) {
+            at = writeEscaped(at, character);
+        }
         plain = copyPlain(at, text);
         at += plain;
     }

@@ -89,7 +89,8 @@ RetainedMessages::RetainedMessages(Context& context) noexcept
       nextRound_(limit_) {}
 
 void RetainedMessages::freed(std::size_t bytes) {
-    if ((freedBytes_ += bytes) >= kMuchMemory) {
+    freedBytes_ += bytes;
+    if (freedBytes_ >= kMuchMemory) {
         freedBytes_ = 0;
         context_.shared<BlockingWork>(context_.platform()).giveBackMemorySoon();
     }
