@@ -113,6 +113,7 @@ void RetainedMessages::makeRoom(Account& account) {
         return;
     }
     std::vector<Account*> accounts;
+    accounts.reserve(accounts_.size());
     for (auto& [user, other] : accounts_) {
         accounts.push_back(&other);
     }
