@@ -320,9 +320,8 @@ void ZRReportingClientServerInstance::performSend(Dictionary message, std::uint3
             std::move(reply));
         recipients_.clear();
     } else {
-        sendSome(
-            std::shared_ptr<Sending>(new Sending{std::move(message), category, type, reporterIDs.empty(),
-                                                 std::exchange(recipients_, {}), further, std::move(reply)}));
+        sendSome(std::make_shared<Sending>(std::move(message), category, type, reporterIDs.empty(),
+                                           std::exchange(recipients_, {}), further, std::move(reply)));
     }
 }
 
