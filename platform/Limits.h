@@ -34,8 +34,8 @@ struct Limits {
     std::size_t sessionsOfConnection = 12'288;
     std::size_t sessionsOfUser = 16'384;
     std::size_t connectionsOfUser = 6'144;
-    std::size_t retainedBytesOfUser = 80U << 20U;
-    std::size_t retainedBytes = 128U << 20U; ///< of all users
+    std::size_t retainedBytesOfUser = 64U << 20U;
+    std::size_t retainedBytes = 112U << 20U; ///< of all users
 
     // Of what waits.
     std::size_t waitingRequests = 1'024;           ///< of a connection

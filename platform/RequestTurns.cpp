@@ -23,6 +23,8 @@ constexpr std::chrono::milliseconds kSlice{1};
 /// Turns make one piece of the server queue until they have taken this long together: replies wait for no
 /// longer than that, and whoever lends its thread to the queue has it back.
 constexpr std::chrono::milliseconds kPieceOfTurns{4};
+/// A queue keeps room for so many pieces while it has none.
+constexpr std::size_t kKeptItems = 64;
 
 } // namespace
 
@@ -111,6 +113,14 @@ public:
             batch.swap(pending);
         }
     }
+    /// Once nothing is left to run: thousands of clients that have all had much to run keep no room for it.
+    void giveRoomBack() noexcept {
+        if (next == batch.size() && pending.empty() && batch.capacity() + pending.capacity() > kKeptItems) {
+            std::vector<Item>().swap(batch);
+            std::vector<Item>().swap(pending);
+            next = 0;
+        }
+    }
     /// The next piece of the turn, or null.
     [[nodiscard]] Item* front() noexcept {
         if (rest.work) {
@@ -192,6 +202,7 @@ void RequestTurns::State::end(const QueueRef& queue, bool isStillItsTurn) {
     const MutexLock lock(mutex);
     queue->isListed = queue->mayRun();
     if (!queue->isListed) {
+        queue->giveRoomBack();
         return;
     }
     std::deque<QueueRef>& ofUser = waiting[queue->client.user];

@@ -206,7 +206,7 @@ private:
     /// Until what the attack has left to do is done, so that it counts as nobody else's.
     void awaitRest() const {
         constexpr std::chrono::milliseconds kLook{100};
-        constexpr std::chrono::seconds kMost{15};
+        constexpr std::chrono::seconds kMost{30};
         for (const auto over = Clock::now() + kMost; Clock::now() < over;) {
             const Meter meter(service_.pid());
             calmly(kLook);
