@@ -21,7 +21,7 @@ inline constexpr std::string_view kProtocolErrorDomain = "com.vandra.tamblo.prot
 inline constexpr std::int64_t kLimitReached = -32000;
 
 /// How a request beyond a limit is refused; the message names the limit as its preference is named. Those
-/// that no preference changes have names of the same kind: `waiting_messages`, `descriptors`, `memory`.
+/// that no preference changes have names of the same kind: `descriptors`, `memory`.
 [[nodiscard]] ReplyError limitReached(std::string_view name, std::size_t limit);
 
 } // namespace tamblo

@@ -21,10 +21,9 @@ struct Limits {
     std::size_t reportersOfMessage = 128;
     std::size_t entriesOfDictionary = 1'024; ///< of a payload or configuration, inner maps included
     std::size_t keyBytes = 1'024;
-    std::size_t bytesOfKeys = 64U << 10U;        ///< of all of a frame
-    std::size_t decodedBytesOfFrame = 4U << 20U; ///< as values in memory
-    std::size_t deliveredBytesOfMessage = 16U
-                                          << 20U; ///< as values in memory, for each reporter that it names
+    std::size_t bytesOfKeys = 64U << 10U;             ///< of all of a frame
+    std::size_t decodedBytesOfFrame = 4U << 20U;      ///< as values in memory
+    std::size_t deliveredBytesOfMessage = 16U << 20U; ///< its values, once for each reporter
     std::size_t applicationNameBytes = 512;
 
     // Of one session, connection or user.

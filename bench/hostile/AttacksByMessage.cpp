@@ -82,23 +82,21 @@ void unknownIdentifiers(const Assault& assault) {
     } while (client.settle());
 }
 
-void largeMessages(const Assault& assault) {
+void floodWith(const Assault& assault, const std::string& text) {
     HostileClient client(assault);
     addSession(client, kReporterID);
-    const std::string text(kLarge, 'x');
     flood(client, [&](std::uint64_t number) {
         return messageFor(kReporterID, {{"count", number}, {"text", text}});
     });
 }
 
+void largeMessages(const Assault& assault) {
+    floodWith(assault, std::string(kLarge, 'x'));
+}
+
 /// Six bytes each in a line of a sink.
 void largeEscapedMessages(const Assault& assault) {
-    HostileClient client(assault);
-    addSession(client, kReporterID);
-    const std::string text(kLarge, '\x01');
-    flood(client, [&](std::uint64_t number) {
-        return messageFor(kReporterID, {{"count", number}, {"text", text}});
-    });
+    floodWith(assault, std::string(kLarge, '\x01'));
 }
 
 /// Each a byte on the wire, and a value in memory.
