@@ -309,10 +309,10 @@ public:
         receiveAll();
         return isReadable(0); // the end
     }
-    /// The same without reading what was sent before the end.
+    /// Whether that is so by now, without reading what was sent before the end.
     [[nodiscard]] bool isHungUp() const {
         pollfd entry{.fd = socket_, .events = POLLRDHUP, .revents = 0};
-        return ::poll(&entry, 1, 60'000) == 1 && (entry.revents & (POLLHUP | POLLRDHUP)) != 0;
+        return ::poll(&entry, 1, 0) == 1 && (entry.revents & (POLLHUP | POLLRDHUP)) != 0;
     }
 
 private:
