@@ -26,6 +26,7 @@ function(tamblo_tests name)
     # A test runs once for each time that it is built: to optimise it takes longer than it saves.
     target_compile_options(${name} PRIVATE -O0 -U_FORTIFY_SOURCE)
     target_compile_definitions(${name} PRIVATE "EXAMPLES_DIR=\"${CMAKE_SOURCE_DIR}/examples\"")
+    set_target_properties(${name} PROPERTIES UNITY_BUILD ${TAMBLO_UNITY} UNITY_BUILD_BATCH_SIZE 6)
     add_dependencies(tamblo_all_tests ${name})
     gtest_discover_tests(${name} DISCOVERY_MODE PRE_TEST PROPERTIES LABELS ${arg_LABEL} TIMEOUT 120)
 endfunction()
