@@ -42,6 +42,13 @@ public:
         bytes_.reset();
         size_ = capacity_ = 0;
     }
+    /// The same when there is more than that of it; else keeps it for what comes.
+    void clearAndKeep(std::size_t capacity) noexcept {
+        clear();
+        if (capacity_ > capacity) {
+            reset();
+        }
+    }
     /// Drops bytes from the end, or from the front.
     void truncate(std::size_t size) noexcept { size_ = size; }
     void dropFront(std::size_t count) noexcept {

@@ -132,6 +132,11 @@ public:
     void stopReading() TAMBLO_EXCLUDES(mutex_);
 
 private:
+    /// Buffers above this are given back once they are empty.
+    static constexpr std::size_t kKeptCapacity = 64 * 1024;
+    /// A peer that takes nothing for so long does not read.
+    static constexpr std::chrono::seconds kPatienceWithPeer{1};
+
     /// How the connection comes to its end; anything but an orderly one is an interruption first.
     enum class Ending : std::uint8_t { none, orderly, interrupted };
 
@@ -158,20 +163,22 @@ private:
     void beginEnd(Ending ending) TAMBLO_EXCLUDES(mutex_);
     void end() TAMBLO_EXCLUDES(mutex_);
     [[nodiscard]] bool beginWaitForPeer() TAMBLO_EXCLUDES(mutex_);
+    void watch() TAMBLO_REQUIRES(mutex_);
+
+    // Replies, and peers that do not read them: `ConnectionReplies.cpp`.
     void replied() TAMBLO_REQUIRES(mutex_);
     void send() TAMBLO_REQUIRES(mutex_);
     [[nodiscard]] std::size_t unsent() const TAMBLO_REQUIRES(mutex_) { return outgoing_.size() - sent_; }
     void countUnsent() TAMBLO_REQUIRES(mutex_);
     void holdRequests() TAMBLO_REQUIRES(mutex_);
     void letRequestsGo() TAMBLO_REQUIRES(mutex_);
-    [[nodiscard]] std::int64_t readByPeer() const TAMBLO_REQUIRES(mutex_);
+    void awaitPeerReads() TAMBLO_EXCLUDES(mutex_);
     void lookWhetherPeerReads(std::int64_t readBefore) TAMBLO_EXCLUDES(mutex_);
+    [[nodiscard]] std::int64_t readByPeer() const TAMBLO_REQUIRES(mutex_);
     void noteSilent() TAMBLO_REQUIRES(mutex_);
     void endSilentOfUser() TAMBLO_REQUIRES(mutex_);
     void endIfSilent() TAMBLO_EXCLUDES(mutex_);
-    void awaitPeerReads() TAMBLO_EXCLUDES(mutex_);
     void giveUp() TAMBLO_REQUIRES(mutex_);
-    void watch() TAMBLO_REQUIRES(mutex_);
 
     Shared& shared_;
     const ClientIdentity peer_;
