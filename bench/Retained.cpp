@@ -2,6 +2,8 @@
 #include "Bench.h"
 #include "Meter.h"
 
+#include <cstddef>
+#include <cstdint>
 #include <vector>
 
 namespace tamblo::bench {
@@ -19,6 +21,7 @@ constexpr std::size_t kBatch = 5'000;
 void retained(Bench& bench) {
     ServiceProcess::Settings settings = bench.place(Placement::oneCore);
     settings.eventsInUse = "[]";
+    settings.retainedBytes = 2U << 30U;
     const ServiceProcess service(settings);
     FrameChannel channel(service.socketPath());
     channel.createSession(kReporterID);

@@ -90,6 +90,11 @@ ServiceProcess::ServiceProcess(const Settings& settings) {
         directory_.write("configuration/preferences/com.vandra.tamblo.analytics.json",
                          "{\"events_in_use\": " + *settings.eventsInUse + "}\n");
     }
+    if (settings.retainedBytes) {
+        const std::string bytes = std::to_string(*settings.retainedBytes);
+        directory_.write("configuration/preferences/com.vandra.tamblo.limits.json",
+                         "{\"retained_bytes_of_user\": " + bytes + ", \"retained_bytes\": " + bytes + "}\n");
+    }
     if (settings.isInternalBuild) {
         makeInternalBuild(directory_);
     }

@@ -23,6 +23,8 @@ public:
         int processor = 0;
         /// The names of the analytics events in use, as a JSON array; all of them without it.
         std::optional<std::string> eventsInUse = std::nullopt;
+        /// What all sessions may retain, where the default is not enough for what is measured.
+        std::optional<std::size_t> retainedBytes = std::nullopt;
         /// With everything on that an internal build can have, and some two hundred driver channels.
         bool isInternalBuild = false;
         /// Whether other users may connect.
