@@ -153,7 +153,10 @@ private:
     bool readDate(const Head& head, Value& value);
     bool readArray(const Head& head, Value& value, int depth);
     bool readMap(const Head& head, Dictionary& dictionary, int depth, std::size_t spare);
-    bool readEntries(const Head& head, int depth);
+    bool readEntries(const Head& head, int depth, std::uint64_t first);
+    bool takeExpected(const KeySetCache::Shape& shape, std::span<Value> values, int depth,
+                      std::uint64_t& taken);
+    bool countEntry(std::size_t keyBytes) noexcept;
     bool makeDictionary(Dictionary& dictionary, std::size_t firstEntry, std::size_t spare);
     bool atBreak() noexcept;
     [[nodiscard]] MapEntries& entries() noexcept;

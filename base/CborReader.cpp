@@ -5,6 +5,7 @@
 #include <array>
 #include <bit>
 #include <cmath>
+#include <cstring>
 #include <limits>
 
 namespace tamblo {
@@ -13,6 +14,7 @@ namespace {
 
 constexpr std::uint8_t kBreak = 0xFF;
 constexpr unsigned kShortText = 0x60; ///< to 0x77: a text whose length is in its first byte
+constexpr unsigned kLongText = 24;    ///< bytes of a text whose length is not
 constexpr std::uint64_t kDateTag = 1;
 
 // What values take in memory, about: a value in a list, and the blocks of those that have one.
@@ -377,11 +379,33 @@ bool CborReader::readMap(const Head& head, Dictionary& dictionary, int depth, st
     if (depth > kMaximumDepth) {
         return fail(CborError::tooDeep);
     }
+    if (!charge(kBlockBytes)) {
+        return false;
+    }
+    // Most maps have the keys that the last one of their size had, and are then read into their place.
+    std::uint64_t taken = 0;
+    KeySetCache::ShapeRef shape;
+    if (keySets_ != nullptr && head.info != kIndefinite) {
+        shape = keySets_->expected(head.argument);
+    }
     MapEntries& entries = this->entries();
     const std::size_t first = entries.keys.size();
     const std::size_t assembled = entries.assembledKeys.size();
-    const bool isRead =
-        charge(kBlockBytes) && readEntries(head, depth) && makeDictionary(dictionary, first, spare);
+    if (shape != nullptr && shape->places.size() == head.argument) {
+        Dictionary::Unfilled map = Dictionary::fromKeySet(shape->keys, spare);
+        if (!takeExpected(*shape, map.values, depth, taken)) {
+            return false;
+        }
+        if (taken == head.argument) {
+            dictionary = std::move(map.dictionary);
+            return true;
+        }
+        for (std::uint64_t i = 0; i < taken; ++i) {
+            entries.keys.push_back(shape->keys->key(shape->places[i]));
+            entries.values.push_back(std::move(map.values[shape->places[i]]));
+        }
+    }
+    const bool isRead = readEntries(head, depth, taken) && makeDictionary(dictionary, first, spare);
     entries.keys.resize(first);
     entries.values.resize(first);
     entries.assembledKeys.resize(assembled);
@@ -408,27 +432,53 @@ bool CborReader::makeDictionary(Dictionary& dictionary, std::size_t firstEntry, 
     return false;
 }
 
-bool CborReader::readEntries(const Head& head, int depth) {
+bool CborReader::takeExpected(const KeySetCache::Shape& shape, std::span<Value> values, int depth,
+                              std::uint64_t& taken) {
+    std::size_t begin = 0;
+    for (taken = 0; taken < shape.places.size(); ++taken) {
+        const std::size_t length = shape.ends[taken] - begin;
+        if (static_cast<std::size_t>(end_ - position_) < length ||
+            std::memcmp(position_, shape.encoded.data() + begin, length) != 0) {
+            return true;
+        }
+        begin += length;
+        position_ += length;
+        const std::uint32_t place = shape.places[taken];
+        const std::size_t keyBytes = shape.keys->key(place).size();
+        Value& value = values[place];
+        const bool isKeyCharged = keyBytes < kLongText || charge(keyBytes);
+        if (!isKeyCharged || !(takeDouble(value) || readItem(value, depth)) || !countEntry(keyBytes)) {
+            return false;
+        }
+    }
+    return true;
+}
+
+bool CborReader::countEntry(std::size_t keyBytes) noexcept {
+    keyBytesRead_ += keyBytes;
+    if (++entriesRead_ > limits_.entries) {
+        return fail(CborError::tooManyEntries);
+    }
+    if (keyBytes > limits_.keyBytes) {
+        return fail(CborError::keyTooLong);
+    }
+    if (keyBytesRead_ > limits_.bytesOfKeys) {
+        return fail(CborError::keysTooLong);
+    }
+    return charge(kEntryBytes);
+}
+
+bool CborReader::readEntries(const Head& head, int depth, std::uint64_t first) {
     MapEntries& entries = this->entries();
     const bool isIndefinite = head.info == kIndefinite;
-    for (std::uint64_t i = 0; isIndefinite ? !atBreak() : i < head.argument; ++i) {
+    for (std::uint64_t i = first; isIndefinite ? !atBreak() : i < head.argument; ++i) {
         std::string_view key;
         Value value;
         // The two commonest items of a message are taken without looking at all that an item may be.
         if (!(takeShortText(key) || readKey(key)) || !(takeDouble(value) || readItem(value, depth))) {
             return false;
         }
-        if (++entriesRead_ > limits_.entries) {
-            return fail(CborError::tooManyEntries);
-        }
-        if (key.size() > limits_.keyBytes) {
-            return fail(CborError::keyTooLong);
-        }
-        keyBytesRead_ += key.size();
-        if (keyBytesRead_ > limits_.bytesOfKeys) {
-            return fail(CborError::keysTooLong);
-        }
-        if (!charge(kEntryBytes)) {
+        if (!countEntry(key.size())) {
             return false;
         }
         entries.keys.push_back(key);
@@ -442,7 +492,7 @@ bool CborReader::takeShortText(std::string_view& text) noexcept {
         return false;
     }
     const unsigned length = *position_ - kShortText;
-    if (length >= 24 || static_cast<std::size_t>(end_ - position_) <= length) {
+    if (length >= kLongText || static_cast<std::size_t>(end_ - position_) <= length) {
         return false;
     }
     text = {reinterpret_cast<const char*>(position_ + 1), length};

@@ -248,6 +248,16 @@ Dictionary Dictionary::fromKeySet(KeySetRef keys, std::span<Value> values,
     return dictionary;
 }
 
+Dictionary::Unfilled Dictionary::fromKeySet(KeySetRef keys, std::size_t spare) {
+    const std::size_t count = keys->size();
+    Unfilled unfilled;
+    Block* const block = Block::make(count + spare, std::move(keys));
+    unfilled.dictionary.block_ = block;
+    unfilled.values = {block->values(), count};
+    std::uninitialized_default_construct_n(block->values(), count);
+    return unfilled;
+}
+
 Dictionary Dictionary::fromSorted(std::span<const std::string_view> keys, std::span<Value> values,
                                   std::size_t spare) {
     Dictionary dictionary;

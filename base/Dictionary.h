@@ -55,6 +55,9 @@ public:
     /// belongs to, each index once. `spare` is room for keys to come. The values are moved from.
     static Dictionary fromKeySet(KeySetRef keys, std::span<Value> values,
                                  std::span<const std::uint32_t> places, std::size_t spare = 0);
+    /// The same with values that are yet to be filled in, in the order of the keys; false until then.
+    struct Unfilled;
+    static Unfilled fromKeySet(KeySetRef keys, std::size_t spare);
     /// The same of keys in ascending order, each once, whose values stand in that order.
     static Dictionary fromSorted(std::span<const std::string_view> keys, std::span<Value> values,
                                  std::size_t spare = 0);
@@ -99,6 +102,12 @@ private:
     static void release(Block* block) noexcept;
 
     Block* block_ = nullptr;
+};
+
+/// Values may be filled in until the dictionary is copied.
+struct Dictionary::Unfilled {
+    Dictionary dictionary;
+    std::span<Value> values;
 };
 
 /// Bytes of memory that a dictionary takes, its keys and all that it refers to included, whether or not

@@ -66,6 +66,23 @@ KeySetCache::Fault sortKeys(std::span<const std::string_view> arrived, KeySetRef
     return KeySetCache::Fault::none;
 }
 
+/// A text's head in CBOR (RFC 8949), in its shortest form; what is remembered has no longer ones.
+void appendEncoded(std::string& encoded, std::string_view key) {
+    constexpr unsigned kText = 0x60;
+    const auto add = [&encoded](std::size_t byte) { encoded += static_cast<char>(byte); };
+    if (key.size() < 24) {
+        add(kText + key.size());
+    } else if (key.size() < 0x100) {
+        add(kText + 24);
+        add(key.size());
+    } else {
+        add(kText + 25);
+        add(key.size() >> 8U);
+        add(key.size() & 0xFFU);
+    }
+    encoded += key;
+}
+
 bool isWorthRemembering(std::span<const std::string_view> keys) noexcept {
     std::size_t bytes = 0;
     for (const std::string_view key : keys) {
@@ -77,7 +94,7 @@ bool isWorthRemembering(std::span<const std::string_view> keys) noexcept {
 } // namespace
 
 bool KeySetCache::Shape::matches(std::span<const std::string_view> arrived) const noexcept {
-    if (!keys || places.size() != arrived.size()) {
+    if (places.size() != arrived.size()) {
         return false;
     }
     for (std::size_t i = 0; i < arrived.size(); ++i) {
@@ -92,7 +109,8 @@ KeySetCache::Fault KeySetCache::makeDictionary(std::span<const std::string_view>
                                                std::span<Value> values, std::size_t spare,
                                                Dictionary& dictionary) {
     const std::uint64_t hash = hashKeys(keys);
-    const Shape* known = shapes_.find(hash, [keys](const Shape& shape) { return shape.matches(keys); });
+    const ShapeRef* known = shapes_.find(
+        hash, [keys](const ShapeRef& shape) { return shape != nullptr && shape->matches(keys); });
     if (known == nullptr) {
         if (!isWorthRemembering(keys)) {
             return makeDictionaryOnce(keys, values, spare, dictionary);
@@ -102,9 +120,14 @@ KeySetCache::Fault KeySetCache::makeDictionary(std::span<const std::string_view>
         if (fault != Fault::none) {
             return fault;
         }
-        known = &shapes_.put(hash, std::move(shape));
+        for (const std::string_view key : keys) {
+            appendEncoded(shape.encoded, key);
+            shape.ends.push_back(static_cast<std::uint32_t>(shape.encoded.size()));
+        }
+        known = &shapes_.put(hash, std::make_shared<const Shape>(std::move(shape)));
     }
-    dictionary = Dictionary::fromKeySet(known->keys, values, known->places, spare);
+    expected_[keys.size() % expected_.size()] = *known;
+    dictionary = Dictionary::fromKeySet((*known)->keys, values, (*known)->places, spare);
     return Fault::none;
 }
 

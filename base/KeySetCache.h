@@ -4,9 +4,11 @@
 #include "base/Dictionary.h"
 #include "base/Value.h"
 
+#include <array>
 #include <cstddef>
 #include <cstdint>
 #include <list>
+#include <memory>
 #include <optional>
 #include <span>
 #include <string>
@@ -34,6 +36,22 @@ public:
     KeySetCache(const KeySetCache&) = delete;
     KeySetCache& operator=(const KeySetCache&) = delete;
 
+    /// The keys of a map as they came, and where each stands among the sorted ones.
+    struct Shape {
+        KeySetRef keys;
+        std::vector<std::uint32_t> places;
+        std::string encoded;             ///< the keys as CBOR texts, one behind the other
+        std::vector<std::uint32_t> ends; ///< of each of these
+
+        [[nodiscard]] bool matches(std::span<const std::string_view> arrived) const noexcept;
+    };
+    using ShapeRef = std::shared_ptr<const Shape>;
+
+    /// What a map of so many entries most likely looks like: as the last one of about as many did. Or null.
+    [[nodiscard]] const ShapeRef& expected(std::uint64_t count) const noexcept {
+        return expected_[count % expected_.size()];
+    }
+
     /// A dictionary of one value for each key, in any order; the values are moved from. `spare` is room for
     /// keys to come.
     [[nodiscard]] Fault makeDictionary(std::span<const std::string_view> keys, std::span<Value> values,
@@ -53,15 +71,8 @@ public:
     [[nodiscard]] MapEntries& entries() noexcept { return entries_; }
 
 private:
-    /// The keys of a map as they came, and where each stands among the sorted ones.
-    struct Shape {
-        KeySetRef keys;
-        std::vector<std::uint32_t> places;
-
-        [[nodiscard]] bool matches(std::span<const std::string_view> arrived) const noexcept;
-    };
-
-    BoundedCache<Shape, 128> shapes_;
+    BoundedCache<ShapeRef, 128> shapes_;
+    std::array<ShapeRef, 32> expected_;
     BoundedCache<Value, 64> texts_;
     MapEntries entries_;
 };

@@ -22,7 +22,7 @@ using Time = std::chrono::steady_clock::time_point;
 constexpr std::chrono::milliseconds kSlice{1};
 /// Turns make one piece of the server queue until they have taken this long together: replies wait for no
 /// longer than that, and whoever lends its thread to the queue has it back.
-constexpr std::chrono::milliseconds kPieceOfTurns{4};
+constexpr std::chrono::milliseconds kPieceOfTurns{3};
 /// A queue keeps room for so many pieces while it has none.
 constexpr std::size_t kKeptItems = 64;
 

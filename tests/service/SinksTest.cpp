@@ -145,6 +145,9 @@ TEST_F(Sinks, CallQualityIsWrittenByAQueueOfItsOwn) {
     expect("", 12, {messageOf(14, 65535, {{"volume", 3}})}, Due::soon,
            {{"call-quality.jsonl",
              opened + line("message", R"(,"category":14,"type":65535,"payload":\{.*"volume":3\})") + "$"}});
+    // Held back, though not until the session ends.
+    expect("", 2, {messageOf(14, 65535, {{"volume", 3}})}, Due::soon,
+           {{"call-quality.jsonl", R"("BatchEvent":true.*)" + line("message", ".*\"volume\":3\\}") + "$"}});
 }
 
 TEST_F(Sinks, WithoutABackEndOfCallQualityThereIsNothingToSend) {

@@ -100,7 +100,7 @@ AppendOnlyFile::~AppendOnlyFile() {
 
 void AppendOnlyFile::flush() {
     // Stays set until the lines are written: who finds it unset has nothing to wait for.
-    if (isWaiting_.load(std::memory_order_acquire)) {
+    if (isWaiting()) {
         const MutexLock lock(mutex_);
         if (!waiting_.empty()) {
             writeOut();

@@ -146,6 +146,8 @@ public:
         const MutexLock lock(mutex_);
         countTooLong();
     }
+    /// Whether there is something for `flush` to do, or somebody is about it.
+    [[nodiscard]] bool isWaiting() const noexcept { return isWaiting_.load(std::memory_order_acquire); }
     [[nodiscard]] bool isOut() const noexcept { return isOut_.load(std::memory_order_relaxed); }
 
     /// Writes out what waits: afterwards it is in the kernel's hands, or lost and counted.

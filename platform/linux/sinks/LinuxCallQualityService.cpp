@@ -4,19 +4,29 @@
 #include "os/RandomNumber.h"
 #include "platform/linux/sinks/PayloadSize.h"
 
+#include <chrono>
+#include <cstddef>
 #include <utility>
 
 namespace tamblo {
 
+namespace {
+
+constexpr std::chrono::milliseconds kLongestHeldBack{250};
+constexpr std::size_t kMostHeldBack = 64U << 10U;
+
+} // namespace
+
 class LinuxCallQualityService::SpoolSession final : public Session {
 public:
-    explicit SpoolSession(std::string text) : name(std::move(text)) {}
+    SpoolSession(std::string text, bool batches) : name(std::move(text)), isBatched(batches) {}
     [[nodiscard]] std::string description() const override { return name; }
-    [[nodiscard]] static const std::string& nameOf(const SessionRef& session) noexcept {
-        return static_cast<const SpoolSession&>(*session).name;
+    [[nodiscard]] static const SpoolSession& of(const SessionRef& session) noexcept {
+        return static_cast<const SpoolSession&>(*session);
     }
 
     const std::string name;
+    const bool isBatched;
 };
 
 LinuxCallQualityService::LinuxCallQualityService(SinkFiles& sinks, const Clock& clock,
@@ -25,7 +35,8 @@ LinuxCallQualityService::LinuxCallQualityService(SinkFiles& sinks, const Clock& 
     : processName_(formatted("{}", hexadecimal(randomNumber(), 16))),
       clock_(clock),
       workQueues_(workQueues),
-      file_(sinks, "call-quality.jsonl", "zrri", AppendOnlyFile::Flushed::byOwner),
+      file_(sinks, "call-quality.jsonl", "zrri", AppendOnlyFile::Flushed::byOwner,
+            {.waiting = kMostHeldBack}),
       backends_({.domain = "com.vandra.tamblo.callquality",
                  .key = "backends",
                  .categoryCode = "zrri",
@@ -42,7 +53,9 @@ std::optional<std::string> LinuxCallQualityService::NewHierarchyToken(std::strin
 
 CallQualityService::SessionRef LinuxCallQualityService::CreateLinkmeterSession(const Dictionary& sessionInfo,
                                                                                const Dictionary& userInfo) {
-    auto session = std::make_shared<SpoolSession>(formatted("{}.{}", processName_, ++lastSession_));
+    const Value* const batches = sessionInfo.find(linkmeter::BatchEvent);
+    auto session = std::make_shared<SpoolSession>(formatted("{}.{}", processName_, ++lastSession_),
+                                                  batches != nullptr && batches->boolValue());
     file_.append([&](TextBuffer& line) {
         SinkLine(line, clock_.now())
             .text("op", "open")
@@ -50,6 +63,7 @@ CallQualityService::SessionRef LinuxCallQualityService::CreateLinkmeterSession(c
             .value("sessionInfo", sessionInfo)
             .value("userInfo", userInfo);
     });
+    isDue_ = true;
     return session;
 }
 
@@ -76,22 +90,39 @@ std::optional<std::string> LinuxCallQualityService::SendLinkmeterMessage(const S
     if (session != nullptr && payloadSize(payload) > file_.longestLine()) {
         file_.loseTooLong();
     } else if (session != nullptr) {
+        const SpoolSession& spooled = SpoolSession::of(session);
         file_.append([&](TextBuffer& line) {
             SinkLine(line, clock_.now())
                 .text("op", "message")
-                .text("session", SpoolSession::nameOf(session))
+                .text("session", spooled.name)
                 .number("category", category)
                 .number("type", type)
                 .value("payload", payload);
         });
+        if (!spooled.isBatched) {
+            isDue_ = true;
+        }
     }
     return std::nullopt;
 }
 
 void LinuxCallQualityService::FlushMessages(const SessionRef& session) {
     file_.append([&](TextBuffer& line) {
-        SinkLine(line, clock_.now()).text("op", "flush").text("session", SpoolSession::nameOf(session));
+        SinkLine(line, clock_.now()).text("op", "flush").text("session", SpoolSession::of(session).name);
     });
+    isDue_ = true;
+}
+
+void LinuxCallQualityService::endRun() {
+    if (isDue_.exchange(false)) {
+        file_.flush();
+    } else if (file_.isWaiting() && !isTimed_.exchange(true)) {
+        const MutexLock lock(mutex_);
+        writing_ = workQueues_.callAfter(kLongestHeldBack, [this] {
+            isTimed_ = false;
+            file_.flush();
+        });
+    }
 }
 
 } // namespace tamblo

@@ -21,6 +21,10 @@ namespace tamblo {
 ///     {"time":…,"op":"message","session":"9f86d081884c7d65.1","category":4,"type":1,"payload":{…}}
 ///     {"time":…,"op":"flush","session":"9f86d081884c7d65.1"}
 ///
+/// No reply waits for the file. The messages of a session whose events are batched are held back, so that
+/// those that come one by one share a write: for a quarter of a second, or until 64 KiB of lines wait, or a
+/// session is made or flushed.
+///
 /// A session's name is one for the file's whole life: 64 random bits of the process, and a count. Which back
 /// ends there are is a preference, domain `com.vandra.tamblo.callquality`, key `backends`; it is looked up on
 /// a queue of the service's own, as looking for real ones would take its time.
@@ -40,9 +44,9 @@ public:
                                                                   const Dictionary& payload) override;
     void FlushMessages(const SessionRef& session) override;
 
-    /// What was recorded goes to the file: at the end of each run of queues' work, since the sessions' queues
-    /// are many, and no reply waits for what they record.
-    void flush() { file_.flush(); }
+    /// At the end of each run of queues' work, since the sessions' queues are many: what may not be held back
+    /// goes to the file.
+    void endRun();
 
 private:
     class SpoolSession;
@@ -51,10 +55,13 @@ private:
     const Clock& clock_;
     WorkQueues& workQueues_;
     AppendOnlyFile file_;
+    std::atomic<bool> isDue_{false};   ///< what waits for the file
+    std::atomic<bool> isTimed_{false}; ///< there is a call that will write it
     std::atomic<std::uint64_t> lastToken_{0};
     std::atomic<std::uint64_t> lastSession_{0};
     Mutex mutex_;
     std::unique_ptr<SerialQueue> queue_ TAMBLO_GUARDED_BY(mutex_);
+    std::unique_ptr<DelayedCall> writing_ TAMBLO_GUARDED_BY(mutex_);
     NamesPreference backends_; ///< the queue's
 };
 
