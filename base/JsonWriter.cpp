@@ -312,10 +312,21 @@ private:
     std::size_t depth_ = 0;
 };
 
-/// Whether JSON has a form for every value of the kind.
-bool alwaysHasForm(Value::Kind kind) noexcept {
-    return kind == Value::Kind::boolean || kind == Value::Kind::integer ||
-           kind == Value::Kind::unsignedInteger || kind == Value::Kind::string;
+/// Whether JSON has a form for the value, as far as that is known without looking into it.
+bool hasForm(const Value& value) noexcept {
+    switch (value.kind()) {
+    case Value::Kind::boolean:
+    case Value::Kind::integer:
+    case Value::Kind::unsignedInteger:
+    case Value::Kind::string:
+        return true;
+    case Value::Kind::singleFloat:
+        return std::isfinite(value.rawSingle());
+    case Value::Kind::doubleFloat:
+        return std::isfinite(value.rawDouble());
+    default:
+        return false;
+    }
 }
 
 /// The kind of the first value in this one, which stands at `step`, that JSON has no form for, for people;
@@ -331,21 +342,19 @@ const char* kindWithoutForm(std::string_view step, const Value& value, std::stri
         break;
     case Value::Kind::singleFloat:
     case Value::Kind::doubleFloat:
-        kind = std::isfinite(value.doubleValue()) ? nullptr : "a number that is not finite";
+        kind = hasForm(value) ? nullptr : "a number that is not finite";
         break;
     case Value::Kind::array:
         for (std::size_t i = 0; kind == nullptr && i < value.arrayValue().size(); ++i) {
             const Value& element = value.arrayValue()[i];
-            kind = alwaysHasForm(element.kind()) ? nullptr
-                                                 : kindWithoutForm(std::to_string(i), element, pointer);
+            kind = hasForm(element) ? nullptr : kindWithoutForm(std::to_string(i), element, pointer);
         }
         break;
     case Value::Kind::dictionary: {
         const Dictionary& dictionary = value.dictionaryValue();
         for (std::size_t i = 0; kind == nullptr && i < dictionary.size(); ++i) {
             const Value& field = dictionary.valueAt(i);
-            kind =
-                alwaysHasForm(field.kind()) ? nullptr : kindWithoutForm(dictionary.keyAt(i), field, pointer);
+            kind = hasForm(field) ? nullptr : kindWithoutForm(dictionary.keyAt(i), field, pointer);
         }
         break;
     }
