@@ -240,7 +240,12 @@ void LinuxPlatform::run(SerialQueue& serverQueue,
     all.workQueues.setHelper([&all](std::chrono::milliseconds delay) {
         all.loop.post([&all, delay] { all.loop.callAfter(delay, [&all] { all.workQueues.help(); }); });
     });
-    all.workQueues.setRunEnd([&all] { all.callQuality.endRun(); });
+    all.workQueues.setRunEnd([&all] {
+        if (const auto delay = all.callQuality.endRun()) {
+            all.loop.post(
+                [&all, delay] { all.loop.callAfter(*delay, [&all] { all.callQuality.writeHeldBack(); }); });
+        }
+    });
     all.connections.setServerQueue(serverQueue, all.workQueues);
     all.signals.setEndWanted([&all, &shutDown] {
         notifyServiceManager("STOPPING=1");

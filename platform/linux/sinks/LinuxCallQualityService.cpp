@@ -4,7 +4,6 @@
 #include "os/RandomNumber.h"
 #include "platform/linux/sinks/PayloadSize.h"
 
-#include <chrono>
 #include <cstddef>
 #include <utility>
 
@@ -113,16 +112,18 @@ void LinuxCallQualityService::FlushMessages(const SessionRef& session) {
     isDue_ = true;
 }
 
-void LinuxCallQualityService::endRun() {
+std::optional<std::chrono::milliseconds> LinuxCallQualityService::endRun() {
     if (isDue_.exchange(false)) {
         file_.flush();
     } else if (file_.isWaiting() && !isTimed_.exchange(true)) {
-        const MutexLock lock(mutex_);
-        writing_ = workQueues_.callAfter(kLongestHeldBack, [this] {
-            isTimed_ = false;
-            file_.flush();
-        });
+        return kLongestHeldBack;
     }
+    return std::nullopt;
+}
+
+void LinuxCallQualityService::writeHeldBack() {
+    isTimed_ = false;
+    file_.flush();
 }
 
 } // namespace tamblo

@@ -8,6 +8,7 @@
 #include "platform/linux/sinks/NamesPreference.h"
 
 #include <atomic>
+#include <chrono>
 #include <cstdint>
 #include <memory>
 #include <optional>
@@ -45,8 +46,9 @@ public:
     void FlushMessages(const SessionRef& session) override;
 
     /// At the end of each run of queues' work, since the sessions' queues are many: what may not be held back
-    /// goes to the file.
-    void endRun();
+    /// goes to the file. The answer is how long the rest may wait until `writeHeldBack`, once for all of it.
+    [[nodiscard]] std::optional<std::chrono::milliseconds> endRun();
+    void writeHeldBack();
 
 private:
     class SpoolSession;
@@ -56,12 +58,11 @@ private:
     WorkQueues& workQueues_;
     AppendOnlyFile file_;
     std::atomic<bool> isDue_{false};   ///< what waits for the file
-    std::atomic<bool> isTimed_{false}; ///< there is a call that will write it
+    std::atomic<bool> isTimed_{false}; ///< there will be a `writeHeldBack`
     std::atomic<std::uint64_t> lastToken_{0};
     std::atomic<std::uint64_t> lastSession_{0};
     Mutex mutex_;
     std::unique_ptr<SerialQueue> queue_ TAMBLO_GUARDED_BY(mutex_);
-    std::unique_ptr<DelayedCall> writing_ TAMBLO_GUARDED_BY(mutex_);
     NamesPreference backends_; ///< the queue's
 };
 
