@@ -58,16 +58,16 @@ TEST(LogFilterTest, ReadsLevelsForAllAndForSingleCategories) {
     }
 }
 
-TEST(LogLimiterTest, CountsWhatEachUserMayNotHaveWritten) {
+TEST(LogLimiterTest, CountsWhatClientsMayNotHaveWritten) {
     LogLimiter limiter;
     LogLimiter::Time now{};
     const auto kindOf = [](std::string_view format, LogLevel level = LogLevel::standard) {
         return LogKind{level, "zrrs", format, std::source_location::current()};
     };
-    const auto admitted = [&](uid_t user, const LogKind& kind, unsigned lines) {
+    const auto admitted = [&](uid_t user, const LogKind& kind, unsigned lines, pid_t process = 7) {
         unsigned count = 0;
         for (unsigned line = 0; line < lines; ++line) {
-            count += limiter.admits({user, static_cast<pid_t>(line)}, kind, now) ? 1 : 0;
+            count += limiter.admits({user, process}, kind, now) ? 1 : 0;
         }
         return count;
     };
@@ -82,8 +82,9 @@ TEST(LogLimiterTest, CountsWhatEachUserMayNotHaveWritten) {
 
     EXPECT_EQ(admitted(1, kindOf("a"), 200'000), LogLimiter::kLinesOfKind);
     EXPECT_EQ(admitted(2, kindOf("a"), 5), 5U) << "another user has a share of its own";
-    unsigned all = LogLimiter::kLinesOfKind;
-    for (const char* format : {"b", "c", "d", "e"}) {
+    EXPECT_EQ(admitted(1, kindOf("a"), 11, 8), LogLimiter::kLinesOfKind) << "so has another client";
+    unsigned all = 2 * LogLimiter::kLinesOfKind;
+    for (const char* format : {"b", "c", "d"}) {
         all += admitted(1, kindOf(format), 11);
     }
     EXPECT_EQ(all, LogLimiter::kLinesOfUser);
@@ -92,7 +93,7 @@ TEST(LogLimiterTest, CountsWhatEachUserMayNotHaveWritten) {
 
     now += LogLimiter::kPeriod;
     EXPECT_EQ(admitted(1, kindOf("b"), 12), LogLimiter::kLinesOfKind);
-    EXPECT_EQ(told(), "a 199990 1 199999; b 3 1 11; c 1 1 10; d 1 1 10; e 11 1 10; ");
+    EXPECT_EQ(told(), "a 199991 1 8; b 3 1 7; c 1 1 7; d 11 1 7; ");
     EXPECT_FALSE(limiter.hasLeftOut());
 
     // Many users at a time, and again: whoever has no place shares one, and nothing goes uncounted.

@@ -2,13 +2,23 @@
 
 #include <algorithm>
 #include <span>
+#include <utility>
 
 namespace tamblo {
+
+namespace {
+
+bool isSame(const LogKind& kind, const LogKind& other) noexcept {
+    // Constants of the program are the same text when they are in the same place.
+    return kind.format.data() == other.format.data() && kind.place.line() == other.place.line();
+}
+
+} // namespace
 
 bool LogLimiter::admits(ClientIdentity client, const LogKind& kind, Time now) noexcept {
     const MutexLock lock(mutex_);
     User& user = userOf(client.user, now);
-    Tally& tally = tallyOf(user, kind);
+    Tally& tally = tallyOf(user, client.process, kind);
     const bool isError = kind.level >= LogLevel::error;
     unsigned& written = isError ? user.errors : user.lines;
     if (tally.written < kLinesOfKind && written < (isError ? kErrorsOfUser : kLinesOfUser)) {
@@ -28,10 +38,9 @@ std::optional<LogLimiter::LeftOut> LogLimiter::takeLeftOut(Time now) noexcept {
         if (!user.isDue && now - user.began < kPeriod) {
             continue;
         }
-        for (Tally& tally : std::span(user.tallies).first(user.kinds)) {
+        for (Tally& tally : std::span(user.tallies).first(user.tallied)) {
             if (tally.leftOut.lines != 0) {
-                const LeftOut taken = tally.leftOut;
-                tally.leftOut.lines = 0;
+                const LeftOut taken = takeAllLike(tally.leftOut.kind, user);
                 leftOut_.fetch_sub(taken.lines, std::memory_order_relaxed);
                 return taken;
             }
@@ -39,6 +48,18 @@ std::optional<LogLimiter::LeftOut> LogLimiter::takeLeftOut(Time now) noexcept {
         user.isDue = false;
     }
     return std::nullopt;
+}
+
+/// One line tells of all clients, as there may be many.
+LogLimiter::LeftOut LogLimiter::takeAllLike(const LogKind& kind, User& user) noexcept {
+    LeftOut all{.kind = kind, .last = {}, .lines = 0};
+    for (Tally& tally : std::span(user.tallies).first(user.tallied)) {
+        if (tally.leftOut.lines != 0 && isSame(tally.leftOut.kind, kind)) {
+            all.last = tally.leftOut.last;
+            all.lines += std::exchange(tally.leftOut.lines, 0);
+        }
+    }
+    return all;
 }
 
 LogLimiter::User& LogLimiter::userOf(uid_t user, Time now) noexcept {
@@ -62,35 +83,33 @@ LogLimiter::User& LogLimiter::userOf(uid_t user, Time now) noexcept {
     return *quiet;
 }
 
-/// Kinds of which something is yet to be told keep their place until it is.
+/// Those of which something is yet to be told keep their place until it is.
 void LogLimiter::beginPeriod(User& user, Time now) noexcept {
-    const auto known = std::span(user.tallies).first(user.kinds);
+    const auto known = std::span(user.tallies).first(user.tallied);
     const auto rest =
         std::ranges::remove_if(known, [](const Tally& tally) { return tally.leftOut.lines == 0; });
-    user.kinds -= rest.size();
-    for (Tally& tally : std::span(user.tallies).first(user.kinds)) {
+    user.tallied -= rest.size();
+    for (Tally& tally : std::span(user.tallies).first(user.tallied)) {
         tally.written = 0;
     }
     user.began = now;
     user.lines = user.errors = 0;
-    user.isDue = user.kinds != 0;
+    user.isDue = user.tallied != 0;
 }
 
-LogLimiter::Tally& LogLimiter::tallyOf(User& user, const LogKind& kind) noexcept {
-    const auto known = std::span(user.tallies).first(user.kinds);
-    const auto found = std::ranges::find_if(known, [&kind](const Tally& tally) {
-        const LogKind& other = tally.leftOut.kind;
-        // Constants of the program are the same text when they are in the same place.
-        return other.format.data() == kind.format.data() && other.place.line() == kind.place.line();
+LogLimiter::Tally& LogLimiter::tallyOf(User& user, pid_t process, const LogKind& kind) noexcept {
+    const auto known = std::span(user.tallies).first(user.tallied);
+    const auto found = std::ranges::find_if(known, [process, &kind](const Tally& tally) {
+        return tally.process == process && isSame(tally.leftOut.kind, kind);
     });
     if (found != known.end()) {
         return *found;
     }
-    if (user.kinds == kKinds) {
+    if (user.tallied == kTallies) {
         return user.tallies.back();
     }
-    Tally& tally = user.tallies[user.kinds++];
-    tally = {.leftOut = {.kind = kind, .last = {}, .lines = 0}, .written = 0};
+    Tally& tally = user.tallies[user.tallied++];
+    tally = {.leftOut = {.kind = kind, .last = {}, .lines = 0}, .process = process, .written = 0};
     return tally;
 }
 
