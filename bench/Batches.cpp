@@ -2,11 +2,7 @@
 
 namespace tamblo::bench {
 
-Batches::Batches(FrameChannel& channel) : channel_(channel) {
-    for (const Message& message : makeMessages(1024, Variety::distinct)) {
-        requests_.push_back(sendRequest(message, 0));
-    }
-}
+Batches::Batches(FrameChannel& channel) : channel_(channel), requests_(sendRequests(1024, 0)) {}
 
 void Batches::send(std::size_t count, std::int64_t reporterID) {
     while (count > 0) {

@@ -2,8 +2,6 @@
 
 #include "Processes.h"
 
-#include <cstdio>
-
 namespace tamblo::bench {
 
 namespace {
@@ -29,22 +27,28 @@ std::string_view describe(Placement placement) noexcept {
 ServiceProcess::Settings Bench::place(Placement placement) const {
     pinThisThread(clientProcessorOf(placement));
     return {.program = tamblod_,
-            .processor =
-                placement == Placement::twoCores ? serviceProcessor() : clientProcessorOf(placement)};
+            .processor = placement == Placement::twoCores ? serviceProcessor() : clientProcessorOf(placement),
+            .directory = storage_.directory};
+}
+
+ResultRow Bench::row(std::string_view name, Placement placement) const {
+    ResultRow row(name);
+    row.set("placement", describe(placement));
+    row.set("storage", describe(storage_.storage));
+    return row;
 }
 
 const SocketFloor& Bench::socketFloor(Placement placement) {
-    std::optional<SocketFloor>& floor = socketFloors_[static_cast<std::size_t>(placement)];
-    if (!floor) {
-        floor = measureSocketFloor(clientProcessorOf(placement), place(placement).processor, quick_);
+    if (const auto known = socketFloors_.find(placement); known != socketFloors_.end()) {
+        return known->second;
     }
-    return *floor;
+    return socketFloors_[placement] =
+               measureSocketFloor(clientProcessorOf(placement), place(placement).processor, quick_);
 }
 
-void Bench::print(const ResultRow& row) {
-    allMet_ = allMet_ && row.met();
-    std::puts(row.text().c_str());
-    std::fflush(stdout);
+std::unique_ptr<BareJob> Bench::bareJob(Placement placement) const {
+    return std::make_unique<BareJob>(clientProcessorOf(placement), place(placement).processor,
+                                     storage_.directory);
 }
 
 } // namespace tamblo::bench

@@ -4,8 +4,8 @@
 #include "ChildProcess.h"
 #include "Meter.h"
 #include "Payloads.h"
+#include "SocketPair.h"
 #include "base/TextBuffer.h"
-#include "os/FileDescriptor.h"
 
 #include <cerrno>
 #include <chrono>
@@ -21,19 +21,6 @@ namespace {
 
 constexpr std::size_t kFramesPerWrite = 64;
 constexpr std::size_t kBytesPerRead = 128 * 1024;
-
-struct SocketPair {
-    SocketPair() {
-        int both[2];
-        if (::socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0, both) != 0) {
-            throw std::system_error(errno, std::generic_category(), "socketpair");
-        }
-        ours = FileDescriptor(both[0]);
-        theirs = FileDescriptor(both[1]);
-    }
-    FileDescriptor ours;
-    FileDescriptor theirs;
-};
 
 void sendAll(int socket, const char* data, std::size_t size) {
     while (size > 0) {
@@ -61,9 +48,9 @@ bool receiveAll(int socket, char* data, std::size_t size) {
 
 TextBuffer framesOf(std::size_t count) {
     TextBuffer frames;
-    for (std::size_t i = 0; i < count; ++i) {
-        wire::Request request = sendRequest(makeMessage(i, Variety::distinct), 7);
-        request.id = i;
+    std::uint64_t id = 0;
+    for (wire::Request& request : sendRequests(count, 7)) {
+        request.id = id++;
         (void)wire::appendRequestFrame(frames, request);
     }
     return frames;
@@ -148,6 +135,16 @@ std::vector<double> Echo::roundTrips(std::size_t count) {
     return times;
 }
 
+double Echo::pacedCost(std::size_t count, std::chrono::nanoseconds interval) {
+    const Meter meter(pid());
+    auto next = std::chrono::steady_clock::now();
+    for (std::size_t i = 0; i < count; ++i) {
+        (void)roundTrips(1);
+        std::this_thread::sleep_until(next += interval);
+    }
+    return microseconds(meter.service()) / static_cast<double>(count);
+}
+
 void floorSocket(Bench& bench) {
     for (const Placement placement : {Placement::twoCores, Placement::oneCore}) {
         const SocketFloor& floor = bench.socketFloor(placement);
@@ -182,13 +179,7 @@ void floorPaced(Bench& bench) {
         Echo echo(clientProcessor(), echoProcessor);
         std::vector<double> cpu;
         for (std::size_t repetition = 0; repetition < bench.repetitions(5); ++repetition) {
-            const Meter meter(echo.pid());
-            auto next = std::chrono::steady_clock::now();
-            for (std::size_t i = 0; i < kFrames; ++i) {
-                (void)echo.roundTrips(1);
-                std::this_thread::sleep_until(next += std::chrono::milliseconds(1));
-            }
-            cpu.push_back(microseconds(meter.service()) / kFrames);
+            cpu.push_back(echo.pacedCost(kFrames, std::chrono::milliseconds(1)));
         }
         ResultRow row("floor_paced");
         row.set("service_cpu_us_per_message", median(cpu));

@@ -8,6 +8,7 @@
 #include <stdexcept>
 #include <system_error>
 
+#include <poll.h>
 #include <sys/socket.h>
 
 namespace tamblo::bench {
@@ -80,6 +81,11 @@ void FrameChannel::receive() {
         --outstanding_;
     }
     incoming_.dropFront(incoming_.size() - frames.rest().size());
+}
+
+bool FrameChannel::hasReply() const noexcept {
+    pollfd waiting{socket_.get(), POLLIN, 0};
+    return ::poll(&waiting, 1, 0) > 0;
 }
 
 void FrameChannel::finish() {

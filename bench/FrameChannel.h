@@ -11,7 +11,7 @@
 #include <cstdint>
 #include <optional>
 #include <string>
-#include <vector>
+#include <utility>
 
 namespace tamblo::bench {
 
@@ -21,6 +21,8 @@ namespace tamblo::bench {
 class FrameChannel {
 public:
     explicit FrameChannel(const std::string& socketPath);
+    /// Over a socket that is connected.
+    explicit FrameChannel(FileDescriptor socket) noexcept : socket_(std::move(socket)) {}
 
     /// From now on, what takes longer throws.
     void limitWaits(std::chrono::seconds longest) const;
@@ -31,6 +33,8 @@ public:
     void flush();
     /// Waits for at least one reply and takes all that have come.
     void receive();
+    /// Whether `receive` would not have to wait.
+    [[nodiscard]] bool hasReply() const noexcept;
     /// Sends what is queued and waits for all replies.
     void finish();
     /// Sends one request and waits for its reply, with nothing else outstanding.

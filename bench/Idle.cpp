@@ -15,13 +15,12 @@ void idle(Bench& bench) {
     const Meter meter(service.pid());
     std::this_thread::sleep_for(std::chrono::seconds(bench.quick() ? 3 : 10));
 
-    ResultRow row("idle");
+    ResultRow row = bench.row("idle", Placement::twoCores);
     row.set("wake_ups", voluntarySwitchesOf(service.pid()) - before);
     row.set("service_cpu_us", microseconds(meter.service()));
     row.set("seconds", secondsOf(meter.wall()));
     row.set("rss_mib", mebibytes(residentBytesOf(service.pid())));
     row.set("threads", std::uint64_t{threadCountOf(service.pid())});
-    row.set("placement", describe(Placement::twoCores));
     row.atMost("wake_ups", 0);
     row.atMost("rss_mib", 6);
     bench.print(row);
@@ -38,12 +37,11 @@ void startUp(Bench& bench) {
         ready.push_back(microseconds(service.timeUntilReady()) / 1000);
     }
 
-    ResultRow row("start_up");
+    ResultRow row = bench.row("start_up", Placement::twoCores);
     row.set("ready_ms", median(ready));
     row.set("first_answer_ms", median(answered));
     row.set("first_answer_ms_slowest", *std::max_element(answered.begin(), answered.end()));
     row.set("counted", "from before the fork to the first client's first reply");
-    row.set("placement", describe(Placement::twoCores));
     row.atMost("first_answer_ms", 10);
     bench.print(row);
 }

@@ -78,7 +78,7 @@ void manySessions(Bench& bench) {
         stop.push_back(many.stopMicroseconds);
     }
 
-    ResultRow row("many_sessions");
+    ResultRow row = bench.row("many_sessions", Placement::oneCore);
     row.set("sessions", static_cast<std::uint64_t>(kMany));
     row.set("threads", std::uint64_t{many.threads});
     row.set("kib_per_session", many.bytes / 1024);
@@ -90,7 +90,6 @@ void manySessions(Bench& bench) {
     row.set("start_ratio", median(startRatio));
     row.set("stop_ratio", median(stopRatio));
     row.set("ratios", "cost of a session among 10000 over that among 1000");
-    row.set("placement", describe(Placement::oneCore));
     row.atMost("threads", 19);
     row.atMost("kib_per_session", 16);
     row.atMost("create_ratio", 1.3);

@@ -121,4 +121,13 @@ wire::Request sendRequest(const Message& message, std::int64_t reporterID) {
     return request;
 }
 
+std::vector<wire::Request> sendRequests(std::size_t count, std::int64_t reporterID) {
+    std::vector<wire::Request> requests;
+    requests.reserve(count);
+    for (std::size_t i = 0; i < count; ++i) {
+        requests.push_back(sendRequest(makeMessage(i, Variety::distinct), reporterID));
+    }
+    return requests;
+}
+
 } // namespace tamblo::bench

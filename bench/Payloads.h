@@ -40,5 +40,7 @@ inline constexpr std::size_t kIssueEvery = 50;
 [[nodiscard]] Dictionary sessionConfiguration();
 
 [[nodiscard]] wire::Request sendRequest(const Message& message, std::int64_t reporterID);
+/// Those of distinct messages.
+[[nodiscard]] std::vector<wire::Request> sendRequests(std::size_t count, std::int64_t reporterID);
 
 } // namespace tamblo::bench

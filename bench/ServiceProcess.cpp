@@ -10,6 +10,7 @@
 #include <csignal>
 #include <cstdio>
 #include <cstdlib>
+#include <filesystem>
 #include <fstream>
 #include <sstream>
 #include <stdexcept>
@@ -49,23 +50,37 @@ FileDescriptor bindNotifySocket(const std::string& path) {
     return socket;
 }
 
-/// One driver's channels, twenty of them.
-std::string driverChannels(int driver) {
+/// One driver's channels, twenty of them; each has gained so much.
+std::string driverChannels(int driver, std::int64_t gain) {
     std::string channels = "[";
     for (int i = 0; i < 20; ++i) {
         const std::string name = "\"driver\": \"driver" + std::to_string(driver) +
                                  "\", \"group\": \"Haptics\", \"subgroup\": \"Stats\", \"name\": \"channel " +
                                  std::to_string(i) + "\", \"unit\": \"ms\", ";
-        constexpr const char* kFigures[] = {
-            R"("format": "simple", "value": 12345)",
-            R"("format": "state", "states": [{"name": "idle", "transitions": 12, "residency": 99000},)"
-            R"( {"name": "running", "transitions": 12, "residency": 1234}])",
-            R"("format": "histogram", "buckets": [{"lower": 0, "upper": 100, "hits": 5},)"
-            R"( {"lower": 100, "upper": 200, "hits": 17}], "min": 3, "max": 177)",
+        const auto gained = [gain](std::int64_t value) { return std::to_string(value + gain); };
+        const std::string figures[] = {
+            R"("format": "simple", "value": )" + gained(12345),
+            R"("format": "state", "states": [{"name": "idle", "transitions": 12, "residency": )" +
+                gained(99000) + R"(}, {"name": "running", "transitions": 12, "residency": )" + gained(1234) +
+                "}]",
+            R"("format": "histogram", "buckets": [{"lower": 0, "upper": 100, "hits": )" + gained(5) +
+                R"(}, {"lower": 100, "upper": 200, "hits": )" + gained(17) + R"(}], "min": 3, "max": 177)",
         };
-        channels += (i == 0 ? "{" : ",\n{") + name + kFigures[i % 3] + "}";
+        channels += (i == 0 ? "{" : ",\n{") + name + figures[i % 3] + "}";
     }
     return channels + "]\n";
+}
+
+/// Each driver's file under its name at once, as a driver replaces it.
+void publishDrivers(const TemporaryDirectory& directory, std::int64_t gain) {
+    constexpr int kDrivers = 10;
+    directory.makeDirectory("runtime/chanlog");
+    for (int driver = 0; driver < kDrivers; ++driver) {
+        const std::string name = "runtime/chanlog/driver" + std::to_string(driver);
+        directory.write(name + ".next", driverChannels(driver, gain));
+        std::filesystem::rename(directory.path() + "/" + name + ".next",
+                                directory.path() + "/" + name + ".json");
+    }
 }
 
 void makeInternalBuild(const TemporaryDirectory& directory) {
@@ -73,15 +88,11 @@ void makeInternalBuild(const TemporaryDirectory& directory) {
                     R"({"InternalBuild": true, "HapticLeakCapture": true})");
     directory.write("configuration/preferences/com.vandra.tamblo.zrreporting.json",
                     R"({"enable_stackburst": true, "TalvixInvalidXyBackOffSeconds": 3600})");
-    directory.makeDirectory("runtime/chanlog");
-    for (int driver = 0; driver < 10; ++driver) {
-        directory.write("runtime/chanlog/driver" + std::to_string(driver) + ".json", driverChannels(driver));
-    }
 }
 
 } // namespace
 
-ServiceProcess::ServiceProcess(const Settings& settings) {
+ServiceProcess::ServiceProcess(const Settings& settings) : directory_(settings.directory) {
     directory_.makeDirectory("runtime");
     directory_.makeDirectory("configuration/preferences");
     directory_.makeDirectory("logs");
@@ -90,6 +101,10 @@ ServiceProcess::ServiceProcess(const Settings& settings) {
         directory_.write("configuration/preferences/com.vandra.tamblo.analytics.json",
                          "{\"events_in_use\": " + *settings.eventsInUse + "}\n");
     }
+    if (settings.callQualityBackends) {
+        directory_.write("configuration/preferences/com.vandra.tamblo.callquality.json",
+                         "{\"backends\": " + *settings.callQualityBackends + "}\n");
+    }
     if (settings.retainedBytes) {
         const std::string bytes = std::to_string(*settings.retainedBytes);
         directory_.write("configuration/preferences/com.vandra.tamblo.limits.json",
@@ -97,6 +112,9 @@ ServiceProcess::ServiceProcess(const Settings& settings) {
     }
     if (settings.isInternalBuild) {
         makeInternalBuild(directory_);
+        if (settings.hasDrivers) {
+            publishDrivers(directory_, driversGain_);
+        }
     }
     if (settings.isForOtherUsers) {
         for (const std::string& path : {directory_.path(), directory_.path() + "/runtime"}) {
@@ -112,8 +130,11 @@ ServiceProcess::ServiceProcess(const Settings& settings) {
             ::chmod(socketPath_.c_str(), 0666);
         }
     } catch (...) {
-        ::kill(pid_, SIGKILL);
-        ::waitpid(pid_, nullptr, 0);
+        // None is left of a service that has ended at once.
+        if (pid_ > 0) {
+            ::kill(pid_, SIGKILL);
+            ::waitpid(pid_, nullptr, 0);
+        }
         throw;
     }
 }
@@ -189,6 +210,25 @@ void ServiceProcess::waitUntilReady(int notifySocket) {
     throw std::runtime_error("the service does not get ready: " + logTail());
 }
 
+void ServiceProcess::advanceDrivers() {
+    publishDrivers(directory_, driversGain_ += 3);
+}
+
+void ServiceProcess::awaitIdle() const {
+    constexpr std::chrono::milliseconds kStillness{100};
+    constexpr int kMost = 600;
+    std::chrono::nanoseconds before{-1};
+    for (int i = 0; i < kMost; ++i) {
+        const std::chrono::nanoseconds now = cpuTimeOf(pid_);
+        if (now == before) {
+            return;
+        }
+        before = now;
+        std::this_thread::sleep_for(kStillness);
+    }
+    throw std::runtime_error("the service does not come to rest");
+}
+
 bool ServiceProcess::isAlive() const noexcept {
     siginfo_t ended{};
     return pid_ > 0 && ::waitid(P_PID, static_cast<id_t>(pid_), &ended, WEXITED | WNOHANG | WNOWAIT) == 0 &&
@@ -211,6 +251,9 @@ bool ServiceProcess::awaitEnd(std::chrono::seconds limit, int& status) {
 }
 
 std::optional<std::chrono::nanoseconds> ServiceProcess::terminate(std::chrono::seconds limit) {
+    if (pid_ <= 0) {
+        return std::nullopt;
+    }
     const auto begin = std::chrono::steady_clock::now();
     ::kill(pid_, SIGTERM);
     int status = 0;
@@ -230,10 +273,12 @@ void ServiceProcess::stop() {
 }
 
 std::size_t ServiceProcess::countLines(std::string_view file, std::string_view text) const {
-    std::ifstream lines(logsDirectory() + "/" + std::string(file), std::ios::binary);
     std::size_t count = 0;
-    for (std::string line; std::getline(lines, line);) {
-        count += line.find(text) != std::string::npos ? 1 : 0;
+    for (const std::string_view age : {"", ".1", ".2", ".3", ".4"}) {
+        std::ifstream lines(logsDirectory() + "/" + std::string(file) + std::string(age), std::ios::binary);
+        for (std::string line; std::getline(lines, line);) {
+            count += line.find(text) != std::string::npos ? 1 : 0;
+        }
     }
     return count;
 }

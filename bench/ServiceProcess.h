@@ -4,6 +4,7 @@
 
 #include <chrono>
 #include <cstddef>
+#include <cstdint>
 #include <functional>
 #include <optional>
 #include <string>
@@ -21,12 +22,17 @@ public:
     struct Settings {
         std::string program;
         int processor = 0;
+        /// That the service's directories are made in; where scratch files usually are without one.
+        std::string directory = {};
         /// The names of the analytics events in use, as a JSON array; all of them without it.
         std::optional<std::string> eventsInUse = std::nullopt;
+        /// The call-quality back ends, as a JSON array; the usual one without it.
+        std::optional<std::string> callQualityBackends = std::nullopt;
         /// What all sessions may retain, where the default is not enough for what is measured.
         std::optional<std::size_t> retainedBytes = std::nullopt;
         /// With everything on that an internal build can have, and some two hundred driver channels.
         bool isInternalBuild = false;
+        bool hasDrivers = true; ///< of an internal build
         /// Whether other users may connect.
         bool isForOtherUsers = false;
         /// Called in the child before it becomes the service.
@@ -44,14 +50,19 @@ public:
     [[nodiscard]] std::string logPath() const { return directory_.path() + "/log"; }
     /// Where its sinks' files are.
     [[nodiscard]] std::string logsDirectory() const { return directory_.path() + "/logs"; }
-    /// How many lines of a sink's file hold the text, as far as the file at hand goes back.
+    /// How many lines of a sink's file hold the text, as far as the files that it keeps go back.
     [[nodiscard]] std::size_t countLines(std::string_view file, std::string_view text) const;
-    /// How many analytics events of this name it has written, as far as the file at hand goes back.
+    /// How many analytics events of this name it has written, as far as the files that are kept go back.
     [[nodiscard]] std::size_t countEvents(std::string_view name) const;
     /// From just before the fork until the service had said that it is ready.
     [[nodiscard]] std::chrono::nanoseconds timeUntilReady() const noexcept { return timeUntilReady_; }
     /// From just before the fork until now.
     [[nodiscard]] std::chrono::nanoseconds age() const noexcept;
+
+    /// Has the drivers of an internal build publish that each of their channels has gained something.
+    void advanceDrivers();
+    /// Until the service has worked off what its queues hold: an idle one uses no processor time at all.
+    void awaitIdle() const;
 
     [[nodiscard]] bool isAlive() const noexcept;
     /// SIGTERM; how long it took to end, or nothing when it was killed in the end.
@@ -68,6 +79,7 @@ private:
     TemporaryDirectory directory_;
     std::string socketPath_;
     pid_t pid_ = -1;
+    std::int64_t driversGain_ = 0;
     std::chrono::steady_clock::time_point startedAt_;
     std::chrono::nanoseconds timeUntilReady_{};
 };

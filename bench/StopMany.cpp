@@ -75,10 +75,7 @@ Figures measure(const ServiceProcess::Settings& settings) {
     other.createSession(kOther);
     other.startSession(kOther);
     other.finish();
-    std::vector<wire::Request> requests;
-    for (const Message& message : makeMessages(512, Variety::distinct)) {
-        requests.push_back(sendRequest(message, kOther));
-    }
+    std::vector<wire::Request> requests = sendRequests(512, kOther);
     std::optional<FrameChannel> leaving(service.socketPath());
     startSessions(*leaving);
 
@@ -118,7 +115,7 @@ void stopMany(Bench& bench) {
         summaries = std::min(summaries, figures.summaries);
     }
 
-    ResultRow row("stop_many");
+    ResultRow row = bench.row("stop_many", Placement::oneCore);
     row.set("sessions", static_cast<std::uint64_t>(kSessions));
     row.set("messages_per_session", kMessages);
     row.set("summaries", std::uint64_t{summaries});
@@ -128,7 +125,6 @@ void stopMany(Bench& bench) {
     row.set("max_ms", quantile(roundTrips, 1.0));
     row.set("stop_cpu_s", median(cpu));
     row.set("stop_wall_s", median(wall));
-    row.set("placement", describe(Placement::oneCore));
     row.atMost("p99_ms", 50);
     row.atLeast("summaries", kSessions);
     bench.print(row);

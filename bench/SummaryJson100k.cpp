@@ -96,7 +96,7 @@ void summaryJson100k(Bench& bench) {
         wall.push_back(figures.wallSeconds);
     }
 
-    ResultRow row("summary_json_100k");
+    ResultRow row = bench.row("summary_json_100k", Placement::oneCore);
     row.set("messages", std::uint64_t{kMessages});
     row.set("records", std::uint64_t{figures.records});
     row.set("file_mib", figures.fileMebibytes);
@@ -104,7 +104,6 @@ void summaryJson100k(Bench& bench) {
     row.set("stop_cpu_s_least", quantile(cpu, 0));
     row.set("stop_wall_s", median(wall));
     row.set("peak_growth_mib", figures.peakMebibytes);
-    row.set("placement", describe(Placement::oneCore));
     row.atMost("stop_cpu_s", 0.4);
     row.atLeast("records", kMessages);
     bench.print(row);

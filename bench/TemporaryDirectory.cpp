@@ -9,9 +9,17 @@
 
 namespace tamblo::bench {
 
-TemporaryDirectory::TemporaryDirectory() {
+namespace {
+
+std::string usualParent() {
     const char* parent = std::getenv("TMPDIR");
-    path_ = std::string(parent != nullptr ? parent : BENCH_DIRECTORY) + "/tamblo-bench.XXXXXX";
+    return parent != nullptr ? parent : BENCH_DIRECTORY;
+}
+
+} // namespace
+
+TemporaryDirectory::TemporaryDirectory(const std::string& parent)
+    : path_((parent.empty() ? usualParent() : parent) + "/tamblo-bench.XXXXXX") {
     if (mkdtemp(path_.data()) == nullptr) {
         throw std::system_error(errno, std::generic_category(), path_);
     }

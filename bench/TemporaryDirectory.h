@@ -4,11 +4,11 @@
 
 namespace tamblo::bench {
 
-/// A directory of its own below TMPDIR, or below the build tree without it: on a disk, as a service's files
-/// are. Removed with all that it holds when it is destroyed.
+/// A directory of its own below another: TMPDIR, or the build tree without it, where none is named. Removed
+/// with all that it holds when it is destroyed.
 class TemporaryDirectory {
 public:
-    TemporaryDirectory();
+    explicit TemporaryDirectory(const std::string& parent = {});
     ~TemporaryDirectory();
     TemporaryDirectory(const TemporaryDirectory&) = delete;
     TemporaryDirectory& operator=(const TemporaryDirectory&) = delete;

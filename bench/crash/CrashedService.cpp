@@ -111,6 +111,9 @@ void CrashedService::kill() {
 }
 
 bool CrashedService::stop() {
+    if (pid_ <= 0) {
+        return false;
+    }
     ::kill(pid_, SIGTERM);
     int status = 0;
     for (const auto end = std::chrono::steady_clock::now() + kPatience;

@@ -60,7 +60,7 @@ class NoEvents final : public AnalyticsEventService {
 public:
     [[nodiscard]] bool isEventInUse(std::string_view) override { return false; }
     [[nodiscard]] std::uint64_t inUseGeneration() const noexcept override { return 1; }
-    void sendEventLazy(std::string_view, const std::function<Dictionary()>&) override {}
+    void sendEventsLazy(std::span<const std::string_view>, const std::function<Dictionary()>&) override {}
 };
 
 /// A device whose channels come from files.
