@@ -89,9 +89,14 @@ public:
         end
     };
 
+    /// `decodedBefore` is what counts already of the same frame.
     explicit CborReader(std::span<const std::uint8_t> bytes, KeySetCache* keySets = nullptr,
-                        const CborLimits& limits = {}) noexcept
-        : position_(bytes.data()), end_(bytes.data() + bytes.size()), keySets_(keySets), limits_(limits) {}
+                        const CborLimits& limits = {}, std::size_t decodedBefore = 0) noexcept
+        : position_(bytes.data()),
+          end_(bytes.data() + bytes.size()),
+          keySets_(keySets),
+          limits_(limits),
+          decodedBytes_(decodedBefore) {}
     CborReader(const CborReader&) = delete;
     CborReader& operator=(const CborReader&) = delete;
 
@@ -140,7 +145,8 @@ private:
     bool readHead(Head& head) noexcept;
     bool readLongHead(Head& head) noexcept;
     [[nodiscard]] bool takeShortText(std::string_view& text) noexcept;
-    [[nodiscard]] bool takeDouble(Value& value) noexcept;
+    [[nodiscard]] bool takeOrdinary(Value& value);
+    [[nodiscard]] bool takeKnownText(const Value& known, Value& value);
     bool readItem(Value& value, int depth);
     bool readSimple(const Head& head, Value& value) noexcept;
     bool readString(const Head& head, Value& value);
@@ -154,10 +160,11 @@ private:
     bool readArray(const Head& head, Value& value, int depth);
     bool readMap(const Head& head, Dictionary& dictionary, int depth, std::size_t spare);
     bool readEntries(const Head& head, int depth, std::uint64_t first);
-    bool takeExpected(const KeySetCache::Shape& shape, std::span<Value> values, int depth,
+    bool takeExpected(KeySetCache::Expected& expected, std::span<Value> values, int depth,
                       std::uint64_t& taken);
+    [[nodiscard]] bool isNext(const std::uint8_t* bytes, std::size_t count) const noexcept;
     bool countEntry(std::size_t keyBytes) noexcept;
-    bool makeDictionary(Dictionary& dictionary, std::size_t firstEntry, std::size_t spare);
+    bool makeDictionary(Dictionary& dictionary, std::size_t firstEntry, std::size_t spare, int depth);
     bool atBreak() noexcept;
     [[nodiscard]] MapEntries& entries() noexcept;
     /// Counts what a value takes, before it is made.

@@ -14,7 +14,7 @@ namespace {
 
 constexpr std::uint8_t kBreak = 0xFF;
 constexpr unsigned kShortText = 0x60; ///< to 0x77: a text whose length is in its first byte
-constexpr unsigned kLongText = 24;    ///< bytes of a text whose length is not
+constexpr unsigned kLongText = KeySetCache::kLongText;
 constexpr std::uint64_t kDateTag = 1;
 
 // What values take in memory, about: a value in a list, and the blocks of those that have one.
@@ -28,6 +28,26 @@ std::uint64_t loadBigEndian(const std::uint8_t* from, unsigned count) noexcept {
         value = value << 8 | from[i];
     }
     return value;
+}
+
+std::uint64_t loadWord(const std::uint8_t* from) noexcept {
+    std::uint64_t word;
+    std::memcpy(&word, from, sizeof word);
+    return word;
+}
+
+std::uint64_t loadBigEndian64(const std::uint8_t* from) noexcept {
+    const std::uint64_t word = loadWord(from);
+    return std::endian::native == std::endian::little ? __builtin_bswap64(word) : word;
+}
+
+/// The bits of a word's first bytes, as they lie in memory; of all of them from eight on.
+std::uint64_t firstBytes(std::size_t count) noexcept {
+    if (count >= sizeof(std::uint64_t)) {
+        return ~std::uint64_t{0};
+    }
+    const std::uint64_t low = (std::uint64_t{1} << (8 * count)) - 1;
+    return std::endian::native == std::endian::little ? low : ~(~std::uint64_t{0} >> (8 * count));
 }
 
 /// An IEEE 754 half-precision number, exactly.
@@ -382,18 +402,19 @@ bool CborReader::readMap(const Head& head, Dictionary& dictionary, int depth, st
     if (!charge(kBlockBytes)) {
         return false;
     }
-    // Most maps have the keys that the last one of their size had, and are then read into their place.
+    // Most messages have the keys that the last one of their size had, and are then read into their place.
     std::uint64_t taken = 0;
-    KeySetCache::ShapeRef shape;
-    if (keySets_ != nullptr && head.info != kIndefinite) {
-        shape = keySets_->expected(head.argument);
+    KeySetCache::Expected* expected = nullptr;
+    if (keySets_ != nullptr && head.info != kIndefinite && depth == 1) {
+        expected = &keySets_->expected(head.argument);
     }
     MapEntries& entries = this->entries();
-    const std::size_t first = entries.keys.size();
-    const std::size_t assembled = entries.assembledKeys.size();
-    if (shape != nullptr && shape->places.size() == head.argument) {
-        Dictionary::Unfilled map = Dictionary::fromKeySet(shape->keys, spare);
-        if (!takeExpected(*shape, map.values, depth, taken)) {
+    const MapEntries::Own own(entries);
+    if (expected != nullptr && expected->shape != nullptr &&
+        expected->shape->places.size() == head.argument) {
+        const KeySetCache::Shape& shape = *expected->shape;
+        Dictionary::Unfilled map = Dictionary::fromKeySet(shape.keys, spare);
+        if (!takeExpected(*expected, map.values, depth, taken)) {
             return false;
         }
         if (taken == head.argument) {
@@ -401,26 +422,23 @@ bool CborReader::readMap(const Head& head, Dictionary& dictionary, int depth, st
             return true;
         }
         for (std::uint64_t i = 0; i < taken; ++i) {
-            entries.keys.push_back(shape->keys->key(shape->places[i]));
-            entries.values.push_back(std::move(map.values[shape->places[i]]));
+            entries.keys.push_back(shape.keys->key(shape.places[i]));
+            entries.values.push_back(std::move(map.values[shape.places[i]]));
         }
     }
-    const bool isRead = readEntries(head, depth, taken) && makeDictionary(dictionary, first, spare);
-    entries.keys.resize(first);
-    entries.values.resize(first);
-    entries.assembledKeys.resize(assembled);
-    return isRead;
+    return readEntries(head, depth, taken) && makeDictionary(dictionary, own.first, spare, depth);
 }
 
 MapEntries& CborReader::entries() noexcept {
     return keySets_ != nullptr ? keySets_->entries() : ownEntries_;
 }
 
-bool CborReader::makeDictionary(Dictionary& dictionary, std::size_t firstEntry, std::size_t spare) {
+bool CborReader::makeDictionary(Dictionary& dictionary, std::size_t firstEntry, std::size_t spare,
+                                int depth) {
     MapEntries& entries = this->entries();
     const auto keys = std::span<const std::string_view>(entries.keys).subspan(firstEntry);
     const auto values = std::span(entries.values).subspan(firstEntry);
-    switch (keySets_ != nullptr ? keySets_->makeDictionary(keys, values, spare, dictionary)
+    switch (keySets_ != nullptr ? keySets_->makeDictionary(keys, values, spare, depth != 1, dictionary)
                                 : KeySetCache::makeDictionaryOnce(keys, values, spare, dictionary)) {
     case KeySetCache::Fault::none:
         return true;
@@ -432,26 +450,54 @@ bool CborReader::makeDictionary(Dictionary& dictionary, std::size_t firstEntry, 
     return false;
 }
 
-bool CborReader::takeExpected(const KeySetCache::Shape& shape, std::span<Value> values, int depth,
+/// Takes entries for as long as they have the keys that are expected. False after an error.
+bool CborReader::takeExpected(KeySetCache::Expected& expected, std::span<Value> values, int depth,
                               std::uint64_t& taken) {
-    std::size_t begin = 0;
-    for (taken = 0; taken < shape.places.size(); ++taken) {
-        const std::size_t length = shape.ends[taken] - begin;
-        if (static_cast<std::size_t>(end_ - position_) < length ||
-            std::memcmp(position_, shape.encoded.data() + begin, length) != 0) {
+    const KeySetCache::Shape& shape = *expected.shape;
+    const std::uint64_t count = shape.places.size();
+    const auto* key = reinterpret_cast<const std::uint8_t*>(shape.encoded.data());
+    std::uint32_t begin = 0;
+    for (taken = 0; taken < count; ++taken) {
+        const std::uint32_t length = shape.ends[taken] - begin;
+        if (!isNext(key, length)) {
             return true;
         }
         begin += length;
+        key += length;
         position_ += length;
-        const std::uint32_t place = shape.places[taken];
-        const std::size_t keyBytes = shape.keys->key(place).size();
-        Value& value = values[place];
-        const bool isKeyCharged = keyBytes < kLongText || charge(keyBytes);
-        if (!isKeyCharged || !(takeDouble(value) || readItem(value, depth)) || !countEntry(keyBytes)) {
+        const std::size_t keyBytes = shape.keys->key(shape.places[taken]).size();
+        if (keyBytes >= kLongText && !charge(keyBytes)) {
+            return false;
+        }
+        Value& value = values[shape.places[taken]];
+        if (!takeOrdinary(value) && !takeKnownText(expected.texts[taken], value)) {
+            if (!readItem(value, depth)) {
+                return false;
+            }
+            if (KeySetCache::isRemembered(value.stringValue().size())) {
+                expected.texts[taken] = value;
+            }
+        }
+        if (!countEntry(keyBytes)) {
             return false;
         }
     }
     return true;
+}
+
+/// Whether these bytes come next. Some more may be read behind them.
+bool CborReader::isNext(const std::uint8_t* bytes, std::size_t count) const noexcept {
+    const auto left = static_cast<std::size_t>(end_ - position_);
+    if (left < count + sizeof(std::uint64_t)) {
+        return left >= count && std::memcmp(position_, bytes, count) == 0;
+    }
+    std::size_t at = 0;
+    for (; count - at > sizeof(std::uint64_t); at += sizeof(std::uint64_t)) {
+        if (loadWord(position_ + at) != loadWord(bytes + at)) {
+            return false;
+        }
+    }
+    return ((loadWord(position_ + at) ^ loadWord(bytes + at)) & firstBytes(count - at)) == 0;
 }
 
 bool CborReader::countEntry(std::size_t keyBytes) noexcept {
@@ -474,8 +520,8 @@ bool CborReader::readEntries(const Head& head, int depth, std::uint64_t first) {
     for (std::uint64_t i = first; isIndefinite ? !atBreak() : i < head.argument; ++i) {
         std::string_view key;
         Value value;
-        // The two commonest items of a message are taken without looking at all that an item may be.
-        if (!(takeShortText(key) || readKey(key)) || !(takeDouble(value) || readItem(value, depth))) {
+        // The commonest items of a message are taken without looking at all that an item may be.
+        if (!(takeShortText(key) || readKey(key)) || !(takeOrdinary(value) || readItem(value, depth))) {
             return false;
         }
         if (!countEntry(key.size())) {
@@ -500,13 +546,66 @@ bool CborReader::takeShortText(std::string_view& text) noexcept {
     return true;
 }
 
-bool CborReader::takeDouble(Value& value) noexcept {
-    constexpr std::uint8_t doubleHead = 0xFB;
-    if (end_ - position_ < 9 || *position_ != doubleHead) {
+/// Takes the next item where it is one of those that messages mostly consist of, numbers, booleans and texts
+/// that lie in their value, and there is enough behind it that none can reach beyond the end.
+bool CborReader::takeOrdinary(Value& value) {
+    constexpr std::uint8_t smallest = 0x18; // an integer whose number is not in its head
+    constexpr std::uint8_t falseItem = 0xF4;
+    constexpr std::uint8_t doubleItem = 0xFB;
+    if (end_ - position_ < 24) {
         return false;
     }
-    value = Value(std::bit_cast<double>(loadBigEndian(position_ + 1, 8)));
-    position_ += 9;
+    const std::uint8_t head = *position_;
+    if (head == doubleItem) {
+        value = Value(std::bit_cast<double>(loadBigEndian64(position_ + 1)));
+        position_ += 9;
+    } else if (head < smallest) {
+        value = Value(unsigned{head});
+        position_ += 1;
+    } else if (head < smallest + 4) {
+        const unsigned bytes = 1U << (head - smallest);
+        value = Value(loadBigEndian64(position_ + 1) >> (64 - 8 * bytes));
+        position_ += 1 + bytes;
+    } else if ((head & 0xFE) == falseItem) {
+        value = Value(head != falseItem);
+        position_ += 1;
+    } else {
+        const unsigned length = head - kShortText;
+        constexpr std::uint64_t highBits = 0x8080'8080'8080'8080;
+        constexpr unsigned kWord = sizeof(std::uint64_t);
+        if (length > Value::kInlineCapacity) {
+            return false;
+        }
+        const std::uint64_t first = loadWord(position_ + 1) & firstBytes(length);
+        const std::uint64_t second =
+            length > kWord ? loadWord(position_ + 1 + kWord) & firstBytes(length - kWord) : 0;
+        if (((first | second) & highBits) != 0 || decodedBytes_ + length > limits_.decodedBytes) {
+            return false;
+        }
+        decodedBytes_ += length;
+        value = Value(std::string_view(reinterpret_cast<const char*>(position_ + 1), length));
+        position_ += 1 + length;
+    }
+    return true;
+}
+
+/// Takes the next item where it is that text.
+bool CborReader::takeKnownText(const Value& known, Value& value) {
+    const std::string_view text = known.stringValue();
+    const auto left = static_cast<std::size_t>(end_ - position_);
+    const std::size_t head = text.size() < kLongText ? 1 : 2;
+    if (text.empty() || left < head + text.size()) {
+        return false;
+    }
+    const bool isLong = position_[0] == kShortText + kLongText && position_[1] == text.size();
+    if (!(head == 1 ? position_[0] == kShortText + text.size() : isLong) ||
+        std::memcmp(position_ + head, text.data(), text.size()) != 0 ||
+        decodedBytes_ + text.size() > limits_.decodedBytes) {
+        return false;
+    }
+    decodedBytes_ += text.size();
+    position_ += head + text.size();
+    value = known;
     return true;
 }
 

@@ -3,7 +3,6 @@
 #include "base/AllocatedBytes.h"
 
 #include <algorithm>
-#include <atomic>
 #include <cstring>
 #include <memory>
 #include <new>
@@ -11,28 +10,15 @@
 
 namespace tamblo {
 
-/// The values, in the order of the keys; they follow the block. Room beyond the keys' count is uninitialised.
-struct Dictionary::Block {
-    std::atomic<std::uint32_t> references{1};
-    std::uint32_t capacity;
-    KeySetRef keys;
+Dictionary::Block* Dictionary::Block::make(std::size_t capacity, KeySetRef keys) {
+    void* memory = ::operator new(sizeof(Block) + capacity * sizeof(Value));
+    return new (memory) Block(capacity, std::move(keys));
+}
 
-    Block(std::size_t room, KeySetRef keySet)
-        : capacity(static_cast<std::uint32_t>(room)), keys(std::move(keySet)) {}
-
-    [[nodiscard]] std::size_t count() const noexcept { return keys->size(); }
-    [[nodiscard]] Value* values() noexcept { return reinterpret_cast<Value*>(this + 1); }
-
-    static Block* make(std::size_t capacity, KeySetRef keys) {
-        void* memory = ::operator new(sizeof(Block) + capacity * sizeof(Value));
-        return new (memory) Block(capacity, std::move(keys));
-    }
-    /// Frees the block alone; its values are gone already.
-    static void free(Block* block) noexcept {
-        block->~Block();
-        ::operator delete(block);
-    }
-};
+void Dictionary::Block::free(Block* block) noexcept {
+    block->~Block();
+    ::operator delete(block);
+}
 
 namespace {
 
@@ -56,10 +42,6 @@ Dictionary::Dictionary(std::initializer_list<Entry> entries) {
     }
 }
 
-Dictionary::Dictionary(const Dictionary& other) noexcept : block_(other.block_) {
-    retain(block_);
-}
-
 Dictionary& Dictionary::operator=(const Dictionary& other) noexcept {
     // The other may lie in a value of this one and go with it.
     Block* const incoming = other.block_;
@@ -69,42 +51,9 @@ Dictionary& Dictionary::operator=(const Dictionary& other) noexcept {
     return *this;
 }
 
-Dictionary& Dictionary::operator=(Dictionary&& other) noexcept {
-    std::swap(block_, other.block_);
-    return *this;
-}
-
-Dictionary::~Dictionary() {
-    release(block_);
-}
-
-void Dictionary::retain(Block* block) noexcept {
-    if (block != nullptr) {
-        block->references.fetch_add(1, std::memory_order_relaxed);
-    }
-}
-
-void Dictionary::release(Block* block) noexcept {
-    if (block == nullptr || block->references.fetch_sub(1, std::memory_order_acq_rel) != 1) {
-        return;
-    }
+void Dictionary::destroy(Block* block) noexcept {
     std::destroy_n(block->values(), block->count());
     Block::free(block);
-}
-
-std::size_t Dictionary::size() const noexcept {
-    return block_ == nullptr ? 0 : block_->count();
-}
-
-const KeySet& Dictionary::keys() const noexcept {
-    return block_ == nullptr ? *KeySet::empty() : *block_->keys;
-}
-
-std::span<const Value> Dictionary::values() const noexcept {
-    if (block_ == nullptr) {
-        return {};
-    }
-    return {block_->values(), block_->count()};
 }
 
 const Value* Dictionary::find(std::string_view key) const noexcept {
@@ -154,6 +103,22 @@ void Dictionary::set(std::string_view key, Value value) {
     relocate(values + extension.index + 1, values + extension.index, count - extension.index);
     new (values + extension.index) Value(std::move(value));
     block_->keys = std::move(extension.keys);
+}
+
+void Dictionary::addKeys(const KeySetRef& keys, std::span<const Addition> added) {
+    detach(keys->size());
+    Value* const values = block_->values();
+    std::size_t from = block_->count();
+    std::size_t to = keys->size();
+    for (std::size_t i = added.size(); i != 0; --i) {
+        const Addition& addition = added[i - 1];
+        const std::size_t behind = to - addition.index - 1;
+        from -= behind;
+        relocate(values + addition.index + 1, values + from, behind);
+        new (values + addition.index) Value(addition.value);
+        to = addition.index;
+    }
+    block_->keys = keys;
 }
 
 bool Dictionary::remove(std::string_view key) {

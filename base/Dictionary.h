@@ -3,6 +3,7 @@
 #include "base/KeySet.h"
 #include "base/Value.h"
 
+#include <atomic>
 #include <cstdint>
 #include <initializer_list>
 #include <span>
@@ -24,21 +25,28 @@ public:
 
     Dictionary() noexcept = default;
     Dictionary(std::initializer_list<Entry> entries);
-    Dictionary(const Dictionary& other) noexcept;
+    Dictionary(const Dictionary& other) noexcept : block_(other.block_) { retain(block_); }
     Dictionary(Dictionary&& other) noexcept : block_(other.block_) { other.block_ = nullptr; }
     Dictionary& operator=(const Dictionary& other) noexcept;
-    Dictionary& operator=(Dictionary&& other) noexcept;
-    ~Dictionary();
+    Dictionary& operator=(Dictionary&& other) noexcept {
+        std::swap(block_, other.block_);
+        return *this;
+    }
+    ~Dictionary() { release(block_); }
 
-    [[nodiscard]] std::size_t size() const noexcept;
+    [[nodiscard]] std::size_t size() const noexcept { return block_ == nullptr ? 0 : block_->count(); }
     [[nodiscard]] bool empty() const noexcept { return size() == 0; }
 
     /// Entries in key order. A reference to a key or value holds until the dictionary is changed or
     /// destroyed.
     [[nodiscard]] std::string_view keyAt(std::size_t index) const noexcept { return keys().key(index); }
     [[nodiscard]] const Value& valueAt(std::size_t index) const noexcept { return values()[index]; }
-    [[nodiscard]] const KeySet& keys() const noexcept;
-    [[nodiscard]] std::span<const Value> values() const noexcept;
+    [[nodiscard]] const KeySet& keys() const noexcept {
+        return block_ == nullptr ? *KeySet::empty() : *block_->keys;
+    }
+    [[nodiscard]] std::span<const Value> values() const noexcept {
+        return block_ == nullptr ? std::span<const Value>() : std::span(block_->values(), block_->count());
+    }
 
     /// The value of the key, or null. Allocates nothing.
     [[nodiscard]] const Value* find(std::string_view key) const noexcept;
@@ -48,6 +56,13 @@ public:
     /// Replaces the value at an index; the keys stay.
     void setValueAt(std::size_t index, Value value);
     bool remove(std::string_view key);
+    /// A key that is added, by its index among the keys as they are then.
+    struct Addition {
+        std::size_t index;
+        const Value& value;
+    };
+    /// Adds some entries, in ascending order, whose keys `keys` has and this one lacks.
+    void addKeys(const KeySetRef& keys, std::span<const Addition> added);
     /// Adds every entry of the other dictionary; its values win.
     void merge(const Dictionary& other);
 
@@ -93,13 +108,35 @@ public:
 
 private:
     friend class Value;
-    struct Block;
+    /// The values, in the order of the keys, follow the block. Room beyond the keys' count is uninitialised.
+    struct Block {
+        Block(std::size_t room, KeySetRef keySet) noexcept
+            : capacity(static_cast<std::uint32_t>(room)), keys(std::move(keySet)) {}
+        static Block* make(std::size_t capacity, KeySetRef keys);
+        /// Frees the block alone; its values are gone already.
+        static void free(Block* block) noexcept;
+        [[nodiscard]] std::size_t count() const noexcept { return keys->size(); }
+        [[nodiscard]] Value* values() noexcept { return reinterpret_cast<Value*>(this + 1); }
+
+        std::atomic<std::uint32_t> references{1};
+        std::uint32_t capacity;
+        KeySetRef keys;
+    };
 
     void detach(std::size_t capacity);
     /// Adds the entries whose keys are missing here; the others stay as they are.
     void addAll(const Dictionary& other);
-    static void retain(Block* block) noexcept;
-    static void release(Block* block) noexcept;
+    static void retain(Block* block) noexcept {
+        if (block != nullptr) {
+            block->references.fetch_add(1, std::memory_order_relaxed);
+        }
+    }
+    static void release(Block* block) noexcept {
+        if (block != nullptr && block->references.fetch_sub(1, std::memory_order_acq_rel) == 1) {
+            destroy(block);
+        }
+    }
+    static void destroy(Block* block) noexcept;
 
     Block* block_ = nullptr;
 };

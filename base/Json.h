@@ -9,6 +9,7 @@
 #include <string>
 #include <string_view>
 #include <variant>
+#include <vector>
 
 namespace tamblo {
 
@@ -16,6 +17,18 @@ namespace tamblo {
 /// text that reads back the same, with `.0` when integral; single-precision floats likewise in single
 /// precision. Dates become RFC 3339 texts, byte strings Base64 texts, numbers that are not finite `null`.
 void appendJson(TextBuffer& out, const Value& value);
+/// The text of a dictionary, and where in it each of its members begins.
+struct JsonObjectText {
+    Dictionary dictionary;
+    std::string_view text;
+    std::vector<std::size_t> members;
+};
+/// Appends a dictionary as an object. `members` is given where each of its members begins in its text.
+void appendJsonObject(TextBuffer& out, const Dictionary& dictionary, std::vector<std::size_t>& members);
+/// The same for one that has the key set of `before`: the members whose values are the same are copied from
+/// there.
+void appendJsonObject(TextBuffer& out, const Dictionary& dictionary, std::vector<std::size_t>& members,
+                      const JsonObjectText& before);
 /// Appends a text in quotes, escaped.
 void appendJsonString(TextBuffer& out, std::string_view text);
 /// Appends a double by the rule above.

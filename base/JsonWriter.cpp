@@ -1,8 +1,10 @@
 #include "base/Json.h"
 
 #include "base/Base64.h"
+#include "base/KeySet.h"
 #include "base/Rfc3339.h"
 
+#include <algorithm>
 #include <array>
 #include <bit>
 #include <charconv>
@@ -10,6 +12,7 @@
 #include <cstdint>
 #include <cstring>
 #include <span>
+#include <utility>
 
 namespace tamblo {
 
@@ -50,20 +53,45 @@ bool anyNeedsEscape(std::uint64_t block) noexcept {
     return (found & highBits) != 0;
 }
 
-/// Copies bytes up to the first that needs an escape, and answers how many.
+template <typename Word> Word load(const char* from) noexcept {
+    Word word;
+    std::memcpy(&word, from, sizeof word);
+    return word;
+}
+template <typename Word> void store(char* to, Word word) noexcept {
+    std::memcpy(to, &word, sizeof word);
+}
+
+/// Copies bytes up to the first that needs an escape, and answers how many. What is left of the last words is
+/// taken with bytes that were copied before.
 std::size_t copyPlain(char* to, std::string_view text) noexcept {
+    const char* const from = text.data();
+    const std::size_t size = text.size();
     std::size_t i = 0;
-    while (text.size() - i >= 8) {
-        std::uint64_t block;
-        std::memcpy(&block, text.data() + i, sizeof block);
+    for (; size - i >= 8; i += 8) {
+        const auto block = load<std::uint64_t>(from + i);
         if (anyNeedsEscape(block)) {
             break;
         }
-        std::memcpy(to + i, &block, sizeof block);
-        i += 8;
+        store(to + i, block);
     }
-    while (i < text.size() && escapeOf(text[i]) == 0) {
-        to[i] = text[i];
+    if (size >= 8 && size - i < 8) {
+        const auto last = load<std::uint64_t>(from + size - 8);
+        if (!anyNeedsEscape(last)) {
+            store(to + size - 8, last);
+            return size;
+        }
+    } else if (size >= 4 && i == 0 && size < 8) {
+        const auto first = load<std::uint32_t>(from);
+        const auto last = load<std::uint32_t>(from + size - 4);
+        if (!anyNeedsEscape(std::uint64_t{first} << 32U | last)) {
+            store(to, first);
+            store(to + size - 4, last);
+            return size;
+        }
+    }
+    while (i < size && escapeOf(from[i]) == 0) {
+        to[i] = from[i];
         ++i;
     }
     return i;
@@ -202,66 +230,82 @@ char* writeScalar(char* to, const Value& value) {
     }
 }
 
-/// Appends a text behind a lead-in (a separator, a key).
-void appendQuoted(TextBuffer& out, std::string_view lead, std::string_view text) {
-    char* const begin = out.room(lead.size() + text.size() + 2);
-    char* at = writeText(begin, lead);
-    *at++ = '"';
-    std::size_t plain = copyPlain(at, text);
-    at += plain;
-    while (plain != text.size()) {
-        // Rare, but who wants it to cost much sends nothing else: some bytes at a time, in the room that they
-        // can need at most.
-        constexpr std::size_t kRun = 64;
-        out.commit(static_cast<std::size_t>(at - out.data()) - out.size());
-        text.remove_prefix(plain);
-        const std::string_view run = text.substr(0, kRun);
-        text.remove_prefix(run.size());
-        at = out.room(kLongestEscaped * run.size() + sizeof(Escaped) + text.size() + 1);
-        for (const char character : run) {
-            at = writeEscaped(at, character);
-        }
-        plain = copyPlain(at, text);
-        at += plain;
-    }
-    *at++ = '"';
-    out.commit(static_cast<std::size_t>(at - out.data()) - out.size());
-}
-
-/// Writes values on one line, or for people: a key or an element on a line of its own.
+/// Writes values on one line, or for people: a key or an element on a line of its own. It writes into the
+/// room behind the text, whose length is set when this goes.
 class Writer {
 public:
-    Writer(TextBuffer& out, std::size_t indent) noexcept : out_(out), indent_(indent) {}
+    explicit Writer(TextBuffer& out, std::size_t indent = 0)
+        : out_(out), indent_(indent), at_(out.room(kScalarRoom)), end_(out.data() + out.capacity()) {}
+    ~Writer() { commit(); }
+    Writer(const Writer&) = delete;
+    Writer& operator=(const Writer&) = delete;
 
-    /// A value behind a lead-in (a key).
-    void item(std::string_view lead, const Value& value) {
+    void value(const Value& value) {
         switch (value.kind()) {
         case Value::Kind::string:
-            return appendQuoted(out_, lead, value.stringValue());
+            return quoted(value.stringValue());
         case Value::Kind::data:
-            return appendQuoted(out_, lead, encodeBase64(value.dataValue()));
+            return quoted(encodeBase64(value.dataValue()));
         case Value::Kind::array:
-            out_.append(lead);
             return array(value.arrayValue());
         case Value::Kind::dictionary:
-            out_.append(lead);
             return dictionary(value.dictionaryValue());
         default:
-            break;
+            reserve(kScalarRoom);
+            at_ = writeScalar(at_, value);
         }
-        char* const begin = out_.room(lead.size() + kScalarRoom);
-        char* const end = writeScalar(writeText(begin, lead), value);
-        out_.commit(static_cast<std::size_t>(end - begin));
     }
+    void dictionary(const Dictionary& dictionary) {
+        open('{');
+        for (std::size_t i = 0; i < dictionary.size(); ++i) {
+            separate(i);
+            member(dictionary, i);
+        }
+        close('}', dictionary.size());
+    }
+    /// One member of a dictionary on one line, with what separates it from the one before.
+    void plainMember(const Dictionary& dictionary, std::size_t index) {
+        reserve(1);
+        *at_++ = index == 0 ? '{' : ',';
+        member(dictionary, index);
+    }
+    void quoted(std::string_view text) {
+        reserve(text.size() + 2);
+        *at_++ = '"';
+        std::size_t plain = copyPlain(at_, text);
+        at_ += plain;
+        while (plain != text.size()) {
+            // Rare, but who wants it to cost much sends nothing else: some bytes at a time, in the room that
+            // they can need at most.
+            constexpr std::size_t kRun = 64;
+            text.remove_prefix(plain);
+            const std::string_view run = text.substr(0, kRun);
+            text.remove_prefix(run.size());
+            reserve(kLongestEscaped * run.size() + sizeof(Escaped) + text.size() + 1);
+            for (const char character : run) {
+                at_ = writeEscaped(at_, character);
+            }
+            plain = copyPlain(at_, text);
+            at_ += plain;
+        }
+        *at_++ = '"';
+    }
+    void number(double number) {
+        reserve(kScalarRoom);
+        at_ = writeFloat(at_, number);
+    }
+    /// Bytes of the text as far as it is written.
+    [[nodiscard]] std::size_t size() const noexcept { return static_cast<std::size_t>(at_ - out_.data()); }
 
     void open(char bracket) {
-        out_.append(bracket);
+        reserve(1);
+        *at_++ = bracket;
         depth_ += indent_;
     }
     void separate(std::size_t index) {
-        if (index != 0) {
-            out_.append(',');
-        }
+        reserve(1);
+        *at_ = ',';
+        at_ += index != 0 ? 1 : 0;
         startLine();
     }
     void close(char bracket, std::size_t count) {
@@ -269,47 +313,64 @@ public:
         if (count != 0) {
             startLine();
         }
-        out_.append(bracket);
+        reserve(1);
+        *at_++ = bracket;
+    }
+    void plain(std::string_view text) {
+        reserve(text.size());
+        at_ = writeText(at_, text);
     }
 
 private:
-    void dictionary(const Dictionary& dictionary) {
-        const KeySet& keys = dictionary.keys();
-        const std::span<const Value> values = dictionary.values();
-        open('{');
-        for (std::size_t i = 0; i < values.size(); ++i) {
-            separate(i);
-            if (indent_ == 0) {
-                item(keys.jsonKey(i), values[i]);
-            } else {
-                out_.append(keys.jsonKey(i));
-                item(" ", values[i]);
-            }
+    void commit() noexcept { out_.commit(size() - out_.size()); }
+    void reserve(std::size_t count) {
+        if (static_cast<std::size_t>(end_ - at_) < count) [[unlikely]] {
+            commit();
+            at_ = out_.room(count);
+            end_ = out_.data() + out_.capacity();
         }
-        close('}', values.size());
+    }
+
+    void member(const Dictionary& dictionary, std::size_t index) {
+        const std::string_view key = dictionary.keys().jsonKey(index);
+        constexpr std::size_t kOrdinary = KeySet::kReadableOfJsonKey;
+        reserve(std::max(key.size(), kOrdinary) + 1);
+        // Nearly all are copied without asking how long they are.
+        if (key.size() <= kOrdinary) {
+            std::memcpy(at_, key.data(), kOrdinary);
+            at_ += key.size();
+        } else {
+            at_ = writeText(at_, key);
+        }
+        if (indent_ != 0) {
+            *at_++ = ' ';
+        }
+        value(dictionary.valueAt(index));
     }
 
     void array(std::span<const Value> elements) {
         open('[');
         for (std::size_t i = 0; i < elements.size(); ++i) {
             separate(i);
-            item("", elements[i]);
+            value(elements[i]);
         }
         close(']', elements.size());
     }
 
     void startLine() {
         if (indent_ != 0) {
-            char* const line = out_.room(1 + depth_);
-            *line = '\n';
-            std::memset(line + 1, ' ', depth_);
-            out_.commit(1 + depth_);
+            reserve(1 + depth_);
+            *at_++ = '\n';
+            std::memset(at_, ' ', depth_);
+            at_ += depth_;
         }
     }
 
     TextBuffer& out_;
-    std::size_t indent_; ///< spaces for each level; none for one line
+    const std::size_t indent_; ///< spaces for each level; none for one line
     std::size_t depth_ = 0;
+    char* at_;
+    char* end_;
 };
 
 /// Whether JSON has a form for the value, as far as that is known without looking into it.
@@ -374,7 +435,47 @@ const char* kindWithoutForm(std::string_view step, const Value& value, std::stri
 } // namespace
 
 void appendJson(TextBuffer& out, const Value& value) {
-    Writer(out, 0).item("", value);
+    Writer(out).value(value);
+}
+
+void appendJsonObject(TextBuffer& out, const Dictionary& dictionary, std::vector<std::size_t>& members) {
+    const std::size_t begin = out.size();
+    members.resize(dictionary.size());
+    Writer writer(out);
+    for (std::size_t i = 0; i < members.size(); ++i) {
+        members[i] = writer.size() + 1 - begin;
+        writer.plainMember(dictionary, i);
+    }
+    writer.plain(members.empty() ? "{}" : "}");
+}
+
+void appendJsonObject(TextBuffer& out, const Dictionary& dictionary, std::vector<std::size_t>& members,
+                      const JsonObjectText& before) {
+    const std::size_t begin = out.size();
+    const std::span<const Value> values = dictionary.values();
+    const std::span<const Value> valuesBefore = before.dictionary.values();
+    const std::size_t count = values.size();
+    members.resize(count);
+    Writer writer(out);
+    for (std::size_t i = 0; i < count;) {
+        std::size_t end = i;
+        // May wrap around: it is added to what is as far ahead.
+        const std::size_t shift = writer.size() + 1 - begin - before.members[i];
+        for (; end < count && values[end].isSame(valuesBefore[end]); ++end) {
+            members[end] = before.members[end] + shift;
+        }
+        if (end != i) {
+            const std::size_t from = before.members[i] - 1;
+            const std::size_t to = end < count ? before.members[end] - 1 : before.text.size() - 1;
+            writer.plain(before.text.substr(from, to - from));
+            i = end;
+            continue;
+        }
+        members[i] = writer.size() + 1 - begin;
+        writer.plainMember(dictionary, i);
+        ++i;
+    }
+    writer.plain(count == 0 ? "{}" : "}");
 }
 
 std::optional<std::string> appendPrettyJson(TextBuffer& out, std::string_view key,
@@ -388,19 +489,19 @@ std::optional<std::string> appendPrettyJson(TextBuffer& out, std::string_view ke
     Writer writer(out, indent);
     writer.open('{');
     writer.separate(0);
-    appendJsonString(out, key);
-    writer.item(": ", value);
+    writer.quoted(key);
+    writer.plain(": ");
+    writer.value(value);
     writer.close('}', 1);
     return std::nullopt;
 }
 
 void appendJsonString(TextBuffer& out, std::string_view text) {
-    appendQuoted(out, "", text);
+    Writer(out).quoted(text);
 }
 
 void appendJsonNumber(TextBuffer& out, double number) {
-    char* const begin = out.room(kScalarRoom);
-    out.commit(static_cast<std::size_t>(writeFloat(begin, number) - begin));
+    Writer(out).number(number);
 }
 
 std::string jsonText(const Value& value) {

@@ -32,13 +32,17 @@ public:
     /// The index of each key in the key set, `kAbsent` for those that it does not hold. Lives until the next
     /// call.
     [[nodiscard]] const Places& in(const KeySet& keySet) {
+        const auto address = reinterpret_cast<std::uintptr_t>(&keySet);
+        if (const Known* const known = known_.find(address, [](const Known&) { return true; })) {
+            return known->places;
+        }
         if (keySet.size() > kMostRememberedKeys || keySet.heldBytes() > kMostRememberedBytes) {
             // What is remembered is held for as long as this is there: larger ones than messages commonly
             // have are not.
             once_ = find(keySet).places;
             return once_;
         }
-        return known_.get(reinterpret_cast<std::uintptr_t>(&keySet), [&] { return find(keySet); }).places;
+        return known_.put(address, find(keySet)).places;
     }
 
 private:

@@ -47,7 +47,9 @@ public:
 
     [[nodiscard]] std::size_t size() const noexcept { return count_; }
     [[nodiscard]] std::string_view key(std::size_t index) const noexcept;
-    /// The key as it stands in JSON, quotes and colon included: `"key":`.
+    /// The key as it stands in JSON, quotes and colon included: `"key":`. So many bytes from its beginning on
+    /// may be read, however long it is.
+    static constexpr std::size_t kReadableOfJsonKey = 32;
     [[nodiscard]] std::string_view jsonKey(std::size_t index) const noexcept;
     [[nodiscard]] std::size_t find(std::string_view key) const noexcept;
     /// Whether the key at an index is this one.
@@ -62,7 +64,7 @@ public:
     [[nodiscard]] bool operator==(const KeySet& other) const noexcept;
 
     /// Bytes of memory.
-    [[nodiscard]] std::size_t heldBytes() const noexcept;
+    [[nodiscard]] std::size_t heldBytes() const noexcept { return heldBytes_; }
     /// Whether more refer to it than the dictionary that asks and one other, such as what remembers key sets.
     [[nodiscard]] bool isShared() const noexcept { return references_.load(std::memory_order_relaxed) > 2; }
 
@@ -90,10 +92,23 @@ private:
     struct Transition;
 
     explicit KeySet(std::span<const std::string_view> sortedKeys);
+    /// Room for so many keys, and for the bytes of their texts and of those as JSON.
+    KeySet(std::size_t count, std::size_t textLength, std::size_t jsonLength);
+    [[nodiscard]] static std::uint32_t bytesOf(std::size_t count, std::size_t text) noexcept;
     ~KeySet();
     KeySet(const KeySet&) = delete;
     KeySet& operator=(const KeySet&) = delete;
 
+    /// The first index whose key is not below this one.
+    [[nodiscard]] std::size_t lowerBound(std::string_view key) const noexcept;
+    /// Where the texts of the key at an index begin, or of the last key end.
+    [[nodiscard]] std::size_t textOffset(std::size_t index) const noexcept;
+    [[nodiscard]] std::size_t jsonOffset(std::size_t index) const noexcept;
+    /// Copies keys of another one, from `begin` to `end`, to an index and to where their texts are to begin.
+    void copyKeys(const KeySet& from, std::size_t begin, std::size_t end, std::size_t index,
+                  std::size_t textOffset, std::size_t jsonOffset) noexcept;
+    [[nodiscard]] KeySetRef makeAdding(std::string_view key, std::size_t index) const;
+    [[nodiscard]] KeySetRef makeRemoving(std::size_t index) const;
     void remember(const KeySetRef& target, std::size_t index, bool isRemoval) const;
     void retain() const noexcept { references_.fetch_add(1, std::memory_order_relaxed); }
     void release() const noexcept;
@@ -105,6 +120,7 @@ private:
     std::unique_ptr<Entry[]> entries_;
     std::unique_ptr<char[]> text_;
     std::uint32_t textLength_ = 0;
+    std::uint32_t heldBytes_ = 0;
     mutable std::atomic<std::uint32_t> transitionCount_{0};
     mutable std::atomic<Transition*> transitions_{nullptr};
 };

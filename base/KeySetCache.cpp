@@ -70,13 +70,13 @@ KeySetCache::Fault sortKeys(std::span<const std::string_view> arrived, KeySetRef
 void appendEncoded(std::string& encoded, std::string_view key) {
     constexpr unsigned kText = 0x60;
     const auto add = [&encoded](std::size_t byte) { encoded += static_cast<char>(byte); };
-    if (key.size() < 24) {
+    if (key.size() < KeySetCache::kLongText) {
         add(kText + key.size());
     } else if (key.size() < 0x100) {
-        add(kText + 24);
+        add(kText + KeySetCache::kLongText);
         add(key.size());
     } else {
-        add(kText + 25);
+        add(kText + KeySetCache::kLongText + 1);
         add(key.size() >> 8U);
         add(key.size() & 0xFFU);
     }
@@ -106,7 +106,7 @@ bool KeySetCache::Shape::matches(std::span<const std::string_view> arrived) cons
 }
 
 KeySetCache::Fault KeySetCache::makeDictionary(std::span<const std::string_view> keys,
-                                               std::span<Value> values, std::size_t spare,
+                                               std::span<Value> values, std::size_t spare, bool isPart,
                                                Dictionary& dictionary) {
     const std::uint64_t hash = hashKeys(keys);
     const ShapeRef* known = shapes_.find(
@@ -124,9 +124,15 @@ KeySetCache::Fault KeySetCache::makeDictionary(std::span<const std::string_view>
             appendEncoded(shape.encoded, key);
             shape.ends.push_back(static_cast<std::uint32_t>(shape.encoded.size()));
         }
+        shape.encoded.append(kReadableBehind, '\0');
         known = &shapes_.put(hash, std::make_shared<const Shape>(std::move(shape)));
     }
-    expected_[keys.size() % expected_.size()] = *known;
+    if (Expected& next = expected(keys.size()); !isPart && next.shape != *known) {
+        // In this order: without memory for the second, nothing is expected.
+        next.shape = nullptr;
+        next.texts.assign(keys.size(), Value());
+        next.shape = *known;
+    }
     dictionary = Dictionary::fromKeySet((*known)->keys, values, (*known)->places, spare);
     return Fault::none;
 }
@@ -144,10 +150,7 @@ KeySetCache::Fault KeySetCache::makeDictionaryOnce(std::span<const std::string_v
 }
 
 std::optional<Value> KeySetCache::textValue(std::string_view text) {
-    // Shorter texts lie in their value. Longer ones would make the memory held here large, and seldom repeat.
-    constexpr std::size_t shortest = 15;
-    constexpr std::size_t longest = 96;
-    const bool isRemembered = text.size() >= shortest && text.size() <= longest;
+    const bool isRemembered = KeySetCache::isRemembered(text.size());
     const std::uint64_t hash = isRemembered ? hashKeys({&text, 1}) : 0;
     if (isRemembered) {
         if (const Value* known =

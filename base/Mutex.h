@@ -21,6 +21,9 @@ template <typename Native> class TAMBLO_THREAD_ANNOTATION(capability("mutex")) A
 public:
     void lock() TAMBLO_THREAD_ANNOTATION(acquire_capability()) { native_.lock(); }
     void unlock() TAMBLO_THREAD_ANNOTATION(release_capability()) { native_.unlock(); }
+    [[nodiscard]] bool try_lock() TAMBLO_THREAD_ANNOTATION(try_acquire_capability(true)) {
+        return native_.try_lock();
+    }
     /// For what the analysis cannot follow: a lock that is handed on.
     [[nodiscard]] Native& native() noexcept { return native_; }
 

@@ -71,6 +71,12 @@ public:
             size_ += text.size();
         }
     }
+    /// Appends bytes that stand in it already.
+    void appendAgain(std::size_t begin, std::size_t end) {
+        char* const to = room(end - begin);
+        std::memcpy(to, bytes_.get() + begin, end - begin);
+        size_ += end - begin;
+    }
     void append(char character) {
         *room(1) = character;
         ++size_;

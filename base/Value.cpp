@@ -1,11 +1,9 @@
 #include "base/Value.h"
 
-#include "base/AllocatedBytes.h"
 #include "base/Dictionary.h"
 #include "base/NumberText.h"
 
 #include <algorithm>
-#include <atomic>
 #include <charconv>
 #include <cmath>
 #include <limits>
@@ -13,18 +11,6 @@
 #include <utility>
 
 namespace tamblo {
-
-/// A text or byte string too long for the value itself; the bytes follow the block.
-struct Value::TextBlock {
-    std::atomic<std::uint32_t> references{1};
-    std::uint32_t length;
-
-    explicit TextBlock(std::uint32_t bytes) : length(bytes) {}
-    char* text() noexcept { return reinterpret_cast<char*>(this + 1); }
-    [[nodiscard]] std::string_view view() const noexcept {
-        return {reinterpret_cast<const char*>(this + 1), length};
-    }
-};
 
 struct Value::ArrayBlock {
     std::atomic<std::uint32_t> references{1};
@@ -110,33 +96,6 @@ bool beginsWithYes(std::string_view text) noexcept {
 
 } // namespace
 
-Value::Value(bool value) noexcept {
-    store<std::int64_t>(value ? 1 : 0, Kind::boolean);
-}
-Value::Value(int value) noexcept : Value(static_cast<long long>(value)) {}
-Value::Value(unsigned value) noexcept : Value(static_cast<long long>(value)) {}
-Value::Value(long value) noexcept : Value(static_cast<long long>(value)) {}
-Value::Value(long long value) noexcept {
-    store<std::int64_t>(value, Kind::integer);
-}
-Value::Value(unsigned long value) noexcept : Value(static_cast<unsigned long long>(value)) {}
-Value::Value(unsigned long long value) noexcept {
-    const bool fitsSigned =
-        value <= static_cast<unsigned long long>(std::numeric_limits<std::int64_t>::max());
-    store<std::uint64_t>(value, fitsSigned ? Kind::integer : Kind::unsignedInteger);
-}
-Value::Value(float value) noexcept {
-    store(value, Kind::singleFloat);
-}
-Value::Value(double value) noexcept {
-    store(value, Kind::doubleFloat);
-}
-Value::Value(const char* text) : Value(std::string_view(text)) {}
-Value::Value(std::string_view text) {
-    storeText(text, Kind::string);
-}
-Value::Value(const std::string& text) : Value(std::string_view(text)) {}
-
 Value::Value(Array elements) {
     store(new ArrayBlock(std::move(elements)), Kind::array);
 }
@@ -157,16 +116,7 @@ Value Value::data(std::span<const std::uint8_t> bytes) {
     return value;
 }
 
-void Value::storeText(std::string_view text, Kind kind) {
-    std::memset(bytes_, 0, sizeof bytes_);
-    bytes_[kKindAt] = static_cast<std::uint8_t>(kind);
-    if (text.size() <= kInlineCapacity) {
-        if (!text.empty()) {
-            std::memcpy(bytes_, text.data(), text.size());
-        }
-        bytes_[kLengthAt] = static_cast<std::uint8_t>(text.size());
-        return;
-    }
+void Value::storeTextBlock(std::string_view text) {
     void* memory = ::operator new(sizeof(TextBlock) + text.size());
     auto* block = new (memory) TextBlock(static_cast<std::uint32_t>(text.size()));
     std::memcpy(block->text(), text.data(), text.size());
@@ -174,58 +124,33 @@ void Value::storeText(std::string_view text, Kind kind) {
     bytes_[kLengthAt] = kInBlock;
 }
 
-std::string_view Value::textBytes() const noexcept {
-    if (bytes_[kLengthAt] == kInBlock) {
-        return load<const TextBlock*>()->view();
+void Value::retainLargeBlock() const noexcept {
+    if (kind() == Kind::array) {
+        load<ArrayBlock*>()->references.fetch_add(1, std::memory_order_relaxed);
+    } else {
+        Dictionary::retain(load<Dictionary::Block*>());
     }
-    return {reinterpret_cast<const char*>(bytes_), bytes_[kLengthAt]};
 }
 
-void Value::retain() const noexcept {
-    if (!ownsBlock()) {
+void Value::releaseLargeBlock() noexcept {
+    if (kind() == Kind::dictionary) {
+        Dictionary::release(load<Dictionary::Block*>());
         return;
     }
-    switch (kind()) {
-    case Kind::array:
-        load<ArrayBlock*>()->references.fetch_add(1, std::memory_order_relaxed);
-        break;
-    case Kind::dictionary:
-        Dictionary::retain(load<Dictionary::Block*>());
-        break;
-    default:
-        load<TextBlock*>()->references.fetch_add(1, std::memory_order_relaxed);
-        break;
+    auto* const block = load<ArrayBlock*>();
+    if (block->references.fetch_sub(1, std::memory_order_acq_rel) == 1) {
+        delete block;
     }
 }
 
-void Value::releaseBlock() noexcept {
-    switch (kind()) {
-    case Kind::array: {
-        auto* block = load<ArrayBlock*>();
-        if (block->references.fetch_sub(1, std::memory_order_acq_rel) == 1) {
-            delete block;
-        }
-        break;
-    }
-    case Kind::dictionary:
-        Dictionary::release(load<Dictionary::Block*>());
-        break;
-    default: {
-        auto* block = load<TextBlock*>();
-        if (block->references.fetch_sub(1, std::memory_order_acq_rel) == 1) {
-            block->~TextBlock();
-            ::operator delete(block);
-        }
-        break;
-    }
-    }
+void Value::freeTextBlock() noexcept {
+    auto* const block = load<TextBlock*>();
+    block->~TextBlock();
+    ::operator delete(block);
 }
 
-std::size_t Value::bytesOfBlock(bool sharesCountHalf) const noexcept {
-    // Longer texts are never shared by the messages that clients send one by one.
-    constexpr std::size_t kLongestSharedText = 96;
-    switch (kind()) {
-    case Kind::array: {
+std::size_t Value::bytesOfLargeBlock(bool sharesCountHalf) const noexcept {
+    if (kind() == Kind::array) {
         const Array& elements = load<const ArrayBlock*>()->elements;
         std::size_t bytes =
             allocatedBytes(sizeof(ArrayBlock)) + allocatedBytes(elements.capacity() * sizeof(Value));
@@ -234,21 +159,11 @@ std::size_t Value::bytesOfBlock(bool sharesCountHalf) const noexcept {
         }
         return bytes;
     }
-    case Kind::dictionary: {
-        const Dictionary& inner = dictionaryValue();
-        const std::size_t keys = inner.keys().heldBytes();
-        return sharesCountHalf ? inner.bytesOfValues(Dictionary::Shared::inProportion) +
-                                     (inner.keys().isShared() ? keys / 2 : keys)
-                               : inner.bytesOfValues(Dictionary::Shared::inFull) + keys;
-    }
-    default: {
-        const auto* text = load<const TextBlock*>();
-        const std::size_t bytes = allocatedBytes(sizeof(TextBlock) + text->length);
-        const bool isShared = sharesCountHalf && text->length <= kLongestSharedText &&
-                              text->references.load(std::memory_order_relaxed) > 2;
-        return isShared ? bytes / 2 : bytes;
-    }
-    }
+    const Dictionary& inner = dictionaryValue();
+    const std::size_t keys = inner.keys().heldBytes();
+    return sharesCountHalf ? inner.bytesOfValues(Dictionary::Shared::inProportion) +
+                                 (inner.keys().isShared() ? keys / 2 : keys)
+                           : inner.bytesOfValues(Dictionary::Shared::inFull) + keys;
 }
 
 double Value::doubleValue() const noexcept {
@@ -305,10 +220,6 @@ bool Value::boolValue() const noexcept {
     return number != 0.0 && !std::isnan(number);
 }
 
-std::string_view Value::stringValue() const noexcept {
-    return kind() == Kind::string ? textBytes() : std::string_view();
-}
-
 double Value::dateSeconds() const noexcept {
     return kind() == Kind::date ? load<double>() : 0.0;
 }
@@ -357,10 +268,7 @@ bool Value::numberEquals(const Value& other) const noexcept {
     return isUnsigned(kind()) == isUnsigned(other.kind()) && rawUnsigned() == other.rawUnsigned();
 }
 
-bool Value::operator==(const Value& other) const noexcept {
-    if (std::memcmp(bytes_, other.bytes_, sizeof bytes_) == 0) {
-        return true;
-    }
+bool Value::equalsOtherBytes(const Value& other) const noexcept {
     if (isNumber() || other.isNumber()) {
         return isNumber() && other.isNumber() && numberEquals(other);
     }

@@ -1,5 +1,8 @@
 #pragma once
 
+#include "base/AllocatedBytes.h"
+
+#include <atomic>
 #include <cstddef>
 #include <cstdint>
 #include <cstring>
@@ -38,20 +41,26 @@ public:
         dictionary,
     };
 
+    /// Texts and byte strings of so many bytes lie in the value.
+    static constexpr std::size_t kInlineCapacity = 14;
+
     /// The boolean false.
     Value() noexcept;
-    Value(bool value) noexcept;
-    Value(int value) noexcept;
-    Value(unsigned value) noexcept;
-    Value(long value) noexcept;
-    Value(long long value) noexcept;
-    Value(unsigned long value) noexcept;
-    Value(unsigned long long value) noexcept;
-    Value(float value) noexcept;
-    Value(double value) noexcept;
-    Value(const char* text);
-    Value(std::string_view text);
-    Value(const std::string& text);
+    Value(bool value) noexcept { store<std::int64_t>(value ? 1 : 0, Kind::boolean); }
+    Value(int value) noexcept : Value(static_cast<long long>(value)) {}
+    Value(unsigned value) noexcept : Value(static_cast<long long>(value)) {}
+    Value(long value) noexcept : Value(static_cast<long long>(value)) {}
+    Value(long long value) noexcept { store<std::int64_t>(value, Kind::integer); }
+    Value(unsigned long value) noexcept : Value(static_cast<unsigned long long>(value)) {}
+    Value(unsigned long long value) noexcept {
+        const bool fitsSigned = value >> 63U == 0;
+        store<std::uint64_t>(value, fitsSigned ? Kind::integer : Kind::unsignedInteger);
+    }
+    Value(float value) noexcept { store(value, Kind::singleFloat); }
+    Value(double value) noexcept { store(value, Kind::doubleFloat); }
+    Value(const char* text) : Value(std::string_view(text)) {}
+    Value(std::string_view text) { storeText(text, Kind::string); }
+    Value(const std::string& text) : Value(std::string_view(text)) {}
     Value(Array elements);
     Value(Dictionary dictionary) noexcept;
     static Value date(double secondsSince1970) noexcept;
@@ -78,7 +87,9 @@ public:
     /// True for a number other than 0, and for a text that begins so, or with "YES", "yes", "TRUE" or "true".
     [[nodiscard]] bool boolValue() const noexcept;
     /// The text itself; empty for every other kind. Lives as long as the value stands unchanged.
-    [[nodiscard]] std::string_view stringValue() const noexcept;
+    [[nodiscard]] std::string_view stringValue() const noexcept {
+        return isString() ? textBytes() : std::string_view();
+    }
     /// The seconds of a date, else 0.
     [[nodiscard]] double dateSeconds() const noexcept;
     /// The bytes of a byte string; empty for every other kind.
@@ -94,7 +105,15 @@ public:
     [[nodiscard]] double rawDouble() const noexcept { return load<double>(); }
     [[nodiscard]] float rawSingle() const noexcept { return load<float>(); }
 
-    [[nodiscard]] bool operator==(const Value& other) const noexcept;
+    [[nodiscard]] bool operator==(const Value& other) const noexcept {
+        return isSame(other) || equalsOtherBytes(other);
+    }
+
+    /// Whether both are the same bytes: of one kind, and of what lies in a block, the same block. Then they
+    /// are equal; equal values need not be the same.
+    [[nodiscard]] bool isSame(const Value& other) const noexcept {
+        return std::memcmp(bytes_, other.bytes_, sizeof bytes_) == 0;
+    }
 
     /// Bytes of memory of what the value refers to, whether or not others refer to it as well.
     [[nodiscard]] std::size_t heldBytes() const noexcept { return ownsBlock() ? bytesOfBlock(false) : 0; }
@@ -102,10 +121,19 @@ public:
 private:
     friend class Dictionary;
 
-    struct TextBlock;
+    /// A text or byte string too long for the value itself; the bytes follow the block.
+    struct TextBlock {
+        explicit TextBlock(std::uint32_t bytes) noexcept : length(bytes) {}
+        [[nodiscard]] char* text() noexcept { return reinterpret_cast<char*>(this + 1); }
+        [[nodiscard]] std::string_view view() const noexcept {
+            return {reinterpret_cast<const char*>(this + 1), length};
+        }
+
+        std::atomic<std::uint32_t> references{1};
+        std::uint32_t length;
+    };
     struct ArrayBlock;
 
-    static constexpr std::size_t kInlineCapacity = 14;
     static constexpr std::size_t kLengthAt = 14;
     static constexpr std::size_t kKindAt = 15;
     /// In the length byte: the text lies in a block, its pointer in the first eight bytes.
@@ -121,13 +149,49 @@ private:
         std::memcpy(bytes_, &value, sizeof(T));
         bytes_[kKindAt] = static_cast<std::uint8_t>(kind);
     }
-    void storeText(std::string_view text, Kind kind);
+    void storeText(std::string_view text, Kind kind) {
+        std::memset(bytes_, 0, sizeof bytes_);
+        bytes_[kKindAt] = static_cast<std::uint8_t>(kind);
+        if (text.size() > kInlineCapacity) {
+            storeTextBlock(text);
+        } else if (!text.empty()) {
+            std::memcpy(bytes_, text.data(), text.size());
+            bytes_[kLengthAt] = static_cast<std::uint8_t>(text.size());
+        }
+    }
+    void storeTextBlock(std::string_view text);
     [[nodiscard]] std::string_view textBytes() const noexcept;
     [[nodiscard]] bool ownsBlock() const noexcept;
-    void retain() const noexcept;
+    void retain() const noexcept {
+        if (!ownsBlock()) {
+            return;
+        }
+        if (kind() < Kind::array) {
+            load<TextBlock*>()->references.fetch_add(1, std::memory_order_relaxed);
+        } else {
+            retainLargeBlock();
+        }
+    }
+    void retainLargeBlock() const noexcept;
     void release() noexcept;
-    void releaseBlock() noexcept;
-    [[nodiscard]] std::size_t bytesOfBlock(bool sharesCountHalf) const noexcept;
+    void releaseLargeBlock() noexcept;
+    void freeTextBlock() noexcept;
+    [[nodiscard]] std::size_t bytesOfBlock(bool sharesCountHalf) const noexcept {
+        return kind() < Kind::array ? bytesOfTextBlock(sharesCountHalf) : bytesOfLargeBlock(sharesCountHalf);
+    }
+    [[nodiscard]] std::size_t bytesOfTextBlock(bool sharesCountHalf) const noexcept {
+        // Longer texts are never shared by the messages that clients send one by one. Others may be held
+        // twice by what reads them (`KeySetCache`), which keeps no message's text.
+        constexpr std::size_t kLongestSharedText = 96;
+        constexpr std::uint32_t kHoldersOfOneMessagesText = 3;
+        const auto* const text = load<const TextBlock*>();
+        const std::size_t bytes = allocatedBytes(sizeof(TextBlock) + text->length);
+        const bool isShared = sharesCountHalf && text->length <= kLongestSharedText &&
+                              text->references.load(std::memory_order_relaxed) > kHoldersOfOneMessagesText;
+        return isShared ? bytes / 2 : bytes;
+    }
+    [[nodiscard]] std::size_t bytesOfLargeBlock(bool sharesCountHalf) const noexcept;
+    [[nodiscard]] bool equalsOtherBytes(const Value& other) const noexcept;
     [[nodiscard]] bool numberEquals(const Value& other) const noexcept;
 
     alignas(8) std::uint8_t bytes_[16];
@@ -141,6 +205,13 @@ inline bool Value::ownsBlock() const noexcept {
         return bytes_[kLengthAt] == kInBlock;
     }
     return k >= Kind::array;
+}
+
+inline std::string_view Value::textBytes() const noexcept {
+    if (bytes_[kLengthAt] == kInBlock) {
+        return load<const TextBlock*>()->view();
+    }
+    return {reinterpret_cast<const char*>(bytes_), bytes_[kLengthAt]};
 }
 
 inline Value::Value() noexcept {
@@ -158,8 +229,13 @@ inline Value::Value(const Value& other) noexcept {
 }
 
 inline void Value::release() noexcept {
-    if (ownsBlock()) {
-        releaseBlock();
+    if (!ownsBlock()) {
+        return;
+    }
+    if (kind() >= Kind::array) {
+        releaseLargeBlock();
+    } else if (load<TextBlock*>()->references.fetch_sub(1, std::memory_order_acq_rel) == 1) {
+        freeTextBlock();
     }
 }
 
@@ -178,7 +254,7 @@ inline Value& Value::operator=(Value&& other) noexcept {
 
 inline Value& Value::operator=(const Value& other) noexcept {
     // The same bytes are the same value and hold the same block, if any: what a client repeats costs nothing.
-    if (std::memcmp(bytes_, other.bytes_, sizeof bytes_) == 0) {
+    if (isSame(other)) {
         return *this;
     }
     // By way of a copy: the other may lie in a block that only this one holds.

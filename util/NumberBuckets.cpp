@@ -28,23 +28,25 @@ std::string bucketText(double bucket, unsigned fractionDigits) {
 
 } // namespace
 
-std::optional<std::string> ZRReportingUtilityBucketNumberToString(double value,
-                                                                  std::span<const double> buckets,
-                                                                  unsigned fractionDigits) {
-    std::optional<double> best;
+std::optional<std::size_t> nearestBucket(double value, std::span<const double> buckets) noexcept {
+    std::optional<std::size_t> best;
     double bestDistance = 0;
-    for (const double bucket : buckets) {
-        const double distance = std::fabs(value - bucket);
+    for (std::size_t i = 0; i < buckets.size(); ++i) {
+        const double distance = std::fabs(value - buckets[i]);
         if (best && distance > bestDistance) {
             break;
         }
-        best = bucket;
+        best = i;
         bestDistance = distance;
     }
-    if (!best) {
-        return std::nullopt;
-    }
-    return bucketText(*best, fractionDigits);
+    return best;
+}
+
+std::optional<std::string> ZRReportingUtilityBucketNumberToString(double value,
+                                                                  std::span<const double> buckets,
+                                                                  unsigned fractionDigits) {
+    const std::optional<std::size_t> nearest = nearestBucket(value, buckets);
+    return nearest ? std::optional(bucketText(buckets[*nearest], fractionDigits)) : std::nullopt;
 }
 
 } // namespace tamblo

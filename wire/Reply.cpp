@@ -39,14 +39,39 @@ std::optional<Error> errorFrom(const Dictionary& dictionary) {
     return error;
 }
 
-/// Nearly every reply is `[1, id, null, null]` or has a boolean as its result: `84 01 (id) f6 (f4 to f6)`,
-/// which is read without a reader's steps. Nothing for any other.
+// Nearly every reply is `[1, id, null, null]` or has a boolean as its result: `84 01 (id) f6 (f4 to f6)`.
+// These are written and read without the steps of a writer and a reader.
+constexpr std::uint8_t kFalseItem = 0xF4;
+constexpr std::uint8_t kTrueItem = 0xF5;
+constexpr std::uint8_t kNullItem = 0xF6;
+
+void appendPlainReply(TextBuffer& out, std::uint64_t id, std::uint8_t result) {
+    constexpr std::size_t longest = 13;
+    const std::size_t start = beginFrame(out);
+    char* at = out.room(longest);
+    const char* const begin = at;
+    *at++ = '\x84';
+    *at++ = '\x01';
+    if (id < 24) {
+        *at++ = static_cast<char>(id);
+    } else {
+        const unsigned power = id <= 0xFF ? 0 : id <= 0xFFFF ? 1 : id <= 0xFFFFFFFF ? 2 : 3;
+        *at++ = static_cast<char>(24 + power);
+        for (unsigned bits = 8U << power; bits != 0; bits -= 8) {
+            *at++ = static_cast<char>(id >> (bits - 8));
+        }
+    }
+    *at++ = static_cast<char>(kNullItem);
+    *at++ = static_cast<char>(result);
+    out.commit(static_cast<std::size_t>(at - begin));
+    (void)finishFrame(out, start);
+}
+
+/// Nothing for any other.
 std::optional<Reply> decodePlainReply(std::span<const std::uint8_t> item) noexcept {
     constexpr std::size_t shortest = 5;
-    constexpr std::uint8_t falseItem = 0xF4;
-    constexpr std::uint8_t nullItem = 0xF6;
-    if (item.size() < shortest || item[0] != 0x84 || item[1] != 0x01 || item[item.size() - 2] != nullItem ||
-        item.back() < falseItem || item.back() > nullItem) {
+    if (item.size() < shortest || item[0] != 0x84 || item[1] != 0x01 || item[item.size() - 2] != kNullItem ||
+        item.back() < kFalseItem || item.back() > kNullItem) {
         return std::nullopt;
     }
     const auto idBytes = item.subspan(3, item.size() - shortest);
@@ -63,8 +88,8 @@ std::optional<Reply> decodePlainReply(std::span<const std::uint8_t> item) noexce
     }
     std::optional<Reply> reply(std::in_place);
     reply->id = id;
-    if (item.back() != nullItem) {
-        reply->result.emplace(item.back() != falseItem);
+    if (item.back() != kNullItem) {
+        reply->result.emplace(item.back() != kFalseItem);
     }
     return reply;
 }
@@ -72,11 +97,11 @@ std::optional<Reply> decodePlainReply(std::span<const std::uint8_t> item) noexce
 } // namespace
 
 void appendNullReply(TextBuffer& out, std::uint64_t id) {
-    appendReply(out, id, [](CborWriter& writer) { writer.null(); });
+    appendPlainReply(out, id, kNullItem);
 }
 
 void appendBooleanReply(TextBuffer& out, std::uint64_t id, bool result) {
-    appendReply(out, id, [result](CborWriter& writer) { writer.boolean(result); });
+    appendPlainReply(out, id, result ? kTrueItem : kFalseItem);
 }
 
 void appendUnsignedReply(TextBuffer& out, std::uint64_t id, std::uint64_t result) {

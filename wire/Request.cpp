@@ -9,9 +9,8 @@ namespace tamblo::wire {
 
 namespace {
 
-/// The keys that the service adds to a payload: timestamp, its rejected predecessor, audio tag, application
-/// name.
-constexpr std::size_t kKeysYetToCome = 4;
+/// Room in a message for the keys that nearly every one lacks: audio tag, application name.
+constexpr std::size_t kSpareKeys = 2;
 
 constexpr std::size_t kIdBytes = 8;
 
@@ -100,7 +99,7 @@ bool readReporterIDs(CborReader& reader, std::size_t atMost, std::vector<std::in
 }
 
 bool readDictionary(CborReader& reader, Dictionary& dictionary) {
-    auto read = reader.readDictionary(kKeysYetToCome);
+    auto read = reader.readDictionary(kSpareKeys);
     if (read) {
         dictionary = std::move(*read);
     }
@@ -213,12 +212,47 @@ std::optional<Refusal> readRequest(CborReader& reader, const RequestLimits& limi
     return std::nullopt;
 }
 
+/// Up to its payload, nearly every request is this, byte for byte: `[0, id, "sendMessage", [` with the id in
+/// its longest form, as the client library writes it.
+constexpr std::string_view kMessageBegin("\x84\0\x1B", 3);
+constexpr std::string_view kMessageMethod = "\x6BsendMessage\x84";
+constexpr std::size_t kMethodBytes = kMessageMethod.size() - 2; ///< of its name
+constexpr std::size_t kMessageHeadBytes = kMessageBegin.size() + kIdBytes + kMessageMethod.size();
+
+/// Whether it is; then the request's id and method are set.
+bool beginsMessage(std::span<const std::uint8_t> item, Request& request) noexcept {
+    if (item.size() < kMessageHeadBytes) {
+        return false;
+    }
+    const std::string_view head(reinterpret_cast<const char*>(item.data()), kMessageHeadBytes);
+    if (!head.starts_with(kMessageBegin) || !head.ends_with(kMessageMethod)) {
+        return false;
+    }
+    std::uint64_t id = 0;
+    for (const std::uint8_t byte : item.subspan(kMessageBegin.size(), kIdBytes)) {
+        id = id << 8U | byte;
+    }
+    request.id = id;
+    request.method = Method::sendMessage;
+    return true;
+}
+
+/// Reads the rest of a message from its payload on.
+std::optional<Refusal> readMessage(CborReader& reader, const RequestLimits& limits, Request& request) {
+    request.reporterIDs.clear();
+    CborReader::ArrayHead parameters{.count = 4};
+    return readParameters(reader, parameters, limits, request);
+}
+
 } // namespace
 
 std::optional<Refusal> decodeRequest(std::span<const std::uint8_t> item, KeySetCache& keySets,
                                      Request& request, const RequestLimits& limits) {
-    CborReader reader(item, &keySets, limits.values);
-    std::optional<Refusal> refused = readRequest(reader, limits, request);
+    const bool isMessage = beginsMessage(item, request);
+    CborReader reader(isMessage ? item.subspan(kMessageHeadBytes) : item, &keySets, limits.values,
+                      isMessage ? kMethodBytes : 0);
+    std::optional<Refusal> refused =
+        isMessage ? readMessage(reader, limits, request) : readRequest(reader, limits, request);
     request.decodedBytes = reader.decodedBytes();
     if (!refused && reader.error() == CborError::none && reader.atEnd()) [[likely]] {
         return std::nullopt;
