@@ -23,7 +23,7 @@ void demand(bool condition) {
 }
 
 /// Takes replies as a connection would and counts them by request.
-class Receiver {
+class Receiver : public std::enable_shared_from_this<Receiver> {
 public:
     template <typename AppendFrame> void reply(const AppendFrame& appendFrame) {
         TextBuffer out;
@@ -61,7 +61,7 @@ void feed(FakePlatform& device, FakeClientConnection& connection, std::span<cons
         const auto id = request.id;
         const wire::Method method = request.method;
         const int before = id ? receiver->count(*id) : 0;
-        dispatchRequest(connection.object(), request, receiver);
+        dispatchRequest(connection.object(), request, *receiver);
         device.serverQueue().runAll();
         const bool mayBeHeld =
             method == wire::Method::startReportingSessionForID || method == wire::Method::killService;

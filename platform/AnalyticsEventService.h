@@ -4,6 +4,7 @@
 
 #include <cstdint>
 #include <functional>
+#include <span>
 #include <string_view>
 
 namespace tamblo {
@@ -20,7 +21,12 @@ public:
     [[nodiscard]] virtual std::uint64_t inUseGeneration() const = 0;
     /// Records one event. The provider is called at most once, only if the event is recorded, and before this
     /// returns; what it returns is the event's payload as of then.
-    virtual void sendEventLazy(std::string_view eventName, const std::function<Dictionary()>& payload) = 0;
+    void sendEventLazy(std::string_view eventName, const std::function<Dictionary()>& payload) {
+        sendEventsLazy({&eventName, 1}, payload);
+    }
+    /// The same for several events that have one payload.
+    virtual void sendEventsLazy(std::span<const std::string_view> eventNames,
+                                const std::function<Dictionary()>& payload) = 0;
 };
 
 } // namespace tamblo

@@ -47,11 +47,16 @@ public:
                                                             const Dictionary& userInfo) = 0;
     /// Looks for back ends; answers once, later, on a thread of the service's own.
     virtual void StartConfiguration(const SessionRef& session, Completion completion) = 0;
-    /// Sends one message; answers why it could not, or nothing. Without a session, nothing is sent.
-    [[nodiscard]] virtual std::optional<std::string> SendLinkmeterMessage(const SessionRef& session,
-                                                                          std::uint16_t category,
-                                                                          std::uint16_t type,
-                                                                          const Dictionary& payload) = 0;
+    /// Sends one message, without the entry of the key `leftOut`, if any; answers why it could not, or
+    /// nothing. Without a session, nothing is sent.
+    [[nodiscard]] virtual std::optional<std::string>
+    SendLinkmeterMessage(const SessionRef& session, std::uint16_t category, std::uint16_t type,
+                         const Dictionary& payload, std::string_view leftOut) = 0;
+    /// The same where it needs no waiting for anything, a disk or another thread. Answers whether it was
+    /// done; what could not be sent counts as done.
+    [[nodiscard]] virtual bool trySendLinkmeterMessage(const SessionRef& session, std::uint16_t category,
+                                                       std::uint16_t type, const Dictionary& payload,
+                                                       std::string_view leftOut) = 0;
     /// Sends what the service has held back.
     virtual void FlushMessages(const SessionRef& session) = 0;
 };

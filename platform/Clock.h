@@ -15,8 +15,10 @@ using WallTime = std::chrono::time_point<std::chrono::system_clock, std::chrono:
 class Clock {
 public:
     virtual ~Clock() = default;
-    /// The time of day, which may step backwards. Without blocking. Read once per message and passed down.
+    /// The time of day, which may step backwards. Without blocking.
     [[nodiscard]] virtual WallTime now() const noexcept = 0;
+    /// The same to some milliseconds, for a fraction of what reading the time costs.
+    [[nodiscard]] virtual WallTime coarseNow() const noexcept { return now(); }
     /// Time that only ever goes on, for how long something took.
     [[nodiscard]] virtual std::chrono::steady_clock::time_point steadyNow() const noexcept {
         return std::chrono::steady_clock::now();

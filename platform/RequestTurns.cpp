@@ -35,7 +35,7 @@ struct RequestTurns::State : std::enable_shared_from_this<State> {
     State(SerialQueue& queue, const Clock& steadyClock) : serverQueue(queue), clock(steadyClock) {}
 
     /// Puts a queue with work among those that wait, and sees to it that turns are taken.
-    void enlist(const QueueRef& queue, Pace pace) TAMBLO_REQUIRES(mutex);
+    void enlist(Queue& queue, Pace pace) TAMBLO_REQUIRES(mutex);
     void callForTurns(Pace pace) TAMBLO_REQUIRES(mutex);
     /// The queue whose turn it is; null when none waits.
     [[nodiscard]] QueueRef begin() TAMBLO_EXCLUDES(mutex);
@@ -71,13 +71,13 @@ public:
 
     void post(Work work, Pace pace) override {
         const MutexLock lock(state_->mutex);
-        pending.push_back({std::move(work), pace});
-        state_->enlist(shared_from_this(), pace);
+        pending.emplace_back(std::move(work), pace);
+        state_->enlist(*this, pace);
     }
     void postNext(Work work, Pace pace) override {
         const MutexLock lock(state_->mutex);
         rest = {std::move(work), pace};
-        state_->enlist(shared_from_this(), pace);
+        state_->enlist(*this, pace);
     }
     void suspend() override {
         const MutexLock lock(state_->mutex);
@@ -88,7 +88,7 @@ public:
     void resume() override {
         const MutexLock lock(state_->mutex);
         if (!isAbandoned && --suspensions == 0) {
-            state_->enlist(shared_from_this(), Pace::quick);
+            state_->enlist(*this, Pace::quick);
         }
     }
     void abandon() override {
@@ -156,16 +156,16 @@ private:
     const std::shared_ptr<State> state_;
 };
 
-void RequestTurns::State::enlist(const QueueRef& queue, Pace pace) {
-    if (queue->isListed || !queue->mayRun()) {
+void RequestTurns::State::enlist(Queue& queue, Pace pace) {
+    if (queue.isListed || !queue.mayRun()) {
         return;
     }
-    std::deque<QueueRef>& ofUser = waiting[queue->client.user];
-    ofUser.push_back(queue);
+    std::deque<QueueRef>& ofUser = waiting[queue.client.user];
+    ofUser.push_back(queue.shared_from_this());
     if (ofUser.size() == 1) {
-        users.push_back(queue->client.user);
+        users.push_back(queue.client.user);
     }
-    queue->isListed = true;
+    queue.isListed = true;
     callForTurns(pace);
 }
 

@@ -541,6 +541,7 @@ void ZRReportingClientServerInstance::leaveSome() {
         } catch (const std::bad_alloc&) {
             log::ownError(ZRReportingServiceDelegateCategory(),
                           "no memory to stop the session of reporter {}", entry->first);
+            session->giveUpStop();
             isOver = true;
         }
         if (isOver) {

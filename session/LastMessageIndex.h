@@ -25,6 +25,12 @@ public:
     bool add(const ZRReportingSessionMessage& message) {
         return last_.insert_or_assign(key(message.category(), message.type()), &message).second;
     }
+    /// A message that is older than all that were added: whether it is the first of its category and type.
+    bool addOlder(const ZRReportingSessionMessage& message) {
+        return last_.try_emplace(key(message.category(), message.type()), &message).second;
+    }
+    /// How many categories and types there are.
+    [[nodiscard]] std::size_t size() const noexcept { return last_.size(); }
     /// The message goes from the list.
     void remove(const ZRReportingSessionMessage& message) {
         const auto found = last_.find(key(message.category(), message.type()));

@@ -4,6 +4,7 @@
 
 #include <algorithm>
 #include <array>
+#include <chrono>
 #include <cstdint>
 #include <map>
 #include <string>
@@ -16,8 +17,19 @@ namespace {
 
 constexpr double kOldestAcceptedAge = 31'536'000; // seconds: 365 days
 
-/// The audio tag and the application's name.
-constexpr std::size_t kKeysAddedAfterwards = 2;
+/// How far the coarse time is behind at most; what is nearer to the limit is looked at exactly.
+constexpr std::chrono::milliseconds kCoarseness{20};
+
+/// Key sets that take more memory are no ordinary messages' and are not remembered.
+constexpr std::size_t kMostBytesOfKeys = 8192;
+
+bool isTooOld(const Value& timestamp, WallTime now) noexcept {
+    return timestamp.doubleValue() < secondsSince1970(now) - kOldestAcceptedAge;
+}
+
+bool isNoName(const Value& appName) noexcept {
+    return appName.stringValue() == "Unknown";
+}
 
 /// Differ between two messages that say the same.
 constexpr std::array<std::string_view, 3> kKeysOfTimes{ZRReportingInternalEventProcessUptimeMS,
@@ -36,16 +48,15 @@ const Value& AudioTags::of(AudioEventCategory category, AudioEventType type) {
 }
 
 void addMissingDates(Dictionary& payload, WallTime now) {
-    const double seconds = secondsSince1970(now);
     if (const Value* timestamp = payload.find(ZRReportingInternalEventEpochTime)) {
-        if (!(timestamp->doubleValue() < seconds - kOldestAcceptedAge)) {
+        if (!isTooOld(*timestamp, now)) {
             return;
         }
         payload.set(kInvalidTimestampKey, Value(*timestamp));
     } else {
         payload.set(kInvalidTimestampKey, "nil");
     }
-    payload.set(ZRReportingInternalEventEpochTime, seconds);
+    payload.set(ZRReportingInternalEventEpochTime, secondsSince1970(now));
 }
 
 void removeWhiteSpaceFromKeys(Dictionary& payload) {
@@ -64,7 +75,7 @@ void removeWhiteSpaceFromKeys(Dictionary& payload) {
             }
         }
     }
-    payload = Dictionary::fromMap(cleaned, kKeysAddedAfterwards);
+    payload = Dictionary::fromMap(cleaned, kMostKeysAdded);
 }
 
 void addAudioMessageTag(Dictionary& payload, const Value& tag) {
@@ -73,9 +84,62 @@ void addAudioMessageTag(Dictionary& payload, const Value& tag) {
 
 void addAppName(Dictionary& payload, const Value& appName) {
     const Value* present = payload.find(ZRReportingApplicationName);
-    if (present == nullptr || present->stringValue() == "Unknown") {
+    if (present == nullptr || isNoName(*present)) {
         payload.set(ZRReportingApplicationName, appName);
     }
+}
+
+void Normaliser::normalise(Dictionary& payload, const Value& tag, const Value& appName, const Clock& clock) {
+    const KeySet& keys = payload.keys();
+    if (keys.heldBytes() <= kMostBytesOfKeys) {
+        const Plan& plan =
+            plans_.get(reinterpret_cast<std::uintptr_t>(&keys), [&keys] { return makePlan(keys); });
+        if (follow(plan, payload, tag, appName, clock.coarseNow() + kCoarseness)) {
+            return;
+        }
+    }
+    addMissingDates(payload, clock.now());
+    removeWhiteSpaceFromKeys(payload);
+    addAudioMessageTag(payload, tag);
+    addAppName(payload, appName);
+}
+
+Normaliser::Plan Normaliser::makePlan(const KeySet& keys) {
+    Plan plan{.arrived = KeySetRef(&keys), .complete = {}};
+    plan.timestamp = keys.find(ZRReportingInternalEventEpochTime);
+    if (plan.timestamp == KeySet::kNotFound || keys.anyKeyHasSpace() ||
+        keys.find(kAudioTagKey) != KeySet::kNotFound) {
+        return plan;
+    }
+    plan.complete = keys.adding(kAudioTagKey).keys;
+    plan.addsAppName = keys.find(ZRReportingApplicationName) == KeySet::kNotFound;
+    if (plan.addsAppName) {
+        plan.complete = plan.complete->adding(ZRReportingApplicationName).keys;
+    }
+    plan.tag = plan.complete->find(kAudioTagKey);
+    plan.appName = plan.complete->find(ZRReportingApplicationName);
+    return plan;
+}
+
+/// Whether that was all there is to do; nothing is changed where it is not.
+bool Normaliser::follow(const Plan& plan, Dictionary& payload, const Value& tag, const Value& appName,
+                        WallTime now) {
+    if (!plan.complete || isTooOld(payload.valueAt(plan.timestamp), now)) {
+        return false;
+    }
+    if (plan.addsAppName) {
+        // The order of the two keys.
+        static_assert(ZRReportingApplicationName < kAudioTagKey);
+        const std::array<Dictionary::Addition, 2> added{{{plan.appName, appName}, {plan.tag, tag}}};
+        payload.addKeys(plan.complete, added);
+        return true;
+    }
+    const std::array<Dictionary::Addition, 1> added{{{plan.tag, tag}}};
+    payload.addKeys(plan.complete, added);
+    if (isNoName(payload.valueAt(plan.appName))) {
+        payload.setValueAt(plan.appName, appName);
+    }
+    return true;
 }
 
 bool isRepetition(const Dictionary& earlier, const Dictionary& payload) noexcept {

@@ -9,7 +9,7 @@
 
 namespace tamblo {
 
-void PreviousValues::take(const Dictionary& payload, std::size_t bytes) {
+void PreviousValues::take(const Dictionary& payload, std::size_t bytes, bool isRecorded) {
     bytesOfKeysLeft_ = 0;
     if (payload.empty()) {
         return;
@@ -18,10 +18,9 @@ void PreviousValues::take(const Dictionary& payload, std::size_t bytes) {
     const auto known = std::find_if(latest_.rbegin(), latest_.rend(),
                                     [keys](const Latest& latest) { return &latest.payload.keys() == keys; });
     const std::size_t held = bytes + keys->heldBytes();
-    bytes_ += held;
     if (known != latest_.rend()) {
-        bytes_ -= known->bytes;
-        *known = {payload, held};
+        bytes_ += held - known->bytes;
+        *known = {payload, held, known->isRecorded || isRecorded};
         std::rotate(known.base() - 1, known.base(), latest_.end());
         return;
     }
@@ -30,9 +29,10 @@ void PreviousValues::take(const Dictionary& payload, std::size_t bytes) {
         latest_.erase(latest_.begin());
         bytes_ -= oldest.bytes;
         takeApart(oldest);
-        bytesOfKeysLeft_ = oldest.payload.keys().heldBytes();
+        bytesOfKeysLeft_ = oldest.isRecorded ? oldest.payload.keys().heldBytes() : 0;
     }
-    latest_.push_back({payload, held});
+    latest_.push_back({payload, held, isRecorded});
+    bytes_ += held;
 }
 
 void PreviousValues::takeApart(const Latest& latest) {
@@ -45,8 +45,8 @@ void PreviousValues::takeApart(const Latest& latest) {
             bytes_ += bytesOf(key, value);
             found->second = value;
         } else if (older_.size() < mostKeys_) {
-            bytes_ += bytesOf(key, value);
             older_.emplace(key, value);
+            bytes_ += bytesOf(key, value);
         } else {
             isFull_ = true;
         }
@@ -81,6 +81,32 @@ Dictionary PreviousValues::values() const {
         }
     }
     return values.empty() ? Dictionary() : Dictionary::fromMap(values);
+}
+
+Dictionary PreviousValues::valuesOf(std::span<const std::string_view> keys) const {
+    std::size_t most = older_.size();
+    for (const Latest& latest : latest_) {
+        most += latest.payload.size();
+    }
+    // Which keys are among the first ones that are remembered, only all of them together tell.
+    const Dictionary all = most > mostKeys_ ? values() : Dictionary();
+    std::map<std::string_view, Value> found;
+    for (const std::string_view key : keys) {
+        if (const Value* const value = most > mostKeys_ ? all.find(key) : find(key)) {
+            found.emplace(key, *value);
+        }
+    }
+    return found.empty() ? Dictionary() : Dictionary::fromMap(found);
+}
+
+const Value* PreviousValues::find(std::string_view key) const {
+    for (auto latest = latest_.rbegin(); latest != latest_.rend(); ++latest) {
+        if (const Value* const value = latest->payload.find(key)) {
+            return value;
+        }
+    }
+    const auto found = older_.find(key);
+    return found != older_.end() ? &found->second : nullptr;
 }
 
 std::size_t PreviousValues::bytesOf(std::string_view key, const Value& value) noexcept {

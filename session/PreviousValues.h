@@ -5,6 +5,7 @@
 
 #include <cstddef>
 #include <functional>
+#include <span>
 #include <string>
 #include <string_view>
 #include <unordered_map>
@@ -29,17 +30,20 @@ public:
     PreviousValues& operator=(const PreviousValues&) = delete;
 
     /// Takes in what a message holds. Its values win over those of the messages before. `bytes` is what
-    /// `heldBytes` counts for the payload's values.
-    void take(const Dictionary& payload, std::size_t bytes);
+    /// `heldBytes` counts for the payload's values; whether the message is recorded as well tells who holds
+    /// its keys later.
+    void take(const Dictionary& payload, std::size_t bytes, bool isRecorded);
     /// Nothing is remembered any more.
     void clear();
 
     /// All of them, made into a dictionary.
     [[nodiscard]] Dictionary values() const;
+    /// Those of some keys alone, which costs as much as there are of these.
+    [[nodiscard]] Dictionary valuesOf(std::span<const std::string_view> keys) const;
     /// Bytes of memory.
     [[nodiscard]] std::size_t heldBytes() const noexcept { return bytes_; }
-    /// The bytes of the keys of the key set that the latest payload has pushed out, which messages may go on
-    /// to share; 0 when it has pushed none out.
+    /// The bytes of the keys of the key set that the latest payload has pushed out, which recorded messages
+    /// go on to share; 0 when it has pushed none out, or none that they have.
     [[nodiscard]] std::size_t bytesOfKeysLeft() const noexcept { return bytesOfKeysLeft_; }
     /// Whether keys were left out.
     [[nodiscard]] bool isFull() const noexcept { return isFull_; }
@@ -48,10 +52,12 @@ private:
     struct Latest {
         Dictionary payload;
         std::size_t bytes; ///< its keys included
+        bool isRecorded;   ///< it, or one before it of the same keys
     };
     using Table = std::unordered_map<std::string, Value, SeededTextHash, std::equal_to<>>;
 
     void takeApart(const Latest& latest);
+    [[nodiscard]] const Value* find(std::string_view key) const;
     [[nodiscard]] static std::size_t bytesOf(std::string_view key, const Value& value) noexcept;
 
     const std::size_t mostKeys_;

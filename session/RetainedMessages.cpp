@@ -133,7 +133,7 @@ void RetainedMessages::makeRoom(Account& account) {
 void RetainedMessages::letGo(Account& account, std::size_t bytes, std::string_view limit) {
     std::vector<std::pair<std::size_t, ZRReportingSession*>> sessions;
     for (const Share* const share : account.shares) {
-        if (!share->session_.isStopping()) {
+        if (share->session_.maySpareMessages()) {
             sessions.emplace_back(share->bytes_, &share->session_);
         }
     }

@@ -17,7 +17,7 @@ namespace {
 /// A session that retains less is stopped in one part.
 constexpr std::size_t kBytesOfShortStop = 128U << 10U;
 /// Messages that are entered into the index, or let go, in one part.
-constexpr std::size_t kMessagesOfPart = 20'000;
+constexpr std::size_t kMessagesOfPart = 5'000;
 /// A message that a worker has derived and is still to send, about.
 constexpr std::size_t kBytesOfDerivedMessage = 512;
 
@@ -45,11 +45,24 @@ bool ZRReportingSession::stopSome() {
     if (stop_->step != SessionStop::Step::done) {
         return false;
     }
+    endStop();
+    return true;
+}
+
+void ZRReportingSession::giveUpStop() {
+    if (stop_ != nullptr) {
+        if (messages_.empty()) {
+            messages_.swap(stop_->past);
+        }
+        endStop();
+    }
+}
+
+void ZRReportingSession::endStop() {
     const std::unique_ptr<SessionStop> past = std::move(stop_);
     for (UniqueFunction<void()>& call : past->waiting) {
         call();
     }
-    return true;
 }
 
 void ZRReportingSession::stopNextPart() {
@@ -57,7 +70,9 @@ void ZRReportingSession::stopNextPart() {
     case SessionStop::Step::sort:
         if (stop_->sort->sortSome()) {
             stop_->step = stop_->sort->hasChanged() ? SessionStop::Step::index : SessionStop::Step::workers;
+            stop_->keySets = stop_->sort->takeKeySets();
             stop_->sort.reset();
+            stop_->kinds = lastMessages_.size();
             orderWorkersToStop();
         }
         break;
@@ -76,13 +91,22 @@ void ZRReportingSession::stopNextPart() {
 }
 
 void ZRReportingSession::indexSomeAgain() {
-    const std::size_t end = std::min(messages_.size(), stop_->indexed + kMessagesOfPart);
-    for (; stop_->indexed < end; ++stop_->indexed) {
-        lastMessages_.add(*messages_[stop_->indexed]);
+    if (stop_->indexed == 0) {
+        lastMessages_.clear();
     }
-    if (end == messages_.size()) {
+    // From the end on: as a rule, all kinds of messages are met soon.
+    const std::size_t end = std::min(messages_.size(), stop_->indexed + kMessagesOfPart);
+    while (stop_->indexed < end && lastMessages_.size() < stop_->kinds) {
+        ++stop_->indexed;
+        lastMessages_.addOlder(*messages_[messages_.size() - stop_->indexed]);
+    }
+    if (stop_->indexed == messages_.size() || lastMessages_.size() == stop_->kinds) {
         stop_->step = SessionStop::Step::workers;
     }
+}
+
+std::span<const KeySet*> ZRReportingSession::keySetsAtStop() noexcept {
+    return stop_ != nullptr ? std::span(stop_->keySets) : std::span<const KeySet*>();
 }
 
 void ZRReportingSession::orderWorkersToStop() {
@@ -100,10 +124,15 @@ void ZRReportingSession::stopSomeOfWorkers() {
     if (workers.empty()) {
         stop_->step = SessionStop::Step::letGo;
         stop_->past.swap(messages_);
+        std::vector<const KeySet*>().swap(stop_->keySets);
         lastMessages_.clear();
         return;
     }
     const Worker& worker = messageWorkers_[workers.back()];
+    if (!worker.workerClass->role.producer && !stop_->keySets.empty()) {
+        // The others, which come last, may change messages without saying so.
+        std::vector<const KeySet*>().swap(stop_->keySets);
+    }
     if (worker.instance->stopSome()) {
         worker.instance->setStarted(false);
         log::debug(ZRReportingSessionCategory(),
@@ -130,17 +159,23 @@ bool ZRReportingSession::holdsDerived(std::size_t messages) {
 }
 
 bool ZRReportingSession::letGoSome() {
+    isLeaving_ = true;
     lastMessages_.clear();
     return letGoSomeOf(messages_);
 }
 
 bool ZRReportingSession::letGoSomeOf(std::vector<MessageRef>& messages) {
-    messages.resize(messages.size() - std::min(messages.size(), kMessagesOfPart));
+    const std::size_t left = messages.size() - std::min(messages.size(), kMessagesOfPart);
+    while (messages.size() > left) {
+        __builtin_prefetch(
+            messages[messages.size() - std::min(messages.size(), MessageSort::kLookAhead)].get());
+        messages.pop_back();
+    }
     if (!messages.empty()) {
         return false;
     }
     std::vector<MessageRef>().swap(messages);
-    const std::size_t derived = stop_ != nullptr ? std::exchange(stop_->derivedBytes, 0) : 0;
+    const std::size_t derived = std::exchange(derivedBytes_, 0);
     retained_.removeDerived(derived);
     retained_.removeFreed(blocks_.bytes() - derived);
     blocks_.clear();

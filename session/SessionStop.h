@@ -22,11 +22,12 @@ struct SessionStop {
     const bool isShort; ///< done in one part
     Step step = Step::sort;
     std::optional<MessageSort> sort;
-    std::size_t indexed = 0;          ///< messages entered into the index
-    std::vector<std::size_t> workers; ///< places of those that are to be stopped, the next one last
-    std::vector<MessageRef> past;     ///< messages that are to be let go
-    std::size_t derivedBytes = 0;     ///< of messages that workers sent
-    std::size_t heldBytes = 0;        ///< of those that they are still to send
+    std::vector<const KeySet*> keySets; ///< of the messages that there were, once they are sorted
+    std::size_t kinds = 0;              ///< categories and types that the index had
+    std::size_t indexed = 0;            ///< messages looked at for it, from the last one on
+    std::vector<std::size_t> workers;   ///< places of those that are to be stopped, the next one last
+    std::vector<MessageRef> past;       ///< messages that are to be let go
+    std::size_t heldBytes = 0;          ///< of those that they are still to send
     bool isFullTold = false;
     std::vector<UniqueFunction<void()>> waiting; ///< for the end
 };

@@ -27,6 +27,7 @@ ZRReportingSession::ZRReportingSession(Created, Context& context, ReporterID rep
                                        std::vector<pid_t> processIdentifiers)
     : context_(context),
       audioTags_(context.shared<intake::AudioTags>()),
+      normaliser_(context.shared<intake::Normaliser>()),
       reporterID_(reporterID),
       processIdentifiers_(std::move(processIdentifiers)),
       appName_(ZRReportingUtilityRetrieveAppName(configuration_)),
@@ -87,27 +88,31 @@ void ZRReportingSession::recordOwnMessage(AudioEventType type, std::string_view 
     addAudioMessageTag(*message, audioTags_);
     const std::size_t bytes = message->payload().bytesOfValues(Dictionary::Shared::inProportion);
     ++ownRecordCount_;
-    record(std::move(message), bytes);
+    record(message, bytes);
 }
 
-void ZRReportingSession::record(MessageRef message, std::size_t bytesOfValues) {
-    const bool isFirstOfKind = lastMessages_.add(*message);
-    messages_.push_back(std::move(message));
-    const std::size_t bytes =
-        kBytesOfMessage + bytesOfValues + (isFirstOfKind ? LastMessageIndex::kBytesOfKind : 0);
-    blocks_.add(bytes);
+void ZRReportingSession::record(const MessageRef& message, std::size_t bytesOfValues) {
+    std::size_t bytes = kBytesOfMessage + bytesOfValues;
+    messages_.push_back(message);
+    try {
+        bytes += lastMessages_.add(*message) ? LastMessageIndex::kBytesOfKind : 0;
+        blocks_.add(bytes);
+    } catch (...) {
+        lastMessages_.remove(*message);
+        messages_.pop_back();
+        throw;
+    }
     if (stop_ != nullptr) {
-        stop_->derivedBytes += bytes;
+        derivedBytes_ += bytes;
         retained_.addDerived(bytes);
     } else {
         retained_.add(bytes);
     }
 }
 
-void ZRReportingSession::remember(const Dictionary& payload, std::size_t bytesOfValues) {
-    const std::size_t before = previousValues_.heldBytes();
+void ZRReportingSession::remember(const Dictionary& payload, std::size_t bytesOfValues, bool isRecorded) {
     const bool wasFull = previousValues_.isFull();
-    previousValues_.take(payload, bytesOfValues);
+    previousValues_.take(payload, bytesOfValues, isRecorded);
     if (previousValues_.isFull() && !wasFull) {
         log::error(ZRReportingSessionCategory(),
                    "more than {} different keys; further ones are not remembered. reporterID={}",
@@ -118,7 +123,8 @@ void ZRReportingSession::remember(const Dictionary& payload, std::size_t bytesOf
     if (keys != 0) {
         blocks_.addToLast(keys);
     }
-    const std::size_t after = previousValues_.heldBytes() + keys;
+    const std::size_t before = std::exchange(previousBytes_, previousValues_.heldBytes());
+    const std::size_t after = previousBytes_ + keys;
     if (after >= before) {
         retained_.add(after - before);
     } else {
@@ -142,7 +148,7 @@ std::size_t ZRReportingSession::letGoOfOldest(std::size_t bytes, std::string_vie
         context_.platform().activity->droppedRecords += freed.messages;
     }
     if (messages_.empty() && freed.bytes < bytes) {
-        freed.bytes += previousValues_.heldBytes();
+        freed.bytes += std::exchange(previousBytes_, 0);
         previousValues_.clear();
     }
     retained_.remove(freed.bytes);
@@ -186,15 +192,14 @@ void ZRReportingSession::accept(const MessageRef& message) {
     if (!message->isRedundant) {
         record(message, bytes);
     }
-    remember(message->payload(), bytes);
+    remember(message->payload(), bytes, !message->isRedundant);
     deliver(message);
 }
 
 void ZRReportingSession::normalise(ZRReportingSessionMessage& message) const {
-    addMissingDates(message, context_.platform().clock->now());
-    removeWhiteSpaceFromKeys(message);
-    addAudioMessageTag(message, audioTags_);
-    addAppName(message);
+    const Value& tag = audioTags_.of(message.category(), message.type());
+    const Clock& clock = *context_.platform().clock;
+    message.editPayload([&](Dictionary& payload) { normaliser_.normalise(payload, tag, appName_, clock); });
 }
 
 std::string ZRReportingSession::description() const {

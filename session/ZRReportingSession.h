@@ -58,7 +58,9 @@ public:
     void updateConfigurationWithContentsOfConfiguration(const Dictionary& configuration);
     /// What the configuration would be after that.
     [[nodiscard]] Dictionary configurationWith(const Dictionary& configuration) const;
-    void addPreviousValues(const Dictionary& values) { remember(values); }
+    void addPreviousValues(const Dictionary& values) {
+        remember(values, values.bytesOfValues(Dictionary::Shared::inProportion), false);
+    }
     /// To whose budget of retained messages the session's count; at first, the service's own user's.
     void setUser(uid_t user) { retained_.setUser(user); }
 
@@ -75,11 +77,17 @@ public:
     /// Does the next part of the stop, some milliseconds of it, and answers whether the session is stopped.
     /// Between two parts the queue may do anything but start the session and send it messages.
     [[nodiscard]] bool stopSome();
+    /// Ends a stop that cannot go on, of a session that is about to go: who waits for it goes on.
+    void giveUpStop();
     /// Whether a stop has begun and is not over.
     [[nodiscard]] bool isStopping() const noexcept { return stop_ != nullptr; }
     /// For workers in their stop: so many messages that the worker has derived are still to be sent. Whether
     /// there is room for more, of what all stops of the user derive.
     [[nodiscard]] bool holdsDerived(std::size_t messages);
+    /// For workers in their stop: the key set of each of the messages that there were when it began, so that
+    /// a walk need not touch those that have no key that it looks for. Whoever changes a message's keys
+    /// enters its new key set here. Empty for a worker that is stopped by itself.
+    [[nodiscard]] std::span<const KeySet*> keySetsAtStop() noexcept;
     /// Calls back once the stop that is under way is over.
     void whenStopped(UniqueFunction<void()> call);
 
@@ -107,6 +115,10 @@ public:
     [[nodiscard]] const std::vector<MessageRef>& messages() const noexcept { return messages_; }
     /// The latest value of each key, put together anew.
     [[nodiscard]] Dictionary previousValues() const { return previousValues_.values(); }
+    /// Those of some keys.
+    [[nodiscard]] Dictionary previousValuesOf(std::span<const std::string_view> keys) const {
+        return previousValues_.valuesOf(keys);
+    }
     [[nodiscard]] std::int64_t totalMessageCount() const noexcept { return totalMessageCount_; }
     /// How many messages that were sent to the session were recorded since the last stop, its own records of
     /// start and stop aside, and those included that were let go since.
@@ -115,8 +127,11 @@ public:
     }
     /// Messages that were let go since the last stop, as the user retained too much.
     [[nodiscard]] std::uint64_t droppedMessageCount() const noexcept { return droppedMessageCount_; }
+    /// Whether messages may be let go for the sake of others: not while a stop makes use of them, nor once
+    /// all of them go.
+    [[nodiscard]] bool maySpareMessages() const noexcept { return stop_ == nullptr && !isLeaving_; }
     /// Lets go of the oldest messages that have about so many bytes, and of the previous values where no
-    /// message is left. The bytes that are free then. Not while the session is stopping.
+    /// message is left. The bytes that are free then. Only where that may be.
     std::size_t letGoOfOldest(std::size_t bytes, std::string_view limit);
     /// Lets go of some thousand messages of a session that is about to go, and is not stopping. Whether none
     /// is left.
@@ -162,6 +177,7 @@ private:
     void indexSomeAgain();
     void stopSomeOfWorkers();
     void letGoOfPast();
+    void endStop();
     [[nodiscard]] bool letGoSomeOf(std::vector<MessageRef>& messages);
     /// Calls `act` with each worker once: those of the first role, then those of the second, then all others.
     template <typename Act>
@@ -177,12 +193,9 @@ private:
     }
     /// Records a message of the session's own, which no worker is offered.
     void recordOwnMessage(AudioEventType type, std::string_view method);
-    void record(MessageRef message, std::size_t bytesOfValues);
+    void record(const MessageRef& message, std::size_t bytesOfValues);
     /// Takes the values into the previous ones; `bytesOfValues` as they count for the user's budget.
-    void remember(const Dictionary& payload, std::size_t bytesOfValues);
-    void remember(const Dictionary& values) {
-        remember(values, values.bytesOfValues(Dictionary::Shared::inProportion));
-    }
+    void remember(const Dictionary& payload, std::size_t bytesOfValues, bool isRecorded);
     void accept(const MessageRef& message);
     [[nodiscard]] std::size_t recordedCount() const noexcept {
         return messages_.size() + droppedMessageCount_;
@@ -192,9 +205,11 @@ private:
 
     Context& context_;
     intake::AudioTags& audioTags_;
+    intake::Normaliser& normaliser_;
     const ReporterID reporterID_;
     const std::vector<pid_t> processIdentifiers_;
     bool started_ = false;
+    bool isLeaving_ = false; ///< its messages are let go in parts
     bool isSingleMessageSession_ = false;
     AudioServiceType serviceType_ = AudioServiceTypeUnknown;
     std::string_view serviceName_ = ZRReportingServiceNameUnknown;
@@ -206,9 +221,11 @@ private:
     BooleanReply transactionCompleteBlock_;
 
     std::vector<MessageRef> messages_;
-    MessageBlocks blocks_; ///< what the messages take
+    MessageBlocks blocks_;         ///< what the messages take
+    std::size_t derivedBytes_ = 0; ///< of those that workers sent in the stop
     LastMessageIndex lastMessages_;
     PreviousValues previousValues_;
+    std::size_t previousBytes_ = 0; ///< as the budget counts them
     std::int64_t totalMessageCount_ = 0;
     std::size_t ownRecordCount_ = 0; ///< among those recorded
     std::uint64_t droppedMessageCount_ = 0;

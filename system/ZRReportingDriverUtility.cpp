@@ -1,6 +1,7 @@
 #include "system/ZRReportingDriverUtility.h"
 
 #include "base/Dictionary.h"
+#include "session/MessageIntake.h"
 #include "session/ZRReportingSession.h"
 #include "util/AudioEvents.h"
 #include "util/Log.h"
@@ -30,9 +31,6 @@ constexpr DriverNames kDrivers[] = {{"VandraAE2MCA", nullptr},
                                     {"Tx", nullptr},
                                     {nullptr, "VXA2"},
                                     {"pdm", nullptr}};
-
-/// Room in a payload for what the session adds: timestamp, tag, application and the mark of an own timestamp.
-constexpr std::size_t kKeysToBeAdded = 4;
 
 /// Of a key, and of the text of a state or histogram with a few entries.
 constexpr std::size_t kUsualLength = 120;
@@ -84,12 +82,38 @@ void Stats::add(const ChanlogChannel& channel) {
               channel.subGroupName);
 }
 
-void send(ZRReportingSession& session, const ZRReportingDriverUtility::DriverStats& stats,
-          AudioEventType type) {
-    if (!stats.empty()) {
-        session.sendMessage(std::make_shared<ZRReportingSessionMessage>(
-            Dictionary::fromMap(stats, kKeysToBeAdded), AudioEventKindChanlog, type));
+/// Whether the statistics have these keys.
+bool haveKeys(const ZRReportingDriverUtility::DriverStats& stats, const KeySetRef& keys) {
+    if (!keys || keys->size() != stats.size()) {
+        return false;
     }
+    std::size_t index = 0;
+    for (const auto& [key, value] : stats) {
+        if (!keys->is(index++, key)) {
+            return false;
+        }
+    }
+    return true;
+}
+
+/// Of mostly the same channels as the time before, whose key set is then this one's, too.
+void send(ZRReportingSession& session, const ZRReportingDriverUtility::DriverStats& stats,
+          AudioEventType type, KeySetRef& lastKeys) {
+    if (stats.empty()) {
+        return;
+    }
+    Dictionary payload;
+    if (haveKeys(stats, lastKeys)) {
+        Dictionary::Unfilled unfilled = Dictionary::fromKeySet(lastKeys, intake::kMostKeysAdded);
+        std::transform(stats.begin(), stats.end(), unfilled.values.begin(),
+                       [](const auto& entry) { return entry.second; });
+        payload = std::move(unfilled.dictionary);
+    } else {
+        payload = Dictionary::fromMap(stats, intake::kMostKeysAdded);
+        lastKeys = KeySetRef(&payload.keys());
+    }
+    session.sendMessage(
+        std::make_shared<ZRReportingSessionMessage>(std::move(payload), AudioEventKindChanlog, type));
 }
 
 } // namespace
@@ -161,9 +185,9 @@ void ZRReportingDriverUtility::sendDriverLogsForSession(const std::shared_ptr<ZR
         }
     }
     if (session != nullptr) {
-        send(*session, stats.simple, AudioEventTypeSimple);
-        send(*session, stats.histogram, AudioEventTypeHistogram);
-        send(*session, stats.state, AudioEventTypeState);
+        send(*session, stats.simple, AudioEventTypeSimple, lastKeys_[0]);
+        send(*session, stats.histogram, AudioEventTypeHistogram, lastKeys_[1]);
+        send(*session, stats.state, AudioEventTypeState, lastKeys_[2]);
     }
 }
 

@@ -1,8 +1,10 @@
 #pragma once
 
+#include "base/KeySet.h"
 #include "base/Value.h"
 #include "platform/ChanlogFacility.h"
 
+#include <array>
 #include <functional>
 #include <map>
 #include <memory>
@@ -113,6 +115,8 @@ public:
 private:
     ChanlogFacility& facility_;
     std::vector<ZRReportingIOChannelSubscription> ioChannelSubscriptions_;
+    /// Of the messages that were sent last, of each kind.
+    mutable std::array<KeySetRef, 3> lastKeys_;
 };
 
 } // namespace tamblo

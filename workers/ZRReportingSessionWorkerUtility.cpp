@@ -4,8 +4,8 @@
 
 namespace tamblo {
 
-std::optional<std::size_t> RapidMessages::firstKeyOf(const Dictionary& payload) {
-    const KeyPlaces::Places& found = places_.in(payload.keys());
+std::optional<std::size_t> RapidMessages::firstKeyOf(const KeySet& keys) {
+    const KeyPlaces::Places& found = places_.in(keys);
     for (std::size_t key = 0; key < keyCount_; ++key) {
         if (found[key] != KeyPlaces::kAbsent) {
             return key;
@@ -14,33 +14,31 @@ std::optional<std::size_t> RapidMessages::firstKeyOf(const Dictionary& payload) 
     return std::nullopt;
 }
 
-/// Whether the message was taken into the burst's first one.
-bool RapidMessages::takeIn(ZRReportingSessionMessage& message, std::size_t key) {
-    const std::uint32_t bit = std::uint32_t{1} << key;
+std::optional<std::size_t> RapidMessages::add(std::span<const MessageRef> messages, std::size_t place) {
+    const Dictionary& payload = messages[place]->payload();
+    const std::optional<std::size_t> key = firstKeyOf(payload.keys());
+    if (!key) {
+        return std::nullopt;
+    }
+    const std::uint32_t bit = std::uint32_t{1} << *key;
     if ((seenKeys_ & bit) != 0) {
         seenKeys_ = 0;
-        anchor_ = nullptr;
+        anchor_.reset();
     }
     seenKeys_ |= bit;
-    if (anchor_ == nullptr) {
-        anchor_ = &message;
-        return false;
+    if (!anchor_) {
+        anchor_ = place;
+        return std::nullopt;
     }
-    const std::chrono::duration<double> pause(intake::epochTime(message.payload()) -
-                                              intake::epochTime(anchor_->payload()));
+    ZRReportingSessionMessage& anchor = *messages[*anchor_];
+    const std::chrono::duration<double> pause(intake::epochTime(payload) -
+                                              intake::epochTime(anchor.payload()));
     if (!(pause < maximumPause_)) {
         // The anchor is meant to stay: what comes later than that stands alone until a key repeats.
-        return false;
+        return std::nullopt;
     }
-    anchor_->editPayload([&message](Dictionary& payload) { payload.merge(message.payload()); });
-    return true;
-}
-
-void RapidMessages::add(ZRReportingSessionMessage& message) {
-    const auto key = firstKeyOf(message.payload());
-    if (!key || !takeIn(message, *key)) {
-        result_.push_back(&message);
-    }
+    anchor.editPayload([&payload](Dictionary& taking) { taking.merge(payload); });
+    return anchor_;
 }
 
 std::vector<ZRReportingSessionMessage*>
@@ -48,10 +46,13 @@ ZRReportingSessionWorkerUtility::combineRapidMessages(std::span<const MessageRef
                                                       std::span<const std::string_view> keysToCombine,
                                                       std::chrono::duration<double> maximumPausetime) {
     RapidMessages rapid(keysToCombine, maximumPausetime);
-    for (const MessageRef& message : messages) {
-        rapid.add(*message);
+    std::vector<ZRReportingSessionMessage*> combined;
+    for (std::size_t place = 0; place < messages.size(); ++place) {
+        if (!rapid.add(messages, place)) {
+            combined.push_back(messages[place].get());
+        }
     }
-    return rapid.result();
+    return combined;
 }
 
 bool ZRReportingSessionWorkerUtility::isTalvixXYerrorMessage(

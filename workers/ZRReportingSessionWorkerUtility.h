@@ -19,27 +19,27 @@ namespace tamblo {
 /// payloads of those that follow it, each less than the pause after the one before, timestamps included; it
 /// changes in place, in the session's list as well. Messages without any of the keys pass through.
 ///
-/// The messages stay their owner's. At most 16 keys, which outlive this. For a session that takes no messages
-/// any longer.
+/// The messages stay their owner's, in one list. At most 16 keys, which outlive this. For a session that
+/// takes no messages any longer.
 class RapidMessages {
 public:
     RapidMessages(std::span<const std::string_view> keys, std::chrono::duration<double> maximumPause)
         : keyCount_(keys.size()), places_(keys), maximumPause_(maximumPause) {}
 
-    void add(ZRReportingSessionMessage& message);
-    /// Those that were not taken into an earlier one.
-    [[nodiscard]] const std::vector<ZRReportingSessionMessage*>& result() const noexcept { return result_; }
+    /// Whether a message of these keys may belong to a burst; one of others need not be added.
+    [[nodiscard]] bool concerns(const KeySet& keys) { return firstKeyOf(keys).has_value(); }
+    /// Looks at the message at a place of the list, which ascends from call to call. When it was taken into
+    /// an earlier one, the place of that, whose keys may be others then.
+    std::optional<std::size_t> add(std::span<const MessageRef> messages, std::size_t place);
 
 private:
-    [[nodiscard]] std::optional<std::size_t> firstKeyOf(const Dictionary& payload);
-    [[nodiscard]] bool takeIn(ZRReportingSessionMessage& message, std::size_t key);
+    [[nodiscard]] std::optional<std::size_t> firstKeyOf(const KeySet& keys);
 
     const std::size_t keyCount_;
     KeyPlaces places_;
     const std::chrono::duration<double> maximumPause_;
-    std::uint32_t seenKeys_ = 0;                  ///< of the burst at hand
-    ZRReportingSessionMessage* anchor_ = nullptr; ///< what takes its others in; null when nothing does
-    std::vector<ZRReportingSessionMessage*> result_;
+    std::uint32_t seenKeys_ = 0;        ///< of the burst at hand
+    std::optional<std::size_t> anchor_; ///< the place of what takes its others in
 };
 
 /// What several workers do with messages.

@@ -28,6 +28,7 @@
 #include <cstdlib>
 #include <utility>
 
+#include <malloc.h>
 #include <sys/epoll.h>
 #include <sys/resource.h>
 #include <sys/signalfd.h>
@@ -43,6 +44,12 @@ void raiseDescriptorLimit() noexcept {
         limit.rlim_cur = limit.rlim_max;
         ::setrlimit(RLIMIT_NOFILE, &limit);
     }
+}
+
+/// One heap for all threads: of others, what lies at their end is not given back when it is asked for. What
+/// threads free is mostly what another one allocated, so they would meet at its heap in any case.
+void useOneHeap() noexcept {
+    static_cast<void>(::mallopt(M_ARENA_MAX, 1));
 }
 
 } // namespace
@@ -204,6 +211,7 @@ struct LinuxPlatform::Services {
 
 std::variant<std::unique_ptr<LinuxPlatform>, std::string> LinuxPlatform::open() {
     raiseDescriptorLimit();
+    useOneHeap();
     auto directories = wire::Directories::prepare();
     if (auto* problem = std::get_if<std::string>(&directories)) {
         return std::move(*problem);
@@ -231,21 +239,23 @@ const Platform& LinuxPlatform::services() const noexcept {
 void LinuxPlatform::run(SerialQueue& serverQueue,
                         const std::function<void(std::function<void()> completion)>& shutDown) {
     Services& all = *services_;
-    serverQueue.setBatchEnd([&all] {
+    const auto endCallQuality = [&all] {
+        if (const auto delay = all.callQuality.endRun()) {
+            all.loop.post(
+                [&all, delay] { all.loop.callAfter(*delay, [&all] { all.callQuality.writeHeldBack(); }); });
+        }
+    };
+    serverQueue.setBatchEnd([&all, endCallQuality] {
         all.sinks.flush();
         all.connections.releaseReplies();
+        endCallQuality();
         all.health.update();
     });
     all.loop.setTurns([&all] { return all.connections.readSome(); });
     all.workQueues.setHelper([&all](std::chrono::milliseconds delay) {
         all.loop.post([&all, delay] { all.loop.callAfter(delay, [&all] { all.workQueues.help(); }); });
     });
-    all.workQueues.setRunEnd([&all] {
-        if (const auto delay = all.callQuality.endRun()) {
-            all.loop.post(
-                [&all, delay] { all.loop.callAfter(*delay, [&all] { all.callQuality.writeHeldBack(); }); });
-        }
-    });
+    all.workQueues.setRunEnd(endCallQuality);
     all.connections.setServerQueue(serverQueue, all.workQueues);
     all.signals.setEndWanted([&all, &shutDown] {
         notifyServiceManager("STOPPING=1");

@@ -188,11 +188,25 @@ TEST(KeySetCache, MakesNoDifferenceButSharesKeySets) {
             const std::string key = random.below(8) == 0 ? "equal ends " + number + " equal ends"
                                                          : std::string(1, "abcdefgh"[random.below(8)]);
             std::ranges::copy(written(Value(key)), std::back_inserter(bytes));
-            std::ranges::copy(written(valueNamed(random.value(1))), std::back_inserter(bytes));
+            const std::string text = "text of the kind " + std::to_string(random.below(3));
+            const Value value = random.below(4) == 0 ? Value(text) : valueNamed(random.value(1));
+            std::ranges::copy(written(value), std::back_inserter(bytes));
             keys.insert(key);
         }
         const bool namesAKeyTwice = keys.size() < entries;
-        ASSERT_EQ(read(bytes, &cache) == Outcome(CborError::duplicateKey), namesAKeyTwice);
+        const Outcome outcome = read(bytes, &cache);
+        ASSERT_EQ(outcome == Outcome(CborError::duplicateKey), namesAKeyTwice);
+        // With more behind it, values are taken several bytes at a time.
+        bytes.resize(bytes.size() + 40);
+        const CborLimits limits{.entries = 2 + random.below(9),
+                                .keyBytes = 1 + random.below(60),
+                                .bytesOfKeys = 1 + random.below(120),
+                                .decodedBytes = 100 + random.below(800)};
+        CborReader plain(bytes, nullptr, limits);
+        CborReader cached(bytes, &cache, limits);
+        ASSERT_EQ(cached.readValue(), plain.readValue());
+        ASSERT_EQ(cached.error(), plain.error());
+        ASSERT_TRUE(cached.error() != CborError::none || cached.decodedBytes() == plain.decodedBytes());
     }
     const Bytes one = fromHex("a3616101616202616303");
     const Bytes other = fromHex("a3616105616206616307");

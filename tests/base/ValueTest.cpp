@@ -119,6 +119,7 @@ void expectHolds(const Dictionary& dictionary, const Model& model) {
     bool anyHasSpace = false;
     for (const auto& [key, value] : model) {
         ASSERT_EQ(dictionary.keyAt(index), key);
+        ASSERT_EQ(dictionary.keys().jsonKey(index), jsonText(key) + ":");
         ASSERT_EQ(dictionary.valueAt(index++), value);
         ASSERT_EQ(*dictionary.find(key), value);
         ASSERT_EQ(dictionary.find(key + "x") != nullptr, model.contains(key + "x"));

@@ -25,6 +25,7 @@ namespace tamblo {
 class FakeClock final : public Clock {
 public:
     WallTime now() const noexcept override { return now_; }
+    WallTime coarseNow() const noexcept override { return now_ - coarseLag; }
     std::chrono::steady_clock::time_point steadyNow() const noexcept override { return steadyNow_; }
     [[nodiscard]] double seconds() const noexcept { return secondsSince1970(now()); }
     std::chrono::seconds utcOffset(WallTime) const override { return offset; }
@@ -39,6 +40,7 @@ public:
     void set(WallTime time) noexcept { now_ = time; }
 
     std::chrono::seconds offset{0};
+    std::chrono::milliseconds coarseLag{10};
     std::function<void()> whileAsleep = [] {};
 
 private:

@@ -24,8 +24,11 @@ public:
 
     bool isEventInUse(std::string_view eventName) override { return !inUse_ || inUse_->contains(eventName); }
     std::uint64_t inUseGeneration() const noexcept override { return generation_; }
-    void sendEventLazy(std::string_view eventName, const std::function<Dictionary()>& payload) override {
-        events.push_back({std::string(eventName), payload()});
+    void sendEventsLazy(std::span<const std::string_view> eventNames,
+                        const std::function<Dictionary()>& payload) override {
+        for (const std::string_view eventName : eventNames) {
+            events.push_back({std::string(eventName), payload()});
+        }
     }
 
     void setEventsInUse(std::optional<std::set<std::string, std::less<>>> names) {
@@ -135,12 +138,21 @@ public:
         completions.push_back(std::move(completion));
     }
     std::optional<std::string> SendLinkmeterMessage(const SessionRef& session, std::uint16_t category,
-                                                    std::uint16_t type, const Dictionary& payload) override {
+                                                    std::uint16_t type, const Dictionary& payload,
+                                                    std::string_view leftOut) override {
         if (sendFailure || session == nullptr) {
             return sendFailure;
         }
-        static_cast<FakeSession&>(*session).messages.push_back({category, type, payload});
+        Dictionary sent = payload;
+        if (!leftOut.empty()) {
+            sent.remove(leftOut);
+        }
+        static_cast<FakeSession&>(*session).messages.push_back({category, type, std::move(sent)});
         return std::nullopt;
+    }
+    bool trySendLinkmeterMessage(const SessionRef& session, std::uint16_t category, std::uint16_t type,
+                                 const Dictionary& payload, std::string_view leftOut) override {
+        return !sendFailure && !SendLinkmeterMessage(session, category, type, payload, leftOut);
     }
     void FlushMessages(const SessionRef& session) override { ++static_cast<FakeSession&>(*session).flushes; }
 

@@ -1,5 +1,5 @@
+#include "platform/linux/settings/LinuxPreferences.h"
 #include "platform/linux/sinks/AppendOnlyFile.h"
-#include "platform/linux/sinks/LinuxAnalyticsEventService.h"
 #include "platform/linux/sinks/LinuxReportFiles.h"
 #include "tests/fakes/FakeWorkQueues.h"
 #include "tests/platform/LinuxServiceSupport.h"
@@ -7,6 +7,7 @@
 #include <future>
 #include <map>
 #include <new>
+#include <random>
 #include <set>
 #include <thread>
 #include <tuple>
@@ -309,72 +310,6 @@ TEST_F(AppendOnlyFileTest, KeepsLinesWholeWhenThreadsAppendAndFilesRotate) {
         ++counts[line];
     }
     EXPECT_THAT(counts, ElementsAre(Pair("another's", kLines), Pair("from one", kLines)));
-}
-
-class LinuxAnalyticsEventServiceTest : public Test {
-protected:
-    void useEvents(const Value& patterns) {
-        preferences_.setPreferenceValue("events_in_use", "com.vandra.tamblo.analytics", patterns);
-    }
-
-    TemporaryDirectory directory_;
-    FakeLog log_;
-    LinuxPreferences preferences_{directory_.path(), log_};
-    FakeClock clock_;
-    SinkFiles sinks_{directory_.path(), log_};
-    LinuxAnalyticsEventService events_{sinks_, clock_, preferences_, log_};
-};
-
-TEST_F(LinuxAnalyticsEventServiceTest, AnswersWhichEventsAreInUse) {
-    const struct {
-        Value patterns;
-        const char *inUse, *notInUse;
-    } cases[] = {
-        {Array{"a.b", "c.*"}, "a.b c. c.d", "a.bc a c cd"},
-        {Array{"*"}, "a x", ""},
-        {Array{}, "", "a.b c.d"},
-        {Array{"a*", "a.b*c", "*d"}, "a a.b", "d xd"},
-        {Array{"b.c*", "b*", "ab*", "b.*", "b.a", "z"}, "b b.c b.z ab abc bz z", "a c aa zz"},
-        {"a", "a zz", ""},
-        {Array{1, "1x"}, "1x", "1 a"},
-    };
-    EXPECT_TRUE(events_.isEventInUse("a.b"));
-    for (const auto& [patterns, inUse, notInUse] : cases) {
-        useEvents(patterns);
-        for (const auto& [names, isInUse] : {std::pair(inUse, true), {notInUse, false}}) {
-            std::istringstream words(names);
-            for (std::string name; words >> name;) {
-                EXPECT_EQ(events_.isEventInUse(name), isInUse) << inUse << ": " << name;
-            }
-        }
-    }
-    preferences_.setPreferenceValue("k", "d", 1); // no news of these
-    EXPECT_TRUE(events_.isEventInUse("1x"));
-    EXPECT_THAT(log_.take(), ElementsAre(HasSubstr("analytics.json: events_in_use is no array"),
-                                         HasSubstr("analytics.json: events_in_use holds what is no name")));
-}
-
-TEST_F(LinuxAnalyticsEventServiceTest, WritesTheEventsThatAreInUse) {
-    useEvents(Array{"e1", "e\"2"});
-    Dictionary payload{{"k", 1}, {"t", "x\ny"}};
-    const auto provider = [&] { // called for events in use only, or the times below are others
-        clock_.advance(std::chrono::milliseconds(250));
-        return payload;
-    };
-    clock_.set({});
-    for (const char* name : {"e1", "e3", "e\"2"}) {
-        events_.sendEventLazy(name, provider);
-    }
-    payload.set("k", 2); // the same dictionary, another payload
-    events_.sendEventLazy("e1", provider);
-    sinks_.flush();
-    events_.sendEventLazy("e1", provider); // another message, though with the payload of the last
-    sinks_.flush();
-    EXPECT_THAT(test::linesOf(directory_.path("analytics-events.jsonl")),
-                ElementsAre(R"({"time":0.25,"event":"e1","payload":{"k":1,"t":"x\ny"}})",
-                            R"({"time":0.25,"event":"e\"2","payload":{"k":1,"t":"x\ny"}})",
-                            R"({"time":0.75,"event":"e1","payload":{"k":2,"t":"x\ny"}})",
-                            R"({"time":1.0,"event":"e1","payload":{"k":2,"t":"x\ny"}})"));
 }
 
 class LinuxReportFilesTest : public Test {

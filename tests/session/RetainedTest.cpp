@@ -7,6 +7,7 @@
 
 #include <gtest/gtest.h>
 
+#include <array>
 #include <map>
 #include <random>
 #include <string>
@@ -83,6 +84,37 @@ TEST_F(RetainedTest, BeyondTheLimitOfAllTheUserWhoHasMostLosesAndNoSessionThatSt
     EXPECT_EQ(all().bytes(), 0U);
 }
 
+TEST_F(RetainedTest, NothingIsTakenFromASessionWhoseMessagesAllGo) {
+    device.services().limits.retainedBytesOfUser = 4U << 20U;
+    device.services().limits.retainedBytes = 8U << 20U;
+    const auto leaving = sessionOf(1);
+    const auto next = sessionOf(1);
+    next->start();
+    send(*leaving, 6000, 10);
+    ASSERT_FALSE(leaving->letGoSome());
+    send(*next, 6000, 1000);
+    EXPECT_EQ(leaving->messages().size(), 1000U);
+    EXPECT_GT(next->droppedMessageCount(), 0U);
+    EXPECT_TRUE(leaving->letGoSome());
+    next->stop();
+    EXPECT_LT(all().bytes(), 10'000U);
+}
+
+TEST_F(RetainedTest, RepetitionsCostTheBudgetNothingWhateverTheirKeys) {
+    const auto session = sessionOf(1);
+    const auto repeat = [&](int rounds) {
+        for (int i = 0; i < 40 * rounds; ++i) {
+            Dictionary payload{{formatted("kind{}", i % 40), "the same"}, {"common", 1}};
+            session->sendMessage(messageOf(std::move(payload), 14, AudioEventType(100 + i % 40)));
+        }
+    };
+    repeat(3);
+    const std::size_t before = all().bytes();
+    repeat(200);
+    EXPECT_LE(all().bytes(), before);
+    EXPECT_EQ(session->messages().size(), 40U);
+}
+
 TEST_F(RetainedTest, MemoryIsGivenBackOnceMuchOfItIsFree) {
     device.services().limits.retainedBytesOfUser = device.services().limits.retainedBytes = 100U << 20U;
     for (const int sessionsOfMebibytes : {4, 20}) {
@@ -126,9 +158,13 @@ TEST(PreviousValues, AreTheLatestOfEachKey) {
                 payload.setValueAt(k, below(3) == 0 ? Value(std::string(below(90), 'v')) : Value(i));
                 model.insert_or_assign(std::string(payload.keyAt(k)), payload.valueAt(k));
             }
-            values.take(payload, payload.bytesOfValues(Dictionary::Shared::inFull));
+            values.take(payload, payload.bytesOfValues(Dictionary::Shared::inFull), false);
             if (i % 97 == 0) {
                 ASSERT_EQ(values.values(), Dictionary::fromMap(model));
+                const std::string_view one = i % 2 == 0 ? "k7" : "k150";
+                const auto found = model.find(one);
+                ASSERT_EQ(values.valuesOf(std::array{one, std::string_view("none")}),
+                          (found != model.end() ? Dictionary{{one, found->second}} : Dictionary()));
             }
         }
         values.clear();
@@ -139,12 +175,14 @@ TEST(PreviousValues, AreTheLatestOfEachKey) {
 TEST(PreviousValues, RememberSoManyKeysAndNoMore) {
     PreviousValues values(100);
     for (int i = 0; i < 500; ++i) {
-        values.take({{formatted("k{}", i), i}, {"common", i}}, 100);
+        values.take({{formatted("k{}", i), i}, {"common", i}}, 100, false);
     }
     const Dictionary remembered = values.values();
     EXPECT_EQ(remembered.size(), 100U);
     EXPECT_EQ(*remembered.find("common"), Value(499));
     EXPECT_EQ(*remembered.find("k0"), Value(0));
+    EXPECT_EQ(values.valuesOf(std::array<std::string_view, 3>{"k499", "common", "k0"}),
+              (Dictionary{{"common", 499}, {"k0", 0}}));
     EXPECT_TRUE(values.isFull());
 }
 

@@ -1,3 +1,5 @@
+#include "session/MessageIntake.h"
+#include "session/MessageSort.h"
 #include "tests/fakes/FakePlatform.h"
 #include "tests/fakes/Messages.h"
 #include "tests/session/ScriptedWorkers.h"
@@ -7,7 +9,9 @@
 
 #include <algorithm>
 #include <cmath>
+#include <optional>
 #include <random>
+#include <utility>
 
 namespace tamblo {
 namespace {
@@ -268,6 +272,64 @@ TEST_F(SessionTest, ATagReplacesTheClientsHoweverManyThereAre) {
         ASSERT_EQ(message->payload().find("audiotag")->stringValue(),
                   ZRReportingUtilityCategoryString(message->category()) + "State");
     }
+}
+
+TEST_F(SessionTest, WhatIsDoneAtOnceIsWhatIsDoneStepByStep) {
+    intake::Normaliser normaliser;
+    const double now = device.clock.seconds();
+    constexpr double kYear = 31'536'000;
+    const std::optional<Value> timestamps[] = {
+        std::nullopt, now, now - 4e7, "soon", NAN, now - kYear, now - kYear - 1e-3, now - kYear + 0.015};
+    const std::optional<Value> names[] = {std::nullopt, "mine", "Unknown", 5,
+                                          "a name that is somewhat longer"};
+    const std::optional<Value> tags[] = {std::nullopt, "mine"};
+    for (const char* other : {"", "Z", "audio", "b c", "zz"}) {
+        for (int i = 0; i < 80; ++i) {
+            const std::pair<const char*, std::optional<Value>> entries[] = {
+                {"zrreporting_timestamp", timestamps[i % 8]},
+                {"HostApplicationDisplayID", names[i / 8 % 5]},
+                {"audiotag", tags[i / 40]}};
+            Dictionary sent{{other, "a text that lies in a block"}};
+            for (const auto& [key, value] : entries) {
+                if (value) {
+                    sent.set(key, *value);
+                }
+            }
+            Dictionary expected = sent;
+            intake::addMissingDates(expected, device.clock.now());
+            intake::removeWhiteSpaceFromKeys(expected);
+            intake::addAudioMessageTag(expected, "the tag");
+            intake::addAppName(expected, "an application");
+            for (int round = 0; round < 2; ++round) {
+                Dictionary payload = sent;
+                normaliser.normalise(payload, "the tag", "an application", device.clock);
+                EXPECT_EQ(payload, expected);
+            }
+        }
+    }
+}
+
+TEST_F(SessionTest, TheSortInPartsIsStable) {
+    std::vector<MessageRef> messages;
+    std::mt19937 random(3);
+    for (int i = 0; i < 70'000; ++i) {
+        Dictionary payload{{"zrreporting_timestamp", static_cast<double>(random() % 50)}};
+        payload.set(i % 3 == 0 ? "a" : "b", i);
+        messages.push_back(messageOf(std::move(payload)));
+    }
+    std::vector<MessageRef> expected = messages;
+    std::stable_sort(expected.begin(), expected.end(), [](const MessageRef& one, const MessageRef& other) {
+        return intake::epochTime(one->payload()) < intake::epochTime(other->payload());
+    });
+    MessageSort sort(messages);
+    while (!sort.sortSome()) {
+    }
+    EXPECT_TRUE(sort.hasChanged());
+    EXPECT_TRUE(messages == expected);
+    const std::vector<const KeySet*> keySets = sort.takeKeySets();
+    EXPECT_TRUE(std::equal(
+        keySets.begin(), keySets.end(), messages.begin(), messages.end(),
+        [](const KeySet* keys, const MessageRef& message) { return keys == &message->payload().keys(); }));
 }
 
 /// What a walk over the session's list from its end says.

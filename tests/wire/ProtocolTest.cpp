@@ -10,6 +10,7 @@
 #include <cstdint>
 #include <limits>
 #include <string>
+#include <utility>
 #include <vector>
 
 namespace tamblo::wire {
@@ -84,7 +85,8 @@ TEST(Request, WhatIsRefusedNamesItsReason) {
     };
     KeySetCache keySets;
     Request request;
-    for (const auto& [code, id, mentions, hex] : cases) {
+    const auto expectRefused = [&](const auto& refused, const std::string& hex) {
+        const auto& [code, id, mentions, same] = refused;
         SCOPED_TRACE(hex);
         const auto refusal = decodeRequest(fromHex(hex), keySets, request);
         ASSERT_TRUE(refusal);
@@ -92,6 +94,32 @@ TEST(Request, WhatIsRefusedNamesItsReason) {
         EXPECT_EQ(refusal->id, id);
         EXPECT_EQ(refusal->endsConnection, code == kNotWellFormed);
         EXPECT_THAT(refusal->error.message, testing::HasSubstr(mentions));
+    };
+    for (const auto& refused : cases) {
+        expectRefused(refused, refused.hex);
+        // With the id as the client library writes it.
+        if (refused.hex.starts_with(send)) {
+            expectRefused(refused, "84 00 1b 0000000000000005 " + refused.hex.substr(9));
+        }
+    }
+}
+
+TEST(Request, CountsTheSameHoweverItsIdIsWritten) {
+    const std::string rest =
+        " 6b 73656e644d657373616765 84 a2 61 6b 67 6120746578742e 61 6c 82 01 02 01 02 81 07";
+    const auto decoded = [&rest](const std::string& head, std::size_t limit) {
+        KeySetCache keySets;
+        Request request;
+        const bool isRefused =
+            decodeRequest(fromHex(head + rest), keySets, request, {.values = {.decodedBytes = limit}})
+                .has_value();
+        return std::pair(isRefused, request.decodedBytes);
+    };
+    const std::size_t bytes = decoded("84 00 05", 10'000).second;
+    ASSERT_GT(bytes, 100U);
+    for (const std::size_t limit : {bytes - 1, bytes, bytes + 1}) {
+        EXPECT_EQ(decoded("84 00 1b 0000000000000005", limit), decoded("84 00 05", limit));
+        EXPECT_EQ(decoded("84 00 05", limit).first, limit < bytes);
     }
 }
 

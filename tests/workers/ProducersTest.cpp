@@ -146,6 +146,17 @@ TEST_F(ProducersTest, SummariesAreSentAtTheStopAndSomeToSomeWorkersOnly) {
     session->stop();
     EXPECT_THAT(device.analyticsEvents.payloads("com.vandra.tamblo.Volume.Summary"), SizeIs(2));
 
+    // A message that is nothing to a worker by itself is, once it has taken in another one.
+    session->start();
+    for (const char* payload : {"0 devices=A", "1 feature", "1.5 devices=B", "1.7 other",
+                                "2 spatial group=1 out", "3 other", "20 length=9 out=false group=0"}) {
+        send(payloadOf(payload, device.clock.seconds()));
+    }
+    session->stop();
+    const auto groups = device.analyticsEvents.payloads("com.vandra.tamblo.Kaleen.Summary");
+    ASSERT_THAT(groups, SizeIs(1));
+    EXPECT_EQ(shown(groups[0], {"play_seconds"}), "18.5");
+
     session = makeSession();
     const Messages messages = messagesOf("0 out in volume=0.5 group=1; 10 length=75");
     EXPECT_THAT(volume(messages, 0s, nullptr), IsEmpty());

@@ -334,6 +334,8 @@ TEST_F(RtcWorkerTest, DescribesTheSessionToTheService) {
 TEST_F(RtcWorkerTest, SetsUpThenSendsInOrderWhateverComesOfIt) {
     const Played cases[] = {
         {"what is handed in meanwhile follows", "start 1 run 2 run", "+/1"},
+        {"at once where nothing waits", "start run found 1", "1+/0"},
+        {"else behind what waits", "start 1 run found 2 run 3", "123+/0"},
         {"back ends at the last moment", "start 1 run 2 run stop run 8999ms found 9000ms run", "12s[1,2]f/0"},
         {"no back ends", "start 1 run 2 run stop run none run", "+/0e"},
         {"none, and too late", "start 1 run 2 run stop run 9000ms none run", "/0e"},

@@ -5,6 +5,7 @@
 
 #include <array>
 #include <cstddef>
+#include <cstdint>
 #include <span>
 #include <string_view>
 
@@ -26,6 +27,17 @@ public:
         for (std::size_t i = 0; i < kCount; ++i) {
             values_[i] = found[i] != KeyPlaces::kAbsent ? &values[found[i]] : nullptr;
         }
+    }
+
+    /// Whether any field but the first is among these keys. The first is the timestamp, which tells nothing
+    /// of what a message is about.
+    [[nodiscard]] static bool anyIn(const KeySet& keys, KeyPlaces& places) {
+        const KeyPlaces::Places& found = places.in(keys);
+        std::uint32_t all = KeyPlaces::kAbsent;
+        for (std::size_t i = 1; i < kCount; ++i) {
+            all &= found[i]; // which has all bits only if each of them has
+        }
+        return all != KeyPlaces::kAbsent;
     }
 
     [[nodiscard]] const Value* operator[](Field field) const noexcept {

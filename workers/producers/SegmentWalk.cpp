@@ -20,6 +20,23 @@ double secondsOf(const Value* timestamp) noexcept {
     return timestamp != nullptr ? timestamp->doubleValue() : 0.0;
 }
 
+/// The texts of all buckets of a table, made once.
+template <std::size_t Count> class BucketTexts {
+public:
+    BucketTexts(const std::array<double, Count>& buckets, unsigned fractionDigits) : buckets_(buckets) {
+        std::transform(buckets.begin(), buckets.end(), texts_.begin(), [&](double bucket) {
+            return Value(*ZRReportingUtilityBucketNumberToString(bucket, buckets, fractionDigits));
+        });
+    }
+    [[nodiscard]] const Value& of(double number) const noexcept {
+        return texts_[*nearestBucket(number, buckets_)];
+    }
+
+private:
+    const std::array<double, Count>& buckets_;
+    std::array<Value, Count> texts_;
+};
+
 } // namespace
 
 Seconds SegmentStart::until(const Value* timestamp) const noexcept {
@@ -62,12 +79,14 @@ Value singleSeconds(Seconds length) noexcept {
     return static_cast<float>(std::max(length.count(), -kMost));
 }
 
-Value bucketText(double number, std::span<const double> buckets, unsigned fractionDigits) {
-    return ZRReportingUtilityBucketNumberToString(number, buckets, fractionDigits).value_or("");
+Value volumeBucketText(double volume) {
+    static const BucketTexts texts(kVolumeBuckets, 4);
+    return texts.of(volume);
 }
 
 Value timeBucketText(Seconds length) {
-    return bucketText(length.count(), kTimeBuckets, 0);
+    static const BucketTexts texts(kTimeBuckets, 0);
+    return texts.of(length.count());
 }
 
 DerivedMessages::DerivedMessages(const SegmentWords& words) : words_(words) {
@@ -95,12 +114,8 @@ void DerivedMessages::skip() const {
                words_.function, count());
 }
 
-std::vector<MessageRef> DerivedMessages::take() {
-    for (const MessageRef& message : messages_) {
-        message->editPayload(
-            [this](Dictionary& payload) { payload.set(kMessageCountKey, messages_.size()); });
-    }
-    return std::exchange(messages_, {});
+void addCount(ZRReportingSessionMessage& message, std::size_t count) {
+    message.editPayload([count](Dictionary& payload) { payload.set(kMessageCountKey, count); });
 }
 
 std::unique_ptr<RapidMessages> rapidSpatialAudioSettings(Seconds longestPause) {
@@ -109,8 +124,9 @@ std::unique_ptr<RapidMessages> rapidSpatialAudioSettings(Seconds longestPause) {
     return std::make_unique<RapidMessages>(kSettings, longestPause);
 }
 
-Dictionary previousValuesOf(const std::shared_ptr<ZRReportingSession>& session) {
-    return session != nullptr ? session->previousValues() : Dictionary();
+Dictionary previousValuesOf(const std::shared_ptr<ZRReportingSession>& session,
+                            std::span<const std::string_view> keys) {
+    return session != nullptr ? session->previousValuesOf(keys) : Dictionary();
 }
 
 std::optional<Value> applicationOf(const std::shared_ptr<ZRReportingSession>& session) {
@@ -132,10 +148,12 @@ DerivedSending::DerivedSending(ZRReportingSession& session, std::string_view wha
 }
 
 bool DerivedSending::sendSome(ZRReportingSession& session) {
-    constexpr std::size_t kMessagesOfPart = 500;
+    constexpr std::size_t kMessagesOfPart = 250;
     const std::size_t end = std::min(derived_.size(), sent_ + kMessagesOfPart);
-    for (; sent_ < end; ++sent_) {
-        session.sendMessage(derived_[sent_]);
+    while (sent_ < end) {
+        const MessageRef message = std::move(derived_[sent_++]);
+        addCount(*message, derived_.size());
+        session.sendMessage(message);
     }
     return sent_ == derived_.size();
 }

@@ -31,6 +31,8 @@ inline constexpr std::string_view kUnknownSetting = "unknown";
 /// The place of a summary among those of the same walk, from 1, and how many of them there are.
 inline constexpr std::string_view kMessageIndexKey = "msgidx";
 inline constexpr std::string_view kMessageCountKey = "msgcnt";
+/// What stands under the latter until the walk is over.
+inline constexpr std::uint64_t kCountedLater = 0;
 
 /// Where a segment began: the timestamp of the message that opened it, null while there is none.
 class SegmentStart {
@@ -54,8 +56,8 @@ private:
 
 /// A length of time as summaries carry it, in single precision.
 [[nodiscard]] Value singleSeconds(Seconds length) noexcept;
-/// The class that a number falls into.
-[[nodiscard]] Value bucketText(double number, std::span<const double> buckets, unsigned fractionDigits);
+/// The class that a volume, or a length of time, falls into.
+[[nodiscard]] Value volumeBucketText(double volume);
 [[nodiscard]] Value timeBucketText(Seconds length);
 
 /// How the log lines of one producer's walks name things.
@@ -80,59 +82,94 @@ public:
     /// A summary of this category.
     ZRReportingSessionMessage& add(Dictionary payload, AudioEventCategory category);
     void skip() const;
-    /// All of them, each now knowing how many there are.
-    [[nodiscard]] std::vector<MessageRef> take();
+    /// All of them, which are yet to be told how many there are.
+    [[nodiscard]] std::vector<MessageRef> take() noexcept { return std::move(messages_); }
 
 private:
     const SegmentWords& words_;
     std::vector<MessageRef> messages_;
 };
 
+/// Tells one of the messages of a walk how many there are.
+void addCount(ZRReportingSessionMessage& message, std::size_t count);
+
 /// What folds bursts of the two spatial-audio settings.
 [[nodiscard]] std::unique_ptr<RapidMessages> rapidSpatialAudioSettings(Seconds longestPause);
 
-/// What a walk begins with: what the session's earlier runs left, nothing once the session is gone.
-[[nodiscard]] Dictionary previousValuesOf(const std::shared_ptr<ZRReportingSession>& session);
+/// What a walk begins with under its keys: what the session's earlier runs left, nothing once the session is
+/// gone.
+[[nodiscard]] Dictionary previousValuesOf(const std::shared_ptr<ZRReportingSession>& session,
+                                          std::span<const std::string_view> keys);
 /// The application that the session's summaries name; none once the session is gone.
 [[nodiscard]] std::optional<Value> applicationOf(const std::shared_ptr<ZRReportingSession>& session);
 
 /// A walk and what it derives of messages, bursts folded where that is asked for; a part at a time, since a
-/// session may have hundreds of thousands. The messages must not change in between.
+/// session may have hundreds of thousands. The messages must not change in between. Most of them do not
+/// concern a walk, which their keys tell.
 template <typename Walk> class Derivation {
 public:
-    /// Messages that are looked at in one part.
-    static constexpr std::size_t kMessagesOfPart = 10'000;
+    /// A part ends once it has looked at so many messages, walked over so many, or derived so many.
+    static constexpr std::size_t kMostLookedAt = 10'000;
+    static constexpr std::size_t kMostWalked = 2'000;
+    static constexpr std::size_t kMostDerived = 500;
 
     explicit Derivation(Walk walk, std::unique_ptr<RapidMessages> rapid = nullptr)
         : walk_(std::move(walk)), rapid_(std::move(rapid)) {}
 
-    /// Does the next part. Whether all is done.
-    [[nodiscard]] bool deriveSome(std::span<const MessageRef> messages) {
+    /// Does the next part. `keySets` are those of the first messages, or of none. Whether all is done.
+    [[nodiscard]] bool deriveSome(std::span<const MessageRef> messages, std::span<const KeySet*> keySets) {
         if (rapid_ && folded_ < messages.size()) {
-            for (const std::size_t end = endOfPart(folded_, messages.size()); folded_ < end; ++folded_) {
-                rapid_->add(*messages[folded_]);
-            }
+            foldSome(messages, keySets);
             return false;
         }
-        const std::size_t count = rapid_ ? rapid_->result().size() : messages.size();
-        for (const std::size_t end = endOfPart(walked_, count); walked_ < end; ++walked_) {
-            walk_.take((rapid_ ? rapid_->result()[walked_] : messages[walked_].get())->payload());
+        const std::size_t end = endOfPart(looked_, messages.size());
+        const std::size_t mostDerived = walk_.derivedCount() + kMostDerived;
+        for (std::size_t walked = 0;
+             looked_ < end && walked < kMostWalked && walk_.derivedCount() < mostDerived; ++looked_) {
+            if (takenInSeen_ < takenIn_.size() && takenIn_[takenInSeen_] == looked_) {
+                ++takenInSeen_;
+            } else if (walk_.isConcernedBy(keysOf(messages, keySets, looked_))) {
+                walk_.take(messages[looked_]->payload());
+                ++walked;
+            }
         }
-        return walked_ == count;
+        return looked_ == messages.size();
     }
     /// What was derived of all.
     [[nodiscard]] std::vector<MessageRef> finish() { return walk_.finish(); }
     [[nodiscard]] std::size_t derivedCount() const noexcept { return walk_.derivedCount(); }
 
 private:
+    void foldSome(std::span<const MessageRef> messages, std::span<const KeySet*> keySets) {
+        const std::size_t end = endOfPart(folded_, messages.size());
+        for (std::size_t added = 0; folded_ < end && added < kMostWalked; ++folded_) {
+            if (!rapid_->concerns(keysOf(messages, keySets, folded_))) {
+                continue;
+            }
+            ++added;
+            const std::optional<std::size_t> taking = rapid_->add(messages, folded_);
+            if (taking) {
+                takenIn_.push_back(folded_);
+                if (*taking < keySets.size()) {
+                    keySets[*taking] = &messages[*taking]->payload().keys();
+                }
+            }
+        }
+    }
+    [[nodiscard]] static const KeySet& keysOf(std::span<const MessageRef> messages,
+                                              std::span<const KeySet*> keySets, std::size_t place) noexcept {
+        return place < keySets.size() ? *keySets[place] : messages[place]->payload().keys();
+    }
     [[nodiscard]] static std::size_t endOfPart(std::size_t begin, std::size_t count) noexcept {
-        return std::min(count, begin + kMessagesOfPart);
+        return std::min(count, begin + kMostLookedAt);
     }
 
     Walk walk_;
     std::unique_ptr<RapidMessages> rapid_; ///< null: nothing is folded
     std::size_t folded_ = 0;
-    std::size_t walked_ = 0;
+    std::vector<std::size_t> takenIn_; ///< places of messages that were folded into earlier ones
+    std::size_t takenInSeen_ = 0;
+    std::size_t looked_ = 0;
 };
 
 /// The least length of a segment that is reported of the session.
@@ -142,9 +179,13 @@ private:
 template <typename Walk>
 [[nodiscard]] std::vector<MessageRef> derivedBy(Derivation<Walk> derivation,
                                                 std::span<const MessageRef> messages) {
-    while (!derivation.deriveSome(messages)) {
+    while (!derivation.deriveSome(messages, {})) {
     }
-    return derivation.finish();
+    std::vector<MessageRef> derived = derivation.finish();
+    for (const MessageRef& message : derived) {
+        addCount(*message, derived.size());
+    }
+    return derived;
 }
 
 /// The next part of what is left to do of a producer's stop; whether all is done.
@@ -180,7 +221,7 @@ template <typename Walk>
             (void)owner->holdsDerived(sending->leftCount());
             return isDone;
         }
-        const bool isDone = derivation->deriveSome(owner->messages());
+        const bool isDone = derivation->deriveSome(owner->messages(), owner->keySetsAtStop());
         // Where there is no room for more, what the rest would have added is left out.
         if (!owner->holdsDerived(derivation->derivedCount()) || isDone) {
             sending.emplace(*owner, what, derivation->finish());

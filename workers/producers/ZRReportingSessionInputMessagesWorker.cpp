@@ -7,6 +7,7 @@
 #include "util/ReportingUtilities.h"
 #include "workers/producers/PayloadFields.h"
 #include "workers/producers/SegmentWalk.h"
+#include "workers/producers/SummaryKeys.h"
 
 #include <memory>
 #include <optional>
@@ -76,6 +77,9 @@ public:
         state_.merge(Fields(previousValues_, places_));
     }
 
+    /// Whether a message of these keys can change anything.
+    [[nodiscard]] bool isConcernedBy(const KeySet& keys) { return Fields::anyIn(keys, places_); }
+
     void take(const Dictionary& payload) {
         const Fields message(payload, places_);
         const bool wasRunning = state_.isTrue(Field::running);
@@ -143,13 +147,16 @@ private:
     }
 
     [[nodiscard]] Dictionary summary(Seconds runningTime) const {
-        Dictionary payload{{ZRReportingApplicationName, *process_},
-                           {"inputrunning_seconds", singleSeconds(runningTime)},
-                           {"inputrunning_secondsBucketed", timeBucketText(runningTime)},
-                           {kMessageIndexKey, derived_.nextIndex()},
-                           {kOperationModeKey, *state_[Field::operationMode]},
-                           {kInputPortKey, *state_[Field::inputPort]},
-                           {kActiveDevicesKey, *state_[Field::devices]}};
+        SummaryKeys<8>::Entries entries{{{ZRReportingApplicationName, *process_},
+                                         {"inputrunning_seconds", singleSeconds(runningTime)},
+                                         {"inputrunning_secondsBucketed", timeBucketText(runningTime)},
+                                         {kMessageIndexKey, derived_.nextIndex()},
+                                         {kOperationModeKey, *state_[Field::operationMode]},
+                                         {kInputPortKey, *state_[Field::inputPort]},
+                                         {kActiveDevicesKey, *state_[Field::devices]},
+                                         {kMessageCountKey, kCountedLater}}};
+        static const SummaryKeys keys(entries);
+        Dictionary payload = keys.payload(entries);
         if (!vocoders_.empty()) {
             payload.set("vocoders", joined(vocoders_));
         }
@@ -171,7 +178,7 @@ private:
 /// One walk for the session, with bursts folded.
 Derivation<InputWalk> walk(const std::shared_ptr<ZRReportingSession>& session, std::optional<Value> process,
                            Seconds minimum) {
-    return Derivation(InputWalk(previousValuesOf(session), std::move(process), minimum),
+    return Derivation(InputWalk(previousValuesOf(session, kKeys), std::move(process), minimum),
                       rapidSpatialAudioSettings(kLongestPauseInBurst));
 }
 

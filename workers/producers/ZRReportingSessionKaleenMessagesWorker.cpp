@@ -7,6 +7,7 @@
 #include "util/MessageKeys.h"
 #include "workers/producers/PayloadFields.h"
 #include "workers/producers/SegmentWalk.h"
+#include "workers/producers/SummaryKeys.h"
 
 #include <functional>
 #include <memory>
@@ -92,6 +93,12 @@ public:
         }
     }
 
+    /// Whether a message of these keys can change anything. Any message opens a segment where playback in a
+    /// group has none, as the one before told no time.
+    [[nodiscard]] bool isConcernedBy(const KeySet& keys) {
+        return Fields::anyIn(keys, places_) || (!start_.isKnown() && isPlaying_ && isInGroup_);
+    }
+
     void take(const Dictionary& payload) {
         const Fields message(payload, places_);
         const bool wasInGroupPlayback = state_.isTrue(Field::running) && isInGroup(state_);
@@ -141,13 +148,17 @@ private:
     }
 
     [[nodiscard]] Dictionary summary(Seconds playingTime) const {
-        return {{kSelectedFormatKey, coalesceKey(Field::format, kSelectedFormatKey)},
-                {kActiveDevicesKey, coalesceKey(Field::devices, kActiveDevicesKey)},
-                {kFormatIDKey, coalesceKey(Field::formatID, kFormatIDKey)},
-                {kChannelsPerFrameKey, coalesceKey(Field::channels, kChannelsPerFrameKey)},
-                {"play_seconds", singleSeconds(playingTime)},
-                {"play_secondsBucketed", timeBucketText(playingTime)},
-                {kMessageIndexKey, derived_.nextIndex()}};
+        SummaryKeys<8>::Entries entries{
+            {{kSelectedFormatKey, coalesceKey(Field::format, kSelectedFormatKey)},
+             {kActiveDevicesKey, coalesceKey(Field::devices, kActiveDevicesKey)},
+             {kFormatIDKey, coalesceKey(Field::formatID, kFormatIDKey)},
+             {kChannelsPerFrameKey, coalesceKey(Field::channels, kChannelsPerFrameKey)},
+             {"play_seconds", singleSeconds(playingTime)},
+             {"play_secondsBucketed", timeBucketText(playingTime)},
+             {kMessageIndexKey, derived_.nextIndex()},
+             {kMessageCountKey, kCountedLater}}};
+        static const SummaryKeys keys(entries);
+        return keys.payload(entries);
     }
 
     Dictionary previousValues_;
@@ -166,7 +177,7 @@ private:
 Derivation<KaleenWalk> walk(const Context& context, const std::shared_ptr<ZRReportingSession>& session,
                             Seconds minimum) {
     return Derivation(
-        KaleenWalk(previousValuesOf(session), minimum, destinations(context.isInternalBuild())));
+        KaleenWalk(previousValuesOf(session, kKeys), minimum, destinations(context.isInternalBuild())));
 }
 
 } // namespace

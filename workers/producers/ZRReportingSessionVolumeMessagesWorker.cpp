@@ -3,9 +3,9 @@
 #include "session/ZRReportingSession.h"
 #include "util/Log.h"
 #include "util/MessageKeys.h"
-#include "util/SummaryBuckets.h"
 #include "workers/producers/PayloadFields.h"
 #include "workers/producers/SegmentWalk.h"
+#include "workers/producers/SummaryKeys.h"
 
 #include <memory>
 #include <optional>
@@ -79,6 +79,9 @@ public:
         }
     }
 
+    /// Whether a message of these keys can change anything.
+    [[nodiscard]] bool isConcernedBy(const KeySet& keys) { return Fields::anyIn(keys, places_); }
+
     void take(const Dictionary& payload) {
         const Fields message(payload, places_);
         const bool wasRunning = state_.isTrue(Field::running);
@@ -132,19 +135,23 @@ private:
 
     [[nodiscard]] Dictionary summary(Seconds playingTime) const {
         const Value& volume = *state_[Field::volume];
-        return {{kSelectedFormatKey, *state_[Field::format]},
-                {kFormatIDKey, *state_[Field::formatID]},
-                {kActiveDevicesKey, *state_[Field::devices]},
-                {ZRReportingApplicationName, *process_},
-                {kVolumeKey, volume},
-                {"QVSessionVolumeBucketed", bucketText(volume.doubleValue(), kVolumeBuckets, 4)},
-                {"play_seconds", singleSeconds(playingTime)},
-                {ZRReportingMessageKeySpatialAudioAccessoryFeature, *state_[Field::spatialFeature]},
-                {kSpatializationEnabledKey, *state_[Field::spatialized]},
-                {kRingerStateKey, *state_[Field::ringer]},
-                {kChannelsPerFrameKey, *state_[Field::channels]},
-                {"play_secondsBucketed", timeBucketText(playingTime)},
-                {kMessageIndexKey, derived_.nextIndex()}};
+        SummaryKeys<14>::Entries entries{
+            {{kSelectedFormatKey, *state_[Field::format]},
+             {kFormatIDKey, *state_[Field::formatID]},
+             {kActiveDevicesKey, *state_[Field::devices]},
+             {ZRReportingApplicationName, *process_},
+             {kVolumeKey, volume},
+             {"QVSessionVolumeBucketed", volumeBucketText(volume.doubleValue())},
+             {"play_seconds", singleSeconds(playingTime)},
+             {ZRReportingMessageKeySpatialAudioAccessoryFeature, *state_[Field::spatialFeature]},
+             {kSpatializationEnabledKey, *state_[Field::spatialized]},
+             {kRingerStateKey, *state_[Field::ringer]},
+             {kChannelsPerFrameKey, *state_[Field::channels]},
+             {"play_secondsBucketed", timeBucketText(playingTime)},
+             {kMessageIndexKey, derived_.nextIndex()},
+             {kMessageCountKey, kCountedLater}}};
+        static const SummaryKeys keys(entries);
+        return keys.payload(entries);
     }
 
     Dictionary previousValues_;
@@ -161,7 +168,7 @@ private:
 /// One walk for the session, with bursts folded.
 Derivation<VolumeWalk> walk(const std::shared_ptr<ZRReportingSession>& session, std::optional<Value> process,
                             Seconds minimum) {
-    return Derivation(VolumeWalk(previousValuesOf(session), std::move(process), minimum),
+    return Derivation(VolumeWalk(previousValuesOf(session, kKeys), std::move(process), minimum),
                       rapidSpatialAudioSettings(kLongestPauseInBurst));
 }
 

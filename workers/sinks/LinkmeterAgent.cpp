@@ -41,6 +41,22 @@ LinkmeterAgent::Messages::~Messages() {
     all.count.fetch_sub(bytes, std::memory_order_relaxed);
 }
 
+/// Counts a piece for as long as it is there, whatever becomes of it.
+class LinkmeterAgent::CountedPiece {
+public:
+    explicit CountedPiece(LinkmeterAgent& agent) noexcept : agent_(&agent) { ++agent.posted_; }
+    CountedPiece(CountedPiece&& other) noexcept : agent_(std::exchange(other.agent_, nullptr)) {}
+    CountedPiece& operator=(CountedPiece&&) = delete;
+    ~CountedPiece() {
+        if (agent_ != nullptr) {
+            --agent_->posted_;
+        }
+    }
+
+private:
+    LinkmeterAgent* agent_;
+};
+
 LinkmeterAgent::LinkmeterAgent(Context& context)
     : context_(context), waiting_(context.shared<WaitingBytes>()) {}
 
@@ -50,7 +66,7 @@ template <typename Piece> void LinkmeterAgent::post(Piece piece, Pace pace) {
             context_.platform().workQueues->makeSerialQueue("com.vandra.tamblo.session.linkmeter");
     }
     linkmeterQueue_->post(
-        [self = shared_from_this(), piece = std::move(piece)]() mutable {
+        [self = shared_from_this(), piece = std::move(piece), counted = CountedPiece(*this)]() mutable {
             if (!self->isDropped_) {
                 piece(*self);
             }
@@ -69,33 +85,37 @@ void LinkmeterAgent::start(Dictionary sessionInfo, Dictionary userInfo) {
              LinkmeterAgent& agent) mutable { agent.setUp(std::move(sessionInfo), userInfo); });
 }
 
-void LinkmeterAgent::send(Message message) {
-    MutexLock held(mutex_);
-    const bool isFirst = toSend_ == nullptr;
-    if (isFirst) {
-        toSend_ = std::make_shared<Messages>(waiting_);
-    }
-    if (isSetUp_ || addWaiting(message)) {
-        toSend_->list.push_back(std::move(message));
-    }
-    if (isFirst) {
-        const std::shared_ptr<Messages> messages = toSend_;
-        held.unlock();
-        post([messages](LinkmeterAgent& agent) { agent.sendAll(messages); });
+void LinkmeterAgent::send(const Dictionary& payload, AudioEventCategory category, AudioEventType type) {
+    const bool isIdle = isSetUp_ && posted_ == 0;
+    if (!isIdle || !sendAtOnce(payload, category, type)) {
+        queue({payload, category, type});
     }
 }
 
-bool LinkmeterAgent::addWaiting(const Message& message) {
+void LinkmeterAgent::queue(Message message) {
+    const MutexLock held(mutex_);
+    const bool isFirst = toSend_ == nullptr;
+    const std::shared_ptr<Messages> messages = isFirst ? std::make_shared<Messages>(waiting_) : toSend_;
+    if (addWaiting(*messages, message)) {
+        messages->list.push_back(std::move(message));
+    }
+    if (isFirst) {
+        post([messages](LinkmeterAgent& agent) { agent.sendAll(messages); });
+        toSend_ = messages;
+    }
+}
+
+bool LinkmeterAgent::addWaiting(Messages& messages, const Message& message) {
     const std::size_t bytes =
         sizeof(Message) + message.payload.bytesOfValues(Dictionary::Shared::inProportion);
     if (waiting_.count.fetch_add(bytes, std::memory_order_relaxed) + bytes <= kMostWaitingBytes) {
-        toSend_->bytes += bytes;
+        messages.bytes += bytes;
         return true;
     }
     waiting_.count.fetch_sub(bytes, std::memory_order_relaxed);
     if (!std::exchange(isFullTold_, true)) {
         log::error(ZRReportingSessionLinkmeterCategory(),
-                   "too many messages wait for back ends; what comes until they are found is lost");
+                   "too many messages wait to be sent; what comes while they do is lost");
     }
     return false;
 }
@@ -126,6 +146,7 @@ void LinkmeterAgent::abandon() {
 void LinkmeterAgent::setUp(Dictionary sessionInfo, const Dictionary& userInfo) {
     const LogCategory& category = ZRReportingSessionLinkmeterCategory();
     CallQualityService& service = *context_.platform().callQuality;
+    isSetUp_ = false; // the wait of the run before may have ended since the start
     log::debug(category, "entering linkmeter {}", "start");
     const std::optional<std::string> token = service.NewHierarchyToken({});
     if (!token) {
@@ -195,11 +216,11 @@ void LinkmeterAgent::timeOut(std::uint64_t waitNumber) {
     const MutexLock held(mutex_);
     if (isWaiting_ && waitNumber_ == waitNumber) {
         isWaiting_ = false;
-        isSetUp_ = true;
         // Back ends that are found later still turn the worker on. It then has no session to send to, and
         // what it sends is lost quietly; this is meant.
         log::standard(ZRReportingSessionLinkmeterCategory(), "timed out waiting for backends");
         linkmeterSession_.reset();
+        isSetUp_ = true;
         linkmeterQueue_->resume();
     }
 }
@@ -212,8 +233,9 @@ void LinkmeterAgent::sendAll(const std::shared_ptr<Messages>& messages) {
         }
     }
     for (Message& message : messages->list) {
+        const Message sent = std::move(message);
         if (linkmeterSessionStarted_) {
-            sendMessage(std::move(message));
+            sendMessage(sent.payload, sent.category, sent.type);
         } else {
             log::standard(ZRReportingSessionLinkmeterCategory(), "Session never started. {}",
                           "handleMessage");
@@ -221,25 +243,56 @@ void LinkmeterAgent::sendAll(const std::shared_ptr<Messages>& messages) {
     }
 }
 
-void LinkmeterAgent::sendMessage(Message message) {
-    const LogCategory& category = ZRReportingSessionLinkmeterCategory();
-    log::debug(category, "entering linkmeter {}", "_sendMessage");
-    if (!context_.isInternalBuild()) {
-        message.payload.remove(ZRReportingInternalEventEpochTime);
+bool LinkmeterAgent::sendAtOnce(const Dictionary& payload, AudioEventCategory category, AudioEventType type) {
+    if (!linkmeterSessionStarted_) {
+        return false;
     }
+    if (linkmeterSession_ != nullptr &&
+        !context_.platform().callQuality->trySendLinkmeterMessage(
+            linkmeterSession_, ZRReportingSessionRtcWorker::retrieveLinkmeterCategoryFromCategory(category),
+            type, payload, keyLeftOut())) {
+        return false;
+    }
+    logSending();
+    logSent(payload, category, type);
+    return true;
+}
+
+void LinkmeterAgent::sendMessage(const Dictionary& payload, AudioEventCategory category,
+                                 AudioEventType type) {
+    logSending();
     if (linkmeterSession_ == nullptr) {
         return;
     }
     const std::optional<std::string> failure = context_.platform().callQuality->SendLinkmeterMessage(
-        linkmeterSession_,
-        ZRReportingSessionRtcWorker::retrieveLinkmeterCategoryFromCategory(message.category), message.type,
-        message.payload);
+        linkmeterSession_, ZRReportingSessionRtcWorker::retrieveLinkmeterCategoryFromCategory(category), type,
+        payload, keyLeftOut());
     if (failure) {
-        log::error(category, "error sending message {}", *failure);
-    } else if (category.isOn(LogLevel::debug)) {
-        log::debug(category, "LinkmeterAgent {} : message {} : category {} : type {}",
-                   linkmeterSession_->description(), message.payload,
-                   static_cast<std::int32_t>(message.category), message.type);
+        log::error(ZRReportingSessionLinkmeterCategory(), "error sending message {}", *failure);
+    } else {
+        logSent(payload, category, type);
+    }
+}
+
+/// The timestamp leaves the device on internal builds only.
+std::string_view LinkmeterAgent::keyLeftOut() const noexcept {
+    return context_.isInternalBuild() ? std::string_view() : ZRReportingInternalEventEpochTime;
+}
+
+void LinkmeterAgent::logSending() {
+    log::debug(ZRReportingSessionLinkmeterCategory(), "entering linkmeter {}", "_sendMessage");
+}
+
+void LinkmeterAgent::logSent(const Dictionary& payload, AudioEventCategory category,
+                             AudioEventType type) const {
+    const LogCategory& logCategory = ZRReportingSessionLinkmeterCategory();
+    if (linkmeterSession_ != nullptr && logCategory.isOn(LogLevel::debug)) {
+        Dictionary sent = payload;
+        if (const std::string_view leftOut = keyLeftOut(); !leftOut.empty()) {
+            sent.remove(leftOut);
+        }
+        log::debug(logCategory, "LinkmeterAgent {} : message {} : category {} : type {}",
+                   linkmeterSession_->description(), sent, static_cast<std::int32_t>(category), type);
     }
 }
 
@@ -279,7 +332,7 @@ void LinkmeterAgent::sendSummary(std::vector<Dictionary> payloads, AudioServiceT
         log::debug(category, "sending rtc summary event. reporterID={} {}=\"{}\"", reporterID,
                    summary.keyAt(i), summary.valueAt(i));
     }
-    sendMessage({std::move(summary), kSummaryCategory, kSummaryType});
+    sendMessage(summary, kSummaryCategory, kSummaryType);
 }
 
 } // namespace tamblo

@@ -13,6 +13,7 @@
 #include <memory>
 #include <optional>
 #include <string>
+#include <string_view>
 #include <vector>
 
 namespace tamblo {
@@ -20,6 +21,9 @@ namespace tamblo {
 /// What of one session is done on the call-quality worker's own queue: setting up, sending, stopping. Setting
 /// up waits, at most nine seconds, until the service has found its back ends. No thread does: the queue is
 /// suspended, and the completion, or a delayed call, has it go on.
+///
+/// A message that finds the queue idle, as nearly all do, is sent by whoever hands it in, where the service
+/// can take it without waiting: nothing could come before it, and it need not be copied.
 ///
 /// What is posted holds the agent, and runs after the worker has gone; the agent of a session that was
 /// dropped without a stop waits for nothing, and what is left to do for it is nothing.
@@ -31,18 +35,18 @@ public:
         AudioEventType type;
     };
 
-    /// Payloads of all sessions that wait until back ends are found; what comes beyond is lost, which one
-    /// error line for each run of a session tells.
+    /// Payloads of all sessions that wait: until back ends are found, or for a slow disk. What comes beyond
+    /// is lost, which one error line for each run of a session tells.
     static constexpr std::size_t kMostWaitingBytes = 16U << 20U;
 
     explicit LinkmeterAgent(Context& context);
     LinkmeterAgent(const LinkmeterAgent&) = delete;
     LinkmeterAgent& operator=(const LinkmeterAgent&) = delete;
 
-    // Each posts its work, without blocking. One thread at a time.
+    // None blocks. One thread at a time.
     /// With what the service is told of the session.
     void start(Dictionary sessionInfo, Dictionary userInfo);
-    void send(Message message);
+    void send(const Dictionary& payload, AudioEventCategory category, AudioEventType type);
     /// With the payloads that are summed up; nothing for a session without messages.
     void stop(std::optional<std::vector<Dictionary>> payloads, AudioServiceType serviceType,
               ReporterID reporterID);
@@ -51,6 +55,7 @@ public:
 
 private:
     struct WaitingBytes;
+    class CountedPiece;
     /// What one piece of work sends.
     struct Messages {
         explicit Messages(WaitingBytes& waiting) : all(waiting) {}
@@ -63,8 +68,10 @@ private:
         WaitingBytes& all;
     };
 
+    /// Holds a message until those before it are done.
+    void queue(Message message);
     /// Whether there is room for one more that has to wait.
-    [[nodiscard]] bool addWaiting(const Message& message) TAMBLO_REQUIRES(mutex_);
+    [[nodiscard]] bool addWaiting(Messages& messages, const Message& message) TAMBLO_REQUIRES(mutex_);
 
     template <typename Piece> void post(Piece piece, Pace pace = Pace::quick);
 
@@ -73,11 +80,20 @@ private:
     void timeOut(std::uint64_t waitNumber);
     void tellWhatWasFound() const;
 
+    // While the queue is idle.
+    /// Answers whether that could be done.
+    [[nodiscard]] bool sendAtOnce(const Dictionary& payload, AudioEventCategory category,
+                                  AudioEventType type);
+
+    [[nodiscard]] std::string_view keyLeftOut() const noexcept;
+    static void logSending();
+    void logSent(const Dictionary& payload, AudioEventCategory category, AudioEventType type) const;
+
     // On the queue.
     void setUp(Dictionary sessionInfo, const Dictionary& userInfo);
     void waitForBackends();
     void sendAll(const std::shared_ptr<Messages>& messages);
-    void sendMessage(Message message);
+    void sendMessage(const Dictionary& payload, AudioEventCategory category, AudioEventType type);
     void finish(std::optional<std::vector<Dictionary>> payloads, AudioServiceType serviceType,
                 ReporterID reporterID);
     void sendSummary(std::vector<Dictionary> payloads, AudioServiceType serviceType, ReporterID reporterID);
@@ -88,13 +104,17 @@ private:
     std::atomic<bool> linkmeterSessionStarted_{false};
     std::atomic<bool> isDropped_{false}; ///< nobody will hear of the session any more
 
-    CallQualityService::SessionRef linkmeterSession_; ///< touched on the queue, or by what ends its wait
+    /// Touched on the queue, while it is idle, or by what ends its wait.
+    CallQualityService::SessionRef linkmeterSession_;
+
+    std::atomic<std::size_t> posted_{0}; ///< pieces that are not over
+    /// The wait of the latest run is over; set behind all else that ends it.
+    std::atomic<bool> isSetUp_{false};
 
     Mutex mutex_;
     bool isAbandoned_ TAMBLO_GUARDED_BY(mutex_) = false;
     std::size_t stopsToCome_ TAMBLO_GUARDED_BY(mutex_) = 0;
     bool isWaiting_ TAMBLO_GUARDED_BY(mutex_) = false;
-    bool isSetUp_ TAMBLO_GUARDED_BY(mutex_) = false; ///< the wait of the latest run is over
     bool isFullTold_ TAMBLO_GUARDED_BY(mutex_) = false;
     std::uint64_t waitNumber_ TAMBLO_GUARDED_BY(mutex_) = 0;
     std::unique_ptr<DelayedCall> timeOut_ TAMBLO_GUARDED_BY(mutex_);

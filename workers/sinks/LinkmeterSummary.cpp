@@ -26,6 +26,8 @@ constexpr std::string_view kServiceTypeKey = "ZR_Session_Summary_Event";
 
 struct Joined {
     TextBuffer text;
+    Value last;                ///< of the values
+    std::size_t lastBegin = 0; ///< of its text, which the next one may have, too
     bool hasValues = false;
     bool isFull = false;
 };
@@ -75,7 +77,8 @@ private:
             return;
         }
         const std::size_t before = joined.text.size();
-        if (std::exchange(joined.hasValues, true)) {
+        const bool isFirst = !std::exchange(joined.hasValues, true);
+        if (!isFirst) {
             joined.text.append(',');
         }
         if (before >= kMostBytesOfKey || bytes_ >= kMostBytes) {
@@ -84,11 +87,18 @@ private:
             ++leftOut_;
             return;
         }
-        if (value.isString()) {
-            joined.text.append(value.stringValue());
+        const std::size_t begin = joined.text.size();
+        if (!isFirst && joined.last.isSame(value)) {
+            joined.text.appendAgain(joined.lastBegin, before);
         } else {
-            appendJson(joined.text, value);
+            if (value.isString()) {
+                joined.text.append(value.stringValue());
+            } else {
+                appendJson(joined.text, value);
+            }
+            joined.last = value;
         }
+        joined.lastBegin = begin;
         bytes_ += joined.text.size() - before;
     }
 

@@ -5,8 +5,12 @@
 #include "session/ZRReportingSession.h"
 #include "util/AudioEvents.h"
 
+#include <array>
+#include <cstddef>
 #include <cstdint>
+#include <span>
 #include <string>
+#include <string_view>
 #include <utility>
 
 namespace tamblo {
@@ -70,10 +74,15 @@ void ZRReportingSessionEventryWorker::handleMessage(const MessageRef& message) {
     }
     AnalyticsEventService& service = *platform().analyticsEvents;
     const Events& events = cache_.get(service, owner->serviceType(), message->category(), message->type());
+    std::array<std::string_view, 2> inUse;
+    std::size_t count = 0;
     for (const Event* event : {&events.general, &events.ofService}) {
         if (event->isInUse) {
-            service.sendEventLazy(event->name, [&message] { return message->payload(); });
+            inUse[count++] = event->name;
         }
+    }
+    if (count != 0) {
+        service.sendEventsLazy(std::span(inUse).first(count), [&message] { return message->payload(); });
     }
 }
 

@@ -64,7 +64,7 @@ std::optional<bool> ZRReportingSessionRtcWorker::start() {
 }
 
 void ZRReportingSessionRtcWorker::handleMessage(const MessageRef& message) {
-    agent_->send({message->payload(), message->category(), message->type()});
+    agent_->send(message->payload(), message->category(), message->type());
 }
 
 bool ZRReportingSessionRtcWorker::stopSome() {

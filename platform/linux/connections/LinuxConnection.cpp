@@ -250,7 +250,7 @@ std::size_t LinuxConnection::decodeAndDispatch(std::span<const std::uint8_t> ite
         return 0;
     }
     const std::size_t bytes = kRequestBytes + request.decodedBytes;
-    dispatchRequest(*exportedObject_, request, shared_from_this());
+    dispatchRequest(*exportedObject_, request, *this);
     return bytes;
 }
 

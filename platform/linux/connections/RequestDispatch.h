@@ -17,20 +17,20 @@ namespace tamblo {
 /// one when the client asked for none.
 template <typename Receiver> class ReplyTo {
 public:
-    ReplyTo(std::optional<std::uint64_t> id, const std::shared_ptr<Receiver>& receiver)
-        : id_(id), receiver_(receiver) {}
+    ReplyTo(std::optional<std::uint64_t> id, Receiver& receiver) : id_(id), receiver_(receiver) {}
 
     template <typename... Result> operator UniqueFunction<void(const ReplyError*, Result...), 32>() const {
         if (!id_) {
             return {};
         }
-        return [receiver = receiver_, id = *id_](const ReplyError* error, Result... result) {
-            if (error != nullptr) {
-                refuse(*receiver, id, *error);
-            } else {
-                receiver->reply([&](TextBuffer& out) { append(out, id, result...); });
-            }
-        };
+        return
+            [receiver = receiver_.shared_from_this(), id = *id_](const ReplyError* error, Result... result) {
+                if (error != nullptr) {
+                    refuse(*receiver, id, *error);
+                } else {
+                    receiver->reply([&](TextBuffer& out) { append(out, id, result...); });
+                }
+            };
     }
     /// The same for an operation that may be refused: of a request without reply, too, the client hears that,
     /// under the id 0.
@@ -38,7 +38,7 @@ public:
         if (id_) {
             return *this;
         }
-        return [receiver = receiver_](const ReplyError* error, bool) {
+        return [receiver = receiver_.shared_from_this()](const ReplyError* error, bool) {
             if (error != nullptr) {
                 refuse(*receiver, 0, *error);
             }
@@ -67,16 +67,15 @@ private:
     }
 
     std::optional<std::uint64_t> id_;
-    const std::shared_ptr<Receiver>& receiver_;
+    Receiver& receiver_;
 };
 
 /// Calls the object's operation for a request, whose parts are moved from. Each reply, whenever it comes and
-/// from whatever thread, is handed to `receiver->reply` as a callable that appends its frame to a
-/// `TextBuffer&`, and the name of a limit that is reached to `receiver->noteLimit`; the replies share the
-/// receiver's ownership.
+/// from whatever thread, is handed to `receiver.reply` as a callable that appends its frame to a
+/// `TextBuffer&`, and the name of a limit that is reached to `receiver.noteLimit`; the replies share the
+/// ownership of the receiver, which a `std::shared_ptr` has.
 template <typename Receiver>
-void dispatchRequest(ZRReportingServiceProtocol& object, wire::Request& request,
-                     const std::shared_ptr<Receiver>& receiver) {
+void dispatchRequest(ZRReportingServiceProtocol& object, wire::Request& request, Receiver& receiver) {
     using wire::Method;
     const ReporterID reporterID = request.reporterID;
     const ReplyTo reply(request.id, receiver);

@@ -13,6 +13,11 @@ namespace tamblo {
 class LinuxClock final : public Clock {
 public:
     [[nodiscard]] WallTime now() const noexcept override { return std::chrono::system_clock::now(); }
+    [[nodiscard]] WallTime coarseNow() const noexcept override {
+        std::timespec time{};
+        ::clock_gettime(CLOCK_REALTIME_COARSE, &time);
+        return WallTime(std::chrono::seconds(time.tv_sec) + std::chrono::nanoseconds(time.tv_nsec));
+    }
     [[nodiscard]] std::chrono::seconds utcOffset(WallTime time) const override {
         const std::time_t seconds = std::chrono::floor<std::chrono::seconds>(time.time_since_epoch()).count();
         const MutexLock lock(zone_);

@@ -41,6 +41,7 @@ SinkFiles::SinkFiles(std::string directory, StructuredLog& log, FileOperations& 
       modes_(modes) {}
 
 void SinkFiles::flush() {
+    payloadTexts_.endBatch();
     const MutexLock lock(mutex_);
     for (AppendOnlyFile* file : flushed_) {
         file->flush();

@@ -8,12 +8,14 @@
 #include "platform/Clock.h"
 #include "platform/StructuredLog.h"
 #include "platform/linux/sinks/FileModes.h"
+#include "platform/linux/sinks/PayloadTexts.h"
 
 #include <algorithm>
 #include <atomic>
 #include <chrono>
 #include <cstddef>
 #include <cstdint>
+#include <optional>
 #include <string>
 #include <string_view>
 #include <vector>
@@ -31,9 +33,12 @@ public:
     SinkFiles(std::string directory, StructuredLog& log,
               FileOperations& operations = FileOperations::system(), FileModes modes = {});
 
-    /// Writes out what waits in all files that are written before replies. It costs a look at each file where
-    /// nothing waits; returns when what was appended before the call, on any thread, is in the kernel's
-    /// hands, or lost and counted.
+    /// What the files' lines share.
+    [[nodiscard]] PayloadTexts& payloadTexts() noexcept { return payloadTexts_; }
+
+    /// Ends a batch: writes out what waits in all files that are written before replies. It costs a look at
+    /// each file where nothing waits; returns when what was appended before the call, on any thread, is in
+    /// the kernel's hands, or lost and counted.
     void flush();
 
     /// The names of the files that cannot be written now, in no order. Waits for nobody who writes.
@@ -52,6 +57,7 @@ private:
     StructuredLog& log_;
     FileOperations& operations_;
     const FileModes modes_;
+    PayloadTexts payloadTexts_;
 
     Mutex mutex_; ///< held while files are written
     std::vector<AppendOnlyFile*> flushed_ TAMBLO_GUARDED_BY(mutex_);
@@ -118,23 +124,34 @@ public:
     /// it may read them and changes none. A line that it throws out of is taken back.
     template <typename Format> void append(Format&& format) {
         const MutexLock lock(mutex_);
-        const std::size_t start = waiting_.size();
+        appendLine(format);
+    }
+    /// The same for a line of each of these things, which `format` is given as well.
+    template <typename Things, typename Format> void appendLines(const Things& things, Format&& format) {
+        const MutexLock lock(mutex_);
+        for (const auto& thing : things) {
+            appendLine([&](TextBuffer& lines) { format(lines, thing); });
+        }
+    }
+
+    /// Adds one line where that needs no waiting for anybody, nor for the disk: it is for the caller to flush
+    /// the file in time. The bytes that wait then; nothing where the line was not added.
+    template <typename Format> [[nodiscard]] std::optional<std::size_t> tryAppend(Format&& format) {
+        if (!mutex_.try_lock()) {
+            return std::nullopt;
+        }
+        std::optional<std::size_t> waiting;
         try {
-            format(waiting_);
-            waiting_.append('\n');
+            if (waiting_.size() < kMostWaitingUnwritten) {
+                addLine(format);
+                waiting = waiting_.size();
+            }
         } catch (...) {
-            waiting_.truncate(start);
+            mutex_.unlock();
             throw;
         }
-        if (waiting_.size() - start > longestLine()) {
-            waiting_.truncate(start);
-            countTooLong();
-            return;
-        }
-        isWaiting_.store(true, std::memory_order_release);
-        if (waiting_.size() >= limits_.waiting) {
-            writeOut();
-        }
+        mutex_.unlock();
+        return waiting;
     }
 
     /// Bytes of a line, with its line end.
@@ -157,6 +174,30 @@ public:
     [[nodiscard]] const std::string& path() const noexcept { return path_; }
 
 private:
+    static constexpr std::size_t kMostWaitingUnwritten = 1U << 20U;
+
+    template <typename Format> void addLine(Format&& format) TAMBLO_REQUIRES(mutex_) {
+        const std::size_t start = waiting_.size();
+        try {
+            format(waiting_);
+            waiting_.append('\n');
+        } catch (...) {
+            waiting_.truncate(start);
+            throw;
+        }
+        if (waiting_.size() - start > longestLine()) {
+            waiting_.truncate(start);
+            countTooLong();
+            return;
+        }
+        isWaiting_.store(true, std::memory_order_release);
+    }
+    template <typename Format> void appendLine(Format&& format) TAMBLO_REQUIRES(mutex_) {
+        addLine(format);
+        if (waiting_.size() >= limits_.waiting) {
+            writeOut();
+        }
+    }
     // Those that answer a boolean leave the reason of a failure in `fault_`.
     void writeOut() TAMBLO_REQUIRES(mutex_);
     [[nodiscard]] bool writeLines(std::string_view& lines) TAMBLO_REQUIRES(mutex_);

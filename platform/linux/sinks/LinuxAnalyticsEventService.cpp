@@ -3,23 +3,11 @@
 #include "base/Json.h"
 
 #include <algorithm>
-#include <cstring>
 #include <functional>
 #include <iterator>
 #include <utility>
 
 namespace tamblo {
-
-namespace {
-
-/// Appends a piece of what stands in the buffer already.
-void appendAgain(TextBuffer& text, std::size_t begin, std::size_t end) {
-    char* const room = text.room(end - begin);
-    std::memcpy(room, text.data() + begin, end - begin);
-    text.commit(end - begin);
-}
-
-} // namespace
 
 LinuxAnalyticsEventService::LinuxAnalyticsEventService(SinkFiles& sinks, const Clock& clock,
                                                        const LinuxPreferences& preferences,
@@ -32,6 +20,7 @@ LinuxAnalyticsEventService::LinuxAnalyticsEventService(SinkFiles& sinks, const C
                    .whenAbsent = {"*"},
                    .absentMeans = "all analytics events are in use"},
                   preferences, log),
+      texts_(sinks.payloadTexts()),
       file_(sinks, "analytics-events.jsonl", "zrrs") {
     // While there are descriptors for it: what the device forbids stays forbidden when there are none.
     const MutexLock lock(mutex_);
@@ -76,38 +65,29 @@ void LinuxAnalyticsEventService::readNamesInUse(std::uint64_t generation) {
     }
 }
 
-void LinuxAnalyticsEventService::sendEventLazy(std::string_view eventName,
-                                               const std::function<Dictionary()>& payload) {
-    if (!isEventInUse(eventName)) {
+void LinuxAnalyticsEventService::sendEventsLazy(std::span<const std::string_view> eventNames,
+                                                const std::function<Dictionary()>& payload) {
+    if (allInUseIn_.load(std::memory_order_relaxed) == preferences_.generation()) {
+        record(eventNames, payload);
         return;
     }
-    // Before the file's lock: the provider is foreign code.
-    Dictionary values = payload();
-    file_.append([&](TextBuffer& lines) { format(lines, eventName, std::move(values)); });
+    for (const std::string_view& eventName : eventNames) {
+        if (isEventInUse(eventName)) {
+            record({&eventName, 1}, payload);
+        }
+    }
 }
 
-void LinuxAnalyticsEventService::format(TextBuffer& lines, std::string_view eventName, Dictionary&& payload) {
-    // The line that was formatted last stands there unless it was written out, or taken back as too long.
-    if (lastLine_.end < lines.size() && payload.sharesStorageWith(lastLine_.payload)) {
-        appendAgain(lines, lastLine_.begin, lastLine_.nameBegin);
-        appendJsonString(lines, eventName);
-        appendAgain(lines, lastLine_.nameEnd, lastLine_.end);
-        return;
-    }
-    LastLine line;
-    line.begin = lines.size();
-    lines.append("{\"time\":");
-    appendJsonNumber(lines, secondsSince1970(clock_.now()));
-    lines.append(",\"event\":");
-    line.nameBegin = lines.size();
-    appendJsonString(lines, eventName);
-    line.nameEnd = lines.size();
-    lines.append(",\"payload\":");
-    appendJson(lines, payload);
-    lines.append('}');
-    line.end = lines.size();
-    line.payload = std::move(payload);
-    lastLine_ = std::move(line);
+void LinuxAnalyticsEventService::record(std::span<const std::string_view> eventNames,
+                                        const std::function<Dictionary()>& payload) {
+    // Before the file's lock: the provider is foreign code.
+    const Dictionary values = payload();
+    file_.appendLines(eventNames, [&](TextBuffer& lines, std::string_view eventName) {
+        texts_.appendLine(lines, clock_, values, {}, [eventName](TextBuffer& line) {
+            line.append(",\"event\":");
+            appendJsonString(line, eventName);
+        });
+    });
 }
 
 } // namespace tamblo

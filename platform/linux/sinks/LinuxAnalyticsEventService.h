@@ -6,11 +6,13 @@
 #include "platform/Clock.h"
 #include "platform/linux/sinks/AppendOnlyFile.h"
 #include "platform/linux/sinks/NamesPreference.h"
+#include "platform/linux/sinks/PayloadTexts.h"
 
 #include <atomic>
 #include <cstddef>
 #include <cstdint>
 #include <functional>
+#include <span>
 #include <string>
 #include <string_view>
 #include <vector>
@@ -23,9 +25,6 @@ namespace tamblo {
 ///
 /// Which events are in use is a preference, domain `com.vandra.tamblo.analytics`, key `events_in_use`: an
 /// array of names, each exact or with one trailing `*`; without it all are.
-///
-/// Most messages are sent as two events with one payload, whose text is made once: where the line before
-/// waits in the file's buffer and has that very payload, its text and time are copied from there.
 class LinuxAnalyticsEventService final : public AnalyticsEventService {
 public:
     /// What is referred to must outlive the service.
@@ -34,19 +33,11 @@ public:
 
     [[nodiscard]] bool isEventInUse(std::string_view eventName) override;
     [[nodiscard]] std::uint64_t inUseGeneration() const override { return preferences_.generation(); }
-    void sendEventLazy(std::string_view eventName, const std::function<Dictionary()>& payload) override;
+    void sendEventsLazy(std::span<const std::string_view> eventNames,
+                        const std::function<Dictionary()>& payload) override;
 
 private:
-    /// The line that was formatted last, in the file's buffer: its payload, and where it stands.
-    struct LastLine {
-        Dictionary payload;
-        std::size_t begin = 0;
-        std::size_t nameBegin = 0;
-        std::size_t nameEnd = 0;
-        std::size_t end = 0;
-    };
-
-    void format(TextBuffer& lines, std::string_view eventName, Dictionary&& payload);
+    void record(std::span<const std::string_view> eventNames, const std::function<Dictionary()>& payload);
     void readNamesInUse(std::uint64_t generation) TAMBLO_REQUIRES(mutex_);
 
     const Clock& clock_;
@@ -60,7 +51,7 @@ private:
     std::vector<std::string> names_ TAMBLO_GUARDED_BY(mutex_);    ///< sorted
     std::vector<std::string> prefixes_ TAMBLO_GUARDED_BY(mutex_); ///< sorted, none of another
 
-    LastLine lastLine_; ///< guarded by the file's lock: touched only while a line is appended
+    PayloadTexts& texts_;
     AppendOnlyFile file_;
 };
 

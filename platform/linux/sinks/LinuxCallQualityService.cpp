@@ -13,6 +13,8 @@ namespace {
 
 constexpr std::chrono::milliseconds kLongestHeldBack{250};
 constexpr std::size_t kMostHeldBack = 64U << 10U;
+/// With so many keys at most, a message's line is not too long: its values are bounded.
+constexpr std::size_t kKeysOfOrdinaryMessage = 1024;
 
 } // namespace
 
@@ -34,6 +36,7 @@ LinuxCallQualityService::LinuxCallQualityService(SinkFiles& sinks, const Clock& 
     : processName_(formatted("{}", hexadecimal(randomNumber(), 16))),
       clock_(clock),
       workQueues_(workQueues),
+      texts_(sinks.payloadTexts()),
       file_(sinks, "call-quality.jsonl", "zrri", AppendOnlyFile::Flushed::byOwner,
             {.waiting = kMostHeldBack}),
       backends_({.domain = "com.vandra.tamblo.callquality",
@@ -82,27 +85,47 @@ void LinuxCallQualityService::StartConfiguration(const SessionRef&, Completion c
 std::optional<std::string> LinuxCallQualityService::SendLinkmeterMessage(const SessionRef& session,
                                                                          std::uint16_t category,
                                                                          std::uint16_t type,
-                                                                         const Dictionary& payload) {
+                                                                         const Dictionary& payload,
+                                                                         std::string_view leftOut) {
+    if (session == nullptr) {
+        return std::nullopt;
+    }
     // A file that cannot be written is told of by itself, once. The message at a session's end has the keys
-    // of all others, and much of their values: one that is too long is not made into a text first, which
-    // would take as much memory again.
-    if (session != nullptr && payloadSize(payload) > file_.longestLine()) {
+    // of all others: one that is too long is not made into a text first, which would take as much memory
+    // again.
+    if (payload.size() > kKeysOfOrdinaryMessage && payloadSize(payload) > file_.longestLine()) {
         file_.loseTooLong();
-    } else if (session != nullptr) {
-        const SpoolSession& spooled = SpoolSession::of(session);
-        file_.append([&](TextBuffer& line) {
-            SinkLine(line, clock_.now())
-                .text("op", "message")
-                .text("session", spooled.name)
-                .number("category", category)
-                .number("type", type)
-                .value("payload", payload);
-        });
-        if (!spooled.isBatched) {
-            isDue_ = true;
-        }
+        return std::nullopt;
+    }
+    file_.append([&](TextBuffer& lines) { appendMessage(lines, session, category, type, payload, leftOut); });
+    if (!SpoolSession::of(session).isBatched) {
+        isDue_ = true;
     }
     return std::nullopt;
+}
+
+bool LinuxCallQualityService::trySendLinkmeterMessage(const SessionRef& session, std::uint16_t category,
+                                                      std::uint16_t type, const Dictionary& payload,
+                                                      std::string_view leftOut) {
+    const std::optional<std::size_t> waiting = file_.tryAppend(
+        [&](TextBuffer& lines) { appendMessage(lines, session, category, type, payload, leftOut); });
+    if (waiting && (*waiting >= kMostHeldBack || !SpoolSession::of(session).isBatched)) {
+        isDue_ = true;
+    }
+    return waiting.has_value();
+}
+
+void LinuxCallQualityService::appendMessage(TextBuffer& lines, const SessionRef& session,
+                                            std::uint16_t category, std::uint16_t type,
+                                            const Dictionary& payload, std::string_view leftOut) {
+    texts_.appendLine(lines, clock_, payload, leftOut, [&](TextBuffer& line) {
+        line.append(",\"op\":\"message\",\"session\":\"");
+        line.append(SpoolSession::of(session).name);
+        line.append("\",\"category\":");
+        appendJson(line, Value(category));
+        line.append(",\"type\":");
+        appendJson(line, Value(type));
+    });
 }
 
 void LinuxCallQualityService::FlushMessages(const SessionRef& session) {
@@ -115,6 +138,7 @@ void LinuxCallQualityService::FlushMessages(const SessionRef& session) {
 std::optional<std::chrono::milliseconds> LinuxCallQualityService::endRun() {
     if (isDue_.exchange(false)) {
         file_.flush();
+        texts_.endBatch();
     } else if (file_.isWaiting() && !isTimed_.exchange(true)) {
         return kLongestHeldBack;
     }
@@ -122,7 +146,8 @@ std::optional<std::chrono::milliseconds> LinuxCallQualityService::endRun() {
 }
 
 void LinuxCallQualityService::writeHeldBack() {
-    isTimed_ = false;
+    // Behind what whoever found it set has appended.
+    (void)isTimed_.exchange(false);
     file_.flush();
 }
 

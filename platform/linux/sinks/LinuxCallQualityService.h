@@ -13,6 +13,7 @@
 #include <memory>
 #include <optional>
 #include <string>
+#include <string_view>
 
 namespace tamblo {
 
@@ -42,7 +43,11 @@ public:
     void StartConfiguration(const SessionRef& session, Completion completion) override;
     [[nodiscard]] std::optional<std::string> SendLinkmeterMessage(const SessionRef& session,
                                                                   std::uint16_t category, std::uint16_t type,
-                                                                  const Dictionary& payload) override;
+                                                                  const Dictionary& payload,
+                                                                  std::string_view leftOut) override;
+    [[nodiscard]] bool trySendLinkmeterMessage(const SessionRef& session, std::uint16_t category,
+                                               std::uint16_t type, const Dictionary& payload,
+                                               std::string_view leftOut) override;
     void FlushMessages(const SessionRef& session) override;
 
     /// At the end of each run of queues' work, since the sessions' queues are many: what may not be held back
@@ -53,9 +58,13 @@ public:
 private:
     class SpoolSession;
 
+    void appendMessage(TextBuffer& lines, const SessionRef& session, std::uint16_t category,
+                       std::uint16_t type, const Dictionary& payload, std::string_view leftOut);
+
     const std::string processName_;
     const Clock& clock_;
     WorkQueues& workQueues_;
+    PayloadTexts& texts_;
     AppendOnlyFile file_;
     std::atomic<bool> isDue_{false};   ///< what waits for the file
     std::atomic<bool> isTimed_{false}; ///< there will be a `writeHeldBack`
