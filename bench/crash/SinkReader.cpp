@@ -96,7 +96,12 @@ void SinkReader::readFile(const std::string& path, const std::function<void(cons
         }
         rest.append(bytes);
     }
-    broken_ += rest.empty() ? 0U : 1U;
+    // Zeros behind the last line were made to make the file long, and no line fitted in behind them.
+    if (const std::size_t begin = rest.find_first_not_of('\0'); begin != rest.npos) {
+        std::fprintf(stderr, "tamblo_crash: half a line at the end of %s: %.200s\n", path.c_str(),
+                     rest.c_str() + begin);
+        ++broken_;
+    }
 }
 
 void SinkReader::readLine(std::string_view line, const std::function<void(const SinkRecord&)>& found) {

@@ -54,6 +54,7 @@ public:
     /// Whether nothing was wrong.
     bool run() {
         service_.start();
+        require(service_.awaitReady(), "the service does not start");
         for (unsigned round = 1; round <= options_.kills && isGood_; ++round) {
             live();
             restart();
