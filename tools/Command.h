@@ -78,6 +78,7 @@ extern const Command kCommandSession;
 extern const Command kCommandReporters;
 extern const Command kCommandValidate;
 extern const Command kCommandTail;
+extern const Command kCommandList;
 extern const Command kCommandNotify;
 extern const Command kCommandPreference;
 extern const Command kCommandDecode;

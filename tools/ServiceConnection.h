@@ -6,6 +6,7 @@
 #include <chrono>
 #include <cstdint>
 #include <optional>
+#include <string>
 #include <string_view>
 
 namespace tamblo::tools {
@@ -51,6 +52,7 @@ private:
     client::Client client_;
 };
 
+[[nodiscard]] std::string notAReporterID(std::string_view text);
 /// The reporter ID that the text is; else complains.
 [[nodiscard]] std::optional<std::int64_t> parseReporterID(std::string_view text);
 
