@@ -100,7 +100,6 @@ bool isOfKind(PreferenceKind kind, const Value& value) {
     case any:
         return true;
     case flag:
-        return value.isNumber();
     case number:
         return value.isNumber();
     case limit:

@@ -44,10 +44,6 @@ std::optional<ExitStatus> ServiceConnection::connect() {
     }
     const std::string& path = client_.socketPath();
     switch (const int fault = faultOfConnecting(path)) {
-    case EACCES:
-    case EPERM:
-        return complain(ExitStatus::unreachable,
-                        formatted("cannot connect to {}: {}", path, describeFault(fault, path)));
     case ENAMETOOLONG:
         return complain(ExitStatus::usage,
                         formatted("{} is too long for a socket's path: it has {} bytes of at most {}", path,
