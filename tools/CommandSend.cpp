@@ -293,7 +293,9 @@ std::string Sender::textOf(const Report& report) const {
 
 void printReports(const Arguments& arguments, const Sender& sender) {
     Array results;
+    bool isSent = false;
     for (const Report& report : sender.reports()) {
+        isSent = isSent || report.outcome != Outcome::noReporter;
         if (!arguments.has("--json")) {
             printLine(sender.textOf(report));
             continue;
@@ -308,7 +310,7 @@ void printReports(const Arguments& arguments, const Sender& sender) {
         results.emplace_back(std::move(result));
     }
     if (arguments.has("--json")) {
-        printLine(jsonText(Dictionary{{"sent", true}, {"results", std::move(results)}}));
+        printLine(jsonText(Dictionary{{"sent", isSent}, {"results", std::move(results)}}));
     }
 }
 

@@ -24,6 +24,8 @@ TEST(Tambloctl, ExitStatusSaysWhoWasWrong) {
         {"send --category Volume --reporter 7 n=5", 0,
          "reporter 7: recorded as com.vandra.tamblo.Volume.Generic, com.vandra.telephony.Volume.Generic\n"},
         {"send -c Volume -r 7 -r 8 n=5", 1, "reporter 8: no client has it"},
+        {"send -c Volume -r 8 n=5 -j", 1,
+         R"("outcome":"noReporter","reporterID":8,"sessions":0}],"sent":false})"},
         {"send -cVolume n=5 --json", 1, R"("outcome":"unrecorded","sessions":0)"}, // a repeat
         {"send -c Volume zrreporting_timestamp=5 n=6", 0, "recorded in 1 session as "},
         {"send --category Nope", 2, "--category needs"},
