@@ -34,6 +34,80 @@ typedef struct {
     const char* message;
 } tamblo_error;
 
+/*
+ * The numbers of the protocol that have names; another may be sent all the same. A category is one of the
+ * kinds, alone or with the part of the audio stack that reports: TAMBLO_SUBSYSTEM_SESSION |
+ * TAMBLO_KIND_PLAYBACK.
+ */
+#define TAMBLO_SUBSYSTEM_MIDI UINT32_C(0x04000000)
+#define TAMBLO_SUBSYSTEM_SESSION UINT32_C(0x08000000)
+#define TAMBLO_SUBSYSTEM_DSP UINT32_C(0x10000000)
+#define TAMBLO_SUBSYSTEM_HAL UINT32_C(0x20000000)
+#define TAMBLO_SUBSYSTEM_ROUTING UINT32_C(0x40000000)
+#define TAMBLO_SUBSYSTEM_TOOLBOX UINT32_C(0x80000000)
+
+typedef enum {
+    TAMBLO_KIND_GENERIC = 1,
+    TAMBLO_KIND_RECORD = 2,
+    TAMBLO_KIND_INPUT = 3,
+    TAMBLO_KIND_PLAYBACK = 4,
+    TAMBLO_KIND_OUTPUT = 5,
+    TAMBLO_KIND_PLAYBACK_AND_RECORD = 6,
+    TAMBLO_KIND_IO = 7,
+    TAMBLO_KIND_SETUP = 8,
+    TAMBLO_KIND_CLIENT_REQUEST = 9,
+    TAMBLO_KIND_ROUTE_CHANGE = 10,
+    TAMBLO_KIND_ERROR = 11,
+    TAMBLO_KIND_CHANLOG = 12,
+    TAMBLO_KIND_PERFORMANCE = 13,
+    TAMBLO_KIND_VOLUME = 14,
+    TAMBLO_KIND_KALEEN = 15,
+    TAMBLO_KIND_HEARING_HEALTH = 16,
+    TAMBLO_KIND_WIRRELS = 17
+} tamblo_event_kind;
+
+typedef enum {
+    TAMBLO_TYPE_GENERIC = 0,
+    TAMBLO_TYPE_START = 1,
+    TAMBLO_TYPE_STOP = 2,
+    TAMBLO_TYPE_ACTIVATE = 3,
+    TAMBLO_TYPE_DEACTIVATE = 4,
+    TAMBLO_TYPE_SETUP = 5,
+    TAMBLO_TYPE_ERROR = 6,
+    TAMBLO_TYPE_ISSUE_DETECTOR = 7,
+    TAMBLO_TYPE_JOULERY = 8,
+    TAMBLO_TYPE_AUDIO_UNIT_USAGE = 9,
+    TAMBLO_TYPE_MIDI_DRIVER = 10,
+    TAMBLO_TYPE_SUMMARY = 11,
+    TAMBLO_TYPE_HEADPHONE_AUDIO_EXPOSURE = 12,
+    TAMBLO_TYPE_AUDIO_EXPOSURE = 13,
+    TAMBLO_TYPE_LISTENING_ENHANCEMENT = 14,
+    TAMBLO_TYPE_PULSEDECK = 15,
+    TAMBLO_TYPE_SIMPLE = 16,
+    TAMBLO_TYPE_HISTOGRAM = 17,
+    TAMBLO_TYPE_STATE = 18,
+    TAMBLO_TYPE_MEMORY_LOG = 19,
+    TAMBLO_TYPE_UNKNOWN = 65535
+} tamblo_event_type;
+
+typedef enum {
+    TAMBLO_SERVICE_GENERIC = 0,
+    TAMBLO_SERVICE_VELKA = 1,
+    TAMBLO_SERVICE_TELEPHONY = 2,
+    TAMBLO_SERVICE_HAPTICS = 3,
+    TAMBLO_SERVICE_ALARMS = 4,
+    TAMBLO_SERVICE_STANDALONE = 5,
+    TAMBLO_SERVICE_SOUND_AUTO_CONFIG = 6,
+    TAMBLO_SERVICE_LONG_FORM_AUDIO = 7,
+    TAMBLO_SERVICE_NON_LONG_FORM_AUDIO = 8,
+    TAMBLO_SERVICE_AUDIO_DEVICE_USAGE = 9,
+    TAMBLO_SERVICE_ALERTS = 10,
+    TAMBLO_SERVICE_TEST = 11,
+    TAMBLO_SERVICE_API_USAGE = 12,
+    TAMBLO_SERVICE_SYSTEM_SOUNDS = 13,
+    TAMBLO_SERVICE_UNKNOWN = 65535
+} tamblo_service_type;
+
 /* The error is null when there is none; the result then counts. */
 typedef void (*tamblo_reply)(void* context, const tamblo_error* error, int64_t result);
 typedef void (*tamblo_state_changed)(void* context, tamblo_state state);
@@ -55,6 +129,13 @@ bool tamblo_client_is_connected(const tamblo_client* client);
 uint64_t tamblo_client_refused_messages(const tamblo_client* client);
 /* Whether all that was queued left within this time. */
 bool tamblo_client_flush(tamblo_client* client, int timeout_ms);
+/*
+ * Whether every request with a callback has been answered, at the latest after this time; but for starts,
+ * which are answered when their session stops. With TAMBLO_CALLER it sends and receives meanwhile. An error
+ * is an answer too: without no_reconnect, requests wait for a service that is not there. Not to be called
+ * from a callback.
+ */
+bool tamblo_client_wait(tamblo_client* client, int timeout_ms);
 /* TAMBLO_CALLER: connects at once; sends, receives and calls back, and returns the number of replies handled.
  */
 bool tamblo_client_connect(tamblo_client* client);
@@ -74,6 +155,12 @@ void tamblo_payload_set_bool(tamblo_payload* payload, const char* key, bool valu
 /* Seconds since 1970. */
 void tamblo_payload_set_date(tamblo_payload* payload, const char* key, double seconds);
 void tamblo_payload_set_data(tamblo_payload* payload, const char* key, const void* bytes, size_t length);
+/* Arrays, and another payload as a value, which is copied. */
+void tamblo_payload_set_strings(tamblo_payload* payload, const char* key, const char* const* values,
+                                size_t count);
+void tamblo_payload_set_ints(tamblo_payload* payload, const char* key, const int64_t* values, size_t count);
+void tamblo_payload_set_doubles(tamblo_payload* payload, const char* key, const double* values, size_t count);
+void tamblo_payload_set_payload(tamblo_payload* payload, const char* key, const tamblo_payload* value);
 
 /* A message to these reporters; without any, to every started session of every client, or, when none is
    started, to the service's single-message session. */

@@ -122,20 +122,24 @@ function(tamblo_program name)
     endif()
 endfunction()
 
-# tamblo_shared_library(NAME FOLDERS folders...): lib<NAME>.so of everything in these folders.
-function(tamblo_shared_library name)
-    cmake_parse_arguments(PARSE_ARGV 1 arg "" "" "FOLDERS")
+# tamblo_client_library(NAME MAP file FOLDERS folders...): lib<NAME>.so and lib<NAME>.a of everything in these
+# folders. The map says which symbols the shared one shows; inline functions are in none of them, as every user
+# compiles those itself.
+function(tamblo_client_library name)
+    cmake_parse_arguments(PARSE_ARGV 1 arg "" "MAP" "FOLDERS")
     set(objects "")
     foreach(folder IN LISTS arg_FOLDERS)
         tamblo_target_name(${folder} target)
-        get_target_property(type ${target} TYPE)
-        if(NOT type STREQUAL "STATIC_LIBRARY")
-            return()
-        endif()
+        set_target_properties(${target} PROPERTIES VISIBILITY_INLINES_HIDDEN ON)
         list(APPEND objects "$<TARGET_OBJECTS:${target}>")
     endforeach()
     add_library(${name} SHARED ${objects})
     set_target_properties(${name} PROPERTIES LINKER_LANGUAGE CXX VERSION ${PROJECT_VERSION}
-        SOVERSION ${PROJECT_VERSION_MAJOR})
+        SOVERSION ${PROJECT_VERSION_MAJOR} LINK_DEPENDS "${CMAKE_SOURCE_DIR}/${arg_MAP}")
+    target_link_options(${name} PRIVATE "-Wl,--version-script=${CMAKE_SOURCE_DIR}/${arg_MAP}")
     target_link_libraries(${name} PRIVATE Threads::Threads)
+
+    add_library(${name}_static STATIC ${objects})
+    set_target_properties(${name}_static PROPERTIES LINKER_LANGUAGE CXX OUTPUT_NAME ${name})
+    target_link_libraries(${name}_static PRIVATE Threads::Threads)
 endfunction()

@@ -1,46 +1,44 @@
 # What `cmake --install` (and `./dev install`) puts in place.
 
-foreach(target tamblod tambloctl tamblo)
+foreach(target tamblod tambloctl)
     if(TARGET ${target})
-        install(TARGETS ${target}
-            RUNTIME DESTINATION "${CMAKE_INSTALL_BINDIR}"
-            LIBRARY DESTINATION "${CMAKE_INSTALL_LIBDIR}")
+        install(TARGETS ${target} RUNTIME DESTINATION "${CMAKE_INSTALL_BINDIR}")
     endif()
 endforeach()
 
-# Adds to the list `headers` the given header and those of this project that it includes, directly or not.
-function(tamblo_add_header_with_includes header)
-    if(header IN_LIST headers OR NOT EXISTS "${CMAKE_SOURCE_DIR}/${header}")
-        return()
-    endif()
-    list(APPEND headers ${header})
-    file(STRINGS "${CMAKE_SOURCE_DIR}/${header}" includes REGEX "^#include \"")
-    foreach(include IN LISTS includes)
-        string(REGEX REPLACE "^#include \"([^\"]+)\".*" "\\1" included "${include}")
-        tamblo_add_header_with_includes("${included}")
-    endforeach()
-    set(headers "${headers}" PARENT_SCOPE)
-endfunction()
-
-# The client library's headers are included as they are in this tree: "client/Client.h" below
-# include/tamblo, which the pkg-config file names. What only its own sources include stays here.
-foreach(entry client/Client.h wire/Directories.h client/tamblo.h)
-    tamblo_add_header_with_includes(${entry})
-endforeach()
-foreach(header IN LISTS headers)
-    get_filename_component(directory "${header}" DIRECTORY)
-    install(FILES ${header} DESTINATION "${CMAKE_INSTALL_INCLUDEDIR}/tamblo/${directory}")
-endforeach()
+# The client library: shared and static, its headers, and what pkg-config and CMake's find_package know of it.
+include(CMakePackageConfigHelpers)
+set(tamblo_cmake_dir "${CMAKE_INSTALL_LIBDIR}/cmake/tamblo")
+install(TARGETS tamblo tamblo_static EXPORT tambloTargets
+    LIBRARY DESTINATION "${CMAKE_INSTALL_LIBDIR}"
+    ARCHIVE DESTINATION "${CMAKE_INSTALL_LIBDIR}"
+    INCLUDES DESTINATION "${CMAKE_INSTALL_INCLUDEDIR}")
+install(EXPORT tambloTargets NAMESPACE tamblo:: DESTINATION "${tamblo_cmake_dir}")
+configure_package_config_file(packaging/tambloConfig.cmake.in "${CMAKE_BINARY_DIR}/tambloConfig.cmake"
+    INSTALL_DESTINATION "${tamblo_cmake_dir}")
+write_basic_package_version_file("${CMAKE_BINARY_DIR}/tambloConfigVersion.cmake" COMPATIBILITY SameMajorVersion)
+install(FILES "${CMAKE_BINARY_DIR}/tambloConfig.cmake" "${CMAKE_BINARY_DIR}/tambloConfigVersion.cmake"
+    DESTINATION "${tamblo_cmake_dir}")
+install(CODE "
+    set(SOURCE \"${CMAKE_SOURCE_DIR}\")
+    set(DESTINATION \"\$ENV{DESTDIR}${CMAKE_INSTALL_FULL_INCLUDEDIR}\")
+    set(ENTRIES ${tamblo_public_headers})")
+install(SCRIPT cmake/InstallHeaders.cmake)
 configure_file(packaging/tamblo.pc.in tamblo.pc @ONLY)
 install(FILES "${CMAKE_BINARY_DIR}/tamblo.pc" DESTINATION "${CMAKE_INSTALL_LIBDIR}/pkgconfig")
 
 configure_file(packaging/tamblod.service.in tamblod.service @ONLY)
 install(FILES "${CMAKE_BINARY_DIR}/tamblod.service" packaging/tamblod.socket
     DESTINATION "${CMAKE_INSTALL_PREFIX}/lib/systemd/system")
+configure_file(packaging/tamblod.user.service.in user/tamblod.service @ONLY)
+install(FILES "${CMAKE_BINARY_DIR}/user/tamblod.service"
+    DESTINATION "${CMAKE_INSTALL_PREFIX}/lib/systemd/user")
 # The unit's user, and its configuration directory, which that user owns.
 install(FILES packaging/tamblod.sysusers DESTINATION "${CMAKE_INSTALL_PREFIX}/lib/sysusers.d" RENAME tamblo.conf)
 install(FILES packaging/tamblod.tmpfiles DESTINATION "${CMAKE_INSTALL_PREFIX}/lib/tmpfiles.d" RENAME tamblo.conf)
-install(DIRECTORY examples/ DESTINATION "${CMAKE_INSTALL_DOCDIR}/examples" FILES_MATCHING PATTERN "*.jsonl")
-install(DIRECTORY docs/ DESTINATION "${CMAKE_INSTALL_DOCDIR}" FILES_MATCHING PATTERN "*.md")
+# The documents lie as they do in the tree, so that their links hold.
+install(DIRECTORY examples DESTINATION "${CMAKE_INSTALL_DOCDIR}" USE_SOURCE_PERMISSIONS
+    PATTERN demo EXCLUDE PATTERN __pycache__ EXCLUDE)
+install(DIRECTORY docs DESTINATION "${CMAKE_INSTALL_DOCDIR}")
+install(FILES README.md DESTINATION "${CMAKE_INSTALL_DOCDIR}")
 install(FILES packaging/audio_issue_detected.proto DESTINATION "${CMAKE_INSTALL_DATADIR}/tamblo")
-install(FILES README.md DESTINATION "${CMAKE_INSTALL_DOCDIR}" OPTIONAL)

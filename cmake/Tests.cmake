@@ -47,11 +47,26 @@ tamblo_tests(tamblo_service_tests LABEL service SOURCES ${service_sources} LIBRA
 # What one client may cost the others, by the real tamblod.
 tamblo_tests(tamblo_hostile_tests LABEL hostile SOURCES ${hostile_sources} LIBRARIES wire base)
 
+# The examples in C and C++, built as against the installed library: with its headers alone.
+set(tamblo_installed_headers "${CMAKE_BINARY_DIR}/installed")
+string(JOIN " " entries ${tamblo_public_headers})
+add_custom_target(tamblo_headers COMMAND "${CMAKE_COMMAND}" "-DSOURCE=${CMAKE_SOURCE_DIR}"
+    "-DDESTINATION=${tamblo_installed_headers}" "-DENTRIES=${entries}"
+    -P "${CMAKE_SOURCE_DIR}/cmake/InstallHeaders.cmake" VERBATIM)
+foreach(language c cpp)
+    add_executable(reporter_${language} examples/client/reporter.${language})
+    target_include_directories(reporter_${language} PRIVATE "${tamblo_installed_headers}")
+    target_link_libraries(reporter_${language} PRIVATE tamblo)
+    add_dependencies(reporter_${language} tamblo_headers)
+    add_dependencies(tamblo_service_tests reporter_${language})
+endforeach()
+
 foreach(tests tamblo_service_tests tamblo_hostile_tests)
     if(TARGET ${tests})
         target_compile_definitions(${tests} PRIVATE
             "TAMBLOD_PATH=\"${CMAKE_RUNTIME_OUTPUT_DIRECTORY}/tamblod\""
-            "TAMBLOCTL_PATH=\"${CMAKE_RUNTIME_OUTPUT_DIRECTORY}/tambloctl\"")
+            "TAMBLOCTL_PATH=\"${CMAKE_RUNTIME_OUTPUT_DIRECTORY}/tambloctl\""
+            "REPORTERS_DIR=\"${CMAKE_RUNTIME_OUTPUT_DIRECTORY}\"")
         foreach(program tamblod tambloctl)
             if(TARGET ${program})
                 add_dependencies(${tests} ${program})

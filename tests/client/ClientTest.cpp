@@ -260,12 +260,20 @@ TEST(MessageWriter, WritesWhatTheServiceReadsAndNothingWhenDropped) {
 TEST(CApi, ACProgramRunsASessionAndItsPayloadArrivesAsItWasBuilt) {
     FakeService service;
     EXPECT_EQ(runCProgram(service.path().c_str()), 0);
-    ASSERT_TRUE(service.waitForRequests(10));
+    ASSERT_TRUE(service.waitForRequests(11));
     const std::uint8_t bytes[] = {0, 1, 255};
     const Dictionary expected{
-        {"string", "text"}, {"int", -5},    {"uint", ~std::uint64_t{0}}, {"double", 0.1},
-        {"float", 0.5F},    {"bool", true}, {"date", Value::date(1.5)},  {"data", Value::data(bytes)}};
-    const auto requests = service.requests();
+        {"string", "text"},
+        {"int", -5},
+        {"uint", ~std::uint64_t{0}},
+        {"double", 0.1},
+        {"float", 0.5F},
+        {"bool", true},
+        {"date", Value::date(1.5)},
+        {"data", Value::data(bytes)},
+        {"inner", Dictionary{{"ints", Array{7}}, {"doubles", Array{0.5}}, {"strings", Array{"a", "b"}}}}};
+    auto requests = service.requests();
+    requests.erase(requests.begin()); // the start of the client that only waits
     EXPECT_EQ(requests[2].serviceType, 7);
     EXPECT_EQ(requests[3].dictionary, expected);
     EXPECT_EQ(requests[5].dictionary.find("float")->kind(), Value::Kind::singleFloat);
