@@ -62,6 +62,7 @@ extern const Command kCommandTail;
 extern const Command kCommandNotify;
 extern const Command kCommandPreference;
 extern const Command kCommandDecode;
+extern const Command kCommandReport;
 extern const Command kCommandKill;
 
 /// Writes `tambloctl: TEXT` to standard error and answers the status, so that a command can return it.

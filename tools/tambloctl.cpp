@@ -14,8 +14,8 @@ namespace {
 using namespace tamblo::tools;
 
 constexpr const Command* kCommands[] = {
-    &kCommandSend,   &kCommandSession, &kCommandReporters,  &kCommandValidate, &kCommandTail,
-    &kCommandDecode, &kCommandNotify,  &kCommandPreference, &kCommandKill,
+    &kCommandSend,   &kCommandSession, &kCommandReporters, &kCommandValidate,   &kCommandTail,
+    &kCommandDecode, &kCommandReport,  &kCommandNotify,    &kCommandPreference, &kCommandKill,
 };
 
 constexpr std::size_t kNameColumn = 12;
