@@ -99,6 +99,7 @@ class Browser:
         self.events.clear()
         self.call("Page.navigate", url="file://" + os.path.abspath(path))
         self._await(lambda answer: answer.get("method") == "Page.loadEventFired")
+        self.until("document.documentElement.dataset.state === 'whole'")
 
     def run(self, expression):
         """The value of an expression, awaited where it is a promise."""
@@ -106,6 +107,13 @@ class Browser:
         if "exceptionDetails" in answer:
             raise RuntimeError(str(answer["exceptionDetails"]))
         return answer["result"].get("value")
+
+    def until(self, condition):
+        end = time.monotonic() + PATIENCE
+        while not self.run(condition):
+            if time.monotonic() > end:
+                raise RuntimeError("not within a minute: " + condition)
+            time.sleep(0.05)
 
     def key(self, name, code=None):
         text = name if len(name) == 1 else ""

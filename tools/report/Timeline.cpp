@@ -15,19 +15,23 @@ class Running {
 public:
     Running(Timeline& timeline, bool isOutput) : timeline_(timeline), isOutput_(isOutput) {}
 
-    void start(double at) { begin_ = begin_.value_or(at); }
+    void start(double at) {
+        begin_ = isRunning_ ? begin_ : at;
+        isRunning_ = true;
+    }
     void stop(double at, bool isOpen = false) {
-        if (begin_) {
+        if (isRunning_) {
             timeline_.stretches.push_back(
-                {.begin = *begin_, .end = at, .isOutput = isOutput_, .isOpen = isOpen});
+                {.begin = begin_, .end = at, .isOutput = isOutput_, .isOpen = isOpen});
         }
-        begin_.reset();
+        isRunning_ = false;
     }
 
 private:
     Timeline& timeline_;
     const bool isOutput_;
-    std::optional<double> begin_;
+    bool isRunning_ = false;
+    double begin_ = 0;
 };
 
 /// Adds a mark where the value is another than before.

@@ -32,39 +32,65 @@ function summaryOf(row) {
     return summary;
 }
 
+/** A session; what only some places ask for is made when it is first asked for, as a page may have thousands. */
 class Session {
+    #row;
+    #stretches = null;
+    #marks = null;
+    #summaries = null;
+    #devices = null;
+    #lookedIn = null;
+
     constructor(row, number) {
-        const [name, app, service, process, reporter, began, ended, flags, messages, stretches, marks,
-            summaries, keys] = row;
+        const [name, app, service, process, reporter, began, ended, flags, messages, stretches, marks, , keys] = row;
+        this.#row = row;
         this.number = number;
         this.name = textOf(name);
         this.app = textOf(app) || UNKNOWN;
         this.service = textOf(service) || UNKNOWN;
         this.process = textOf(process);
-        Object.assign(this, { reporter, began, ended, flags, messages, keys });
+        this.reporter = reporter;
+        this.began = began;
+        this.ended = ended;
+        this.flags = flags;
+        this.messages = messages;
+        this.keys = keys;
         this.isNegative = ended < began;
-        this.stretches = stretches.map(([begin, end, isOutput, how]) => ({ begin, end, isOutput: isOutput === 1, how }));
-        this.marks = marks.map(([at, kind, text]) => ({ at, kind, text: textOf(text) }))
-            .sort((a, b) => a.at - b.at);
-        this.summaries = summaries.map(summaryOf);
+        this.overloads = 0;
         this.low = Math.min(began, ended);
         this.high = Math.max(began, ended);
-        for (const { begin, end } of this.stretches) {
-            this.low = Math.min(this.low, begin, end);
-            this.high = Math.max(this.high, begin, end);
+        for (const stretch of stretches) {
+            this.low = Math.min(this.low, stretch[0], stretch[1]);
+            this.high = Math.max(this.high, stretch[0], stretch[1]);
         }
-        if (this.marks.length > 0) {
-            this.low = Math.min(this.low, this.marks[0].at);
-            this.high = Math.max(this.high, this.marks[this.marks.length - 1].at);
+        for (const mark of marks) {
+            this.low = Math.min(this.low, mark[0]);
+            this.high = Math.max(this.high, mark[0]);
+            if (mark[1] === OVERLOAD) { ++this.overloads; }
         }
-        this.overloads = this.marks.reduce((sum, mark) => sum + (mark.kind === OVERLOAD ? 1 : 0), 0);
-        this.devices = this.findDevices();
-        this.lookedIn = null;
+    }
+
+    get stretches() {
+        this.#stretches ??= this.#row[9].map(([begin, end, isOutput, how]) => ({ begin, end, isOutput: isOutput === 1, how }));
+        return this.#stretches;
+    }
+    get marks() {
+        this.#marks ??= this.#row[10].map(([at, kind, text]) => ({ at, kind, text: textOf(text) }))
+            .sort((a, b) => a.at - b.at);
+        return this.#marks;
+    }
+    get summaries() {
+        this.#summaries ??= this.#row[11].map(summaryOf);
+        return this.#summaries;
+    }
+    get devices() {
+        this.#devices ??= this.#findDevices();
+        return this.#devices;
     }
 
     has(flag) { return (this.flags & flag) !== 0; }
 
-    findDevices() {
+    #findDevices() {
         const routes = new Set();
         for (const mark of this.marks) {
             if (mark.kind === ROUTE) { routes.add(mark.text); }
@@ -80,12 +106,12 @@ class Session {
     /** Whether all words are in what the session's row says of it. */
     contains(words) {
         if (words.length === 0) { return true; }
-        if (this.lookedIn === null) {
+        if (this.#lookedIn === null) {
             const issues = new Set(this.marks.filter((mark) => mark.kind >= OVERLOAD).map((mark) => mark.text));
-            this.lookedIn = [this.app, this.service, this.process, this.name, String(this.reporter ?? ''),
+            this.#lookedIn = [this.app, this.service, this.process, this.name, String(this.reporter ?? ''),
                 ...this.devices, ...issues, ...this.keys.map((key) => report.keys[key])].join('\n').toLowerCase();
         }
-        return words.every((word) => this.lookedIn.includes(word));
+        return words.every((word) => this.#lookedIn.includes(word));
     }
 }
 

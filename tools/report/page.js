@@ -53,19 +53,23 @@ function applyFilters() {
     shown.sort(ORDERS[byId('order').value]);
     timeline.setRows(shown);
     byId('shown').textContent = shown.length === sessions.length ? '' : `${number(shown.length)} of ${number(sessions.length)}`;
-    showFigures(shown);
+    return shown;
 }
 
 /** Filters once a typist pauses: figures over many sessions take longer than a keystroke. */
 let pause = 0;
 function filterSoon() {
     clearTimeout(pause);
-    pause = setTimeout(applyFilters, 120);
+    pause = setTimeout(() => showFigures(applyFilters()), 120);
 }
 
 byId('filters').addEventListener('input', filterSoon);
 byId('filters').addEventListener('reset', filterSoon);
 byId('filters').addEventListener('submit', (event) => event.preventDefault());
+byId('only-in-view').addEventListener('change', (event) => {
+    timeline.isOnlyInView = event.target.checked;
+    timeline.draw();
+});
 document.querySelector('.buttons').addEventListener('click', (event) => {
     const acts = { in: () => timeline.zoom(0.6), out: () => timeline.zoom(1 / 0.6), fit: () => timeline.fit(true),
         session: () => timeline.showSession() };
@@ -92,9 +96,14 @@ showAbout();
 showLegend();
 showDetails(null);
 showCaptures();
-fillSelect('by-app', countNames((session) => [session.app]));
-fillSelect('by-service', countNames((session) => [session.service]));
-fillSelect('by-device', countNames((session) => session.devices));
-fillSelect('by-key', countNames((session) => session.keys.map((key) => report.keys[key])));
-applyFilters();
+const shownFirst = applyFilters();
 timeline.fit(false);
+// The timeline is drawn before what takes longer and stands further down.
+requestAnimationFrame(() => setTimeout(() => {
+    fillSelect('by-app', countNames((session) => [session.app]));
+    fillSelect('by-service', countNames((session) => [session.service]));
+    fillSelect('by-device', countNames((session) => session.devices));
+    fillSelect('by-key', countNames((session) => session.keys.map((key) => report.keys[key])));
+    showFigures(shownFirst);
+    document.documentElement.dataset.state = 'whole';
+}));

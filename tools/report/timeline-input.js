@@ -10,7 +10,10 @@ Object.assign(Timeline.prototype, {
         this.box.addEventListener('pointerleave', () => { this.tip.hidden = true; });
         this.box.addEventListener('wheel', (event) => this.wheel(event), { passive: false });
         this.box.addEventListener('keydown', (event) => this.key(event));
-        this.box.addEventListener('dblclick', (event) => this.zoom(0.4, this.place(event).x));
+        this.box.addEventListener('dblclick', (event) => {
+            const { x } = this.place(event);
+            if (x > this.labels) { this.zoom(0.4, x); } else { this.showSession(); }
+        });
     },
 
     place(event) {

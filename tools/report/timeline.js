@@ -22,6 +22,8 @@ class Timeline {
         this.heightOfAll = document.getElementById('rows-height');
         this.tip = document.getElementById('tip');
         this.rows = [];
+        this.all = [];
+        this.isOnlyInView = false;
         this.start = 0;
         this.span = HOUR;
         this.selected = null;
@@ -53,19 +55,30 @@ class Timeline {
     x(at) { return this.labels + (at - this.start) / this.span * this.width; }
     at(x) { return this.start + (x - this.labels) / this.width * this.span; }
 
-    setRows(rows) {
+    setRows(all) {
+        this.all = all;
+        this.placeRows(all);
+        if (this.selected !== null && !all.includes(this.selected)) { this.select(null); }
+        this.draw();
+    }
+    placeRows(rows) {
         this.rows = rows;
         const height = this.top + rows.length * ROW + 4;
         this.heightOfAll.style.height = `${height}px`;
         this.box.style.height = `min(60vh, 620px, ${Math.max(height, LEAST_HEIGHT) + 2}px)`;
-        if (this.selected !== null && !rows.includes(this.selected)) { this.select(null); }
-        this.draw();
+    }
+    /** Leaves out what the time that is shown does not reach, where that is asked for. */
+    chooseRows() {
+        const isInView = (session) => session.high >= this.start && session.low <= this.start + this.span;
+        const rows = this.isOnlyInView ? this.all.filter(isInView) : this.all;
+        if (rows.length !== this.rows.length || rows[0] !== this.rows[0]) { this.placeRows(rows); }
+        this.rows = rows;
     }
 
     /** The time of all rows; of much, its last part alone, unless everything is asked for. */
     fit(isEverything) {
         let low = Infinity, high = -Infinity;
-        for (const session of this.rows) {
+        for (const session of this.all) {
             low = Math.min(low, session.low);
             high = Math.max(high, session.high);
         }
@@ -74,7 +87,10 @@ class Timeline {
             high = Math.max(high, event.at);
         }
         if (low > high) { low = 0; high = HOUR; }
-        if (!isEverything && high - low > FIRST_SPAN) { low = high - FIRST_SPAN / 2; }
+        if (!isEverything && high - low > FIRST_SPAN) {
+            low = high - FIRST_SPAN / 2;
+            this.box.scrollTop = Math.max(0, this.rows.findIndex((session) => session.high >= low)) * ROW;
+        }
         this.show(low, high);
     }
     show(low, high) {
@@ -121,6 +137,7 @@ class Timeline {
 
     paint() {
         const { context, box, canvas } = this;
+        this.chooseRows();
         const ratio = window.devicePixelRatio || 1;
         const width = box.clientWidth, height = box.clientHeight;
         if (canvas.width !== Math.round(width * ratio) || canvas.height !== Math.round(height * ratio)) {
@@ -147,7 +164,7 @@ class Timeline {
         context.restore();
         this.paintAxis(width, height);
         if (this.lane > 0) { this.paintLane(width); }
-        ++this.frames;
+        if (++this.frames === 1) { performance.mark('timeline-painted'); }
     }
 
     paintStripe(session, i, y) {
