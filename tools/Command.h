@@ -82,6 +82,7 @@ extern const Command kCommandList;
 extern const Command kCommandNotify;
 extern const Command kCommandPreference;
 extern const Command kCommandDecode;
+extern const Command kCommandReport;
 extern const Command kCommandKill;
 
 /// All of them, in the order in which the help lists them.

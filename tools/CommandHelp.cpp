@@ -9,8 +9,9 @@ namespace tamblo::tools {
 namespace {
 
 constexpr const Command* kCommands[] = {
-    &kCommandSend,   &kCommandSession, &kCommandReporters, &kCommandValidate,   &kCommandTail,
-    &kCommandDecode, &kCommandList,    &kCommandNotify,    &kCommandPreference, &kCommandKill,
+    &kCommandSend,   &kCommandSession,    &kCommandReporters, &kCommandValidate,
+    &kCommandTail,   &kCommandDecode,     &kCommandReport,    &kCommandList,
+    &kCommandNotify, &kCommandPreference, &kCommandKill,
 };
 
 constexpr std::size_t kNameColumn = 12;

@@ -67,6 +67,11 @@ TEST(Tambloctl, ExitStatusSaysWhoWasWrong) {
         {"preference set broken a 1", 1, "it is left as it is"},
         {"decode EAIaATMiAW4qA2NvbQ==", 0, "  issuetype: \"3\""},
         {"decode --kind=line EAIaATMiAW4qA2NvbQ==", 2, "tambloctl: line 1: not usable JSON: "},
+        {"report --since yesterday", 2, "is no time"},
+        {"report a b", 2, "one directory"},
+        {"report -o", 2, "needs a value"},
+        {"report --app x /nonexistent", 1, "there is no directory /nonexistent"},
+        {"report --since 2d -o /dev/null/x", 1, "cannot write /dev/null/x"},
         {"kill", 0, ""},
         {"kill --timeout 0", 3, "no service answers at "},
     };

@@ -1,0 +1,135 @@
+#include "tools/report/SinkLines.h"
+
+#include "base/Format.h"
+#include "os/FileDescriptor.h"
+
+#include <algorithm>
+#include <cerrno>
+
+#include <fcntl.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+namespace tamblo::report {
+
+namespace {
+
+using LineFunction = UniqueFunction<void(std::string_view line)>;
+
+constexpr int kKeptFiles = 4;
+constexpr std::size_t kPieceBytes = std::size_t{256} << 10U;
+
+struct OpenFile {
+    FileDescriptor descriptor;
+    dev_t device = 0;
+    ino_t inode = 0;
+    off_t size = 0;
+};
+
+/// The newest first. A file that was renamed between two openings is met twice and counts once.
+std::vector<OpenFile> openAll(const std::string& directory, std::string_view name, ReadCounts& counts) {
+    std::vector<OpenFile> files;
+    for (int number = 0; number <= kKeptFiles; ++number) {
+        std::string fileName(name);
+        if (number > 0) {
+            appendFormatted(fileName, ".{}", number);
+        }
+        struct stat status {};
+        // A pipe in a file's place must not be waited for.
+        FileDescriptor file(::open((directory + "/" + fileName).c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK));
+        if (!file.isOpen()) {
+            if (errno != ENOENT) {
+                counts.unreadable.push_back(std::move(fileName));
+            }
+            continue;
+        }
+        if (::fstat(file.get(), &status) != 0 || !S_ISREG(status.st_mode)) {
+            counts.unreadable.push_back(std::move(fileName));
+            continue;
+        }
+        const bool isKnown = std::ranges::any_of(files, [&status](const OpenFile& other) {
+            return other.device == status.st_dev && other.inode == status.st_ino;
+        });
+        if (!isKnown) {
+            files.push_back({std::move(file), status.st_dev, status.st_ino, status.st_size});
+        }
+    }
+    return files;
+}
+
+/// Cuts pieces of a file into lines.
+class LineCutter {
+public:
+    LineCutter(ReadCounts& counts, LineFunction& take) : counts_(counts), take_(take) {}
+
+    void add(std::string_view piece) {
+        for (std::size_t end = piece.find('\n'); end != std::string_view::npos; end = piece.find('\n')) {
+            hold(piece.substr(0, end));
+            handOver();
+            piece.remove_prefix(end + 1);
+        }
+        hold(piece);
+    }
+    void end() {
+        if (isTooLong_) {
+            ++counts_.longLines;
+        } else if (!held_.empty()) {
+            ++counts_.tornLines;
+        }
+    }
+
+private:
+    void hold(std::string_view part) {
+        if (isTooLong_ || held_.size() + part.size() > kLongestLine) {
+            isTooLong_ = true;
+            held_.clear();
+        } else {
+            held_.append(part);
+        }
+    }
+    void handOver() {
+        if (isTooLong_) {
+            ++counts_.longLines;
+        } else {
+            ++counts_.lines;
+            take_(held_);
+        }
+        isTooLong_ = false;
+        held_.clear();
+    }
+
+    ReadCounts& counts_;
+    LineFunction& take_;
+    std::string held_;
+    bool isTooLong_ = false;
+};
+
+void readFile(const OpenFile& file, ReadCounts& counts, LineFunction& take) {
+    LineCutter lines(counts, take);
+    std::string piece(kPieceBytes, '\0');
+    // No further than it reached when it was opened: it may grow as fast as it is read.
+    for (off_t offset = 0; offset < file.size;) {
+        const auto wanted = std::min<off_t>(file.size - offset, static_cast<off_t>(kPieceBytes));
+        const ssize_t count =
+            ::pread(file.descriptor.get(), piece.data(), static_cast<std::size_t>(wanted), offset);
+        if (count <= 0) {
+            break;
+        }
+        lines.add({piece.data(), static_cast<std::size_t>(count)});
+        offset += count;
+        counts.bytes += static_cast<std::uint64_t>(count);
+    }
+    lines.end();
+}
+
+} // namespace
+
+void readSink(const std::string& directory, std::string_view name, ReadCounts& counts, LineFunction& take) {
+    const std::vector<OpenFile> files = openAll(directory, name, counts);
+    counts.files += files.size();
+    for (auto file = files.rbegin(); file != files.rend(); ++file) {
+        readFile(*file, counts, take);
+    }
+}
+
+} // namespace tamblo::report

@@ -1,0 +1,32 @@
+#pragma once
+
+#include "base/UniqueFunction.h"
+
+#include <cstddef>
+#include <cstdint>
+#include <string>
+#include <string_view>
+#include <vector>
+
+namespace tamblo::report {
+
+/// What was met while sinks were read.
+struct ReadCounts {
+    std::uint64_t files = 0;
+    std::uint64_t bytes = 0;
+    std::uint64_t lines = 0;             ///< handed over
+    std::uint64_t tornLines = 0;         ///< without an end, at the end of a file
+    std::uint64_t longLines = 0;         ///< of more than `kLongestLine`
+    std::vector<std::string> unreadable; ///< names of files that could not be opened
+};
+
+/// Longer lines are passed over, so that a file without line ends takes no more memory than any other. What a
+/// report needs is in lines of some hundred bytes.
+inline constexpr std::size_t kLongestLine = std::size_t{1} << 20U;
+
+/// Hands over the whole lines of a sink, those of its rotated files first, as they stand there now. All files
+/// are opened before the first is read: a sink that is rotated meanwhile loses none of them.
+void readSink(const std::string& directory, std::string_view name, ReadCounts& counts,
+              UniqueFunction<void(std::string_view line)>& take);
+
+} // namespace tamblo::report

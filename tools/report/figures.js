@@ -1,0 +1,151 @@
+// Figures over the sessions that are shown: rows of bars, which are tables, and columns in SVG.
+
+const MOST_BARS = 12;
+const MOST_COLUMNS = 96;
+const VOLUMES = Array.from({ length: 17 }, (_, i) => i / 16);
+
+function addTo(sums, name, which, seconds) {
+    const sum = sums.get(name) ?? { output: 0, input: 0 };
+    sum[which] += seconds;
+    sums.set(name, sum);
+}
+
+/** Seconds of output and input by several names, of volumes, and overloads. Lengths are those of summaries. */
+function figuresOf(shown) {
+    const figures = { application: new Map(), device: new Map(), route: new Map(), service: new Map(),
+        volume: VOLUMES.map(() => 0), overloads: [] };
+    for (const session of shown) {
+        for (const { kind, values } of session.summaries) {
+            if (kind !== 'output' && kind !== 'input') { continue; }
+            const seconds = Number(kind === 'output' ? values.play_seconds : values.inputrunning_seconds) || 0;
+            const route = String(values.active_devices ?? UNKNOWN);
+            addTo(figures.application, session.app, kind, seconds);
+            addTo(figures.service, session.service, kind, seconds);
+            addTo(figures.route, route, kind, seconds);
+            for (const device of new Set(devicesIn(route))) { addTo(figures.device, device, kind, seconds); }
+            const volume = VOLUMES.indexOf(Number(values.QVSessionVolumeBucketed ?? NaN));
+            if (kind === 'output' && volume >= 0) { figures.volume[volume] += seconds; }
+        }
+        for (const mark of session.marks) {
+            if (mark.kind === OVERLOAD) { figures.overloads.push(mark.at); }
+        }
+    }
+    return figures;
+}
+
+const minutesText = (seconds) => (seconds / 60).toLocaleString('en', { maximumFractionDigits: seconds < 600 ? 2 : 1 });
+
+function bar(sum, most) {
+    const cell = element('td', 'bars');
+    for (const which of ['output', 'input']) {
+        const piece = element('div', `piece ${which}`);
+        piece.style.width = `${Math.max(0, sum[which]) / most * 100}%`;
+        cell.append(piece);
+    }
+    return cell;
+}
+
+/** Minutes by name, the longest first; what is beyond the first ones stands together. */
+function barFigure(id, title, sums) {
+    const rows = [...sums].sort((a, b) => (b[1].output + b[1].input) - (a[1].output + a[1].input));
+    const rest = rows.splice(MOST_BARS);
+    if (rest.length > 0) {
+        rows.push([`${rest.length} others`, rest.reduce((all, [, sum]) =>
+            ({ output: all.output + sum.output, input: all.input + sum.input }), { output: 0, input: 0 })]);
+    }
+    const most = Math.max(1e-9, ...rows.map(([, sum]) => Math.max(sum.output, sum.input)));
+    const made = table('figure-bars', '', [title.split(' by ')[1], '', 'output', 'input'], []);
+    for (const [name, sum] of rows) {
+        const head = element('th', '', name);
+        head.scope = 'row';
+        head.title = name;
+        const cells = ['output', 'input'].map((which) => {
+            const cell = element('td', 'number', sum[which] === 0 ? '–' : minutesText(sum[which]));
+            cell.dataset.seconds = sum[which];
+            return cell;
+        });
+        made.tBodies[0].append(element('tr', '', head, bar(sum, most), ...cells));
+    }
+    return figure(id, title, rows.length > 0 ? [made] : []);
+}
+
+function figure(id, title, content) {
+    const made = element('figure', '', element('figcaption', '', title),
+        ...(content.length > 0 ? content : [element('p', 'hint', 'Nothing of this kind was reported.')]));
+    made.id = id;
+    return made;
+}
+
+function svg(name, attributes, ...content) {
+    const made = document.createElementNS('http://www.w3.org/2000/svg', name);
+    for (const [key, value] of Object.entries(attributes)) { made.setAttribute(key, value); }
+    made.append(...content);
+    return made;
+}
+
+/** A round number that is no less. */
+function roundUp(number) {
+    const power = 10 ** Math.floor(Math.log10(number));
+    return [1, 2, 2.5, 5, 10].map((step) => step * power).find((step) => step >= number * 0.9999);
+}
+
+/** Columns `[label, value, title]` with an axis, and the same as a table to open. */
+function columnFigure(id, title, unit, columns, headings, className) {
+    const width = 520, height = 200, left = 44, bottom = 26, top = 10;
+    const most = roundUp(Math.max(1e-9, ...columns.map(([, value]) => value)));
+    const plot = svg('svg', { viewBox: `0 0 ${width} ${height}`, role: 'img', 'aria-label': `${title}; the table below has the figures` });
+    for (const part of [0, 0.5, 1]) {
+        const y = top + (height - top - bottom) * (1 - part);
+        plot.append(svg('line', { x1: left, x2: width, y1: y, y2: y, class: 'grid' }),
+            svg('text', { x: left - 6, y: y + 4, class: 'end' }, `${Number((most * part).toPrecision(3))}`));
+    }
+    const step = (width - left) / columns.length;
+    const every = Math.ceil(64 / step);
+    columns.forEach(([label, value, more], i) => {
+        const tall = (height - top - bottom) * Math.max(0, value) / most;
+        const x = left + i * step;
+        plot.append(svg('rect', { x: x + step * 0.1, y: height - bottom - tall, width: step * 0.8, height: tall, class: className },
+            svg('title', {}, `${more}: ${Number(value.toPrecision(4))} ${unit}`)));
+        if (i % every === 0) { plot.append(svg('text', { x: x + step / 2, y: height - 8, class: i === 0 ? 'start' : 'middle' }, label)); }
+    });
+    const numbers = table('', '', headings, columns.map(([, value, more]) => [more, Number(value.toPrecision(6))]));
+    return figure(id, title, [plot, element('details', '', element('summary', '', 'As a table'), element('div', 'scroll', numbers))]);
+}
+
+function overloadFigure(overloads, shown) {
+    const title = 'Overloads per hour';
+    if (overloads.length === 0) { return figure('figure-overloads', title, []); }
+    let low = Infinity, high = -Infinity;
+    for (const session of shown) {
+        low = Math.min(low, session.low);
+        high = Math.max(high, session.high);
+    }
+    const shift = (report.base * 1000) % DAY;
+    const step = [1, 2, 3, 6, 12, 24, 168, 720, 8760].map((hours) => hours * HOUR)
+        .find((candidate) => (high - low) / candidate < MOST_COLUMNS) ?? (high - low) / MOST_COLUMNS;
+    const start = Math.floor((low + shift) / step) * step - shift;
+    const counts = Array.from({ length: Math.floor((high - start) / step) + 1 }, () => 0);
+    for (const at of overloads) { ++counts[Math.floor((at - start) / step)]; }
+    const columns = counts.map((count, i) => {
+        const text = momentText(start + i * step);
+        return [step < DAY ? text.slice(11, 16) : text.slice(5, 10), count / (step / HOUR), text.slice(0, 16)];
+    });
+    return columnFigure('figure-overloads', title, 'per hour', columns, ['From (UTC)', 'Overloads per hour'], 'overload');
+}
+
+function showFigures(shown) {
+    const figures = figuresOf(shown);
+    const volumes = figures.volume.some((seconds) => seconds > 0)
+        ? columnFigure('figure-volume', 'Minutes of output by volume', 'minutes',
+            figures.volume.map((seconds, i) => [String(Number(VOLUMES[i].toFixed(2))), seconds / 60, `volume ${VOLUMES[i]}`]),
+            ['Volume class', 'Minutes'], 'output')
+        : figure('figure-volume', 'Minutes of output by volume', []);
+    document.querySelector('#figures .plots').replaceChildren(
+        barFigure('figure-application', 'Minutes by application', figures.application),
+        barFigure('figure-device', 'Minutes by device', figures.device),
+        barFigure('figure-route', 'Minutes by route', figures.route),
+        barFigure('figure-service', 'Minutes by service type', figures.service),
+        overloadFigure(figures.overloads, shown), volumes);
+    document.getElementById('figures-of').textContent = shown.length === sessions.length
+        ? `of all ${sessions.length} sessions` : `of the ${shown.length} sessions shown`;
+}
