@@ -63,6 +63,13 @@ extern const Command kCommandNotify;
 extern const Command kCommandPreference;
 extern const Command kCommandDecode;
 extern const Command kCommandKill;
+extern const Command kCommandStatus;
+extern const Command kCommandClients;
+extern const Command kCommandSessions;
+extern const Command kCommandTop;
+
+/// `session show ID`.
+ExitStatus showSession(const Arguments& arguments);
 
 /// Writes `tambloctl: TEXT` to standard error and answers the status, so that a command can return it.
 ExitStatus complain(ExitStatus status, std::string_view text);
