@@ -84,6 +84,13 @@ extern const Command kCommandPreference;
 extern const Command kCommandDecode;
 extern const Command kCommandReport;
 extern const Command kCommandKill;
+extern const Command kCommandStatus;
+extern const Command kCommandClients;
+extern const Command kCommandSessions;
+extern const Command kCommandTop;
+
+/// `session show ID`.
+ExitStatus showSession(const Arguments& arguments);
 
 /// All of them, in the order in which the help lists them.
 [[nodiscard]] std::span<const Command* const> allCommands() noexcept;

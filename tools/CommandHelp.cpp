@@ -9,9 +9,9 @@ namespace tamblo::tools {
 namespace {
 
 constexpr const Command* kCommands[] = {
-    &kCommandSend,   &kCommandSession,    &kCommandReporters, &kCommandValidate,
-    &kCommandTail,   &kCommandDecode,     &kCommandReport,    &kCommandList,
-    &kCommandNotify, &kCommandPreference, &kCommandKill,
+    &kCommandSend,   &kCommandSession, &kCommandReporters, &kCommandValidate, &kCommandTail,
+    &kCommandDecode, &kCommandReport,  &kCommandList,      &kCommandNotify,   &kCommandPreference,
+    &kCommandStatus, &kCommandClients, &kCommandSessions,  &kCommandTop,      &kCommandKill,
 };
 
 constexpr std::size_t kNameColumn = 12;

@@ -234,6 +234,9 @@ void keepSpacing(SessionPlayer::Options& player, std::unique_ptr<std::istream>& 
 }
 
 ExitStatus run(const Arguments& arguments) {
+    if (!arguments.rest().empty() && arguments.rest()[0] == "show") {
+        return showSession(arguments);
+    }
     auto made = makePlan(arguments);
     if (const auto* wrong = std::get_if<std::string>(&made)) {
         return complain(ExitStatus::usage, *wrong);
@@ -261,7 +264,9 @@ constexpr Command kCommandSession{
     "session",
     "make a session, play recorded messages to it, and stop it",
     "--reporter ID [--service-type TYPE] [--configuration JSON] [--play FILE [--speed N | --fast] "
-    "[--sending-times]]",
+    "[--sending-times]] | show ID",
+    "\"session show ID\" shows a session that there is, with --json as JSON; --socket is the status socket "
+    "then.\n"
     "A line of the file: {\"offset_s\": 0.5, \"category\": \"Session_Playback\", \"type\": \"Start\", "
     "\"payload\": {...}}.\n"
     "Messages are sent at their offsets, in seconds since the session's start, or, without those, spaced "
