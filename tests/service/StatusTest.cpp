@@ -135,6 +135,28 @@ TEST(Status, CountersSayWhatBecameOfMessagesAndSurviveAKill) {
     EXPECT_EQ(metricsOf(service)["tamblo_starts_total"], 1);
 }
 
+TEST(Status, IsServedOnTheSecondSocketThatTheServiceManagerPassesOn) {
+    const TemporaryDirectory directory;
+    const int clients = boundSocket(SOCK_STREAM, directory.path("clients"));
+    const int readers = boundSocket(SOCK_STREAM, directory.path("readers"));
+    {
+        const ServiceProcess service({.beforeExec = [clients, readers] {
+            // Whatever numbers they have now.
+            const int second = ::fcntl(readers, F_DUPFD, 64);
+            ::dup2(::fcntl(clients, F_DUPFD, 64), 3);
+            ::dup2(second, 4);
+            ::setenv("LISTEN_PID", std::to_string(::getpid()).c_str(), 1);
+            ::setenv("LISTEN_FDS", "2", 1);
+        }});
+        EXPECT_FALSE(std::filesystem::exists(service.runtimeDirectory() + "/com.vandra.tamblo.status"));
+        EXPECT_TRUE(RawClient(directory.path("clients")).call(Method::getAllReporters));
+        const CommandResult status = service.tambloctl("status --socket " + directory.path("readers"));
+        EXPECT_EQ(status.status, 0) << status.output;
+    }
+    ::close(clients);
+    ::close(readers);
+}
+
 TEST(Status, MetricsHaveTheirForm) {
     const ServiceProcess service;
     const std::string open = statusText(service, "metrics");
