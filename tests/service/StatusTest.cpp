@@ -135,6 +135,28 @@ TEST(Status, CountersSayWhatBecameOfMessagesAndSurviveAKill) {
     EXPECT_EQ(metricsOf(service)["tamblo_starts_total"], 1);
 }
 
+TEST(Status, IsServedOnTheSecondSocketThatTheServiceManagerPassesOn) {
+    const TemporaryDirectory directory;
+    const int clients = boundSocket(SOCK_STREAM, directory.path("clients"));
+    const int readers = boundSocket(SOCK_STREAM, directory.path("readers"));
+    {
+        const ServiceProcess service({.beforeExec = [clients, readers] {
+            // Whatever numbers they have now.
+            const int second = ::fcntl(readers, F_DUPFD, 64);
+            ::dup2(::fcntl(clients, F_DUPFD, 64), 3);
+            ::dup2(second, 4);
+            ::setenv("LISTEN_PID", std::to_string(::getpid()).c_str(), 1);
+            ::setenv("LISTEN_FDS", "2", 1);
+        }});
+        EXPECT_FALSE(std::filesystem::exists(service.runtimeDirectory() + "/com.vandra.tamblo.status"));
+        EXPECT_TRUE(RawClient(directory.path("clients")).call(Method::getAllReporters));
+        const CommandResult status = service.tambloctl("status --socket " + directory.path("readers"));
+        EXPECT_EQ(status.status, 0) << status.output;
+    }
+    ::close(clients);
+    ::close(readers);
+}
+
 TEST(Status, MetricsHaveTheirForm) {
     const ServiceProcess service;
     const std::string open = statusText(service, "metrics");
@@ -181,6 +203,62 @@ TEST(Status, ReadersAreSentOneDocumentAndTheEnd) {
     EXPECT_EQ(json::parse(ended.rest())["clients"].size(), 0U);
     EXPECT_TRUE(statusJson(service, "tea").contains("error"));
     EXPECT_TRUE(statusJson(service, "session x").contains("error"));
+}
+
+TEST(Status, ClientsAndSessionsAreShownWithWhatTheyHave) {
+    const ServiceProcess service;
+    Session session(service.socketPath(), 7);
+    Session other(service.socketPath(), -3, 5);
+    tell(session, 7, 1);
+    tell(session, 7, 2);
+    const json clients = statusJson(service, "clients")["clients"];
+    ASSERT_EQ(clients.size(), 2U);
+    EXPECT_EQ(clients[0]["pid"], ::getpid());
+    EXPECT_EQ(clients[0]["messages"], 2);
+    EXPECT_EQ(clients[1]["messages"], 0);
+    EXPECT_GT(clients[0]["bytes"], clients[1]["bytes"]);
+    EXPECT_GT(clients[0]["seconds"], 0);
+    EXPECT_EQ(clients[0]["started_sessions"], 1);
+    const json sessions = statusJson(service, "sessions")["sessions"];
+    ASSERT_EQ(sessions.size(), 2U);
+    EXPECT_EQ(sessions[0]["reporter"], 7);
+    EXPECT_EQ(sessions[0]["recorded"], 2);
+    EXPECT_EQ(sessions[1]["reporter"], -3);
+    EXPECT_EQ(sessions[0]["retained_bytes"], clients[0]["retained_bytes"]);
+    const json shown = statusJson(service, "session 7")["sessions"];
+    ASSERT_EQ(shown.size(), 1U);
+    EXPECT_EQ(shown[0]["previous_values"]["volume"], 2);
+    EXPECT_FALSE(shown[0]["workers"].empty());
+    EXPECT_TRUE(statusJson(service, "session 8")["sessions"].empty());
+
+    EXPECT_EQ(json::parse(service.tambloctl("sessions --json").output)["sessions"].size(), 2U);
+    EXPECT_NE(service.tambloctl("session show 7").output.find("\"speaker\""), std::string::npos);
+    EXPECT_EQ(service.tambloctl("session show 8").status, 1);
+    const CommandResult status = service.tambloctl("status");
+    EXPECT_NE(status.output.find("2 clients, 2 sessions"), std::string::npos) << status.output;
+    EXPECT_EQ(status.status, 0);
+    // No terminal: one picture below the other, and no key is waited for.
+    const CommandResult top = service.tambloctl("top --count 2 --interval 0.1 --sessions --sort retained");
+    EXPECT_EQ(countOf("2 sessions by retained", top.output), 2U) << top.output;
+    EXPECT_EQ(service.tambloctl("top --sort tea").status, 2);
+}
+
+TEST(Status, AReaderThatNeverReadsIsLetGoAndTenThousandSessionsAreListed) {
+    const ServiceProcess service;
+    RawClient client(service.socketPath());
+    for (std::int64_t i = 1; i <= 10'000; ++i) {
+        ASSERT_TRUE(client.send(framesOf(request(Method::createReportingSession, i))));
+    }
+    ASSERT_TRUE(client.call(Method::reporterID, 1));
+    const StatusReader stuck(service);
+    stuck.send("sessions\n");
+    const json all = statusJson(service, "sessions");
+    ASSERT_EQ(all["sessions"].size(), 10'000U);
+    EXPECT_EQ(all["sessions"][9'999]["reporter"], 10'000);
+    EXPECT_TRUE(eventually([&] {
+        return metricsOf(service)[R"(tamblo_status_readers_let_go_total{reason="does_not_read"})"] == 1;
+    }));
+    EXPECT_LT(stuck.rest().size(), 2'000'000U);
 }
 
 TEST(Status, SixteenReadersAreServedAndOthersAreTold) {

@@ -222,6 +222,7 @@ void LinuxConnection::takeFrames(std::span<const std::uint8_t> received) {
         ++requests;
     }
     if (ending_ == Ending::none && frames.tooLong()) {
+        counters::add(counters::Counter::requestsRefusedNotARequest);
         refuse({.endsConnection = true,
                 .error = {std::string(kProtocolErrorDomain), wire::kNotARequest,
                           "a frame is longer than 1 MiB"}});

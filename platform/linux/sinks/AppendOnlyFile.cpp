@@ -339,6 +339,8 @@ bool AppendOnlyFile::rotate() {
     while (free < kKeptFiles && operations_.status(directory, numbered(free).c_str(), status) == 0) {
         ++free;
     }
+    const bool pushesOut =
+        free == kKeptFiles && operations_.status(directory, numbered(free).c_str(), status) == 0;
     for (int number = free; number > 0; --number) {
         if (operations_.rename(directory, numbered(number - 1).c_str(), numbered(number).c_str()) != 0) {
             const bool result = failed("rename");
@@ -346,6 +348,7 @@ bool AppendOnlyFile::rotate() {
             return result;
         }
     }
+    counters::add(counters::Counter::sinkFilesRemoved, pushesOut ? 1 : 0);
     closeFile();
     return true;
 }

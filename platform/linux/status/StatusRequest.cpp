@@ -69,7 +69,7 @@ StatusQuestion StatusQuestion::of(std::string_view received) {
     }
     question.isHttp = true;
     question.takesOpenMetrics = received.find(kOpenMetricsType) != received.npos;
-    std::string path = question.line.substr(kHttpMethod.size());
+    std::string path(trimmed(firstLine(received).substr(kHttpMethod.size())));
     path.resize(std::min(path.find_first_of(" ?"), path.size()));
     std::ranges::replace(path, '/', ' ');
     question.line = trimmed(path);

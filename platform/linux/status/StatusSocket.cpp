@@ -33,6 +33,8 @@ constexpr milliseconds kTimeForLine{2000};
 /// For what the server queue is asked; and for each time that a reader takes something.
 constexpr milliseconds kTimeForAnswer{5000};
 constexpr milliseconds kTimeForReading{5000};
+/// However steadily it reads: others wait for its place.
+constexpr milliseconds kTimeForReader{30000};
 /// How long accepting rests when no descriptors are left.
 constexpr milliseconds kAcceptPause{100};
 /// A line, or the headers of a request.
@@ -74,6 +76,7 @@ struct StatusSocket::Reader {
 
     FileDescriptor socket{};
     Time deadline{};
+    Time ends{};
     State state = State::asking;
     std::string received{};
     StatusQuestion question{};
@@ -202,8 +205,9 @@ void StatusSocket::acceptReaders() {
             continue;
         }
         counters::add(counters::Counter::statusReaders);
+        const Time now = std::chrono::steady_clock::now();
         readers_.push_back(
-            {.socket = std::move(socket), .deadline = std::chrono::steady_clock::now() + kSilence});
+            {.socket = std::move(socket), .deadline = now + kSilence, .ends = now + kTimeForReader});
     }
 }
 
@@ -292,7 +296,7 @@ void StatusSocket::takeAnswer(Reader& reader, Time now) {
     }
     reader.answer.reset();
     reader.state = Reader::State::reading;
-    reader.deadline = now + kTimeForReading;
+    reader.deadline = std::min(now + kTimeForReading, reader.ends);
 }
 
 void StatusSocket::send(Reader& reader, Time now) {
@@ -300,7 +304,7 @@ void StatusSocket::send(Reader& reader, Time now) {
     const ssize_t count = ::send(reader.socket.get(), rest.data(), rest.size(), MSG_DONTWAIT | MSG_NOSIGNAL);
     if (count > 0) {
         reader.sent += static_cast<std::size_t>(count);
-        reader.deadline = now + kTimeForReading;
+        reader.deadline = std::min(now + kTimeForReading, reader.ends);
     }
     const bool isRefused = count < 0 && errno != EAGAIN && errno != EINTR;
     if (reader.deadline <= now) {
