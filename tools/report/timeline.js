@@ -4,6 +4,7 @@ const ROW = 26;
 const AXIS = 40;
 const LANE = 24;
 const LEAST_HEIGHT = 240;
+const DENSE = 200;
 const HIT = 7;
 const SECOND = 1000, MINUTE = 60 * SECOND, HOUR = 60 * MINUTE, DAY = 24 * HOUR;
 const STEPS = [1, 2, 5, 10, 20, 50, 100, 200, 500, SECOND, 2 * SECOND, 5 * SECOND, 10 * SECOND, 15 * SECOND,
@@ -32,6 +33,7 @@ class Timeline {
         this.isPrinting = false;
         this.frames = 0;
         this.lane = deviceEvents.length > 0 ? LANE : 0;
+        this.measure();
         this.readColours();
         new ResizeObserver(() => this.draw()).observe(this.box);
         this.box.addEventListener('scroll', () => this.draw());
@@ -50,8 +52,11 @@ class Timeline {
     }
 
     get top() { return AXIS + this.lane; }
-    get labels() { return this.box.clientWidth < 600 ? 116 : 230; }
-    get width() { return Math.max(50, this.box.clientWidth - this.labels); }
+    /** Asking the browser for each mark anew would take longer than drawing it. */
+    measure() {
+        this.labels = this.box.clientWidth < 600 ? 116 : 230;
+        this.width = Math.max(50, this.box.clientWidth - this.labels);
+    }
     x(at) { return this.labels + (at - this.start) / this.span * this.width; }
     at(x) { return this.start + (x - this.labels) / this.width * this.span; }
 
@@ -137,6 +142,7 @@ class Timeline {
 
     paint() {
         const { context, box, canvas } = this;
+        this.measure();
         this.chooseRows();
         const ratio = window.devicePixelRatio || 1;
         const width = box.clientWidth, height = box.clientHeight;
@@ -255,21 +261,30 @@ class Timeline {
         }
         this.paintBar(session, y);
         for (const stretch of session.stretches) { this.paintStretch(stretch, y); }
-        // Marks of one kind that fall together are drawn once.
-        const last = MARKS.map(() => -Infinity);
-        for (const mark of session.marks) {
-            const x = this.x(mark.at);
-            if (x >= labels && x <= right && x - last[mark.kind] >= 1.5) {
-                last[mark.kind] = x;
-                this.paintMark(mark.kind, x, y + ROW / 2);
-            }
-        }
+        this.paintMarks(session, y, right);
         if (session === this.selected && this.mark !== null) {
             context.strokeStyle = colours.text;
             context.lineWidth = 2;
             context.beginPath();
             context.arc(this.x(this.mark.at), y + ROW / 2, 9, 0, 2 * Math.PI);
             context.stroke();
+        }
+    }
+
+    /** Marks of one kind that fall together are drawn once; very many, as lines. */
+    paintMarks({ marks }, y, right) {
+        const isDense = marks.length > DENSE;
+        const last = MARKS.map(() => -Infinity);
+        for (const { at, kind } of marks) {
+            const x = this.x(at);
+            if (x < this.labels || x > right || x - last[kind] < (isDense ? 3 : 1.5)) { continue; }
+            last[kind] = x;
+            if (isDense) {
+                this.context.fillStyle = this.colours[MARKS[kind].name];
+                this.context.fillRect(x - 1, y + 3 + kind * 5, 2, 5);
+            } else {
+                this.paintMark(kind, x, y + ROW / 2);
+            }
         }
     }
 
