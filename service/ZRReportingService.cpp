@@ -22,6 +22,9 @@ constexpr std::chrono::seconds kPatienceWithStops{3};
 /// A message to all started sessions looks for so many of them at a time.
 constexpr std::size_t kSessionsFoundAtOnce = 32;
 
+/// The process name of the command-line client, whose connections are no audio component's.
+constexpr std::string_view kToolName = "tambloctl";
+
 /// Seconds from the start to the end, either way round; −1 without a start.
 Value uptimeBetween(const std::optional<WallTime>& start, WallTime end, pid_t processIdentifier,
                     const std::string& name) {
@@ -59,6 +62,9 @@ void reportClientUptime(const Context& context, const ClientRef& client, pid_t p
         log::standard(ZRReportingServiceDelegateCategory(), "clientProcessName is nil. clientpid={}",
                       processIdentifier);
         return;
+    }
+    if (*knownName == kToolName) {
+        return; // looking at what is reported should not add to it
     }
     context.platform().analyticsEvents->sendEventLazy("com.vandra.tamblo.zrreportingclientuptime", [&] {
         return Dictionary{{"processName", name}, {"seconds", uptime}};

@@ -1,6 +1,7 @@
 #include "base/Format.h"
 #include "os/FileDescriptor.h"
 #include "os/SmallFile.h"
+#include "tools/AccessFault.h"
 #include "tools/Command.h"
 #include "tools/Decode.h"
 
@@ -18,8 +19,8 @@ namespace {
 constexpr std::size_t kLargestInput = 1U << 30U;
 
 constexpr Option kOptions[] = {
-    {"--kind", "KIND", "record, line or frame; guessed without it"},
-    {"--file", "FILE", "decode what the file holds"},
+    {.name = "--kind", .value = "KIND", .help = "record, line or frame; guessed without it", .letter = 'k'},
+    {.name = "--file", .value = "FILE", .help = "decode what the file holds", .letter = 'f'},
 };
 
 ExitStatus run(const Arguments& arguments) {
@@ -44,7 +45,9 @@ ExitStatus run(const Arguments& arguments) {
         const FileDescriptor opened(::open(path.c_str(), O_RDONLY | O_CLOEXEC));
         SmallFile content = opened.isOpen() ? SmallFile::read(opened.get(), kLargestInput) : SmallFile{errno};
         if (content.error != 0) {
-            return complain(ExitStatus::usage, formatted("cannot read {}: {}", path, content.reason()));
+            return complain(ExitStatus::usage, formatted("cannot read {}: {}", path,
+                                                         content.error == EACCES ? describeFault(EACCES, path)
+                                                                                 : content.reason()));
         }
         input = std::move(content.text);
     }

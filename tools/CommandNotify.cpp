@@ -1,13 +1,13 @@
 #include "base/Format.h"
 #include "base/NumberText.h"
-#include "os/Directory.h"
 #include "os/ReplaceFile.h"
 #include "os/SmallFile.h"
+#include "tools/AccessFault.h"
 #include "tools/Command.h"
 #include "wire/Directories.h"
 
+#include <cerrno>
 #include <string>
-#include <system_error>
 
 namespace tamblo::tools {
 
@@ -40,13 +40,16 @@ ExitStatus run(const Arguments& arguments) {
         return complain(ExitStatus::usage,
                         formatted("\"{}\" is no state: it is an unsigned 64-bit number", words[1]));
     }
-    int failure = makeDirectories(directories.notifications());
-    if (failure == 0) {
-        failure = replaceFileAtomically(path, formatted("{}\n", *state));
+    const int failure = replaceFileAtomically(path, formatted("{}\n", *state));
+    if (failure == ENOENT || failure == ENOTDIR) {
+        return complain(
+            ExitStatus::unreachable,
+            formatted("there is no {}, which the service makes: start tamblod, or set RUNTIME_DIRECTORY",
+                      directories.notifications()));
     }
     return failure == 0 ? ExitStatus::done
-                        : complain(ExitStatus::failed, formatted("cannot write {}: {}", path,
-                                                                 std::generic_category().message(failure)));
+                        : complain(ExitStatus::failed,
+                                   formatted("cannot write {}: {}", path, describeFault(failure, path)));
 }
 
 } // namespace

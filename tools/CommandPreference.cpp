@@ -2,17 +2,40 @@
 #include "base/Json.h"
 #include "os/Directory.h"
 #include "os/PreferenceFile.h"
+#include "tools/AccessFault.h"
 #include "tools/Command.h"
+#include "tools/KnownSettings.h"
 #include "wire/Directories.h"
 
+#include <cerrno>
+#include <functional>
+#include <optional>
 #include <string>
-#include <system_error>
 
 namespace tamblo::tools {
 
 namespace {
 
 using Words = std::span<const std::string_view>;
+
+constexpr Option kOptions[] = {
+    {.name = "--force", .value = "", .help = "set what the service would not take, too"},
+};
+
+/// The JSON that the text is, else the text itself.
+Value valueOf(std::string_view text) {
+    const auto json = readJson(text);
+    const Value* const value = std::get_if<Value>(&json);
+    return value != nullptr ? *value : Value(text);
+}
+
+/// What went wrong with the file, with its owner where that is what stands in the way.
+ExitStatus complainOfFile(const PreferenceFile& file, std::string_view fault) {
+    const bool isDenied = faultOfReading(file.path()) == EACCES;
+    return complain(ExitStatus::failed, isDenied ? formatted("cannot read {}: {}", file.path(),
+                                                             describeFault(EACCES, file.path()))
+                                                 : std::string(fault));
+}
 
 ExitStatus complainOfKey(const PreferenceFile& file, std::string_view key) {
     return complain(ExitStatus::failed, formatted("{} has no key \"{}\"", file.path(), key));
@@ -21,7 +44,7 @@ ExitStatus complainOfKey(const PreferenceFile& file, std::string_view key) {
 ExitStatus get(const PreferenceFile& file, Words rest) {
     const auto content = file.read();
     if (const auto* fault = std::get_if<std::string>(&content)) {
-        return complain(ExitStatus::failed, *fault);
+        return complainOfFile(file, *fault);
     }
     const auto& values = std::get<Dictionary>(content);
     const Value* const value = rest.empty() ? nullptr : values.find(rest[0]);
@@ -34,14 +57,29 @@ ExitStatus get(const PreferenceFile& file, Words rest) {
 
 ExitStatus edit(const PreferenceFile& file, const std::function<bool(Dictionary&)>& change) {
     const auto fault = file.edit(change);
-    return fault ? complain(ExitStatus::failed, *fault) : ExitStatus::done;
+    return fault ? complainOfFile(file, *fault) : ExitStatus::done;
 }
 
-ExitStatus set(const PreferenceFile& file, std::string_view key, std::string_view text) {
-    const auto json = readJson(text);
-    const Value* const value = std::get_if<Value>(&json);
+/// The status to exit with for a value that the service would not take; a note on a key that it does not
+/// read.
+std::optional<ExitStatus> check(std::string_view domain, std::string_view key, const Value& value) {
+    const KnownPreference* const known = findKnownPreference(domain, key);
+    if (known != nullptr && !isOfKind(known->kind, value)) {
+        return complain(ExitStatus::usage,
+                        formatted("{} {} is {}, not {}; nothing was changed (--force sets it)", domain, key,
+                                  describe(known->kind), jsonText(value)));
+    }
+    if (known == nullptr && isServiceDomain(domain)) {
+        complain(ExitStatus::done, formatted("note: the service reads no \"{}\" of {}; \"tambloctl list "
+                                             "preferences\" has what it reads",
+                                             key, domain));
+    }
+    return std::nullopt;
+}
+
+ExitStatus set(const PreferenceFile& file, std::string_view key, const Value& value) {
     return edit(file, [&](Dictionary& values) {
-        values.set(key, value != nullptr ? *value : Value(text));
+        values.set(key, value);
         return true;
     });
 }
@@ -74,11 +112,17 @@ ExitStatus run(const Arguments& arguments) {
     if (isGet) {
         return get(*file, words.subspan(2));
     }
+    const Value value = isSet ? valueOf(words[3]) : Value(false);
+    if (isSet && !arguments.has("--force")) {
+        if (const auto failure = check(words[1], words[2], value)) {
+            return *failure;
+        }
+    }
     if (const int failure = makeDirectories(directories.preferences())) {
         return complain(ExitStatus::failed, formatted("cannot create {}: {}", directories.preferences(),
-                                                      std::generic_category().message(failure)));
+                                                      describeFault(failure, directories.preferences())));
     }
-    return isSet ? set(*file, words[2], words[3]) : unset(*file, words[2]);
+    return isSet ? set(*file, words[2], value) : unset(*file, words[2]);
 }
 
 } // namespace
@@ -89,8 +133,10 @@ constexpr Command kCommandPreference{
     "get DOMAIN [KEY] | set DOMAIN KEY VALUE | unset DOMAIN KEY",
     "A VALUE that is JSON is taken as such (true, 5, [\"a\",\"b\"]); any other is a text. What is printed is "
     "JSON.\n"
-    "A file that is not a JSON object is not touched.",
-    {},
+    "A file that is not a JSON object is not touched, and a value of a kind that the service does not take "
+    "for the\n"
+    "key is refused; \"tambloctl list preferences\" has the keys.",
+    kOptions,
     run,
 };
 

@@ -1,6 +1,7 @@
 #include "base/Format.h"
 #include "base/Json.h"
 #include "base/NumberText.h"
+#include "tools/AccessFault.h"
 #include "tools/Command.h"
 #include "tools/Payload.h"
 #include "tools/ServiceConnection.h"
@@ -8,11 +9,15 @@
 #include "tools/SessionSummaries.h"
 #include "wire/Directories.h"
 
+#include <cerrno>
 #include <cmath>
 #include <fstream>
 #include <iostream>
 #include <memory>
+#include <sstream>
+#include <utility>
 
+#include <sys/stat.h>
 #include <unistd.h>
 
 namespace tamblo::tools {
@@ -20,17 +25,37 @@ namespace tamblo::tools {
 namespace {
 
 constexpr Option kOptions[] = {
-    {"--reporter", "ID", "the session's reporter, not 0; needed"},
-    {"--service-type", "TYPE", "by name (longformaudio) or number (generic)"},
-    {"--configuration", "JSON", "an object"},
-    {"--play", "FILE", "the messages, JSON lines; - is standard input; without it none are sent"},
-    {"--speed", "N", "play N times as fast as recorded"},
-    {"--fast", "", "play as fast as the service takes the messages"},
-    {"--restamp", "", "give every message a fresh timestamp, not just those without one"},
-    {"--recorded-spacing", "",
-     "give timestamps as far apart as recorded, at any speed; the last is the present"},
-    {"--progress", "", "show progress though standard error is no terminal"},
-    {"--quiet", "", "no progress, no report and no summaries"},
+    {.name = "--reporter", .value = "ID", .help = "the session's reporter, not 0; needed", .letter = 'r'},
+    {.name = "--service-type",
+     .value = "TYPE",
+     .help = "by name (longformaudio) or number (generic)",
+     .letter = 't'},
+    {.name = "--configuration", .value = "JSON", .help = "an object", .letter = 'c'},
+    {.name = "--play",
+     .value = "FILE",
+     .help = "the messages, JSON lines; - is standard input; without it none are sent",
+     .letter = 'p'},
+    {.name = "--speed",
+     .value = "N",
+     .help = "play N times as fast as recorded",
+     .letter = 's',
+     .excludes = "--fast"},
+    {.name = "--fast", .value = "", .help = "play as fast as the service takes the messages", .letter = 'f'},
+    {.name = "--restamp",
+     .value = "",
+     .help = "give every message a fresh timestamp, not just those without one"},
+    {.name = "--sending-times",
+     .value = "",
+     .help = "stamp messages with the times at which they are sent, however much faster that is"},
+    {.name = "--progress",
+     .value = "",
+     .help = "show progress though standard error is no terminal",
+     .excludes = "--quiet"},
+    {.name = "--quiet",
+     .value = "",
+     .help = "no progress, no report and no summaries",
+     .letter = 'q',
+     .excludes = "--json"},
     kJsonOption,
     kSocketOption,
     kTimeoutOption,
@@ -176,33 +201,58 @@ ExitStatus playAndStop(ServiceConnection& service, const Arguments& arguments, c
                                                                                 : ExitStatus::failed;
 }
 
+/// Opens what is to be played, if anything is.
+std::optional<ExitStatus> openLines(const std::string& file, std::unique_ptr<std::istream>& lines) {
+    if (file == "-") {
+        lines = std::make_unique<std::istream>(std::cin.rdbuf());
+        return std::nullopt;
+    }
+    if (file.empty()) {
+        return std::nullopt;
+    }
+    struct stat status {};
+    const bool isDirectory = ::stat(file.c_str(), &status) == 0 && S_ISDIR(status.st_mode);
+    if (const int fault = isDirectory ? EISDIR : faultOfReading(file)) {
+        return complain(ExitStatus::usage, formatted("cannot read {}: {}", file, describeFault(fault, file)));
+    }
+    lines = std::make_unique<std::ifstream>(file);
+    return std::nullopt;
+}
+
+/// Has timestamps lie as far apart as recorded, which takes the recording's length; what cannot be read twice
+/// is kept.
+void keepSpacing(SessionPlayer::Options& player, std::unique_ptr<std::istream>& lines) {
+    const bool canBeReadTwice = static_cast<bool>(lines->seekg(0));
+    lines->clear();
+    if (!canBeReadTwice) {
+        auto kept = std::make_unique<std::stringstream>();
+        *kept << lines->rdbuf();
+        kept->clear();
+        lines = std::move(kept);
+    }
+    player.recordedLength = recordedLength(*lines);
+}
+
 ExitStatus run(const Arguments& arguments) {
     auto made = makePlan(arguments);
     if (const auto* wrong = std::get_if<std::string>(&made)) {
         return complain(ExitStatus::usage, *wrong);
     }
     Plan& plan = std::get<Plan>(made);
-    std::ifstream file;
-    std::istream* lines = plan.file == "-" ? &std::cin : nullptr;
-    if (!plan.file.empty() && lines == nullptr) {
-        file.open(plan.file);
-        if (!file) {
-            return complain(ExitStatus::usage, formatted("cannot read {}", plan.file));
-        }
-        lines = &file;
+    std::unique_ptr<std::istream> lines;
+    if (const auto failure = openLines(plan.file, lines)) {
+        return *failure;
     }
-    if (arguments.has("--recorded-spacing") && lines != nullptr) {
-        plan.player.recordedLength = recordedLength(*lines);
-        if (!plan.player.recordedLength) {
-            return complain(ExitStatus::usage, "--recorded-spacing needs a file that can be read twice");
-        }
+    const bool playsFaster = !plan.player.speed || *plan.player.speed != 1;
+    if (lines != nullptr && playsFaster && !arguments.has("--sending-times")) {
+        keepSpacing(plan.player, lines);
     }
     ServiceConnection service(arguments);
     if (const auto failure = service.connect()) {
         return *failure;
     }
     plan.player.timeout = service.timeout();
-    return playAndStop(service, arguments, plan, lines);
+    return playAndStop(service, arguments, plan, lines.get());
 }
 
 } // namespace
@@ -210,18 +260,22 @@ ExitStatus run(const Arguments& arguments) {
 constexpr Command kCommandSession{
     "session",
     "make a session, play recorded messages to it, and stop it",
-    "--reporter ID [--service-type TYPE] [--configuration JSON] [--play FILE [--speed N | --fast]]",
+    "--reporter ID [--service-type TYPE] [--configuration JSON] [--play FILE [--speed N | --fast] "
+    "[--sending-times]]",
     "A line of the file: {\"offset_s\": 0.5, \"category\": \"Session_Playback\", \"type\": \"Start\", "
     "\"payload\": {...}}.\n"
     "Messages are sent at their offsets, in seconds since the session's start, or, without those, spaced "
-    "like their\n"
-    "payloads' zrreporting_timestamp. In the end it prints what the service derived from the session, as it "
-    "stands in\n"
-    "LOGS_DIRECTORY/analytics-events.jsonl: of sessions of one application and service type that stop at "
-    "the same moment,\n"
-    "it may be another one's. Exits with 1 when a message was refused or the held reply to the start did not "
-    "come, with\n"
-    "2 at a line that cannot be read (the session is stopped first).",
+    "like\n"
+    "their payloads' zrreporting_timestamp. Played faster, they get timestamps that lie as far apart as "
+    "recorded,\n"
+    "the last one's being the present: stretches keep their lengths, and the session seems to have begun "
+    "earlier.\n"
+    "In the end it prints the summaries that the service derived from the session. They are looked up in\n"
+    "LOGS_DIRECTORY/analytics-events.jsonl by application, service type and time; if two such sessions stop "
+    "at\n"
+    "the same moment, they can be mixed up. Exits with 1 when a message was refused or the held reply to "
+    "the\n"
+    "start did not come, with 2 at a line that cannot be read (the session is stopped first).",
     kOptions,
     run,
 };

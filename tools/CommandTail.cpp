@@ -3,15 +3,22 @@
 #include "base/NumberText.h"
 #include "base/Rfc3339.h"
 #include "os/FileDescriptor.h"
+#include "tools/AccessFault.h"
 #include "tools/Command.h"
+#include "tools/Decode.h"
 #include "tools/Payload.h"
+#include "tools/RecordFilter.h"
 #include "tools/ServiceConnection.h"
 #include "tools/SinkFile.h"
+#include "tools/TimeText.h"
 #include "wire/Directories.h"
 
 #include <algorithm>
+#include <cerrno>
+#include <chrono>
 #include <cstdio>
 #include <deque>
+#include <limits>
 #include <map>
 
 #include <poll.h>
@@ -23,69 +30,167 @@ namespace tamblo::tools {
 namespace {
 
 constexpr Option kOptions[] = {
-    {"--lines", "N", "the last N lines that match (10)"},
-    {"--follow", "", "go on with what is written from now on, through the file's renaming"},
-    {"--event", "NAME", "only this event; a trailing * stands for anything; may be given several times"},
-    {"--key", "KEY[=VALUE]",
-     "only lines whose payload has the key, with the value; may be given several times"},
-    {"--reporter", "ID", "only lines that name this reporter (the key reporterid)"},
-    {"--summary", "", "print how often each event stands in the file and its predecessors, and end"},
-    {"--json", "", "print the lines as they stand in the file, or the summary as JSON"},
+    {.name = "--lines",
+     .value = "N",
+     .help = "the last N lines that match (10; with --since or --until all)",
+     .letter = 'n'},
+    {.name = "--follow",
+     .value = "",
+     .help = "go on with what is written from now on, through the file's renaming",
+     .letter = 'f',
+     .excludes = "--summary --until"},
+    {.name = "--event",
+     .value = "NAME",
+     .help = "only this event; a trailing * stands for anything; may be given several times",
+     .letter = 'e',
+     .isRepeatable = true},
+    {.name = "--key",
+     .value = "KEY[=VALUE]",
+     .help = "only lines whose payload has the key, with the value; may be given several times",
+     .letter = 'k',
+     .isRepeatable = true},
+    {.name = "--reporter",
+     .value = "ID",
+     .help = "only lines of this reporter's sessions; FILE is then call-quality, if none is given",
+     .letter = 'r'},
+    {.name = "--since", .value = "TIME", .help = "only lines of this time and later", .letter = 'S'},
+    {.name = "--until", .value = "TIME", .help = "only lines of before this time", .letter = 'U'},
+    {.name = "--summary",
+     .value = "",
+     .help = "print how often each event stands in the file and its predecessors, and end",
+     .letter = 's',
+     .excludes = "--lines --wide"},
+    {.name = "--wide",
+     .value = "",
+     .help = "print each entry of a line on a line of its own",
+     .letter = 'w',
+     .excludes = "--json"},
+    {.name = "--json",
+     .value = "",
+     .help = "print the lines as they stand in the file, or the summary as JSON",
+     .letter = 'j'},
 };
+
+constexpr std::size_t kAllLines = std::numeric_limits<std::size_t>::max();
 
 struct Plan {
     std::string path;
     RecordFilter filter;
-    std::size_t lines = 10;
+    std::size_t lines = 10; ///< the most of what is there already
     bool follows = false;
     bool printsJson = false;
+    bool isWide = false;
 };
+
+std::optional<std::string> takeFilter(RecordFilter& filter, const Arguments& arguments) {
+    for (const std::string_view event : arguments.all("--event")) {
+        filter.wantEvent(event);
+    }
+    for (const std::string_view key : arguments.all("--key")) {
+        filter.wantKey(key);
+    }
+    if (const auto text = arguments.last("--reporter")) {
+        const auto reporter = parseNumber<std::int64_t>(*text);
+        if (!reporter) {
+            return notAReporterID(*text);
+        }
+        filter.wantReporter(*reporter);
+    }
+    const double now =
+        std::chrono::duration<double>(std::chrono::system_clock::now().time_since_epoch()).count();
+    for (const std::string_view option : {"--since", "--until"}) {
+        const auto text = arguments.last(option);
+        const auto moment = text ? parseMoment(*text, now) : std::nullopt;
+        if (text && !moment) {
+            return formatted("{} needs a time: 2026-03-01T12:00, 5m (so long ago), or seconds since 1970",
+                             option);
+        }
+        if (moment && option == "--since") {
+            filter.wantSince(*moment);
+        } else if (moment) {
+            filter.wantUntil(*moment);
+        }
+    }
+    return std::nullopt;
+}
+
+/// What speaks against the file: a name that no sink has, or one whose lines name no reporter.
+std::optional<std::string> faultOfFile(const Plan& plan, std::string_view typed) {
+    const KnownSink* const sink = findKnownSink(plan.path);
+    if (sink == nullptr && typed.find('/') == std::string_view::npos && filesOfSink(plan.path).empty() &&
+        faultOfReading(plan.path) == ENOENT) {
+        return formatted(
+            "\"{}\" is no report sink; \"tambloctl list sinks\" has them, and a path has a slash", typed);
+    }
+    if (sink != nullptr && !sink->namesReporter && plan.filter.wantsReporter()) {
+        return formatted(
+            "the lines of {} name no reporter; those of call-quality do, and have every message of a "
+            "session, and those of memory-log",
+            sink->name);
+    }
+    return std::nullopt;
+}
 
 std::variant<Plan, std::string> makePlan(const Arguments& arguments) {
     if (arguments.rest().size() > 1) {
         return std::string("tail takes one file");
     }
     Plan plan;
-    const std::string_view typed = arguments.rest().empty() ? "analytics-events" : arguments.rest()[0];
+    if (auto wrong = takeFilter(plan.filter, arguments)) {
+        return *std::move(wrong);
+    }
+    const std::string_view usual = plan.filter.wantsReporter() ? "call-quality" : "analytics-events";
+    const std::string_view typed = arguments.rest().empty() ? usual : arguments.rest()[0];
     const auto directories = wire::Directories::ofThisProcess();
     if (directories.logs.empty()) {
         return std::string("the logs directory is not known: set LOGS_DIRECTORY");
     }
     plan.path = sinkPath(directories.logs, typed);
+    if (auto wrong = faultOfFile(plan, typed)) {
+        return *std::move(wrong);
+    }
     if (const auto text = arguments.last("--lines")) {
         const auto lines = parseDecimalOrHex<std::uint64_t>(*text);
         if (!lines) {
             return std::string("--lines needs a number");
         }
         plan.lines = *lines;
-    }
-    for (const std::string_view event : arguments.all("--event")) {
-        plan.filter.wantEvent(event);
-    }
-    for (const std::string_view key : arguments.all("--key")) {
-        plan.filter.wantKey(key);
-    }
-    if (const auto text = arguments.last("--reporter")) {
-        if (!parseNumber<std::int64_t>(*text)) {
-            return formatted("\"{}\" is no reporter ID: it is a signed 64-bit number", *text);
-        }
-        plan.filter.wantKey("reporterid=" + std::string(*text));
+    } else if (arguments.has("--since") || arguments.has("--until")) {
+        plan.lines = kAllLines;
     }
     plan.follows = arguments.has("--follow");
     plan.printsJson = arguments.has("--json");
+    plan.isWide = arguments.has("--wide");
     return plan;
 }
 
 /// The record in the line when it is one, and wanted.
-std::optional<Dictionary> wantedRecord(const Plan& plan, std::string_view line) {
+std::optional<Dictionary> wantedRecord(Plan& plan, std::string_view line) {
     auto record = parseJsonObject(line);
-    if (auto* fields = std::get_if<Dictionary>(&record); fields != nullptr && plan.filter.accepts(*fields)) {
-        return std::move(*fields);
+    auto* const fields = std::get_if<Dictionary>(&record);
+    if (fields == nullptr) {
+        return std::nullopt;
     }
-    return std::nullopt;
+    plan.filter.noteSession(*fields);
+    return plan.filter.accepts(*fields) ? std::optional(std::move(*fields)) : std::nullopt;
 }
 
-void printRecord(const Plan& plan, std::string_view line) {
+/// Finds the sessions of the reporter that is asked for, before the lines are read from the end.
+void noteSessions(Plan& plan) {
+    if (!plan.filter.wantsReporter()) {
+        return;
+    }
+    LineFunction note = [&plan](std::string_view line) {
+        if (line.find(R"("op":"open")") != std::string_view::npos) {
+            (void)wantedRecord(plan, line);
+        }
+    };
+    for (const std::string& file : filesOfSink(plan.path)) {
+        readLines(file, note);
+    }
+}
+
+void printRecord(Plan& plan, std::string_view line) {
     const auto record = wantedRecord(plan, line);
     if (!record) {
         return;
@@ -94,10 +199,18 @@ void printRecord(const Plan& plan, std::string_view line) {
         printLine(line);
         return;
     }
+    if (plan.isWide) {
+        const std::string text = decode(line, EncodedKind::line).text;
+        std::fwrite(text.data(), 1, text.size(), stdout);
+        return;
+    }
     const Value* time = record->find("time");
     Dictionary rest = *record;
     rest.remove("time");
     rest.remove("event");
+    if (const auto fields = fieldsOfMetric(*record)) {
+        rest.set("record", *fields);
+    }
     const Value* payload = rest.find("payload");
     const bool isJustPayload = rest.size() == 1 && payload != nullptr;
     printLine(formatted("{} {} {}", formatRfc3339(time == nullptr ? 0 : time->doubleValue()).value_or("-"),
@@ -106,7 +219,7 @@ void printRecord(const Plan& plan, std::string_view line) {
 
 /// The last lines that match, from as few of the files as have them. The follower reads the newest file, and
 /// goes on right behind what was found.
-std::deque<std::string> lastLines(const Plan& plan, SinkFollower& follower) {
+std::deque<std::string> lastLines(Plan& plan, SinkFollower& follower) {
     std::deque<std::string> found;
     std::deque<std::string> ofFile;
     LineFunction take = [&](std::string_view line) {
@@ -135,17 +248,37 @@ std::deque<std::string> lastLines(const Plan& plan, SinkFollower& follower) {
     return found;
 }
 
-ExitStatus follow(const Plan& plan) {
+/// What is there already and wanted. The follower goes on behind it.
+void printPresent(Plan& plan, SinkFollower& follower) {
+    if (plan.lines != kAllLines) {
+        for (const std::string& line : lastLines(plan, follower)) {
+            printRecord(plan, line);
+        }
+        return;
+    }
+    LineFunction print = [&plan](std::string_view line) { printRecord(plan, line); };
+    for (const std::string& file : filesOfSink(plan.path)) {
+        if (file != plan.path) {
+            readLines(file, print);
+        }
+    }
+    follower.readNew(print);
+}
+
+ExitStatus follow(Plan& plan) {
     const std::string directory = plan.path.substr(0, plan.path.find_last_of('/'));
     const FileDescriptor watch(::inotify_init1(IN_CLOEXEC | IN_NONBLOCK));
     if (::inotify_add_watch(watch.get(), directory.c_str(), IN_MODIFY | IN_CREATE | IN_MOVED_TO) < 0) {
-        return complain(ExitStatus::failed, formatted("cannot watch {}", directory));
+        const int fault = errno;
+        return complain(ExitStatus::failed,
+                        formatted("cannot watch {}: {}", directory, describeFault(fault, directory)));
+    }
+    if (filesOfSink(plan.path).empty()) {
+        complain(ExitStatus::done, formatted("note: there is no {} yet", plan.path));
     }
     SinkFollower follower(plan.path);
     LineFunction print = [&plan](std::string_view line) { printRecord(plan, line); };
-    for (const std::string& line : lastLines(plan, follower)) {
-        printRecord(plan, line);
-    }
+    printPresent(plan, follower);
     while (std::fflush(stdout) == 0 && std::ferror(stdout) == 0) {
         pollfd watched[2] = {{.fd = watch.get(), .events = POLLIN, .revents = 0},
                              {.fd = STDOUT_FILENO, .events = 0, .revents = 0}};
@@ -160,7 +293,7 @@ ExitStatus follow(const Plan& plan) {
     return ExitStatus::done;
 }
 
-ExitStatus printSummary(const Plan& plan) {
+ExitStatus printSummary(Plan& plan) {
     std::map<std::string, std::uint64_t> counts;
     std::uint64_t total = 0;
     LineFunction count = [&](std::string_view line) {
@@ -190,18 +323,35 @@ ExitStatus printSummary(const Plan& plan) {
     return ExitStatus::done;
 }
 
+/// The status to exit with where the sink cannot be read.
+std::optional<ExitStatus> complainOfSink(const Plan& plan) {
+    const std::vector<std::string> files = filesOfSink(plan.path);
+    for (const std::string& file : files.empty() ? std::vector{plan.path} : files) {
+        const int fault = faultOfReading(file);
+        if (fault == ENOENT && !plan.follows) {
+            return complain(
+                ExitStatus::failed,
+                formatted("there is no {}: nothing was reported yet, or LOGS_DIRECTORY is not the service's",
+                          file));
+        }
+        if (fault != 0 && fault != ENOENT) {
+            return complain(ExitStatus::failed,
+                            formatted("cannot read {}: {}", file, describeFault(fault, file)));
+        }
+    }
+    return std::nullopt;
+}
+
 ExitStatus run(const Arguments& arguments) {
-    const auto made = makePlan(arguments);
+    auto made = makePlan(arguments);
     if (const auto* wrong = std::get_if<std::string>(&made)) {
         return complain(ExitStatus::usage, *wrong);
     }
-    const Plan& plan = std::get<Plan>(made);
-    if (filesOfSink(plan.path).empty() && !plan.follows) {
-        return complain(
-            ExitStatus::failed,
-            formatted("there is no {}: nothing was reported yet, or LOGS_DIRECTORY is not the service's",
-                      plan.path));
+    Plan& plan = std::get<Plan>(made);
+    if (const auto failure = complainOfSink(plan)) {
+        return *failure;
     }
+    noteSessions(plan);
     if (arguments.has("--summary")) {
         return printSummary(plan);
     }
@@ -209,9 +359,7 @@ ExitStatus run(const Arguments& arguments) {
         return follow(plan);
     }
     SinkFollower newest(plan.path);
-    for (const std::string& line : lastLines(plan, newest)) {
-        printRecord(plan, line);
-    }
+    printPresent(plan, newest);
     return ExitStatus::done;
 }
 
@@ -220,10 +368,13 @@ ExitStatus run(const Arguments& arguments) {
 constexpr Command kCommandTail{
     "tail",
     "print what the service reported",
-    "[FILE] [--lines N] [--follow] [--event NAME]... [--key KEY[=VALUE]]... [--summary] [--json]",
-    "FILE is a report sink by name (analytics-events, power-events, diagnostics-metrics, call-quality,\n"
-    "bug-captures, bug-report-drafts, stack-captures, memory-log) or by path; analytics-events when there\n"
-    "is none.",
+    "[FILE] [--lines N] [--follow] [--since TIME] [--until TIME] [--event NAME]... [--key KEY[=VALUE]]... "
+    "[--reporter ID] [--summary] [--wide | --json]",
+    "FILE is a report sink by name (\"tambloctl list sinks\") or by path; analytics-events when there is "
+    "none.\n"
+    "Metric records are shown decoded. TIME is 2026-03-01, 2026-03-01T12:00:30 (UTC, unless +02:00 "
+    "follows),\n"
+    "5m (so long ago; s, m, h or d), or seconds since 1970.",
     kOptions,
     run,
 };

@@ -55,6 +55,11 @@ void appendEntries(std::string& out, const Dictionary& entries, std::size_t dept
     }
 }
 
+bool isAudioIssue(const Dictionary& fields) {
+    const Value* const metric = fields.find("metric");
+    return metric != nullptr && *metric == Value(qmxmetrics::kAudioIssueMetric);
+}
+
 std::optional<std::string> appendLine(std::string& out, std::string_view line) {
     auto read = parseJsonObject(line);
     if (const auto* wrong = std::get_if<std::string>(&read)) {
@@ -71,11 +76,10 @@ std::optional<std::string> appendLine(std::string& out, std::string_view line) {
     if (std::holds_alternative<std::string>(parseJsonObject(line, kForService))) {
         out += "# a null is left out: a number that is not finite\n";
     }
-    const Value* metric = fields.find("metric");
-    const Value* record = fields.find("record");
-    if (metric == nullptr || !(*metric == Value(qmxmetrics::kAudioIssueMetric))) {
+    if (!isAudioIssue(fields)) {
         return std::nullopt;
     }
+    const Value* record = fields.find("record");
     if (record == nullptr || !record->isString()) {
         return std::string("there is no record");
     }
@@ -122,6 +126,28 @@ EncodedKind guessEncodedKind(std::string_view input) {
         return EncodedKind::line;
     }
     return isBinary || isHex(input) ? EncodedKind::frame : EncodedKind::record;
+}
+
+std::optional<Dictionary> fieldsOfMetric(const Dictionary& line) {
+    const Value* const encoded = line.find("record");
+    const auto bytes =
+        encoded != nullptr && isAudioIssue(line) ? decodeBase64(encoded->stringValue()) : std::nullopt;
+    if (!bytes) {
+        return std::nullopt;
+    }
+    ProtoReader reader(*bytes);
+    qmxmetrics::AudioIssueDetected record;
+    if (!readRecord(reader, record) || !reader.atEnd()) {
+        return std::nullopt;
+    }
+    Dictionary fields{{"duration", record.duration},
+                      {"issuetype", record.issuetype},
+                      {"node", record.node},
+                      {"rtaidclient", record.rtaidclient}};
+    if (record.timestamp) {
+        fields.set("timestamp", *record.timestamp);
+    }
+    return fields;
 }
 
 Decoded decode(std::string_view input, EncodedKind kind) {

@@ -1,5 +1,7 @@
 #pragma once
 
+#include "base/Dictionary.h"
+
 #include <cstdint>
 #include <optional>
 #include <string>
@@ -29,6 +31,9 @@ struct Decoded {
     std::vector<std::string> problems;
 };
 [[nodiscard]] Decoded decode(std::string_view input, EncodedKind kind);
+
+/// The fields of a line's metric record; nothing for a line without one, or with one that is not whole.
+[[nodiscard]] std::optional<Dictionary> fieldsOfMetric(const Dictionary& line);
 
 /// The same for frames, of which each becomes a line that is a JSON object.
 [[nodiscard]] Decoded decodeFrames(std::string_view input);

@@ -7,8 +7,10 @@ namespace tamblo::tools {
 std::variant<Dictionary, std::string> parseJsonObject(std::string_view text, JsonReadOptions options) {
     auto read = readJson(text, options);
     if (const auto* error = std::get_if<JsonError>(&read)) {
-        return formatted("not usable JSON: line {}, column {}: {}", error->line, error->column,
-                         error->message);
+        // Who reads lines says which one it is.
+        const std::string line =
+            text.find('\n') == std::string_view::npos ? std::string() : formatted("line {}, ", error->line);
+        return formatted("not usable JSON: {}column {}: {}", line, error->column, error->message);
     }
     const Value& value = std::get<Value>(read);
     if (!value.isDictionary()) {
@@ -44,7 +46,11 @@ std::variant<Dictionary, std::string> parsePayload(std::span<const std::string_v
         if (payload.contains(key)) {
             return formatted("the payload has the key \"{}\" twice", key);
         }
-        payload.set(key, parseScalar(word.substr(equals + 1)));
+        const std::string_view value = word.substr(equals + 1);
+        if (value == "null") {
+            return formatted("\"{}\": the service takes no null; {}='\"null\"' is the text", word, key);
+        }
+        payload.set(key, parseScalar(value));
     }
     return payload;
 }

@@ -11,49 +11,6 @@ namespace tamblo::tools {
 
 namespace {
 
-constexpr Option kSendOptions[] = {
-    {"--category", "CATEGORY", "by name (Volume, Session_Playback) or number; needed"},
-    {"--type", "TYPE", "by name (Start, Summary) or number (Generic)"},
-    {"--reporter", "ID", "the session's reporter; may be given several times"},
-    kJsonOption,
-    kSocketOption,
-    kTimeoutOption,
-};
-
-ExitStatus send(const Arguments& arguments) {
-    const auto category = client::parseCategory(arguments.last("--category").value_or(""));
-    if (!category) {
-        return complain(ExitStatus::usage, "--category needs the name of a category, such as Volume or "
-                                           "Session_Playback, or its number");
-    }
-    const auto type = client::parseType(arguments.last("--type").value_or("Generic"));
-    if (!type) {
-        return complain(ExitStatus::usage, "--type needs the name of a type, such as Start, or its number");
-    }
-    std::vector<std::int64_t> reporters;
-    for (const std::string_view text : arguments.all("--reporter")) {
-        const auto reporter = parseReporterID(text);
-        if (!reporter) {
-            return ExitStatus::usage;
-        }
-        reporters.push_back(*reporter);
-    }
-    const auto payload = parsePayload(arguments.rest());
-    if (const auto* wrong = std::get_if<std::string>(&payload)) {
-        return complain(ExitStatus::usage, *wrong);
-    }
-    ServiceConnection service(arguments);
-    if (const auto failure = service.connect()) {
-        return *failure;
-    }
-    if (const auto failure = service.await(
-            service.client().sendMessage(std::get<Dictionary>(payload), *category, *type, reporters))) {
-        return *failure;
-    }
-    printLine(arguments.has("--json") ? "{\"sent\":true}" : "sent");
-    return ExitStatus::done;
-}
-
 constexpr Option kQueryOptions[] = {kJsonOption, kSocketOption, kTimeoutOption};
 
 ExitStatus reporters(const Arguments& arguments) {
@@ -110,6 +67,7 @@ ExitStatus validate(const Arguments& arguments) {
     const Value* type = answer.find("serviceType");
     const bool isValid = found != nullptr && *reporter != 0 && *found == Value(*reporter);
     if (arguments.has("--json")) {
+        answer.set("reporterID", *reporter); // which the service answers 0 for where it knows none
         answer.set("valid", isValid);
         printLine(jsonText(answer));
     } else if (isValid && type != nullptr) {
@@ -146,18 +104,6 @@ ExitStatus kill(const Arguments& arguments) {
 
 } // namespace
 
-constexpr Command kCommandSend{
-    "send",
-    "send one message",
-    "--category CATEGORY [--type TYPE] [--reporter ID]... [KEY=VALUE... | JSON]",
-    "A value that is a JSON scalar is taken as one; any other is a text. A message reaches a reporter "
-    "whichever\n"
-    "client made it. Without a reporter it goes to every started session of every client or, when none is\n"
-    "started, to the service's single-message session.",
-    kSendOptions,
-    send,
-};
-
 constexpr Command kCommandReporters{
     "reporters", "list the reporters of all clients, with their service types", "[--json]", "", kQueryOptions,
     reporters,
@@ -171,7 +117,7 @@ constexpr Command kCommandValidate{
 
 constexpr Command kCommandKill{
     "kill",       "end the service at once, without stopping its sessions",
-    "",           "Ends when the connection does. The service exits with status 2.",
+    "",           "The command returns when the connection is gone. tamblod then exits with status 2.",
     kKillOptions, kill,
 };
 

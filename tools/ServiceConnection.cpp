@@ -2,8 +2,12 @@
 
 #include "base/Format.h"
 #include "base/NumberText.h"
+#include "tools/AccessFault.h"
 
 #include <algorithm>
+#include <cerrno>
+
+#include <sys/un.h>
 
 namespace tamblo::tools {
 
@@ -38,9 +42,21 @@ std::optional<ExitStatus> ServiceConnection::connect() {
         return complain(ExitStatus::unreachable,
                         "the service's directory is not known: set RUNTIME_DIRECTORY or XDG_RUNTIME_DIR");
     }
-    return complain(
-        ExitStatus::unreachable,
-        formatted("no service answers at {}: start tamblod, or set RUNTIME_DIRECTORY", client_.socketPath()));
+    const std::string& path = client_.socketPath();
+    switch (const int fault = faultOfConnecting(path)) {
+    case ENAMETOOLONG:
+        return complain(ExitStatus::usage,
+                        formatted("{} is too long for a socket's path: it has {} bytes of at most {}", path,
+                                  path.size(), sizeof(sockaddr_un::sun_path) - 1));
+    case ENOENT:
+    case ECONNREFUSED:
+    case 0: // it came up meanwhile
+        return complain(ExitStatus::unreachable,
+                        formatted("no service answers at {}: start tamblod, or set RUNTIME_DIRECTORY", path));
+    default:
+        return complain(ExitStatus::unreachable,
+                        formatted("cannot connect to {}: {}", path, describeFault(fault, path)));
+    }
 }
 
 ExitStatus ServiceConnection::complainAbout(const client::Error& error) {
@@ -52,11 +68,14 @@ ExitStatus ServiceConnection::complainAbout(const client::Error& error) {
                                                   error.message.empty() ? "" : ": ", error.message));
 }
 
+std::string notAReporterID(std::string_view text) {
+    return formatted("\"{}\" is no reporter ID: it is a signed 64-bit number", text);
+}
+
 std::optional<std::int64_t> parseReporterID(std::string_view text) {
     const auto number = parseNumber<std::int64_t>(text);
     if (!number) {
-        complain(ExitStatus::usage,
-                 formatted("\"{}\" is no reporter ID: it is a signed 64-bit number", text));
+        complain(ExitStatus::usage, notAReporterID(text));
     }
     return number;
 }

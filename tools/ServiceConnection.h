@@ -6,15 +6,18 @@
 #include <chrono>
 #include <cstdint>
 #include <optional>
+#include <string>
 #include <string_view>
 
 namespace tamblo::tools {
 
 /// The options of every command that talks to the service.
-inline constexpr Option kSocketOption{"--socket", "PATH",
-                                      "the service's socket, when it is not in its usual place"};
-inline constexpr Option kTimeoutOption{"--timeout", "SECONDS", "how long to wait for an answer (10)"};
-inline constexpr Option kJsonOption{"--json", "", "print JSON, for scripts"};
+inline constexpr Option kSocketOption{
+    .name = "--socket", .value = "PATH", .help = "the service's socket, when it is not in its usual place"};
+inline constexpr Option kTimeoutOption{
+    .name = "--timeout", .value = "SECONDS", .help = "how long to wait for an answer (10)"};
+inline constexpr Option kJsonOption{
+    .name = "--json", .value = "", .help = "print JSON, for scripts", .letter = 'j'};
 
 /// A command's connection to the service, without a thread and without a second attempt.
 class ServiceConnection {
@@ -49,6 +52,7 @@ private:
     client::Client client_;
 };
 
+[[nodiscard]] std::string notAReporterID(std::string_view text);
 /// The reporter ID that the text is; else complains.
 [[nodiscard]] std::optional<std::int64_t> parseReporterID(std::string_view text);
 

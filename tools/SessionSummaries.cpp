@@ -2,17 +2,14 @@
 
 #include "base/Format.h"
 #include "base/Utf8.h"
+#include "tools/AccessFault.h"
 #include "tools/Payload.h"
 
 #include <algorithm>
 #include <array>
-#include <cerrno>
 #include <cstddef>
-#include <cstring>
 #include <optional>
 #include <utility>
-
-#include <unistd.h>
 
 namespace tamblo::tools {
 
@@ -301,9 +298,8 @@ std::variant<std::vector<SessionSummary>, std::string> SummaryReader::read(const
     if (!written.empty()) {
         return summariesOf(session, written);
     }
-    if (::access(path_.c_str(), R_OK) != 0) {
-        return formatted("no summaries: cannot read {}: {}; the service may run as another user", path_,
-                         std::strerror(errno));
+    if (const int fault = faultOfReading(path_)) {
+        return formatted("no summaries: cannot read {}: {}", path_, describeFault(fault, path_));
     }
     return formatted("no summaries: none came to {}; the preference events_in_use leaves them out, or the "
                      "service writes elsewhere",

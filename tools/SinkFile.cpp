@@ -47,32 +47,46 @@ std::size_t readLines(int descriptor, off_t offset, LineFunction& line) {
     }
 }
 
+constexpr std::string_view kEnding = ".jsonl";
+
+constexpr auto kSinks = std::to_array<KnownSink>({
+    {"analytics-events", false, "each message, as events"},
+    {"power-events", false, "haptics usage"},
+    {"diagnostics-metrics", false, "detected issues, as metric records"},
+    {"call-quality", true, "each session, its messages and its stop"},
+    {"bug-captures", false, "captures of what went wrong (internal builds)"},
+    {"bug-report-drafts", false, "bug reports prepared for the user (internal builds)"},
+    {"stack-captures", false, "stacks at overloads (internal builds)"},
+    {"memory-log", true, "memory of processes"},
+});
+
 bool exists(const std::string& path) {
     return ::access(path.c_str(), F_OK) == 0;
 }
 
-bool matches(std::string_view name, std::string_view pattern) {
-    return pattern.ends_with('*') ? name.starts_with(pattern.substr(0, pattern.size() - 1)) : name == pattern;
-}
-
-const Value* findKey(const Dictionary& record, std::string_view key) {
-    if (const Value* payload = record.find("payload")) {
-        if (const Value* value = payload->dictionaryValue().find(key)) {
-            return value;
-        }
-    }
-    return record.find(key);
-}
-
 } // namespace
+
+std::span<const KnownSink> knownSinks() noexcept {
+    return kSinks;
+}
+
+const KnownSink* findKnownSink(std::string_view path) noexcept {
+    std::string_view name = path.substr(path.find_last_of('/') + 1);
+    if (name.ends_with(kEnding)) {
+        name.remove_suffix(kEnding.size());
+    }
+    const auto found = std::find_if(kSinks.begin(), kSinks.end(),
+                                    [name](const KnownSink& sink) { return sink.name == name; });
+    return found == kSinks.end() ? nullptr : &*found;
+}
 
 std::string sinkPath(std::string_view logsDirectory, std::string_view typed) {
     std::string path(typed);
     if (typed.find('/') == std::string_view::npos) {
         path.insert(0, std::string(logsDirectory) + "/");
     }
-    if (!typed.ends_with(".jsonl") && !exists(path)) {
-        path += ".jsonl";
+    if (!typed.ends_with(kEnding) && !exists(path)) {
+        path += kEnding;
     }
     return path;
 }
@@ -160,27 +174,6 @@ std::string nameOfRecord(const Dictionary& record) {
         }
     }
     return "?";
-}
-
-void RecordFilter::wantKey(std::string_view text) {
-    const std::size_t equals = text.find('=');
-    Key key{.name = std::string(text.substr(0, equals)), .value = std::nullopt};
-    if (equals != std::string_view::npos) {
-        key.value = text.substr(equals + 1);
-    }
-    keys_.push_back(std::move(key));
-}
-
-bool RecordFilter::accepts(const Dictionary& record) const {
-    const std::string name = nameOfRecord(record);
-    const bool isWantedEvent =
-        events_.empty() || std::any_of(events_.begin(), events_.end(),
-                                       [&](const auto& pattern) { return matches(name, pattern); });
-    return isWantedEvent && std::all_of(keys_.begin(), keys_.end(), [&record](const Key& key) {
-               const Value* const value = findKey(record, key.name);
-               return value != nullptr &&
-                      (!key.value || *value == parseScalar(*key.value) || *value == Value(*key.value));
-           });
 }
 
 } // namespace tamblo::tools

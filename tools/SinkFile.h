@@ -5,6 +5,7 @@
 #include "os/FileDescriptor.h"
 
 #include <optional>
+#include <span>
 #include <string>
 #include <string_view>
 #include <vector>
@@ -12,6 +13,16 @@
 #include <sys/types.h>
 
 namespace tamblo::tools {
+
+/// A report sink of the service.
+struct KnownSink {
+    std::string_view name;
+    bool namesReporter; ///< in its lines, or in those that open a session
+    std::string_view what;
+};
+[[nodiscard]] std::span<const KnownSink> knownSinks() noexcept;
+/// By the name of its file, with or without directory and ending; null for a file of another name.
+[[nodiscard]] const KnownSink* findKnownSink(std::string_view path) noexcept;
 
 /// The path of a report sink from what was typed: a name with or without its ending, or a path.
 [[nodiscard]] std::string sinkPath(std::string_view logsDirectory, std::string_view typed);
@@ -53,26 +64,5 @@ void readLines(const std::string& path, LineFunction& line);
 
 /// What a line counts as: its event, or, in a sink without events, what comes nearest.
 [[nodiscard]] std::string nameOfRecord(const Dictionary& record);
-
-/// Which records of a sink are wanted: of one of the events named, and with all of the keys.
-class RecordFilter {
-public:
-    /// Event names are exact or end with `*`.
-    void wantEvent(std::string_view pattern) { events_.emplace_back(pattern); }
-    /// `KEY`, or `KEY=VALUE` with the value as in a typed payload. Keys are those of the payload, or of the
-    /// record.
-    void wantKey(std::string_view text);
-
-    [[nodiscard]] bool isEmpty() const noexcept { return events_.empty() && keys_.empty(); }
-    [[nodiscard]] bool accepts(const Dictionary& record) const;
-
-private:
-    struct Key {
-        std::string name;
-        std::optional<std::string> value;
-    };
-    std::vector<std::string> events_;
-    std::vector<Key> keys_;
-};
 
 } // namespace tamblo::tools

@@ -44,7 +44,7 @@ TEST(LogFilterTest, ReadsLevelsForAllAndForSingleCategories) {
         {"", "default default"},
         {"error,zrrs=debug", "debug error"},
         {" zrrs = info , fault ,, zrrs=default", "default fault"},
-        {"loud,zrrs=,zrrc=Debug,info,zr=info,=error", "info info loud zrrs= zrrc=Debug zr=info =error"},
+        {"loud,zrrs=,zrrc=Debug,info,zrxx=info,=error", "info info loud zrrs= zrrc=Debug zrxx=info =error"},
     };
     const char* const names[] = {"debug", "info", "default", "error", "fault"};
     for (const auto& [words, expected] : cases) {

@@ -1,12 +1,15 @@
 #include "base/Cbor.h"
 #include "tests/base/Samples.h"
 #include "tests/service/RealService.h"
+#include "wire/Vocabulary.h"
 
 #include <gtest/gtest.h>
 #include <nlohmann/json.hpp>
 
+#include <array>
 #include <map>
 #include <set>
+#include <span>
 
 // The protocol's page, held against the service.
 
@@ -95,6 +98,30 @@ TEST(ProtocolDocument, TheServiceDoesWhatItShows) {
         R"(,"event":"com.vandra.longformaudio.Playback.Start","payload":{)"
         R"("HostApplicationDisplayID":"com.example.player","audiotag":"PlaybackStart",)";
     EXPECT_EQ(service.countEvents(event), 2U);
+}
+
+TEST(ProtocolDocument, NumbersAreThoseOfTheVocabulary) {
+    const std::string page = contentOf(EXAMPLES_DIR "/../docs/protocol.md");
+    std::string wanted = "| number | subsystem |\n|---|---|\n";
+    const auto addRow = [&wanted](const std::string& number, std::string_view name) {
+        wanted.append("| ").append(number).append(" | `").append(name).append("` |\n");
+    };
+    const auto addTable = [&](std::string_view heading, std::span<const std::string_view> names,
+                              std::size_t first) {
+        wanted.append("\n| number | ").append(heading).append(" |\n|---|---|\n");
+        for (std::size_t i = first; i < names.size(); ++i) {
+            addRow(std::to_string(i), names[i]);
+        }
+    };
+    for (const auto& [subsystem, name] : wire::kSubsystemNames) {
+        std::array<char, 11> number{};
+        std::snprintf(number.data(), number.size(), "0x%08x", static_cast<unsigned>(subsystem));
+        addRow(number.data(), name);
+    }
+    addTable("kind", wire::kKindNames, 1);
+    addTable("type", wire::kTypeNames, 0);
+    addTable("service type", wire::kServiceNames, 0);
+    EXPECT_NE(page.find(wanted), page.npos) << wanted;
 }
 
 } // namespace

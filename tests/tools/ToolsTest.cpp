@@ -27,8 +27,9 @@ TEST(Payload, WordsAndObjectsAreRead) {
     } cases[] = {
         {{}, "{}"},
         {{"n=5", "f=0.5", "b=true", "t=text"}, R"({"b":true,"f":0.5,"n":5,"t":"text"})"},
-        {{"quoted=\"5\"", "empty=", "eq=a=b", "array=[1]", "null=null"},
+        {{"quoted=\"5\"", "empty=", "eq=a=b", "array=[1]", "null=\"null\""},
          R"({"array":"[1]","empty":"","eq":"a=b","null":"null","quoted":"5"})"},
+        {{"null=null"}, ""},
         {{R"({"a":{"b":[1,2]}})"}, R"({"a":{"b":[1,2]}})"},
         {{"a=1", "a=2"}, ""},
         {{"word"}, ""},
@@ -194,7 +195,7 @@ TEST(Decode, RecordsAndLinesAreLaidOutAndWhatIsWrongIsNamed) {
          ""},
         {metric + record + "\"}", metricText + record + "\"\n  time: 0\n" + recordText, ""},
         {R"({"time":)", "",
-         "line 1: not usable JSON: line 1, column 9: a value is expected, not the end of the text"},
+         "line 1: not usable JSON: column 9: a value is expected, not the end of the text"},
     };
     for (const auto& row : cases) {
         const Decoded decoded = guessed(row.input);

@@ -1,6 +1,7 @@
 #include "platform/linux/log/LogFilter.h"
 
 #include "base/SplitText.h"
+#include "wire/LogCodes.h"
 
 #include <algorithm>
 #include <array>
@@ -37,7 +38,7 @@ LogFilter::LogFilter(std::string_view words) {
         const std::string_view code = isForCategory ? trimmed(word.substr(0, equals)) : std::string_view();
         const std::optional<LogLevel> level =
             levelNamed(isForCategory ? trimmed(word.substr(equals + 1)) : word);
-        if (!level || (isForCategory && code.size() != 4)) {
+        if (!level || (isForCategory && !wire::isLogCode(code))) {
             unknownWords_.emplace_back(word);
         } else if (isForCategory) {
             categories_.insert(categories_.begin(), {std::string(code), *level});
