@@ -36,6 +36,10 @@ install(FILES "${CMAKE_BINARY_DIR}/user/tamblod.service"
 # The unit's user, and its configuration directory, which that user owns.
 install(FILES packaging/tamblod.sysusers DESTINATION "${CMAKE_INSTALL_PREFIX}/lib/sysusers.d" RENAME tamblo.conf)
 install(FILES packaging/tamblod.tmpfiles DESTINATION "${CMAKE_INSTALL_PREFIX}/lib/tmpfiles.d" RENAME tamblo.conf)
+# Manual pages and completion of command lines, made by the programs that are installed.
+install(CODE "
+    execute_process(COMMAND \"${CMAKE_SOURCE_DIR}/packaging/manual\" \"${CMAKE_RUNTIME_OUTPUT_DIRECTORY}\"
+        \"\$ENV{DESTDIR}${CMAKE_INSTALL_FULL_DATADIR}\" COMMAND_ERROR_IS_FATAL ANY)")
 # The documents lie as they do in the tree, so that their links hold.
 install(DIRECTORY examples DESTINATION "${CMAKE_INSTALL_DOCDIR}" USE_SOURCE_PERMISSIONS
     PATTERN demo EXCLUDE PATTERN __pycache__ EXCLUDE)

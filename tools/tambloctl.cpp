@@ -1,5 +1,7 @@
 #include "base/Format.h"
 #include "tools/Command.h"
+#include "tools/Completion.h"
+#include "tools/Manual.h"
 
 #include <algorithm>
 #include <cerrno>
@@ -44,6 +46,26 @@ ExitStatus runCommand(const Command& command, std::span<const std::string_view> 
     return arguments.has(kVersionOption.name) ? printVersion() : command.run(arguments);
 }
 
+/// For packaging/manual, and in no help: what an installation has besides the program.
+ExitStatus generate(std::span<const std::string_view> words) {
+    const std::string_view what = words.empty() ? "" : words[0];
+    const Command* const command = words.size() > 1 ? commandNamed(words[1]) : nullptr;
+    if (what == "manual" && (command != nullptr || words.size() == 1)) {
+        return print(command == nullptr ? manualPage(TAMBLO_VERSION)
+                                        : manualPageOf(*command, TAMBLO_VERSION));
+    }
+    if (what == "bash" || what == "zsh") {
+        return print(what == "bash" ? bashCompletion() : zshCompletion());
+    }
+    if (what != "names") {
+        return complain(ExitStatus::usage, "generate: manual [COMMAND], bash, zsh or names");
+    }
+    for (const Command* const known : allCommands()) {
+        printLine(known->name);
+    }
+    return ExitStatus::done;
+}
+
 ExitStatus run(const std::vector<std::string_view>& words) {
     if (words.empty()) {
         std::fputs(helpForAll().c_str(), stderr);
@@ -55,6 +77,9 @@ ExitStatus run(const std::vector<std::string_view>& words) {
     const bool asksForHelp = words[0] == "help" || words[0] == "--help" || words[0] == "-h";
     if (asksForHelp && words.size() == 1) {
         return print(helpForAll());
+    }
+    if (words[0] == "generate") {
+        return generate(std::span(words).subspan(1));
     }
     const std::string_view name = asksForHelp ? words[1] : words[0];
     const Command* const command = commandNamed(name);
