@@ -14,10 +14,9 @@ namespace {
 using namespace tamblo::tools;
 
 constexpr const Command* kCommands[] = {
-    &kCommandSend,   &kCommandSession, &kCommandReporters, &kCommandValidate,
-    &kCommandTail,   &kCommandDecode,  &kCommandNotify,    &kCommandPreference,
-    &kCommandStatus, &kCommandClients, &kCommandSessions,  &kCommandTop,
-    &kCommandKill,
+    &kCommandSend,     &kCommandSession, &kCommandReporters,  &kCommandValidate, &kCommandTail,
+    &kCommandDecode,   &kCommandNotify,  &kCommandPreference, &kCommandStatus,   &kCommandClients,
+    &kCommandSessions, &kCommandTop,     &kCommandKill,
 };
 
 constexpr std::size_t kNameColumn = 12;
