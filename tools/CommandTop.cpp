@@ -85,18 +85,21 @@ double numberOf(const Value& row, std::string_view name) {
     return StatusDocument::member(row, name).doubleValue();
 }
 
-std::vector<Value> sortedRows(const StatusDocument& document, const View& view) {
-    const auto rows = document[view.showsSessions ? "sessions" : "clients"].arrayValue();
-    std::vector<Value> sorted(rows.begin(), rows.end());
-    std::ranges::stable_sort(sorted, [&view](const Value& a, const Value& b) {
-        return numberOf(a, view.sort.member) > numberOf(b, view.sort.member);
-    });
-    return sorted;
-}
-
 Before::Key keyOf(const Value& row) {
     return {StatusDocument::member(row, "client").unsignedValue(),
             StatusDocument::member(row, "reporter").integerValue()};
+}
+
+std::vector<Value> sortedRows(const StatusDocument& document, const View& view) {
+    const auto rows = document[view.showsSessions ? "sessions" : "clients"].arrayValue();
+    std::vector<Value> sorted(rows.begin(), rows.end());
+    // Those that have the same stay where they are.
+    std::ranges::sort(sorted, [&view](const Value& a, const Value& b) {
+        const double first = numberOf(a, view.sort.member);
+        const double second = numberOf(b, view.sort.member);
+        return first != second ? first > second : keyOf(a) < keyOf(b);
+    });
+    return sorted;
 }
 
 Table clientsTable(const std::vector<Value>& rows, Before& before) {

@@ -160,9 +160,12 @@ bool StatusSocket::waitForReaders() {
     polled[1] = {.fd = acceptsFrom_ == Time() ? socket_.get() : -1, .events = POLLIN, .revents = 0};
     for (std::size_t i = 0; i != readers_.size(); ++i) {
         const Reader& reader = readers_[i];
-        const short wanted = reader.state == Reader::State::asking    ? POLLIN
-                             : reader.state == Reader::State::reading ? POLLOUT
-                                                                      : 0;
+        short wanted = 0;
+        if (reader.state == Reader::State::asking) {
+            wanted = POLLIN;
+        } else if (reader.state == Reader::State::reading) {
+            wanted = POLLOUT;
+        }
         polled[i + 2] = {.fd = reader.socket.get(), .events = wanted, .revents = 0};
     }
     if (::poll(polled.data(), readers_.size() + 2, timeLeft()) < 0 && errno != EINTR) {
