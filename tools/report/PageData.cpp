@@ -7,6 +7,8 @@
 #include <algorithm>
 #include <bit>
 #include <cmath>
+#include <deque>
+#include <string>
 #include <string_view>
 #include <unordered_map>
 
@@ -15,6 +17,7 @@ namespace tamblo::report {
 namespace {
 
 constexpr double kMillisecondsInSecond = 1000;
+constexpr std::size_t kPieceBytes = std::size_t{64} << 10U;
 
 /// Bits of a session's flags, which page.js knows, too.
 enum Flag : unsigned {
@@ -129,7 +132,7 @@ private:
             appendNumbers(
                 {static_cast<std::uint64_t>(mark.kind) - static_cast<std::uint64_t>(FactKind::volume)});
             piece_.append(',');
-            appendText(mark.value);
+            appendText(*mark.value);
             piece_.append(']');
         }
         piece_.append("],[");
@@ -183,7 +186,16 @@ private:
     }
     /// A number stands as a text, too: the page shows it, and counts with none of these but volumes.
     void appendText(const Value& value) {
-        const std::string text = value.isString() ? std::string(value.stringValue()) : jsonText(value);
+        if (value.isString()) {
+            appendNumberOf(value.stringValue());
+            return;
+        }
+        const std::string text = jsonText(value);
+        const auto known = numbers_.find(text);
+        appendNumberOf(known != numbers_.end() ? known->first : std::string_view(made_.emplace_back(text)));
+    }
+    /// The text has to stay where it is.
+    void appendNumberOf(std::string_view text) {
         const auto [place, isNew] = numbers_.try_emplace(text, texts_.size());
         if (isNew) {
             texts_.push_back(text);
@@ -195,6 +207,9 @@ private:
         for (std::size_t i = 0; i < texts.size(); ++i) {
             piece_.append(i == 0 ? "" : ",");
             appendJsonString(piece_, texts[i]);
+            if (piece_.size() > kPieceBytes) {
+                flush();
+            }
         }
         piece_.append(']');
     }
@@ -207,8 +222,10 @@ private:
     const PageData& data_;
     TextBuffer piece_;
     double base_ = INFINITY;
-    std::unordered_map<std::string, std::size_t, SeededTextHash, std::equal_to<>> numbers_;
-    std::vector<std::string> texts_;
+    // Texts lie in the sessions, and those that are made here in a list.
+    std::unordered_map<std::string_view, std::size_t, SeededTextHash> numbers_;
+    std::deque<std::string_view> texts_;
+    std::deque<std::string> made_;
 };
 
 } // namespace

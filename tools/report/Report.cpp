@@ -181,7 +181,8 @@ std::variant<ReportResult, std::string> makeReport(const ReportPlan& plan) {
     }
     std::erase_if(data.device,
                   [&plan](const DeviceEvent& event) { return plan.since && event.time < *plan.since; });
-    std::ranges::stable_sort(data.sessions, {}, &Session::began);
+    std::ranges::sort(data.sessions, {},
+                      [](const Session* session) { return std::pair(session->began, session->serial); });
     PageWriter page(plan.page);
     if (page.error() == 0) {
         writePage(page, data);

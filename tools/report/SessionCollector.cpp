@@ -4,7 +4,6 @@
 
 #include <algorithm>
 #include <cmath>
-#include <iterator>
 #include <tuple>
 #include <utility>
 
@@ -302,10 +301,12 @@ void SessionCollector::giveGroupSummaries(const Message& message, std::string_vi
     if (rest.hasStop) {
         return;
     }
-    const auto groups = std::ranges::stable_partition(
-        rest.summaries, [](const Summary& summary) { return summary.kind != SummaryKind::group; });
-    std::move(groups.begin(), groups.end(), std::back_inserter(session.summaries));
-    rest.summaries.erase(groups.begin(), groups.end());
+    for (Summary& summary : rest.summaries) {
+        if (summary.kind == SummaryKind::group) {
+            session.summaries.push_back(std::move(summary));
+        }
+    }
+    std::erase_if(rest.summaries, [](const Summary& summary) { return summary.kind == SummaryKind::group; });
     if (rest.facts.empty() && rest.summaries.empty()) {
         bytes_ -= rest.bytes;
         sessions_.erase(known->second);

@@ -30,13 +30,11 @@ struct OpenFile {
 std::vector<OpenFile> openAll(const std::string& directory, std::string_view name, ReadCounts& counts) {
     std::vector<OpenFile> files;
     for (int number = 0; number <= kKeptFiles; ++number) {
-        std::string fileName(name);
-        if (number > 0) {
-            appendFormatted(fileName, ".{}", number);
-        }
+        std::string fileName = number == 0 ? std::string(name) : formatted("{}.{}", name, number);
+        const std::string path = formatted("{}/{}", directory, fileName);
         struct stat status {};
         // A pipe in a file's place must not be waited for.
-        FileDescriptor file(::open((directory + "/" + fileName).c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK));
+        FileDescriptor file(::open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK));
         if (!file.isOpen()) {
             if (errno != ENOENT) {
                 counts.unreadable.push_back(std::move(fileName));

@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <optional>
+#include <utility>
 
 namespace tamblo::report {
 
@@ -37,7 +38,7 @@ private:
 /// Adds a mark where the value is another than before.
 void markChange(Timeline& timeline, std::optional<Value>& last, const Fact& fact) {
     if (last != fact.value) {
-        timeline.marks.push_back({fact.at, fact.kind, fact.value});
+        timeline.marks.push_back({fact.at, fact.kind, &fact.value});
         last = fact.value;
     }
 }
@@ -72,7 +73,8 @@ Timeline timelineOf(const Session& session) {
         facts.push_back(&fact);
     }
     if (!session.isClockSetBack) {
-        std::ranges::stable_sort(facts, {}, &Fact::at);
+        // They lie in their order, which decides between those of one time.
+        std::ranges::sort(facts, {}, [](const Fact* fact) { return std::pair(fact->at, fact); });
     }
     Running output(timeline, true);
     Running input(timeline, false);
@@ -104,7 +106,7 @@ Timeline timelineOf(const Session& session) {
             break;
         case FactKind::overload:
         case FactKind::issue:
-            timeline.marks.push_back({fact->at, fact->kind, fact->value});
+            timeline.marks.push_back({fact->at, fact->kind, &fact->value});
             break;
         }
     }

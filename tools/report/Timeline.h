@@ -19,7 +19,7 @@ struct Stretch {
 struct Mark {
     double at = 0;
     FactKind kind = FactKind::issue; ///< volume, route, overload or issue
-    Value value;
+    const Value* value = nullptr;    ///< the session's
 };
 
 struct Timeline {

@@ -163,11 +163,11 @@ function table(className, caption, headings, rows) {
     const made = element('table', className);
     if (caption) { made.append(element('caption', '', caption)); }
     const head = element('tr');
-    for (const heading of headings) {
-        const cell = element('th', '', heading);
+    headings.forEach((heading, i) => {
+        const cell = element('th', typeof rows[0]?.[i] === 'number' ? 'number' : '', heading);
         cell.scope = 'col';
         head.append(cell);
-    }
+    });
     made.append(element('thead', '', head), element('tbody', '', ...rows.map((cells) =>
         element('tr', '', ...cells.map((cell) => element('td', typeof cell === 'number' ? 'number' : '', cell))))));
     return made;
