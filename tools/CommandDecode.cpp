@@ -18,8 +18,8 @@ namespace {
 constexpr std::size_t kLargestInput = 1U << 30U;
 
 constexpr Option kOptions[] = {
-    {"--kind", "KIND", "record, line or frame; guessed without it"},
-    {"--file", "FILE", "decode what the file holds"},
+    {.name = "--kind", .value = "KIND", .help = "record, line or frame; guessed without it", .letter = 'k'},
+    {.name = "--file", .value = "FILE", .help = "decode what the file holds", .letter = 'f'},
 };
 
 ExitStatus run(const Arguments& arguments) {

@@ -12,9 +12,19 @@ namespace tamblo::tools {
 namespace {
 
 constexpr Option kSendOptions[] = {
-    {"--category", "CATEGORY", "by name (Volume, Session_Playback) or number; needed"},
-    {"--type", "TYPE", "by name (Start, Summary) or number (Generic)"},
-    {"--reporter", "ID", "the session's reporter; may be given several times"},
+    {.name = "--category",
+     .value = "CATEGORY",
+     .help = "by name (Volume, Session_Playback) or number; needed",
+     .letter = 'c'},
+    {.name = "--type",
+     .value = "TYPE",
+     .help = "by name (Start, Summary) or number (Generic)",
+     .letter = 't'},
+    {.name = "--reporter",
+     .value = "ID",
+     .help = "the session's reporter; may be given several times",
+     .letter = 'r',
+     .isRepeatable = true},
     kJsonOption,
     kSocketOption,
     kTimeoutOption,

@@ -11,10 +11,12 @@
 namespace tamblo::tools {
 
 /// The options of every command that talks to the service.
-inline constexpr Option kSocketOption{"--socket", "PATH",
-                                      "the service's socket, when it is not in its usual place"};
-inline constexpr Option kTimeoutOption{"--timeout", "SECONDS", "how long to wait for an answer (10)"};
-inline constexpr Option kJsonOption{"--json", "", "print JSON, for scripts"};
+inline constexpr Option kSocketOption{
+    .name = "--socket", .value = "PATH", .help = "the service's socket, when it is not in its usual place"};
+inline constexpr Option kTimeoutOption{
+    .name = "--timeout", .value = "SECONDS", .help = "how long to wait for an answer (10)"};
+inline constexpr Option kJsonOption{
+    .name = "--json", .value = "", .help = "print JSON, for scripts", .letter = 'j'};
 
 /// A command's connection to the service, without a thread and without a second attempt.
 class ServiceConnection {
