@@ -75,6 +75,7 @@ struct Command {
 
 extern const Command kCommandSend;
 extern const Command kCommandSession;
+extern const Command kCommandRecord;
 extern const Command kCommandReporters;
 extern const Command kCommandValidate;
 extern const Command kCommandTail;

@@ -9,8 +9,8 @@ namespace tamblo::tools {
 namespace {
 
 constexpr const Command* kCommands[] = {
-    &kCommandSend,   &kCommandSession, &kCommandReporters,  &kCommandValidate, &kCommandTail,
-    &kCommandDecode, &kCommandNotify,  &kCommandPreference, &kCommandKill,
+    &kCommandSend, &kCommandSession, &kCommandRecord, &kCommandReporters,  &kCommandValidate,
+    &kCommandTail, &kCommandDecode,  &kCommandNotify, &kCommandPreference, &kCommandKill,
 };
 
 constexpr std::size_t kNameColumn = 12;
