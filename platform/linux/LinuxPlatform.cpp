@@ -23,6 +23,7 @@
 #include "platform/linux/sinks/LinuxAnalyticsEventService.h"
 #include "platform/linux/sinks/LinuxCallQualityService.h"
 #include "platform/linux/sinks/LinuxReportFiles.h"
+#include "platform/linux/tap/Taps.h"
 
 #include <csignal>
 #include <cstdlib>
@@ -120,6 +121,7 @@ struct LinuxPlatform::Services {
         platform.workQueues.reset();
         platform.diagnosticCapture.reset();
         platform.connections.reset();
+        platform.messageTap.reset();
     }
     [[nodiscard]] bool watch() {
         return loop.isOpen() && preferenceChanges.watch(loop, preferences.fileDescriptor()) &&
@@ -200,6 +202,7 @@ struct LinuxPlatform::Services {
     LinuxDiagnosticCapture& diagnosticCapture = provide<LinuxDiagnosticCapture>(
         platform.diagnosticCapture, sinks, clock, workQueues,
         [this] { return connections.clientProcesses(); }, log);
+    Taps& taps = provide<Taps>(platform.messageTap, loop);
 
     Health health{loop, [this] { return status(); }};
     Changes notificationChanges{[this] {
