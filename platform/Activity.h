@@ -10,6 +10,7 @@ namespace tamblo {
 /// thread.
 struct Activity {
     std::atomic<std::size_t> sessions{0};
+    std::atomic<std::size_t> retainedBytes{0};    ///< of all sessions' messages
     std::atomic<std::uint64_t> droppedRecords{0}; ///< records let go for the budget of what is retained
 };
 

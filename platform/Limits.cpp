@@ -4,15 +4,12 @@
 
 #include <array>
 #include <optional>
-#include <utility>
 
 namespace tamblo {
 
 namespace {
 
-using Member = std::size_t Limits::*;
-
-constexpr std::array kMembers = std::to_array<std::pair<std::string_view, Member>>({
+constexpr std::array kRows = std::to_array<Limits::Row>({
     {"reporters_of_message", &Limits::reportersOfMessage},
     {"entries_of_dictionary", &Limits::entriesOfDictionary},
     {"key_bytes", &Limits::keyBytes},
@@ -39,13 +36,21 @@ constexpr std::array kMembers = std::to_array<std::pair<std::string_view, Member
 
 } // namespace
 
+std::span<const Limits::Row> Limits::rows() noexcept {
+    return kRows;
+}
+
+std::optional<std::size_t> Limits::preferenceOf(const Preferences& preferences, std::string_view name) {
+    const std::optional<Value> value = preferences.copyPreferenceValue(name, kLimitsDomain);
+    return value && value->isNumber() && value->integerValue() > 0
+               ? std::optional(static_cast<std::size_t>(value->integerValue()))
+               : std::nullopt;
+}
+
 Limits Limits::read(const Preferences& preferences) {
     Limits limits;
-    for (const auto& [name, member] : kMembers) {
-        const std::optional<Value> value = preferences.copyPreferenceValue(name, kLimitsDomain);
-        if (value && value->isNumber() && value->integerValue() > 0) {
-            limits.*member = static_cast<std::size_t>(value->integerValue());
-        }
+    for (const auto& [name, member] : kRows) {
+        limits.*member = preferenceOf(preferences, name).value_or(limits.*member);
     }
     return limits;
 }

@@ -1,6 +1,8 @@
 #pragma once
 
 #include <cstddef>
+#include <optional>
+#include <span>
 #include <string_view>
 
 namespace tamblo {
@@ -46,6 +48,16 @@ struct Limits {
     std::size_t replyBytesOfUser = 16U << 20U;     ///< likewise
 
     [[nodiscard]] static Limits read(const Preferences& preferences);
+
+    /// A limit by its name.
+    struct Row {
+        std::string_view name;
+        std::size_t Limits::*member;
+    };
+    [[nodiscard]] static std::span<const Row> rows() noexcept;
+    /// What a device's maker has set the limit to; nothing where the default is in force.
+    [[nodiscard]] static std::optional<std::size_t> preferenceOf(const Preferences& preferences,
+                                                                 std::string_view name);
 };
 
 } // namespace tamblo

@@ -1,8 +1,10 @@
 #include "platform/RequestTurns.h"
 
 #include "base/Mutex.h"
+#include "platform/Counters.h"
 #include "platform/LogOrigin.h"
 
+#include <algorithm>
 #include <atomic>
 #include <chrono>
 #include <cstddef>
@@ -64,6 +66,7 @@ public:
     struct Item {
         Work work;
         Pace pace = Pace::quick;
+        RequestTally::Stamp arrival = 0; ///< of a request
     };
 
     Queue(std::shared_ptr<State> state, const ClientIdentity& identity, UniqueFunction<void()> onNoMemory)
@@ -71,12 +74,12 @@ public:
 
     void post(Work work, Pace pace) override {
         const MutexLock lock(state_->mutex);
-        pending.emplace_back(std::move(work), pace);
+        pending.emplace_back(std::move(work), pace, tally().arrival());
         state_->enlist(*this, pace);
     }
     void postNext(Work work, Pace pace) override {
         const MutexLock lock(state_->mutex);
-        rest = {std::move(work), pace};
+        rest = {std::move(work), pace, 0};
         state_->enlist(*this, pace);
     }
     void suspend() override {
@@ -98,6 +101,10 @@ public:
         dropped[0].swap(pending);
         dropped[1].swap(batch);
         std::swap(droppedRest, rest);
+        const auto isLost = [](const Item& item) { return item.work && item.arrival != 0; };
+        counters::add(counters::Counter::requestsLostShutdown,
+                      static_cast<std::uint64_t>(std::ranges::count_if(dropped[0], isLost) +
+                                                 std::ranges::count_if(dropped[1], isLost)));
         next = 0;
         isAbandoned = true;
         suspensions = 0;
@@ -128,6 +135,27 @@ public:
         }
         return suspensions == 0 && next != batch.size() ? &batch[next] : nullptr;
     }
+    /// Before a piece begins: notes how long its request has waited.
+    void noteBegin(Time began) noexcept {
+        if (rest.work) {
+            return;
+        }
+        const RequestTally::Stamp arrival = batch[next].arrival;
+        isRequest = arrival != 0;
+        took = {};
+        if (isRequest) {
+            counters::noteAlone(counters::Histogram::waited,
+                                RequestTally::between(arrival, RequestTally::stampOf(began)));
+        }
+    }
+    /// After it: what it took, and the request with all of its pieces.
+    void noteEnd(std::chrono::nanoseconds time) noexcept {
+        tally().addTime(time);
+        took += time;
+        if (isRequest && !rest.work) {
+            counters::noteAlone(counters::Histogram::took, took);
+        }
+    }
     void runFront() {
         if (rest.work) {
             Work work = std::exchange(rest.work, Work());
@@ -146,7 +174,9 @@ public:
     std::vector<Item> pending;
     std::vector<Item> batch;
     std::size_t next = 0;
-    Item rest;             ///< of the request at hand
+    Item rest;                        ///< of the request at hand
+    std::chrono::nanoseconds took{0}; ///< until now
+    bool isRequest = false;
     bool isListed = false; ///< among those that wait, or at its turn
     bool isAbandoned = false;
     /// Of an abandoned queue none count, nor their ends, which may come late.
@@ -219,7 +249,8 @@ void RequestTurns::State::end(const QueueRef& queue, bool isStillItsTurn) {
 
 bool RequestTurns::State::takeTurn(Queue& queue, bool mayBlock) {
     const LogOrigin origin(queue.client);
-    const Time ends = clock.steadyNow() + kSlice;
+    Time now = clock.steadyNow();
+    const Time ends = now + kSlice;
     do {
         const Queue::Item* const item = queue.front();
         if (item == nullptr) {
@@ -228,12 +259,16 @@ bool RequestTurns::State::takeTurn(Queue& queue, bool mayBlock) {
         if (item->pace == Pace::mayBlock && !mayBlock) {
             return true;
         }
+        queue.noteBegin(now);
         try {
             queue.runFront();
         } catch (const std::bad_alloc&) {
+            counters::add(counters::Counter::requestsLostMemory);
             queue.outOfMemory();
         }
-    } while (!endsSoon && clock.steadyNow() < ends);
+        const Time began = std::exchange(now, clock.steadyNow());
+        queue.noteEnd(now - began);
+    } while (!endsSoon && now < ends);
     return false;
 }
 

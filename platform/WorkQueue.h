@@ -1,6 +1,7 @@
 #pragma once
 
 #include "base/UniqueFunction.h"
+#include "platform/RequestTally.h"
 
 #include <chrono>
 #include <cstddef>
@@ -59,6 +60,12 @@ public:
     /// Drops what waits, the rest of a request too, without running it. Runs what is posted later, whoever
     /// has suspended it, or will. On the reporting server queue, outside the queue's own work.
     virtual void abandon() = 0;
+
+    /// What the client has asked for.
+    [[nodiscard]] RequestTally& tally() noexcept { return tally_; }
+
+private:
+    RequestTally tally_;
 };
 
 /// One call that is to come. Destroying it calls it off; a call that has begun is not waited for.

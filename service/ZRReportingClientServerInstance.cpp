@@ -1,5 +1,6 @@
 #include "service/ZRReportingClientServerInstance.h"
 
+#include "platform/Counters.h"
 #include "session/ZRReportingSession.h"
 #include "util/AudioEvents.h"
 #include "util/Log.h"
@@ -298,12 +299,14 @@ void ZRReportingClientServerInstance::performSend(Dictionary message, std::uint3
     emitTracePoint(context_, TraceEvent::sendMessageRequest);
     const Delegate delegate = delegate_.lock();
     if (delegate == nullptr || !delegate->isReportingEnabled()) {
+        counters::addAlone(counters::Counter::messagesRefusedDisabled);
         if (reply) {
             const ReplyError error{std::string(kErrorDomain), kReportingDisabled};
             reply(&error);
         }
         return;
     }
+    requests_->tally().addMessage();
     recipients_.clear(); // of what a request without memory has left
     std::optional<StartedWalk> further;
     if (reporterIDs.empty()) {
@@ -312,6 +315,7 @@ void ZRReportingClientServerInstance::performSend(Dictionary message, std::uint3
         delegate->findReportingSessionsForIDs(reporterIDs, recipients_);
     }
     if (recipients_.empty()) {
+        counters::addAlone(counters::Counter::messagesLostNoSession);
         answer(reply);
     } else if (recipients_.size() == 1 && !recipients_.front()->isStopping()) {
         // It is given the payload itself, which spares it a copy when it is normalised.

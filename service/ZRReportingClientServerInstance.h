@@ -75,6 +75,9 @@ public:
 
     [[nodiscard]] SessionRef findReportingSessionForID(ReporterID reporterID, bool acrossAllClients) const;
 
+    [[nodiscard]] const ClientIdentity& identity() const noexcept { return acceptance_.identity; }
+    /// What the client has asked for.
+    [[nodiscard]] const RequestTally& tally() const noexcept { return requests_->tally(); }
     [[nodiscard]] pid_t processIdentifier() const noexcept { return acceptance_.identity.process; }
     [[nodiscard]] uid_t user() const noexcept { return acceptance_.identity.user; }
     [[nodiscard]] const SessionMap& clientReportingSessionMap() const noexcept {

@@ -48,6 +48,8 @@ public:
     /// Null when there is none now.
     [[nodiscard]] SessionRef singleMessageSession() const { return singleMessages_->singleMessageSession(); }
 
+    /// What the clients of each user hold together.
+    [[nodiscard]] const UserAccounts& accounts() const noexcept { return accounts_; }
     [[nodiscard]] const std::vector<ClientRef>& getAllClients() const override { return clients_; }
     [[nodiscard]] bool isReportingEnabled() const noexcept override { return reportingEnabled_; }
     [[nodiscard]] std::vector<SessionRef> getAllActiveReportingSessions() override;

@@ -1,4 +1,5 @@
 #include "platform/linux/LinuxPlatform.h"
+#include "service/ServiceStatus.h"
 #include "service/ZRReportingService.h"
 #include "util/Context.h"
 #include "wire/Protocol.h"
@@ -71,6 +72,8 @@ int main(int argc, char* argv[]) {
     ConnectionListener& listener = context.platform().connections->listenerForServiceName(wire::kServiceName);
     listener.setDelegate(service);
     listener.resume();
+    ServiceStatus status(context, service);
+    linuxPlatform.showStatus(status, TAMBLO_VERSION);
     linuxPlatform.run(context.serverQueue(),
                       [&service](auto completion) { service.shutDown(std::move(completion)); });
     return EXIT_SUCCESS;

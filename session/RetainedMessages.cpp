@@ -84,6 +84,7 @@ void RetainedMessages::Share::removeFreed(std::size_t bytes) {
 
 RetainedMessages::RetainedMessages(Context& context) noexcept
     : context_(context),
+      activity_(*context.platform().activity),
       limitOfUser_(context.platform().limits.retainedBytesOfUser),
       limit_(context.platform().limits.retainedBytes),
       nextRound_(limit_) {}
@@ -99,6 +100,7 @@ void RetainedMessages::freed(std::size_t bytes) {
 void RetainedMessages::removed(Account& account, std::size_t bytes) noexcept {
     account.bytes -= bytes;
     bytes_ -= bytes;
+    activity_.retainedBytes.store(bytes_, std::memory_order_relaxed);
     account.nextRound = std::min(account.nextRound, nextRoundFor(account.bytes, limitOfUser_));
     nextRound_ = std::min(nextRound_, nextRoundFor(bytes_, limit_));
 }

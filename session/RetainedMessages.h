@@ -50,6 +50,7 @@ public:
             all_.derivedBytes_ += bytes;
         }
         void removeDerived(std::size_t bytes) noexcept;
+        [[nodiscard]] std::size_t bytes() const noexcept { return bytes_; }
         [[nodiscard]] bool hasRoomForDerived() const noexcept {
             return account_->derivedBytes < kMostDerivedBytesOfUser && all_.derivedBytes_ < kMostDerivedBytes;
         }
@@ -75,6 +76,12 @@ public:
     RetainedMessages(const RetainedMessages&) = delete;
     RetainedMessages& operator=(const RetainedMessages&) = delete;
 
+    /// Calls `act` with the number and the bytes of each user who has a session.
+    template <typename Act> void forEachUser(Act act) const {
+        for (const auto& [user, account] : accounts_) {
+            act(user, account.bytes);
+        }
+    }
     /// Bytes of all sessions.
     [[nodiscard]] std::size_t bytes() const noexcept { return bytes_; }
 
@@ -90,6 +97,7 @@ private:
     void added(Account& account, std::size_t bytes) {
         account.bytes += bytes;
         bytes_ += bytes;
+        activity_.retainedBytes.store(bytes_, std::memory_order_relaxed);
         if (account.bytes > account.nextRound || bytes_ > nextRound_) {
             makeRoom(account);
         }
@@ -101,6 +109,7 @@ private:
     static void letGo(Account& account, std::size_t bytes, std::string_view limit);
 
     Context& context_;
+    Activity& activity_; ///< is told of the bytes
     const std::size_t limitOfUser_;
     const std::size_t limit_;
     std::map<uid_t, Account> accounts_; ///< of users who have a session

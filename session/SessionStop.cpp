@@ -1,5 +1,6 @@
 #include "session/SessionStop.h"
 
+#include "platform/Counters.h"
 #include "session/ZRReportingSession.h"
 #include "util/Log.h"
 #include "util/TraceEvents.h"
@@ -151,6 +152,7 @@ bool ZRReportingSession::holdsDerived(std::size_t messages) {
     retained_.addDerived(bytes);
     const bool hasRoom = retained_.hasRoomForDerived();
     if (!hasRoom && !std::exchange(stop_->isFullTold, true)) {
+        counters::addAlone(counters::Counter::stopsCut);
         log::error(ZRReportingSessionCategory(),
                    "too much is derived of a session at its stop, and more is left out. reporterID={} pid={}",
                    reporterID_, processIdentifiers_.empty() ? 0 : processIdentifiers_.front());
@@ -190,6 +192,7 @@ void ZRReportingSession::letGoOfPast() {
     ownRecordCount_ = 0;
     droppedMessageCount_ = 0;
     started_ = false;
+    counters::addAlone(counters::Counter::sessionsStopped);
     stop_->step = SessionStop::Step::done;
 }
 

@@ -1,6 +1,7 @@
 #include "session/ZRReportingSession.h"
 
 #include "base/Utf8.h"
+#include "platform/Counters.h"
 #include "util/Log.h"
 #include "util/MessageKeys.h"
 #include "util/TraceEvents.h"
@@ -19,6 +20,7 @@ std::shared_ptr<ZRReportingSession> ZRReportingSession::initWithID(Context& cont
     session->setServiceType(AudioServiceTypeUnknown);
     session->startWorkersFromClasses(classes.startOnInit);
     log::info(ZRReportingSessionCategory(), "created reporting session for ID: {}", reporterID);
+    counters::addAlone(counters::Counter::sessionsCreated);
     emitTracePoint(context, TraceEvent::sessionCreated);
     return session;
 }
@@ -70,6 +72,7 @@ void ZRReportingSession::start() {
     }
     log::debug(ZRReportingSessionCategory(), "self.started==false. starting. reporterID={}", reporterID_);
     started_ = true;
+    counters::addAlone(counters::Counter::sessionsStarted);
     emitTracePoint(context_, TraceEvent::sessionStarted);
     startWorkersFromClasses(workerClassLists().valid);
 }
@@ -130,6 +133,7 @@ void ZRReportingSession::remember(const Dictionary& payload, std::size_t bytesOf
     const bool wasFull = previousValues_.isFull();
     previousValues_.take(payload, bytesOfValues, isRecorded);
     if (previousValues_.isFull() && !wasFull) {
+        counters::addLimit("previous_keys_of_session");
         log::error(ZRReportingSessionCategory(),
                    "more than {} different keys; further ones are not remembered. reporterID={}",
                    context_.platform().limits.previousKeysOfSession, reporterID_);
@@ -161,6 +165,8 @@ std::size_t ZRReportingSession::letGoOfOldest(std::size_t bytes, std::string_vie
                       [this](const MessageRef& message) { lastMessages_.remove(*message); });
         messages_.erase(messages_.begin(), end);
         droppedMessageCount_ += freed.messages;
+        counters::addAlone(counters::Counter::messagesLostRetained, freed.messages);
+        counters::addLimit(limit);
         context_.platform().activity->droppedRecords += freed.messages;
     }
     if (messages_.empty() && freed.bytes < bytes) {
@@ -205,9 +211,13 @@ void ZRReportingSession::accept(const MessageRef& message) {
                "ZRReportingSessionWorker action=sendMessage reporterID={} app={} redundant={} message={}",
                reporterID_, appName_, yesOrNo(message->isRedundant), message->payload());
     const std::size_t bytes = message->payload().bytesOfValues(Dictionary::Shared::inProportion);
+    messageBytes_ += bytes;
     if (!message->isRedundant) {
         record(message, bytes,
                stop_ != nullptr ? TappedMessage::Origin::derived : TappedMessage::Origin::sent);
+        counters::addAlone(counters::Counter::messagesRecorded);
+    } else {
+        counters::addAlone(counters::Counter::messagesRedundant);
     }
     remember(message->payload(), bytes, !message->isRedundant);
     deliver(message);
@@ -217,6 +227,14 @@ void ZRReportingSession::normalise(ZRReportingSessionMessage& message) const {
     const Value& tag = audioTags_.of(message.category(), message.type());
     const Clock& clock = *context_.platform().clock;
     message.editPayload([&](Dictionary& payload) { normaliser_.normalise(payload, tag, appName_, clock); });
+}
+
+std::vector<std::string> ZRReportingSession::workerNames() const {
+    std::vector<std::string> names;
+    for (const Worker& worker : messageWorkers_) {
+        names.emplace_back(worker.workerClass->name);
+    }
+    return names;
 }
 
 std::string ZRReportingSession::description() const {

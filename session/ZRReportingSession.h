@@ -121,6 +121,10 @@ public:
         return previousValues_.valuesOf(keys);
     }
     [[nodiscard]] std::int64_t totalMessageCount() const noexcept { return totalMessageCount_; }
+    /// What the values of all messages take that were ever sent to the session.
+    [[nodiscard]] std::uint64_t messageBytes() const noexcept { return messageBytes_; }
+    /// What counts for the user's budget of retained messages.
+    [[nodiscard]] std::size_t retainedBytes() const noexcept { return retained_.bytes(); }
     /// How many messages that were sent to the session were recorded since the last stop, its own records of
     /// start and stop aside, and those included that were let go since.
     [[nodiscard]] std::size_t acceptedMessageCount() const noexcept {
@@ -139,6 +143,8 @@ public:
     [[nodiscard]] bool letGoSome();
     /// How many workers the session has made, started or not.
     [[nodiscard]] std::size_t workerInstanceCount() const noexcept { return messageWorkers_.size(); }
+    /// Of their classes, in the order in which they were made.
+    [[nodiscard]] std::vector<std::string> workerNames() const;
     [[nodiscard]] std::string description() const;
 
     /// What makes a message uniform, in this order; `session/MessageIntake.h` says how.
@@ -230,6 +236,7 @@ private:
     PreviousValues previousValues_;
     std::size_t previousBytes_ = 0; ///< as the budget counts them
     std::int64_t totalMessageCount_ = 0;
+    std::uint64_t messageBytes_ = 0;
     std::size_t ownRecordCount_ = 0; ///< among those recorded
     std::uint64_t droppedMessageCount_ = 0;
 

@@ -79,10 +79,18 @@ extern const Command kCommandRecord;
 extern const Command kCommandReporters;
 extern const Command kCommandValidate;
 extern const Command kCommandTail;
+extern const Command kCommandTap;
 extern const Command kCommandNotify;
 extern const Command kCommandPreference;
 extern const Command kCommandDecode;
 extern const Command kCommandKill;
+extern const Command kCommandStatus;
+extern const Command kCommandClients;
+extern const Command kCommandSessions;
+extern const Command kCommandTop;
+
+/// `session show ID`.
+ExitStatus showSession(const Arguments& arguments);
 
 /// All of them, in the order in which the help lists them.
 [[nodiscard]] std::span<const Command* const> allCommands() noexcept;

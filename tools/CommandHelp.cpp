@@ -9,8 +9,9 @@ namespace tamblo::tools {
 namespace {
 
 constexpr const Command* kCommands[] = {
-    &kCommandSend, &kCommandSession, &kCommandRecord, &kCommandReporters,  &kCommandValidate,
-    &kCommandTail, &kCommandDecode,  &kCommandNotify, &kCommandPreference, &kCommandKill,
+    &kCommandSend,   &kCommandSession, &kCommandRecord,   &kCommandReporters, &kCommandValidate,
+    &kCommandTail,   &kCommandTap,     &kCommandDecode,   &kCommandNotify,    &kCommandPreference,
+    &kCommandStatus, &kCommandClients, &kCommandSessions, &kCommandTop,       &kCommandKill,
 };
 
 constexpr std::size_t kNameColumn = 12;

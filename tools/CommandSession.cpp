@@ -220,6 +220,9 @@ ExitStatus playAndStop(ServiceConnection& service, const Arguments& arguments, c
 }
 
 ExitStatus run(const Arguments& arguments) {
+    if (!arguments.rest().empty() && arguments.rest()[0] == "show") {
+        return showSession(arguments);
+    }
     auto made = makePlan(arguments);
     if (const auto* wrong = std::get_if<std::string>(&made)) {
         return complain(ExitStatus::usage, *wrong);
@@ -257,7 +260,9 @@ ExitStatus run(const Arguments& arguments) {
 constexpr Command kCommandSession{
     "session",
     "make a session, play recorded messages to it, and stop it",
-    "--reporter ID [--service-type TYPE] [--configuration JSON] [--play FILE [--speed N | --fast]]",
+    "--reporter ID [--service-type TYPE] [--configuration JSON] [--play FILE [--speed N | --fast]] | show ID",
+    "\"session show ID\" shows a session that there is, with --json as JSON; --socket is the status socket "
+    "then.\n"
     "A line of the file: {\"offset_s\": 0.5, \"category\": \"Session_Playback\", \"type\": \"Start\", "
     "\"payload\": {...}}.\n"
     "The first line may be {\"session\": {\"service_type\": \"telephony\", \"configuration\": {...}}}, which "

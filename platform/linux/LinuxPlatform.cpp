@@ -23,6 +23,9 @@
 #include "platform/linux/sinks/LinuxAnalyticsEventService.h"
 #include "platform/linux/sinks/LinuxCallQualityService.h"
 #include "platform/linux/sinks/LinuxReportFiles.h"
+#include "platform/linux/status/CounterFile.h"
+#include "platform/linux/status/StatusDocuments.h"
+#include "platform/linux/status/StatusSocket.h"
 #include "platform/linux/tap/Taps.h"
 
 #include <csignal>
@@ -144,17 +147,23 @@ struct LinuxPlatform::Services {
         if (const auto lost = sinkFiles->lostLines(); lost != 0) {
             appendFormatted(text, ", {} lines lost", lost);
         }
-        std::vector<std::string> out = sinkFiles->out();
+        for (const std::vector<std::string>& out : {sinkFiles->out(), directoriesOut()}) {
+            for (const std::string& sink : out) {
+                appendFormatted(text, ", {} is out", sink);
+            }
+        }
+        return text;
+    }
+    /// Those that could not be written when that was last tried.
+    [[nodiscard]] std::vector<std::string> directoriesOut() const {
+        std::vector<std::string> out;
         if (reportFiles.isOut()) {
             out.emplace_back("DiagnosticLogs/");
         }
         if (bugCapture.isOut()) {
             out.emplace_back("captures/");
         }
-        for (const std::string& sink : out) {
-            appendFormatted(text, ", {} is out", sink);
-        }
-        return text;
+        return out;
     }
 
     const wire::Directories directories;
@@ -204,6 +213,21 @@ struct LinuxPlatform::Services {
         [this] { return connections.clientProcesses(); }, log);
     Taps& taps = provide<Taps>(platform.messageTap, loop);
 
+    CounterFile counterFile;
+    StatusDocuments statusDocuments{
+        {.loop = loop,
+         .workQueues = workQueues,
+         .log = log,
+         .directories = directories,
+         .preferences = preferences,
+         .limits = limits,
+         .fileModes = fileModes,
+         .sinks = sinks,
+         .activity = *platform.activity,
+         .connections = connections,
+         .furtherOut = [this] { return directoriesOut(); },
+         .isInternalBuild = [this] { return deviceProperties.booleanProperty("InternalBuild"); }}};
+    StatusSocket statusSocket{loop, workQueues, log, statusDocuments};
     Health health{loop, [this] { return status(); }};
     Changes notificationChanges{[this] {
         // A post may tell of a preference that was written just before it.
@@ -224,9 +248,17 @@ std::variant<std::unique_ptr<LinuxPlatform>, std::string> LinuxPlatform::open() 
     if (!platform->services_->watch()) {
         return "the kernel gives out no more file descriptors: raise the limit on open files";
     }
-    if (auto problem = platform->services_->connections.open(places.runtime)) {
+    Services& all = *platform->services_;
+    if (auto problem = all.connections.open(places.runtime)) {
         return std::move(*problem);
     }
+    if (const auto problem = all.statusSocket.open(places.runtime)) {
+        // Its clients need it all the same.
+        all.log.report(LogLevel::error, "zrrs", formatted("nobody is told the status: {}", *problem));
+    }
+    ListeningSocket::forgetPassedOn();
+    all.counterFile.open(places.runtime, all.log);
+    counters::add(counters::Counter::starts);
     return platform;
 }
 
@@ -237,6 +269,15 @@ LinuxPlatform::~LinuxPlatform() = default;
 
 const Platform& LinuxPlatform::services() const noexcept {
     return services_->platform;
+}
+
+void LinuxPlatform::showStatus(StatusSource& source, std::string version) {
+    services_->statusDocuments.setSource(source, services_->counterFile, std::move(version));
+    services_->statusSocket.setTaps(
+        [&taps = services_->taps](FileDescriptor reader, std::string_view filter) {
+            taps.add(std::move(reader), filter);
+        });
+    services_->statusSocket.resume();
 }
 
 void LinuxPlatform::run(SerialQueue& serverQueue,
@@ -262,6 +303,7 @@ void LinuxPlatform::run(SerialQueue& serverQueue,
     all.connections.setServerQueue(serverQueue, all.workQueues);
     all.signals.setEndWanted([&all, &shutDown] {
         notifyServiceManager("STOPPING=1");
+        all.statusSocket.stop();
         // What clients sent before the signal is read first, as far as it came with the same wake-up.
         all.loop.post([&all, &shutDown] {
             all.connections.stop();

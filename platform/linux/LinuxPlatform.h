@@ -1,6 +1,7 @@
 #pragma once
 
 #include "platform/Platform.h"
+#include "platform/StatusSource.h"
 #include "wire/Directories.h"
 
 #include <functional>
@@ -23,6 +24,9 @@ public:
 
     /// The services behind the interfaces. They live as long as this does.
     [[nodiscard]] const Platform& services() const noexcept;
+
+    /// Tells how the service is, on the status socket, from `run` on. The source outlives the platform's run.
+    void showStatus(StatusSource& source, std::string version);
 
     /// Carries out requests until the first SIGTERM or SIGINT, then `shutDown`, and returns once that has
     /// called the completion that it is given, with the queues at rest and every connection gone. The server

@@ -1,6 +1,7 @@
 #include "workers/sinks/LinkmeterAgent.h"
 
 #include "base/WhileAlive.h"
+#include "platform/Counters.h"
 #include "util/Log.h"
 #include "util/MessageKeys.h"
 #include "workers/sinks/LinkmeterSummary.h"
@@ -113,6 +114,7 @@ bool LinkmeterAgent::addWaiting(Messages& messages, const Message& message) {
         return true;
     }
     waiting_.count.fetch_sub(bytes, std::memory_order_relaxed);
+    counters::add(counters::Counter::messagesLostCallQuality);
     if (!std::exchange(isFullTold_, true)) {
         log::error(ZRReportingSessionLinkmeterCategory(),
                    "too many messages wait to be sent; what comes while they do is lost");
@@ -324,6 +326,7 @@ void LinkmeterAgent::sendSummary(std::vector<Dictionary> payloads, AudioServiceT
     const LogCategory& category = ZRReportingSessionLinkmeterCategory();
     auto [summary, leftOut] = LinkmeterSummary::of(std::move(payloads), serviceType);
     if (leftOut != 0) {
+        counters::add(counters::Counter::summaryValues, leftOut);
         log::error(category, "{} values are left out of a summary that is full. reporterID={}", leftOut,
                    reporterID);
     }

@@ -1,5 +1,6 @@
 #include "workers/sinks/ZRReportingSessionMemoryLogWorker.h"
 
+#include "platform/Counters.h"
 #include "platform/ProcessList.h"
 #include "session/ZRReportingSession.h"
 #include "util/AudioEvents.h"
@@ -25,6 +26,7 @@ void ZRReportingSessionMemoryLogWorker::handleMessage(const MessageRef& message)
     // A clock that was set back holds nothing up.
     const bool isSoon = lastLogged_ && now >= *lastLogged_ && now - *lastLogged_ < kLeastInterval;
     if (ownSession == nullptr || isSoon) {
+        counters::add(counters::Counter::memoryRecordsRate);
         return;
     }
     lastLogged_ = now;

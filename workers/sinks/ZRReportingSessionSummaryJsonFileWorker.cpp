@@ -3,6 +3,7 @@
 #include "base/BoundedCache.h"
 #include "base/Format.h"
 #include "base/Json.h"
+#include "platform/Counters.h"
 #include "session/ZRReportingSession.h"
 #include "util/AudioEvents.h"
 #include "util/Log.h"
@@ -99,6 +100,7 @@ void ZRReportingSessionSummaryJsonFileWorker::add(const ZRReportingSession& sess
         return;
     }
     if (leftOut_ != 0) {
+        counters::add(counters::Counter::summaryFileMessages);
         ++leftOut_;
         return;
     }
@@ -111,6 +113,7 @@ void ZRReportingSessionSummaryJsonFileWorker::add(const ZRReportingSession& sess
     writeMessage(message, names_->next(message));
     if (bytes_ + lines_.size() > kMostBytes) {
         lines_.truncate(before);
+        counters::add(counters::Counter::summaryFileMessages);
         leftOut_ = 1;
     } else if (lines_.size() >= kBytesPerWrite) {
         writeOut();

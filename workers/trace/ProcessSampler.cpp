@@ -1,6 +1,7 @@
 #include "workers/trace/ProcessSampler.h"
 
 #include "base/WhileAlive.h"
+#include "platform/Counters.h"
 #include "util/Log.h"
 
 #include <algorithm>
@@ -17,6 +18,7 @@ ProcessSampler::ProcessSampler(const Platform& platform)
 std::unique_ptr<ProcessSampler::Recording> ProcessSampler::record(std::span<const pid_t> processes) {
     const MutexLock lock(mutex_);
     if (heldRecordings_ >= kMostRecordings) {
+        counters::add(counters::Counter::tracesOfSessions);
         if (!std::exchange(isFullTold_, true)) {
             log::info(ZRReportingTraceCategory(),
                       "{} sessions are traced already; further ones are not until one of their files is done",

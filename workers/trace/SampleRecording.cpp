@@ -1,5 +1,7 @@
 #include "workers/trace/SampleRecording.h"
 
+#include "platform/Counters.h"
+
 #include <algorithm>
 #include <utility>
 
@@ -69,6 +71,7 @@ void SampleRecording::dropEveryOther() {
         for (std::size_t i = 0; 2 * i < samples.size(); ++i) {
             samples[i] = samples[2 * i];
         }
+        counters::add(counters::Counter::traceSamples, samples.size() / 2);
         samples.resize((samples.size() + 1) / 2);
     }
     ticksPerSample_ *= 2;

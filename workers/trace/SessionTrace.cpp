@@ -1,5 +1,6 @@
 #include "workers/trace/SessionTrace.h"
 
+#include "platform/Counters.h"
 #include "util/MessageKeys.h"
 #include "workers/producers/PayloadFields.h"
 
@@ -79,8 +80,12 @@ private:
 
     [[nodiscard]] bool hasRoom() noexcept {
         const std::size_t marks = trace_.output.size() + trace_.input.size() + trace_.issues.size();
-        trace_.droppedMarks += marks < SessionTrace::kMostMarks ? 0 : 1;
-        return marks < SessionTrace::kMostMarks;
+        if (marks < SessionTrace::kMostMarks) {
+            return true;
+        }
+        ++trace_.droppedMarks;
+        counters::add(counters::Counter::traceMarks);
+        return false;
     }
 
     SessionTrace& trace_;

@@ -4,6 +4,7 @@
 #include "base/Rfc3339.h"
 #include "os/Directory.h"
 #include "os/ReplaceFile.h"
+#include "platform/Counters.h"
 
 #include <algorithm>
 #include <cerrno>
@@ -165,6 +166,7 @@ void CaptureFolders::removeOld(int directory, WallTime now, std::string_view lat
     std::string problem;
     for (const std::string& name : removed) {
         const int error = removeTree(directory, name);
+        counters::add(counters::Counter::captureFoldersRemoved, error == 0 ? 1 : 0);
         if (error != 0 && problem.empty()) {
             problem = failure("remove", name, error);
         }

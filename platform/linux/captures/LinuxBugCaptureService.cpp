@@ -55,7 +55,8 @@ LinuxBugCaptureService::LinuxBugCaptureService(SinkFiles& sinks, const std::stri
              {.waiting = kMaximumWaiting,
               .ofUser = kMaximumWaiting,
               .what = "pieces of bug captures",
-              .categoryCode = "zrrb"},
+              .categoryCode = "zrrb",
+              .counted = counters::Counter::bugCapturesWaiting},
              log) {}
 
 std::unique_ptr<GlarnReporter> LinuxBugCaptureService::makeReporter(std::span<const pid_t> processes) {
@@ -67,11 +68,13 @@ std::unique_ptr<GlarnReporter> LinuxBugCaptureService::makeReporter(std::span<co
 bool LinuxBugCaptureService::request(CaptureRequest request, const GlarnReporter::Reply& reply) {
     // Written so that what is no number is refused.
     if (!(request.duration.count() >= 0 && request.duration <= kMaximumDuration)) {
+        counters::add(counters::Counter::bugCapturesInvalid);
         return false;
     }
     request.time = clock_.now();
     const GlarnError refusal = admit(request.time);
     if (refusal != kGlarnErrorNone) {
+        counters::add(counters::Counter::bugCapturesRefusedToday);
         reply({{glarn::kReplySuccess, false}, {glarn::kReplyReason, static_cast<std::int32_t>(refusal)}});
         return true;
     }
@@ -156,6 +159,7 @@ void LinuxBugCaptureService::gatherLater(const RequestRef& request) {
 }
 
 void LinuxBugCaptureService::gather(const CaptureRequest& request) {
+    counters::add(counters::Counter::bugCaptures);
     const WallTime now = clock_.now();
     std::vector<CaptureFile> files = content_.gather(request, now);
     files.push_back({"log.txt", log_.lastLines()});

@@ -1,6 +1,7 @@
 #include "platform/linux/captures/LinuxDiagnosticCapture.h"
 
 #include "base/Format.h"
+#include "platform/Counters.h"
 #include "platform/ProcessList.h"
 
 #include <algorithm>
@@ -157,7 +158,11 @@ void LinuxDiagnosticCapture::captureStacks(StackCaptureRequest request) {
     waiting.clients.resize(std::min(waiting.clients.size(), kMaximumThreads));
     {
         const MutexLock lock(mutex_);
-        if (add(std::move(waiting)) || ++dropped_ > 1) {
+        if (add(std::move(waiting))) {
+            return;
+        }
+        counters::add(counters::Counter::stackCapturesWaiting);
+        if (++dropped_ > 1) {
             return;
         }
     }
@@ -200,6 +205,7 @@ std::vector<LinuxDiagnosticCapture::Waiting> LinuxDiagnosticCapture::takeWaiting
 
 void LinuxDiagnosticCapture::captureWaiting() {
     const std::vector<Waiting> captures = takeWaiting();
+    counters::add(counters::Counter::stackCaptures, captures.size());
     ProcessList all(kMaximumThreads);
     std::vector<std::vector<pid_t>> ofEach;
     for (const Waiting& capture : captures) {

@@ -50,7 +50,8 @@ LinuxMemoryLog::LinuxMemoryLog(SinkFiles& sinks, const Clock& clock, WorkQueues&
              {.waiting = kMaximumWaiting,
               .ofUser = kMaximumWaitingOfUser,
               .what = "memory records",
-              .categoryCode = "zrrs"},
+              .categoryCode = "zrrs",
+              .counted = counters::Counter::memoryRecordsWaiting},
              log) {}
 
 void LinuxMemoryLog::logMemory(std::int64_t reporterID, std::vector<pid_t> processes) {
@@ -58,6 +59,7 @@ void LinuxMemoryLog::logMemory(std::int64_t reporterID, std::vector<pid_t> proce
 }
 
 void LinuxMemoryLog::record(std::int64_t reporterID, const std::vector<pid_t>& processes) {
+    counters::add(counters::Counter::memoryRecords);
     const WallTime time = clock_.now();
     std::vector<ProcessMemory> found;
     for (const pid_t process : processes) {

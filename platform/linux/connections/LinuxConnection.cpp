@@ -1,6 +1,7 @@
 #include "platform/linux/connections/LinuxConnection.h"
 
 #include "base/Format.h"
+#include "platform/Counters.h"
 #include "platform/LogOrigin.h"
 #include "platform/linux/connections/RequestDispatch.h"
 #include "wire/FrameSplitter.h"
@@ -31,6 +32,38 @@ constexpr int kReadOnAtOnce = 16;
 
 ReplyError outOfMemory() {
     return {std::string(kProtocolErrorDomain), kLimitReached, "memory: the service has none left"};
+}
+
+static_assert(std::ranges::equal(counters::kMethods, wire::kMethods, {}, {}, &wire::MethodRow::name));
+
+/// Of requests, and of errors with which they were answered, by the slot of the first method.
+std::size_t slotOf(std::size_t first, wire::Method method) noexcept {
+    return first + static_cast<std::size_t>(method);
+}
+
+/// What was refused where it was read. Only then is a method known when it is the method's.
+void countRefusal(const wire::Refusal& refusal, wire::Method method) noexcept {
+    using counters::Counter;
+    const bool isMessage = method == wire::Method::sendMessage;
+    switch (refusal.error.code) {
+    case wire::kNotWellFormed:
+        return counters::add(Counter::requestsRefusedNotWellFormed);
+    case wire::kNotARequest:
+        return counters::add(Counter::requestsRefusedNotARequest);
+    case wire::kUnknownMethod:
+        return counters::add(Counter::requestsRefusedUnknownMethod);
+    case wire::kWrongParameters:
+        counters::add(Counter::requestsRefusedParameters);
+        break;
+    default:
+        counters::add(Counter::requestsRefusedLimit);
+    }
+    counters::addTo(slotOf(counters::kFirstRequestError, method), 1);
+    if (isMessage) {
+        counters::addAlone(Counter::messagesReceived);
+        counters::add(refusal.error.code == wire::kWrongParameters ? Counter::messagesRefusedFrame
+                                                                   : Counter::messagesRefusedLimit);
+    }
 }
 
 bool mayKillService(uid_t user) noexcept {
@@ -89,14 +122,16 @@ void LinuxConnection::ready(std::uint32_t events) {
     }
 }
 
-void LinuxConnection::read() {
+void LinuxConnection::read(RequestTally::Time now) {
     isReadable_ = false;
     const LogOrigin origin(peer_);
+    requests_->tally().beginArrival(now);
     try {
         readOnce();
     } catch (const std::bad_alloc&) {
         endBeyond(outOfMemory());
     }
+    requests_->tally().endArrival();
 }
 
 void LinuxConnection::readOnce() {
@@ -166,6 +201,7 @@ LinuxConnection::Ending LinuxConnection::receive(int socket, std::span<const std
         const bool isQuiet = errno == EAGAIN || errno == EINTR;
         return isQuiet ? Ending::none : Ending::interrupted;
     }
+    requests_->tally().addReceived(static_cast<std::uint64_t>(count));
     if (!collects) {
         received = {start, kept + static_cast<std::size_t>(count)};
         return Ending::none;
@@ -186,6 +222,7 @@ void LinuxConnection::takeFrames(std::span<const std::uint8_t> received) {
         ++requests;
     }
     if (ending_ == Ending::none && frames.tooLong()) {
+        counters::add(counters::Counter::requestsRefusedNotARequest);
         refuse({.endsConnection = true,
                 .error = {std::string(kProtocolErrorDomain), wire::kNotARequest,
                           "a frame is longer than 1 MiB"}});
@@ -199,6 +236,7 @@ void LinuxConnection::takeFrames(std::span<const std::uint8_t> received) {
     waitingRequests_ += requests;
     waitingBytes_ += bytes;
     user_->waitingBytes += bytes;
+    requests_->tally().endArrival();
     requests_->post([self = shared_from_this(), requests, bytes] { self->carriedOut(requests, bytes); });
     shared_.intake.endRead(requests);
 }
@@ -240,16 +278,23 @@ void LinuxConnection::endUnfinished() {
 }
 
 std::size_t LinuxConnection::decodeAndDispatch(std::span<const std::uint8_t> item) {
-    if (const auto refusal = shared_.intake.decode(item)) {
+    const auto refusal = shared_.intake.decode(item);
+    wire::Request& request = shared_.intake.request();
+    if (refusal) {
+        countRefusal(*refusal, request.method);
         refuse(*refusal);
         return 0;
     }
-    wire::Request& request = shared_.intake.request();
     if (request.method == wire::Method::killService && !mayKillService(peer_.user)) {
         refuseKill(request.id.value_or(0));
         return 0;
     }
     const std::size_t bytes = kRequestBytes + request.decodedBytes;
+    requests_->tally().addRequest();
+    counters::addAloneTo(slotOf(counters::kFirstRequest, request.method), 1);
+    if (request.method == wire::Method::sendMessage) {
+        counters::addAlone(counters::Counter::messagesReceived);
+    }
     dispatchRequest(*exportedObject_, request, *this);
     return bytes;
 }
@@ -261,6 +306,8 @@ void LinuxConnection::addError(std::uint64_t id, const ReplyError& error) {
 }
 
 void LinuxConnection::refuseKill(std::uint64_t id) {
+    counters::add(counters::Counter::requestsRefusedNotAllowed);
+    counters::addTo(slotOf(counters::kFirstRequestError, wire::Method::killService), 1);
     // The code is that of a limit, but none is reached.
     addError(id, {std::string(kProtocolErrorDomain), kLimitReached,
                   "killService is for root and the service's own user"});
@@ -290,6 +337,7 @@ void LinuxConnection::sendRefusals() {
 }
 
 void LinuxConnection::noteLimit(std::string_view limit) {
+    counters::addLimit(limit);
     if (!isLimitNoted_.exchange(true)) {
         const LogOrigin origin(peer_);
         shared_.log.reportOfClient(LogLevel::error, "zrrs", "a client is refused: {}. pid={} uid={}", limit,
@@ -368,6 +416,7 @@ void LinuxConnection::watch() {
             LogLevel::error, "zrrs",
             formatted("a client is turned away, since its socket cannot be watched: {}. pid={}",
                       std::generic_category().message(errno), peer_.process));
+        counters::add(counters::Counter::connectionsUnwatched);
         wantsInput_ = false;
         giveUp();
         return;
@@ -425,6 +474,8 @@ void LinuxConnection::end() {
     if (invalidationHandler_) {
         invalidationHandler_();
     }
+    counters::add(ending_ == Ending::orderly ? counters::Counter::connectionsEndedOrderly
+                                             : counters::Counter::connectionsEndedInterrupted);
     // The handlers hold the client, the client its sessions, and those may hold replies of this connection.
     interruptionHandler_.reset();
     invalidationHandler_.reset();

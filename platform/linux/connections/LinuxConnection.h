@@ -109,8 +109,8 @@ public:
     [[nodiscard]] std::string description() const override;
 
     void ready(std::uint32_t events) override TAMBLO_EXCLUDES(mutex_);
-    /// Its turn to be read.
-    void read() TAMBLO_EXCLUDES(mutex_);
+    /// Its turn to be read, at this time.
+    void read(RequestTally::Time now) TAMBLO_EXCLUDES(mutex_);
     /// A frame that has begun got no further.
     void endUnfinished() TAMBLO_EXCLUDES(mutex_);
     /// Refuses the connection as a whole, which is not resumed: the reason is sent.

@@ -1,15 +1,12 @@
 #include "platform/linux/connections/LinuxConnectionService.h"
 
-#include "base/NumberText.h"
-#include "os/Directory.h"
-#include "os/LocalAddress.h"
+#include "platform/Counters.h"
 #include "platform/LogOrigin.h"
 #include "wire/Protocol.h"
 
 #include <algorithm>
 #include <cerrno>
 #include <chrono>
-#include <cstdlib>
 #include <cstring>
 #include <new>
 #include <set>
@@ -26,12 +23,8 @@ namespace tamblo {
 
 namespace {
 
-constexpr int kActivatedSocket = 3;
-/// Waiting connections beyond this are turned away by the kernel.
-constexpr int kBacklog = 1024;
-/// Another start is done within milliseconds: who has the runtime directory locked for longer is not waited
-/// for.
-constexpr std::chrono::milliseconds kLockPatience{1000};
+/// The first that the service manager passes on.
+constexpr int kPassedOnSocket = 3;
 /// How long accepting rests when the process has no descriptors left.
 constexpr std::chrono::milliseconds kAcceptPause{100};
 /// How many connections one wake-up accepts, so that those there are get their turn.
@@ -45,17 +38,6 @@ constexpr int SO_PEERPIDFD = 77; ///< of Linux 6.5
 
 std::string because(const std::string& what, int error) {
     return what + ": " + std::strerror(error);
-}
-
-bool environmentSays(const char* name, long wanted) {
-    const char* const text = std::getenv(name);
-    return text != nullptr && parseNumber<long>(text) == wanted;
-}
-
-bool activatedSocketHas(int option, int wanted) {
-    int value = 0;
-    socklen_t length = sizeof value;
-    return ::getsockopt(kActivatedSocket, SOL_SOCKET, option, &value, &length) == 0 && value == wanted;
 }
 
 LinuxConnection::Peer peerOf(int socket) {
@@ -76,88 +58,15 @@ std::size_t descriptorLimit() noexcept {
     return std::max<std::size_t>(limit.rlim_cur, 2 * kReservedDescriptors);
 }
 
-/// Whether somebody answers on the socket at this address.
-bool isAnswered(const LocalAddress& address) {
-    const FileDescriptor probe(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0));
-    return ::connect(probe.get(), address.get(), address.size()) == 0 || errno == EAGAIN;
-}
-
 } // namespace
 
 LinuxConnectionService::LinuxConnectionService(EventLoop& loop, const Clock& clock, StructuredLog& log,
                                                const Limits& limits)
     : shared_(loop, log, limits), clock_(clock), descriptors_(descriptorLimit()) {}
 
-LinuxConnectionService::~LinuxConnectionService() {
-    removeSocketFile();
-}
-
 std::optional<std::string> LinuxConnectionService::open(const std::string& runtimeDirectory) {
-    const bool isActivated = environmentSays("LISTEN_PID", ::getpid()) && environmentSays("LISTEN_FDS", 1);
-    return isActivated ? adoptActivatedSocket() : bindSocket(wire::socketPath(runtimeDirectory));
-}
-
-std::optional<std::string> LinuxConnectionService::adoptActivatedSocket() {
-    // Whatever else has that number may be a descriptor of our own by now.
-    if (!activatedSocketHas(SO_DOMAIN, AF_UNIX) || !activatedSocketHas(SO_TYPE, SOCK_STREAM) ||
-        !activatedSocketHas(SO_ACCEPTCONN, 1)) {
-        return "LISTEN_FDS is set, but file descriptor 3 is no listening local stream socket: pass one, or "
-               "unset LISTEN_FDS";
-    }
-    ::unsetenv("LISTEN_PID");
-    ::unsetenv("LISTEN_FDS");
-    socket_ = FileDescriptor(kActivatedSocket);
-    ::fcntl(socket_.get(), F_SETFD, FD_CLOEXEC);
-    ::fcntl(socket_.get(), F_SETFL, ::fcntl(socket_.get(), F_GETFL) | O_NONBLOCK);
-    return std::nullopt;
-}
-
-std::optional<std::string> LinuxConnectionService::bindSocket(const std::string& path) {
-    const auto address = LocalAddress::of(path);
-    if (!address) {
-        return "the socket's path is too long for the system (" + path +
-               "): set RUNTIME_DIRECTORY to a shorter one";
-    }
-    // Two services that start at the same time must not both take a left-over socket for theirs to replace.
-    const std::string directory = path.substr(0, path.rfind('/'));
-    const FileDescriptor lock = lockDirectory(directory, kLockPatience);
-    if (!lock.isOpen() && errno == EWOULDBLOCK) {
-        return "another program has " + directory + " locked: end it, or set RUNTIME_DIRECTORY";
-    }
-
-    FileDescriptor socket(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0));
-    if (::bind(socket.get(), address->get(), address->size()) != 0) {
-        if (errno != EADDRINUSE) {
-            return because("cannot make the socket " + path, errno);
-        }
-        struct stat there {};
-        if (::lstat(path.c_str(), &there) == 0 && !S_ISSOCK(there.st_mode)) {
-            return path + " is in the way and no socket: remove it, or set RUNTIME_DIRECTORY";
-        }
-        if (isAnswered(*address)) {
-            return "another tamblod already answers at " + path + ": stop it first, or set RUNTIME_DIRECTORY";
-        }
-        if (::unlink(path.c_str()) != 0 || ::bind(socket.get(), address->get(), address->size()) != 0) {
-            return because("cannot replace the left-over socket " + path, errno);
-        }
-    }
-    if (::listen(socket.get(), kBacklog) != 0) {
-        return because("cannot listen on " + path, errno);
-    }
-    ::chmod(path.c_str(), 0666);
-    ::stat(path.c_str(), &socketFile_);
-    socketPath_ = path;
-    socket_ = std::move(socket);
-    return std::nullopt;
-}
-
-void LinuxConnectionService::removeSocketFile() {
-    struct stat now {};
-    if (!socketPath_.empty() && ::stat(socketPath_.c_str(), &now) == 0 && now.st_ino == socketFile_.st_ino &&
-        now.st_dev == socketFile_.st_dev) {
-        ::unlink(socketPath_.c_str());
-    }
-    socketPath_.clear();
+    return ListeningSocket::passedOn() != 0 ? socket_.adopt(kPassedOnSocket)
+                                            : socket_.bind(wire::socketPath(runtimeDirectory));
 }
 
 ConnectionListener& LinuxConnectionService::listenerForServiceName(std::string_view) {
@@ -181,6 +90,7 @@ void LinuxConnectionService::ready(std::uint32_t) {
             try {
                 accept(std::move(socket));
             } catch (const std::bad_alloc&) {
+                counters::add(counters::Counter::connectionsNoMemory);
                 shared_.log.report(LogLevel::error, kLogCategory,
                                    "a client is turned away: no memory is left");
             }
@@ -200,6 +110,7 @@ void LinuxConnectionService::pauseAccepting(int error) {
     if (!std::exchange(isPaused_, true)) {
         shared_.log.report(LogLevel::error, kLogCategory, because("accepting connections rests", error));
     }
+    counters::add(counters::Counter::acceptingRests);
     stopWatching();
     shared_.loop.callAfter(kAcceptPause, [this] {
         if (socket_.isOpen()) {
@@ -223,6 +134,7 @@ void LinuxConnectionService::accept(FileDescriptor socket) {
         std::make_shared<LinuxConnection>(shared_, std::move(socket), std::move(peer), user,
                                           [this, user](const auto& gone) { ended(gone, *user); });
     if (const auto reason = refusalOf(*user, descriptor)) {
+        counters::add(counters::Counter::connectionsTurnedAway);
         connection->turnAway(*reason);
         return;
     }
@@ -234,6 +146,7 @@ void LinuxConnectionService::accept(FileDescriptor socket) {
     }
     if (delegate_->shouldAcceptNewConnection(*connection)) {
         ++user->connections;
+        counters::add(counters::Counter::connectionsAccepted);
     } else {
         const MutexLock lock(mutex_);
         connections_.erase(connection);
@@ -271,6 +184,17 @@ void LinuxConnectionService::ended(const std::shared_ptr<LinuxConnection>& conne
     connections_.erase(connection);
 }
 
+ConnectionUse LinuxConnectionService::use() const {
+    ConnectionUse most;
+    for (const auto& [number, user] : users_) {
+        most.connections = std::max(most.connections, user->connections);
+        most.waitingBytes = std::max(most.waitingBytes, user->waitingBytes.load());
+        most.unfinishedBytes = std::max(most.unfinishedBytes, user->unfinishedBytes);
+        most.replyBytes = std::max(most.replyBytes, user->refusedBytes.load());
+    }
+    return most;
+}
+
 std::size_t LinuxConnectionService::connectionCount() {
     const MutexLock lock(mutex_);
     return connections_.size();
@@ -287,8 +211,7 @@ std::vector<pid_t> LinuxConnectionService::clientProcesses() {
 
 void LinuxConnectionService::stop() {
     stopWatching();
-    removeSocketFile();
-    socket_.reset();
+    socket_.close();
     const MutexLock lock(mutex_);
     for (const auto& connection : connections_) {
         connection->stopReading();

@@ -7,6 +7,7 @@
 #include "platform/Limits.h"
 #include "platform/StructuredLog.h"
 #include "platform/linux/connections/LinuxConnection.h"
+#include "platform/linux/connections/ListeningSocket.h"
 #include "platform/linux/loop/EventLoop.h"
 
 #include <cstddef>
@@ -17,9 +18,15 @@
 #include <unordered_set>
 #include <vector>
 
-#include <sys/stat.h>
-
 namespace tamblo {
+
+/// What the connections of one user have together, at most; by the names of the limits.
+struct ConnectionUse {
+    std::size_t connections = 0;
+    std::size_t waitingBytes = 0;
+    std::size_t unfinishedBytes = 0;
+    std::size_t replyBytes = 0;
+};
 
 /// The interprocess connection service: a local stream socket in the runtime directory, or the one that the
 /// process was started with. Listens, accepts, asks the delegate, and keeps the connections until they have
@@ -30,7 +37,6 @@ class LinuxConnectionService final : public ConnectionService, public Connection
 public:
     /// All must outlive the service.
     LinuxConnectionService(EventLoop& loop, const Clock& clock, StructuredLog& log, const Limits& limits);
-    ~LinuxConnectionService() override;
 
     /// Takes over the socket of socket activation or binds one in the directory. A text says what is in the
     /// way.
@@ -50,6 +56,8 @@ public:
 
     /// The processes of the clients that are connected, each once. From any thread.
     [[nodiscard]] std::vector<pid_t> clientProcesses() TAMBLO_EXCLUDES(mutex_);
+    /// Of each limit of a user, what the user has who has most of it. On the I/O thread.
+    [[nodiscard]] ConnectionUse use() const;
     /// From any thread.
     [[nodiscard]] std::size_t connectionCount() TAMBLO_EXCLUDES(mutex_);
     /// Sends what was replied since the last call. From any thread.
@@ -60,8 +68,6 @@ public:
     void letGo() TAMBLO_EXCLUDES(mutex_);
 
 private:
-    [[nodiscard]] std::optional<std::string> adoptActivatedSocket();
-    [[nodiscard]] std::optional<std::string> bindSocket(const std::string& path);
     void accept(FileDescriptor socket) TAMBLO_EXCLUDES(mutex_);
     [[nodiscard]] const std::shared_ptr<ClientUser>& userNumbered(uid_t user);
     void ended(const std::shared_ptr<LinuxConnection>& connection, ClientUser& user) TAMBLO_EXCLUDES(mutex_);
@@ -69,7 +75,6 @@ private:
     [[nodiscard]] std::optional<ReplyError> refusalOf(const ClientUser& user, int descriptor) const;
     void pauseAccepting(int error);
     void stopWatching();
-    void removeSocketFile();
 
     LinuxConnection::Shared shared_;
     const Clock& clock_;
@@ -77,9 +82,7 @@ private:
     const std::size_t descriptors_;
     std::map<uid_t, std::shared_ptr<ClientUser>> users_; ///< those with connections
     ListenerDelegate* delegate_ = nullptr;
-    FileDescriptor socket_;
-    std::string socketPath_; ///< empty with an activated socket
-    struct stat socketFile_ {};
+    ListeningSocket socket_;
     bool isWatched_ = false;
     bool isPaused_ = false; ///< until a connection has been accepted
 

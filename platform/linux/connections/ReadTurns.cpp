@@ -26,7 +26,8 @@ bool ReadTurns::readSome() {
     if (users_.empty()) {
         return false;
     }
-    const auto ends = std::chrono::steady_clock::now() + kReadingTime;
+    auto now = std::chrono::steady_clock::now();
+    const auto ends = now + kReadingTime;
     do {
         const std::shared_ptr<ClientUser> user = std::move(users_.front());
         users_.pop_front();
@@ -35,8 +36,9 @@ bool ReadTurns::readSome() {
         if (!user->readable.empty()) {
             users_.push_back(user);
         }
-        connection->read();
-    } while (!users_.empty() && std::chrono::steady_clock::now() < ends);
+        connection->read(now);
+        now = std::chrono::steady_clock::now();
+    } while (!users_.empty() && now < ends);
     return !users_.empty();
 }
 

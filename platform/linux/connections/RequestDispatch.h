@@ -1,5 +1,6 @@
 #pragma once
 
+#include "platform/Counters.h"
 #include "platform/ZRReportingServiceProtocol.h"
 #include "wire/Reply.h"
 #include "wire/Request.h"
@@ -17,20 +18,21 @@ namespace tamblo {
 /// one when the client asked for none.
 template <typename Receiver> class ReplyTo {
 public:
-    ReplyTo(std::optional<std::uint64_t> id, Receiver& receiver) : id_(id), receiver_(receiver) {}
+    ReplyTo(const wire::Request& request, Receiver& receiver)
+        : id_(request.id), method_(request.method), receiver_(receiver) {}
 
     template <typename... Result> operator UniqueFunction<void(const ReplyError*, Result...), 32>() const {
         if (!id_) {
             return {};
         }
-        return
-            [receiver = receiver_.shared_from_this(), id = *id_](const ReplyError* error, Result... result) {
-                if (error != nullptr) {
-                    refuse(*receiver, id, *error);
-                } else {
-                    receiver->reply([&](TextBuffer& out) { append(out, id, result...); });
-                }
-            };
+        return [receiver = receiver_.shared_from_this(), id = *id_, method = method_](const ReplyError* error,
+                                                                                      Result... result) {
+            if (error != nullptr) {
+                refuse(*receiver, method, id, *error);
+            } else {
+                receiver->reply([&](TextBuffer& out) { append(out, id, result...); });
+            }
+        };
     }
     /// The same for an operation that may be refused: of a request without reply, too, the client hears that,
     /// under the id 0.
@@ -38,15 +40,16 @@ public:
         if (id_) {
             return *this;
         }
-        return [receiver = receiver_.shared_from_this()](const ReplyError* error, bool) {
+        return [receiver = receiver_.shared_from_this(), method = method_](const ReplyError* error, bool) {
             if (error != nullptr) {
-                refuse(*receiver, 0, *error);
+                refuse(*receiver, method, 0, *error);
             }
         };
     }
 
 private:
-    static void refuse(Receiver& receiver, std::uint64_t id, const ReplyError& error) {
+    static void refuse(Receiver& receiver, wire::Method method, std::uint64_t id, const ReplyError& error) {
+        counters::addTo(counters::kFirstRequestError + static_cast<std::size_t>(method), 1);
         if (error.code == kLimitReached) {
             receiver.noteLimit(error.message);
         }
@@ -67,6 +70,7 @@ private:
     }
 
     std::optional<std::uint64_t> id_;
+    wire::Method method_;
     Receiver& receiver_;
 };
 
@@ -78,7 +82,7 @@ template <typename Receiver>
 void dispatchRequest(ZRReportingServiceProtocol& object, wire::Request& request, Receiver& receiver) {
     using wire::Method;
     const ReporterID reporterID = request.reporterID;
-    const ReplyTo reply(request.id, receiver);
+    const ReplyTo reply(request, receiver);
     switch (request.method) {
     case Method::createReportingSession:
         return object.createReportingSession(reporterID, reply.orRefusal());

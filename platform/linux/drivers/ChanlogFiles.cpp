@@ -2,6 +2,7 @@
 
 #include "base/Format.h"
 #include "os/Directory.h"
+#include "platform/Counters.h"
 #include "platform/linux/drivers/ChanlogChannelJson.h"
 
 #include <algorithm>
@@ -59,6 +60,7 @@ bool ChanlogFiles::readFiles(const std::vector<std::string>& names, StructuredLo
         }
         const auto size = std::min(static_cast<std::size_t>(status.st_size), kMaximumFileSize);
         if (files_.size() == kMaximumFiles || size > room) {
+            counters::add(counters::Counter::driverFiles);
             fault = formatted("{}: more than {} files or {} bytes in all; it and those behind it in the "
                               "order of names are left out",
                               path, kMaximumFiles, kMaximumTotalSize);
@@ -96,11 +98,14 @@ void ChanlogFiles::readChannels(File& file, StructuredLog& log) {
         auto read = readChanlogChannel(element);
         if (auto* channel = std::get_if<ChanlogChannelRef>(&read)) {
             file.channels.push_back(std::move(*channel));
-        } else if (faults.size() < kMaximumFaultsTold) {
-            faults.push_back(formatted("{}: channel {}: {}; it is left out", file.json.path(), count,
-                                       std::get<std::string>(read)));
         } else {
-            ++untold;
+            counters::add(counters::Counter::driverChannels);
+            if (faults.size() < kMaximumFaultsTold) {
+                faults.push_back(formatted("{}: channel {}: {}; it is left out", file.json.path(), count,
+                                           std::get<std::string>(read)));
+            } else {
+                ++untold;
+            }
         }
         ++count;
     };

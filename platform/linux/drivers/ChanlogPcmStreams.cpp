@@ -3,6 +3,7 @@
 #include "base/Format.h"
 #include "base/SplitText.h"
 #include "os/SmallFile.h"
+#include "platform/Counters.h"
 
 #include <cerrno>
 #include <cstdint>
@@ -77,6 +78,7 @@ void ChanlogPcmStreams::list(StructuredLog& log) {
         addStreams(takeUpTo('\n', rest));
     }
     if (streams_.size() > kMaximumStreams) {
+        counters::add(counters::Counter::driverStreams, streams_.size() - kMaximumStreams);
         log.report(LogLevel::error, kLogCategory,
                    formatted("{}/pcm: more than {} streams; the others are left out", soundDirectory_,
                              kMaximumStreams));

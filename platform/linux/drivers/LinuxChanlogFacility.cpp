@@ -1,6 +1,7 @@
 #include "platform/linux/drivers/LinuxChanlogFacility.h"
 
 #include "base/Format.h"
+#include "platform/Counters.h"
 
 #include <algorithm>
 #include <cerrno>
@@ -146,6 +147,9 @@ ChanlogChannels LinuxChanlogFacility::gather() {
         }
     }
     const bool isOver = known.size() > kMaximumChannels;
+    if (isOver) {
+        counters::add(counters::Counter::driverChannels, known.size() - kMaximumChannels);
+    }
     if (isOver && !isOverLimit_) {
         log_.report(LogLevel::error, "zrrd",
                     formatted("{} driver statistics channels; those beyond {} are left out", known.size(),

@@ -2,6 +2,7 @@
 
 #include "base/Format.h"
 #include "base/Utf8.h"
+#include "platform/Counters.h"
 #include "platform/LogOrigin.h"
 
 #include <algorithm>
@@ -153,8 +154,12 @@ LogLevel LinuxStructuredLog::threshold(std::string_view categoryCode) const noex
 
 bool LinuxStructuredLog::admits(const LogKind& kind) noexcept {
     const std::optional<ClientIdentity> client = LogOrigin::client();
-    return !client || filter_.threshold(kind.categoryCode) < LogLevel::standard ||
-           limiter_.admits(*client, kind, std::chrono::steady_clock::now());
+    if (!client || filter_.threshold(kind.categoryCode) < LogLevel::standard ||
+        limiter_.admits(*client, kind, std::chrono::steady_clock::now())) {
+        return true;
+    }
+    counters::add(counters::Counter::logLinesRate);
+    return false;
 }
 
 void LinuxStructuredLog::write(LogLevel level, std::string_view categoryCode,
@@ -190,7 +195,11 @@ void LinuxStructuredLog::writeLine(LogLevel level, std::string_view categoryCode
     buffer.appendHarmless(line);
     const std::string_view bytes = buffer.finish();
     lastLines_.add(bytes);
+    if (level >= LogLevel::error) {
+        lastErrors_.add(std::chrono::system_clock::now(), categoryCode, line);
+    }
     if (!reportDropped() || !put(bytes)) {
+        counters::add(counters::Counter::logLinesUnread);
         dropped_.fetch_add(1, std::memory_order_relaxed);
     }
 }

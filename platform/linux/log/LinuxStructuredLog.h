@@ -2,6 +2,7 @@
 
 #include "os/FileDescriptor.h"
 #include "platform/StructuredLog.h"
+#include "platform/linux/log/LastErrors.h"
 #include "platform/linux/log/LogFilter.h"
 #include "platform/linux/log/LogLimiter.h"
 #include "platform/linux/log/LogRing.h"
@@ -47,6 +48,7 @@ public:
     void write(LogLevel level, std::string_view categoryCode, std::string_view line) noexcept override;
     /// The last lines, as they are written to standard error.
     [[nodiscard]] std::string lastLines() const { return lastLines_.text(); }
+    [[nodiscard]] const LastErrors& lastErrors() const noexcept { return lastErrors_; }
 
 private:
     /// How to write without waiting.
@@ -66,6 +68,7 @@ private:
     LogFilter filter_;
     LogLimiter limiter_;
     LogRing lastLines_;
+    LastErrors lastErrors_;
     int descriptor_;
     FileDescriptor own_;
     Channel channel_ = Channel::plain;

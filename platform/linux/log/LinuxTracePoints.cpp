@@ -1,5 +1,7 @@
 #include "platform/linux/log/LinuxTracePoints.h"
 
+#include "platform/Counters.h"
+
 #include <array>
 #include <cstring>
 #include <ctime>
@@ -41,6 +43,7 @@ void LinuxTracePoints::EmitTracePoint(std::uint32_t traceCode) noexcept {
     }
     const std::int64_t pausedUntil = pausedUntil_.load(std::memory_order_relaxed);
     if (pausedUntil != 0 && coarseSeconds() < pausedUntil) {
+        counters::add(counters::Counter::tracePoints);
         return;
     }
     constexpr std::string_view kDigits = "0123456789abcdef";
@@ -52,6 +55,7 @@ void LinuxTracePoints::EmitTracePoint(std::uint32_t traceCode) noexcept {
     line[17] = '\n';
     const bool accepted = ::write(marker_.get(), line.data(), line.size()) >= 0;
     if (!accepted) {
+        counters::add(counters::Counter::tracePoints);
         // One second more, since the clock counts whole ones.
         pausedUntil_.store(coarseSeconds() + kPauseSeconds + 1, std::memory_order_relaxed);
     } else if (pausedUntil != 0) {

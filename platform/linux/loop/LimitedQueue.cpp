@@ -29,6 +29,7 @@ void LimitedQueue::post(Work work) {
                 Pace::mayBlock);
             return;
         }
+        counters::add(limit_.counted);
         if (++dropped_ > 1) {
             return;
         }

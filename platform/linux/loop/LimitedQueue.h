@@ -1,6 +1,7 @@
 #pragma once
 
 #include "base/Mutex.h"
+#include "platform/Counters.h"
 #include "platform/LogOrigin.h"
 #include "platform/StructuredLog.h"
 #include "platform/WorkQueue.h"
@@ -26,6 +27,7 @@ public:
         std::size_t ofUser;    ///< of those
         std::string_view what; ///< the pieces' name in the log: "stack captures"
         std::string_view categoryCode;
+        counters::Counter counted; ///< of what is dropped
     };
 
     /// The limit's texts must be constants.

@@ -48,6 +48,15 @@ void SinkFiles::flush() {
     }
 }
 
+std::vector<SinkFiles::State> SinkFiles::states() const {
+    std::vector<State> states;
+    const MutexLock lock(listMutex_);
+    for (const AppendOnlyFile* file : files_) {
+        states.push_back({file->name(), file->path(), file->isOut()});
+    }
+    return states;
+}
+
 std::vector<std::string> SinkFiles::out() const {
     std::vector<std::string> names;
     const MutexLock lock(listMutex_);
@@ -84,7 +93,8 @@ AppendOnlyFile::AppendOnlyFile(SinkFiles& sinks, std::string_view name, std::str
       name_(name),
       path_(formatted("{}/{}", sinks.directory_.path(), name)),
       categoryCode_(categoryCode),
-      limits_(limits) {
+      limits_(limits),
+      counted_(name) {
     // What fails here fails again with the first line, and is told then.
     static_cast<void>(openFile(IfMissing::fail));
     sinks_.add(*this, flushed == Flushed::beforeReplies);
@@ -112,6 +122,7 @@ void AppendOnlyFile::flush() {
 void AppendOnlyFile::writeOut() {
     std::string_view lines = waiting_.view();
     const bool wasOut = isOut_;
+    std::uint64_t lost = 0;
     if (writeLines(lines)) {
         if (wasOut) {
             endOutage("it can be written again");
@@ -120,10 +131,12 @@ void AppendOnlyFile::writeOut() {
         if (!wasOut) {
             beginOutage();
         }
-        const std::uint64_t lost = countLines(lines);
+        lost = countLines(lines);
         lostLines_ += lost;
+        counted_.add(counters::SinkCount::lostOutage, lost);
         sinks_.lostLines_.fetch_add(lost, std::memory_order_relaxed);
     }
+    counted_.add(counters::SinkCount::lines, std::exchange(waitingLines_, 0) - lost);
     if (waiting_.capacity() > kKeptCapacity) {
         waiting_.reset();
     }
@@ -133,6 +146,7 @@ void AppendOnlyFile::writeOut() {
 
 void AppendOnlyFile::beginOutage() {
     isOut_ = true;
+    counted_.add(counters::SinkCount::outages, 1);
     sinks_.log_.report(
         LogLevel::error, categoryCode_,
         formatted("{}: {}; its records are lost until it can be written again", path_, fault_));
@@ -141,6 +155,7 @@ void AppendOnlyFile::beginOutage() {
 /// A client can cause such lines: the log does not grow with their number.
 void AppendOnlyFile::countTooLong() {
     sinks_.lostLines_.fetch_add(1, std::memory_order_relaxed);
+    counted_.add(counters::SinkCount::lostTooLong, 1);
     if (std::has_single_bit(++tooLongLines_)) {
         sinks_.log_.report(LogLevel::error, categoryCode_,
                            formatted("{}: records of more than {} bytes are left out, {} until now", path_,
@@ -194,10 +209,12 @@ bool AppendOnlyFile::writeFully(std::string_view& lines, std::size_t length) {
         const std::size_t written = length - rest.size();
         const std::size_t whole = wholeLines(lines, written);
         cutTornLine(written - whole);
+        counted_.add(counters::SinkCount::bytes, whole);
         lines.remove_prefix(whole);
         return result;
     }
     size_ += length;
+    counted_.add(counters::SinkCount::bytes, length);
     lines.remove_prefix(length);
     return true;
 }
@@ -322,6 +339,8 @@ bool AppendOnlyFile::rotate() {
     while (free < kKeptFiles && operations_.status(directory, numbered(free).c_str(), status) == 0) {
         ++free;
     }
+    const bool pushesOut =
+        free == kKeptFiles && operations_.status(directory, numbered(free).c_str(), status) == 0;
     for (int number = free; number > 0; --number) {
         if (operations_.rename(directory, numbered(number - 1).c_str(), numbered(number).c_str()) != 0) {
             const bool result = failed("rename");
@@ -329,6 +348,7 @@ bool AppendOnlyFile::rotate() {
             return result;
         }
     }
+    counters::add(counters::Counter::sinkFilesRemoved, pushesOut ? 1 : 0);
     closeFile();
     return true;
 }

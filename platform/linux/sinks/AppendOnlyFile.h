@@ -6,6 +6,7 @@
 #include "os/FileOperations.h"
 #include "os/HeldDirectory.h"
 #include "platform/Clock.h"
+#include "platform/Counters.h"
 #include "platform/StructuredLog.h"
 #include "platform/linux/sinks/FileModes.h"
 #include "platform/linux/sinks/PayloadTexts.h"
@@ -41,6 +42,13 @@ public:
     /// the kernel's hands, or lost and counted.
     void flush();
 
+    /// The path and whether it can be written, of each file. Waits for nobody who writes.
+    struct State {
+        std::string name;
+        std::string path;
+        bool isOut;
+    };
+    [[nodiscard]] std::vector<State> states() const;
     /// The names of the files that cannot be written now, in no order. Waits for nobody who writes.
     [[nodiscard]] std::vector<std::string> out() const;
     /// How many lines all files have lost since the start, those that were too long among them.
@@ -190,6 +198,7 @@ private:
             countTooLong();
             return;
         }
+        ++waitingLines_;
         isWaiting_.store(true, std::memory_order_release);
     }
     template <typename Format> void appendLine(Format&& format) TAMBLO_REQUIRES(mutex_) {
@@ -222,11 +231,13 @@ private:
     const std::string path_;
     const std::string_view categoryCode_;
     const SinkFileLimits limits_;
+    const counters::OfSink counted_;
 
     /// Whether lines wait, or are being written.
     std::atomic<bool> isWaiting_{false};
     Mutex mutex_;
     TextBuffer waiting_ TAMBLO_GUARDED_BY(mutex_);
+    std::uint64_t waitingLines_ TAMBLO_GUARDED_BY(mutex_) = 0;
     HeldDirectory::Ref directory_ TAMBLO_GUARDED_BY(mutex_); ///< that of the open file
     int descriptor_ TAMBLO_GUARDED_BY(mutex_) = -1;
     std::uint64_t size_ TAMBLO_GUARDED_BY(mutex_) = 0;

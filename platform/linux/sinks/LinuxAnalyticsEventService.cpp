@@ -1,6 +1,7 @@
 #include "platform/linux/sinks/LinuxAnalyticsEventService.h"
 
 #include "base/Json.h"
+#include "platform/Counters.h"
 
 #include <algorithm>
 #include <functional>
@@ -74,6 +75,8 @@ void LinuxAnalyticsEventService::sendEventsLazy(std::span<const std::string_view
     for (const std::string_view& eventName : eventNames) {
         if (isEventInUse(eventName)) {
             record({&eventName, 1}, payload);
+        } else {
+            counters::add(counters::Counter::eventsNotInUse);
         }
     }
 }
@@ -82,6 +85,7 @@ void LinuxAnalyticsEventService::record(std::span<const std::string_view> eventN
                                         const std::function<Dictionary()>& payload) {
     // Before the file's lock: the provider is foreign code.
     const Dictionary values = payload();
+    counters::add(counters::Counter::eventsInUse, eventNames.size());
     file_.appendLines(eventNames, [&](TextBuffer& lines, std::string_view eventName) {
         texts_.appendLine(lines, clock_, values, {}, [eventName](TextBuffer& line) {
             line.append(",\"event\":");

@@ -1,6 +1,7 @@
 #include "platform/linux/sinks/ReportDirectory.h"
 
 #include "base/Format.h"
+#include "platform/Counters.h"
 #include "platform/Limits.h"
 
 #include <algorithm>
@@ -293,6 +294,7 @@ void ReportDirectory::remove(Reports::iterator report) {
                               report->first, textOf(errno)));
     }
     isRemovingOut_ = !isGone;
+    counters::add(counters::Counter::reportsRemoved, isGone ? 1 : 0);
     forget(report);
 }
 

@@ -1,0 +1,217 @@
+#include "tools/StatusScreen.h"
+
+#include "base/Format.h"
+#include "base/Json.h"
+#include "base/Rfc3339.h"
+#include "tools/Table.h"
+
+#include <utility>
+
+namespace tamblo::tools {
+
+namespace {
+
+using Align = Table::Align;
+
+const Value& member(const Value& object, std::string_view name) {
+    return StatusDocument::member(object, name);
+}
+
+double numberOf(const Value& object, std::string_view name) {
+    return member(object, name).doubleValue();
+}
+
+void append(std::vector<std::string>& lines, const Table& table) {
+    lines.emplace_back();
+    for (std::string& line : table.lines()) {
+        lines.push_back(std::move(line));
+    }
+}
+
+/// The sum of a family's counters.
+std::uint64_t sumOf(const StatusDocument& document, std::string_view family) {
+    std::uint64_t sum = 0;
+    for (const Value& row : member(document["counters"], family).arrayValue()) {
+        sum += member(row, "value").unsignedValue();
+    }
+    return sum;
+}
+
+std::string fill(const Value& limit) {
+    const Value& used = member(limit, "used");
+    const double value = numberOf(limit, "value");
+    return used.isNumber() && value > 0 ? formatted("{} %", fixed(used.doubleValue() / value * 100, 1)) : "";
+}
+
+bool isOfInterest(const Value& limit) {
+    return numberOf(limit, "used") > 0 || numberOf(limit, "hits") > 0 ||
+           member(limit, "source").stringValue() != "default";
+}
+
+Table limitsTable(const StatusDocument& document) {
+    Table table({{"LIMIT"},
+                 {"VALUE", Align::right},
+                 {"USED", Align::right},
+                 {"FILL", Align::right},
+                 {"HITS", Align::right},
+                 {"FROM", Align::left, 60}});
+    for (const Value& limit : document["limits"].arrayValue()) {
+        if (isOfInterest(limit)) {
+            table.add({textOf(limit, "name"), textOf(limit, "value"), textOf(limit, "used"), fill(limit),
+                       textOf(limit, "hits"), textOf(limit, "source")});
+        }
+    }
+    return table;
+}
+
+Table sinksTable(const StatusDocument& document) {
+    Table table({{"SINK"},
+                 {"STATE"},
+                 {"SIZE", Align::right},
+                 {"LINES", Align::right},
+                 {"OUTAGES", Align::right},
+                 {"LOST", Align::right}});
+    for (const Value& sink : document["sinks"].arrayValue()) {
+        table.add({textOf(sink, "name"), textOf(sink, "state"), bytesText(numberOf(sink, "size")),
+                   textOf(sink, "lines"), textOf(sink, "outages"), textOf(sink, "lost_lines")});
+    }
+    return table;
+}
+
+void appendHead(std::vector<std::string>& lines, const StatusDocument& document) {
+    const Value& all = document.value;
+    lines.push_back(formatted("tamblod {}, up {} (pid {}, user {}), {} in memory", textOf(all, "version"),
+                              durationText(numberOf(all, "uptime")), textOf(all, "pid"), textOf(all, "uid"),
+                              bytesText(numberOf(all, "resident_bytes"))));
+    lines.push_back(formatted("{} clients, {} sessions, {} retained", textOf(all, "clients"),
+                              textOf(all, "sessions"), bytesText(numberOf(all, "retained_bytes"))));
+    lines.push_back(formatted(
+        "messages: {} received, {} recorded, {} redundant, {} refused, {} lost; counted "
+        "for {}",
+        sumOf(document, "messages_received"), sumOf(document, "messages_recorded"),
+        sumOf(document, "messages_redundant"), sumOf(document, "messages_refused"),
+        sumOf(document, "messages_lost"),
+        durationText(numberOf(all, "started") + numberOf(all, "uptime") - numberOf(all, "counters_began"))));
+}
+
+void appendErrors(std::vector<std::string>& lines, const StatusDocument& document) {
+    const auto errors = document["last_errors"].arrayValue();
+    lines.emplace_back();
+    lines.emplace_back(errors.empty() ? "no errors since the start" : "last errors:");
+    for (const Value& error : errors) {
+        lines.push_back(formatted("  {} {} {}", formatRfc3339(numberOf(error, "time")),
+                                  textOf(error, "category"),
+                                  harmless(member(error, "text").stringValue(), 200)));
+    }
+}
+
+} // namespace
+
+std::string textOf(const Value& object, std::string_view name) {
+    const Value* const found = object.isDictionary() ? object.dictionaryValue().find(name) : nullptr;
+    if (found == nullptr) {
+        return "";
+    }
+    return found->isString() ? std::string(found->stringValue()) : jsonText(*found);
+}
+
+std::vector<std::string> statusLines(const StatusDocument& document) {
+    std::vector<std::string> lines;
+    appendHead(lines, document);
+    Table settings({{"SETTING"}, {"VALUE", Align::left, 60}, {"FROM", Align::left, 60}});
+    for (const Value& setting : document["settings"].arrayValue()) {
+        settings.add({textOf(setting, "name"), textOf(setting, "value"), textOf(setting, "source")});
+    }
+    append(lines, settings);
+    append(lines, sinksTable(document));
+    for (const Value& directory : document["directories_out"].arrayValue()) {
+        lines.push_back(formatted("{} cannot be written", directory.stringValue()));
+    }
+    const Table limits = limitsTable(document);
+    if (!limits.empty()) {
+        append(lines, limits);
+    }
+    if (!document["is_complete"].boolValue()) {
+        lines.emplace_back("the server queue did not answer: what users have of their limits is not known");
+    }
+    appendErrors(lines, document);
+    return lines;
+}
+
+std::vector<std::string> clientLines(const StatusDocument& document) {
+    Table table({{"PID", Align::right},
+                 {"UID", Align::right},
+                 {"PROCESS"},
+                 {"SESSIONS", Align::right},
+                 {"STARTED", Align::right},
+                 {"MESSAGES", Align::right},
+                 {"BYTES", Align::right},
+                 {"SECONDS", Align::right},
+                 {"RETAINED", Align::right}});
+    for (const Value& client : document["clients"].arrayValue()) {
+        table.add({textOf(client, "pid"), textOf(client, "uid"), textOf(client, "process"),
+                   textOf(client, "sessions"), textOf(client, "started_sessions"), textOf(client, "messages"),
+                   bytesText(numberOf(client, "bytes")),
+                   formatted("{}", fixed(numberOf(client, "seconds"), 3)),
+                   bytesText(numberOf(client, "retained_bytes"))});
+    }
+    return table.lines();
+}
+
+std::vector<std::string> sessionLines(const StatusDocument& document) {
+    Table table({{"REPORTER", Align::right},
+                 {"PID", Align::right},
+                 {"PROCESS"},
+                 {"APPLICATION"},
+                 {"SERVICE"},
+                 {"STATE"},
+                 {"MESSAGES", Align::right},
+                 {"RECORDED", Align::right},
+                 {"BYTES", Align::right},
+                 {"RETAINED", Align::right}});
+    for (const Value& session : document["sessions"].arrayValue()) {
+        table.add({textOf(session, "reporter"), textOf(session, "pid"), textOf(session, "process"),
+                   textOf(session, "application"), textOf(session, "service"), textOf(session, "state"),
+                   textOf(session, "messages"), textOf(session, "recorded"),
+                   bytesText(numberOf(session, "bytes")), bytesText(numberOf(session, "retained_bytes"))});
+    }
+    return table.lines();
+}
+
+std::vector<std::string> sessionDetailLines(const StatusDocument& document) {
+    std::vector<std::string> lines;
+    for (const Value& session : document["sessions"].arrayValue()) {
+        if (!lines.empty()) {
+            lines.emplace_back();
+        }
+        lines.push_back(formatted("reporter {} of {} (pid {}, user {}): {}, {}", textOf(session, "reporter"),
+                                  harmless(textOf(session, "process"), 64), textOf(session, "pid"),
+                                  textOf(session, "uid"), textOf(session, "service"),
+                                  textOf(session, "state")));
+        lines.push_back(
+            formatted("messages: {}, of which {} are recorded since the last stop and {} of these "
+                      "let go; {} retained",
+                      textOf(session, "messages"), textOf(session, "recorded"), textOf(session, "dropped"),
+                      bytesText(numberOf(session, "retained_bytes"))));
+        std::string workers;
+        for (const Value& worker : member(session, "workers").arrayValue()) {
+            workers.append(workers.empty() ? "" : ", ").append(worker.stringValue());
+        }
+        lines.push_back(formatted("workers: {}", workers));
+        const std::pair<std::string_view, std::string_view> kParts[] = {
+            {"CONFIGURATION", "configuration"}, {"LATEST VALUE OF", "previous_values"}};
+        for (const auto& [title, name] : kParts) {
+            const Dictionary& values = member(session, name).dictionaryValue();
+            Table table({{title}, {"VALUE", Align::left, 100}});
+            for (std::size_t i = 0; i != values.size(); ++i) {
+                table.add({std::string(values.keyAt(i)), jsonText(values.valueAt(i))});
+            }
+            if (!table.empty()) {
+                append(lines, table);
+            }
+        }
+    }
+    return lines;
+}
+
+} // namespace tamblo::tools

@@ -1,0 +1,20 @@
+#pragma once
+
+#include "tools/StatusConnection.h"
+
+#include <string>
+#include <vector>
+
+namespace tamblo::tools {
+
+// The documents of the status socket as lines for people.
+
+[[nodiscard]] std::vector<std::string> statusLines(const StatusDocument& document);
+[[nodiscard]] std::vector<std::string> clientLines(const StatusDocument& document);
+[[nodiscard]] std::vector<std::string> sessionLines(const StatusDocument& document);
+[[nodiscard]] std::vector<std::string> sessionDetailLines(const StatusDocument& document);
+
+/// A member as text: a number, or a text.
+[[nodiscard]] std::string textOf(const Value& object, std::string_view name);
+
+} // namespace tamblo::tools
