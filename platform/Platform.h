@@ -15,6 +15,7 @@
 #include "platform/DiagnosticsMetricsService.h"
 #include "platform/Limits.h"
 #include "platform/MemoryLog.h"
+#include "platform/MessageTap.h"
 #include "platform/NamedNotifications.h"
 #include "platform/PowerEventLog.h"
 #include "platform/Preferences.h"
@@ -36,6 +37,7 @@ namespace tamblo {
 struct Platform {
     Limits limits{};
     std::unique_ptr<Activity> activity = std::make_unique<Activity>();
+    std::unique_ptr<MessageTap> messageTap = std::make_unique<NoMessageTap>();
     std::unique_ptr<StructuredLog> log;
     std::unique_ptr<Clock> clock;
     std::unique_ptr<TracePoints> tracePoints;

@@ -28,6 +28,7 @@ std::shared_ptr<ZRReportingSession> ZRReportingSession::initWithID(Context& cont
 ZRReportingSession::ZRReportingSession(Created, Context& context, ReporterID reporterID,
                                        std::vector<pid_t> processIdentifiers)
     : context_(context),
+      tap_(*context.platform().messageTap),
       audioTags_(context.shared<intake::AudioTags>()),
       normaliser_(context.shared<intake::Normaliser>()),
       reporterID_(reporterID),
@@ -91,10 +92,11 @@ void ZRReportingSession::recordOwnMessage(AudioEventType type, std::string_view 
     addAudioMessageTag(*message, audioTags_);
     const std::size_t bytes = message->payload().bytesOfValues(Dictionary::Shared::inProportion);
     ++ownRecordCount_;
-    record(message, bytes);
+    record(message, bytes, TappedMessage::Origin::session);
 }
 
-void ZRReportingSession::record(const MessageRef& message, std::size_t bytesOfValues) {
+void ZRReportingSession::record(const MessageRef& message, std::size_t bytesOfValues,
+                                TappedMessage::Origin origin) {
     std::size_t bytes = kBytesOfMessage + bytesOfValues;
     messages_.push_back(message);
     try {
@@ -111,6 +113,20 @@ void ZRReportingSession::record(const MessageRef& message, std::size_t bytesOfVa
     } else {
         retained_.add(bytes);
     }
+    if (tap_.isOpen()) {
+        offerToTap(*message, origin);
+    }
+}
+
+void ZRReportingSession::offerToTap(const ZRReportingSessionMessage& message, TappedMessage::Origin origin) {
+    tap_.offer({.reporterID = reporterID_,
+                .isSessionStarted = started_,
+                .origin = origin,
+                .serviceName = serviceName_,
+                .category = message.category(),
+                .type = message.type(),
+                .payload = message.payload(),
+                .time = context_.platform().clock->now()});
 }
 
 void ZRReportingSession::remember(const Dictionary& payload, std::size_t bytesOfValues, bool isRecorded) {
@@ -197,7 +213,8 @@ void ZRReportingSession::accept(const MessageRef& message) {
     const std::size_t bytes = message->payload().bytesOfValues(Dictionary::Shared::inProportion);
     messageBytes_ += bytes;
     if (!message->isRedundant) {
-        record(message, bytes);
+        record(message, bytes,
+               stop_ != nullptr ? TappedMessage::Origin::derived : TappedMessage::Origin::sent);
         counters::addAlone(counters::Counter::messagesRecorded);
     } else {
         counters::addAlone(counters::Counter::messagesRedundant);

@@ -3,6 +3,7 @@
 #include "base/AllocatedBytes.h"
 #include "base/Dictionary.h"
 #include "platform/Clock.h"
+#include "platform/MessageTap.h"
 #include "platform/ZRReportingServiceProtocol.h"
 #include "session/LastMessageIndex.h"
 #include "session/MessageBlocks.h"
@@ -199,7 +200,8 @@ private:
     }
     /// Records a message of the session's own, which no worker is offered.
     void recordOwnMessage(AudioEventType type, std::string_view method);
-    void record(const MessageRef& message, std::size_t bytesOfValues);
+    void record(const MessageRef& message, std::size_t bytesOfValues, TappedMessage::Origin origin);
+    void offerToTap(const ZRReportingSessionMessage& message, TappedMessage::Origin origin);
     /// Takes the values into the previous ones; `bytesOfValues` as they count for the user's budget.
     void remember(const Dictionary& payload, std::size_t bytesOfValues, bool isRecorded);
     void accept(const MessageRef& message);
@@ -210,6 +212,7 @@ private:
     void deliver(const MessageRef& message);
 
     Context& context_;
+    MessageTap& tap_;
     intake::AudioTags& audioTags_;
     intake::Normaliser& normaliser_;
     const ReporterID reporterID_;

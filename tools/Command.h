@@ -75,10 +75,12 @@ struct Command {
 
 extern const Command kCommandSend;
 extern const Command kCommandSession;
+extern const Command kCommandRecord;
 extern const Command kCommandReporters;
 extern const Command kCommandValidate;
 extern const Command kCommandTail;
 extern const Command kCommandList;
+extern const Command kCommandTap;
 extern const Command kCommandNotify;
 extern const Command kCommandPreference;
 extern const Command kCommandDecode;

@@ -5,6 +5,7 @@
 #include "tools/Command.h"
 #include "tools/Payload.h"
 #include "tools/ServiceConnection.h"
+#include "tools/SessionFile.h"
 #include "tools/SessionPlayer.h"
 #include "tools/SessionSummaries.h"
 #include "wire/Directories.h"
@@ -28,9 +29,9 @@ constexpr Option kOptions[] = {
     {.name = "--reporter", .value = "ID", .help = "the session's reporter, not 0; needed", .letter = 'r'},
     {.name = "--service-type",
      .value = "TYPE",
-     .help = "by name (longformaudio) or number (generic)",
+     .help = "by name (longformaudio) or number (the file's, else generic)",
      .letter = 't'},
-    {.name = "--configuration", .value = "JSON", .help = "an object", .letter = 'c'},
+    {.name = "--configuration", .value = "JSON", .help = "an object (the file's)", .letter = 'c'},
     {.name = "--play",
      .value = "FILE",
      .help = "the messages, JSON lines; - is standard input; without it none are sent",
@@ -106,6 +107,28 @@ std::variant<Plan, std::string> makePlan(const Arguments& arguments) {
         !arguments.has("--quiet") && (arguments.has("--progress") || ::isatty(STDERR_FILENO) != 0);
     plan.file = arguments.last("--play").value_or("");
     return plan;
+}
+
+/// Reads the file's first line. What a header there says of the session goes where the command line says
+/// nothing of it.
+std::optional<std::string> takeHeader(std::istream& lines, const Arguments& arguments, Plan& plan) {
+    std::string line;
+    if (!std::getline(lines, line)) {
+        return std::nullopt;
+    }
+    auto parsed = parseSessionHeader(line);
+    plan.player.firstLine = std::move(line);
+    if (const auto* wrong = std::get_if<std::string>(&parsed)) {
+        return formatted("{}:1: {}", plan.file, *wrong);
+    }
+    const auto& header = std::get<std::optional<SessionHeader>>(parsed);
+    if (header && header->serviceType && !arguments.has("--service-type")) {
+        plan.serviceType = *header->serviceType;
+    }
+    if (header && header->configuration && !plan.configuration) {
+        plan.configuration = header->configuration;
+    }
+    return std::nullopt;
 }
 
 /// Makes the session, up to its start, whose reply is held and is noted in `isStartAnswered` when it comes.
@@ -250,6 +273,10 @@ ExitStatus run(const Arguments& arguments) {
     if (lines != nullptr && playsFaster && !arguments.has("--sending-times")) {
         keepSpacing(plan.player, lines);
     }
+    if (const auto wrong =
+            lines != nullptr ? takeHeader(*lines, arguments, plan) : std::optional<std::string>()) {
+        return complain(ExitStatus::usage, *wrong);
+    }
     ServiceConnection service(arguments);
     if (const auto failure = service.connect()) {
         return *failure;
@@ -269,6 +296,9 @@ constexpr Command kCommandSession{
     "then.\n"
     "A line of the file: {\"offset_s\": 0.5, \"category\": \"Session_Playback\", \"type\": \"Start\", "
     "\"payload\": {...}}.\n"
+    "The first line may be {\"session\": {\"service_type\": \"telephony\", \"configuration\": {...}}}, which "
+    "counts where\n"
+    "the command line says nothing of it; \"tambloctl record\" writes such files.\n"
     "Messages are sent at their offsets, in seconds since the session's start, or, without those, spaced "
     "like\n"
     "their payloads' zrreporting_timestamp. Played faster, they get timestamps that lie as far apart as "

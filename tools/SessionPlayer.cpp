@@ -3,6 +3,7 @@
 #include "base/Format.h"
 #include "base/Json.h"
 #include "tools/Payload.h"
+#include "tools/SessionFile.h"
 
 #include <algorithm>
 #include <cstdio>
@@ -30,6 +31,20 @@ std::string wordOf(const Value* value, std::string_view usual) {
         return std::string(usual);
     }
     return value->isString() ? std::string(value->stringValue()) : jsonText(*value);
+}
+
+bool takeLine(std::optional<std::string>& first, std::istream& lines, std::string& text) {
+    if (first) {
+        text = *std::exchange(first, std::nullopt);
+        return true;
+    }
+    return static_cast<bool>(std::getline(lines, text));
+}
+
+bool isHeader(std::string_view text) {
+    const auto header = parseSessionHeader(text);
+    const auto* const found = std::get_if<std::optional<SessionHeader>>(&header);
+    return found != nullptr && found->has_value();
 }
 
 } // namespace
@@ -85,8 +100,9 @@ std::optional<std::string> SessionPlayer::play(std::istream& lines, const std::s
     SessionSpacing spacing;
     std::optional<std::string> wrong;
     std::string text;
-    for (std::size_t number = 1; !isLost() && std::getline(lines, text); ++number) {
-        if (text.find_first_not_of(" \t\r") == std::string::npos) {
+    std::optional<std::string> first = options_.firstLine;
+    for (std::size_t number = 1; !isLost() && takeLine(first, lines, text); ++number) {
+        if (text.find_first_not_of(" \t\r") == std::string::npos || (number == 1 && isHeader(text))) {
             continue;
         }
         auto parsed = parseSessionLine(text);

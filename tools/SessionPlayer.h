@@ -58,6 +58,8 @@ public:
         /// recorded, whatever the speed. The last message's is the time at which that is sent, so that a
         /// session that is played faster seems to have begun earlier.
         std::optional<double> recordedLength{};
+        /// A line that was read in front of the others.
+        std::optional<std::string> firstLine{};
         bool showsProgress = false;
         std::chrono::milliseconds timeout{};
     };
@@ -80,6 +82,7 @@ public:
         : client_(client), options_(options), report_(std::make_shared<Report>()) {}
 
     /// Plays to the end, or to the first line that is wrong: says in `name:line: …` what is wrong with it.
+    /// A header in the first line is passed over.
     [[nodiscard]] std::optional<std::string> play(std::istream& lines, const std::string& name);
     [[nodiscard]] const Report& report() const noexcept { return *report_; }
 

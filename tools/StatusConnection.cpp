@@ -60,14 +60,14 @@ const Value& StatusDocument::member(const Value& object, std::string_view name) 
 
 StatusConnection::StatusConnection(const Arguments& arguments) : path_(pathFrom(arguments)) {}
 
-std::variant<StatusDocument, StatusConnection::Failure>
-StatusConnection::ask(std::string_view request) const {
+std::variant<FileDescriptor, StatusConnection::Failure>
+StatusConnection::send(std::string_view request) const {
     if (path_.empty()) {
         return Failure{ExitStatus::unreachable,
                        "the service's directory is not known: set RUNTIME_DIRECTORY or XDG_RUNTIME_DIR"};
     }
     const auto address = LocalAddress::of(path_);
-    const FileDescriptor socket(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
+    FileDescriptor socket(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
     if (!address || ::connect(socket.get(), address->get(), address->size()) != 0) {
         return Failure{ExitStatus::unreachable,
                        formatted("no service answers at {}: start tamblod, or set RUNTIME_DIRECTORY", path_)};
@@ -75,6 +75,16 @@ StatusConnection::ask(std::string_view request) const {
     const std::string line = formatted("{}\n", request);
     // One that is turned away may have been sent the reason and the end already.
     (void)::send(socket.get(), line.data(), line.size(), MSG_NOSIGNAL);
+    return socket;
+}
+
+std::variant<StatusDocument, StatusConnection::Failure>
+StatusConnection::ask(std::string_view request) const {
+    auto connection = send(request);
+    if (auto* const failure = std::get_if<Failure>(&connection)) {
+        return std::move(*failure);
+    }
+    const auto& socket = std::get<FileDescriptor>(connection);
     auto text = readToEnd(socket.get());
     if (!text) {
         return Failure{ExitStatus::failed, "the service did not answer in time"};

@@ -1,6 +1,7 @@
 #pragma once
 
 #include "base/Value.h"
+#include "os/FileDescriptor.h"
 #include "tools/Command.h"
 
 #include <string>
@@ -32,6 +33,8 @@ public:
         ExitStatus status;
         std::string text;
     };
+    /// A connection on which the request has been sent.
+    [[nodiscard]] std::variant<FileDescriptor, Failure> send(std::string_view request) const;
     [[nodiscard]] std::variant<StatusDocument, Failure> ask(std::string_view request) const;
 
 private:

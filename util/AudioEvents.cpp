@@ -52,12 +52,7 @@ static_assert(AudioServiceTypeSystemSounds + 1 == wire::kServiceNames.size());
 static_assert(ZRReportingServiceNameUnknown == wire::kUnknownServiceName);
 
 std::string ZRReportingUtilityCategoryString(AudioEventCategory category) {
-    std::string name;
-    if (ZRReportingUtilityIsABTestModeOn(category)) {
-        name.append(wire::subsystemName(category)).append("_");
-    }
-    const AudioEventCategory kind = category & 0xFFFF;
-    return name.append(wire::kKindNames[kind < wire::kKindNames.size() ? kind : 0]);
+    return wire::eventCategoryName(category);
 }
 
 AudioEventCategory ZRReportingUtilityCategoryFromString(std::string_view name) noexcept {
@@ -67,10 +62,7 @@ AudioEventCategory ZRReportingUtilityCategoryFromString(std::string_view name) n
 }
 
 std::string_view ZRReportingUtilityTypeString(AudioEventType type) noexcept {
-    if (type == AudioEventTypeUnknown) {
-        return wire::kUnknownName;
-    }
-    return wire::kTypeNames[type < wire::kTypeNames.size() ? type : AudioEventTypeGeneric];
+    return wire::eventTypeName(type);
 }
 
 AudioEventType ZRReportingUtilityTypeFromString(std::string_view name) noexcept {

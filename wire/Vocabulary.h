@@ -6,6 +6,7 @@
 #include <cstdint>
 #include <optional>
 #include <span>
+#include <string>
 #include <string_view>
 
 /// The words of the client protocol, each said once for both ends: the requests, and the categories, types
@@ -242,6 +243,25 @@ numberNamed(const std::array<std::string_view, kSize>& names, std::string_view n
         }
     }
     return {};
+}
+
+/// The category's name in events: the subsystem's, "_" and the kind's. A high half that is no subsystem still
+/// yields the separator; the unknown category has none.
+[[nodiscard]] inline std::string eventCategoryName(std::uint32_t category) {
+    std::string name;
+    if (category > 0xFFFF && category != static_cast<std::uint32_t>(EventCategory::unknown)) {
+        name.append(subsystemName(category)).append("_");
+    }
+    const std::uint32_t kind = category & 0xFFFF;
+    return name.append(kKindNames[kind < kKindNames.size() ? kind : 0]);
+}
+
+/// The type's name in events; a value without a name is "Generic".
+[[nodiscard]] constexpr std::string_view eventTypeName(std::uint16_t type) noexcept {
+    if (type == static_cast<std::uint16_t>(EventType::unknown)) {
+        return kUnknownName;
+    }
+    return kTypeNames[type < kTypeNames.size() ? type : 0];
 }
 
 } // namespace tamblo::wire

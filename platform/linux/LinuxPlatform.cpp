@@ -26,6 +26,7 @@
 #include "platform/linux/status/CounterFile.h"
 #include "platform/linux/status/StatusDocuments.h"
 #include "platform/linux/status/StatusSocket.h"
+#include "platform/linux/tap/Taps.h"
 
 #include <csignal>
 #include <cstdlib>
@@ -123,6 +124,7 @@ struct LinuxPlatform::Services {
         platform.workQueues.reset();
         platform.diagnosticCapture.reset();
         platform.connections.reset();
+        platform.messageTap.reset();
     }
     [[nodiscard]] bool watch() {
         return loop.isOpen() && preferenceChanges.watch(loop, preferences.fileDescriptor()) &&
@@ -209,6 +211,7 @@ struct LinuxPlatform::Services {
     LinuxDiagnosticCapture& diagnosticCapture = provide<LinuxDiagnosticCapture>(
         platform.diagnosticCapture, sinks, clock, workQueues,
         [this] { return connections.clientProcesses(); }, log);
+    Taps& taps = provide<Taps>(platform.messageTap, loop);
 
     CounterFile counterFile;
     StatusDocuments statusDocuments{
@@ -270,6 +273,10 @@ const Platform& LinuxPlatform::services() const noexcept {
 
 void LinuxPlatform::showStatus(StatusSource& source, std::string version) {
     services_->statusDocuments.setSource(source, services_->counterFile, std::move(version));
+    services_->statusSocket.setTaps(
+        [&taps = services_->taps](FileDescriptor reader, std::string_view filter) {
+            taps.add(std::move(reader), filter);
+        });
     services_->statusSocket.resume();
 }
 

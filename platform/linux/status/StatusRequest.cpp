@@ -52,7 +52,8 @@ std::variant<StatusRequest, std::string> StatusRequest::parse(std::string_view l
         }
         return "session: wanted a reporter ID";
     }
-    return "unknown request: there are status, clients, sessions, session ID, metrics, metrics plain";
+    return "unknown request: there are status, clients, sessions, session ID, metrics, metrics plain, "
+           "tap FILTER";
 }
 
 bool StatusQuestion::isWhole(std::string_view received) noexcept {

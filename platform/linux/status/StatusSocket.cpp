@@ -1,6 +1,7 @@
 #include "platform/linux/status/StatusSocket.h"
 
 #include "base/Format.h"
+#include "base/SplitText.h"
 #include "platform/Counters.h"
 #include "wire/StatusProtocol.h"
 
@@ -39,6 +40,12 @@ constexpr milliseconds kTimeForReader{30000};
 constexpr milliseconds kAcceptPause{100};
 /// A line, or the headers of a request.
 constexpr std::size_t kMostBytes = 8192;
+
+constexpr std::string_view kTap = "tap";
+
+bool isTap(const StatusQuestion& question) noexcept {
+    return !question.isHttp && (question.line == kTap || question.line.starts_with("tap "));
+}
 
 std::string errorText(std::string_view error) {
     return std::string("{\"error\":\"").append(error).append("\"}\n");
@@ -259,6 +266,13 @@ void StatusSocket::receive(Reader& reader, Time now) {
 void StatusSocket::ask(Reader& reader, Time now) {
     reader.question = StatusQuestion::of(reader.received);
     reader.received = std::string();
+    if (isTap(reader.question)) {
+        // From now on the reader is the taps'.
+        reader.deadline = Time::max();
+        takeTap_(std::move(reader.socket),
+                 trimmed(std::string_view(reader.question.line).substr(kTap.size())));
+        return;
+    }
     reader.state = Reader::State::waiting;
     reader.deadline = now + kTimeForAnswer;
     const auto parsed = StatusRequest::parse(reader.question.line);

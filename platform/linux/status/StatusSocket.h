@@ -14,6 +14,8 @@
 #include <memory>
 #include <optional>
 #include <string>
+#include <string_view>
+#include <utility>
 #include <vector>
 
 namespace tamblo {
@@ -51,6 +53,9 @@ public:
     /// Takes over the second socket of socket activation or binds one in the directory. A text says what is
     /// in the way.
     [[nodiscard]] std::optional<std::string> open(const std::string& runtimeDirectory);
+    /// Who takes over readers whose line is `tap FILTER`; called on the status queue. Before `resume`.
+    using TakeTap = UniqueFunction<void(FileDescriptor reader, std::string_view filter)>;
+    void setTaps(TakeTap takeTap) { takeTap_ = std::move(takeTap); }
     /// Readers are served from now on, if it is open. On the loop's thread, as is what follows.
     void resume() TAMBLO_EXCLUDES(mutex_);
     void ready(std::uint32_t events) override TAMBLO_EXCLUDES(mutex_);
@@ -81,6 +86,7 @@ private:
     WorkQueues& queues_;
     StructuredLog& log_;
     StatusAnswers& answers_;
+    TakeTap takeTap_;
     ListeningSocket socket_;
     const std::shared_ptr<WakeUp> wakeUp_;
     std::unique_ptr<SerialQueue> queue_;

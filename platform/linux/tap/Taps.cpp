@@ -1,0 +1,254 @@
+#include "platform/linux/tap/Taps.h"
+
+#include "base/Format.h"
+#include "base/Json.h"
+#include "platform/linux/tap/TapFilter.h"
+
+#include <algorithm>
+#include <cerrno>
+#include <cstdint>
+#include <new>
+#include <string>
+#include <utility>
+#include <variant>
+
+#include <sys/epoll.h>
+#include <sys/socket.h>
+
+namespace tamblo {
+
+namespace {
+
+/// What one wake-up sends to a reader at most.
+constexpr std::size_t kBytesOfTurn = 64U << 10U;
+/// What an idle tap's buffer may keep.
+constexpr std::size_t kKeptCapacity = 16U << 10U;
+
+std::string_view nameOf(TappedMessage::Origin origin) noexcept {
+    switch (origin) {
+    case TappedMessage::Origin::sent:
+        return "message";
+    case TappedMessage::Origin::derived:
+        return "derived";
+    case TappedMessage::Origin::session:
+        break;
+    }
+    return "session";
+}
+
+void appendLine(TextBuffer& line, const TappedMessage& message) {
+    line.append("{\"time\":");
+    appendJsonNumber(line, secondsSince1970(message.time));
+    line.append(",\"reporter\":");
+    appendJson(line, Value(message.reporterID));
+    line.append(",\"service\":");
+    appendJsonString(line, message.serviceName);
+    line.append(message.isSessionStarted ? ",\"started\":true" : ",\"started\":false");
+    line.append(",\"origin\":\"");
+    line.append(nameOf(message.origin));
+    line.append("\",\"event\":\"");
+    line.append(eventName(message.category, message.type));
+    line.append("\",\"category\":");
+    appendJson(line, Value(message.category));
+    line.append(",\"type\":");
+    appendJson(line, Value(message.type));
+    const std::size_t bytes = message.payload.bytesOfValues(Dictionary::Shared::inFull);
+    if (bytes <= Taps::kLargestPayload) {
+        line.append(",\"payload\":");
+        appendJson(line, Value(message.payload));
+    } else {
+        line.append(",\"payload_left_out\":");
+        appendJson(line, Value(static_cast<std::uint64_t>(bytes)));
+    }
+    line.append("}\n");
+}
+
+void sendWhatFits(int socket, std::string_view text) noexcept {
+    static_cast<void>(::send(socket, text.data(), text.size(), MSG_DONTWAIT | MSG_NOSIGNAL));
+}
+
+void refuse(const FileDescriptor& reader, std::string_view reason) {
+    TextBuffer line;
+    line.append("{\"error\":");
+    appendJsonString(line, reason);
+    line.append("}\n");
+    sendWhatFits(reader.get(), line.view());
+}
+
+} // namespace
+
+/// One reader. What it waits for is written on the server queue and sent on the loop's thread.
+class Taps::Tap final : public EventSource {
+public:
+    Tap(Taps& taps, FileDescriptor socket, TapFilter filter)
+        : taps_(taps), socket_(std::move(socket)), filter_(std::move(filter)) {}
+
+    [[nodiscard]] bool watch() { return taps_.loop_.add(socket_.get(), 0, *this); }
+    [[nodiscard]] FileDescriptor takeSocket() noexcept { return std::move(socket_); }
+    /// On the server queue. `line` is the message's, once some tap has made it.
+    void offer(const TappedMessage& message, TextBuffer& line) TAMBLO_EXCLUDES(mutex_);
+    void ready(std::uint32_t events) override TAMBLO_EXCLUDES(mutex_);
+    void sendRest() TAMBLO_EXCLUDES(mutex_) {
+        const MutexLock lock(mutex_);
+        (void)sendSome(kMostWaiting);
+    }
+
+private:
+    [[nodiscard]] bool isAtLimit() const noexcept TAMBLO_REQUIRES(mutex_) {
+        return filter_.limit != 0 && shown_ == filter_.limit;
+    }
+    void append(std::string_view line) TAMBLO_REQUIRES(mutex_);
+    /// Until the reader takes something.
+    void wait() TAMBLO_REQUIRES(mutex_);
+    /// False when the reader is gone.
+    [[nodiscard]] bool sendSome(std::size_t most) TAMBLO_REQUIRES(mutex_);
+    void tellWhatIsLeftOut() TAMBLO_REQUIRES(mutex_);
+    [[nodiscard]] bool goOn() TAMBLO_REQUIRES(mutex_);
+
+    Taps& taps_;
+    FileDescriptor socket_;
+    const TapFilter filter_;
+    std::uint64_t matched_ = 0; ///< the server queue's
+
+    Mutex mutex_;
+    TextBuffer out_ TAMBLO_GUARDED_BY(mutex_);
+    std::size_t sent_ TAMBLO_GUARDED_BY(mutex_) = 0; ///< of `out_`
+    std::uint64_t shown_ TAMBLO_GUARDED_BY(mutex_) = 0;
+    std::uint64_t leftOut_ TAMBLO_GUARDED_BY(mutex_) = 0;
+    bool isWriting_ TAMBLO_GUARDED_BY(mutex_) = false; ///< the loop waits until the reader takes more
+};
+
+void Taps::Tap::offer(const TappedMessage& message, TextBuffer& line) {
+    if (!filter_.accepts(message) || matched_++ % filter_.sample != 0) {
+        return;
+    }
+    const MutexLock lock(mutex_);
+    if (isAtLimit()) {
+        return;
+    }
+    ++shown_;
+    // Once full it stays so until half of it is sent: else every message would be made into text to find that
+    // it does not fit.
+    if (leftOut_ != 0) {
+        ++leftOut_;
+        return;
+    }
+    try {
+        if (line.empty()) {
+            appendLine(line, message);
+        }
+        if (out_.size() - sent_ + line.size() <= kMostWaiting) {
+            append(line.view());
+            return;
+        }
+    } catch (const std::bad_alloc&) {
+        line.clear();
+    }
+    ++leftOut_;
+    wait();
+}
+
+void Taps::Tap::append(std::string_view line) {
+    if (sent_ != 0 && out_.size() + line.size() > kMostWaiting) {
+        out_.dropFront(std::exchange(sent_, 0));
+    }
+    out_.append(line);
+    wait();
+}
+
+void Taps::Tap::wait() {
+    if (!std::exchange(isWriting_, true)) {
+        taps_.loop_.modify(socket_.get(), EPOLLOUT, *this);
+    }
+}
+
+void Taps::Tap::tellWhatIsLeftOut() {
+    if (leftOut_ != 0) {
+        append(formatted("{\"left_out\":{}}\n", std::exchange(leftOut_, 0)));
+    }
+}
+
+void Taps::Tap::ready(std::uint32_t events) {
+    bool goesOn = (events & (EPOLLERR | EPOLLHUP)) == 0;
+    if (goesOn) {
+        const MutexLock lock(mutex_);
+        goesOn = sendSome(kBytesOfTurn) && goOn();
+    }
+    if (!goesOn) {
+        taps_.remove(*this);
+    }
+}
+
+bool Taps::Tap::sendSome(std::size_t most) {
+    const std::string_view rest = out_.view().substr(sent_, most);
+    const ssize_t count = ::send(socket_.get(), rest.data(), rest.size(), MSG_DONTWAIT | MSG_NOSIGNAL);
+    if (count < 0) {
+        return errno == EAGAIN || errno == EWOULDBLOCK || errno == EINTR;
+    }
+    sent_ += static_cast<std::size_t>(count);
+    return true;
+}
+
+/// What follows when some was sent; whether the reader is to be shown more.
+bool Taps::Tap::goOn() {
+    if (out_.size() - sent_ <= kMostWaiting / 2) {
+        tellWhatIsLeftOut();
+    }
+    if (sent_ < out_.size()) {
+        return true;
+    }
+    out_.clearAndKeep(kKeptCapacity);
+    sent_ = 0;
+    isWriting_ = false;
+    taps_.loop_.modify(socket_.get(), 0, *this);
+    return !isAtLimit();
+}
+
+Taps::~Taps() {
+    const MutexLock lock(mutex_);
+    for (const std::shared_ptr<Tap>& tap : taps_) {
+        tap->sendRest();
+    }
+}
+
+void Taps::add(FileDescriptor reader, std::string_view filter) {
+    auto parsed = TapFilter::parse(filter);
+    if (const auto* const wrong = std::get_if<std::string>(&parsed)) {
+        refuse(reader, *wrong);
+        return;
+    }
+    auto tap = std::make_shared<Tap>(*this, std::move(reader), std::get<TapFilter>(std::move(parsed)));
+    const MutexLock lock(mutex_);
+    if (taps_.size() == kMostTaps || !tap->watch()) {
+        refuse(tap->takeSocket(), formatted("tap: there are {} taps at most", kMostTaps));
+        return;
+    }
+    taps_.push_back(std::move(tap));
+    setOpen(true);
+}
+
+void Taps::offer(const TappedMessage& message) {
+    line_.clearAndKeep(kKeptCapacity);
+    const MutexLock lock(mutex_);
+    for (const std::shared_ptr<Tap>& tap : taps_) {
+        tap->offer(message, line_);
+    }
+}
+
+void Taps::remove(const Tap& tap) {
+    const MutexLock lock(mutex_);
+    const auto found =
+        std::ranges::find(taps_, &tap, [](const std::shared_ptr<Tap>& known) { return known.get(); });
+    if (found == taps_.end()) {
+        return;
+    }
+    std::shared_ptr<Tap> removed = std::move(*found);
+    taps_.erase(found);
+    setOpen(!taps_.empty());
+    const FileDescriptor socket = removed->takeSocket();
+    loop_.remove(socket.get());
+    // The events of this wake-up may still name it.
+    loop_.post([removed = std::move(removed)] {});
+}
+
+} // namespace tamblo

@@ -1,0 +1,155 @@
+#include "base/Format.h"
+#include "base/NumberText.h"
+#include "tools/Command.h"
+#include "tools/Payload.h"
+#include "tools/ServiceConnection.h"
+#include "tools/SessionFile.h"
+#include "tools/SessionRecorder.h"
+#include "tools/SinkFile.h"
+#include "tools/SinkSnapshot.h"
+#include "wire/Directories.h"
+
+#include <cerrno>
+#include <cstdio>
+#include <cstring>
+#include <memory>
+
+namespace tamblo::tools {
+
+namespace {
+
+constexpr Option kOptions[] = {
+    {.name = "--session", .value = "NAME", .help = "the session of this name in the call-quality file"},
+    {.name = "--reporter", .value = "ID", .help = "the last session of this reporter", .letter = 'r'},
+    {.name = "--app", .value = "NAME", .help = "the last session of this application"},
+    {.name = "--output",
+     .value = "FILE",
+     .help = "the file that is written; - and none: standard output",
+     .letter = 'o'},
+};
+
+struct CloseFile {
+    void operator()(std::FILE* file) const noexcept {
+        if (file != stdout) {
+            static_cast<void>(std::fclose(file));
+        }
+    }
+};
+using OutputFile = std::unique_ptr<std::FILE, CloseFile>;
+
+/// Written at the end; whatever could not be.
+std::optional<ExitStatus> finish(std::FILE* file, const std::string& name) {
+    const bool isWritten = std::fflush(file) == 0 && std::ferror(file) == 0;
+    return isWritten ? std::nullopt
+                     : std::optional(complain(ExitStatus::failed,
+                                              formatted("cannot write {}: {}", name, std::strerror(errno))));
+}
+
+std::variant<WantedSession, std::string> wantedSession(const Arguments& arguments) {
+    WantedSession wanted;
+    if (!arguments.rest().empty()) {
+        return formatted("record takes no \"{}\"; the file is named with -o", arguments.rest()[0]);
+    }
+    wanted.name = arguments.last("--session");
+    wanted.application = arguments.last("--app");
+    if (const auto text = arguments.last("--reporter")) {
+        wanted.reporterID = parseNumber<std::int64_t>(*text);
+        if (!wanted.reporterID) {
+            return formatted("\"{}\" is no reporter ID: it is a signed 64-bit number", *text);
+        }
+    }
+    return wanted;
+}
+
+void say(const std::string& text) {
+    std::fprintf(stderr, "%s\n", text.c_str());
+}
+
+/// For people, on standard error, as standard output may be the file.
+ExitStatus tell(const FoundSession& session, const SessionFileWriter& writer, const RecordingReport& report) {
+    say(formatted("{} messages of session {}{}, {} s{}", writer.written(), plainText(Value(session.name)),
+                  session.hasOpenLine
+                      ? formatted(" of reporter {}, {}", session.reporterID, session.serviceType)
+                      : std::string(),
+                  fixed(writer.seconds(), 3), writer.leftOut()));
+    if (!session.hasOpenLine) {
+        say("its beginning is in no file any more: no service type, no configuration, and maybe not all");
+    }
+    if (!report.hasStopped) {
+        say("it has not stopped, or its end is in none of the files");
+    }
+    if (report.withoutNull != 0) {
+        say(formatted("{} messages have values without a JSON form, which are missing", report.withoutNull));
+    }
+    if (report.passedOver != 0) {
+        say(formatted("{} lines of the files are torn or longer than any that the service writes",
+                      report.passedOver));
+    }
+    if (report.unreadable != 0) {
+        say(formatted("{} lines of the session cannot be read and are missing", report.unreadable));
+    }
+    return report.unreadable == 0 && session.hasOpenLine ? ExitStatus::done : ExitStatus::failed;
+}
+
+ExitStatus run(const Arguments& arguments) {
+    const auto made = wantedSession(arguments);
+    if (const auto* wrong = std::get_if<std::string>(&made)) {
+        return complain(ExitStatus::usage, *wrong);
+    }
+    const std::string logs = wire::Directories::ofThisProcess().logs;
+    if (logs.empty()) {
+        return complain(ExitStatus::usage, "the logs directory is not known: set LOGS_DIRECTORY");
+    }
+    const std::string sinkFile = sinkPath(logs, "call-quality");
+    SinkSnapshot sink(sinkFile);
+    if (!sink.problem().empty()) {
+        say("tambloctl: " + sink.problem());
+    }
+    if (sink.isEmpty()) {
+        return complain(ExitStatus::failed,
+                        formatted("there is no {} to read: no session was started yet, or LOGS_DIRECTORY "
+                                  "is not the service's",
+                                  sinkFile));
+    }
+    const std::optional<FoundSession> session = findSession(sink, std::get<WantedSession>(made));
+    if (!session) {
+        return complain(ExitStatus::failed,
+                        formatted("no such session in {} and its earlier files; those of service type test "
+                                  "are not there",
+                                  sinkFile));
+    }
+    const std::string name(arguments.last("--output").value_or("-"));
+    const OutputFile file(name == "-" ? stdout : std::fopen(name.c_str(), "we"));
+    if (file == nullptr) {
+        return complain(ExitStatus::failed, formatted("cannot write {}: {}", name, std::strerror(errno)));
+    }
+    SessionFileWriter writer(file.get());
+    const RecordingReport report = recordSession(sink, *session, writer);
+    if (const auto failure = finish(file.get(), name)) {
+        return *failure;
+    }
+    return tell(*session, writer, report);
+}
+
+} // namespace
+
+constexpr Command kCommandRecord{
+    "record",
+    "write a session from the call-quality file as one that can be played",
+    "[--session NAME | --reporter ID | --app NAME] [-o FILE]",
+    "Of several sessions the last one counts, and without any option the last one of all. The file has a "
+    "line that\n"
+    "names the session's service type and configuration, and a line for each message, for \"tambloctl "
+    "session --play\".\n"
+    "What the service makes itself when a session is played is left out: summaries, driver statistics, "
+    "features of the\n"
+    "device. Repeats are in no sink, and values are as JSON has them: a date or a byte string is a text. "
+    "Timestamps of\n"
+    "messages are in the call-quality file of internal builds only; without them, play with "
+    "--recorded-spacing. Exits\n"
+    "with 1 when there is no such session, or some of it is missing.",
+    kOptions,
+    run,
+};
+
+} // namespace tamblo::tools
