@@ -153,9 +153,9 @@ private:
     [[nodiscard]] static double cpu() {
         return secondsOn(CLOCK_PROCESS_CPUTIME_ID) - secondsOn(CLOCK_THREAD_CPUTIME_ID);
     }
-    /// $FUZZED_COSTS names those that count, such as "log memory"; all do without it. The service goes on with
-    /// what is left of an input, such as summaries, while the next one has begun: what an input was granted
-    /// and did not spend is there for the next.
+    /// $FUZZED_COSTS names those that count, such as "log memory"; all do without it. The service goes on
+    /// with what is left of an input, such as summaries, while the next one has begun: what an input was
+    /// granted and did not spend is there for the next.
     void check(std::string_view what, double cost, double granted) const {
         static const char* const chosen = std::getenv("FUZZED_COSTS");
         static std::map<std::string_view, double> unspent;
