@@ -145,9 +145,9 @@ constexpr Command kCommandRecord{
     "features of the\n"
     "device. Repeats are in no sink, and values are as JSON has them: a date or a byte string is a text. "
     "Timestamps of\n"
-    "messages are in the call-quality file of internal builds only; without them, play with "
-    "--recorded-spacing. Exits\n"
-    "with 1 when there is no such session, or some of it is missing.",
+    "messages are in the call-quality file of internal builds only; without them, the lines' times count. "
+    "Exits with 1\n"
+    "when there is no such session, or some of it is missing.",
     kOptions,
     run,
 };
