@@ -231,6 +231,7 @@ void ZRReportingSession::normalise(ZRReportingSessionMessage& message) const {
 
 std::vector<std::string> ZRReportingSession::workerNames() const {
     std::vector<std::string> names;
+    names.reserve(messageWorkers_.size());
     for (const Worker& worker : messageWorkers_) {
         names.emplace_back(worker.workerClass->name);
     }

@@ -40,8 +40,8 @@ bool isDerivedKind(std::uint32_t category) noexcept {
 /// By name where there is one that is read back as the number.
 Value categoryWord(std::uint32_t number) {
     const auto category = static_cast<client::EventCategory>(number);
-    std::string name = client::categoryName(category);
-    return client::parseCategory(name) == category ? Value(std::move(name)) : Value(number);
+    const std::string name = client::categoryName(category);
+    return client::parseCategory(name) == category ? Value(name) : Value(number);
 }
 
 Value typeWord(std::uint16_t number) {

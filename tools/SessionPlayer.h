@@ -79,7 +79,7 @@ public:
     };
 
     SessionPlayer(client::Client& client, Options options)
-        : client_(client), options_(options), report_(std::make_shared<Report>()) {}
+        : client_(client), options_(std::move(options)), report_(std::make_shared<Report>()) {}
 
     /// Plays to the end, or to the first line that is wrong: says in `name:line: …` what is wrong with it.
     /// A header in the first line is passed over.

@@ -51,6 +51,7 @@ void SinkFiles::flush() {
 std::vector<SinkFiles::State> SinkFiles::states() const {
     std::vector<State> states;
     const MutexLock lock(listMutex_);
+    states.reserve(files_.size());
     for (const AppendOnlyFile* file : files_) {
         states.push_back({file->name(), file->path(), file->isOut()});
     }
