@@ -12,54 +12,11 @@
 #include <thread>
 #include <vector>
 
-#include <sys/socket.h>
-
 namespace tamblo::test {
 
 namespace {
 
 using nlohmann::json;
-
-/// A connection to the status socket.
-class StatusReader {
-public:
-    explicit StatusReader(const ServiceProcess& service)
-        : socket_(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0)) {
-        const sockaddr_un address = addressOf(service.runtimeDirectory() + "/com.vandra.tamblo.status");
-        isConnected_ =
-            ::connect(socket_.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address) == 0;
-    }
-    [[nodiscard]] bool isConnected() const noexcept { return isConnected_; }
-    void send(std::string_view text) const {
-        (void)::send(socket_.get(), text.data(), text.size(), MSG_NOSIGNAL);
-    }
-    void endSending() const { ::shutdown(socket_.get(), SHUT_WR); }
-    /// Everything up to the end, or what came within some seconds.
-    [[nodiscard]] std::string rest() const {
-        std::string text;
-        std::array<char, 65536> bytes;
-        for (;;) {
-            pollfd readable{.fd = socket_.get(), .events = POLLIN, .revents = 0};
-            const ssize_t count = ::poll(&readable, 1, kPatience.count()) == 1
-                                      ? ::recv(socket_.get(), bytes.data(), bytes.size(), 0)
-                                      : -1;
-            if (count <= 0) {
-                return text;
-            }
-            text.append(bytes.data(), static_cast<std::size_t>(count));
-        }
-    }
-
-private:
-    FileDescriptor socket_;
-    bool isConnected_ = false;
-};
-
-std::string statusText(const ServiceProcess& service, const std::string& line) {
-    const StatusReader reader(service);
-    reader.send(line + "\n");
-    return reader.rest();
-}
 
 json statusJson(const ServiceProcess& service, const std::string& line) {
     return json::parse(statusText(service, line));
