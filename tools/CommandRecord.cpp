@@ -1,18 +1,24 @@
 #include "base/Format.h"
+#include "base/Json.h"
 #include "base/NumberText.h"
 #include "tools/Command.h"
+#include "tools/LiveRecorder.h"
 #include "tools/Payload.h"
 #include "tools/ServiceConnection.h"
 #include "tools/SessionFile.h"
 #include "tools/SessionRecorder.h"
 #include "tools/SinkFile.h"
 #include "tools/SinkSnapshot.h"
+#include "tools/StatusConnection.h"
+#include "tools/TapLines.h"
 #include "wire/Directories.h"
 
 #include <cerrno>
+#include <csignal>
 #include <cstdio>
 #include <cstring>
 #include <memory>
+#include <span>
 
 namespace tamblo::tools {
 
@@ -26,6 +32,10 @@ constexpr Option kOptions[] = {
      .value = "FILE",
      .help = "the file that is written; - and none: standard output",
      .letter = 'o'},
+    {.name = "--live",
+     .value = "",
+     .help = "the reporter's session as it goes on, or the next one, until it stops"},
+    kStatusSocketOption,
 };
 
 struct CloseFile {
@@ -91,10 +101,75 @@ ExitStatus tell(const FoundSession& session, const SessionFileWriter& writer, co
     return report.unreadable == 0 && session.hasOpenLine ? ExitStatus::done : ExitStatus::failed;
 }
 
+/// Of the reporter's session, while it is there.
+std::optional<Dictionary> configurationOf(const Arguments& arguments, std::int64_t reporterID) {
+    const auto answer = StatusConnection(arguments).ask(formatted("session {}", reporterID));
+    const auto* const document = std::get_if<StatusDocument>(&answer);
+    const Value none;
+    const Value& sessions = document != nullptr ? (*document)["sessions"] : none;
+    for (const Value& session : sessions.isArray() ? sessions.arrayValue() : std::span<const Value>()) {
+        if (const Value& found = StatusDocument::member(session, "configuration"); found.isDictionary()) {
+            return found.dictionaryValue();
+        }
+    }
+    return std::nullopt;
+}
+
+ExitStatus tellLive(const LiveRecorder& recorder, const SessionFileWriter& writer, std::int64_t reporterID) {
+    say(formatted("{} messages of the session of reporter {}, {}, {} s{}", writer.written(), reporterID,
+                  recorder.serviceType(), fixed(writer.seconds(), 3), writer.leftOut()));
+    if (!recorder.hasStopped()) {
+        say("it has not stopped");
+    }
+    if (recorder.withoutNull() != 0) {
+        say(formatted("{} messages have values without a JSON form, which are missing",
+                      recorder.withoutNull()));
+    }
+    const std::string missing = recorder.missing();
+    std::fputs(missing.c_str(), stderr);
+    return missing.empty() ? ExitStatus::done : ExitStatus::failed;
+}
+
+ExitStatus recordLive(const Arguments& arguments, const WantedSession& wanted) {
+    if (!wanted.reporterID || wanted.name || wanted.application) {
+        return complain(ExitStatus::usage, "--live needs --reporter, and no other choice of a session");
+    }
+    const std::int64_t reporterID = *wanted.reporterID;
+    std::signal(SIGPIPE, SIG_IGN);
+    const auto tap =
+        StatusConnection(arguments).send("tap " + jsonText(Dictionary{{"reporter", reporterID}}));
+    if (const auto* failure = std::get_if<StatusConnection::Failure>(&tap)) {
+        return complain(failure->status, failure->text);
+    }
+    const std::string name(arguments.last("--output").value_or("-"));
+    const OutputFile file(name == "-" ? stdout : std::fopen(name.c_str(), "we"));
+    if (file == nullptr) {
+        return complain(ExitStatus::failed, formatted("cannot write {}: {}", name, std::strerror(errno)));
+    }
+    SessionFileWriter writer(file.get());
+    LiveRecorder recorder(reporterID, writer, [&] { return configurationOf(arguments, reporterID); });
+    TapLineFunction take = [&recorder](std::string_view line) { return recorder.take(line); };
+    // An answer to a later request says that the tap is open.
+    (void)configurationOf(arguments, reporterID);
+    say(formatted("recording the session of reporter {}", reporterID));
+    readTap(std::get<FileDescriptor>(tap), file.get(), take);
+    if (const auto failure = finish(file.get(), name)) {
+        return *failure;
+    }
+    if (!recorder.refusal().empty() || !recorder.hasBegun()) {
+        return complain(ExitStatus::failed,
+                        recorder.refusal().empty() ? "no session was started" : recorder.refusal());
+    }
+    return tellLive(recorder, writer, reporterID);
+}
+
 ExitStatus run(const Arguments& arguments) {
     const auto made = wantedSession(arguments);
     if (const auto* wrong = std::get_if<std::string>(&made)) {
         return complain(ExitStatus::usage, *wrong);
+    }
+    if (arguments.has("--live")) {
+        return recordLive(arguments, std::get<WantedSession>(made));
     }
     const std::string logs = wire::Directories::ofThisProcess().logs;
     if (logs.empty()) {
@@ -135,8 +210,8 @@ ExitStatus run(const Arguments& arguments) {
 
 constexpr Command kCommandRecord{
     "record",
-    "write a session from the call-quality file as one that can be played",
-    "[--session NAME | --reporter ID | --app NAME] [-o FILE]",
+    "write a session from the call-quality file, or as it goes on, as one that can be played",
+    "[--session NAME | [--live] --reporter ID | --app NAME] [-o FILE]",
     "Of several sessions the last one counts, and without any option the last one of all. The file has a "
     "line that\n"
     "names the session's service type and configuration, and a line for each message, for \"tambloctl "
@@ -145,9 +220,14 @@ constexpr Command kCommandRecord{
     "features of the\n"
     "device. Repeats are in no sink, and values are as JSON has them: a date or a byte string is a text. "
     "Timestamps of\n"
-    "messages are in the call-quality file of internal builds only; without them, the lines' times count. "
-    "Exits with 1\n"
-    "when there is no such session, or some of it is missing.",
+    "messages are in the call-quality file of internal builds only.\n"
+    "\n"
+    "With --live messages come from the service itself, with their timestamps, until the session stops or "
+    "Ctrl-C;\n"
+    "sessions of several clients under one ID are not told apart. Exits with 1 when there is no such "
+    "session, "
+    "or some of\n"
+    "it is missing.",
     kOptions,
     run,
 };

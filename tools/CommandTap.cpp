@@ -8,19 +8,14 @@
 #include "tools/Payload.h"
 #include "tools/ServiceConnection.h"
 #include "tools/StatusConnection.h"
+#include "tools/TapLines.h"
 
 #include <array>
-#include <cerrno>
 #include <csignal>
 #include <cstdio>
 #include <map>
 #include <string>
 #include <utility>
-
-#include <poll.h>
-#include <sys/signalfd.h>
-#include <sys/socket.h>
-#include <unistd.h>
 
 namespace tamblo::tools {
 
@@ -169,44 +164,6 @@ private:
     std::uint64_t leftOut_ = 0;
 };
 
-FileDescriptor endingSignals() {
-    sigset_t signals;
-    sigemptyset(&signals);
-    sigaddset(&signals, SIGINT);
-    sigaddset(&signals, SIGTERM);
-    ::sigprocmask(SIG_BLOCK, &signals, nullptr);
-    return FileDescriptor(::signalfd(-1, &signals, SFD_CLOEXEC));
-}
-
-/// Until the tap ends, a signal comes, or nobody reads what is printed.
-void printAll(const FileDescriptor& tap, TapPrinter& printer) {
-    const FileDescriptor signals = endingSignals();
-    std::string held;
-    std::array<char, 65536> bytes;
-    while (std::fflush(stdout) == 0 && std::ferror(stdout) == 0) {
-        std::array<pollfd, 3> watched{{{.fd = tap.get(), .events = POLLIN, .revents = 0},
-                                       {.fd = signals.get(), .events = POLLIN, .revents = 0},
-                                       {.fd = STDOUT_FILENO, .events = 0, .revents = 0}}};
-        if (::poll(watched.data(), watched.size(), -1) < 0) {
-            continue;
-        }
-        if (watched[1].revents != 0 || watched[2].revents != 0) {
-            return;
-        }
-        const ssize_t count = ::recv(tap.get(), bytes.data(), bytes.size(), 0);
-        if (count <= 0) {
-            return;
-        }
-        held.append(bytes.data(), static_cast<std::size_t>(count));
-        std::size_t start = 0;
-        for (std::size_t end = held.find('\n'); end != std::string::npos; end = held.find('\n', start)) {
-            printer.print(std::string_view(held).substr(start, end - start));
-            start = end + 1;
-        }
-        held.erase(0, start);
-    }
-}
-
 ExitStatus run(const Arguments& arguments) {
     const auto filter = makeFilter(arguments);
     if (const auto* wrong = std::get_if<std::string>(&filter)) {
@@ -222,7 +179,11 @@ ExitStatus run(const Arguments& arguments) {
         return complain(failure->status, failure->text);
     }
     TapPrinter printer(arguments.has("--json"));
-    printAll(std::get<FileDescriptor>(connection), printer);
+    TapLineFunction print = [&printer](std::string_view line) {
+        printer.print(line);
+        return true;
+    };
+    readTap(std::get<FileDescriptor>(connection), stdout, print);
     if (!printer.error().empty()) {
         return complain(ExitStatus::failed, printer.error());
     }

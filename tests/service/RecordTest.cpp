@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <cmath>
+#include <future>
 
 #include <gmock/gmock.h>
 #include <nlohmann/json.hpp>
@@ -74,6 +75,57 @@ TEST(Record, WhatIsPlayedFromARecordingDerivesTheSameSummaries) {
     }
     EXPECT_EQ(service.tambloctl("record --reporter 9").status, 1);
     EXPECT_EQ(service.tambloctl("record -o /dev/full").status, 1);
+}
+
+TEST(Record, ALiveRecordingIsTheSessionUntilItStops) {
+    ServiceProcess service({.isInternalBuild = true});
+    const std::string live = service.logs().string() + "/live";
+    const std::string said = service.logs().string() + "/said";
+    auto recorded = std::async(std::launch::async, [&] {
+        return run("(" + service.tambloctlCommand("record --live -r 101 -o " + live + " 2>" + said + ")"));
+    });
+    ASSERT_TRUE(eventually([&] { return contentOf(said).find("recording") != std::string::npos; }));
+    const std::string playing = "session --json --fast --reporter ";
+    const CommandResult original = service.tambloctl(
+        playing +
+        "101 --service-type longformaudio --configuration '{\"HostApplicationDisplayID\":\"app\"}'" +
+        " --play " EXAMPLES_DIR "/music.jsonl");
+    ASSERT_EQ(original.status, 0) << original.output;
+    EXPECT_EQ(recorded.get().status, 0) << contentOf(said);
+    EXPECT_THAT(linesOf(live).at(0), HasSubstr(R"("configuration":{"HostApplicationDisplayID":"app"})"));
+    const CommandResult again = service.tambloctl(playing + "102 --play " + live);
+    ASSERT_EQ(again.status, 0) << again.output;
+    EXPECT_FALSE(figuresOf(original.output).empty());
+    EXPECT_EQ(figuresOf(original.output), figuresOf(again.output));
+}
+
+TEST(Record, ALiveRecordingSaysWhatIsMissing) {
+    const TemporaryDirectory directory;
+    const FileDescriptor listener(boundSocket(SOCK_STREAM, directory.path("status")));
+    ASSERT_EQ(::listen(listener.get(), 3), 0);
+    // A tap, and two requests for the session's configuration, which nobody knows.
+    std::thread service([&listener] {
+        const std::string line = R"({"time":5,"reporter":7,"service":"haptics","started":true,"type":2,)";
+        const std::string shown = line + R"("origin":"message","category":4,"payload":{"a":1}})" + "\n" +
+                                  line + R"("origin":"message","category":4,"payload_left_out":70000})" +
+                                  "\n" + "{\"left_out\":12}\n" + line +
+                                  R"("origin":"session","category":8})" + "\n";
+        for (const std::string& answer : {shown, std::string("{}\n"), std::string("{}\n")}) {
+            const FileDescriptor client(::accept(listener.get(), nullptr, nullptr));
+            (void)::send(client.get(), answer.data(), answer.size(), MSG_NOSIGNAL);
+            std::array<char, 256> request;
+            (void)::recv(client.get(), request.data(), request.size(), 0);
+        }
+    });
+    const CommandResult recorded =
+        run("timeout 20 " TAMBLOCTL_PATH " record --live -r 7 --socket " + directory.path("status"));
+    service.join();
+    EXPECT_EQ(recorded.status, 1);
+    EXPECT_THAT(recorded.output, HasSubstr("1 messages of the session of reporter 7, haptics"));
+    for (const char* missing : {"had begun before", "configuration could not", "12 messages were left out",
+                                "1 messages with large payloads"}) {
+        EXPECT_THAT(recorded.output, HasSubstr(missing));
+    }
 }
 
 } // namespace
