@@ -105,8 +105,7 @@ inline constexpr std::array<std::string_view, 11> kMethods{
     "getAllReporters",
     "killService",
 };
-/// Limits that clients reach, by the names that they are told: those that may be changed, and what the system
-/// gives.
+/// Limits that clients reach, by the names that they are told.
 inline constexpr auto kLimits = [] {
     std::array<std::string_view, kLimitRows.size() + 2> names{};
     auto* const further = std::ranges::transform(kLimitRows, names.begin(), &LimitRow::name).out;
