@@ -5,6 +5,7 @@
 #include "base/Mutex.h"
 #include "base/SplitText.h"
 #include "os/SmallFile.h"
+#include "platform/PreferenceDomains.h"
 #include "platform/linux/status/MetricsText.h"
 #include "platform/linux/status/RowDocuments.h"
 
@@ -216,10 +217,10 @@ void StatusDocuments::appendSettings(JsonObject& document) const {
         settings.push_back({std::string(key), value ? jsonText(*value) : std::move(whenAbsent),
                             value ? parts_.preferences.path(domain) : "default"});
     };
-    add("com.vandra.tamblo.analytics", "events_in_use", R"(["*"])");
-    add("com.vandra.tamblo.callquality", "backends", R"(["spool"])");
-    add("com.vandra.tamblo.sinks", "file_mode", octal(parts_.fileModes.file));
-    add("com.vandra.tamblo.sinks", "directory_mode", octal(parts_.fileModes.directory));
+    add(kAnalyticsDomain, "events_in_use", R"(["*"])");
+    add(kCallQualityDomain, "backends", R"(["spool"])");
+    add(kSinksDomain, "file_mode", octal(parts_.fileModes.file));
+    add(kSinksDomain, "directory_mode", octal(parts_.fileModes.directory));
     const ReportLimits reports;
     add(kLimitsDomain, "report_files", formatted("{}", reports.files));
     add(kLimitsDomain, "report_bytes", formatted("{}", reports.bytes));
