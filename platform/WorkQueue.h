@@ -7,6 +7,7 @@
 #include <cstddef>
 #include <memory>
 #include <string_view>
+#include <vector>
 
 namespace tamblo {
 
@@ -64,8 +65,35 @@ public:
     /// What the client has asked for.
     [[nodiscard]] RequestTally& tally() noexcept { return tally_; }
 
+    /// Processor time, as somebody adds it up on the reporting server queue.
+    using TimeAccount = std::shared_ptr<std::chrono::nanoseconds>;
+    /// Says for whom the piece of work that runs does something besides the client; several share what it
+    /// takes. On the reporting server queue, in the piece.
+    void chargeTo(const TimeAccount& account) {
+        if (charged_ == accounts_.size()) {
+            accounts_.push_back(account);
+        } else if (accounts_[charged_] != account) {
+            accounts_[charged_] = account;
+        }
+        ++charged_;
+    }
+
+protected:
+    /// At the end of the piece.
+    void charge(std::chrono::nanoseconds time) noexcept {
+        tally_.addTime(time);
+        const auto share = charged_ > 1 ? time / static_cast<std::int64_t>(charged_) : time;
+        for (std::size_t i = 0; i != charged_; ++i) {
+            *accounts_[i] += share;
+        }
+        charged_ = 0;
+    }
+
 private:
     RequestTally tally_;
+    /// The first ones are those of this piece, the others of pieces before: most clients have one session.
+    std::vector<TimeAccount> accounts_;
+    std::size_t charged_ = 0;
 };
 
 /// One call that is to come. Destroying it calls it off; a call that has begun is not waited for.

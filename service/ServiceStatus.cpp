@@ -58,6 +58,7 @@ SessionRow rowOf(const ZRReportingSession& session, const ZRReportingClientServe
             .bytes = session.messageBytes(),
             .recorded = session.acceptedMessageCount(),
             .dropped = session.droppedMessageCount(),
+            .time = *session.processorTime(),
             .retainedBytes = session.retainedBytes()};
 }
 

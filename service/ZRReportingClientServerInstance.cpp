@@ -319,6 +319,7 @@ void ZRReportingClientServerInstance::performSend(Dictionary message, std::uint3
         answer(reply);
     } else if (recipients_.size() == 1 && !recipients_.front()->isStopping()) {
         // It is given the payload itself, which spares it a copy when it is normalised.
+        requests_->chargeTo(recipients_.front()->processorTime());
         recipients_.front()->sendMessage(
             std::make_shared<ZRReportingSessionMessage>(std::move(message), category, type),
             std::move(reply));
@@ -347,6 +348,7 @@ void ZRReportingClientServerInstance::sendSome(const std::shared_ptr<Sending>& s
         const SessionRef session = std::move(sending->recipients[sending->next++]);
         if (!isLeftOut) {
             ++sending->begun;
+            requests_->chargeTo(session->processorTime());
             session->sendMessage(sending->record(),
                                  [sending](const ReplyError* error) { sending->noteAnswer(error); });
         }
@@ -424,6 +426,7 @@ void ZRReportingClientServerInstance::finishStop(ReporterID reporterID, const Se
 
 template <typename Finish>
 void ZRReportingClientServerInstance::stopThen(const SessionRef& session, Finish finish) {
+    requests_->chargeTo(session->processorTime());
     if (session->stopSome()) {
         finish(*this);
         return;
@@ -566,11 +569,16 @@ void ZRReportingClientServerInstance::leaveSome() {
 SessionRef ZRReportingClientServerInstance::findReportingSessionForID(ReporterID reporterID,
                                                                       bool acrossAllClients) const {
     const auto own = clientReportingSessionMap_.find(reporterID);
+    SessionRef session;
     if (own != clientReportingSessionMap_.end()) {
-        return own->second;
+        session = own->second;
+    } else if (const Delegate delegate = acrossAllClients ? delegate_.lock() : nullptr) {
+        session = delegate->findReportingSessionForID(reporterID);
     }
-    const Delegate delegate = acrossAllClients ? delegate_.lock() : nullptr;
-    return delegate != nullptr ? delegate->findReportingSessionForID(reporterID) : nullptr;
+    if (session != nullptr) {
+        requests_->chargeTo(session->processorTime());
+    }
+    return session;
 }
 
 SessionRef ZRReportingClientServerInstance::makeSession(ReporterID reporterID) const {

@@ -182,6 +182,8 @@ TEST(Status, ClientsAndSessionsAreShownWithWhatTheyHave) {
     EXPECT_EQ(sessions[0]["recorded"], 2);
     EXPECT_EQ(sessions[1]["reporter"], -3);
     EXPECT_EQ(sessions[0]["retained_bytes"], clients[0]["retained_bytes"]);
+    EXPECT_GT(sessions[0]["seconds"], 0);
+    EXPECT_LT(sessions[0]["seconds"], clients[0]["seconds"]); // which have been read and decoded, too
     const json shown = statusJson(service, "session 7")["sessions"];
     ASSERT_EQ(shown.size(), 1U);
     EXPECT_EQ(shown[0]["previous_values"]["volume"], 2);
