@@ -3,6 +3,7 @@
 #include "base/UniqueFunction.h"
 #include "platform/RequestTally.h"
 
+#include <algorithm>
 #include <chrono>
 #include <cstddef>
 #include <memory>
@@ -70,10 +71,8 @@ public:
     /// Says for whom the piece of work that runs does something besides the client; several share what it
     /// takes. On the reporting server queue, in the piece.
     void chargeTo(const TimeAccount& account) {
-        if (charged_ == accounts_.size()) {
-            accounts_.push_back(account);
-        } else if (accounts_[charged_] != account) {
-            accounts_[charged_] = account;
+        if (charged_ == accounts_.size() || accounts_[charged_] != account) {
+            placeAccount(account);
         }
         ++charged_;
     }
@@ -90,6 +89,11 @@ protected:
     }
 
 private:
+    void placeAccount(const TimeAccount& account) {
+        accounts_.resize(std::max(accounts_.size(), charged_ + 1));
+        accounts_[charged_] = account;
+    }
+
     RequestTally tally_;
     /// The first ones are those of this piece, the others of pieces before: most clients have one session.
     std::vector<TimeAccount> accounts_;
