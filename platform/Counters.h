@@ -1,5 +1,7 @@
 #pragma once
 
+#include "platform/Limits.h"
+
 #include <algorithm>
 #include <array>
 #include <atomic>
@@ -105,32 +107,13 @@ inline constexpr std::array<std::string_view, 11> kMethods{
     "killService",
 };
 /// Limits that clients reach, by the names that they are told.
-inline constexpr std::array<std::string_view, 24> kLimits{
-    "reporters_of_message",
-    "entries_of_dictionary",
-    "key_bytes",
-    "bytes_of_keys",
-    "decoded_bytes_of_frame",
-    "delivered_bytes_of_message",
-    "application_name_bytes",
-    "configuration_bytes_of_session",
-    "configuration_bytes_of_user",
-    "previous_keys_of_session",
-    "sessions_of_connection",
-    "sessions_of_user",
-    "connections_of_user",
-    "retained_bytes_of_user",
-    "retained_bytes",
-    "waiting_requests",
-    "waiting_bytes",
-    "waiting_bytes_of_user",
-    "unfinished_bytes_of_user",
-    "frame_seconds",
-    "reply_bytes",
-    "reply_bytes_of_user",
-    "descriptors",
-    "memory",
-};
+inline constexpr auto kLimits = [] {
+    std::array<std::string_view, kLimitRows.size() + 2> names{};
+    auto* const further = std::ranges::transform(kLimitRows, names.begin(), &LimitRow::name).out;
+    further[0] = "descriptors";
+    further[1] = "memory";
+    return names;
+}();
 /// How long requests waited until they were begun with, and took.
 enum class Histogram : std::uint8_t { waited, took, count };
 /// The upper bounds of the buckets grow fourfold from a microsecond on; the last bucket has none.

@@ -53,13 +53,13 @@ constexpr Option kOptions[] = {
     kStatusSocketOption,
 };
 
-/// What an option of the kind is resolved to; or a line that says what is wrong.
+/// The filter that the options ask for, as the service takes it; or a line that says what is wrong.
 std::variant<Dictionary, std::string> makeFilter(const Arguments& arguments) {
     std::map<std::string_view, Array> lists;
     for (const std::string_view text : arguments.all("--reporter")) {
         const auto reporter = parseNumber<std::int64_t>(text);
         if (!reporter) {
-            return formatted("\"{}\" is no reporter ID: it is a signed 64-bit number", text);
+            return notAReporterID(text);
         }
         lists["reporter"].emplace_back(*reporter);
     }

@@ -3,6 +3,7 @@
 #include "base/Format.h"
 #include "base/Json.h"
 #include "platform/linux/tap/TapFilter.h"
+#include "wire/EventNames.h"
 
 #include <algorithm>
 #include <cerrno>
@@ -47,7 +48,7 @@ void appendLine(TextBuffer& line, const TappedMessage& message) {
     line.append(",\"origin\":\"");
     line.append(nameOf(message.origin));
     line.append("\",\"event\":\"");
-    line.append(eventName(message.category, message.type));
+    line.append(wire::eventName(wire::kAllServices, message.category, message.type));
     line.append("\",\"category\":");
     appendJson(line, Value(message.category));
     line.append(",\"type\":");
