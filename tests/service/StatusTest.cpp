@@ -65,7 +65,7 @@ TEST(Status, CountersSayWhatBecameOfMessagesAndSurviveAKill) {
         EXPECT_EQ(now[R"(tamblo_messages_refused_total{stage="decode",reason="limit"})"], 1);
         EXPECT_EQ(now[R"(tamblo_limits_hit_total{limit="reporters_of_message"})"], 1);
         EXPECT_EQ(now[R"(tamblo_requests_total{method="sendMessage"})"], 4);
-        EXPECT_EQ(now[R"(tamblo_request_errors_total{method="sendMessage"})"], 1);
+        EXPECT_EQ(now[R"(tamblo_request_errors_total{method="sendMessage",error="limit"})"], 1);
         EXPECT_EQ(now["tamblo_sessions"], 1);
         EXPECT_GT(now["tamblo_retained_bytes"], 0);
         EXPECT_EQ(now["tamblo_request_duration_seconds_count"], now["tamblo_request_wait_seconds_count"]);
