@@ -109,7 +109,10 @@ constexpr CounterRow kRows[] = {
     {Counter::statusReaders, "status_readers", "", "Readers of the status socket that were served."},
     {Counter::statusReadersTurnedAway, "status_readers_let_go", R"(reason="too_many")",
      "Readers of the status socket that were turned away, or let go before they had it all."},
+    {Counter::statusReadersOfUser, "status_readers_let_go", R"(reason="too_many_of_user")", ""},
     {Counter::statusReadersSilent, "status_readers_let_go", R"(reason="does_not_read")", ""},
+    {Counter::statusReadersUnanswered, "status_readers_let_go", R"(reason="no_answer")", ""},
+    {Counter::statusReadersNoMemory, "status_readers_let_go", R"(reason="memory")", ""},
     {Counter::starts, "starts", "", "Starts of the service since the counters began."},
 };
 static_assert(std::size(kRows) == static_cast<std::size_t>(Counter::count));

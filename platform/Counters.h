@@ -95,7 +95,10 @@ enum class Counter : std::uint16_t {
     logLinesUnread,
     statusReaders,
     statusReadersTurnedAway,
+    statusReadersOfUser,
     statusReadersSilent,
+    statusReadersUnanswered,
+    statusReadersNoMemory,
     starts,
     count,
 };
