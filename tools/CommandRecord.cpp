@@ -65,7 +65,7 @@ std::variant<WantedSession, std::string> wantedSession(const Arguments& argument
     if (const auto text = arguments.last("--reporter")) {
         wanted.reporterID = parseNumber<std::int64_t>(*text);
         if (!wanted.reporterID) {
-            return formatted("\"{}\" is no reporter ID: it is a signed 64-bit number", *text);
+            return notAReporterID(*text);
         }
     }
     return wanted;
@@ -138,7 +138,7 @@ ExitStatus recordLive(const Arguments& arguments, const WantedSession& wanted) {
     std::signal(SIGPIPE, SIG_IGN);
     const auto tap =
         StatusConnection(arguments).send("tap " + jsonText(Dictionary{{"reporter", reporterID}}));
-    if (const auto* failure = std::get_if<StatusConnection::Failure>(&tap)) {
+    if (const auto* failure = std::get_if<Unreachable>(&tap)) {
         return complain(failure->status, failure->text);
     }
     const std::string name(arguments.last("--output").value_or("-"));
@@ -178,7 +178,10 @@ ExitStatus run(const Arguments& arguments) {
     const std::string sinkFile = sinkPath(logs, "call-quality");
     SinkSnapshot sink(sinkFile);
     if (!sink.problem().empty()) {
-        say("tambloctl: " + sink.problem());
+        complain(ExitStatus::failed, sink.problem());
+    }
+    if (sink.isEmpty() && !sink.problem().empty()) {
+        return ExitStatus::failed;
     }
     if (sink.isEmpty()) {
         return complain(ExitStatus::failed,
