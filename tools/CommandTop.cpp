@@ -217,14 +217,14 @@ ExitStatus run(const Arguments& arguments) {
     const StatusConnection connection(arguments);
     const auto ask = [&] { return connection.ask(view.showsSessions ? "sessions" : "clients"); };
     auto answer = ask();
-    if (const auto* const failure = std::get_if<StatusConnection::Failure>(&answer)) {
+    if (const auto* const failure = std::get_if<Unreachable>(&answer)) {
         return complain(failure->status, failure->text);
     }
     Terminal terminal;
     Before before;
     for (std::uint64_t pictures = 1;; ++pictures) {
         // A service that is started again is shown again.
-        const auto* const failure = std::get_if<StatusConnection::Failure>(&answer);
+        const auto* const failure = std::get_if<Unreachable>(&answer);
         terminal.show(failure != nullptr
                           ? std::vector<std::string>{failure->text}
                           : pictureOf(std::get<StatusDocument>(answer), view, before, terminal.size()));

@@ -193,6 +193,7 @@ TEST(Status, ClientsAndSessionsAreShownWithWhatTheyHave) {
     EXPECT_EQ(json::parse(service.tambloctl("sessions --json").output)["sessions"].size(), 2U);
     EXPECT_NE(service.tambloctl("session show 7").output.find("\"speaker\""), std::string::npos);
     EXPECT_EQ(service.tambloctl("session show 8").status, 1);
+    EXPECT_EQ(service.tambloctl("session show 8 --json").status, 1);
     const CommandResult status = service.tambloctl("status");
     EXPECT_NE(status.output.find("2 clients, 2 sessions"), std::string::npos) << status.output;
     EXPECT_EQ(status.status, 0);
