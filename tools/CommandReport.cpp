@@ -36,9 +36,9 @@ std::string selectionOf(const report::ReportPlan& plan) {
             words.append(words.empty() ? "" : ", ").append(what).append(" ").append(value);
         }
     };
-    add("since", plan.since ? formatRfc3339(*plan.since).value_or("") : "");
-    add("session", plan.session);
-    add("application", plan.application);
+    add("since", plan.wanted.since ? formatRfc3339(*plan.wanted.since).value_or("") : "");
+    add("session", plan.wanted.session);
+    add("application", plan.wanted.application);
     return words;
 }
 
@@ -46,12 +46,12 @@ std::variant<report::ReportPlan, std::string> makePlan(const Arguments& argument
     report::ReportPlan plan;
     plan.now = std::chrono::duration<double>(std::chrono::system_clock::now().time_since_epoch()).count();
     plan.page = arguments.last("--output").value_or("report.html");
-    plan.session = arguments.last("--session").value_or("");
-    plan.application = arguments.last("--app").value_or("");
+    plan.wanted.session = arguments.last("--session").value_or("");
+    plan.wanted.application = arguments.last("--app").value_or("");
     plan.directory = wire::Directories::ofThisProcess().logs;
     if (const auto text = arguments.last("--since")) {
-        plan.since = parseMoment(*text, plan.now);
-        if (!plan.since) {
+        plan.wanted.since = parseMoment(*text, plan.now);
+        if (!plan.wanted.since) {
             return formatted("\"{}\" is no time: it is like 2026-03-01, 2026-03-01T12:00:00Z or 7d", *text);
         }
     }
