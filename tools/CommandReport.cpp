@@ -6,6 +6,7 @@
 #include "wire/Directories.h"
 
 #include <chrono>
+#include <cstdio>
 #include <filesystem>
 #include <optional>
 #include <string>
@@ -25,7 +26,10 @@ constexpr Option kOptions[] = {
      .value = "ID",
      .help = "only this session: a reporter's number, or the name in the call-quality file"},
     {.name = "--app", .value = "NAME", .help = "only this application; a trailing * stands for anything"},
-    {.name = "--output", .value = "FILE", .help = "where to write the page (report.html)", .letter = 'o'},
+    {.name = "--output",
+     .value = "FILE",
+     .help = "where to write the page, - for standard output (report.html)",
+     .letter = 'o'},
 };
 
 /// What the options say, in words; empty when they say nothing.
@@ -84,11 +88,15 @@ ExitStatus run(const Arguments& arguments) {
     }
     const auto& report = std::get<report::ReportResult>(result);
     std::error_code error;
-    printLine(formatted("{}: {} sessions, of {} lines",
-                        std::filesystem::absolute(plan.page, error).lexically_normal().string(),
-                        report.sessions, report.lines));
+    std::string text = formatted("{} sessions, of {} lines\n", report.sessions, report.lines);
     for (const std::string& line : report.leftOut) {
-        printLine("left out: " + line);
+        text.append("left out: ").append(line).append("\n");
+    }
+    if (plan.page == "-") {
+        std::fputs(text.c_str(), stderr);
+    } else {
+        const std::string page = std::filesystem::absolute(plan.page, error).lexically_normal().string();
+        std::fputs(formatted("{}: {}", page, text).c_str(), stdout);
     }
     return ExitStatus::done;
 }

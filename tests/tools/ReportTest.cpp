@@ -4,7 +4,10 @@
 #include <gmock/gmock.h>
 #include <nlohmann/json.hpp>
 
+#include <future>
 #include <map>
+
+#include <sys/stat.h>
 
 // Pages are made of files that are written here, and their data held against what was written.
 
@@ -14,6 +17,7 @@ namespace {
 using nlohmann::json;
 using testing::Contains;
 using testing::ElementsAre;
+using testing::EndsWith;
 using testing::HasSubstr;
 using testing::IsEmpty;
 using testing::StartsWith;
@@ -292,6 +296,23 @@ TEST_F(ReportTest, WhatIsNotAskedForTakesNoMemoryFromWhatIs) {
     EXPECT_THAT(data["leftOut"], IsEmpty());
     plan_.mostBytes = ReportPlan::kMost;
     EXPECT_EQ(made()["sessions"][0][summaries].size(), 2) << "its own, and none of those before";
+}
+
+TEST_F(ReportTest, AFileIsReplacedWhereALinkLeadsAndAPipeIsWrittenInto) {
+    callQuality(kBegin, "open", "p.1", json::object());
+    plan_.directory = logs_.path();
+    std::filesystem::create_symlink("page", logs_.path("link"));
+    test::writeFile(logs_.path("page"), "old");
+    plan_.page = logs_.path("link");
+    EXPECT_TRUE(std::holds_alternative<ReportResult>(makeReport(plan_)));
+    EXPECT_TRUE(std::filesystem::is_symlink(logs_.path("link")));
+    EXPECT_THAT(logs_.read("page"), StartsWith("<!DOCTYPE"));
+    ASSERT_EQ(::mkfifo(logs_.path("pipe").c_str(), 0600), 0);
+    auto received = std::async(std::launch::async, [this] { return logs_.read("pipe"); });
+    plan_.page = logs_.path("pipe");
+    EXPECT_TRUE(std::holds_alternative<ReportResult>(makeReport(plan_)));
+    EXPECT_THAT(received.get(), EndsWith("</html>\n"));
+    EXPECT_TRUE(std::filesystem::is_fifo(logs_.path("pipe")));
 }
 
 TEST_F(ReportTest, ARunningSessionIsNotToldTwice) {
