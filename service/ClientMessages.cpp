@@ -104,6 +104,7 @@ void ZRReportingClientServerInstance::performSend(Dictionary message, std::uint3
         answer(reply);
     } else if (recipients_.size() == 1 && !recipients_.front()->isStopping()) {
         // It is given the payload itself, which spares it a copy when it is normalised.
+        requests_->chargeTo(recipients_.front()->processorTime());
         recipients_.front()->sendMessage(
             std::make_shared<ZRReportingSessionMessage>(std::move(message), category, type),
             std::move(reply));
@@ -132,6 +133,7 @@ void ZRReportingClientServerInstance::sendSome(const std::shared_ptr<Sending>& s
         const SessionRef session = std::move(sending->recipients[sending->next++]);
         if (!isLeftOut) {
             ++sending->begun;
+            requests_->chargeTo(session->processorTime());
             session->sendMessage(sending->record(),
                                  [sending](const ReplyError* error) { sending->noteAnswer(error); });
         }

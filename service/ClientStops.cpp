@@ -62,6 +62,7 @@ void ZRReportingClientServerInstance::finishStop(ReporterID reporterID, const Se
 
 template <typename Finish>
 void ZRReportingClientServerInstance::stopThen(const SessionRef& session, Finish finish) {
+    requests_->chargeTo(session->processorTime());
     if (session->stopSome()) {
         finish(*this);
         return;

@@ -253,11 +253,16 @@ void ZRReportingClientServerInstance::killService() {
 SessionRef ZRReportingClientServerInstance::findReportingSessionForID(ReporterID reporterID,
                                                                       bool acrossAllClients) const {
     const auto own = clientReportingSessionMap_.find(reporterID);
+    SessionRef session;
     if (own != clientReportingSessionMap_.end()) {
-        return own->second;
+        session = own->second;
+    } else if (const Delegate delegate = acrossAllClients ? delegate_.lock() : nullptr) {
+        session = delegate->findReportingSessionForID(reporterID);
     }
-    const Delegate delegate = acrossAllClients ? delegate_.lock() : nullptr;
-    return delegate != nullptr ? delegate->findReportingSessionForID(reporterID) : nullptr;
+    if (session != nullptr) {
+        requests_->chargeTo(session->processorTime());
+    }
+    return session;
 }
 
 SessionRef ZRReportingClientServerInstance::makeSession(ReporterID reporterID) const {

@@ -153,7 +153,7 @@ ExitStatus recordLive(const Arguments& arguments, const WantedSession& wanted) {
     std::signal(SIGPIPE, SIG_IGN);
     const auto tap =
         StatusConnection(arguments).send("tap " + jsonText(Dictionary{{"reporter", reporterID}}));
-    if (const auto* failure = std::get_if<StatusConnection::Failure>(&tap)) {
+    if (const auto* failure = std::get_if<Unreachable>(&tap)) {
         return complain(failure->status, failure->text);
     }
     const std::string name = outputName(arguments);
@@ -193,7 +193,10 @@ ExitStatus run(const Arguments& arguments) {
     const std::string sinkFile = sinkPath(logs, "call-quality");
     SinkSnapshot sink(sinkFile);
     if (!sink.problem().empty()) {
-        say("tambloctl: " + sink.problem());
+        complain(ExitStatus::failed, sink.problem());
+    }
+    if (sink.isEmpty() && !sink.problem().empty()) {
+        return ExitStatus::failed;
     }
     if (sink.isEmpty()) {
         return complain(ExitStatus::failed,

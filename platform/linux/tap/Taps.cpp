@@ -2,6 +2,7 @@
 
 #include "base/Format.h"
 #include "base/Json.h"
+#include "os/SocketEnd.h"
 #include "platform/linux/tap/TapFilter.h"
 #include "wire/EventNames.h"
 
@@ -68,12 +69,13 @@ void sendWhatFits(int socket, std::string_view text) noexcept {
     static_cast<void>(::send(socket, text.data(), text.size(), MSG_DONTWAIT | MSG_NOSIGNAL));
 }
 
-void refuse(const FileDescriptor& reader, std::string_view reason) {
+void refuse(FileDescriptor reader, std::string_view reason) {
     TextBuffer line;
     line.append("{\"error\":");
     appendJsonString(line, reason);
     line.append("}\n");
     sendWhatFits(reader.get(), line.view());
+    closeInOrder(std::move(reader));
 }
 
 } // namespace
@@ -215,7 +217,7 @@ Taps::~Taps() {
 void Taps::add(FileDescriptor reader, std::string_view filter) {
     auto parsed = TapFilter::parse(filter);
     if (const auto* const wrong = std::get_if<std::string>(&parsed)) {
-        refuse(reader, *wrong);
+        refuse(std::move(reader), *wrong);
         return;
     }
     auto tap = std::make_shared<Tap>(*this, std::move(reader), std::get<TapFilter>(std::move(parsed)));
