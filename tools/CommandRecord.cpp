@@ -101,18 +101,20 @@ ExitStatus tell(const FoundSession& session, const SessionFileWriter& writer, co
     return report.unreadable == 0 && session.hasOpenLine ? ExitStatus::done : ExitStatus::failed;
 }
 
-/// Of the reporter's session, while it is there.
-std::optional<Dictionary> configurationOf(const Arguments& arguments, std::int64_t reporterID) {
+/// What the status has of the reporter's session: of a started one, where several clients have the ID.
+std::optional<Dictionary> sessionOf(const Arguments& arguments, std::int64_t reporterID) {
     const auto answer = StatusConnection(arguments).ask(formatted("session {}", reporterID));
     const auto* const document = std::get_if<StatusDocument>(&answer);
     const Value none;
     const Value& sessions = document != nullptr ? (*document)["sessions"] : none;
-    for (const Value& session : sessions.isArray() ? sessions.arrayValue() : std::span<const Value>()) {
-        if (const Value& found = StatusDocument::member(session, "configuration"); found.isDictionary()) {
-            return found.dictionaryValue();
+    std::optional<Dictionary> found;
+    for (const Value& session : sessions.arrayValue()) {
+        if (session.isDictionary() &&
+            (!found || StatusDocument::member(session, "state").stringValue() == "started")) {
+            found = session.dictionaryValue();
         }
     }
-    return std::nullopt;
+    return found;
 }
 
 ExitStatus tellLive(const LiveRecorder& recorder, const SessionFileWriter& writer, std::int64_t reporterID) {
@@ -136,8 +138,8 @@ ExitStatus recordLive(const Arguments& arguments, const WantedSession& wanted) {
     }
     const std::int64_t reporterID = *wanted.reporterID;
     std::signal(SIGPIPE, SIG_IGN);
-    const auto tap =
-        StatusConnection(arguments).send("tap " + jsonText(Dictionary{{"reporter", reporterID}}));
+    const auto tap = StatusConnection(arguments).send(
+        "tap " + jsonText(Dictionary{{"reporter", reporterID}, {"recording", true}}));
     if (const auto* failure = std::get_if<Unreachable>(&tap)) {
         return complain(failure->status, failure->text);
     }
@@ -147,10 +149,10 @@ ExitStatus recordLive(const Arguments& arguments, const WantedSession& wanted) {
         return complain(ExitStatus::failed, formatted("cannot write {}: {}", name, std::strerror(errno)));
     }
     SessionFileWriter writer(file.get());
-    LiveRecorder recorder(reporterID, writer, [&] { return configurationOf(arguments, reporterID); });
+    LiveRecorder recorder(reporterID, writer, [&] { return sessionOf(arguments, reporterID); });
     TapLineFunction take = [&recorder](std::string_view line) { return recorder.take(line); };
     // An answer to a later request says that the tap is open.
-    (void)configurationOf(arguments, reporterID);
+    (void)sessionOf(arguments, reporterID);
     say(formatted("recording the session of reporter {}", reporterID));
     readTap(std::get<FileDescriptor>(tap), file.get(), take);
     if (const auto failure = finish(file.get(), name)) {
@@ -225,12 +227,10 @@ constexpr Command kCommandRecord{
     "Timestamps of\n"
     "messages are in the call-quality file of internal builds only.\n"
     "\n"
-    "With --live messages come from the service itself, with their timestamps, until the session stops or "
-    "Ctrl-C;\n"
-    "sessions of several clients under one ID are not told apart. Exits with 1 when there is no such "
-    "session, "
-    "or some of\n"
-    "it is missing.",
+    "With --live messages come from the service itself, with their timestamps, until the session stops or\n"
+    "Ctrl-C; one such recording is made at a time, and sessions of several clients under one ID are not "
+    "told\n"
+    "apart. Exits with 1 when there is no such session, or some of it is missing.",
     kOptions,
     run,
 };

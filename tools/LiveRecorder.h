@@ -16,16 +16,18 @@ namespace tamblo::tools {
 /// started already, to its stop.
 class LiveRecorder {
 public:
-    /// Asked once, when the session is first seen.
-    using ConfigurationFunction = UniqueFunction<std::optional<Dictionary>()>;
+    /// What the service's status has of the reporter's session, if it is there. Asked when the session is
+    /// first seen, for its configuration, and when messages were left out: its stop may be one of them.
+    using SessionFunction = UniqueFunction<std::optional<Dictionary>()>;
 
-    LiveRecorder(std::int64_t reporterID, SessionFileWriter& writer, ConfigurationFunction configuration)
-        : reporterID_(reporterID), writer_(writer), configuration_(std::move(configuration)) {}
+    LiveRecorder(std::int64_t reporterID, SessionFileWriter& writer, SessionFunction session)
+        : reporterID_(reporterID), writer_(writer), session_(std::move(session)) {}
 
     /// Whether the session goes on.
     [[nodiscard]] bool take(std::string_view line);
 
     [[nodiscard]] bool hasBegun() const noexcept { return hasBegun_; }
+    /// Whether it is known to have ended.
     [[nodiscard]] bool hasStopped() const noexcept { return hasStopped_; }
     [[nodiscard]] const std::string& serviceType() const noexcept { return serviceType_; }
     [[nodiscard]] std::uint64_t withoutNull() const noexcept { return withoutNull_; }
@@ -39,7 +41,7 @@ private:
 
     const std::int64_t reporterID_;
     SessionFileWriter& writer_;
-    ConfigurationFunction configuration_;
+    SessionFunction session_;
     bool hasBegun_ = false;
     bool hasBeginning_ = true;
     bool hasConfiguration_ = true;
