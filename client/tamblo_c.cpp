@@ -80,6 +80,9 @@ static_assert(TAMBLO_TYPE_ISSUE_DETECTOR == static_cast<int>(EventType::issueDet
 static_assert(TAMBLO_SERVICE_LONG_FORM_AUDIO == static_cast<int>(ServiceType::longFormAudio) &&
               TAMBLO_SERVICE_SYSTEM_SOUNDS == static_cast<int>(ServiceType::systemSounds) &&
               TAMBLO_SERVICE_UNKNOWN == static_cast<int>(ServiceType::unknown));
+static_assert(TAMBLO_ERROR_DOMAIN == kErrorDomain &&
+              TAMBLO_ERROR_CONNECTION_LOST == static_cast<int>(ErrorCode::connectionLost) &&
+              TAMBLO_ERROR_TOO_MANY_PENDING == static_cast<int>(ErrorCode::tooManyPending));
 
 /// A C callback as one of the library's. The answer is counted where it is waited for.
 template <typename T>

@@ -52,5 +52,29 @@ TEST(Completion, HasEveryOptionThatTheHelpHas) {
     EXPECT_THAT(names, HasSubstr("tail\n"));
 }
 
+TEST(Manual, HasAPageForEachFunctionOfTheLibraryThatSaysWhatItDoes) {
+    const TemporaryDirectory share;
+    const std::string tree = EXAMPLES_DIR "/..";
+    const CommandResult made =
+        run(tree + "/packaging/manual $(dirname " TAMBLOCTL_PATH ") " + share.path("share"));
+    ASSERT_EQ(made.status, 0) << made.output;
+    const std::string pages = share.path("share/man/man3/");
+    const std::string library = contentOf(pages + "libtamblo.3");
+    std::istringstream shown(
+        run("sed -n 's/^ \\(tamblo_[a-z_]*\\)@.*/\\1/p' " + tree + "/packaging/debian/libtamblo1.symbols")
+            .output);
+    int functions = 0;
+    for (std::string name; std::getline(shown, name); ++functions) {
+        EXPECT_THAT(contentOf(pages + name + ".3"), testing::StartsWith(".so man3/libtamblo.3")) << name;
+        EXPECT_THAT(library, HasSubstr(name + "(")) << name;
+    }
+    EXPECT_GT(functions, 20);
+    for (const char* part : {"\n.SH TYPES\n", "\n.SH FUNCTIONS\n",
+                             "\nWhether all that was queued left within this time.\n", "int main(void) {"}) {
+        EXPECT_THAT(library, HasSubstr(part));
+    }
+    EXPECT_THAT(library, Not(HasSubstr("*/\n.RE")));
+}
+
 } // namespace
 } // namespace tamblo::test
