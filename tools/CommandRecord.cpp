@@ -13,12 +13,16 @@
 #include "tools/TapLines.h"
 #include "wire/Directories.h"
 
+#include <algorithm>
+#include <array>
 #include <cerrno>
 #include <csignal>
 #include <cstdio>
 #include <cstring>
 #include <memory>
 #include <span>
+
+#include <sys/socket.h>
 
 namespace tamblo::tools {
 
@@ -132,6 +136,17 @@ ExitStatus tellLive(const LiveRecorder& recorder, const SessionFileWriter& write
     return missing.empty() ? ExitStatus::done : ExitStatus::failed;
 }
 
+/// Why there is no tap, when that has come.
+std::optional<std::string> refusalOf(const FileDescriptor& tap) {
+    std::array<char, 4096> bytes;
+    const ssize_t count = ::recv(tap.get(), bytes.data(), bytes.size(), MSG_PEEK | MSG_DONTWAIT);
+    const std::string_view text(bytes.data(), static_cast<std::size_t>(std::max<ssize_t>(count, 0)));
+    const auto line = parseJsonObject(text.substr(0, text.find('\n')));
+    const auto* const record = std::get_if<Dictionary>(&line);
+    const Value* const error = record != nullptr ? record->find("error") : nullptr;
+    return error != nullptr ? std::optional(plainText(*error)) : std::nullopt;
+}
+
 ExitStatus recordLive(const Arguments& arguments, const WantedSession& wanted) {
     if (!wanted.reporterID || wanted.name || wanted.application) {
         return complain(ExitStatus::usage, "--live needs --reporter, and no other choice of a session");
@@ -143,6 +158,12 @@ ExitStatus recordLive(const Arguments& arguments, const WantedSession& wanted) {
     if (const auto* failure = std::get_if<Unreachable>(&tap)) {
         return complain(failure->status, failure->text);
     }
+    // An answer to a later request says that the tap is open, or was refused: then the file, which may be
+    // another recording's, stays as it is.
+    (void)sessionOf(arguments, reporterID);
+    if (const auto refusal = refusalOf(std::get<FileDescriptor>(tap))) {
+        return complain(ExitStatus::failed, *refusal);
+    }
     const std::string name(arguments.last("--output").value_or("-"));
     const OutputFile file(name == "-" ? stdout : std::fopen(name.c_str(), "we"));
     if (file == nullptr) {
@@ -151,16 +172,13 @@ ExitStatus recordLive(const Arguments& arguments, const WantedSession& wanted) {
     SessionFileWriter writer(file.get());
     LiveRecorder recorder(reporterID, writer, [&] { return sessionOf(arguments, reporterID); });
     TapLineFunction take = [&recorder](std::string_view line) { return recorder.take(line); };
-    // An answer to a later request says that the tap is open.
-    (void)sessionOf(arguments, reporterID);
     say(formatted("recording the session of reporter {}", reporterID));
     readTap(std::get<FileDescriptor>(tap), file.get(), take);
     if (const auto failure = finish(file.get(), name)) {
         return *failure;
     }
-    if (!recorder.refusal().empty() || !recorder.hasBegun()) {
-        return complain(ExitStatus::failed,
-                        recorder.refusal().empty() ? "no session was started" : recorder.refusal());
+    if (!recorder.hasBegun()) {
+        return complain(ExitStatus::failed, "no session was started");
     }
     return tellLive(recorder, writer, reporterID);
 }

@@ -26,10 +26,6 @@ bool LiveRecorder::take(std::string_view line) {
         ++leftOut_;
         return true;
     }
-    if (const Value* error = record->find("error")) {
-        refusal_ = plainText(*error);
-        return false;
-    }
     if (const Value* leftOut = record->find("left_out")) {
         leftOut_ += leftOut->unsignedValue();
         const auto session = hasBegun_ ? session_() : std::nullopt;

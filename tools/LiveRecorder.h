@@ -31,8 +31,6 @@ public:
     [[nodiscard]] bool hasStopped() const noexcept { return hasStopped_; }
     [[nodiscard]] const std::string& serviceType() const noexcept { return serviceType_; }
     [[nodiscard]] std::uint64_t withoutNull() const noexcept { return withoutNull_; }
-    /// Why there is no tap; empty when there is one.
-    [[nodiscard]] const std::string& refusal() const noexcept { return refusal_; }
     /// For people: a line for each thing that is missing; empty when nothing is.
     [[nodiscard]] std::string missing() const;
 
@@ -51,7 +49,6 @@ private:
     std::uint64_t leftOut_ = 0;
     std::uint64_t large_ = 0;
     std::uint64_t withoutNull_ = 0;
-    std::string refusal_;
 };
 
 } // namespace tamblo::tools

@@ -86,6 +86,9 @@ TEST(Record, ALiveRecordingIsTheSessionUntilItStops) {
     });
     ASSERT_TRUE(eventually([&] { return contentOf(said).find("recording") != std::string::npos; }));
     const std::string playing = "session --json --fast --reporter ";
+    const CommandResult second = service.tambloctl("record --live -r 102 -o " + live);
+    EXPECT_EQ(second.status, 1) << "one is made already, and its file stays";
+    EXPECT_THAT(second.output, HasSubstr("one at a time"));
     const CommandResult original = service.tambloctl(
         playing +
         "101 --service-type longformaudio --configuration '{\"HostApplicationDisplayID\":\"app\"}'" +
