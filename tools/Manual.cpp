@@ -89,7 +89,8 @@ std::string manualPage(std::string_view version) {
     }
     page.append(".SH NOTES\n");
     appendText(page, text.substr(rest));
-    return page.append(".SH SEE ALSO\ntamblod(8), tamblo\\-protocol(7), tamblo\\-sinks(5)\n");
+    return page.append(
+        ".SH SEE ALSO\ntamblod(8), tamblo\\-status(7), tamblo\\-protocol(7), tamblo\\-sinks(5)\n");
 }
 
 std::string manualPageOf(const Command& command, std::string_view version) {
