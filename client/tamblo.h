@@ -157,7 +157,9 @@ bool tamblo_client_wait(tamblo_client* client, int timeout_ms);
 bool tamblo_client_connect(tamblo_client* client);
 size_t tamblo_client_run(tamblo_client* client, int timeout_ms);
 
-/* A payload or a configuration: keys with values, each set again replaces the former. May be sent many times.
+/*
+ * A payload or a configuration: keys with values, each set again replaces the former. May be sent many times.
+ * A null one, which tamblo_payload_create answers when there is no memory, is empty, and stays so.
  */
 tamblo_payload* tamblo_payload_create(void);
 void tamblo_payload_destroy(tamblo_payload* payload);

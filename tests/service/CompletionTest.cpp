@@ -40,6 +40,9 @@ TEST(Completion, OffersCommandsOptionsAndWordsInBash) {
 TEST(Completion, HasEveryOptionThatTheHelpHas) {
     const std::string names = run(TAMBLOCTL_PATH " generate names").output;
     const std::string zsh = run(TAMBLOCTL_PATH " generate zsh").output;
+    const CommandResult read =
+        run("! command -v zsh >/dev/null || " TAMBLOCTL_PATH " generate zsh | zsh -f -n /dev/stdin");
+    EXPECT_TRUE(read.status == 0 && read.output.empty()) << read.output;
     std::istringstream all(names);
     for (std::string name; std::getline(all, name);) {
         const std::string bash = offered("tambloctl " + name + " -");
