@@ -51,12 +51,27 @@ struct CloseFile {
 };
 using OutputFile = std::unique_ptr<std::FILE, CloseFile>;
 
-/// Written at the end; whatever could not be.
+std::string outputName(const Arguments& arguments) {
+    return std::string(arguments.last("--output").value_or("-"));
+}
+
+ExitStatus complainAboutOutput(const std::string& name) {
+    return complain(ExitStatus::failed, formatted("cannot write {}: {}", name, std::strerror(errno)));
+}
+
+/// Null, behind a complaint, where it cannot be written.
+OutputFile openOutput(const std::string& name) {
+    OutputFile file(name == "-" ? stdout : std::fopen(name.c_str(), "we"));
+    if (file == nullptr) {
+        (void)complainAboutOutput(name);
+    }
+    return file;
+}
+
+/// Nothing once all of it is written; else what the command exits with.
 std::optional<ExitStatus> finish(std::FILE* file, const std::string& name) {
     const bool isWritten = std::fflush(file) == 0 && std::ferror(file) == 0;
-    return isWritten ? std::nullopt
-                     : std::optional(complain(ExitStatus::failed,
-                                              formatted("cannot write {}: {}", name, std::strerror(errno))));
+    return isWritten ? std::nullopt : std::optional(complainAboutOutput(name));
 }
 
 std::variant<WantedSession, std::string> wantedSession(const Arguments& arguments) {
@@ -164,10 +179,10 @@ ExitStatus recordLive(const Arguments& arguments, const WantedSession& wanted) {
     if (const auto refusal = refusalOf(std::get<FileDescriptor>(tap))) {
         return complain(ExitStatus::failed, *refusal);
     }
-    const std::string name(arguments.last("--output").value_or("-"));
-    const OutputFile file(name == "-" ? stdout : std::fopen(name.c_str(), "we"));
+    const std::string name = outputName(arguments);
+    const OutputFile file = openOutput(name);
     if (file == nullptr) {
-        return complain(ExitStatus::failed, formatted("cannot write {}: {}", name, std::strerror(errno)));
+        return ExitStatus::failed;
     }
     SessionFileWriter writer(file.get());
     LiveRecorder recorder(reporterID, writer, [&] { return sessionOf(arguments, reporterID); });
@@ -216,10 +231,10 @@ ExitStatus run(const Arguments& arguments) {
                                   "are not there",
                                   sinkFile));
     }
-    const std::string name(arguments.last("--output").value_or("-"));
-    const OutputFile file(name == "-" ? stdout : std::fopen(name.c_str(), "we"));
+    const std::string name = outputName(arguments);
+    const OutputFile file = openOutput(name);
     if (file == nullptr) {
-        return complain(ExitStatus::failed, formatted("cannot write {}: {}", name, std::strerror(errno)));
+        return ExitStatus::failed;
     }
     SessionFileWriter writer(file.get());
     const RecordingReport report = recordSession(sink, *session, writer);

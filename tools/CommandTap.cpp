@@ -53,7 +53,7 @@ constexpr Option kOptions[] = {
     kStatusSocketOption,
 };
 
-/// What an option of the kind is resolved to; or a line that says what is wrong.
+/// The filter that the options ask for, as the service takes it; or a line that says what is wrong.
 std::variant<Dictionary, std::string> makeFilter(const Arguments& arguments) {
     std::map<std::string_view, Array> lists;
     for (const std::string_view text : arguments.all("--reporter")) {

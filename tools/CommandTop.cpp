@@ -25,7 +25,7 @@ using Align = Table::Align;
 constexpr Option kOptions[] = {
     {"--sessions", "", "show sessions, not clients; the key s changes between them"},
     {"--sort", "messages|bytes|time|retained",
-     "what they are sorted by, retained memory or the time of clients, too; the keys m, b, t, r change it"},
+     "by processor time, say, or retained memory; the keys m, b, t, r change it"},
     {"--interval", "SECONDS", "between two pictures (2)"},
     {"--count", "N", "end after so many pictures"},
     kStatusSocketOption,
@@ -110,7 +110,7 @@ Table clientsTable(const std::vector<Value>& rows, Before& before) {
                  {"MSG/S", Align::right},
                  {"MESSAGES", Align::right},
                  {"BYTES", Align::right},
-                 {"BUSY%", Align::right},
+                 {"CPU%", Align::right},
                  {"TIME", Align::right},
                  {"RETAINED", Align::right}});
     for (const Value& row : rows) {
@@ -132,12 +132,17 @@ Table sessionsTable(const std::vector<Value>& rows, Before& before) {
                  {"MSG/S", Align::right},
                  {"MESSAGES", Align::right},
                  {"BYTES", Align::right},
+                 {"CPU%", Align::right},
+                 {"TIME", Align::right},
                  {"RETAINED", Align::right}});
     for (const Value& row : rows) {
+        const auto key = keyOf(row);
+        const double seconds = numberOf(row, "seconds");
         table.add({textOf(row, "reporter"), textOf(row, "pid"), textOf(row, "process"),
-                   textOf(row, "application"),
-                   before.rate(keyOf(row), "messages", numberOf(row, "messages"), 0), textOf(row, "messages"),
-                   bytesText(numberOf(row, "bytes")), bytesText(numberOf(row, "retained_bytes"))});
+                   textOf(row, "application"), before.rate(key, "messages", numberOf(row, "messages"), 0),
+                   textOf(row, "messages"), bytesText(numberOf(row, "bytes")),
+                   before.rate(key, "seconds", seconds * 100, 1), formatted("{}", fixed(seconds, 2)),
+                   bytesText(numberOf(row, "retained_bytes"))});
     }
     return table;
 }
@@ -241,9 +246,9 @@ constexpr Command kCommandTop{
     "top",
     "clients or sessions, those with most first, again and again",
     "[--sessions] [--sort messages|bytes|time|retained] [--interval SECONDS] [--count N]",
-    "TIME is what the service's queue has spent on a client's requests, in seconds, BUSY% the part of the "
-    "last interval\n"
-    "that it did; MSG/S is for the last interval, too. Ends with q or Ctrl-C. Where standard output is no "
+    "TIME is the processor time of a client's requests, or of those for a session, in seconds, CPU% what it "
+    "was of the last\n"
+    "interval; MSG/S is for the last interval, too. Ends with q or Ctrl-C. Where standard output is no "
     "terminal, the\n"
     "pictures follow one another.",
     kOptions,

@@ -89,7 +89,7 @@ constexpr Command kCommandStatus{
 
 constexpr Command kCommandClients{
     "clients",  "the clients that are connected",
-    "[--json]", "SECONDS is what the service's queue has spent on a client's requests.",
+    "[--json]", "SECONDS is the processor time of a client's requests.",
     kOptions,   clients,
 };
 

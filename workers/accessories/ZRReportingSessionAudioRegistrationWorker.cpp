@@ -1,6 +1,7 @@
 #include "workers/accessories/ZRReportingSessionAudioRegistrationWorker.h"
 
 #include "base/Dictionary.h"
+#include "platform/Counters.h"
 #include "util/Log.h"
 #include "workers/accessories/AccessoryRegistry.h"
 
@@ -70,7 +71,9 @@ std::optional<bool> ZRReportingSessionAudioRegistrationWorker::start() {
     const WallTime now = device.clock->now();
     // A clock that was set back does not put the next lookup off.
     const bool isRecent = lookups.last && *lookups.last <= now && now - *lookups.last < kLookupInterval;
-    if (!isRecent && !lookups.isUnderWay.exchange(true)) {
+    if (isRecent || lookups.isUnderWay.exchange(true)) {
+        counters::add(counters::Counter::accessoryLookups);
+    } else {
         lookups.last = now;
         // A queue for one piece, which runs after the queue is gone: at most once a minute, none is kept.
         device.workQueues->makeSerialQueue("com.vandra.tamblo.accessories")

@@ -2,8 +2,10 @@
 
 #include "base/Format.h"
 #include "base/Json.h"
+#include "os/SocketEnd.h"
 #include "platform/linux/tap/LineQueue.h"
 #include "platform/linux/tap/TapFilter.h"
+#include "wire/EventNames.h"
 
 #include <algorithm>
 #include <cerrno>
@@ -49,7 +51,7 @@ void appendLine(TextBuffer& line, const TappedMessage& message, std::size_t larg
     line.append(",\"origin\":\"");
     line.append(nameOf(message.origin));
     line.append("\",\"event\":\"");
-    line.append(eventName(message.category, message.type));
+    line.append(wire::eventName(wire::kAllServices, message.category, message.type));
     line.append("\",\"category\":");
     appendJson(line, Value(message.category));
     line.append(",\"type\":");
@@ -69,12 +71,13 @@ void sendWhatFits(int socket, std::string_view text) noexcept {
     static_cast<void>(::send(socket, text.data(), text.size(), MSG_DONTWAIT | MSG_NOSIGNAL));
 }
 
-void refuse(const FileDescriptor& reader, std::string_view reason) {
+void refuse(FileDescriptor reader, std::string_view reason) {
     TextBuffer line;
     line.append("{\"error\":");
     appendJsonString(line, reason);
     line.append("}\n");
     sendWhatFits(reader.get(), line.view());
+    closeInOrder(std::move(reader));
 }
 
 } // namespace
@@ -218,7 +221,7 @@ Taps::~Taps() {
 void Taps::add(FileDescriptor reader, std::string_view filter) {
     auto parsed = TapFilter::parse(filter);
     if (const auto* const wrong = std::get_if<std::string>(&parsed)) {
-        refuse(reader, *wrong);
+        refuse(std::move(reader), *wrong);
         return;
     }
     auto tap = std::make_shared<Tap>(*this, std::move(reader), std::get<TapFilter>(std::move(parsed)));
