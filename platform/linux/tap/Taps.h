@@ -19,10 +19,14 @@ namespace tamblo {
 /// Nobody waits for a reader. What its buffer has no room for is counted and not even made into text, and the
 /// reader is told how many messages that were (`{"left_out":N}`), where they would have stood. A large
 /// payload is not shown. So what a reader costs others is bounded by its filter and by what it reads.
+///
+/// A recording is to miss nothing: one tap at a time, of named reporters, has a buffer for some hundred
+/// thousand messages, and is shown payloads of any size.
 class Taps final : public MessageTap {
 public:
     static constexpr std::size_t kMostTaps = 8;
     static constexpr std::size_t kMostWaiting = 1U << 20U;
+    static constexpr std::size_t kMostWaitingOfRecording = 32U << 20U;
     /// As the values lie in memory.
     static constexpr std::size_t kLargestPayload = 64U << 10U;
 
@@ -45,7 +49,8 @@ private:
     void remove(const Tap& tap) TAMBLO_EXCLUDES(mutex_);
 
     EventLoop& loop_;
-    TextBuffer line_; ///< the server queue's
+    TextBuffer line_;  ///< the server queue's
+    TextBuffer whole_; ///< likewise, of a message with a payload of any size
 
     Mutex mutex_;
     std::vector<std::shared_ptr<Tap>> taps_ TAMBLO_GUARDED_BY(mutex_);
