@@ -86,6 +86,7 @@ enum class Counter : std::uint16_t {
     threads,
     accessoryLookups,
     accessories,
+    tapMessages,
     summaryFilesLost,
     performanceFilesLost,
     reportsRemoved,
@@ -99,6 +100,9 @@ enum class Counter : std::uint16_t {
     statusReadersSilent,
     statusReadersUnanswered,
     statusReadersNoMemory,
+    taps,
+    tapsTurnedAway,
+    tapsOfUser,
     starts,
     count,
 };

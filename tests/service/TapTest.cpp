@@ -117,6 +117,32 @@ TEST(Tap, ALargePayloadIsNotShown) {
     EXPECT_EQ(lines[1]["payload"]["text"], std::string(40'000, 'y'));
 }
 
+TEST(Tap, WhatThereIsNoTimeToLookAtIsLeftOut) {
+    ServiceProcess service;
+    // None of the patterns matches, but it takes long to see that.
+    json filter;
+    for (int i = 0; i != 200; ++i) {
+        filter["event"].push_back("com.vandra.tamblo.Playback.Star_*");
+    }
+    std::vector<StatusReader> taps;
+    for (int i = 0; i != 8; ++i) {
+        taps.push_back(tapOf(service, filter.dump()));
+    }
+    Session client(service.socketPath(), 7);
+    for (int i = 0; i != 10'000; ++i) {
+        ASSERT_TRUE(client.send(framesOf(message({{"n", i}}, {7}))));
+        (void)client.receive();
+    }
+    service.stop();
+    for (const StatusReader& tap : taps) {
+        const auto lines = shownBy(tap);
+        EXPECT_FALSE(lines.empty());
+        for (const json& line : lines) {
+            EXPECT_GT(line.value("left_out", 0), 0) << line;
+        }
+    }
+}
+
 /// `tambloctl tap`, whose output goes to a file.
 class TapProcess {
 public:
