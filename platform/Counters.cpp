@@ -1,7 +1,6 @@
 #include "platform/Counters.h"
 
 #include <algorithm>
-#include <bit>
 #include <iterator>
 
 namespace tamblo::counters {
@@ -193,16 +192,6 @@ OfSink::OfSink(std::string_view fileName) noexcept {
     if (found != kSinks.end()) {
         first_ = kFirstSink + static_cast<std::size_t>(found - kSinks.begin()) * kCountsOfSink;
     }
-}
-
-void noteAlone(Histogram histogram, std::chrono::nanoseconds time) noexcept {
-    const std::uint64_t nanoseconds = time.count() > 0 ? static_cast<std::uint64_t>(time.count()) : 0;
-    // The bound of bucket n is 4^n microseconds, and belongs to it.
-    const std::uint64_t below = nanoseconds == 0 ? 0 : (nanoseconds - 1) / 1000;
-    const std::size_t bucket = std::min((static_cast<std::size_t>(std::bit_width(below)) + 1) / 2, kBounds);
-    const std::size_t first = kFirstHistogram + static_cast<std::size_t>(histogram) * kSlotsOfHistogram;
-    addAloneTo(first + bucket, 1);
-    addAloneTo(first + kBounds + 1, nanoseconds);
 }
 
 std::vector<Family> families() {

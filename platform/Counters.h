@@ -1,7 +1,11 @@
 #pragma once
 
+#include "platform/Limits.h"
+
+#include <algorithm>
 #include <array>
 #include <atomic>
+#include <bit>
 #include <chrono>
 #include <cstddef>
 #include <cstdint>
@@ -133,32 +137,13 @@ inline constexpr std::array<std::string_view, 4> kRequestErrors{"wrong_parameter
                                                                 "reporting_disabled"};
 enum class RequestError : std::uint8_t { wrongParameters, limit, notAllowed, reportingDisabled };
 /// Limits that clients reach, by the names that they are told.
-inline constexpr std::array<std::string_view, 24> kLimits{
-    "reporters_of_message",
-    "entries_of_dictionary",
-    "key_bytes",
-    "bytes_of_keys",
-    "decoded_bytes_of_frame",
-    "delivered_bytes_of_message",
-    "application_name_bytes",
-    "configuration_bytes_of_session",
-    "configuration_bytes_of_user",
-    "previous_keys_of_session",
-    "sessions_of_connection",
-    "sessions_of_user",
-    "connections_of_user",
-    "retained_bytes_of_user",
-    "retained_bytes",
-    "waiting_requests",
-    "waiting_bytes",
-    "waiting_bytes_of_user",
-    "unfinished_bytes_of_user",
-    "frame_seconds",
-    "reply_bytes",
-    "reply_bytes_of_user",
-    "descriptors",
-    "memory",
-};
+inline constexpr auto kLimits = [] {
+    std::array<std::string_view, kLimitRows.size() + 2> names{};
+    auto* const further = std::ranges::transform(kLimitRows, names.begin(), &LimitRow::name).out;
+    further[0] = "descriptors";
+    further[1] = "memory";
+    return names;
+}();
 /// How long requests waited until they were begun with, and took.
 enum class Histogram : std::uint8_t { waited, took, count };
 /// The upper bounds of the buckets grow fourfold from a microsecond on; the last bucket has none.
@@ -233,7 +218,15 @@ private:
 };
 
 /// Notes a time, one at a time.
-void noteAlone(Histogram histogram, std::chrono::nanoseconds time) noexcept;
+inline void noteAlone(Histogram histogram, std::chrono::nanoseconds time) noexcept {
+    const std::uint64_t nanoseconds = time.count() > 0 ? static_cast<std::uint64_t>(time.count()) : 0;
+    // The bound of bucket n is 4^n microseconds, and belongs to it.
+    const std::uint64_t below = nanoseconds == 0 ? 0 : (nanoseconds - 1) / 1000;
+    const std::size_t bucket = std::min((static_cast<std::size_t>(std::bit_width(below)) + 1) / 2, kBounds);
+    const std::size_t first = kFirstHistogram + static_cast<std::size_t>(histogram) * kSlotsOfHistogram;
+    addAloneTo(first + bucket, 1);
+    addAloneTo(first + kBounds + 1, nanoseconds);
+}
 
 /// One number of a family.
 struct Row {

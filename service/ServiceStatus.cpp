@@ -58,6 +58,7 @@ SessionRow rowOf(const ZRReportingSession& session, const ZRReportingClientServe
             .bytes = session.messageBytes(),
             .recorded = session.acceptedMessageCount(),
             .dropped = session.droppedMessageCount(),
+            .time = *session.processorTime(),
             .retainedBytes = session.retainedBytes()};
 }
 
@@ -152,6 +153,8 @@ void ServiceStatus::clients(Reply<std::vector<ClientRow>> reply) {
 
 void ServiceStatus::sessions(Reply<std::vector<SessionRow>> reply) {
     auto rows = std::make_shared<std::vector<SessionRow>>();
+    // Room for those that there are now: to move thousands of rows would take longer than a slice.
+    rows->reserve(context_.platform().activity->sessions + 1);
     walkSome(std::make_unique<Walk>(Walk{
         .onClient = [](const auto&) {},
         .onSession = [rows](const auto* client,

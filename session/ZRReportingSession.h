@@ -16,6 +16,7 @@
 #include "session/ZRReportingSessionWorkerProtocol.h"
 #include "util/AudioEvents.h"
 
+#include <chrono>
 #include <cstdint>
 #include <memory>
 #include <optional>
@@ -123,6 +124,10 @@ public:
     [[nodiscard]] std::int64_t totalMessageCount() const noexcept { return totalMessageCount_; }
     /// What the values of all messages take that were ever sent to the session.
     [[nodiscard]] std::uint64_t messageBytes() const noexcept { return messageBytes_; }
+    /// What requests for the session have taken of the processor, which whoever carries them out adds up.
+    [[nodiscard]] const std::shared_ptr<std::chrono::nanoseconds>& processorTime() const noexcept {
+        return processorTime_;
+    }
     /// What counts for the user's budget of retained messages.
     [[nodiscard]] std::size_t retainedBytes() const noexcept { return retained_.bytes(); }
     /// How many messages that were sent to the session were recorded since the last stop, its own records of
@@ -237,6 +242,8 @@ private:
     std::size_t previousBytes_ = 0; ///< as the budget counts them
     std::int64_t totalMessageCount_ = 0;
     std::uint64_t messageBytes_ = 0;
+    const std::shared_ptr<std::chrono::nanoseconds> processorTime_ =
+        std::make_shared<std::chrono::nanoseconds>(0);
     std::size_t ownRecordCount_ = 0; ///< among those recorded
     std::uint64_t droppedMessageCount_ = 0;
 

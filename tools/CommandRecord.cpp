@@ -47,12 +47,27 @@ struct CloseFile {
 };
 using OutputFile = std::unique_ptr<std::FILE, CloseFile>;
 
-/// Written at the end; whatever could not be.
+std::string outputName(const Arguments& arguments) {
+    return std::string(arguments.last("--output").value_or("-"));
+}
+
+ExitStatus complainAboutOutput(const std::string& name) {
+    return complain(ExitStatus::failed, formatted("cannot write {}: {}", name, std::strerror(errno)));
+}
+
+/// Null, behind a complaint, where it cannot be written.
+OutputFile openOutput(const std::string& name) {
+    OutputFile file(name == "-" ? stdout : std::fopen(name.c_str(), "we"));
+    if (file == nullptr) {
+        (void)complainAboutOutput(name);
+    }
+    return file;
+}
+
+/// Nothing once all of it is written; else what the command exits with.
 std::optional<ExitStatus> finish(std::FILE* file, const std::string& name) {
     const bool isWritten = std::fflush(file) == 0 && std::ferror(file) == 0;
-    return isWritten ? std::nullopt
-                     : std::optional(complain(ExitStatus::failed,
-                                              formatted("cannot write {}: {}", name, std::strerror(errno))));
+    return isWritten ? std::nullopt : std::optional(complainAboutOutput(name));
 }
 
 std::variant<WantedSession, std::string> wantedSession(const Arguments& arguments) {
@@ -65,7 +80,7 @@ std::variant<WantedSession, std::string> wantedSession(const Arguments& argument
     if (const auto text = arguments.last("--reporter")) {
         wanted.reporterID = parseNumber<std::int64_t>(*text);
         if (!wanted.reporterID) {
-            return formatted("\"{}\" is no reporter ID: it is a signed 64-bit number", *text);
+            return notAReporterID(*text);
         }
     }
     return wanted;
@@ -138,13 +153,13 @@ ExitStatus recordLive(const Arguments& arguments, const WantedSession& wanted) {
     std::signal(SIGPIPE, SIG_IGN);
     const auto tap =
         StatusConnection(arguments).send("tap " + jsonText(Dictionary{{"reporter", reporterID}}));
-    if (const auto* failure = std::get_if<StatusConnection::Failure>(&tap)) {
+    if (const auto* failure = std::get_if<Unreachable>(&tap)) {
         return complain(failure->status, failure->text);
     }
-    const std::string name(arguments.last("--output").value_or("-"));
-    const OutputFile file(name == "-" ? stdout : std::fopen(name.c_str(), "we"));
+    const std::string name = outputName(arguments);
+    const OutputFile file = openOutput(name);
     if (file == nullptr) {
-        return complain(ExitStatus::failed, formatted("cannot write {}: {}", name, std::strerror(errno)));
+        return ExitStatus::failed;
     }
     SessionFileWriter writer(file.get());
     LiveRecorder recorder(reporterID, writer, [&] { return configurationOf(arguments, reporterID); });
@@ -178,7 +193,10 @@ ExitStatus run(const Arguments& arguments) {
     const std::string sinkFile = sinkPath(logs, "call-quality");
     SinkSnapshot sink(sinkFile);
     if (!sink.problem().empty()) {
-        say("tambloctl: " + sink.problem());
+        complain(ExitStatus::failed, sink.problem());
+    }
+    if (sink.isEmpty() && !sink.problem().empty()) {
+        return ExitStatus::failed;
     }
     if (sink.isEmpty()) {
         return complain(ExitStatus::failed,
@@ -193,10 +211,10 @@ ExitStatus run(const Arguments& arguments) {
                                   "are not there",
                                   sinkFile));
     }
-    const std::string name(arguments.last("--output").value_or("-"));
-    const OutputFile file(name == "-" ? stdout : std::fopen(name.c_str(), "we"));
+    const std::string name = outputName(arguments);
+    const OutputFile file = openOutput(name);
     if (file == nullptr) {
-        return complain(ExitStatus::failed, formatted("cannot write {}: {}", name, std::strerror(errno)));
+        return ExitStatus::failed;
     }
     SessionFileWriter writer(file.get());
     const RecordingReport report = recordSession(sink, *session, writer);

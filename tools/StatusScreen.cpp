@@ -168,12 +168,15 @@ std::vector<std::string> sessionLines(const StatusDocument& document) {
                  {"MESSAGES", Align::right},
                  {"RECORDED", Align::right},
                  {"BYTES", Align::right},
+                 {"SECONDS", Align::right},
                  {"RETAINED", Align::right}});
     for (const Value& session : document["sessions"].arrayValue()) {
         table.add({textOf(session, "reporter"), textOf(session, "pid"), textOf(session, "process"),
                    textOf(session, "application"), textOf(session, "service"), textOf(session, "state"),
                    textOf(session, "messages"), textOf(session, "recorded"),
-                   bytesText(numberOf(session, "bytes")), bytesText(numberOf(session, "retained_bytes"))});
+                   bytesText(numberOf(session, "bytes")),
+                   formatted("{}", fixed(numberOf(session, "seconds"), 3)),
+                   bytesText(numberOf(session, "retained_bytes"))});
     }
     return table.lines();
 }

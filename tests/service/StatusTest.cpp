@@ -182,6 +182,8 @@ TEST(Status, ClientsAndSessionsAreShownWithWhatTheyHave) {
     EXPECT_EQ(sessions[0]["recorded"], 2);
     EXPECT_EQ(sessions[1]["reporter"], -3);
     EXPECT_EQ(sessions[0]["retained_bytes"], clients[0]["retained_bytes"]);
+    EXPECT_GT(sessions[0]["seconds"], 0);
+    EXPECT_LT(sessions[0]["seconds"], clients[0]["seconds"]); // which have been read and decoded, too
     const json shown = statusJson(service, "session 7")["sessions"];
     ASSERT_EQ(shown.size(), 1U);
     EXPECT_EQ(shown[0]["previous_values"]["volume"], 2);
@@ -191,6 +193,7 @@ TEST(Status, ClientsAndSessionsAreShownWithWhatTheyHave) {
     EXPECT_EQ(json::parse(service.tambloctl("sessions --json").output)["sessions"].size(), 2U);
     EXPECT_NE(service.tambloctl("session show 7").output.find("\"speaker\""), std::string::npos);
     EXPECT_EQ(service.tambloctl("session show 8").status, 1);
+    EXPECT_EQ(service.tambloctl("session show 8 --json").status, 1);
     const CommandResult status = service.tambloctl("status");
     EXPECT_NE(status.output.find("2 clients, 2 sessions"), std::string::npos) << status.output;
     EXPECT_EQ(status.status, 0);

@@ -109,8 +109,10 @@ TEST(Tambloctl, WhatIsForbiddenOrMissingIsSaidToBe) {
     expect("send -c Volume n=2", 0, "whether it was recorded cannot be seen: cannot read ");
     forbid(service.logs());
     expect("tail --follow", 1, "permission denied; " + service.logs().string() + " belongs to ");
+    expect("record", 1, "permission denied; " + service.logs().string() + " belongs to ");
     forbid(service.runtimeDirectory());
-    for (const char* command : {"reporters", "kill", "send -c Volume n=3"}) {
+    for (const char* command :
+         {"reporters", "kill", "send -c Volume n=3", "status", "tap", "record --live -r 7"}) {
         expect(command, 3, "permission denied; " + service.runtimeDirectory() + " belongs to ");
         expect(command, 3, mode);
     }
@@ -118,8 +120,10 @@ TEST(Tambloctl, WhatIsForbiddenOrMissingIsSaidToBe) {
     std::filesystem::permissions(service.runtimeDirectory(), std::filesystem::perms::owner_all);
     std::filesystem::permissions(service.logs(), std::filesystem::perms::owner_all);
 
-    EXPECT_THAT(service.tambloctl("reporters --socket /" + std::string(200, 'a')).output,
-                HasSubstr("too long for a socket's path"));
+    for (const char* command : {"reporters", "status"}) {
+        EXPECT_THAT(service.tambloctl(command + (" --socket /" + std::string(200, 'a'))).output,
+                    HasSubstr("too long for a socket's path"));
+    }
     service.stop();
     std::filesystem::remove_all(service.runtimeDirectory());
     EXPECT_EQ(service.tambloctl("notify name").status, 3);

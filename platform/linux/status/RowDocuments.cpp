@@ -48,6 +48,7 @@ void appendFields(JsonObject& row, const SessionRow& session) {
         .number("bytes", session.bytes)
         .number("recorded", session.recorded)
         .number("dropped", session.dropped)
+        .number("seconds", std::chrono::duration<double>(session.time).count())
         .number("retained_bytes", session.retainedBytes);
 }
 

@@ -282,7 +282,7 @@ std::optional<std::size_t> StatusDocuments::usedOf(std::string_view limit,
 
 void StatusDocuments::appendLimits(JsonObject& document, const std::optional<Use>& use) const {
     document.value("is_complete", Value(use.has_value()));
-    document.array("limits", Limits::rows(), [&](TextBuffer& out, const Limits::Row& row) {
+    document.array("limits", kLimitRows, [&](TextBuffer& out, const LimitRow& row) {
         const auto preference = Limits::preferenceOf(parts_.preferences, row.name);
         const std::size_t value = parts_.limits.*row.member;
         JsonObject fields(out);

@@ -30,7 +30,4 @@ struct TapFilter {
     [[nodiscard]] bool accepts(const TappedMessage& message) const;
 };
 
-/// The name under which an analytics event of this kind is offered for messages of all services.
-[[nodiscard]] std::string eventName(std::uint32_t category, std::uint16_t type);
-
 } // namespace tamblo

@@ -5,6 +5,7 @@
 #include "os/StreamSocket.h"
 #include "platform/Counters.h"
 #include "platform/linux/tap/TapFilter.h"
+#include "wire/EventNames.h"
 
 #include <algorithm>
 #include <cerrno>
@@ -51,7 +52,7 @@ void appendLine(TextBuffer& line, const TappedMessage& message) {
     line.append(",\"origin\":\"");
     line.append(nameOf(message.origin));
     line.append("\",\"event\":\"");
-    line.append(eventName(message.category, message.type));
+    line.append(wire::eventName(wire::kAllServices, message.category, message.type));
     line.append("\",\"category\":");
     appendJson(line, Value(message.category));
     line.append(",\"type\":");
