@@ -97,6 +97,7 @@ constexpr CounterRow kRows[] = {
     {Counter::threads, "left_out", R"(what="threads")", ""},
     {Counter::accessoryLookups, "left_out", R"(what="accessory_lookups")", ""},
     {Counter::accessories, "left_out", R"(what="accessories")", ""},
+    {Counter::tapMessages, "left_out", R"(what="tap_messages")", ""},
     {Counter::summaryFilesLost, "report_files_lost", R"(kind="summary")",
      "Files of a session that could not be written, or not whole."},
     {Counter::performanceFilesLost, "report_files_lost", R"(kind="performance")", ""},
@@ -112,6 +113,10 @@ constexpr CounterRow kRows[] = {
     {Counter::statusReadersSilent, "status_readers_let_go", R"(reason="does_not_read")", ""},
     {Counter::statusReadersUnanswered, "status_readers_let_go", R"(reason="no_answer")", ""},
     {Counter::statusReadersNoMemory, "status_readers_let_go", R"(reason="memory")", ""},
+    {Counter::taps, "taps", "", "Taps that were opened."},
+    {Counter::tapsTurnedAway, "taps_let_go", R"(reason="too_many")",
+     "Taps that were turned away, or ended for another user's."},
+    {Counter::tapsOfUser, "taps_let_go", R"(reason="too_many_of_user")", ""},
     {Counter::starts, "starts", "", "Starts of the service since the counters began."},
 };
 static_assert(std::size(kRows) == static_cast<std::size_t>(Counter::count));

@@ -90,6 +90,7 @@ enum class Counter : std::uint16_t {
     threads,
     accessoryLookups,
     accessories,
+    tapMessages,
     summaryFilesLost,
     performanceFilesLost,
     reportsRemoved,
@@ -103,6 +104,9 @@ enum class Counter : std::uint16_t {
     statusReadersSilent,
     statusReadersUnanswered,
     statusReadersNoMemory,
+    taps,
+    tapsTurnedAway,
+    tapsOfUser,
     starts,
     count,
 };

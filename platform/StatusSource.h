@@ -42,6 +42,9 @@ struct SessionRow {
     std::string application;
     bool isStarted = false;
     bool isStopping = false;
+    std::optional<WallTime> start;
+    /// From the start to the stop, or to now; below zero where the clock was set back meanwhile.
+    std::optional<std::chrono::nanoseconds> length;
     std::uint64_t messages = 0;       ///< that were sent to it
     std::uint64_t bytes = 0;          ///< of their values
     std::uint64_t recorded = 0;       ///< since the last stop

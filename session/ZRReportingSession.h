@@ -122,6 +122,10 @@ public:
         return previousValues_.valuesOf(keys);
     }
     [[nodiscard]] std::int64_t totalMessageCount() const noexcept { return totalMessageCount_; }
+    /// When the session was last started, and stopped since then, by a clock that may have been set
+    /// meanwhile.
+    [[nodiscard]] std::optional<WallTime> startTime() const noexcept { return startTime_; }
+    [[nodiscard]] std::optional<WallTime> stopTime() const noexcept { return stopTime_; }
     /// What the values of all messages take that were ever sent to the session.
     [[nodiscard]] std::uint64_t messageBytes() const noexcept { return messageBytes_; }
     /// What requests for the session have taken of the processor, which whoever carries them out adds up.
@@ -240,6 +244,8 @@ private:
     LastMessageIndex lastMessages_;
     PreviousValues previousValues_;
     std::size_t previousBytes_ = 0; ///< as the budget counts them
+    std::optional<WallTime> startTime_;
+    std::optional<WallTime> stopTime_;
     std::int64_t totalMessageCount_ = 0;
     std::uint64_t messageBytes_ = 0;
     const std::shared_ptr<std::chrono::nanoseconds> processorTime_ =

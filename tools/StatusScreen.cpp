@@ -105,6 +105,12 @@ void appendErrors(std::vector<std::string>& lines, const StatusDocument& documen
     }
 }
 
+/// Nothing for a session that was never started.
+std::string lengthText(const Value& session) {
+    const Value& length = member(session, "length");
+    return length.isNumber() ? durationText(length.doubleValue()) : "";
+}
+
 } // namespace
 
 std::string textOf(const Value& object, std::string_view name) {
@@ -165,6 +171,7 @@ std::vector<std::string> sessionLines(const StatusDocument& document) {
                  {"APPLICATION"},
                  {"SERVICE"},
                  {"STATE"},
+                 {"LENGTH", Align::right},
                  {"MESSAGES", Align::right},
                  {"RECORDED", Align::right},
                  {"BYTES", Align::right},
@@ -173,7 +180,7 @@ std::vector<std::string> sessionLines(const StatusDocument& document) {
     for (const Value& session : document["sessions"].arrayValue()) {
         table.add({textOf(session, "reporter"), textOf(session, "pid"), textOf(session, "process"),
                    textOf(session, "application"), textOf(session, "service"), textOf(session, "state"),
-                   textOf(session, "messages"), textOf(session, "recorded"),
+                   lengthText(session), textOf(session, "messages"), textOf(session, "recorded"),
                    bytesText(numberOf(session, "bytes")),
                    formatted("{}", fixed(numberOf(session, "seconds"), 3)),
                    bytesText(numberOf(session, "retained_bytes"))});
@@ -201,6 +208,13 @@ std::vector<std::string> sessionDetailLines(const StatusDocument& document) {
             workers.append(workers.empty() ? "" : ", ").append(worker.stringValue());
         }
         lines.push_back(formatted("workers: {}", workers));
+        if (const Value& start = member(session, "start"); start.isNumber()) {
+            lines.push_back(formatted("started: {}, for {}", formatRfc3339(start.doubleValue()).value_or("-"),
+                                      lengthText(session)));
+        }
+        if (const Value& leftOut = member(session, "values_left_out"); leftOut.isNumber()) {
+            lines.push_back(formatted("{} values that take too much are not shown", leftOut.unsignedValue()));
+        }
         const std::pair<std::string_view, std::string_view> kParts[] = {
             {"CONFIGURATION", "configuration"}, {"LATEST VALUE OF", "previous_values"}};
         for (const auto& [title, name] : kParts) {

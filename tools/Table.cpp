@@ -90,7 +90,11 @@ std::string bytesText(double bytes) {
 }
 
 std::string durationText(double seconds) {
-    const auto whole = static_cast<std::int64_t>(std::floor(std::max(seconds, 0.0)));
+    constexpr double kLongestTold = 1e12;
+    if (seconds < 0) {
+        return "-" + durationText(-seconds);
+    }
+    const auto whole = static_cast<std::int64_t>(std::min(std::floor(seconds), kLongestTold));
     if (whole < 60) {
         return formatted("{} s", whole);
     }

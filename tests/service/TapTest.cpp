@@ -138,6 +138,36 @@ TEST(Tap, ARecordingMissesNothingThoughItsReaderIsSlow) {
     EXPECT_EQ(lines.back()["payload"]["text"], large);
 }
 
+TEST(Tap, WhatThereIsNoTimeToLookAtIsLeftOut) {
+    ServiceProcess service;
+    // None of the patterns matches, but it takes long to see that.
+    json filter;
+    for (int i = 0; i != 200; ++i) {
+        filter["event"].push_back("com.vandra.tamblo.Playback.Star_*");
+    }
+    std::vector<StatusReader> taps;
+    for (int i = 0; i != 8; ++i) {
+        taps.push_back(tapOf(service, filter.dump()));
+    }
+    Session client(service.socketPath(), 7);
+    std::string frames;
+    for (int i = 0; i != 20'000; ++i) {
+        frames += framesOf(message({{"n", i}}, {7}));
+    }
+    ASSERT_TRUE(client.send(frames));
+    for (int i = 0; i != 20'000; ++i) {
+        ASSERT_TRUE(client.receive());
+    }
+    service.stop();
+    for (const StatusReader& tap : taps) {
+        const auto lines = shownBy(tap);
+        EXPECT_FALSE(lines.empty());
+        for (const json& line : lines) {
+            EXPECT_GT(line.value("left_out", 0), 0) << line;
+        }
+    }
+}
+
 /// `tambloctl tap`, whose output goes to a file.
 class TapProcess {
 public:

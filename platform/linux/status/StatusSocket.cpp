@@ -2,7 +2,7 @@
 
 #include "base/Format.h"
 #include "base/SplitText.h"
-#include "os/SocketEnd.h"
+#include "os/StreamSocket.h"
 #include "platform/Counters.h"
 #include "wire/StatusProtocol.h"
 
@@ -44,13 +44,6 @@ constexpr std::string_view kTap = "tap";
 
 bool isTap(const StatusQuestion& question) noexcept {
     return !question.isHttp && (question.line == kTap || question.line.starts_with("tap "));
-}
-
-uid_t userOf(const FileDescriptor& socket) noexcept {
-    ucred credentials{};
-    socklen_t length = sizeof credentials;
-    static_cast<void>(::getsockopt(socket.get(), SOL_SOCKET, SO_PEERCRED, &credentials, &length));
-    return credentials.uid;
 }
 
 std::string errorText(std::string_view error) {
@@ -219,7 +212,7 @@ void StatusSocket::acceptReaders() {
             }
             return;
         }
-        const uid_t user = userOf(socket);
+        const uid_t user = peerUser(socket.get());
         if (!makeRoomFor(user)) {
             turnAway(std::move(socket));
             continue;

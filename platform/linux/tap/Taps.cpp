@@ -2,7 +2,8 @@
 
 #include "base/Format.h"
 #include "base/Json.h"
-#include "os/SocketEnd.h"
+#include "os/StreamSocket.h"
+#include "platform/Counters.h"
 #include "platform/linux/tap/LineQueue.h"
 #include "platform/linux/tap/TapFilter.h"
 #include "wire/EventNames.h"
@@ -27,6 +28,8 @@ namespace {
 constexpr std::size_t kBytesOfTurn = 64U << 10U;
 /// What is kept of the room for a line.
 constexpr std::size_t kKeptCapacity = 16U << 10U;
+/// How late a reader hears of what was left out for want of time, when nothing else comes.
+constexpr std::chrono::milliseconds kLatestTold{200};
 
 std::string_view nameOf(TappedMessage::Origin origin) noexcept {
     switch (origin) {
@@ -86,13 +89,26 @@ void refuse(FileDescriptor reader, std::string_view reason) {
 class Taps::Tap final : public EventSource {
 public:
     Tap(Taps& taps, FileDescriptor socket, TapFilter filter)
-        : taps_(taps), socket_(std::move(socket)), filter_(std::move(filter)) {}
+        : taps_(taps),
+          socket_(std::move(socket)),
+          user_(peerUser(socket_.get())),
+          filter_(std::move(filter)) {}
 
     [[nodiscard]] bool isRecording() const noexcept { return filter_.isRecording; }
+    [[nodiscard]] uid_t user() const noexcept { return user_; }
+    [[nodiscard]] bool isEnding() const noexcept { return isEnding_; }
+    /// Has the loop hear that the connection is over, and remove the tap. With the lock of all taps.
+    void end() TAMBLO_EXCLUDES(mutex_);
     [[nodiscard]] bool watch() { return taps_.loop_.add(socket_.get(), 0, *this); }
     [[nodiscard]] FileDescriptor takeSocket() noexcept { return std::move(socket_); }
     /// On the server queue. `line` is the message's, once some tap of this kind has made it.
     void offer(const TappedMessage& message, TextBuffer& line) TAMBLO_EXCLUDES(mutex_);
+    /// Messages that nobody has looked at; they do not count towards the limit.
+    void leaveOut(std::uint64_t messages) TAMBLO_EXCLUDES(mutex_) {
+        const MutexLock lock(mutex_);
+        leftOut_ += messages;
+        wait();
+    }
     void ready(std::uint32_t events) override TAMBLO_EXCLUDES(mutex_);
     void sendRest() TAMBLO_EXCLUDES(mutex_) {
         const MutexLock lock(mutex_);
@@ -119,8 +135,10 @@ private:
 
     Taps& taps_;
     FileDescriptor socket_;
+    const uid_t user_;
     const TapFilter filter_;
     std::uint64_t matched_ = 0; ///< the server queue's
+    bool isEnding_ = false;     ///< under the lock of all taps
 
     Mutex mutex_;
     LineQueue out_ TAMBLO_GUARDED_BY(mutex_);
@@ -141,6 +159,7 @@ void Taps::Tap::offer(const TappedMessage& message, TextBuffer& line) {
     // Once full it stays so until half of it is sent: else every message would be made into text to find that
     // it does not fit.
     if (leftOut_ != 0) {
+        counters::add(counters::Counter::tapMessages);
         ++leftOut_;
         return;
     }
@@ -156,8 +175,18 @@ void Taps::Tap::offer(const TappedMessage& message, TextBuffer& line) {
     } catch (const std::bad_alloc&) {
         line.clear();
     }
+    counters::add(counters::Counter::tapMessages);
     ++leftOut_;
     wait();
+}
+
+void Taps::Tap::end() {
+    const MutexLock lock(mutex_);
+    isEnding_ = true;
+    if (sendSome(kMostWaiting) && out_.empty()) {
+        sendWhatFits(socket_.get(), "{\"error\":\"tap: another user needs the place\"}\n");
+    }
+    ::shutdown(socket_.get(), SHUT_RDWR);
 }
 
 void Taps::Tap::append(std::string_view line) {
@@ -228,22 +257,58 @@ void Taps::add(FileDescriptor reader, std::string_view filter) {
     const MutexLock lock(mutex_);
     const bool isSecond = tap->isRecording() &&
                           std::ranges::any_of(taps_, [](const auto& open) { return open->isRecording(); });
-    if (isSecond || taps_.size() == kMostTaps || !tap->watch()) {
+    if (isSecond || !makeRoomFor(tap->user()) || !tap->watch()) {
+        counters::add(counters::Counter::tapsTurnedAway);
         refuse(tap->takeSocket(), isSecond ? "tap: there is a recording, and one at a time is made"
                                            : formatted("tap: there are {} taps at most", kMostTaps));
         return;
     }
+    counters::add(counters::Counter::taps);
+    tellWhatIsLeftOut();
     taps_.push_back(std::move(tap));
     setOpen(true);
 }
 
+bool Taps::makeRoomFor(uid_t user) {
+    const auto countOf = [this](uid_t other) {
+        return std::ranges::count_if(taps_, [other](const std::shared_ptr<Tap>& tap) {
+            return tap->user() == other && !tap->isEnding();
+        });
+    };
+    const auto isOpen = [](const std::shared_ptr<Tap>& tap) { return !tap->isEnding(); };
+    if (std::cmp_less(std::ranges::count_if(taps_, isOpen), kMostTaps)) {
+        return true;
+    }
+    const auto most = std::ranges::max_element(taps_, {}, [&](const std::shared_ptr<Tap>& tap) {
+        return tap->isEnding() ? 0 : countOf(tap->user());
+    });
+    if (countOf((*most)->user()) < countOf(user) + 2) {
+        return false;
+    }
+    counters::add(counters::Counter::tapsOfUser);
+    (*most)->end();
+    return true;
+}
+
 void Taps::offer(const TappedMessage& message) {
     line_.clearAndKeep(kKeptCapacity);
-    const MutexLock lock(mutex_);
-    for (const std::shared_ptr<Tap>& tap : taps_) {
-        tap->offer(message, tap->isRecording() ? whole_ : line_);
-    }
     whole_.clearAndKeep(kKeptCapacity);
+    const MutexLock lock(mutex_);
+    offerTo(true, message, whole_);
+    const auto began = now_();
+    if (!hasTime(began)) {
+        return;
+    }
+    offerTo(false, message, line_);
+    credit_ -= now_() - began;
+}
+
+void Taps::offerTo(bool areRecordings, const TappedMessage& message, TextBuffer& line) {
+    for (const std::shared_ptr<Tap>& tap : taps_) {
+        if (tap->isRecording() == areRecordings) {
+            tap->offer(message, line);
+        }
+    }
 }
 
 void Taps::remove(const Tap& tap) {

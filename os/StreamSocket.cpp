@@ -1,4 +1,4 @@
-#include "os/SocketEnd.h"
+#include "os/StreamSocket.h"
 
 #include <array>
 
@@ -12,6 +12,13 @@ namespace {
 constexpr int kMostReads = 4096;
 
 } // namespace
+
+uid_t peerUser(int socket) noexcept {
+    ucred credentials{};
+    socklen_t length = sizeof credentials;
+    static_cast<void>(::getsockopt(socket, SOL_SOCKET, SO_PEERCRED, &credentials, &length));
+    return credentials.uid;
+}
 
 void closeInOrder(FileDescriptor socket) noexcept {
     std::array<char, 4096> bytes;
