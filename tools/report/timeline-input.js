@@ -63,7 +63,7 @@ Object.assign(Timeline.prototype, {
         }
     },
     goToCapture(found) {
-        const row = document.getElementById(`capture-${deviceEvents.indexOf(found)}`);
+        const row = rowOfCapture(found);
         const link = row.querySelector('a');
         row.scrollIntoView({ block: 'center' });
         (link ?? row).focus();
