@@ -1,15 +1,14 @@
 #include "tools/report/SessionFilter.h"
 
 #include "base/Format.h"
+#include "base/NamePattern.h"
 
 #include <algorithm>
 
 namespace tamblo::report {
 
 bool SessionFilter::wantsApplication(std::string_view name) const {
-    const std::string_view pattern = application;
-    return pattern.ends_with('*') ? name.starts_with(pattern.substr(0, pattern.size() - 1))
-                                  : pattern.empty() || name == pattern;
+    return application.empty() || matchesPattern(name, application);
 }
 
 bool SessionFilter::mayWant(const Session& candidate) const {
