@@ -154,6 +154,14 @@ TEST(Status, ReadersAreSentOneDocumentAndTheEnd) {
         EXPECT_EQ(limit["source"] != "default", isChanged) << limit;
         EXPECT_EQ(limit["value"] == 99, isChanged) << limit;
     }
+    // What is written meanwhile is not in force.
+    writeFile(service.preferenceFile("com.vandra.tamblo.sinks"), R"({"file_mode": "0666"})");
+    for (const json& setting : statusJson(service, "status")["settings"]) {
+        if (setting["name"] == "file_mode") {
+            EXPECT_EQ(setting["value"], "0600");
+            EXPECT_EQ(setting["source"], "default");
+        }
+    }
     const StatusReader ended(service);
     ended.send("clients");
     ended.endSending();

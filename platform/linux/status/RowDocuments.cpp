@@ -11,7 +11,7 @@ namespace {
 /// In memory: as text, each may take six times as much. The sessions of one reporter may be thousands, and
 /// have all that their users may have retained.
 constexpr std::size_t kMostBytesOfValue = 64U << 10U;
-constexpr std::size_t kMostBytesOfValues = 4U << 20U;
+constexpr std::size_t kMostBytesOfValues = 1U << 20U;
 
 void appendName(JsonObject& row, const std::optional<std::string>& name) {
     if (name) {

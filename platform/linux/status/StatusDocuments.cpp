@@ -23,6 +23,8 @@ namespace tamblo {
 namespace {
 
 constexpr std::chrono::milliseconds kPatienceWithService{1000};
+constexpr std::string_view kSinksDomain = "com.vandra.tamblo.sinks";
+constexpr std::string_view kCapturesDomain = "com.vandra.tamblo.zrreporting";
 
 struct Setting {
     std::string name;
@@ -219,11 +221,28 @@ void StatusDocuments::appendSettings(JsonObject& document) const {
     };
     add(kAnalyticsDomain, "events_in_use", R"(["*"])");
     add(kCallQualityDomain, "backends", R"(["spool"])");
-    add(kSinksDomain, "file_mode", octal(parts_.fileModes.file));
-    add(kSinksDomain, "directory_mode", octal(parts_.fileModes.directory));
+    // These are read at the start: what has been changed since is not in force.
+    const auto addOfStart = [&](std::string_view domain, std::string_view key, std::string value,
+                                const std::string& whenAbsent) {
+        const bool isDefault = value == whenAbsent;
+        settings.push_back(
+            {std::string(key), std::move(value), isDefault ? "default" : parts_.preferences.path(domain)});
+    };
+    const FileModes modes;
+    addOfStart(kSinksDomain, "file_mode", octal(parts_.fileModes.file), octal(modes.file));
+    addOfStart(kSinksDomain, "directory_mode", octal(parts_.fileModes.directory), octal(modes.directory));
     const ReportLimits reports;
-    add(kLimitsDomain, "report_files", formatted("{}", reports.files));
-    add(kLimitsDomain, "report_bytes", formatted("{}", reports.bytes));
+    addOfStart(kLimitsDomain, "report_files", formatted("{}", reports_.files),
+               formatted("{}", reports.files));
+    addOfStart(kLimitsDomain, "report_bytes", formatted("{}", reports_.bytes),
+               formatted("{}", reports.bytes));
+    if (isInternalBuild.value_or(false)) {
+        add(kCapturesDomain, "TalvixInvalidXyBackOffSeconds", "no drafts");
+        add(kCapturesDomain, "enable_stackburst", "false");
+        add(kCapturesDomain, "io_buffer_size", "512");
+        add(kCapturesDomain, "io_cycle", "0");
+        add(kCapturesDomain, "wait_time", "0");
+    }
     document.array("settings", settings, [](TextBuffer& out, const Setting& setting) {
         JsonObject(out)
             .text("name", setting.name)
