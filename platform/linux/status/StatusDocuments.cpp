@@ -23,8 +23,6 @@ namespace tamblo {
 namespace {
 
 constexpr std::chrono::milliseconds kPatienceWithService{1000};
-constexpr std::string_view kSinksDomain = "com.vandra.tamblo.sinks";
-constexpr std::string_view kCapturesDomain = "com.vandra.tamblo.zrreporting";
 
 struct Setting {
     std::string name;
