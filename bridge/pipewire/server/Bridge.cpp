@@ -35,14 +35,20 @@ Bridge::Bridge(const Options& options, const wire::Directories& directories)
       service_(directories.socketFile()),
       reporter_(options.isDry ? static_cast<Reporter&>(text_) : service_),
       streams_(graph_, reporter_, clock_, serviceTypes_),
+      overloads_(graph_, reporter_, clock_, [this](ObjectID node) { return streams_.sessionOf(node); }),
+      profiler_(graph_, clock_, overloads_),
       server_(loop_, graph_),
       serverPlace_(SoundServer::socketPath(), clock_),
       servicePlace_(directories.socketFile(), clock_),
       preferences_(PreferenceFile::of(directories.preferences(), ServiceTypes::kDomain)),
       preferencesWatcher_(directories.preferences()) {
     graph_.addObserver(streams_);
+    graph_.addObserver(overloads_);
+    graph_.addObserver(profiler_);
     service_.addListener(streams_);
     loop_.addTimed(streams_);
+    loop_.addTimed(profiler_);
+    loop_.addTimed(overloads_);
 }
 
 int Bridge::run() {

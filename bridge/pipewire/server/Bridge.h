@@ -2,11 +2,13 @@
 
 #include "bridge/pipewire/graph/Graph.h"
 #include "bridge/pipewire/report/Endpoint.h"
+#include "bridge/pipewire/report/Overloads.h"
 #include "bridge/pipewire/report/ServiceReporter.h"
 #include "bridge/pipewire/report/ServiceTypes.h"
 #include "bridge/pipewire/report/StreamSessions.h"
 #include "bridge/pipewire/report/TextReporter.h"
 #include "bridge/pipewire/server/Loop.h"
+#include "bridge/pipewire/server/Profiler.h"
 #include "bridge/pipewire/server/SoundServer.h"
 #include "os/PreferenceFile.h"
 #include "wire/Directories.h"
@@ -49,6 +51,8 @@ private:
     ServiceReporter service_;
     Reporter& reporter_; ///< the one of the two that is used
     StreamSessions streams_;
+    Overloads overloads_;
+    Profiler profiler_;
     SoundServer server_;
     Endpoint serverPlace_;
     Endpoint servicePlace_;
