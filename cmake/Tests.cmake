@@ -85,6 +85,8 @@ if(TARGET tamblo-pipewire)
     tamblo_program(tamblo_pipewire_streams SOURCES bridge/pipewire/tests/streams.cpp)
     target_link_libraries(tamblo_pipewire_streams PRIVATE PkgConfig::PIPEWIRE)
     target_compile_definitions(tamblo_pipewire_tests PRIVATE
-        "PROGRAMS_DIR=\"${CMAKE_RUNTIME_OUTPUT_DIRECTORY}\"")
+        "PROGRAMS_DIR=\"${CMAKE_RUNTIME_OUTPUT_DIRECTORY}\""
+        "TAMBLOD_PATH=\"${CMAKE_RUNTIME_OUTPUT_DIRECTORY}/tamblod\""
+        "TAMBLOCTL_PATH=\"${CMAKE_RUNTIME_OUTPUT_DIRECTORY}/tambloctl\"")
     add_dependencies(tamblo_pipewire_tests tamblo-pipewire tamblo_pipewire_streams tamblod)
 endif()
