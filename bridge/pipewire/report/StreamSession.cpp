@@ -12,6 +12,17 @@ constexpr EventCategory kSession = client::category(Subsystem::session, EventKin
 constexpr EventCategory kRouteChange = client::category(Subsystem::routing, EventKind::routeChange);
 constexpr EventCategory kVolume = client::category(EventKind::volume);
 
+/// What has no value yet need not be said; that it has none any more, has.
+Dictionary withoutEmpty(const Dictionary& settings) {
+    Dictionary rest;
+    for (std::size_t i = 0; i < settings.size(); ++i) {
+        if (!settings.valueAt(i).isString() || !settings.valueAt(i).stringValue().empty()) {
+            rest.set(settings.keyAt(i), settings.valueAt(i));
+        }
+    }
+    return rest;
+}
+
 } // namespace
 
 EventCategory StreamSession::ownCategory() const noexcept {
@@ -24,17 +35,16 @@ void StreamSession::update(const StreamSettings& now, const Moment& at) {
         if (id_ == kNoSession) {
             return;
         }
-        said_ = now.settings;
         if (!now.isRunning) {
-            say(kSetup, EventType::setup, now.settings, at);
+            say(kSetup, EventType::setup, withoutEmpty(now.settings), at);
         }
     }
-    const Dictionary changes = changesBetween(said_, now.settings);
-    Dictionary before = std::exchange(said_, now.settings);
+    const Dictionary changes = changesBetween(settings_, now.settings);
+    const Dictionary before = std::exchange(settings_, now.settings);
     if (now.isRunning && !isRunning()) {
         start(at);
-    } else if (!now.isRunning && isRunning()) {
-        stop(at);
+    } else if (!now.isRunning) {
+        stopStream(at);
     } else if (changes.contains("active_devices")) {
         Dictionary payload = changes;
         if (const Value* const previous = before.find("active_devices")) {
@@ -47,10 +57,11 @@ void StreamSession::update(const StreamSettings& now, const Moment& at) {
     }
 }
 
-/// Everything is said with the start, as what is said later in a run would count from its beginning.
+/// Everything is said with the start: what has changed since the last one, and as what is said later in a run
+/// would count from its beginning.
 void StreamSession::start(const Moment& at) {
     runningSince_ = at;
-    Dictionary payload = said_;
+    Dictionary payload = withoutEmpty(settings_);
     payload.set(kind_.isInput ? "session_input_running" : "session_output_running", true);
     say(ownCategory(), EventType::start, std::move(payload), at);
 }
@@ -82,7 +93,7 @@ void StreamSession::end(const Moment& at) {
 void StreamSession::forget() {
     id_ = kNoSession;
     runningSince_.reset();
-    said_ = {};
+    settings_ = {};
     messages_ = 0;
 }
 

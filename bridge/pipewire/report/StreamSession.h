@@ -19,8 +19,8 @@ struct StreamKind {
 };
 
 /// The reporting session of one application's streams that follow each other. It says what it is given, as
-/// messages of a well-reporting client: everything at its start and whenever sound begins to run, else what
-/// has changed; at the end of each period of activity that it ended, and how long it was.
+/// messages of a well-reporting client: everything at its start and whenever sound begins to run; what has
+/// changed while it runs; at the end of each period of activity that it ended, and how long it was.
 ///
 /// Owned by `StreamSessions`, which decides when it is given what.
 class StreamSession {
@@ -49,7 +49,7 @@ private:
     const StreamKind kind_;
     SessionID id_ = kNoSession;
     std::optional<Moment> runningSince_;
-    Dictionary said_; ///< the settings that the service has been told
+    Dictionary settings_; ///< as of the last update
     std::int64_t messages_ = 0;
 };
 

@@ -50,7 +50,7 @@ public:
     /// `kNoSession` while there is none.
     [[nodiscard]] SessionID sessionOf(ObjectID stream) const noexcept;
     [[nodiscard]] std::size_t count() const noexcept { return live_.size() + waiting_.size(); }
-    /// Streams that were not reported, as there were too many.
+    /// How often a stream was not reported, as there were too many.
     [[nodiscard]] std::uint64_t leftOut() const noexcept { return leftOut_; }
 
 private:
