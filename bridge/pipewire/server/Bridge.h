@@ -34,7 +34,18 @@ public:
     [[nodiscard]] int run();
 
 private:
+    /// A place whose socket is waited for, and the loop's watch of it.
+    struct Place {
+        Endpoint endpoint;
+        std::unique_ptr<Loop::Watch> watch{};
+
+        [[nodiscard]] bool isDue(const Clock& clock) const {
+            return endpoint.due() && *endpoint.due() <= clock.now().steady;
+        }
+    };
+
     void readPreferences();
+    void watchPlace(Place& place);
     void reachService();
     void reachServer();
     void leaveServer();
@@ -54,8 +65,8 @@ private:
     Overloads overloads_;
     Profiler profiler_;
     SoundServer server_;
-    Endpoint serverPlace_;
-    Endpoint servicePlace_;
+    Place serverPlace_;
+    Place servicePlace_;
     std::optional<PreferenceFile> preferences_;
     DirectoryWatcher preferencesWatcher_;
     std::unique_ptr<Loop::Watch> serviceWatch_;
