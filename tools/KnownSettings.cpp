@@ -13,6 +13,7 @@ constexpr std::string_view kSinks = "com.vandra.tamblo.sinks";
 constexpr std::string_view kLimits = "com.vandra.tamblo.limits";
 constexpr std::string_view kCaptures = "com.vandra.tamblo.zrreporting";
 constexpr std::string_view kAccessories = "com.vandra.tamblo.accessories";
+constexpr std::string_view kPipeWire = "com.vandra.tamblo.pipewire";
 constexpr std::string_view kReporting = "com.vandra.tamblo";
 constexpr std::string_view kDashlo = "com.vandra.dashlo";
 
@@ -36,6 +37,8 @@ constexpr auto kPreferences = std::to_array<KnownPreference>({
     {kCaptures, "io_cycle", number, "the least io_cycle of an overload (0)"},
     {kCaptures, "wait_time", number, "microseconds from the message to the capture (0)"},
     {kAccessories, "registered", object, "the accessories known, which the service stores"},
+    {kPipeWire, "service_types", object, "read by tamblo-pipewire: names of service types by role"},
+    {kPipeWire, "service_types_of_applications", object, "the same by application, whatever the role"},
     {kLimits, "reporters_of_message", limit, "reporters that a message names (128)"},
     {kLimits, "entries_of_dictionary", limit, "entries of a payload or configuration (1024)"},
     {kLimits, "key_bytes", limit, "bytes of a key (1024)"},
