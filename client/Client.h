@@ -130,6 +130,10 @@ public:
     /// number of replies that it handled as soon as there are any, or 0 early when the connection changed.
     bool connect() { return engine_->connect(); }
     std::size_t run(std::chrono::milliseconds timeout) { return engine_->pump(timeout); }
+    /// Caller mode, for a program with a loop of its own: the descriptor to watch for reading, and for
+    /// writing while `flush` with no time says that something is left; then `run` or `flush` with no time do
+    /// not wait. -1 without a connection; another one after the next connect.
+    [[nodiscard]] int descriptor() const noexcept { return engine_->descriptor(); }
 
     /// Whether the future is ready, at the latest after this time. Pumps in caller mode: then a request and
     /// its reply are one system call each.

@@ -70,6 +70,8 @@ public:
     std::size_t pump(std::chrono::milliseconds timeout);
     /// Has `pump` return, from any thread; only when wakeable.
     void wake() noexcept;
+    /// The pumping thread: the connection's; -1 without one.
+    [[nodiscard]] int descriptor() const noexcept { return socket_.get(); }
     /// The pumping thread: whether all that was queued has been handed to the kernel.
     [[nodiscard]] bool isFlushed() noexcept { return prologue_.empty() && queue_.empty(); }
     /// Ends the connection for good and answers everything that waits.

@@ -74,3 +74,19 @@ foreach(tests tamblo_service_tests tamblo_hostile_tests)
         endforeach()
     endif()
 endforeach()
+
+# The bridge to PipeWire: its model without a server, and the program with a private one.
+if(TARGET tamblo-pipewire)
+    file(GLOB pipewire_sources CONFIGURE_DEPENDS RELATIVE "${CMAKE_SOURCE_DIR}" bridge/pipewire/tests/*Test.cpp)
+    tamblo_link_headers(bridge/pipewire/tests TRUE pipewire_tests_include)
+    tamblo_tests(tamblo_pipewire_tests LABEL service SOURCES ${pipewire_sources}
+        LIBRARIES bridge/pipewire/report bridge/pipewire/graph client wire os base)
+    target_include_directories(tamblo_pipewire_tests PRIVATE "${pipewire_tests_include}")
+    tamblo_program(tamblo_pipewire_streams SOURCES bridge/pipewire/tests/streams.cpp)
+    target_link_libraries(tamblo_pipewire_streams PRIVATE PkgConfig::PIPEWIRE)
+    target_compile_definitions(tamblo_pipewire_tests PRIVATE
+        "PROGRAMS_DIR=\"${CMAKE_RUNTIME_OUTPUT_DIRECTORY}\""
+        "TAMBLOD_PATH=\"${CMAKE_RUNTIME_OUTPUT_DIRECTORY}/tamblod\""
+        "TAMBLOCTL_PATH=\"${CMAKE_RUNTIME_OUTPUT_DIRECTORY}/tambloctl\"")
+    add_dependencies(tamblo_pipewire_tests tamblo-pipewire tamblo_pipewire_streams tamblod)
+endif()

@@ -54,7 +54,8 @@ DirectoryWatcher::DirectoryWatcher(std::string directory, Watch watched)
 void DirectoryWatcher::watch() {
     replaceWatch(parentWatch_, watchNearestParent());
     const int parentError = errno;
-    const std::uint32_t mask = kWritesMask | (watched_ == Watch::writes ? 0 : kRemovalsMask);
+    const std::uint32_t mask = kWritesMask | (watched_ == Watch::writes ? 0 : kRemovalsMask) |
+                               (watched_ == Watch::creationsAndRemovals ? IN_CREATE | IN_ATTRIB : 0U);
     const int watch = ::inotify_add_watch(inotify_.get(), directory_.c_str(), mask);
     const bool isMissing = watch < 0 && (errno == ENOENT || errno == ENOTDIR);
     if (isMissing) {

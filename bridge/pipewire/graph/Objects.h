@@ -1,0 +1,140 @@
+#pragma once
+
+#include <cstdint>
+#include <optional>
+#include <string>
+#include <vector>
+
+/// What the sound server's world consists of, as far as reports need it. Texts have been cut and cleaned when
+/// they stand here, and nothing else enters: `graph/Properties.h` has the list of what may.
+namespace tamblo::pipewire {
+
+/// The server's number of an object; given to another one when the object is gone.
+using ObjectID = std::uint32_t;
+inline constexpr ObjectID kNoObject = 0xFFFFFFFF;
+
+/// What an application calls itself. Streams may say it, or the client that they belong to.
+struct ApplicationNames {
+    std::string portal;     ///< the identifier that a sandbox vouches for
+    std::string identifier; ///< such as "org.example.Player"
+    std::string binary;     ///< of the process
+    std::string name;
+
+    bool operator==(const ApplicationNames&) const = default;
+};
+
+struct Client {
+    ApplicationNames application;
+
+    bool operator==(const Client&) const = default;
+};
+
+enum class MediaClass : std::uint8_t {
+    other,          ///< filters between others, and what carries no sound
+    playbackStream, ///< an application plays
+    captureStream,  ///< an application records
+    sink,
+    source,
+    duplex,
+};
+
+enum class NodeState : std::uint8_t { creating, suspended, idle, running, error };
+
+struct Format {
+    std::string codec; ///< "lpcm", or how the stream is compressed; empty: not known
+    std::uint32_t rate = 0;
+    std::uint32_t channels = 0;
+
+    bool operator==(const Format&) const = default;
+};
+
+struct Volume {
+    double linear = 1; ///< the factor of the loudest channel
+    bool isMuted = false;
+
+    bool operator==(const Volume&) const = default;
+};
+
+struct Node {
+    MediaClass mediaClass = MediaClass::other;
+    /// Whether the server has told more than that it is there.
+    bool isKnown = false;
+    NodeState state = NodeState::creating;
+    /// How often it has come to be in an error, and what the last one was called.
+    std::uint32_t errors = 0;
+    std::string error;
+
+    ObjectID client = kNoObject;
+    ObjectID device = kNoObject;
+    /// Which of the device's ends it is, as the device's routes count them.
+    std::optional<std::uint32_t> endOfDevice;
+
+    std::string name;
+    std::string description;
+    std::string nick;
+    std::string role;
+    std::string category;
+    std::string latency; ///< frames and rate that it asks for, "1024/48000"
+    /// What nodes have in common that are the two sides of one filter.
+    std::string linkGroup;
+    std::string bluetoothProfile;
+    std::string bluetoothCodec;
+    std::string formFactor;
+    ApplicationNames application;
+    bool isVirtual = false; ///< no device, but a place that others connect to
+    bool isMonitor = false; ///< it only shows levels
+
+    std::optional<Format> format;
+    std::optional<Volume> volume;
+
+    bool operator==(const Node&) const = default;
+};
+
+/// A connector of a device, and what is behind it: headphones, a speaker.
+struct Route {
+    bool isOutput = true;
+    std::uint32_t end = 0; ///< the node's `endOfDevice`
+    std::string name;
+    std::string description;
+    std::string portType;
+
+    bool operator==(const Route&) const = default;
+};
+
+struct Device {
+    bool isKnown = false;
+    std::string name; ///< the server's own, free of addresses
+    std::string description;
+    std::string nick;
+    std::string api; ///< "alsa", "bluez5"
+    std::string bus;
+    std::string formFactor;
+    std::string vendor; ///< numbers of the maker and of the product, not of the piece
+    std::string product;
+    std::string profile;
+    std::string profileDescription;
+    std::vector<Route> routes; ///< the active ones
+
+    bool operator==(const Device&) const = default;
+};
+
+struct Link {
+    ObjectID output = kNoObject; ///< the node that gives
+    ObjectID input = kNoObject;  ///< the node that takes
+
+    bool operator==(const Link&) const = default;
+};
+
+/// What the server says of itself, and what a session manager has set for all.
+struct Server {
+    std::string name;
+    std::string version;
+    std::string defaultSink; ///< names of nodes
+    std::string defaultSource;
+    std::uint32_t rate = 0;    ///< Hz; 0: not known
+    std::uint32_t quantum = 0; ///< frames
+
+    bool operator==(const Server&) const = default;
+};
+
+} // namespace tamblo::pipewire

@@ -1,0 +1,103 @@
+#include "bridge/pipewire/server/Bridge.h"
+
+#include <csignal>
+#include <cstdio>
+#include <cstdlib>
+#include <exception>
+#include <optional>
+#include <span>
+#include <string>
+#include <string_view>
+#include <variant>
+
+#include <pipewire/pipewire.h>
+
+namespace {
+
+constexpr int kWrongUse = 2;
+
+constexpr const char* kHelp =
+    "usage: tamblo-pipewire [--dry-run] [--once] [--help | --version]\n"
+    "\n"
+    "Reports to tamblod what the sound server PipeWire knows: a session for each application's stream, with "
+    "when\n"
+    "it ran, where to, how loud, in which format. It runs until SIGTERM or SIGINT, whether or not the two "
+    "are\n"
+    "there.\n"
+    "\n"
+    "  --dry-run  print what would be reported, and report nothing\n"
+    "  --once     report the streams that there are now, and end\n"
+    "\n"
+    "  RUNTIME_DIRECTORY        where the service's socket is\n"
+    "  CONFIGURATION_DIRECTORY  preferences; com.vandra.tamblo.pipewire has which role is which service "
+    "type\n"
+    "  PIPEWIRE_REMOTE, PIPEWIRE_RUNTIME_DIR, XDG_RUNTIME_DIR\n"
+    "                           where the sound server's socket is, as for its other clients\n"
+    "\n"
+    "Exit status: 0 after a signal, 1 when it cannot start or, with --once, has nobody to ask or to tell, 2 "
+    "with\n"
+    "other arguments.\n";
+
+/// What the arguments ask for, or the exit status where that is all.
+std::variant<tamblo::pipewire::Bridge::Options, int> parse(std::span<const char* const> arguments) {
+    tamblo::pipewire::Bridge::Options options;
+    for (const std::string_view argument : arguments) {
+        if (argument == "--help") {
+            std::fputs(kHelp, stdout);
+            return EXIT_SUCCESS;
+        }
+        if (argument == "--version") {
+            std::puts("tamblo-pipewire " TAMBLO_VERSION);
+            return EXIT_SUCCESS;
+        }
+        if (argument == "--dry-run") {
+            options.isDry = true;
+        } else if (argument == "--once") {
+            options.once = true;
+        } else {
+            std::fprintf(stderr, "tamblo-pipewire: unknown argument \"%.*s\"; --help lists them\n",
+                         static_cast<int>(argument.size()), argument.data());
+            return kWrongUse;
+        }
+    }
+    return options;
+}
+
+/// Before the library makes its first thread, which takes over what is blocked.
+void blockSignals() {
+    sigset_t signals;
+    sigemptyset(&signals);
+    sigaddset(&signals, SIGTERM);
+    sigaddset(&signals, SIGINT);
+    pthread_sigmask(SIG_BLOCK, &signals, nullptr);
+}
+
+} // namespace
+
+int main(int argc, char* argv[]) {
+    const std::span<const char* const> words(argv, static_cast<std::size_t>(argc));
+    const auto parsed = parse(words.subspan(argc > 0 ? 1 : 0));
+    if (const int* const status = std::get_if<int>(&parsed)) {
+        return *status;
+    }
+    const auto directories = tamblo::wire::Directories::ofThisProcess();
+    if (directories.runtime.empty() || directories.configuration.empty()) {
+        std::fputs("tamblo-pipewire: set RUNTIME_DIRECTORY and CONFIGURATION_DIRECTORY\n", stderr);
+        return EXIT_FAILURE;
+    }
+    blockSignals();
+    pw_init(nullptr, nullptr);
+    if (std::getenv("PIPEWIRE_DEBUG") == nullptr) {
+        // Its warnings are about being set up without a configuration file, which is meant.
+        pw_log_set_level(SPA_LOG_LEVEL_ERROR);
+    }
+    int status = EXIT_FAILURE;
+    try {
+        tamblo::pipewire::Bridge bridge(std::get<tamblo::pipewire::Bridge::Options>(parsed), directories);
+        status = bridge.run();
+    } catch (const std::exception& problem) {
+        std::fprintf(stderr, "tamblo-pipewire: %s\n", problem.what());
+    }
+    pw_deinit();
+    return status;
+}

@@ -1,0 +1,249 @@
+#include "bridge/pipewire/report/StreamSettings.h"
+
+#include "base/Format.h"
+#include "bridge/pipewire/graph/CleanText.h"
+#include "bridge/pipewire/graph/Routes.h"
+
+#include <algorithm>
+#include <array>
+#include <cctype>
+#include <charconv>
+#include <cmath>
+#include <set>
+#include <string>
+#include <string_view>
+#include <vector>
+
+namespace tamblo::pipewire {
+
+namespace {
+
+constexpr std::size_t kMostListBytes = 512;
+
+std::string joined(const std::set<std::string>& texts) {
+    std::string list;
+    for (const std::string& text : texts) {
+        if (text.empty() || list.size() + text.size() > kMostListBytes) {
+            continue;
+        }
+        list += list.empty() ? "" : ", ";
+        list += text;
+    }
+    return list;
+}
+
+/// Six digits are more than anybody sees of a volume; the rest is noise of the arithmetic.
+double rounded(double value) noexcept {
+    constexpr double digits = 1e6;
+    return std::round(value * digits) / digits;
+}
+
+std::string upperCase(std::string_view text) {
+    std::string upper(text);
+    std::transform(upper.begin(), upper.end(), upper.begin(),
+                   [](unsigned char byte) { return static_cast<char>(std::toupper(byte)); });
+    return upper;
+}
+
+std::string channelsText(std::uint32_t channels) {
+    switch (channels) {
+    case 1:
+        return "mono";
+    case 2:
+        return "stereo";
+    case 6:
+        return "5.1";
+    case 8:
+        return "7.1";
+    default:
+        return formatted("{} channels", channels);
+    }
+}
+
+void setFormat(Dictionary& settings, const Format& format) {
+    settings.set("session_selected_format", formatted("{} {} Hz {}", upperCase(format.codec), format.rate,
+                                                      channelsText(format.channels)));
+    settings.set("mFormatID", format.codec);
+    settings.set("mChannelsPerFrame", format.channels);
+    settings.set("sample_rate", format.rate);
+}
+
+/// "1024/48000", in seconds.
+void setLatency(Dictionary& settings, std::string_view latency) {
+    const std::size_t slash = latency.find('/');
+    std::uint32_t frames = 0;
+    std::uint32_t rate = 0;
+    if (slash == std::string_view::npos) {
+        return;
+    }
+    std::from_chars(latency.data(), latency.data() + slash, frames);
+    std::from_chars(latency.data() + slash + 1, latency.data() + latency.size(), rate);
+    if (frames != 0 && rate != 0) {
+        settings.set("requested_latency", rounded(static_cast<double>(frames) / rate));
+    }
+}
+
+/// Filters say what they do by their names alone.
+bool isSpatial(std::string_view name) {
+    const std::string upper = upperCase(name);
+    constexpr std::array<std::string_view, 4> words{"SPATIAL", "SURROUND", "BINAURAL", "HRTF"};
+    return std::any_of(words.begin(), words.end(),
+                       [&upper](std::string_view word) { return upper.find(word) != std::string::npos; });
+}
+
+/// What the devices that a stream reaches have in common, or each of them has.
+class DeviceSettings {
+public:
+    void add(const DeviceFacts& facts) {
+        names_.insert(facts.name);
+        portTypes_.insert(facts.portType);
+        formFactors_.insert(facts.formFactor);
+        profiles_.insert(facts.bluetoothProfile);
+        codecs_.insert(facts.bluetoothCodec);
+        rate_ = rate_ == 0 ? facts.rate : rate_;
+        const bool isLouder = !facts.volume.isMuted && facts.volume.linear > volume_;
+        volume_ = isFirst_ ? audible(facts.volume) : isLouder ? facts.volume.linear : volume_;
+        isFirst_ = false;
+    }
+
+    [[nodiscard]] static double audible(const Volume& volume) noexcept {
+        return volume.isMuted ? 0 : volume.linear;
+    }
+    /// The loudest's.
+    [[nodiscard]] double volume() const noexcept { return volume_; }
+    [[nodiscard]] std::uint32_t rate() const noexcept { return rate_; }
+    [[nodiscard]] std::string names() const {
+        const std::string list = joined(names_);
+        return list.empty() ? "None" : list;
+    }
+    [[nodiscard]] std::string codecs() const { return joined(codecs_); }
+
+    void setOthers(Dictionary& settings) const {
+        settings.set("port_type", joined(portTypes_));
+        settings.set("form_factor", joined(formFactors_));
+        settings.set("bluetooth_profile", joined(profiles_));
+        settings.set("bluetooth_codec", joined(codecs_));
+    }
+
+private:
+    std::set<std::string> names_;
+    std::set<std::string> portTypes_;
+    std::set<std::string> formFactors_;
+    std::set<std::string> profiles_;
+    std::set<std::string> codecs_;
+    std::uint32_t rate_ = 0;
+    double volume_ = 1;
+    bool isFirst_ = true;
+};
+
+/// What lies between a stream and the devices.
+class FilterSettings {
+public:
+    FilterSettings(const Graph& graph, const std::vector<ObjectID>& filters) {
+        for (const ObjectID id : filters) {
+            const Node& filter = *graph.node(id);
+            hasSpatial_ = hasSpatial_ || isSpatial(filter.name) || isSpatial(filter.description);
+            volume_ *= DeviceSettings::audible(filter.volume.value_or(Volume{}));
+            if (!filter.name.empty() && names_.size() + filter.name.size() <= kMostListBytes) {
+                names_ += (names_.empty() ? "" : ", ") + filter.name;
+            }
+        }
+    }
+
+    [[nodiscard]] const std::string& names() const noexcept { return names_; }
+    [[nodiscard]] bool hasSpatial() const noexcept { return hasSpatial_; }
+    [[nodiscard]] double volume() const noexcept { return volume_; }
+
+private:
+    std::string names_;
+    bool hasSpatial_ = false;
+    double volume_ = 1;
+};
+
+void setVolume(Dictionary& settings, const Volume& stream, double device) {
+    const double linear = DeviceSettings::audible(stream) * device;
+    settings.set("QVSessionVolume", rounded(perceivedVolume(linear)));
+    settings.set("linear_volume", rounded(linear));
+    settings.set("stream_volume", rounded(perceivedVolume(stream.linear)));
+    settings.set("stream_muted", stream.isMuted);
+    settings.set("device_volume", rounded(perceivedVolume(device)));
+}
+
+/// What carries voice over a headset's link, by the name that reports have for it.
+std::pair<std::string_view, std::string_view> vocoderOf(std::string_view codec) noexcept {
+    if (codec == "msbc") {
+        return {"mSBC", "16000"};
+    }
+    if (codec == "lc3_swb") {
+        return {"LC3-SWB", "32000"};
+    }
+    return codec == "cvsd" ? std::pair<std::string_view, std::string_view>{"CVSD", "8000"}
+                           : std::pair<std::string_view, std::string_view>{"none", "0.0"};
+}
+
+void setInput(Dictionary& settings, const DeviceSettings& devices, const std::string& filters) {
+    const auto [vocoder, rate] = vocoderOf(devices.codecs());
+    settings.set("vp_config_operation_mode", filters.empty() ? "none" : filters);
+    settings.set("vp_config_input_port", devices.names());
+    settings.set("vp_config_primary_vocoder", vocoder);
+    settings.set("vp_config_primary_vocoderFs", rate);
+}
+
+} // namespace
+
+double perceivedVolume(double linear) noexcept {
+    return std::isfinite(linear) ? std::clamp(std::cbrt(linear), 0.0, 1.0) : 0.0;
+}
+
+StreamSettings settingsOf(const Graph& graph, ObjectID stream) {
+    StreamSettings now;
+    const Node* const node = graph.node(stream);
+    if (node == nullptr) {
+        return now;
+    }
+    const bool isInput = node->mediaClass == MediaClass::captureStream;
+    const Reached reached = devicesReachedFrom(graph, stream);
+    now.isRunning = node->state == NodeState::running && reached.isLinked;
+
+    DeviceSettings devices;
+    for (const ObjectID id : reached.devices) {
+        const Node* const device = graph.node(id);
+        devices.add(factsOf(graph, id, isInput && device->mediaClass == MediaClass::sink));
+    }
+    const FilterSettings filters(graph, reached.filters);
+
+    Dictionary& settings = now.settings;
+    settings.set("active_devices", devices.names());
+    devices.setOthers(settings);
+    settings.set("filters", filters.names());
+    settings.set("spatializationEnabled", filters.hasSpatial());
+    if (node->format) {
+        setFormat(settings, *node->format);
+        settings.set("is_resampled", devices.rate() != 0 && devices.rate() != node->format->rate);
+    }
+    if (devices.rate() != 0) {
+        settings.set("device_sample_rate", devices.rate());
+    }
+    setVolume(settings, node->volume.value_or(Volume{}), filters.volume() * devices.volume());
+    setLatency(settings, node->latency);
+    if (graph.server().quantum != 0) {
+        settings.set("io_buffer_size", graph.server().quantum);
+    }
+    if (isInput) {
+        setInput(settings, devices, filters.names());
+    }
+    return now;
+}
+
+Dictionary changesBetween(const Dictionary& before, const Dictionary& now) {
+    Dictionary changes;
+    for (std::size_t i = 0; i < now.size(); ++i) {
+        const Value* const old = before.find(now.keyAt(i));
+        if (old == nullptr || !(*old == now.valueAt(i))) {
+            changes.set(now.keyAt(i), now.valueAt(i));
+        }
+    }
+    return changes;
+}
+
+} // namespace tamblo::pipewire

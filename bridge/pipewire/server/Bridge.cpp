@@ -1,0 +1,160 @@
+#include "bridge/pipewire/server/Bridge.h"
+
+#include <algorithm>
+#include <array>
+#include <cerrno>
+#include <csignal>
+#include <cstdio>
+#include <cstdlib>
+#include <cstring>
+#include <variant>
+
+namespace tamblo::pipewire {
+
+using std::chrono::milliseconds;
+
+namespace {
+
+/// How long the program's end may take.
+constexpr milliseconds kFarewell{1000};
+
+void log(const std::string& line) {
+    std::fprintf(stderr, "tamblo-pipewire: %s\n", line.c_str());
+}
+
+} // namespace
+
+Bridge::Bridge(const Options& options, const wire::Directories& directories)
+    : options_(options),
+      loop_(clock_),
+      text_(stdout),
+      service_(directories.socketFile()),
+      reporter_(options.isDry ? static_cast<Reporter&>(text_) : service_),
+      streams_(graph_, reporter_, clock_, serviceTypes_),
+      overloads_(graph_, reporter_, clock_, [this](ObjectID node) { return streams_.sessionOf(node); }),
+      profiler_(graph_, clock_, overloads_),
+      server_(loop_, graph_),
+      serverPlace_{Endpoint(SoundServer::socketPath(), clock_)},
+      servicePlace_{Endpoint(directories.socketFile(), clock_)},
+      preferences_(PreferenceFile::of(directories.preferences(), ServiceTypes::kDomain)),
+      preferencesWatcher_(directories.preferences()) {
+    graph_.addObserver(streams_);
+    graph_.addObserver(overloads_);
+    graph_.addObserver(profiler_);
+    service_.addListener(streams_);
+    loop_.addTimed(streams_);
+    loop_.addTimed(profiler_);
+    loop_.addTimed(overloads_);
+}
+
+int Bridge::run() {
+    readPreferences();
+    std::vector<std::unique_ptr<Loop::Watch>> watches;
+    for (const int signal : {SIGTERM, SIGINT}) {
+        watches.push_back(loop_.watchSignal(signal, [this] { loop_.stop(); }));
+    }
+    watches.push_back(loop_.watch(preferencesWatcher_.fileDescriptor(), [this] {
+        preferencesWatcher_.read([](auto) {});
+        readPreferences();
+    }));
+    watchPlace(serverPlace_);
+    if (!options_.isDry) {
+        watchPlace(servicePlace_);
+    }
+    loop_.run([this] { return beforeSleep(); });
+    streams_.endAll();
+    service_.finish(kFarewell);
+    return status_;
+}
+
+void Bridge::readPreferences() {
+    if (!preferences_) {
+        return;
+    }
+    const auto read = preferences_->read();
+    if (const auto* const fault = std::get_if<std::string>(&read)) {
+        log(*fault);
+        return;
+    }
+    for (const std::string& fault : serviceTypes_.setPreferences(std::get<Dictionary>(read))) {
+        log(preferences_->path() + ": " + fault);
+    }
+}
+
+void Bridge::watchPlace(Place& place) {
+    place.watch = loop_.watch(place.endpoint.descriptor(), [&place] { place.endpoint.read(); });
+}
+
+void Bridge::reachService() {
+    if (!service_.connect()) {
+        servicePlace_.endpoint.failed();
+        return;
+    }
+    servicePlace_.watch.reset();
+    servicePlace_.endpoint.connected();
+    log("reports to " + service_.socketPath());
+    // What the service says is taken in before the next sleep.
+    serviceWatch_ = loop_.watch(service_.descriptor(), [] {});
+}
+
+void Bridge::reachServer() {
+    if (!server_.connect()) {
+        serverPlace_.endpoint.failed();
+        return;
+    }
+    serverPlace_.watch.reset();
+    serverPlace_.endpoint.connected();
+    log("watches " + SoundServer::socketPath());
+}
+
+void Bridge::leaveServer() {
+    log("the sound server has gone");
+    server_.disconnect();
+    serverPlace_.endpoint.lost();
+    watchPlace(serverPlace_);
+}
+
+std::optional<SteadyTime> Bridge::beforeSleep() {
+    if (server_.hasGone()) {
+        leaveServer();
+    }
+    if (serverPlace_.isDue(clock_)) {
+        reachServer();
+    }
+    if (!options_.isDry && servicePlace_.isDue(clock_)) {
+        reachService();
+    }
+    if (options_.once) {
+        takeSnapshot();
+    }
+    if (service_.isReachable() && !service_.pump()) {
+        log("the service has gone");
+        serviceWatch_.reset();
+        servicePlace_.endpoint.lost();
+        watchPlace(servicePlace_);
+    }
+    if (serviceWatch_) {
+        serviceWatch_->watchWriting(service_.wantsWriting());
+    }
+    std::optional<SteadyTime> due = serverPlace_.endpoint.due();
+    const std::optional<SteadyTime> other = options_.isDry ? std::nullopt : servicePlace_.endpoint.due();
+    return due && other ? std::min(*due, *other) : due ? due : other;
+}
+
+/// Ends the program, when everything is known, or when it will not be.
+void Bridge::takeSnapshot() {
+    if (server_.isConnected() && server_.isComplete() && reporter_.isReachable()) {
+        streams_.settle();
+        loop_.stop();
+    } else if (!server_.isConnected() && !serverPlace_.endpoint.due()) {
+        log("no sound server answers at " + SoundServer::socketPath());
+        status_ = EXIT_FAILURE;
+        loop_.stop();
+    } else if (!reporter_.isReachable() && !servicePlace_.endpoint.due()) {
+        log("the service does not answer at " + service_.socketPath());
+        status_ = EXIT_FAILURE;
+        loop_.stop();
+    }
+}
+
+} // namespace tamblo::pipewire

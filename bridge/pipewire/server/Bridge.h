@@ -1,0 +1,76 @@
+#pragma once
+
+#include "bridge/pipewire/graph/Graph.h"
+#include "bridge/pipewire/report/Endpoint.h"
+#include "bridge/pipewire/report/Overloads.h"
+#include "bridge/pipewire/report/ServiceReporter.h"
+#include "bridge/pipewire/report/ServiceTypes.h"
+#include "bridge/pipewire/report/StreamSessions.h"
+#include "bridge/pipewire/report/TextReporter.h"
+#include "bridge/pipewire/server/Loop.h"
+#include "bridge/pipewire/server/Profiler.h"
+#include "bridge/pipewire/server/SoundServer.h"
+#include "os/PreferenceFile.h"
+#include "wire/Directories.h"
+
+#include <memory>
+#include <optional>
+#include <string>
+
+namespace tamblo::pipewire {
+
+/// The program: owns the graph, the sound server's connection that fills it, those who report from it, and
+/// the connection to the service; has each of the two connections tried when there is hope, in any order.
+class Bridge {
+public:
+    struct Options {
+        bool isDry = false; ///< writes down what would be reported
+        bool once = false;  ///< reports what there is now, and ends
+    };
+
+    Bridge(const Options& options, const wire::Directories& directories);
+
+    /// Until SIGTERM or SIGINT, which are to be blocked before the first thread is made. The exit status.
+    [[nodiscard]] int run();
+
+private:
+    /// A place whose socket is waited for, and the loop's watch of it.
+    struct Place {
+        Endpoint endpoint;
+        std::unique_ptr<Loop::Watch> watch{};
+
+        [[nodiscard]] bool isDue(const Clock& clock) const {
+            return endpoint.due() && *endpoint.due() <= clock.now().steady;
+        }
+    };
+
+    void readPreferences();
+    void watchPlace(Place& place);
+    void reachService();
+    void reachServer();
+    void leaveServer();
+    /// Everything that was reported leaves; when to be called again at the latest.
+    [[nodiscard]] std::optional<SteadyTime> beforeSleep();
+    void takeSnapshot();
+
+    const Options options_;
+    SystemClock clock_;
+    Loop loop_;
+    Graph graph_;
+    ServiceTypes serviceTypes_;
+    TextReporter text_;
+    ServiceReporter service_;
+    Reporter& reporter_; ///< the one of the two that is used
+    StreamSessions streams_;
+    Overloads overloads_;
+    Profiler profiler_;
+    SoundServer server_;
+    Place serverPlace_;
+    Place servicePlace_;
+    std::optional<PreferenceFile> preferences_;
+    DirectoryWatcher preferencesWatcher_;
+    std::unique_ptr<Loop::Watch> serviceWatch_;
+    int status_ = 0;
+};
+
+} // namespace tamblo::pipewire

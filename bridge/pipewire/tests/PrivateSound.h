@@ -1,0 +1,177 @@
+#pragma once
+
+#include "tests/service/RealService.h"
+
+#include "base/Json.h"
+
+#include <chrono>
+#include <cstdint>
+#include <cstdlib>
+#include <filesystem>
+#include <memory>
+#include <optional>
+#include <string>
+#include <string_view>
+#include <vector>
+
+namespace tamblo::pipewire::test {
+
+using tamblo::test::contentOf;
+using tamblo::test::eventually;
+using tamblo::test::linesOf;
+using tamblo::test::ServiceProcess;
+using tamblo::test::writeFile;
+
+/// A program that is ended with its owner.
+class Program {
+public:
+    explicit Program(std::vector<std::string> words, const std::string& output = "/dev/null") {
+        std::vector<char*> arguments;
+        for (std::string& word : words) {
+            arguments.push_back(word.data());
+        }
+        arguments.push_back(nullptr);
+        pid_ = ::fork();
+        if (pid_ == 0) {
+            ::prctl(PR_SET_PDEATHSIG, SIGKILL);
+            const int file = ::open(output.c_str(), O_WRONLY | O_CREAT | O_APPEND, 0600);
+            ::dup2(file, STDOUT_FILENO);
+            ::dup2(file, STDERR_FILENO);
+            ::execvp(arguments.front(), arguments.data());
+            ::_exit(127);
+        }
+    }
+    ~Program() { end(SIGKILL); }
+    Program(const Program&) = delete;
+    Program& operator=(const Program&) = delete;
+
+    /// Its exit status, or minus the signal; nothing when it runs on for too long.
+    std::optional<int> wait() {
+        int status = 0;
+        if (pid_ <= 0 || !eventually([this, &status] { return ::waitpid(pid_, &status, WNOHANG) == pid_; })) {
+            return std::nullopt;
+        }
+        pid_ = -1;
+        return WIFEXITED(status) ? WEXITSTATUS(status) : -WTERMSIG(status);
+    }
+    std::optional<int> end(int signal = SIGTERM) {
+        if (pid_ > 0) {
+            ::kill(pid_, signal);
+        }
+        return wait();
+    }
+    [[nodiscard]] pid_t pid() const noexcept { return pid_; }
+
+private:
+    pid_t pid_ = -1;
+};
+
+[[nodiscard]] inline bool isInstalled(const std::string& program) {
+    return tamblo::test::run("command -v " + program).status == 0;
+}
+
+/// A PipeWire with its session manager in directories of their own: two sinks and a source of no hardware,
+/// "Speaker A", "Speaker B" and "Microphone". One at a time: it sets this process's environment.
+class PrivateSound {
+public:
+    PrivateSound() {
+        for (const auto& [name, place] :
+             {std::pair("XDG_RUNTIME_DIR", "run"), std::pair("HOME", "home"),
+              std::pair("XDG_CONFIG_HOME", "home/config"), std::pair("XDG_STATE_HOME", "home/state")}) {
+            std::filesystem::create_directories(directory_.path(place));
+            ::setenv(name, directory_.path(place).c_str(), 1);
+        }
+        ::unsetenv("PIPEWIRE_REMOTE");
+        ::unsetenv("PIPEWIRE_RUNTIME_DIR");
+        const std::string address = "unix:path=" + directory_.path("run/bus");
+        ::setenv("DBUS_SESSION_BUS_ADDRESS", address.c_str(), 1);
+        bus_ = std::make_unique<Program>(
+            std::vector<std::string>{"dbus-daemon", "--session", "--nofork", "--address=" + address});
+        const auto node = [](std::string_view name, std::string_view description,
+                             std::string_view mediaClass) {
+            return "{ factory = adapter args = { factory.name = support.null-audio-sink node.name = " +
+                   std::string(name) + " node.description = \"" + std::string(description) +
+                   "\" media.class = " + std::string(mediaClass) + " audio.position = [ FL FR ] } }\n";
+        };
+        writeFile(directory_.path("home/config/pipewire/pipewire.conf.d/devices.conf"),
+                  "context.objects = [\n" + node("sink-a", "Speaker A", "Audio/Sink") +
+                      node("sink-b", "Speaker B", "Audio/Sink") +
+                      node("microphone", "Microphone", "Audio/Source/Virtual") + "]\n");
+        startServer();
+        startManager();
+    }
+
+    void startServer() {
+        server_ = std::make_unique<Program>(std::vector<std::string>{"pipewire"}, log("pipewire"));
+        if (!eventually([] { return tamblo::test::run("timeout 5 pw-cli info 0").status == 0; })) {
+            throw std::runtime_error("PipeWire does not start: " + contentOf(log("pipewire")));
+        }
+    }
+    void killServer() { server_->end(SIGKILL); }
+    void startManager() {
+        manager_ = std::make_unique<Program>(std::vector<std::string>{"wireplumber"}, log("wireplumber"));
+        if (!eventually([this] { return contains("timeout 5 pw-metadata", "sink-"); })) {
+            throw std::runtime_error("WirePlumber names no default sink: " + contentOf(log("wireplumber")));
+        }
+    }
+    void killManager() { manager_->end(SIGKILL); }
+
+    /// Silence of this length, in a file with a title for a name.
+    [[nodiscard]] std::string song(std::chrono::milliseconds length) {
+        const auto frames = static_cast<std::uint32_t>(48 * length.count());
+        const std::uint32_t bytes = frames * 4;
+        std::string file = "RIFF....WAVEfmt ....................data....";
+        const auto put = [&file](std::size_t at, std::uint32_t number, std::size_t size) {
+            for (std::size_t i = 0; i < size; ++i) {
+                file[at + i] = static_cast<char>(number >> (8 * i));
+            }
+        };
+        put(4, 36 + bytes, 4);
+        put(16, 16, 4);
+        put(20, 1, 2);
+        put(22, 2, 2);
+        put(24, 48000, 4);
+        put(28, 48000 * 4, 4);
+        put(32, 4, 2);
+        put(34, 16, 2);
+        put(40, bytes, 4);
+        file.append(bytes, '\0');
+        const std::string path = directory_.path("A secret song " + std::to_string(length.count()) + ".wav");
+        writeFile(path, file);
+        return path;
+    }
+
+    /// A node's number by its name, or a property of it.
+    [[nodiscard]] std::string nodeNamed(const std::string& name, const std::string& property = "id") const {
+        const std::string listed =
+            tamblo::test::run(
+                "timeout 5 pw-cli ls Node | awk -v name='node.name = \"" + name + "\"' '" +
+                "/^\\tid /{id=$2; sub(\",\",\"\",id)} /object.serial/{serial=$3; gsub(\"\\\"\",\"\",serial)} "
+                "index($0,name){print " +
+                (property == "id" ? "id" : "serial") + "}'")
+                .output;
+        return listed.substr(0, listed.find('\n'));
+    }
+    void setVolume(const std::string& node, const std::string& volume) const {
+        (void)tamblo::test::run("timeout 5 wpctl set-volume " + nodeNamed(node) + " " + volume);
+    }
+    void move(const std::string& streamID, const std::string& sinkSerial) const {
+        (void)tamblo::test::run("timeout 5 pw-metadata " + streamID + " target.object " + sinkSerial);
+    }
+
+    [[nodiscard]] std::string log(const std::string& program) const {
+        return directory_.path(program + ".log");
+    }
+
+    [[nodiscard]] static bool contains(const std::string& command, std::string_view text) {
+        return tamblo::test::run(command).output.find(text) != std::string::npos;
+    }
+
+private:
+    const TemporaryDirectory directory_;
+    std::unique_ptr<Program> bus_;
+    std::unique_ptr<Program> server_;
+    std::unique_ptr<Program> manager_;
+};
+
+} // namespace tamblo::pipewire::test

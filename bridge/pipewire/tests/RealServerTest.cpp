@@ -1,0 +1,196 @@
+#include "bridge/pipewire/tests/PrivateSound.h"
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+namespace tamblo::pipewire {
+namespace {
+
+using namespace std::chrono_literals;
+using test::PrivateSound;
+using test::Program;
+using test::ServiceProcess;
+using testing::HasSubstr;
+using testing::Not;
+
+/// A private sound server, a real service, and the program between them.
+class PipeWireServer : public testing::Test {
+protected:
+    void SetUp() override {
+        for (const char* const program :
+             {"pipewire", "wireplumber", "dbus-daemon", "pw-play", "pw-cli", "wpctl"}) {
+            if (!test::isInstalled(program)) {
+                GTEST_SKIP() << program << " is not installed";
+            }
+        }
+        sound_ = std::make_unique<PrivateSound>();
+        service_ = std::make_unique<ServiceProcess>();
+        ::setenv("RUNTIME_DIRECTORY", service_->runtimeDirectory().c_str(), 1);
+        ::setenv("CONFIGURATION_DIRECTORY", service_->preferenceFile("x").parent_path().parent_path().c_str(),
+                 1);
+        startBridge();
+    }
+
+    void startBridge() {
+        bridge_ = std::make_unique<Program>(std::vector<std::string>{PROGRAMS_DIR "/tamblo-pipewire"},
+                                            sound_->log("bridge"));
+        ASSERT_TRUE(test::eventually([this] {
+            const std::string said = test::contentOf(sound_->log("bridge"));
+            return said.find("reports to") != std::string::npos && said.find("watches") != std::string::npos;
+        }));
+    }
+
+    /// The payloads of an event that sessions of this application had.
+    [[nodiscard]] std::vector<Dictionary> events(const std::string& name,
+                                                 const std::string& application = "pw-cat") const {
+        std::vector<Dictionary> payloads;
+        for (const std::string& line : test::linesOf(service_->logs() / "analytics-events.jsonl")) {
+            const auto parsed = readJson(line);
+            const Dictionary& event = std::get<Value>(parsed).dictionaryValue();
+            const Dictionary& payload = event.find("payload")->dictionaryValue();
+            const Value* const owner = payload.find("HostApplicationDisplayID");
+            if (event.find("event")->stringValue() == "com.vandra.tamblo." + name && owner != nullptr &&
+                owner->stringValue() == application) {
+                payloads.push_back(payload);
+            }
+        }
+        return payloads;
+    }
+    [[nodiscard]] bool awaitEvents(const std::string& name, std::size_t count,
+                                   const std::string& application = "pw-cat") const {
+        return test::eventually([&] { return events(name, application).size() >= count; });
+    }
+    [[nodiscard]] static double number(const Dictionary& payload, std::string_view key) {
+        const Value* const value = payload.find(key);
+        return value == nullptr ? -1 : value->doubleValue();
+    }
+    [[nodiscard]] static std::string text(const Dictionary& payload, std::string_view key) {
+        const Value* const value = payload.find(key);
+        return value == nullptr ? "" : std::string(value->stringValue());
+    }
+
+    std::unique_ptr<PrivateSound> sound_;
+    std::unique_ptr<ServiceProcess> service_;
+    std::unique_ptr<Program> bridge_;
+};
+
+TEST_F(PipeWireServer, reportsStretchesWithTheirLengthsVolumesAndDevices) {
+    sound_->setVolume("sink-a", "0.5");
+    Program player({"pw-play", "--target", "sink-a", sound_->song(6s)});
+    ASSERT_TRUE(awaitEvents("Session_Playback.Start", 1));
+    const auto begin = std::chrono::steady_clock::now();
+    std::this_thread::sleep_for(1500ms);
+    sound_->setVolume("sink-a", "0.25");
+    ASSERT_TRUE(awaitEvents("Volume.Generic", 1));
+    const auto quieter = std::chrono::steady_clock::now();
+    std::this_thread::sleep_for(1s);
+    sound_->move(sound_->nodeNamed("pw-play"), sound_->nodeNamed("sink-b", "serial"));
+    ASSERT_TRUE(awaitEvents("Routing_RouteChange.Generic", 1));
+    const auto moved = std::chrono::steady_clock::now();
+    std::this_thread::sleep_for(1s);
+    player.end(SIGKILL);
+    const auto end = std::chrono::steady_clock::now();
+
+    ASSERT_TRUE(awaitEvents("Volume.Summary", 3));
+    const auto stretches = events("Volume.Summary");
+    ASSERT_EQ(stretches.size(), 3U);
+    const auto seconds = [](auto length) { return std::chrono::duration<double>(length).count(); };
+    EXPECT_NEAR(number(stretches[0], "play_seconds"), seconds(quieter - begin), 0.2);
+    EXPECT_NEAR(number(stretches[1], "play_seconds"), seconds(moved - quieter), 0.2);
+    EXPECT_NEAR(number(stretches[2], "play_seconds"), seconds(end - moved), 0.2);
+    EXPECT_NEAR(number(stretches[0], "QVSessionVolume"), 0.5, 1e-3);
+    EXPECT_NEAR(number(stretches[1], "QVSessionVolume"), 0.25, 1e-3);
+    EXPECT_NEAR(number(stretches[2], "QVSessionVolume"), 1, 1e-3);
+    EXPECT_EQ(text(stretches[1], "active_devices"), "Speaker A");
+    EXPECT_EQ(text(stretches[2], "active_devices"), "Speaker B");
+    EXPECT_EQ(text(stretches[2], "session_selected_format"), "LPCM 48000 Hz stereo");
+
+    const auto whole = events("Session_Generic.Summary");
+    ASSERT_EQ(whole.size(), 1U);
+    EXPECT_EQ(text(whole[0], "summaryServiceName"), "longformaudio");
+    EXPECT_NEAR(number(whole[0], "total_active_time"), seconds(end - begin), 0.2);
+}
+
+TEST_F(PipeWireServer, makesOneSessionOfTwoSongsAndAnotherOfARecording) {
+    for (int song = 0; song < 2; ++song) {
+        EXPECT_EQ(Program({"pw-play", sound_->song(1s)}).wait(), 0);
+        std::this_thread::sleep_for(500ms);
+    }
+    Program recorder({"pw-record", "/dev/null"});
+    ASSERT_TRUE(awaitEvents("Session_Record.Start", 1));
+    std::this_thread::sleep_for(1500ms);
+    recorder.end(SIGKILL);
+    ASSERT_TRUE(awaitEvents("Session_Generic.Summary", 2));
+    const auto stretches = events("Volume.Summary");
+    ASSERT_EQ(stretches.size(), 2U);
+    for (const Dictionary& stretch : stretches) {
+        EXPECT_NEAR(number(stretch, "play_seconds"), 1.1, 0.2) << "with the player's latency";
+        EXPECT_EQ(number(stretch, "msgcnt"), 2);
+    }
+    const auto inputs = events("Input.Summary");
+    ASSERT_EQ(inputs.size(), 1U);
+    EXPECT_NEAR(number(inputs[0], "inputrunning_seconds"), 1.5, 0.25);
+    EXPECT_EQ(text(inputs[0], "vp_config_input_port"), "Microphone");
+    // A title reached no sink.
+    EXPECT_EQ(tamblo::test::run("grep -ril secret " + service_->logs().string()).output, "");
+}
+
+TEST_F(PipeWireServer, livesThroughRestartsOfAllThree) {
+    Program player({PROGRAMS_DIR "/tamblo_pipewire_streams", "1", "60", "application.id=player"});
+    ASSERT_TRUE(awaitEvents("Session_Playback.Start", 1, "player"));
+
+    service_->stop();
+    EXPECT_EQ(events("Session_Generic.Summary", "player").size(), 1U);
+    service_->start();
+    ASSERT_TRUE(awaitEvents("Session_Playback.Start", 2, "player")) << "what runs is reported anew";
+
+    service_->signal(SIGKILL);
+    (void)service_->awaitEnd();
+    service_->start();
+    ASSERT_TRUE(awaitEvents("Session_Playback.Start", 3, "player"));
+
+    sound_->killManager();
+    sound_->startManager();
+    sound_->killServer();
+    ASSERT_TRUE(awaitEvents("Session_Generic.Summary", 2, "player")) << "the server's end is its streams'";
+    sound_->killManager();
+    sound_->startServer();
+    sound_->startManager();
+    Program again({PROGRAMS_DIR "/tamblo_pipewire_streams", "1", "60", "application.id=again"});
+    ASSERT_TRUE(awaitEvents("Session_Playback.Start", 1, "again"));
+    EXPECT_EQ(bridge_->end(), 0);
+    EXPECT_TRUE(awaitEvents("Session_Generic.Summary", 1, "again")) << "at its own end, too";
+    startBridge();
+    ASSERT_TRUE(awaitEvents("Session_Playback.Start", 2, "again"));
+    EXPECT_EQ(events("Session_Playback.Start", "player").size(), 3U) << "nothing twice";
+}
+
+TEST_F(PipeWireServer, takesWhateverStreamsSay) {
+    const std::string streams = PROGRAMS_DIR "/tamblo_pipewire_streams";
+    EXPECT_EQ(Program({streams, "1", "1", "bare"}).wait(), 0);
+    EXPECT_EQ(Program({streams, "1", "1", "long"}).wait(), 0);
+    EXPECT_EQ(Program({streams, "1", "1", "broken"}).wait(), 0);
+    EXPECT_EQ(Program({streams, "2", "1", "media.class="}).wait(), 0);
+    EXPECT_EQ(Program({streams, "1", "1", "application.id=last"}).wait(), 0);
+    EXPECT_TRUE(awaitEvents("Session_Generic.Summary", 1, "last"));
+    EXPECT_EQ(events("Session_Generic.Summary", std::string(128, 'x')).size(), 1U);
+    EXPECT_EQ(events("Session_Generic.Summary", "?? broken ?(  [31m").size(), 1U);
+}
+
+TEST_F(PipeWireServer, reportsTheEndOfEachOf500Streams) {
+    std::vector<std::unique_ptr<Program>> players;
+    for (int i = 0; i < 20; ++i) {
+        players.push_back(std::make_unique<Program>(std::vector<std::string>{
+            PROGRAMS_DIR "/tamblo_pipewire_streams", "25", "2", "application.id=many"}));
+    }
+    for (const auto& player : players) {
+        EXPECT_EQ(player->wait(), 0);
+    }
+    EXPECT_TRUE(awaitEvents("Session_Generic.Summary", 500, "many"));
+    EXPECT_EQ(events("Session_Generic.Summary", "many").size(), 500U);
+    EXPECT_EQ(events("Session_Playback.Start", "many").size(),
+              events("Session_Playback.Stop", "many").size());
+}
+
+} // namespace
+} // namespace tamblo::pipewire
