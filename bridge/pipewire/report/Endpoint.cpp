@@ -19,22 +19,30 @@ Endpoint::Endpoint(const std::string& socketPath, const Clock& clock)
     : path_(socketPath),
       fileName_(socketPath.substr(socketPath.find_last_of('/') + 1)),
       clock_(clock),
-      watcher_(directoryOf(socketPath), DirectoryWatcher::Watch::creationsAndRemovals),
-      due_(clock.now().steady) {}
+      due_(clock.now().steady) {
+    watch();
+}
+
+void Endpoint::watch() {
+    watcher_.emplace(directoryOf(path_), DirectoryWatcher::Watch::creationsAndRemovals);
+}
 
 void Endpoint::read() {
+    if (!watcher_) {
+        return;
+    }
     bool mayBeThere = false;
-    watcher_.read([&](std::optional<std::string_view> fileName) {
+    watcher_->read([&](std::optional<std::string_view> fileName) {
         mayBeThere = mayBeThere || !fileName || *fileName == fileName_;
     });
-    if (mayBeThere && !isConnected_) {
+    if (mayBeThere) {
         attempts_ = 0;
         due_ = clock_.now().steady;
     }
 }
 
 void Endpoint::connected() {
-    isConnected_ = true;
+    watcher_.reset();
     attempts_ = 0;
     due_.reset();
 }
@@ -44,7 +52,7 @@ void Endpoint::failed() {
 }
 
 void Endpoint::lost() {
-    isConnected_ = false;
+    watch();
     attempts_ = 0;
     retry();
 }

@@ -19,7 +19,7 @@ namespace tamblo::pipewire {
 class ServiceReporter final : public Reporter {
 public:
     /// Requests that may wait.
-    static constexpr std::size_t kMostWaiting = 16384;
+    static constexpr std::size_t kMostWaiting = 8192;
 
     explicit ServiceReporter(std::string socketPath);
     ~ServiceReporter() override;

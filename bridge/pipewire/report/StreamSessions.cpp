@@ -138,6 +138,10 @@ StreamSession* StreamSessions::sessionFor(ObjectID stream) {
         waiting_.erase(place);
         return &session;
     }
+    if (count() >= kMostSessions && !waiting_.empty()) {
+        waiting_.front().session.end(clock_.now());
+        waiting_.pop_front();
+    }
     if (count() >= kMostSessions) {
         ++leftOut_;
         return nullptr;

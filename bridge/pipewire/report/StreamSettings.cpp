@@ -136,6 +136,30 @@ private:
     bool isFirst_ = true;
 };
 
+/// What lies between a stream and the devices.
+class FilterSettings {
+public:
+    FilterSettings(const Graph& graph, const std::vector<ObjectID>& filters) {
+        for (const ObjectID id : filters) {
+            const Node& filter = *graph.node(id);
+            hasSpatial_ = hasSpatial_ || isSpatial(filter.name) || isSpatial(filter.description);
+            volume_ *= DeviceSettings::audible(filter.volume.value_or(Volume{}));
+            if (!filter.name.empty() && names_.size() + filter.name.size() <= kMostListBytes) {
+                names_ += (names_.empty() ? "" : ", ") + filter.name;
+            }
+        }
+    }
+
+    [[nodiscard]] const std::string& names() const noexcept { return names_; }
+    [[nodiscard]] bool hasSpatial() const noexcept { return hasSpatial_; }
+    [[nodiscard]] double volume() const noexcept { return volume_; }
+
+private:
+    std::string names_;
+    bool hasSpatial_ = false;
+    double volume_ = 1;
+};
+
 void setVolume(Dictionary& settings, const Volume& stream, double device) {
     const double linear = DeviceSettings::audible(stream) * device;
     settings.set("QVSessionVolume", rounded(perceivedVolume(linear)));
@@ -186,22 +210,13 @@ StreamSettings settingsOf(const Graph& graph, ObjectID stream) {
         const Node* const device = graph.node(id);
         devices.add(factsOf(graph, id, isInput && device->mediaClass == MediaClass::sink));
     }
-    std::string filters;
-    bool hasSpatial = false;
-    for (const ObjectID id : reached.filters) {
-        const Node* const filter = graph.node(id);
-        const std::string& name = filter->name;
-        hasSpatial = hasSpatial || isSpatial(name) || isSpatial(filter->description);
-        if (!name.empty() && filters.size() + name.size() <= kMostListBytes) {
-            filters += (filters.empty() ? "" : ", ") + name;
-        }
-    }
+    const FilterSettings filters(graph, reached.filters);
 
     Dictionary& settings = now.settings;
     settings.set("active_devices", devices.names());
     devices.setOthers(settings);
-    settings.set("filters", filters);
-    settings.set("spatializationEnabled", hasSpatial);
+    settings.set("filters", filters.names());
+    settings.set("spatializationEnabled", filters.hasSpatial());
     if (node->format) {
         setFormat(settings, *node->format);
         settings.set("is_resampled", devices.rate() != 0 && devices.rate() != node->format->rate);
@@ -209,13 +224,13 @@ StreamSettings settingsOf(const Graph& graph, ObjectID stream) {
     if (devices.rate() != 0) {
         settings.set("device_sample_rate", devices.rate());
     }
-    setVolume(settings, node->volume.value_or(Volume{}), devices.volume());
+    setVolume(settings, node->volume.value_or(Volume{}), filters.volume() * devices.volume());
     setLatency(settings, node->latency);
     if (graph.server().quantum != 0) {
         settings.set("io_buffer_size", graph.server().quantum);
     }
     if (isInput) {
-        setInput(settings, devices, filters);
+        setInput(settings, devices, filters.names());
     }
     return now;
 }

@@ -22,10 +22,6 @@ void log(const std::string& line) {
     std::fprintf(stderr, "tamblo-pipewire: %s\n", line.c_str());
 }
 
-bool isDue(const Endpoint& place, const Clock& clock) {
-    return place.due() && *place.due() <= clock.now().steady;
-}
-
 } // namespace
 
 Bridge::Bridge(const Options& options, const wire::Directories& directories)
@@ -40,8 +36,8 @@ Bridge::Bridge(const Options& options, const wire::Directories& directories)
       troubles_(graph_, reporter_, clock_, [this](ObjectID node) { return sessionOf(node); }),
       profiler_(graph_, clock_, overloads_),
       server_(loop_, graph_),
-      serverPlace_(SoundServer::socketPath(), clock_),
-      servicePlace_(directories.socketFile(), clock_),
+      serverPlace_{Endpoint(SoundServer::socketPath(), clock_)},
+      servicePlace_{Endpoint(directories.socketFile(), clock_)},
       preferences_(PreferenceFile::of(directories.preferences(), ServiceTypes::kDomain)),
       preferencesWatcher_(directories.preferences()) {
     graph_.addObserver(streams_);
@@ -75,13 +71,13 @@ int Bridge::run() {
     for (const int signal : {SIGTERM, SIGINT}) {
         watches.push_back(loop_.watchSignal(signal, [this] { loop_.stop(); }));
     }
-    watches.push_back(loop_.watch(serverPlace_.descriptor(), [this] { serverPlace_.read(); }));
     watches.push_back(loop_.watch(preferencesWatcher_.fileDescriptor(), [this] {
         preferencesWatcher_.read([](auto) {});
         readPreferences();
     }));
+    watchPlace(serverPlace_);
     if (!options_.isDry) {
-        watches.push_back(loop_.watch(servicePlace_.descriptor(), [this] { servicePlace_.read(); }));
+        watchPlace(servicePlace_);
     }
     loop_.run([this] { return beforeSleep(); });
     streams_.endAll();
@@ -104,12 +100,17 @@ void Bridge::readPreferences() {
     }
 }
 
+void Bridge::watchPlace(Place& place) {
+    place.watch = loop_.watch(place.endpoint.descriptor(), [&place] { place.endpoint.read(); });
+}
+
 void Bridge::reachService() {
     if (!service_.connect()) {
-        servicePlace_.failed();
+        servicePlace_.endpoint.failed();
         return;
     }
-    servicePlace_.connected();
+    servicePlace_.watch.reset();
+    servicePlace_.endpoint.connected();
     log("reports to " + service_.socketPath());
     // What the service says is taken in before the next sleep.
     serviceWatch_ = loop_.watch(service_.descriptor(), [] {});
@@ -117,27 +118,29 @@ void Bridge::reachService() {
 
 void Bridge::reachServer() {
     if (!server_.connect()) {
-        serverPlace_.failed();
+        serverPlace_.endpoint.failed();
         return;
     }
-    serverPlace_.connected();
+    serverPlace_.watch.reset();
+    serverPlace_.endpoint.connected();
     log("watches " + SoundServer::socketPath());
 }
 
 void Bridge::leaveServer() {
     log("the sound server has gone");
     server_.disconnect();
-    serverPlace_.lost();
+    serverPlace_.endpoint.lost();
+    watchPlace(serverPlace_);
 }
 
 std::optional<SteadyTime> Bridge::beforeSleep() {
     if (server_.hasGone()) {
         leaveServer();
     }
-    if (isDue(serverPlace_, clock_)) {
+    if (serverPlace_.isDue(clock_)) {
         reachServer();
     }
-    if (!options_.isDry && isDue(servicePlace_, clock_)) {
+    if (!options_.isDry && servicePlace_.isDue(clock_)) {
         reachService();
     }
     if (options_.once) {
@@ -146,13 +149,14 @@ std::optional<SteadyTime> Bridge::beforeSleep() {
     if (service_.isReachable() && !service_.pump()) {
         log("the service has gone");
         serviceWatch_.reset();
-        servicePlace_.lost();
+        servicePlace_.endpoint.lost();
+        watchPlace(servicePlace_);
     }
     if (serviceWatch_) {
         serviceWatch_->watchWriting(service_.wantsWriting());
     }
-    std::optional<SteadyTime> due = serverPlace_.due();
-    const std::optional<SteadyTime> other = options_.isDry ? std::nullopt : servicePlace_.due();
+    std::optional<SteadyTime> due = serverPlace_.endpoint.due();
+    const std::optional<SteadyTime> other = options_.isDry ? std::nullopt : servicePlace_.endpoint.due();
     return due && other ? std::min(*due, *other) : due ? due : other;
 }
 
@@ -162,11 +166,11 @@ void Bridge::takeSnapshot() {
         streams_.settle();
         device_.settle();
         loop_.stop();
-    } else if (!server_.isConnected() && !serverPlace_.due()) {
+    } else if (!server_.isConnected() && !serverPlace_.endpoint.due()) {
         log("no sound server answers at " + SoundServer::socketPath());
         status_ = EXIT_FAILURE;
         loop_.stop();
-    } else if (!reporter_.isReachable() && !servicePlace_.due()) {
+    } else if (!reporter_.isReachable() && !servicePlace_.endpoint.due()) {
         log("the service does not answer at " + service_.socketPath());
         status_ = EXIT_FAILURE;
         loop_.stop();

@@ -36,9 +36,20 @@ public:
     [[nodiscard]] int run();
 
 private:
+    /// A place whose socket is waited for, and the loop's watch of it.
+    struct Place {
+        Endpoint endpoint;
+        std::unique_ptr<Loop::Watch> watch{};
+
+        [[nodiscard]] bool isDue(const Clock& clock) const {
+            return endpoint.due() && *endpoint.due() <= clock.now().steady;
+        }
+    };
+
     /// Of a stream its own, of any other node the device's.
     [[nodiscard]] SessionID sessionOf(ObjectID node) const;
     void readPreferences();
+    void watchPlace(Place& place);
     void reachService();
     void reachServer();
     void leaveServer();
@@ -60,8 +71,8 @@ private:
     Troubles troubles_;
     Profiler profiler_;
     SoundServer server_;
-    Endpoint serverPlace_;
-    Endpoint servicePlace_;
+    Place serverPlace_;
+    Place servicePlace_;
     std::optional<PreferenceFile> preferences_;
     DirectoryWatcher preferencesWatcher_;
     std::unique_ptr<Loop::Watch> serviceWatch_;

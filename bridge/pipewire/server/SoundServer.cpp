@@ -174,7 +174,7 @@ void SoundServer::addMetadata(ObjectID id, const spa_dict* properties) {
 }
 
 void SoundServer::keep(ObjectID id, std::unique_ptr<BoundObject> object) {
-    if (object) {
+    if (object && bound_.size() < kMostBound) {
         bound_[id] = std::move(object);
     }
 }

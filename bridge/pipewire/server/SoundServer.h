@@ -39,6 +39,8 @@ public:
 private:
     /// One for the registry, one for the objects' information, one for their parameters.
     static constexpr unsigned kRoundTrips = 3;
+    /// Objects that are listened to.
+    static constexpr std::size_t kMostBound = 8192;
 
     static void coreTold(void* data, const pw_core_info* info);
     static void coreDone(void* data, std::uint32_t id, int number);

@@ -98,6 +98,48 @@ TEST_F(PipeWireSessions, sayEverythingAtTheStartThenWhatChangesAndHowLongItWas) 
     EXPECT_FALSE(sessions_.due()) << "nothing wakes an idle program";
 }
 
+TEST_F(PipeWireSessions, sayWhatFiltersAndHeadsetsDo) {
+    world_.node(110,
+                {{"media.class", "Audio/Sink"}, {"node.name", "spatializer"}, {"node.link-group", "filter"}});
+    world_.graph.changeNode(110, [](Node& node) { node.volume = {{0.125, false}}; });
+    world_.node(111, {{"media.class", "Stream/Output/Audio"}, {"node.link-group", "filter"}});
+    world_.stream(1, {{"application.id", "org.example.player"}});
+    world_.link(1, 110);
+    world_.link(111, 101);
+    pass(1s);
+    EXPECT_EQ(lastOf("active_devices"), "Headphones");
+    EXPECT_EQ(lastOf("filters"), "spatializer");
+    EXPECT_EQ(lastOf("spatializationEnabled"), true);
+    EXPECT_EQ(lastOf("QVSessionVolume"), 0.5);
+
+    world_.node(120, {{"media.class", "Audio/Source"},
+                      {"node.description", "Headset"},
+                      {"api.bluez5.profile", "headset-head-unit"},
+                      {"api.bluez5.codec", "msbc"}});
+    world_.node(
+        121,
+        {{"media.class", "Audio/Source"}, {"node.name", "echo-cancel-source"}, {"node.link-group", "ec"}});
+    world_.node(122, {{"media.class", "Stream/Input/Audio"}, {"node.link-group", "ec"}});
+    world_.node(
+        2, {{"media.class", "Stream/Input/Audio"}, {"application.id", "phone"}, {"media.role", "phone"}});
+    world_.link(121, 2);
+    world_.link(120, 122);
+    pass(1s);
+    EXPECT_EQ(last().category, "Session_Record");
+    EXPECT_EQ(lastOf("session_input_running"), true);
+    EXPECT_EQ(lastOf("vp_config_operation_mode"), "echo-cancel-source");
+    EXPECT_EQ(lastOf("vp_config_input_port"), "Headset");
+    EXPECT_EQ(lastOf("vp_config_primary_vocoder"), "mSBC");
+    EXPECT_EQ(lastOf("vp_config_primary_vocoderFs"), "16000");
+    EXPECT_EQ(lastOf("bluetooth_profile"), "headset-head-unit");
+    EXPECT_EQ(reports_.sessions[1].serviceType, ServiceType::telephony);
+    world_.graph.remove(2);
+    EXPECT_EQ(reports_.messages[reports_.messages.size() - 2]
+                  .payload.find("vp_config_primary_vocoder")
+                  ->stringValue(),
+              "none");
+}
+
 TEST_F(PipeWireSessions, goOnWithTheApplicationsNextStreamOfTheSameKind) {
     play(1);
     pass(3s);
