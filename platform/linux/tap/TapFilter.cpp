@@ -121,8 +121,10 @@ std::variant<TapFilter, std::string> TapFilter::parse(std::string_view json) {
                              jsonText(Value(members.keyAt(i))));
         }
     }
-    if (filter.isRecording && filter.reporters.empty()) {
-        return std::string("tap: a recording needs a filter with a reporter");
+    // A recording gets the time that it needs, which must not be much.
+    const std::size_t others = members.size() - (filter.limit != 0 ? 1 : 0) - 2;
+    if (filter.isRecording && (filter.reporters.size() != 1 || others != 0)) {
+        return std::string("tap: a recording needs one reporter, and takes nothing else but a limit");
     }
     return filter;
 }
