@@ -1,5 +1,6 @@
 #include "platform/Limits.h"
 
+#include "platform/PreferenceDomains.h"
 #include "platform/Preferences.h"
 
 namespace tamblo {

@@ -9,9 +9,6 @@ namespace tamblo {
 
 class Preferences;
 
-/// The preferences domain in which a device's maker changes limits: numbers by name.
-inline constexpr std::string_view kLimitsDomain = "com.vandra.tamblo.limits";
-
 /// What the service grants its clients; read once, when the service starts.
 ///
 /// The defaults lie far above honest use, and together keep the service below 256 MiB whatever the clients

@@ -24,7 +24,7 @@ constexpr Option kOptions[] = {
      .help = "only sessions that ended after: 2026-03-01, 2026-03-01T12:00:00Z, or 90m, 36h, 7d ago"},
     {.name = "--session",
      .value = "ID",
-     .help = "only this session: a reporter's number, or the name in the call-quality file"},
+     .help = "only the sessions of this reporter, or the one of this name in the call-quality file"},
     {.name = "--app", .value = "NAME", .help = "only this application; a trailing * stands for anything"},
     {.name = "--output",
      .value = "FILE",

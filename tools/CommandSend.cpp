@@ -3,6 +3,7 @@
 #include "base/NamePattern.h"
 #include "base/NumberText.h"
 #include "os/PreferenceFile.h"
+#include "platform/PreferenceDomains.h"
 #include "tools/AccessFault.h"
 #include "tools/Command.h"
 #include "tools/Payload.h"
@@ -151,8 +152,7 @@ private:
 
 /// Whether one of the names is that of an event in use, as far as the preference can be read.
 bool isAnyInUse(std::span<const std::string> names) {
-    const auto file =
-        PreferenceFile::of(wire::Directories::ofThisProcess().preferences(), "com.vandra.tamblo.analytics");
+    const auto file = PreferenceFile::of(wire::Directories::ofThisProcess().preferences(), kAnalyticsDomain);
     const auto content = file ? file->read() : std::variant<Dictionary, std::string>();
     const auto* const values = std::get_if<Dictionary>(&content);
     const Value* const inUse = values == nullptr ? nullptr : values->find("events_in_use");

@@ -24,7 +24,8 @@ using Align = Table::Align;
 
 constexpr Option kOptions[] = {
     {"--sessions", "", "show sessions, not clients; the key s changes between them"},
-    {"--sort", "KEY", "by messages, bytes, processor time or retained memory; the keys m, b, t, r change it"},
+    {"--sort", "messages|bytes|time|retained",
+     "by processor time, say, or retained memory; the keys m, b, t, r change it"},
     {"--interval", "SECONDS", "between two pictures (2)"},
     {"--count", "N", "end after so many pictures"},
     kStatusSocketOption,

@@ -2,6 +2,7 @@
 
 #include "base/Format.h"
 #include "platform/Limits.h"
+#include "platform/PreferenceDomains.h"
 
 #include <algorithm>
 #include <array>
@@ -11,14 +12,6 @@
 namespace tamblo::tools {
 
 namespace {
-
-constexpr std::string_view kAnalytics = "com.vandra.tamblo.analytics";
-constexpr std::string_view kCallQuality = "com.vandra.tamblo.callquality";
-constexpr std::string_view kSinks = "com.vandra.tamblo.sinks";
-constexpr std::string_view kCaptures = "com.vandra.tamblo.zrreporting";
-constexpr std::string_view kAccessories = "com.vandra.tamblo.accessories";
-constexpr std::string_view kReporting = "com.vandra.tamblo";
-constexpr std::string_view kDashlo = "com.vandra.dashlo";
 
 using enum PreferenceKind;
 
@@ -37,24 +30,26 @@ std::string defaultText(const LimitRow& row) {
 
 std::vector<KnownPreference> makePreferences() {
     std::vector<KnownPreference> all{
-        {kAnalytics, "events_in_use", names,
+        {kAnalyticsDomain, "events_in_use", names,
          "which events are recorded, exact or with one trailing *; absent: all"},
-        {kCallQuality, "backends", names, "the back ends of call quality; absent: [\"spool\"]; empty: none"},
-        {kSinks, "file_mode", octalText, "permissions of the sinks' files besides the owner's"},
-        {kSinks, "directory_mode", octalText, "the same of their directories"},
-        {kReporting, "device_name", any, "reported as the device's name"},
-        {kReporting, "disable_reporting", flag, "read, and nothing acts on it"},
-        {kDashlo, "spatial-audio-accessory-feature", any, "reported as stored"},
-        {kCaptures, "TalvixInvalidXyBackOffSeconds", number,
+        {kCallQualityDomain, "backends", names,
+         "the back ends of call quality; absent: [\"spool\"]; empty: none"},
+        {kSinksDomain, "file_mode", octalText, "permissions of the sinks' files besides the owner's"},
+        {kSinksDomain, "directory_mode", octalText, "the same of their directories"},
+        {kReportingDomain, "device_name", any, "reported as the device's name"},
+        {kReportingDomain, "disable_reporting", flag, "read, and nothing acts on it"},
+        {ZRReportingMessageKeySpatialAudioAccessoryFeatureDomain, "spatial-audio-accessory-feature", any,
+         "reported as stored"},
+        {kCapturesDomain, "TalvixInvalidXyBackOffSeconds", number,
          "internal builds: seconds between drafts; absent: no drafts"},
-        {kCaptures, "TalvixInvalidXyQLTlastRun", number,
+        {kCapturesDomain, "TalvixInvalidXyQLTlastRun", number,
          "the time of the last draft, which the service stores"},
-        {kCaptures, "enable_stackburst", flag, "internal builds: stack captures are wanted"},
-        {kCaptures, "io_buffer_size", number,
+        {kCapturesDomain, "enable_stackburst", flag, "internal builds: stack captures are wanted"},
+        {kCapturesDomain, "io_buffer_size", number,
          "frames: the least smallest_buffer_frame_size of an overload (512)"},
-        {kCaptures, "io_cycle", number, "the least io_cycle of an overload (0)"},
-        {kCaptures, "wait_time", number, "microseconds from the message to the capture (0)"},
-        {kAccessories, "registered", object, "the accessories known, which the service stores"},
+        {kCapturesDomain, "io_cycle", number, "the least io_cycle of an overload (0)"},
+        {kCapturesDomain, "wait_time", number, "microseconds from the message to the capture (0)"},
+        {kAccessoriesDomain, "registered", object, "the accessories known, which the service stores"},
     };
     for (const LimitRow& row : kLimitRows) {
         all.push_back({kLimitsDomain, row.name, limit, formatted("{} ({})", row.what, defaultText(row))});
@@ -94,7 +89,7 @@ const KnownPreference* findKnownPreference(std::string_view domain, std::string_
 }
 
 bool isServiceDomain(std::string_view domain) noexcept {
-    return domain == kReporting || domain.starts_with("com.vandra.tamblo.");
+    return domain == kReportingDomain || domain.starts_with("com.vandra.tamblo.");
 }
 
 bool isOfKind(PreferenceKind kind, const Value& value) {

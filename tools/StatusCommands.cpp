@@ -82,7 +82,7 @@ constexpr Command kCommandStatus{
     "Limits are those that are in use, have been reached, or are not the default; --json has all of them, "
     "and "
     "all\n"
-    "counters. docs/status.md says what each means, and what to do about it.",
+    "counters. docs/status.md, which is tamblo-status(7), says what each means.",
     kOptions,
     status,
 };

@@ -4,7 +4,6 @@
 #include "tools/report/Session.h"
 
 #include <algorithm>
-#include <cmath>
 #include <cstdint>
 #include <iterator>
 #include <map>
@@ -26,7 +25,7 @@ public:
         }
         for (auto& [application, runs] : runs_) {
             std::ranges::sort(runs, {}, &Run::began);
-            double latest = -INFINITY;
+            double latest = 0; // no time of a line is less
             for (Run& run : runs) {
                 latest = std::max(latest, run.latestEnd);
                 run.latestEnd = latest;

@@ -137,7 +137,8 @@ void writePage(PageWriter& out, const PageData& data) {
         } else if (name == "script") {
             for (const std::string_view part :
                  {page_parts::data_js, page_parts::details_js, page_parts::timeline_js,
-                  page_parts::timeline_input_js, page_parts::figures_js, page_parts::page_js}) {
+                  page_parts::timeline_input_js, page_parts::timeline_rows_js, page_parts::figures_js,
+                  page_parts::page_js}) {
                 out.text(part);
             }
         } else {

@@ -17,8 +17,8 @@ struct SessionFilter {
     [[nodiscard]] bool wantsApplication(std::string_view name) const;
     /// Whether a session can still turn out to be wanted, whenever it ends and if only its application is not
     /// known yet.
-    [[nodiscard]] bool mayWant(const Session& session) const;
-    [[nodiscard]] bool wants(const Session& session) const;
+    [[nodiscard]] bool mayWant(const Session& candidate) const;
+    [[nodiscard]] bool wants(const Session& candidate) const;
 };
 
 } // namespace tamblo::report

@@ -2,6 +2,7 @@
 
 #include "base/Dictionary.h"
 #include "platform/Counters.h"
+#include "platform/PreferenceDomains.h"
 #include "util/Log.h"
 #include "workers/accessories/AccessoryRegistry.h"
 
@@ -19,7 +20,6 @@ namespace {
 
 using Worker = ZRReportingSessionAudioRegistrationWorker;
 
-constexpr std::string_view kDomain = "com.vandra.tamblo.accessories";
 constexpr std::string_view kKey = "registered";
 /// Accessories come and go in minutes, and their records are files to be read.
 constexpr std::chrono::minutes kLookupInterval{1};
@@ -40,13 +40,13 @@ void send(Context& context, std::vector<Dictionary> reports) {
 
 void lookUp(Context& context) {
     const Platform& device = context.platform();
-    PreferencesSuite store(*device.preferences, std::string(kDomain));
+    PreferencesSuite store(*device.preferences, std::string(kAccessoriesDomain));
     const std::optional<Value> kept = store.value(kKey);
     const std::vector<Accessory> seen = device.accessories->connectedEarbuds();
     AccessoryRegistry::Update update = AccessoryRegistry::update(kept, seen, device.clock->now());
     if (update.hadRubbish) {
         log::error(ZRReportingAudioRegistrationCategory(),
-                   "{}: {} holds what is no accessory; that is ignored", kDomain, kKey);
+                   "{}: {} holds what is no accessory; that is ignored", kAccessoriesDomain, kKey);
     }
     log::debug(ZRReportingAudioRegistrationCategory(), "looked up accessories. seen={} reported={}",
                seen.size(), update.reports.size());

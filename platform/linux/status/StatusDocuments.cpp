@@ -5,6 +5,7 @@
 #include "base/Mutex.h"
 #include "base/SplitText.h"
 #include "os/SmallFile.h"
+#include "platform/PreferenceDomains.h"
 #include "platform/linux/status/MetricsText.h"
 #include "platform/linux/status/RowDocuments.h"
 
@@ -22,8 +23,6 @@ namespace tamblo {
 namespace {
 
 constexpr std::chrono::milliseconds kPatienceWithService{1000};
-constexpr std::string_view kSinksDomain = "com.vandra.tamblo.sinks";
-constexpr std::string_view kCapturesDomain = "com.vandra.tamblo.zrreporting";
 
 struct Setting {
     std::string name;
@@ -218,8 +217,8 @@ void StatusDocuments::appendSettings(JsonObject& document) const {
         settings.push_back({std::string(key), value ? jsonText(*value) : std::move(whenAbsent),
                             value ? parts_.preferences.path(domain) : "default"});
     };
-    add("com.vandra.tamblo.analytics", "events_in_use", R"(["*"])");
-    add("com.vandra.tamblo.callquality", "backends", R"(["spool"])");
+    add(kAnalyticsDomain, "events_in_use", R"(["*"])");
+    add(kCallQualityDomain, "backends", R"(["spool"])");
     // These are read at the start: what has been changed since is not in force.
     const auto addOfStart = [&](std::string_view domain, std::string_view key, std::string value,
                                 const std::string& whenAbsent) {

@@ -90,6 +90,10 @@ bool take(TapFilter& filter, std::string_view name, const Value& value) {
     if (name == "keys") {
         return takeValues(value, filter.values);
     }
+    if (name == "recording") {
+        filter.isRecording = value.kind() == Value::Kind::boolean && value.boolValue();
+        return filter.isRecording;
+    }
     return (name == "limit" && takeCount(value, filter.limit)) ||
            (name == "sample" && takeCount(value, filter.sample));
 }
@@ -116,6 +120,9 @@ std::variant<TapFilter, std::string> TapFilter::parse(std::string_view json) {
             return formatted("tap: {} is no member of a filter, or of another kind",
                              jsonText(Value(members.keyAt(i))));
         }
+    }
+    if (filter.isRecording && filter.reporters.empty()) {
+        return std::string("tap: a recording needs a filter with a reporter");
     }
     return filter;
 }

@@ -24,6 +24,7 @@ struct TapFilter {
     std::vector<std::pair<std::string, std::vector<Value>>> values;
     std::uint64_t limit = 0;  ///< so many messages, then the tap ends; 0: no limit
     std::uint64_t sample = 1; ///< the first of each so many that match
+    bool isRecording = false; ///< the tap is to miss nothing, see `Taps`; needs reporters
 
     /// From a JSON object; an empty text is one without members. A text says what is wrong with it.
     [[nodiscard]] static std::variant<TapFilter, std::string> parse(std::string_view json);

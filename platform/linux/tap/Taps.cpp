@@ -4,12 +4,14 @@
 #include "base/Json.h"
 #include "os/StreamSocket.h"
 #include "platform/Counters.h"
+#include "platform/linux/tap/LineQueue.h"
 #include "platform/linux/tap/TapFilter.h"
 #include "wire/EventNames.h"
 
 #include <algorithm>
 #include <cerrno>
 #include <cstdint>
+#include <limits>
 #include <new>
 #include <string>
 #include <utility>
@@ -24,7 +26,7 @@ namespace {
 
 /// What one wake-up sends to a reader at most.
 constexpr std::size_t kBytesOfTurn = 64U << 10U;
-/// What an idle tap's buffer may keep.
+/// What is kept of the room for a line.
 constexpr std::size_t kKeptCapacity = 16U << 10U;
 /// How late a reader hears of what was left out for want of time, when nothing else comes.
 constexpr std::chrono::milliseconds kLatestTold{200};
@@ -41,7 +43,7 @@ std::string_view nameOf(TappedMessage::Origin origin) noexcept {
     return "session";
 }
 
-void appendLine(TextBuffer& line, const TappedMessage& message) {
+void appendLine(TextBuffer& line, const TappedMessage& message, std::size_t largestPayload) {
     line.append("{\"time\":");
     appendJsonNumber(line, secondsSince1970(message.time));
     line.append(",\"reporter\":");
@@ -58,7 +60,7 @@ void appendLine(TextBuffer& line, const TappedMessage& message) {
     line.append(",\"type\":");
     appendJson(line, Value(message.type));
     const std::size_t bytes = message.payload.bytesOfValues(Dictionary::Shared::inFull);
-    if (bytes <= Taps::kLargestPayload) {
+    if (bytes <= largestPayload) {
         line.append(",\"payload\":");
         appendJson(line, Value(message.payload));
     } else {
@@ -92,13 +94,14 @@ public:
           user_(peerUser(socket_.get())),
           filter_(std::move(filter)) {}
 
+    [[nodiscard]] bool isRecording() const noexcept { return filter_.isRecording; }
     [[nodiscard]] uid_t user() const noexcept { return user_; }
     [[nodiscard]] bool isEnding() const noexcept { return isEnding_; }
     /// Has the loop hear that the connection is over, and remove the tap. With the lock of all taps.
     void end() TAMBLO_EXCLUDES(mutex_);
     [[nodiscard]] bool watch() { return taps_.loop_.add(socket_.get(), 0, *this); }
     [[nodiscard]] FileDescriptor takeSocket() noexcept { return std::move(socket_); }
-    /// On the server queue. `line` is the message's, once some tap has made it.
+    /// On the server queue. `line` is the message's, once some tap of this kind has made it.
     void offer(const TappedMessage& message, TextBuffer& line) TAMBLO_EXCLUDES(mutex_);
     /// Messages that nobody has looked at; they do not count towards the limit.
     void leaveOut(std::uint64_t messages) TAMBLO_EXCLUDES(mutex_) {
@@ -109,12 +112,18 @@ public:
     void ready(std::uint32_t events) override TAMBLO_EXCLUDES(mutex_);
     void sendRest() TAMBLO_EXCLUDES(mutex_) {
         const MutexLock lock(mutex_);
-        (void)sendSome(kMostWaiting);
+        for (std::size_t before = 0; before != out_.size() && !out_.empty();) {
+            before = out_.size();
+            (void)sendSome(before);
+        }
     }
 
 private:
     [[nodiscard]] bool isAtLimit() const noexcept TAMBLO_REQUIRES(mutex_) {
         return filter_.limit != 0 && shown_ == filter_.limit;
+    }
+    [[nodiscard]] std::size_t mostWaiting() const noexcept {
+        return isRecording() ? kMostWaitingOfRecording : kMostWaiting;
     }
     void append(std::string_view line) TAMBLO_REQUIRES(mutex_);
     /// Until the reader takes something.
@@ -132,8 +141,7 @@ private:
     bool isEnding_ = false;     ///< under the lock of all taps
 
     Mutex mutex_;
-    TextBuffer out_ TAMBLO_GUARDED_BY(mutex_);
-    std::size_t sent_ TAMBLO_GUARDED_BY(mutex_) = 0; ///< of `out_`
+    LineQueue out_ TAMBLO_GUARDED_BY(mutex_);
     std::uint64_t shown_ TAMBLO_GUARDED_BY(mutex_) = 0;
     std::uint64_t leftOut_ TAMBLO_GUARDED_BY(mutex_) = 0;
     bool isWriting_ TAMBLO_GUARDED_BY(mutex_) = false; ///< the loop waits until the reader takes more
@@ -157,9 +165,10 @@ void Taps::Tap::offer(const TappedMessage& message, TextBuffer& line) {
     }
     try {
         if (line.empty()) {
-            appendLine(line, message);
+            appendLine(line, message,
+                       isRecording() ? std::numeric_limits<std::size_t>::max() : kLargestPayload);
         }
-        if (out_.size() - sent_ + line.size() <= kMostWaiting) {
+        if (out_.size() + line.size() <= mostWaiting()) {
             append(line.view());
             return;
         }
@@ -174,16 +183,13 @@ void Taps::Tap::offer(const TappedMessage& message, TextBuffer& line) {
 void Taps::Tap::end() {
     const MutexLock lock(mutex_);
     isEnding_ = true;
-    if (sendSome(kMostWaiting) && sent_ == out_.size()) {
+    if (sendSome(kMostWaiting) && out_.empty()) {
         sendWhatFits(socket_.get(), "{\"error\":\"tap: another user needs the place\"}\n");
     }
     ::shutdown(socket_.get(), SHUT_RDWR);
 }
 
 void Taps::Tap::append(std::string_view line) {
-    if (sent_ != 0 && out_.size() + line.size() > kMostWaiting) {
-        out_.dropFront(std::exchange(sent_, 0));
-    }
     out_.append(line);
     wait();
 }
@@ -212,25 +218,23 @@ void Taps::Tap::ready(std::uint32_t events) {
 }
 
 bool Taps::Tap::sendSome(std::size_t most) {
-    const std::string_view rest = out_.view().substr(sent_, most);
+    const std::string_view rest = out_.front(most);
     const ssize_t count = ::send(socket_.get(), rest.data(), rest.size(), MSG_DONTWAIT | MSG_NOSIGNAL);
     if (count < 0) {
         return errno == EAGAIN || errno == EWOULDBLOCK || errno == EINTR;
     }
-    sent_ += static_cast<std::size_t>(count);
+    out_.drop(static_cast<std::size_t>(count));
     return true;
 }
 
 /// What follows when some was sent; whether the reader is to be shown more.
 bool Taps::Tap::goOn() {
-    if (out_.size() - sent_ <= kMostWaiting / 2) {
+    if (out_.size() <= mostWaiting() / 2) {
         tellWhatIsLeftOut();
     }
-    if (sent_ < out_.size()) {
+    if (!out_.empty()) {
         return true;
     }
-    out_.clearAndKeep(kKeptCapacity);
-    sent_ = 0;
     isWriting_ = false;
     taps_.loop_.modify(socket_.get(), 0, *this);
     return !isAtLimit();
@@ -251,9 +255,12 @@ void Taps::add(FileDescriptor reader, std::string_view filter) {
     }
     auto tap = std::make_shared<Tap>(*this, std::move(reader), std::get<TapFilter>(std::move(parsed)));
     const MutexLock lock(mutex_);
-    if (!makeRoomFor(tap->user()) || !tap->watch()) {
+    const bool isSecond = tap->isRecording() &&
+                          std::ranges::any_of(taps_, [](const auto& open) { return open->isRecording(); });
+    if (isSecond || !makeRoomFor(tap->user()) || !tap->watch()) {
         counters::add(counters::Counter::tapsTurnedAway);
-        refuse(tap->takeSocket(), formatted("tap: there are {} taps at most", kMostTaps));
+        refuse(tap->takeSocket(), isSecond ? "tap: there is a recording, and one at a time is made"
+                                           : formatted("tap: there are {} taps at most", kMostTaps));
         return;
     }
     counters::add(counters::Counter::taps);
@@ -285,42 +292,21 @@ bool Taps::makeRoomFor(uid_t user) {
 
 void Taps::offer(const TappedMessage& message) {
     line_.clearAndKeep(kKeptCapacity);
-    const auto began = now_();
+    whole_.clearAndKeep(kKeptCapacity);
     const MutexLock lock(mutex_);
+    offerTo(true, message, whole_);
+    const auto began = now_();
     if (!hasTime(began)) {
         return;
     }
-    for (const std::shared_ptr<Tap>& tap : taps_) {
-        tap->offer(message, line_);
-    }
+    offerTo(false, message, line_);
     credit_ -= now_() - began;
 }
 
-bool Taps::hasTime(std::chrono::steady_clock::time_point now) {
-    credit_ = std::min<std::chrono::nanoseconds>(kMostCredit,
-                                                 credit_ + (now - std::exchange(creditOf_, now)) / kShare);
-    if (isOutOfTime_ ? credit_ >= kMostCredit / 4 : credit_.count() > 0) {
-        isOutOfTime_ = false;
-        tellWhatIsLeftOut();
-        return true;
-    }
-    isOutOfTime_ = true;
-    counters::add(counters::Counter::tapMessages, taps_.size());
-    if (leftOut_++ == 0) {
-        loop_.post([this] {
-            loop_.callAfter(kLatestTold, [this] {
-                const MutexLock lock(mutex_);
-                tellWhatIsLeftOut();
-            });
-        });
-    }
-    return false;
-}
-
-void Taps::tellWhatIsLeftOut() {
-    if (const std::uint64_t leftOut = std::exchange(leftOut_, 0)) {
-        for (const std::shared_ptr<Tap>& tap : taps_) {
-            tap->leaveOut(leftOut);
+void Taps::offerTo(bool areRecordings, const TappedMessage& message, TextBuffer& line) {
+    for (const std::shared_ptr<Tap>& tap : taps_) {
+        if (tap->isRecording() == areRecordings) {
+            tap->offer(message, line);
         }
     }
 }

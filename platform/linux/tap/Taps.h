@@ -26,11 +26,15 @@ namespace tamblo {
 /// were granted in advance: messages for which there is none are not looked at, and count as left out for
 /// all. So readers slow others down by no more than that, whatever their filters cost.
 ///
+/// A recording is to miss nothing: one tap at a time, of named reporters, has a buffer for some hundred
+/// thousand messages, is shown payloads of any size, and is outside that share of the time.
+///
 /// Where all places are taken, a reader of the user who has most of them makes room for a user who has fewer.
 class Taps final : public MessageTap {
 public:
     static constexpr std::size_t kMostTaps = 8;
     static constexpr std::size_t kMostWaiting = 1U << 20U;
+    static constexpr std::size_t kMostWaitingOfRecording = 32U << 20U;
     /// As the values lie in memory.
     static constexpr std::size_t kLargestPayload = 64U << 10U;
 
@@ -56,6 +60,8 @@ public:
 private:
     class Tap;
 
+    /// To those taps that are recordings, or to the others.
+    void offerTo(bool areRecordings, const TappedMessage& message, TextBuffer& line) TAMBLO_REQUIRES(mutex_);
     /// On the loop's thread.
     void remove(const Tap& tap) TAMBLO_EXCLUDES(mutex_);
     /// Whether there is a place for one more of the user's taps, maybe another user's.
@@ -66,7 +72,8 @@ private:
 
     EventLoop& loop_;
     const SteadyNow now_;
-    TextBuffer line_; ///< the server queue's
+    TextBuffer line_;  ///< the server queue's
+    TextBuffer whole_; ///< likewise, of a message with a payload of any size
 
     Mutex mutex_;
     std::vector<std::shared_ptr<Tap>> taps_ TAMBLO_GUARDED_BY(mutex_);
