@@ -311,6 +311,38 @@ void Taps::offerTo(bool areRecordings, const TappedMessage& message, TextBuffer&
     }
 }
 
+bool Taps::hasTime(std::chrono::steady_clock::time_point now) {
+    credit_ = std::min<std::chrono::nanoseconds>(kMostCredit,
+                                                 credit_ + (now - std::exchange(creditOf_, now)) / kShare);
+    if (isOutOfTime_ ? credit_ >= kMostCredit / 4 : credit_.count() > 0) {
+        isOutOfTime_ = false;
+        tellWhatIsLeftOut();
+        return true;
+    }
+    isOutOfTime_ = true;
+    counters::add(counters::Counter::tapMessages,
+                  static_cast<std::uint64_t>(std::ranges::count(taps_, false, &Tap::isRecording)));
+    if (leftOut_++ == 0) {
+        loop_.post([this] {
+            loop_.callAfter(kLatestTold, [this] {
+                const MutexLock lock(mutex_);
+                tellWhatIsLeftOut();
+            });
+        });
+    }
+    return false;
+}
+
+void Taps::tellWhatIsLeftOut() {
+    if (const std::uint64_t leftOut = std::exchange(leftOut_, 0)) {
+        for (const std::shared_ptr<Tap>& tap : taps_) {
+            if (!tap->isRecording()) {
+                tap->leaveOut(leftOut);
+            }
+        }
+    }
+}
+
 void Taps::remove(const Tap& tap) {
     const MutexLock lock(mutex_);
     const auto found =
