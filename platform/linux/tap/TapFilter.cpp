@@ -124,7 +124,7 @@ std::variant<TapFilter, std::string> TapFilter::parse(std::string_view json) {
     // A recording gets the time that it needs, which must not be much.
     const std::size_t others = members.size() - (filter.limit != 0 ? 1 : 0) - 2;
     if (filter.isRecording && (filter.reporters.size() != 1 || others != 0)) {
-        return std::string("tap: a recording needs one reporter, and takes nothing else but a limit");
+        return std::string("tap: the filter of a recording names one reporter, and nothing else but a limit");
     }
     return filter;
 }
