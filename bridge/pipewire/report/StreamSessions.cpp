@@ -79,7 +79,7 @@ void StreamSessions::streamRemoved(ObjectID stream) {
     }
     found->second.stopStream(now);
     if (found->second.id() != kNoSession) {
-        waiting_.push_back({std::move(found->second), now.steady + kGrace});
+        waiting_.push_back({std::move(found->second), stream, now.steady + kGrace});
     }
     live_.erase(found);
 }
@@ -177,8 +177,12 @@ void StreamSessions::endAll() {
 }
 
 SessionID StreamSessions::sessionOf(ObjectID stream) const noexcept {
-    const auto found = live_.find(stream);
-    return found == live_.end() ? kNoSession : found->second.id();
+    if (const auto found = live_.find(stream); found != live_.end()) {
+        return found->second.id();
+    }
+    const auto ended = std::find_if(waiting_.rbegin(), waiting_.rend(),
+                                    [stream](const Waiting& waiting) { return waiting.stream == stream; });
+    return ended == waiting_.rend() ? kNoSession : ended->session.id();
 }
 
 } // namespace tamblo::pipewire

@@ -46,7 +46,8 @@ public:
     /// that is done without being asked for.
     void endAll();
 
-    /// A stream's session, to report of it what goes wrong; `kNoSession` while there is none.
+    /// A stream's session, to report of it what goes wrong, or has gone wrong just before its end;
+    /// `kNoSession` while there is none.
     [[nodiscard]] SessionID sessionOf(ObjectID stream) const noexcept;
     [[nodiscard]] std::size_t count() const noexcept { return live_.size() + waiting_.size(); }
     /// How often a stream was not reported, as there were too many.
@@ -56,6 +57,7 @@ private:
     /// A session between two streams.
     struct Waiting {
         StreamSession session;
+        ObjectID stream; ///< the one that has ended
         SteadyTime until;
     };
 

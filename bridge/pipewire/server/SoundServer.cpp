@@ -3,12 +3,12 @@
 #include "base/Format.h"
 #include "bridge/pipewire/graph/CleanText.h"
 #include "bridge/pipewire/graph/Properties.h"
+#include "bridge/pipewire/server/Context.h"
 #include "bridge/pipewire/server/Proxy.h"
 
+#include <array>
 #include <cerrno>
 #include <cstdlib>
-#include <initializer_list>
-#include <stdexcept>
 #include <utility>
 
 #include <pipewire/extensions/metadata.h>
@@ -18,25 +18,8 @@ namespace tamblo::pipewire {
 
 namespace {
 
-/// The context without a configuration file: those load modules that this program has no use for, one of
-/// which asks for a real-time thread. Nor has it any use for the thread that moves sound.
-pw_context* makeContext(pw_loop* loop) {
-    pw_context* const context = pw_context_new(
-        loop, pw_properties_new(PW_KEY_CONFIG_NAME, "null", PW_KEY_APP_NAME, "tamblo-pipewire", nullptr), 0);
-    if (context == nullptr) {
-        throw std::runtime_error("PipeWire's library cannot be set up");
-    }
-    if (pw_data_loop* const dataLoop = pw_context_get_data_loop(context)) {
-        pw_data_loop_stop(dataLoop);
-    }
-    for (const char* const module : {"libpipewire-module-protocol-native", "libpipewire-module-metadata"}) {
-        if (pw_context_load_module(context, module, nullptr, nullptr) == nullptr) {
-            pw_context_destroy(context);
-            throw std::runtime_error(std::string("PipeWire's library lacks ") + module);
-        }
-    }
-    return context;
-}
+constexpr std::array<const char*, 2> kModules{"libpipewire-module-protocol-native",
+                                              "libpipewire-module-metadata"};
 
 std::string_view textOf(const spa_dict* properties, const char* key) noexcept {
     const char* const text = properties == nullptr ? nullptr : spa_dict_lookup(properties, key);
@@ -62,7 +45,8 @@ const pw_registry_events SoundServer::kRegistryEvents = [] {
     return events;
 }();
 
-SoundServer::SoundServer(Loop& loop, Graph& graph) : graph_(graph), context_(makeContext(loop.get())) {}
+SoundServer::SoundServer(Loop& loop, Graph& graph)
+    : graph_(graph), context_(makeContext(loop.get(), kModules)) {}
 
 SoundServer::~SoundServer() {
     disconnect();

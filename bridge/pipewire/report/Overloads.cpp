@@ -1,0 +1,152 @@
+#include "bridge/pipewire/report/Overloads.h"
+
+#include "bridge/pipewire/graph/Routes.h"
+#include "bridge/pipewire/report/ServiceTypes.h"
+
+#include <algorithm>
+#include <cmath>
+#include <utility>
+
+namespace tamblo::pipewire {
+
+namespace {
+
+constexpr EventCategory kIO = client::category(EventKind::io);
+
+void bringForward(std::optional<SteadyTime>& due, SteadyTime time) {
+    due = due ? std::min(*due, time) : time;
+}
+
+double rounded(double value) noexcept {
+    constexpr double kDigits = 1e3;
+    return std::round(value * kDigits) / kDigits;
+}
+
+} // namespace
+
+void Overloads::cycleEnded(const Cycle& cycle) {
+    for (std::size_t i = 0; i < cycle.nodes.size(); ++i) {
+        Tally* const tally = tallyOf(cycle.nodes[i].node);
+        if (tally == nullptr) {
+            continue;
+        }
+        count(*tally, cycle.nodes[i], cycle);
+        if (i == 0) {
+            countXruns(*tally, cycle);
+        }
+    }
+}
+
+/// One that the graph has not, or not yet, cannot be reported.
+Overloads::Tally* Overloads::tallyOf(ObjectID node) {
+    if (const auto found = tallies_.find(node); found != tallies_.end()) {
+        return &found->second;
+    }
+    const Node* const known = graph_.node(node);
+    if (known == nullptr) {
+        return nullptr;
+    }
+    Tally tally;
+    tally.application =
+        known->isDevice() ? std::string() : applicationOf(*known, graph_.client(known->client));
+    tally.name = known->isDevice()   ? factsOf(graph_, node).name
+                 : known->isStream() ? tally.application
+                                     : known->name;
+    return &tallies_.emplace(node, std::move(tally)).first->second;
+}
+
+void Overloads::count(Tally& tally, const NodeCycle& node, const Cycle& cycle) {
+    tally.frames = cycle.frames;
+    tally.cycleSeconds = cycle.seconds;
+    if (node.outcome == NodeCycle::Outcome::waited || (tally.cycles != 0 && tally.lastTurn == node.turn)) {
+        return;
+    }
+    ++tally.cycles;
+    tally.lastTurn = node.turn;
+    double share = node.share;
+    if (node.outcome == NodeCycle::Outcome::late) {
+        // It has worked since the first cycle in a row that it was late in.
+        ++tally.late;
+        share = ++tally.lateInRow;
+        tally.secondsLost += cycle.seconds;
+    } else {
+        tally.lateInRow = 0;
+    }
+    ++tally.counted;
+    tally.sumOfShares += share;
+    tally.worstShare = std::max(tally.worstShare, share);
+}
+
+/// The server counts them from the driver's beginning, as long as the driver's number of xruns does not fall.
+void Overloads::countXruns(Tally& tally, const Cycle& cycle) {
+    const std::uint32_t before = tally.xrunsOfServer.value_or(cycle.xruns);
+    if (cycle.xruns > before) {
+        tally.xruns += cycle.xruns - before;
+        tally.secondsLost += (cycle.xruns - before) * cycle.seconds;
+    }
+    tally.xrunsOfServer = cycle.xruns;
+}
+
+void Overloads::cyclesRead() {
+    const Moment now = clock_.now();
+    due_.reset();
+    for (auto entry = tallies_.begin(); entry != tallies_.end();) {
+        auto& [node, tally] = *entry;
+        const bool hasGone = tally.goneAt && now.steady - *tally.goneAt >= kAfterEnd;
+        if (tally.hasNews() && tally.saidAt && now.steady - *tally.saidAt < kInterval) {
+            bringForward(due_, *tally.saidAt + kInterval);
+        } else {
+            report(node, tally, now);
+        }
+        entry = hasGone ? tallies_.erase(entry) : std::next(entry);
+    }
+}
+
+void Overloads::run() {
+    cyclesRead();
+}
+
+/// The server's numbers go to other objects when theirs have gone.
+void Overloads::graphChanged(const GraphEvent& event) {
+    if (event.kind != GraphEvent::Kind::node) {
+        return;
+    }
+    const auto found = tallies_.find(event.id);
+    if (found == tallies_.end()) {
+        return;
+    }
+    if (event.change == GraphEvent::Change::added) {
+        tallies_.erase(found);
+    } else if (event.change == GraphEvent::Change::removed) {
+        found->second.goneAt = clock_.now().steady;
+    }
+}
+
+void Overloads::report(ObjectID node, Tally& tally, const Moment& now) {
+    const SessionID session = tally.hasNews() ? sessionOf_(node) : kNoSession;
+    if (session != kNoSession) {
+        const double mean = tally.counted == 0 ? 0 : tally.sumOfShares / tally.counted;
+        Dictionary payload{{"node", tally.name},
+                           {"overload_number", tally.late + tally.xruns},
+                           {"late_number", tally.late},
+                           {"xrun_number", tally.xruns},
+                           {"cycle_share", rounded(tally.worstShare)},
+                           {"mean_cycle_share", rounded(mean)},
+                           {"io_buffer_size", tally.frames},
+                           {"cycle_seconds", tally.cycleSeconds},
+                           {"smallest_buffer_frame_size", tally.frames},
+                           {"io_cycle", tally.cycles}};
+        if (!tally.saidAt || now.steady - *tally.saidAt >= kCalm) {
+            reporter_.send(session, kIO, EventType::error, payload, now.wall);
+        }
+        payload.set("issue_type", "overload");
+        payload.set("rtaid_client", tally.application);
+        payload.set("any_channel_silence_seconds", tally.secondsLost);
+        reporter_.send(session, kIO, EventType::issueDetector, std::move(payload), now.wall);
+        tally.saidAt = now.steady;
+    }
+    tally.counted = tally.late = tally.xruns = 0;
+    tally.worstShare = tally.sumOfShares = tally.secondsLost = 0;
+}
+
+} // namespace tamblo::pipewire

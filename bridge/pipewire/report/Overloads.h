@@ -1,0 +1,74 @@
+#pragma once
+
+#include "bridge/pipewire/graph/Cycle.h"
+#include "bridge/pipewire/graph/Graph.h"
+#include "bridge/pipewire/report/Reporter.h"
+#include "bridge/pipewire/report/SessionOfNode.h"
+#include "bridge/pipewire/report/Time.h"
+
+#include <chrono>
+#include <cstdint>
+#include <optional>
+#include <string>
+#include <unordered_map>
+
+namespace tamblo::pipewire {
+
+/// Reports nodes that did not finish a cycle in time, and devices that ran dry, as overloads: at most one
+/// message a second for each node, with their number since the last one. When a node had none for a while,
+/// the first is also an error of the audio I/O, which can have the service capture what goes on.
+///
+/// The loop's thread.
+class Overloads final : public CycleObserver, public GraphObserver, public Timed {
+public:
+    static constexpr std::chrono::seconds kInterval{1};
+    static constexpr std::chrono::seconds kCalm{10};
+    /// A node that has gone is still reported, if its session lasts: its last cycles are told of later.
+    static constexpr std::chrono::seconds kAfterEnd{3};
+
+    Overloads(const Graph& graph, Reporter& reporter, const Clock& clock, SessionOfNode sessionOf)
+        : graph_(graph), reporter_(reporter), clock_(clock), sessionOf_(std::move(sessionOf)) {}
+
+    void cycleEnded(const Cycle& cycle) override;
+    void cyclesRead() override;
+    void graphChanged(const GraphEvent& event) override;
+    [[nodiscard]] std::optional<SteadyTime> due() const override { return due_; }
+    void run() override;
+
+private:
+    /// What there is to say of a node.
+    struct Tally {
+        std::string name;
+        std::string application;
+        std::uint64_t cycles = 0; ///< since it was first seen
+        std::int64_t lastTurn = 0;
+        std::uint32_t lateInRow = 0;
+        std::uint32_t counted = 0; ///< from here on, since it was last spoken of
+        std::uint32_t late = 0;
+        std::uint32_t xruns = 0;
+        double worstShare = 0;
+        double sumOfShares = 0;
+        double secondsLost = 0;
+        std::uint32_t frames = 0;
+        double cycleSeconds = 0;
+        std::optional<std::uint32_t> xrunsOfServer; ///< of a driver, when it was last told of
+        std::optional<SteadyTime> saidAt;
+        std::optional<SteadyTime> goneAt;
+
+        [[nodiscard]] bool hasNews() const noexcept { return late != 0 || xruns != 0; }
+    };
+
+    void count(Tally& tally, const NodeCycle& node, const Cycle& cycle);
+    void countXruns(Tally& tally, const Cycle& cycle);
+    [[nodiscard]] Tally* tallyOf(ObjectID node);
+    void report(ObjectID node, Tally& tally, const Moment& now);
+
+    const Graph& graph_;
+    Reporter& reporter_;
+    const Clock& clock_;
+    const SessionOfNode sessionOf_;
+    std::unordered_map<ObjectID, Tally> tallies_;
+    std::optional<SteadyTime> due_;
+};
+
+} // namespace tamblo::pipewire
