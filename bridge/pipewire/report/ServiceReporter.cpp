@@ -71,9 +71,13 @@ bool ServiceReporter::pump() {
     }
     bool isFlushed = false;
     do {
+        const std::size_t before = waiting_.size();
         while (!waiting_.empty() && hand(waiting_.front())) {
-            waiting_.pop_front();
-            stepsHanded_ = 0;
+            dropFirst();
+        }
+        // What the library refuses though its queue was empty, it will never take.
+        if (isFlushed && waiting_.size() == before) {
+            dropFirst();
         }
         isFlushed = client_->flush(milliseconds{0});
     } while (isFlushed && !waiting_.empty());
@@ -83,6 +87,11 @@ bool ServiceReporter::pump() {
     }
     wantsWriting_ = !isFlushed;
     return true;
+}
+
+void ServiceReporter::dropFirst() {
+    waiting_.pop_front();
+    stepsHanded_ = 0;
 }
 
 void ServiceReporter::finish(milliseconds patience) {

@@ -58,6 +58,7 @@ private:
     };
 
     void queue(Request request);
+    void dropFirst();
     /// Whether the library took the request, in full.
     [[nodiscard]] bool hand(const Request& request);
     void lose();

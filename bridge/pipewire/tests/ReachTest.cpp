@@ -70,6 +70,10 @@ TEST(PipeWireReporter, givesAServiceUpThatTakesNothing) {
     ASSERT_TRUE(reporter.connect());
     EXPECT_EQ(listener.came, 1);
     const SessionID session = reporter.begin(ServiceType::generic, "player");
+    reporter.send(session, client::category(EventKind::volume), EventType::generic,
+                  {{"text", std::string(2U << 20U, 'x')}}, WallTime());
+    EXPECT_TRUE(reporter.pump()) << "what is longer than the service accepts is left out";
+    EXPECT_FALSE(reporter.wantsWriting());
     bool isThere = true;
     std::size_t sent = 0;
     for (; isThere && sent < 100'000; ++sent) {
