@@ -6,6 +6,7 @@
 
 #include <atomic>
 #include <chrono>
+#include <cstddef>
 #include <memory>
 #include <optional>
 #include <string>
@@ -22,12 +23,8 @@ constexpr std::string_view kDomain = "com.vandra.tamblo.accessories";
 constexpr std::string_view kKey = "registered";
 /// Accessories come and go in minutes, and their records are files to be read.
 constexpr std::chrono::minutes kLookupInterval{1};
-
-/// The lookups of all sessions, of which there is one at a time.
-struct Lookups {
-    std::optional<WallTime> last; ///< when it began; for the thread that does the sessions' work
-    std::atomic<bool> isUnderWay{false};
-};
+/// Later than what was reported at the last lookup is due again, however long that took.
+constexpr std::chrono::milliseconds kNextLookup = AccessoryRegistry::kReportInterval + kLookupInterval;
 
 void send(Context& context, std::vector<Dictionary> reports) {
     context.serverQueue().post([&context, reports = std::move(reports)] {
@@ -61,27 +58,76 @@ void lookUp(Context& context) {
 
 } // namespace
 
+/// The lookups of all sessions, of which there is one at a time. All but `isUnderWay` is for the reporting
+/// server queue.
+struct ZRReportingSessionAudioRegistrationWorker::Lookups {
+    explicit Lookups(Context& owner) : context(owner) {}
+
+    /// Unless there was one just now.
+    void lookUpSoon() {
+        const Platform& device = context.platform();
+        const WallTime now = device.clock->now();
+        // A clock that was set back does not put the next lookup off.
+        const bool isRecent = last && *last <= now && now - *last < kLookupInterval;
+        if (!isRecent && device.analyticsEvents->isEventInUse(kEvent) && !isUnderWay.exchange(true)) {
+            last = now;
+            // A queue for one piece, which runs after the queue is gone: at most once a minute, none is kept.
+            device.workQueues->makeSerialQueue("com.vandra.tamblo.accessories")
+                ->post(
+                    [this] {
+                        lookUp(context);
+                        isUnderWay = false;
+                    },
+                    Pace::mayBlock);
+            next.reset();
+        }
+        if (!next) {
+            next = device.workQueues->callAfter(
+                kNextLookup, [this] { context.serverQueue().post([this] { lookUpAgain(); }); });
+        }
+    }
+
+    Context& context;
+    std::size_t sessions = 0;          ///< that are started
+    std::unique_ptr<DelayedCall> next; ///< a day after the last one, while there are any
+    std::optional<WallTime> last;      ///< when it began
+    std::atomic<bool> isUnderWay{false};
+
+private:
+    void lookUpAgain() {
+        if (sessions != 0) {
+            next.reset();
+            lookUpSoon();
+        }
+    }
+};
+
+ZRReportingSessionAudioRegistrationWorker::ZRReportingSessionAudioRegistrationWorker(
+    Context& context, std::weak_ptr<ZRReportingSession> session)
+    : ZRReportingSessionWorkerConsumerProtocol(context, std::move(session)),
+      lookups_(context.shared<Lookups>(context)) {}
+
+ZRReportingSessionAudioRegistrationWorker::~ZRReportingSessionAudioRegistrationWorker() {
+    leave();
+}
+
 std::optional<bool> ZRReportingSessionAudioRegistrationWorker::start() {
-    const Platform& device = platform();
-    if (!device.analyticsEvents->isEventInUse(kEvent)) {
-        return true;
+    if (!std::exchange(isCounted_, true)) {
+        ++lookups_.sessions;
     }
-    auto& lookups = context().shared<Lookups>();
-    const WallTime now = device.clock->now();
-    // A clock that was set back does not put the next lookup off.
-    const bool isRecent = lookups.last && *lookups.last <= now && now - *lookups.last < kLookupInterval;
-    if (!isRecent && !lookups.isUnderWay.exchange(true)) {
-        lookups.last = now;
-        // A queue for one piece, which runs after the queue is gone: at most once a minute, none is kept.
-        device.workQueues->makeSerialQueue("com.vandra.tamblo.accessories")
-            ->post(
-                [&context = context(), &lookups] {
-                    lookUp(context);
-                    lookups.isUnderWay = false;
-                },
-                Pace::mayBlock);
-    }
+    lookups_.lookUpSoon();
     return true;
+}
+
+bool ZRReportingSessionAudioRegistrationWorker::stopSome() {
+    leave();
+    return true;
+}
+
+void ZRReportingSessionAudioRegistrationWorker::leave() {
+    if (std::exchange(isCounted_, false) && --lookups_.sessions == 0) {
+        lookups_.next.reset();
+    }
 }
 
 } // namespace tamblo
