@@ -1,7 +1,16 @@
 # What `cmake --install` (and `./dev install`) puts in place.
 
-foreach(target tamblod tambloctl)
+# Units and documents name the prefix that was configured: another one at installation would get half of it.
+install(CODE "
+    string(REGEX REPLACE \"/$\" \"\" configured \"${CMAKE_INSTALL_PREFIX}\")
+    if(NOT CMAKE_INSTALL_PREFIX STREQUAL configured)
+        message(FATAL_ERROR \"configured for \${configured}: for another place, configure with -DCMAKE_INSTALL_PREFIX\")
+    endif()")
+
+add_custom_target(tamblo_installed DEPENDS tamblo tamblo_static)
+foreach(target tamblod tambloctl tamblo-pipewire)
     if(TARGET ${target})
+        add_dependencies(tamblo_installed ${target})
         install(TARGETS ${target} RUNTIME DESTINATION "${CMAKE_INSTALL_BINDIR}")
     endif()
 endforeach()
@@ -36,6 +45,16 @@ install(FILES "${CMAKE_BINARY_DIR}/user/tamblod.service"
 # The unit's user, and its configuration directory, which that user owns.
 install(FILES packaging/tamblod.sysusers DESTINATION "${CMAKE_INSTALL_PREFIX}/lib/sysusers.d" RENAME tamblo.conf)
 install(FILES packaging/tamblod.tmpfiles DESTINATION "${CMAKE_INSTALL_PREFIX}/lib/tmpfiles.d" RENAME tamblo.conf)
+# The bridge to the sound server: a unit for one server of the whole system, with a user for it, and one for users' own.
+if(TARGET tamblo-pipewire)
+    configure_file(packaging/tamblo-pipewire.service.in tamblo-pipewire.service @ONLY)
+    install(FILES "${CMAKE_BINARY_DIR}/tamblo-pipewire.service" DESTINATION "${CMAKE_INSTALL_PREFIX}/lib/systemd/system")
+    configure_file(packaging/tamblo-pipewire.user.service.in user/tamblo-pipewire.service @ONLY)
+    install(FILES "${CMAKE_BINARY_DIR}/user/tamblo-pipewire.service"
+        DESTINATION "${CMAKE_INSTALL_PREFIX}/lib/systemd/user")
+    install(FILES packaging/tamblo-pipewire.sysusers DESTINATION "${CMAKE_INSTALL_PREFIX}/lib/sysusers.d"
+        RENAME tamblo-pipewire.conf)
+endif()
 # Manual pages and completion of command lines, made by the programs that are installed.
 install(CODE "
     execute_process(COMMAND \"${CMAKE_SOURCE_DIR}/packaging/manual\" \"${CMAKE_RUNTIME_OUTPUT_DIRECTORY}\"

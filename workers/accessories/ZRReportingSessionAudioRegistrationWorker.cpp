@@ -1,6 +1,8 @@
 #include "workers/accessories/ZRReportingSessionAudioRegistrationWorker.h"
 
 #include "base/Dictionary.h"
+#include "platform/Counters.h"
+#include "platform/PreferenceDomains.h"
 #include "util/Log.h"
 #include "workers/accessories/AccessoryRegistry.h"
 
@@ -19,7 +21,6 @@ namespace {
 
 using Worker = ZRReportingSessionAudioRegistrationWorker;
 
-constexpr std::string_view kDomain = "com.vandra.tamblo.accessories";
 constexpr std::string_view kKey = "registered";
 /// Accessories come and go in minutes, and their records are files to be read.
 constexpr std::chrono::minutes kLookupInterval{1};
@@ -36,13 +37,13 @@ void send(Context& context, std::vector<Dictionary> reports) {
 
 void lookUp(Context& context) {
     const Platform& device = context.platform();
-    PreferencesSuite store(*device.preferences, std::string(kDomain));
+    PreferencesSuite store(*device.preferences, std::string(kAccessoriesDomain));
     const std::optional<Value> kept = store.value(kKey);
     const std::vector<Accessory> seen = device.accessories->connectedEarbuds();
     AccessoryRegistry::Update update = AccessoryRegistry::update(kept, seen, device.clock->now());
     if (update.hadRubbish) {
         log::error(ZRReportingAudioRegistrationCategory(),
-                   "{}: {} holds what is no accessory; that is ignored", kDomain, kKey);
+                   "{}: {} holds what is no accessory; that is ignored", kAccessoriesDomain, kKey);
     }
     log::debug(ZRReportingAudioRegistrationCategory(), "looked up accessories. seen={} reported={}",
                seen.size(), update.reports.size());
@@ -63,24 +64,13 @@ void lookUp(Context& context) {
 struct ZRReportingSessionAudioRegistrationWorker::Lookups {
     explicit Lookups(Context& owner) : context(owner) {}
 
-    /// Unless there was one just now.
+    /// Unless there was one just now, or nobody wants to know.
     void lookUpSoon() {
         const Platform& device = context.platform();
-        const WallTime now = device.clock->now();
-        // A clock that was set back does not put the next lookup off.
-        const bool isRecent = last && *last <= now && now - *last < kLookupInterval;
-        if (!isRecent && device.analyticsEvents->isEventInUse(kEvent) && !isUnderWay.exchange(true)) {
-            last = now;
-            // A queue for one piece, which runs after the queue is gone: at most once a minute, none is kept.
-            device.workQueues->makeSerialQueue("com.vandra.tamblo.accessories")
-                ->post(
-                    [this] {
-                        lookUp(context);
-                        isUnderWay = false;
-                    },
-                    Pace::mayBlock);
-            next.reset();
+        if (!device.analyticsEvents->isEventInUse(kEvent)) {
+            return;
         }
+        lookUpUnlessRecent(device);
         if (!next) {
             next = device.workQueues->callAfter(
                 kNextLookup, [this] { context.serverQueue().post([this] { lookUpAgain(); }); });
@@ -89,14 +79,35 @@ struct ZRReportingSessionAudioRegistrationWorker::Lookups {
 
     Context& context;
     std::size_t sessions = 0;          ///< that are started
-    std::unique_ptr<DelayedCall> next; ///< a day after the last one, while there are any
+    std::unique_ptr<DelayedCall> next; ///< a day after the last one
     std::optional<WallTime> last;      ///< when it began
     std::atomic<bool> isUnderWay{false};
 
 private:
+    void lookUpUnlessRecent(const Platform& device) {
+        const WallTime now = device.clock->now();
+        // A clock that was set back does not put the next lookup off.
+        const bool isRecent = last && *last <= now && now - *last < kLookupInterval;
+        if (isRecent || isUnderWay.exchange(true)) {
+            counters::add(counters::Counter::accessoryLookups);
+            return;
+        }
+        last = now;
+        next.reset();
+        // A queue for one piece, which runs after the queue is gone: at most once a minute, none is kept.
+        device.workQueues->makeSerialQueue("com.vandra.tamblo.accessories")
+            ->post(
+                [this] {
+                    lookUp(context);
+                    isUnderWay = false;
+                },
+                Pace::mayBlock);
+    }
+
+    /// The call stays when the last session stops: sessions come and go faster than days.
     void lookUpAgain() {
+        next.reset();
         if (sessions != 0) {
-            next.reset();
             lookUpSoon();
         }
     }
@@ -125,8 +136,8 @@ bool ZRReportingSessionAudioRegistrationWorker::stopSome() {
 }
 
 void ZRReportingSessionAudioRegistrationWorker::leave() {
-    if (std::exchange(isCounted_, false) && --lookups_.sessions == 0) {
-        lookups_.next.reset();
+    if (std::exchange(isCounted_, false)) {
+        --lookups_.sessions;
     }
 }
 

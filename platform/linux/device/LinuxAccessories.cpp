@@ -4,6 +4,7 @@
 #include "os/Directory.h"
 #include "os/HeldFile.h"
 #include "os/SmallFile.h"
+#include "platform/Counters.h"
 #include "platform/linux/device/BluetoothRecord.h"
 #include "wire/ConnectedAccessories.h"
 
@@ -97,7 +98,10 @@ std::vector<std::string> LinuxAccessories::addressesIn(const std::string& direct
                               std::generic_category().message(error)));
     }
     std::sort(addresses.begin(), addresses.end());
-    addresses.resize(std::min(addresses.size(), most));
+    if (addresses.size() > most) {
+        counters::add(counters::Counter::accessories, addresses.size() - most);
+        addresses.resize(most);
+    }
     return addresses;
 }
 

@@ -1,4 +1,0 @@
-set output 'Timing3.svg set terminal svg set multiplot set grid set title
-    "Clients end date" set xlabel "audio cycles" set ylabel "usec" plot "/tmp/p2run/prof.log" using 1 title
-    "Audio period" with lines,
-    "/tmp/p2run/prof.log" using 8 title "node/42" with lines unset multiplot unset output
