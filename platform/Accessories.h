@@ -17,7 +17,7 @@ struct Accessory {
 class Accessories {
 public:
     virtual ~Accessories() = default;
-    /// The wireless earbuds that are connected, each once; where the device cannot tell that, those that it
+    /// The wireless earbuds that are connected, each once; where nobody tells what is, those that the device
     /// is paired with. Any thread; may read a disk.
     [[nodiscard]] virtual std::vector<Accessory> connectedEarbuds() = 0;
 };

@@ -88,8 +88,8 @@ std::variant<Directories, std::string> Directories::prepare(const Environment& e
                 root.what, path, std::generic_category().message(failure), root.variable);
         }
     }
-    for (const std::string& path :
-         {directories.notifications(), directories.driverChannels(), directories.preferences()}) {
+    for (const std::string& path : {directories.notifications(), directories.driverChannels(),
+                                    directories.accessories(), directories.preferences()}) {
         // Without it what it would hold is absent, as it is without a file in it.
         static_cast<void>(makeDirectories(path));
     }

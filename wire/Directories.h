@@ -20,6 +20,7 @@ struct Directories {
     [[nodiscard]] std::string socketFile() const;
     [[nodiscard]] std::string notifications() const { return runtime + "/notifications"; }
     [[nodiscard]] std::string driverChannels() const { return runtime + "/chanlog"; }
+    [[nodiscard]] std::string accessories() const { return runtime + "/accessories"; }
     [[nodiscard]] std::string preferences() const { return configuration + "/preferences"; }
     [[nodiscard]] std::string deviceProperties() const { return configuration + "/device-properties.json"; }
 

@@ -205,7 +205,8 @@ struct LinuxPlatform::Services {
     LinuxChanlogFacility& chanlog =
         provide<LinuxChanlogFacility>(platform.chanlog, directories.driverChannels(), log);
     LinuxProcessSampling& processSampling = provide<LinuxProcessSampling>(platform.processSampling);
-    LinuxAccessories& accessories = provide<LinuxAccessories>(platform.accessories, log);
+    LinuxAccessories& accessories =
+        provide<LinuxAccessories>(platform.accessories, log, directories.accessories());
     LinuxConnectionService& connections =
         provide<LinuxConnectionService>(platform.connections, loop, clock, log, limits);
     LinuxDiagnosticCapture& diagnosticCapture = provide<LinuxDiagnosticCapture>(

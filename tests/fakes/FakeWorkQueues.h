@@ -139,8 +139,11 @@ public:
             }
         }
     }
-    [[nodiscard]] std::size_t delayedCalls() const {
-        const auto isToCome = [](const auto& entry) { return bool(entry->call); };
+    /// Those that come within this time.
+    [[nodiscard]] std::size_t delayedCalls(std::chrono::hours within = std::chrono::hours(1000)) const {
+        const auto isToCome = [latest = elapsed_ + within](const auto& entry) {
+            return bool(entry->call) && entry->due <= latest;
+        };
         return static_cast<std::size_t>(std::count_if(delayed_.begin(), delayed_.end(), isToCome));
     }
 

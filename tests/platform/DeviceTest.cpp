@@ -1,8 +1,10 @@
+#include "os/HeldFile.h"
 #include "platform/linux/device/BluetoothRecord.h"
 #include "platform/linux/device/LinuxAccessories.h"
 #include "platform/linux/device/LinuxDeviceConditions.h"
 #include "platform/linux/device/LinuxProcessInformation.h"
 #include "tests/platform/LinuxServiceSupport.h"
+#include "wire/ConnectedAccessories.h"
 
 #include <set>
 
@@ -53,7 +55,9 @@ protected:
     }
     static std::string address(int number) { return "00:1B:66:AA:00:0" + std::to_string(number); }
     std::vector<Accessory> earbuds(const std::string& machine = "machine-id") {
-        return LinuxAccessories(log, directory.path("bt"), directory.path(machine)).connectedEarbuds();
+        return LinuxAccessories(log, directory.path("accessories"), directory.path("bt"),
+                                directory.path(machine))
+            .connectedEarbuds();
     }
 
     TemporaryDirectory directory;
@@ -79,6 +83,35 @@ TEST_F(LinuxAccessoriesTest, FindsPairedEarbudsEachOnce) {
                           earbuds("none")[0].identifier}),
                 SizeIs(4));
     EXPECT_THAT(log.take(), IsEmpty());
+}
+
+TEST_F(LinuxAccessoriesTest, CountsWhatIsConnectedAsLongAsSomebodyKnows) {
+    addDevice(address(1), address(2));
+    addDevice(address(1), address(3), "[General]\nClass=0x240414\n" + kKey); // a loudspeaker
+    const std::string drawer = earbuds().at(0).identifier;
+    const std::string speaker = MachineKey::read(directory.path("machine-id")).identifierOf(address(3));
+    directory.write("accessories/none", "");
+    HeldFile file(directory.path("accessories/connected.json"));
+    const auto connect = [&file](const std::vector<wire::ConnectedAccessory>& accessories) {
+        EXPECT_EQ(file.write(wire::connectedAccessoriesText(accessories)), 0);
+    };
+    connect({});
+    EXPECT_THAT(earbuds(), IsEmpty()) << "paired ones that lie in a drawer are not connected";
+    connect({{speaker, "x", "headset"}, {"new", "bluetooth:054c:0d58", "headphone"}, {"box", "", "speaker"}});
+    ASSERT_THAT(earbuds(), SizeIs(1)) << "the record knows better what it is";
+    EXPECT_EQ(earbuds()[0].identifier, "new");
+    EXPECT_EQ(earbuds()[0].model, "bluetooth:054c:0d58");
+    connect({{drawer, "x", ""}});
+    ASSERT_THAT(earbuds(), SizeIs(1));
+    EXPECT_EQ(earbuds()[0].model, "bluetooth:ffff:0101:0203");
+    EXPECT_EQ(file.write("rubbish"), 0);
+    EXPECT_THAT(earbuds(), SizeIs(1)) << "as if nobody knew";
+    connect({});
+    file.remove();
+    EXPECT_THAT(earbuds(), SizeIs(1));
+    // Left by one that was killed.
+    directory.write("accessories/connected.json", "[]");
+    EXPECT_THAT(earbuds(), SizeIs(1));
 }
 
 /// Thermal zones in a directory in place of `/sys`. Words: `/NAME` begins a zone, `FILE=TEXT` is a file of

@@ -214,9 +214,9 @@ TEST_F(SessionFilesTest, HoldsSoManyTracesAtATimeAndForgetsDroppedSessions) {
     }
     EXPECT_EQ(timesFull(), 2U) << "the files wait";
     EXPECT_THAT(traces(), SizeIs(ProcessSampler::kMostRecordings - 1)) << "though nothing was sampled";
-    EXPECT_EQ(device.workQueues.delayedCalls(), 1U);
+    EXPECT_EQ(device.workQueues.delayedCalls(1h), 1U);
     sessions.clear();
-    EXPECT_EQ(device.workQueues.delayedCalls(), 0U);
+    EXPECT_EQ(device.workQueues.delayedCalls(1h), 0U);
 }
 
 TEST(SampleRecordingTest, KeepsEveryOtherSampleWhenItIsFull) {

@@ -271,6 +271,32 @@ TEST_F(WorkersTest, AccessoriesAreLookedUpAtMostOnceAMinuteAndKept) {
     }
 }
 
+TEST_F(WorkersTest, AccessoriesAreLookedUpDailyWhileASessionLasts) {
+    device.accessories.earbuds = {{"a", "m"}};
+    auto& queues = device.workQueues;
+    const auto passDay = [this, &queues] {
+        device.clock.advance(24h + 1min);
+        queues.elapse(24h + 1min);
+        device.serverQueue().runAll();
+        return device.accessories.lookups;
+    };
+    auto first = makeSession();
+    first->start();
+    device.serverQueue().runAll();
+    EXPECT_EQ(device.accessories.lookups, 1);
+    EXPECT_EQ(passDay(), 2);
+    EXPECT_EQ(passDay(), 3);
+    EXPECT_EQ(device.analyticsEvents.payloads("com.vandra.tamblo.accessoryregistration").size(), 3U);
+    auto other = makeSession();
+    other->start();
+    first.reset();
+    EXPECT_EQ(passDay(), 4) << "one session is left, which began within the minute of a lookup";
+    other->stop();
+    device.serverQueue().runAll();
+    EXPECT_EQ(passDay(), 4);
+    EXPECT_EQ(queues.delayedCalls(), 0U);
+}
+
 /// The call-quality service answers, and the worker's queue runs, when a test says so.
 class RtcWorkerTest : public WorkerTest {
 protected:
@@ -320,7 +346,7 @@ protected:
         }
         const std::string levels = loggedLevels(ZRReportingSessionLinkmeterCategory());
         const std::uint64_t lost = countOfLost();
-        return text + std::to_string(device.workQueues.delayedCalls()) +
+        return text + std::to_string(device.workQueues.delayedCalls(1h)) +
                std::string(static_cast<std::size_t>(std::ranges::count(levels, 'e')), 'e') +
                std::string(lost - std::exchange(lost_, lost), '-');
     }

@@ -8,6 +8,7 @@
 
 #include <atomic>
 #include <chrono>
+#include <cstddef>
 #include <memory>
 #include <optional>
 #include <string>
@@ -23,12 +24,8 @@ using Worker = ZRReportingSessionAudioRegistrationWorker;
 constexpr std::string_view kKey = "registered";
 /// Accessories come and go in minutes, and their records are files to be read.
 constexpr std::chrono::minutes kLookupInterval{1};
-
-/// The lookups of all sessions, of which there is one at a time.
-struct Lookups {
-    std::optional<WallTime> last; ///< when it began; for the thread that does the sessions' work
-    std::atomic<bool> isUnderWay{false};
-};
+/// Later than what was reported at the last lookup is due again, however long that took.
+constexpr std::chrono::milliseconds kNextLookup = AccessoryRegistry::kReportInterval + kLookupInterval;
 
 void send(Context& context, std::vector<Dictionary> reports) {
     context.serverQueue().post([&context, reports = std::move(reports)] {
@@ -62,29 +59,86 @@ void lookUp(Context& context) {
 
 } // namespace
 
-std::optional<bool> ZRReportingSessionAudioRegistrationWorker::start() {
-    const Platform& device = platform();
-    if (!device.analyticsEvents->isEventInUse(kEvent)) {
-        return true;
+/// The lookups of all sessions, of which there is one at a time. All but `isUnderWay` is for the reporting
+/// server queue.
+struct ZRReportingSessionAudioRegistrationWorker::Lookups {
+    explicit Lookups(Context& owner) : context(owner) {}
+
+    /// Unless there was one just now, or nobody wants to know.
+    void lookUpSoon() {
+        const Platform& device = context.platform();
+        if (!device.analyticsEvents->isEventInUse(kEvent)) {
+            return;
+        }
+        lookUpUnlessRecent(device);
+        if (!next) {
+            next = device.workQueues->callAfter(
+                kNextLookup, [this] { context.serverQueue().post([this] { lookUpAgain(); }); });
+        }
     }
-    auto& lookups = context().shared<Lookups>();
-    const WallTime now = device.clock->now();
-    // A clock that was set back does not put the next lookup off.
-    const bool isRecent = lookups.last && *lookups.last <= now && now - *lookups.last < kLookupInterval;
-    if (isRecent || lookups.isUnderWay.exchange(true)) {
-        counters::add(counters::Counter::accessoryLookups);
-    } else {
-        lookups.last = now;
+
+    Context& context;
+    std::size_t sessions = 0;          ///< that are started
+    std::unique_ptr<DelayedCall> next; ///< a day after the last one
+    std::optional<WallTime> last;      ///< when it began
+    std::atomic<bool> isUnderWay{false};
+
+private:
+    void lookUpUnlessRecent(const Platform& device) {
+        const WallTime now = device.clock->now();
+        // A clock that was set back does not put the next lookup off.
+        const bool isRecent = last && *last <= now && now - *last < kLookupInterval;
+        if (isRecent || isUnderWay.exchange(true)) {
+            counters::add(counters::Counter::accessoryLookups);
+            return;
+        }
+        last = now;
+        next.reset();
         // A queue for one piece, which runs after the queue is gone: at most once a minute, none is kept.
         device.workQueues->makeSerialQueue("com.vandra.tamblo.accessories")
             ->post(
-                [&context = context(), &lookups] {
+                [this] {
                     lookUp(context);
-                    lookups.isUnderWay = false;
+                    isUnderWay = false;
                 },
                 Pace::mayBlock);
     }
+
+    /// The call stays when the last session stops: sessions come and go faster than days.
+    void lookUpAgain() {
+        next.reset();
+        if (sessions != 0) {
+            lookUpSoon();
+        }
+    }
+};
+
+ZRReportingSessionAudioRegistrationWorker::ZRReportingSessionAudioRegistrationWorker(
+    Context& context, std::weak_ptr<ZRReportingSession> session)
+    : ZRReportingSessionWorkerConsumerProtocol(context, std::move(session)),
+      lookups_(context.shared<Lookups>(context)) {}
+
+ZRReportingSessionAudioRegistrationWorker::~ZRReportingSessionAudioRegistrationWorker() {
+    leave();
+}
+
+std::optional<bool> ZRReportingSessionAudioRegistrationWorker::start() {
+    if (!std::exchange(isCounted_, true)) {
+        ++lookups_.sessions;
+    }
+    lookups_.lookUpSoon();
     return true;
+}
+
+bool ZRReportingSessionAudioRegistrationWorker::stopSome() {
+    leave();
+    return true;
+}
+
+void ZRReportingSessionAudioRegistrationWorker::leave() {
+    if (std::exchange(isCounted_, false)) {
+        --lookups_.sessions;
+    }
 }
 
 } // namespace tamblo

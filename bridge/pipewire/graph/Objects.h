@@ -117,6 +117,8 @@ struct Device {
     std::string formFactor;
     std::string vendor; ///< numbers of the maker and of the product, not of the piece
     std::string product;
+    /// Tells a wireless one from others on this machine; a hash, of which its address cannot be had.
+    std::string identifier;
     std::string profile;
     std::string profileDescription;
     std::vector<Route> routes; ///< the active ones

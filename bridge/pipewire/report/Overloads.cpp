@@ -135,6 +135,7 @@ void Overloads::report(ObjectID node, Tally& tally, const Moment& now) {
                            {"io_buffer_size", tally.frames},
                            {"cycle_seconds", tally.cycleSeconds},
                            {"smallest_buffer_frame_size", tally.frames},
+                           {"cycle_number", tally.counted},
                            {"io_cycle", tally.cycles}};
         if (!tally.saidAt || now.steady - *tally.saidAt >= kCalm) {
             reporter_.send(session, kIO, EventType::error, payload, now.wall);

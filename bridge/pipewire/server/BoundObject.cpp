@@ -4,14 +4,19 @@
 #include "bridge/pipewire/graph/Properties.h"
 #include "bridge/pipewire/server/Pods.h"
 #include "bridge/pipewire/server/Proxy.h"
+#include "os/MachineKey.h"
 
 #include <algorithm>
 #include <array>
+#include <cstring>
 #include <optional>
 #include <span>
+#include <string>
+#include <string_view>
 #include <utility>
 
 #include <pipewire/extensions/metadata.h>
+#include <spa/utils/keys.h>
 
 namespace tamblo::pipewire {
 
@@ -139,6 +144,16 @@ private:
     WantedParameters<2> wanted_{{SPA_PARAM_Format, SPA_PARAM_Props}};
 };
 
+/// As the service has it of the Bluetooth daemon's records, whose addresses are in capital letters.
+std::string identifierOf(std::string_view address) {
+    static const MachineKey key = MachineKey::read();
+    std::string text(address);
+    std::transform(text.begin(), text.end(), text.begin(), [](char byte) {
+        return byte >= 'a' && byte <= 'f' ? static_cast<char>(byte - 'a' + 'A') : byte;
+    });
+    return key.identifierOf(text);
+}
+
 class BoundDevice final : public BoundObject {
 public:
     BoundDevice(pw_registry* registry, ObjectID id, Graph& graph)
@@ -156,8 +171,12 @@ private:
         auto& self = *static_cast<BoundDevice*>(data);
         self.graph_.changeDevice(self.id_, [info](Device& device) {
             device.isKnown = true;
-            forEachEntry(info->props,
-                         [&device](const char* key, const char* value) { takeProperty(device, key, value); });
+            forEachEntry(info->props, [&device](const char* key, const char* value) {
+                takeProperty(device, key, value);
+                if (std::strcmp(key, SPA_KEY_API_BLUEZ5_ADDRESS) == 0) {
+                    device.identifier = identifierOf(value);
+                }
+            });
         });
         if ((info->change_mask & PW_DEVICE_CHANGE_MASK_PARAMS) != 0) {
             self.wanted_.forEachChanged({info->params, info->n_params}, [&self](std::uint32_t id) {

@@ -32,6 +32,7 @@ Bridge::Bridge(const Options& options, const wire::Directories& directories)
       reporter_(options.isDry ? static_cast<Reporter&>(text_) : service_),
       streams_(graph_, reporter_, clock_, serviceTypes_),
       device_(graph_, reporter_, clock_),
+      accessories_(graph_, clock_, directories.accessories()),
       overloads_(graph_, reporter_, clock_, [this](ObjectID node) { return sessionOf(node); }),
       troubles_(graph_, reporter_, clock_, [this](ObjectID node) { return sessionOf(node); }),
       profiler_(graph_, clock_, overloads_),
@@ -50,6 +51,11 @@ Bridge::Bridge(const Options& options, const wire::Directories& directories)
         graph_.addObserver(overloads_);
         graph_.addObserver(profiler_);
         graph_.addObserver(troubles_);
+        if (!options.isDry) {
+            graph_.addObserver(accessories_);
+            service_.addListener(accessories_);
+            loop_.addTimed(accessories_);
+        }
         loop_.addTimed(profiler_);
         loop_.addTimed(overloads_);
         loop_.addTimed(troubles_);

@@ -1,6 +1,7 @@
 #pragma once
 
 #include "bridge/pipewire/graph/Graph.h"
+#include "bridge/pipewire/report/ConnectedAccessories.h"
 #include "bridge/pipewire/report/DeviceSession.h"
 #include "bridge/pipewire/report/Endpoint.h"
 #include "bridge/pipewire/report/Overloads.h"
@@ -67,6 +68,7 @@ private:
     Reporter& reporter_; ///< the one of the two that is used
     StreamSessions streams_;
     DeviceSession device_;
+    ConnectedAccessories accessories_;
     Overloads overloads_;
     Troubles troubles_;
     Profiler profiler_;

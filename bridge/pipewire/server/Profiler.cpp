@@ -7,8 +7,10 @@
 #include <array>
 #include <cerrno>
 #include <cstddef>
+#include <cstdio>
 #include <cstring>
 #include <new>
+#include <stdexcept>
 #include <utility>
 
 #include <pipewire/extensions/profiler.h>
@@ -27,12 +29,8 @@ constexpr std::array<const char*, 2> kModules{"libpipewire-module-protocol-nativ
 constexpr milliseconds kAnswerInterval{20};
 constexpr unsigned kMostAnswers = 50;
 
-/// The socket holds some 200 KiB. After half of that there may be more that waits in the server: it is given
-/// this long to send it.
-constexpr std::size_t kMayBeMore = 100U << 10U;
-constexpr int kForMoreMilliseconds = 2;
-/// What one reading may bring.
-constexpr std::size_t kMostBytes = 1U << 20U;
+/// The socket holds some 200 KiB. After much of that there may be more, which waits in the server.
+constexpr std::size_t kMayBeMore = 128U << 10U;
 
 } // namespace
 
@@ -58,9 +56,10 @@ public:
     Connection& operator=(const Connection&) = delete;
 
     [[nodiscard]] bool isOpen() const noexcept { return core_ != nullptr; }
-    /// Whether cycles come; while they do not, `mayStillCome` tells whether it is worth to look again.
-    [[nodiscard]] bool isBound() const noexcept { return profiler_ != nullptr; }
-    [[nodiscard]] bool mayStillCome() noexcept { return isBound() || ++looks_ < kMostAnswers; }
+    /// Whether the server has told of its profiler; while it has not, `mayStillCome` tells whether it is
+    /// worth to look again.
+    [[nodiscard]] bool isFound() const noexcept { return id_ != kNoObject; }
+    [[nodiscard]] bool mayStillCome() noexcept { return isFound() || ++looks_ < kMostAnswers; }
 
     bool open() {
         core_ = pw_context_connect(context_, nullptr, 0);
@@ -80,28 +79,29 @@ public:
             return;
         }
         profiler_.reset();
-        closeRegistry();
+        spa_hook_remove(&registryHook_);
+        pw_proxy_destroy(reinterpret_cast<pw_proxy*>(std::exchange(registry_, nullptr)));
         spa_hook_remove(&coreHook_);
         pw_core_disconnect(std::exchange(core_, nullptr));
         id_ = kNoObject;
     }
 
-    /// Everything that has come; false when there is too much, or the server has gone.
+    /// What has come; false when the server has gone.
     [[nodiscard]] bool read() {
-        std::size_t all = 0;
+        bytes_ = 0;
         pw_loop_enter(loop_);
-        do {
-            bytes_ = 0;
-            while (pw_loop_iterate(loop_, all == 0 ? 0 : kForMoreMilliseconds) > 0 && bytes_ < kMayBeMore) {
-            }
-            all += bytes_;
-        } while (bytes_ >= kMayBeMore && all < kMostBytes);
-        if (id_ != kNoObject && profiler_ == nullptr && !hasGone_) {
-            bind();
-            pw_loop_iterate(loop_, 0);
+        while (pw_loop_iterate(loop_, 0) > 0 && bytes_ < kMayBeMore) {
         }
+        const bool isDrained = bytes_ < kMayBeMore;
+        if (!isDrained) {
+            profiler_.reset();
+        } else if (profiler_ == nullptr && id_ != kNoObject && !hasGone_) {
+            bind();
+        }
+        // What was asked for leaves.
+        pw_loop_iterate(loop_, 0);
         pw_loop_leave(loop_);
-        return !hasGone_ && all < kMostBytes;
+        return !hasGone_;
     }
 
 private:
@@ -110,15 +110,6 @@ private:
                                                          PW_VERSION_PROFILER);
         if (profiler_->get() != nullptr) {
             pw_profiler_add_listener(profiler_->get(), profiler_->hook(), &kProfilerEvents, this);
-        }
-        // What else comes and goes in the server is not told over this connection, too.
-        closeRegistry();
-    }
-
-    void closeRegistry() {
-        if (registry_ != nullptr) {
-            spa_hook_remove(&registryHook_);
-            pw_proxy_destroy(reinterpret_cast<pw_proxy*>(std::exchange(registry_, nullptr)));
         }
     }
 
@@ -174,6 +165,12 @@ void Profiler::graphChanged(const GraphEvent& event) {
     if (event.kind == GraphEvent::Kind::node) {
         noteRunning(event.id, event.change != GraphEvent::Change::removed &&
                                   graph_.node(event.id)->state == NodeState::running);
+    } else if (event.kind == GraphEvent::Kind::server && graph_.server().version.empty()) {
+        // The next server is another connection's.
+        if (connection_) {
+            connection_->close();
+        }
+        due_.reset();
     }
 }
 
@@ -182,18 +179,31 @@ void Profiler::noteRunning(ObjectID node, bool isRunning) {
         const bool isFirst = running_.empty();
         running_.insert(node);
         silentSince_.reset();
-        if (isFirst && !due_) {
-            due_ = clock_.now().steady;
+        if (isFirst && !isMissing_) {
+            const bool isOpen = connection_ && connection_->isOpen();
+            due_ = clock_.now().steady + (isOpen ? kInterval : std::chrono::seconds{0});
         }
     } else if (running_.erase(node) != 0 && running_.empty()) {
         silentSince_ = clock_.now().steady;
     }
 }
 
+/// A library without the module for it is one that goes without profiling, too.
+bool Profiler::makeConnection() {
+    try {
+        connection_ = std::make_unique<Connection>(observer_);
+    } catch (const std::runtime_error& problem) {
+        isMissing_ = true;
+        std::fprintf(stderr, "tamblo-pipewire: overloads are not seen: %s\n", problem.what());
+    }
+    return connection_ != nullptr;
+}
+
 void Profiler::run() {
     const SteadyTime now = clock_.now().steady;
-    if (!connection_) {
-        connection_ = std::make_unique<Connection>(observer_);
+    if (!connection_ && !makeConnection()) {
+        due_.reset();
+        return;
     }
     Connection& connection = *connection_;
     const bool isTooLate = silentSince_ && now - *silentSince_ >= kLinger;
@@ -207,17 +217,20 @@ void Profiler::run() {
         due_ = now + kPause;
         return;
     }
-    if (!connection.read() || !connection.mayStillCome()) {
+    const bool goesOn = connection.read() && connection.mayStillCome();
+    observer_.cyclesRead();
+    // From now on: what was reported of this reading was so long ago at the next.
+    const SteadyTime end = clock_.now().steady;
+    if (!goesOn) {
         connection.close();
-        due_ = now + kPause;
-    } else if (!connection.isBound()) {
-        due_ = now + kAnswerInterval;
+        due_ = end + kPause;
+    } else if (!connection.isFound()) {
+        due_ = end + kAnswerInterval;
     } else {
         // When nothing runs, what is left has come with this reading or the next; then only the end is due.
         const bool isOver = silentSince_ && now - *silentSince_ >= kInterval;
-        due_ = isOver ? *silentSince_ + kLinger : now + kInterval;
+        due_ = isOver ? *silentSince_ + kLinger : end + kInterval;
     }
-    observer_.cyclesRead();
 }
 
 } // namespace tamblo::pipewire

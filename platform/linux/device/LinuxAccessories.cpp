@@ -2,17 +2,15 @@
 
 #include "base/Format.h"
 #include "os/Directory.h"
+#include "os/HeldFile.h"
 #include "os/SmallFile.h"
 #include "platform/Counters.h"
 #include "platform/linux/device/BluetoothRecord.h"
+#include "wire/ConnectedAccessories.h"
 
 #include <algorithm>
-#include <array>
-#include <bit>
 #include <cerrno>
-#include <charconv>
 #include <cstddef>
-#include <cstdint>
 #include <set>
 #include <system_error>
 
@@ -27,8 +25,6 @@ constexpr std::size_t kMostDevices = 256;
 constexpr std::size_t kMostEntries = 4096;
 /// A record of a device with many services has some ten kibibytes.
 constexpr std::size_t kLongestRecord = 256U << 10U;
-/// The file has 33 bytes.
-constexpr std::size_t kLongestMachineIdentifier = 64;
 
 /// Whether it is an address as the daemon names directories: "00:1B:66:AA:BB:CC".
 bool isAddress(std::string_view name) noexcept {
@@ -38,67 +34,45 @@ bool isAddress(std::string_view name) noexcept {
     });
 }
 
-/// A secret of 128 bits.
-using HashKey = std::array<std::uint64_t, 2>;
-
-/// SipHash-2-4 (Aumasson and Bernstein, 2012): whoever does not have the key can neither tell the text from
-/// its hash nor find it by trying all texts that there are.
-std::uint64_t keyedHash(const HashKey& key, std::string_view text) noexcept {
-    std::array<std::uint64_t, 4> v{key[0] ^ 0x736F6D6570736575U, key[1] ^ 0x646F72616E646F6DU,
-                                   key[0] ^ 0x6C7967656E657261U, key[1] ^ 0x7465646279746573U};
-    const auto rounds = [&v](int count) {
-        for (int i = 0; i < count; ++i) {
-            v[0] += v[1];
-            v[1] = std::rotl(v[1], 13) ^ v[0];
-            v[0] = std::rotl(v[0], 32);
-            v[2] += v[3];
-            v[3] = std::rotl(v[3], 16) ^ v[2];
-            v[0] += v[3];
-            v[3] = std::rotl(v[3], 21) ^ v[0];
-            v[2] += v[1];
-            v[1] = std::rotl(v[1], 17) ^ v[2];
-            v[2] = std::rotl(v[2], 32);
-        }
-    };
-    const auto take = [&v, &rounds](std::uint64_t word) {
-        v[3] ^= word;
-        rounds(2);
-        v[0] ^= word;
-    };
-    // Words of eight bytes, the lowest first; the last one has the length in its highest byte.
-    std::uint64_t word = 0;
-    for (std::size_t i = 0; i < text.size(); ++i) {
-        word |= std::uint64_t{static_cast<unsigned char>(text[i])} << 8U * (i % 8);
-        if (i % 8 == 7) {
-            take(word);
-            word = 0;
-        }
-    }
-    take(word | std::uint64_t{text.size()} << 56U);
-    v[2] ^= 0xFFU;
-    rounds(4);
-    return v[0] ^ v[1] ^ v[2] ^ v[3];
-}
-
-/// The machine's identifier, 32 hexadecimal digits; zero without one.
-HashKey machineKey(const std::string& path) {
-    const SmallFile file = SmallFile::read(path, kLongestMachineIdentifier);
-    const std::string_view digits = file.trimmed();
-    HashKey key{};
-    for (std::size_t i = 0; i < key.size() && digits.size() == 32; ++i) {
-        const char* begin = digits.data() + 16 * i;
-        std::from_chars(begin, begin + 16, key[i], 16);
-    }
-    return key;
+/// By what its maker calls it; whether it is one for each ear, nothing but a record tells.
+bool isWornOnTheHead(const wire::ConnectedAccessory& accessory) noexcept {
+    return accessory.formFactor == "headset" || accessory.formFactor == "headphone";
 }
 
 } // namespace
 
 std::vector<Accessory> LinuxAccessories::connectedEarbuds() {
+    const auto text = HeldFile::read(connected_ + "/" + std::string(wire::kConnectedAccessoriesFile),
+                                     wire::kMostConnectedAccessoriesBytes);
+    const auto connected = text ? wire::parseConnectedAccessories(*text) : std::nullopt;
     std::vector<Accessory> earbuds;
+    if (!connected) {
+        for (Paired& device : paired()) {
+            if (device.isEarbud) {
+                earbuds.push_back({std::move(device.identifier), std::move(device.model)});
+            }
+        }
+        return earbuds;
+    }
+    const std::vector<Paired> known = connected->empty() ? std::vector<Paired>() : paired();
+    for (const wire::ConnectedAccessory& accessory : *connected) {
+        const auto record = std::find_if(known.begin(), known.end(), [&accessory](const Paired& device) {
+            return device.identifier == accessory.identifier;
+        });
+        const bool hasRecord = record != known.end();
+        if (hasRecord ? record->isEarbud : isWornOnTheHead(accessory)) {
+            const bool statesModel = hasRecord && !record->model.empty();
+            earbuds.push_back({accessory.identifier, statesModel ? record->model : accessory.model});
+        }
+    }
+    return earbuds;
+}
+
+std::vector<LinuxAccessories::Paired> LinuxAccessories::paired() {
+    std::vector<Paired> all;
     std::set<std::string> seen;
     std::size_t devices = 0;
-    const HashKey key = machineKey(machineIdentifierFile_);
+    const MachineKey key = MachineKey::read(machineIdentifierFile_);
     for (const std::string& adapter : addressesIn(storage_, kMostAdapters)) {
         const std::string directory = storage_ + "/" + adapter;
         for (const std::string& device : addressesIn(directory, kMostDevices - devices)) {
@@ -107,12 +81,12 @@ std::vector<Accessory> LinuxAccessories::connectedEarbuds() {
                 SmallFile::read(formatted("{}/{}/info", directory, device), kLongestRecord);
             const BluetoothRecord record = BluetoothRecord::parse(file.text);
             // A device that is paired with two adapters is still one.
-            if (record.isPaired && record.isEarbud() && seen.insert(device).second) {
-                earbuds.push_back({formatted("{}", hexadecimal(keyedHash(key, device), 16)), record.model()});
+            if (record.isPaired && seen.insert(device).second) {
+                all.push_back({key.identifierOf(device), record.model(), record.isEarbud()});
             }
         }
     }
-    return earbuds;
+    return all;
 }
 
 std::vector<std::string> LinuxAccessories::addressesIn(const std::string& directory, std::size_t most) {
