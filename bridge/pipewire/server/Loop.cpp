@@ -78,6 +78,9 @@ void Loop::run(const std::function<std::optional<SteadyTime>()>& beforeSleep) {
     while (!isStopped_) {
         runDue();
         std::optional<SteadyTime> wake = beforeSleep();
+        if (isStopped_) {
+            break;
+        }
         for (const Timed* const timed : timed_) {
             bringForward(wake, timed->due());
         }

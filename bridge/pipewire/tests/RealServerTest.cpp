@@ -158,6 +158,9 @@ TEST_F(PipeWireServer, livesThroughRestartsOfAllThree) {
     sound_->startManager();
     Program again({PROGRAMS_DIR "/tamblo_pipewire_streams", "1", "60", "application.id=again"});
     ASSERT_TRUE(awaitEvents("Session_Playback.Start", 1, "again"));
+    const std::string once = "timeout 10 " PROGRAMS_DIR "/tamblo-pipewire --dry-run --once";
+    EXPECT_TRUE(PrivateSound::contains(once, "begin, generic, of again"));
+    EXPECT_EQ(tamblo::test::run("PIPEWIRE_REMOTE=nobody " + once).status, 1);
     EXPECT_EQ(bridge_->end(), 0);
     EXPECT_TRUE(awaitEvents("Session_Generic.Summary", 1, "again")) << "at its own end, too";
     startBridge();
