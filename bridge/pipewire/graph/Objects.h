@@ -84,6 +84,12 @@ struct Node {
     bool isVirtual = false; ///< no device, but a place that others connect to
     bool isMonitor = false; ///< it only shows levels
 
+    [[nodiscard]] bool isStream() const noexcept {
+        return mediaClass == MediaClass::playbackStream || mediaClass == MediaClass::captureStream;
+    }
+    /// A sink, a source, or both.
+    [[nodiscard]] bool isDevice() const noexcept { return !isStream() && mediaClass != MediaClass::other; }
+
     std::optional<Format> format;
     std::optional<Volume> volume;
 

@@ -46,12 +46,12 @@ Overloads::Tally* Overloads::tallyOf(ObjectID node) {
     if (known == nullptr) {
         return nullptr;
     }
-    const bool isStream =
-        known->mediaClass == MediaClass::playbackStream || known->mediaClass == MediaClass::captureStream;
-    const bool isDevice = !isStream && known->mediaClass != MediaClass::other;
     Tally tally;
-    tally.application = isDevice ? std::string() : applicationOf(*known, graph_.client(known->client));
-    tally.name = isDevice ? factsOf(graph_, node).name : isStream ? tally.application : known->name;
+    tally.application =
+        known->isDevice() ? std::string() : applicationOf(*known, graph_.client(known->client));
+    tally.name = known->isDevice()   ? factsOf(graph_, node).name
+                 : known->isStream() ? tally.application
+                                     : known->name;
     return &tallies_.emplace(node, std::move(tally)).first->second;
 }
 

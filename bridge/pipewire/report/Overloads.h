@@ -3,19 +3,16 @@
 #include "bridge/pipewire/graph/Cycle.h"
 #include "bridge/pipewire/graph/Graph.h"
 #include "bridge/pipewire/report/Reporter.h"
+#include "bridge/pipewire/report/SessionOfNode.h"
 #include "bridge/pipewire/report/Time.h"
 
 #include <chrono>
 #include <cstdint>
-#include <functional>
 #include <optional>
 #include <string>
 #include <unordered_map>
 
 namespace tamblo::pipewire {
-
-/// The session that something about a node belongs to; `kNoSession` without one.
-using SessionOfNode = std::function<SessionID(ObjectID node)>;
 
 /// Reports nodes that did not finish a cycle in time, and devices that ran dry, as overloads: at most one
 /// message a second for each node, with their number since the last one. When a node had none for a while,

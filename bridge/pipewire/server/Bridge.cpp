@@ -31,7 +31,9 @@ Bridge::Bridge(const Options& options, const wire::Directories& directories)
       service_(directories.socketFile()),
       reporter_(options.isDry ? static_cast<Reporter&>(text_) : service_),
       streams_(graph_, reporter_, clock_, serviceTypes_),
-      overloads_(graph_, reporter_, clock_, [this](ObjectID node) { return streams_.sessionOf(node); }),
+      device_(graph_, reporter_, clock_),
+      overloads_(graph_, reporter_, clock_, [this](ObjectID node) { return sessionOf(node); }),
+      troubles_(graph_, reporter_, clock_, [this](ObjectID node) { return sessionOf(node); }),
       profiler_(graph_, clock_, overloads_),
       server_(loop_, graph_),
       serverPlace_{Endpoint(SoundServer::socketPath(), clock_)},
@@ -39,12 +41,28 @@ Bridge::Bridge(const Options& options, const wire::Directories& directories)
       preferences_(PreferenceFile::of(directories.preferences(), ServiceTypes::kDomain)),
       preferencesWatcher_(directories.preferences()) {
     graph_.addObserver(streams_);
-    graph_.addObserver(overloads_);
-    graph_.addObserver(profiler_);
+    graph_.addObserver(device_);
     service_.addListener(streams_);
+    service_.addListener(device_);
     loop_.addTimed(streams_);
-    loop_.addTimed(profiler_);
-    loop_.addTimed(overloads_);
+    loop_.addTimed(device_);
+    if (!options.once) {
+        graph_.addObserver(overloads_);
+        graph_.addObserver(profiler_);
+        graph_.addObserver(troubles_);
+        loop_.addTimed(profiler_);
+        loop_.addTimed(overloads_);
+        loop_.addTimed(troubles_);
+    }
+}
+
+SessionID Bridge::sessionOf(ObjectID node) const {
+    if (const SessionID session = streams_.sessionOf(node); session != kNoSession) {
+        return session;
+    }
+    const Node* const known = graph_.node(node);
+    const bool isOfDevice = known != nullptr && (!known->isStream() || !known->linkGroup.empty());
+    return isOfDevice ? device_.id() : kNoSession;
 }
 
 int Bridge::run() {
@@ -63,6 +81,7 @@ int Bridge::run() {
     }
     loop_.run([this] { return beforeSleep(); });
     streams_.endAll();
+    device_.end();
     service_.finish(kFarewell);
     return status_;
 }
@@ -145,6 +164,7 @@ std::optional<SteadyTime> Bridge::beforeSleep() {
 void Bridge::takeSnapshot() {
     if (server_.isConnected() && server_.isComplete() && reporter_.isReachable()) {
         streams_.settle();
+        device_.settle();
         loop_.stop();
     } else if (!server_.isConnected() && !serverPlace_.endpoint.due()) {
         log("no sound server answers at " + SoundServer::socketPath());

@@ -1,12 +1,14 @@
 #pragma once
 
 #include "bridge/pipewire/graph/Graph.h"
+#include "bridge/pipewire/report/DeviceSession.h"
 #include "bridge/pipewire/report/Endpoint.h"
 #include "bridge/pipewire/report/Overloads.h"
 #include "bridge/pipewire/report/ServiceReporter.h"
 #include "bridge/pipewire/report/ServiceTypes.h"
 #include "bridge/pipewire/report/StreamSessions.h"
 #include "bridge/pipewire/report/TextReporter.h"
+#include "bridge/pipewire/report/Troubles.h"
 #include "bridge/pipewire/server/Loop.h"
 #include "bridge/pipewire/server/Profiler.h"
 #include "bridge/pipewire/server/SoundServer.h"
@@ -44,6 +46,8 @@ private:
         }
     };
 
+    /// Of a stream its own, of any other node the device's.
+    [[nodiscard]] SessionID sessionOf(ObjectID node) const;
     void readPreferences();
     void watchPlace(Place& place);
     void reachService();
@@ -62,7 +66,9 @@ private:
     ServiceReporter service_;
     Reporter& reporter_; ///< the one of the two that is used
     StreamSessions streams_;
+    DeviceSession device_;
     Overloads overloads_;
+    Troubles troubles_;
     Profiler profiler_;
     SoundServer server_;
     Place serverPlace_;

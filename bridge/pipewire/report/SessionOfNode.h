@@ -1,0 +1,13 @@
+#pragma once
+
+#include "bridge/pipewire/graph/Objects.h"
+#include "bridge/pipewire/report/Reporter.h"
+
+#include <functional>
+
+namespace tamblo::pipewire {
+
+/// The session that something about a node belongs to; `kNoSession` without one.
+using SessionOfNode = std::function<SessionID(ObjectID node)>;
+
+} // namespace tamblo::pipewire
