@@ -24,8 +24,7 @@ public:
     Audience(const ServiceProcess::Settings& settings, std::int64_t sessions)
         : sessions_(sessions), service_(settings), channel_(service_.socketPath()) {
         for (std::int64_t id = 1; id <= sessions; ++id) {
-            channel_.createSession(id);
-            channel_.startSession(id);
+            channel_.beginSession(id);
             if (id % 100 == 0) {
                 channel_.finish();
             }

@@ -124,6 +124,11 @@ void FrameChannel::startSession(std::int64_t reporterID) {
     queueWithoutReply(request);
 }
 
+void FrameChannel::beginSession(std::int64_t reporterID, client::ServiceType serviceType) {
+    createSession(reporterID, serviceType);
+    startSession(reporterID);
+}
+
 void FrameChannel::stopSession(std::int64_t reporterID) {
     wire::Request request = reporterRequest(wire::Method::stopReportingSessionForID, reporterID);
     queue(request);

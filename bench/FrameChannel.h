@@ -46,6 +46,9 @@ public:
                        client::ServiceType serviceType = client::ServiceType::nonLongFormAudio);
     /// Without asking for the reply, which is held until the stop.
     void startSession(std::int64_t reporterID);
+    /// Both, one after the other.
+    void beginSession(std::int64_t reporterID,
+                      client::ServiceType serviceType = client::ServiceType::nonLongFormAudio);
     void stopSession(std::int64_t reporterID);
 
 private:

@@ -22,8 +22,7 @@ constexpr double kLongestWaitMilliseconds = 5;
 constexpr std::chrono::milliseconds kAfterwards{300};
 
 void sendAll(const ServiceProcess& service, FrameChannel& channel, const LargeSession& session) {
-    channel.createSession(kReporterID);
-    channel.startSession(kReporterID);
+    channel.beginSession(kReporterID);
     const std::chrono::duration<double> now = std::chrono::system_clock::now().time_since_epoch();
     const double begin = now.count() - static_cast<double>(session.messages) / session.messagesPerSecond;
     for (std::size_t number = 0; number < session.messages; ++number) {
@@ -67,8 +66,7 @@ void measureOthersWaits(const ServiceProcess::Settings& settings, const LargeSes
     using Clock = std::chrono::steady_clock;
     const ServiceProcess service(settings);
     FrameChannel other(service.socketPath());
-    other.createSession(kOther);
-    other.startSession(kOther);
+    other.beginSession(kOther);
     other.finish();
     std::vector<wire::Request> requests = sendRequests(512, kOther);
     FrameChannel channel(service.socketPath());

@@ -28,8 +28,7 @@ void measure(Bench& bench, Placement placement) {
     const ServiceProcess service(settings);
     Echo echo(clientProcessor(), settings.processor);
     FrameChannel channel(service.socketPath());
-    channel.createSession(kReporterID);
-    channel.startSession(kReporterID);
+    channel.beginSession(kReporterID);
     channel.finish();
     std::vector<wire::Request> requests = sendRequests(512, kReporterID);
 

@@ -57,8 +57,7 @@ struct Figures {
 
 void startSessions(FrameChannel& channel) {
     for (std::int64_t id = 1; id <= kSessions; ++id) {
-        channel.createSession(id);
-        channel.startSession(id);
+        channel.beginSession(id);
         for (std::uint64_t message = 0; message < kMessages; ++message) {
             wire::Request request = sendRequest(makeMessage(message, Variety::distinct), id);
             channel.queue(request);
@@ -72,8 +71,7 @@ void startSessions(FrameChannel& channel) {
 Figures measure(const ServiceProcess::Settings& settings) {
     const ServiceProcess service(settings);
     FrameChannel other(service.socketPath());
-    other.createSession(kOther);
-    other.startSession(kOther);
+    other.beginSession(kOther);
     other.finish();
     std::vector<wire::Request> requests = sendRequests(512, kOther);
     std::optional<FrameChannel> leaving(service.socketPath());

@@ -57,8 +57,7 @@ std::size_t recordsIn(const std::string& text) {
 Figures measure(const ServiceProcess::Settings& settings) {
     const ServiceProcess service(settings);
     FrameChannel channel(service.socketPath());
-    channel.createSession(kReporterID, client::ServiceType::test);
-    channel.startSession(kReporterID);
+    channel.beginSession(kReporterID, client::ServiceType::test);
     for (std::size_t number = 0; number < kMessages; ++number) {
         wire::Request request = sendRequest(makeMessage(number, Variety::distinct), kReporterID);
         channel.queue(request);

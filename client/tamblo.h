@@ -28,11 +28,25 @@ typedef struct tamblo_payload tamblo_payload;
 typedef enum { TAMBLO_BACKGROUND = 0, TAMBLO_CALLER = 1 } tamblo_threading;
 typedef enum { TAMBLO_CONNECTED = 0, TAMBLO_LOST = 1, TAMBLO_RECONNECTING = 2 } tamblo_state;
 
+/*
+ * What came instead of a result: what the service said, or, with the domain TAMBLO_ERROR_DOMAIN, why its
+ * answer will not come; the code is then one of tamblo_error_code.
+ */
 typedef struct {
     const char* domain;
     int64_t code;
     const char* message;
 } tamblo_error;
+
+#define TAMBLO_ERROR_DOMAIN "com.vandra.tamblo.client"
+
+typedef enum {
+    TAMBLO_ERROR_CONNECTION_LOST = 1,  /* it was sent; whether it was carried out is not known */
+    TAMBLO_ERROR_REFUSED = 2,          /* it was not sent: the queue was full, or it was too long */
+    TAMBLO_ERROR_CLOSED = 3,           /* the client was destroyed first */
+    TAMBLO_ERROR_UNEXPECTED_REPLY = 4, /* the service answered with another kind of result */
+    TAMBLO_ERROR_TOO_MANY_PENDING = 5  /* it was not sent: a million requests are unanswered */
+} tamblo_error_code;
 
 /*
  * The numbers of the protocol that have names; another may be sent all the same. A category is one of the
@@ -125,7 +139,9 @@ typedef struct {
 tamblo_client* tamblo_client_create(const tamblo_options* options);
 /* Sends what is queued for at most a second, answers what waits with an error, and frees. */
 void tamblo_client_destroy(tamblo_client* client);
+/* Whether there is a connection at the moment. */
 bool tamblo_client_is_connected(const tamblo_client* client);
+/* Requests that were not queued: the queue was full, or they were longer than the service accepts. */
 uint64_t tamblo_client_refused_messages(const tamblo_client* client);
 /* Whether all that was queued left within this time. */
 bool tamblo_client_flush(tamblo_client* client, int timeout_ms);
@@ -141,7 +157,9 @@ bool tamblo_client_wait(tamblo_client* client, int timeout_ms);
 bool tamblo_client_connect(tamblo_client* client);
 size_t tamblo_client_run(tamblo_client* client, int timeout_ms);
 
-/* A payload or a configuration: keys with values, each set again replaces the former. May be sent many times.
+/*
+ * A payload or a configuration: keys with values, each set again replaces the former. May be sent many times.
+ * A null one, which tamblo_payload_create answers when there is no memory, is empty, and stays so.
  */
 tamblo_payload* tamblo_payload_create(void);
 void tamblo_payload_destroy(tamblo_payload* payload);
@@ -154,6 +172,7 @@ void tamblo_payload_set_float(tamblo_payload* payload, const char* key, float va
 void tamblo_payload_set_bool(tamblo_payload* payload, const char* key, bool value);
 /* Seconds since 1970. */
 void tamblo_payload_set_date(tamblo_payload* payload, const char* key, double seconds);
+/* Bytes, which are copied. */
 void tamblo_payload_set_data(tamblo_payload* payload, const char* key, const void* bytes, size_t length);
 /* Arrays, and another payload as a value, which is copied. */
 void tamblo_payload_set_strings(tamblo_payload* payload, const char* key, const char* const* values,

@@ -80,6 +80,9 @@ static_assert(TAMBLO_TYPE_ISSUE_DETECTOR == static_cast<int>(EventType::issueDet
 static_assert(TAMBLO_SERVICE_LONG_FORM_AUDIO == static_cast<int>(ServiceType::longFormAudio) &&
               TAMBLO_SERVICE_SYSTEM_SOUNDS == static_cast<int>(ServiceType::systemSounds) &&
               TAMBLO_SERVICE_UNKNOWN == static_cast<int>(ServiceType::unknown));
+static_assert(TAMBLO_ERROR_DOMAIN == kErrorDomain &&
+              TAMBLO_ERROR_CONNECTION_LOST == static_cast<int>(ErrorCode::connectionLost) &&
+              TAMBLO_ERROR_TOO_MANY_PENDING == static_cast<int>(ErrorCode::tooManyPending));
 
 /// A C callback as one of the library's. The answer is counted where it is waited for.
 template <typename T>
@@ -148,9 +151,16 @@ bool ask(tamblo_client* client, tamblo_reply reply, void* context, const Act& ac
 
 void set(tamblo_payload* payload, const char* key, auto&& makeValue) noexcept {
     guarded([&] {
-        payload->dictionary.set(key, makeValue());
+        if (payload != nullptr) {
+            payload->dictionary.set(key, makeValue());
+        }
         return true;
     });
+}
+
+const tamblo::Dictionary& entriesOf(const tamblo_payload* payload) noexcept {
+    static const tamblo::Dictionary none;
+    return payload != nullptr ? payload->dictionary : none;
 }
 
 void setArray(tamblo_payload* payload, const char* key, auto elements) noexcept {
@@ -231,7 +241,9 @@ void tamblo_payload_destroy(tamblo_payload* payload) {
 }
 
 void tamblo_payload_clear(tamblo_payload* payload) {
-    payload->dictionary = {};
+    if (payload != nullptr) {
+        payload->dictionary = {};
+    }
 }
 
 void tamblo_payload_set_string(tamblo_payload* payload, const char* key, const char* value) {
@@ -281,14 +293,14 @@ void tamblo_payload_set_doubles(tamblo_payload* payload, const char* key, const 
 }
 
 void tamblo_payload_set_payload(tamblo_payload* payload, const char* key, const tamblo_payload* value) {
-    set(payload, key, [&] { return tamblo::Value(value->dictionary); });
+    set(payload, key, [&] { return tamblo::Value(entriesOf(value)); });
 }
 
 bool tamblo_client_send(tamblo_client* client, const tamblo_payload* payload, uint32_t category,
                         uint16_t type, const int64_t* reporter_ids, size_t reporter_count, tamblo_reply reply,
                         void* context) {
     return ask<Nothing>(client, reply, context, [&](Client& to, Callback<Nothing> callback) {
-        return to.sendMessage(payload->dictionary, static_cast<EventCategory>(category),
+        return to.sendMessage(entriesOf(payload), static_cast<EventCategory>(category),
                               static_cast<EventType>(type), {reporter_ids, reporter_count},
                               std::move(callback));
     });
@@ -311,7 +323,7 @@ bool tamblo_client_set_service_type(tamblo_client* client, uint16_t service_type
 bool tamblo_client_set_configuration(tamblo_client* client, const tamblo_payload* configuration,
                                      int64_t reporter_id, tamblo_reply reply, void* context) {
     return ask<bool>(client, reply, context, [&](Client& to, Callback<bool> callback) {
-        return to.setConfiguration(configuration->dictionary, reporter_id, std::move(callback));
+        return to.setConfiguration(entriesOf(configuration), reporter_id, std::move(callback));
     });
 }
 

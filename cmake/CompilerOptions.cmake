@@ -23,7 +23,8 @@ add_compile_options(-Wall -Wextra -Wpedantic -Wconversion -Wshadow -Werror)
 if(CMAKE_CXX_COMPILER_ID MATCHES "Clang")
     # Part of clang's -Wconversion but not of g++'s: both compilers shall ask for the same.
     add_compile_options(-Wno-sign-conversion)
-    add_compile_options($<$<COMPILE_LANGUAGE:CXX>:-Wthread-safety>) # C may have another compiler
+    # C may have another compiler.
+    add_compile_options("$<$<COMPILE_LANGUAGE:CXX>:-Wthread-safety;-Wreserved-identifier>")
     # The library of g++ 12 sorts stably through a function that it has itself deprecated, and says so to clang
     # only. g++ keeps watch over this project's own uses.
     add_compile_options(-Wno-deprecated-declarations)

@@ -1,5 +1,12 @@
 # What `cmake --install` (and `./dev install`) puts in place.
 
+# Units and documents name the prefix that was configured: another one at installation would get half of it.
+install(CODE "
+    string(REGEX REPLACE \"/$\" \"\" configured \"${CMAKE_INSTALL_PREFIX}\")
+    if(NOT CMAKE_INSTALL_PREFIX STREQUAL configured)
+        message(FATAL_ERROR \"configured for \${configured}: for another place, configure with -DCMAKE_INSTALL_PREFIX\")
+    endif()")
+
 add_custom_target(tamblo_installed DEPENDS tamblo tamblo_static)
 foreach(target tamblod tambloctl tamblo-pipewire)
     if(TARGET ${target})

@@ -27,7 +27,13 @@ if(tamblo_pipewire_found)
     tamblo_folder(bridge/pipewire/graph PUBLIC base)
     tamblo_folder(bridge/pipewire/report PUBLIC bridge/pipewire/graph client os base)
     tamblo_folder(bridge/pipewire/server PUBLIC bridge/pipewire/report bridge/pipewire/graph client wire os base)
-    target_link_libraries(tamblo_bridge_pipewire_server PUBLIC PkgConfig::PIPEWIRE)
+    # The macros by which the server is called are statements that have a value, an extension that clang would warn of
+    # where they are used.
+    add_library(tamblo_pipewire_library INTERFACE)
+    target_link_libraries(tamblo_pipewire_library INTERFACE PkgConfig::PIPEWIRE)
+    target_compile_options(tamblo_pipewire_library INTERFACE
+        "$<$<CXX_COMPILER_ID:Clang>:-Wno-gnu-statement-expression-from-macro-expansion>")
+    target_link_libraries(tamblo_bridge_pipewire_server PUBLIC tamblo_pipewire_library)
     tamblo_program(tamblo-pipewire SOURCES bridge/pipewire/main.cpp
         LIBRARIES bridge/pipewire/server bridge/pipewire/report bridge/pipewire/graph client wire os base
         SELF_CONTAINED)

@@ -83,7 +83,7 @@ if(TARGET tamblo-pipewire)
         LIBRARIES bridge/pipewire/report bridge/pipewire/graph client wire os base)
     target_include_directories(tamblo_pipewire_tests PRIVATE "${pipewire_tests_include}")
     tamblo_program(tamblo_pipewire_streams SOURCES bridge/pipewire/tests/streams.cpp)
-    target_link_libraries(tamblo_pipewire_streams PRIVATE PkgConfig::PIPEWIRE)
+    target_link_libraries(tamblo_pipewire_streams PRIVATE tamblo_pipewire_library)
     target_compile_definitions(tamblo_pipewire_tests PRIVATE
         "PROGRAMS_DIR=\"${CMAKE_RUNTIME_OUTPUT_DIRECTORY}\""
         "TAMBLOD_PATH=\"${CMAKE_RUNTIME_OUTPUT_DIRECTORY}/tamblod\""

@@ -23,6 +23,10 @@ public:
     [[nodiscard]] virtual std::chrono::steady_clock::time_point steadyNow() const noexcept {
         return std::chrono::steady_clock::now();
     }
+    /// How long the processor has worked for the calling thread. May cost a microsecond.
+    [[nodiscard]] virtual std::chrono::nanoseconds threadTime() const noexcept {
+        return steadyNow().time_since_epoch();
+    }
     /// How far the device's local time is ahead of UTC at that time. May read the zone from the disk.
     [[nodiscard]] virtual std::chrono::seconds utcOffset(WallTime time) const = 0;
     /// Holds up the calling thread for that long.

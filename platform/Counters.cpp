@@ -1,7 +1,6 @@
 #include "platform/Counters.h"
 
 #include <algorithm>
-#include <bit>
 #include <iterator>
 
 namespace tamblo::counters {
@@ -32,6 +31,8 @@ constexpr CounterRow kRows[] = {
      "Messages, or their records, that were dropped without an error to their sender."},
     {Counter::messagesLostRetained, "messages_lost", R"(stage="retained",reason="limit")", ""},
     {Counter::messagesLostCallQuality, "messages_lost", R"(stage="call_quality",reason="limit")", ""},
+    {Counter::messagesLostNoBackEnds, "messages_lost", R"(stage="call_quality",reason="no_back_ends")", ""},
+    {Counter::messagesLostSessionGone, "messages_lost", R"(stage="call_quality",reason="session_gone")", ""},
     {Counter::requestsRefusedNotWellFormed, "requests_refused", R"(reason="not_well_formed")",
      "Frames and requests that were refused when they were read."},
     {Counter::requestsRefusedNotARequest, "requests_refused", R"(reason="not_a_request")", ""},
@@ -40,8 +41,9 @@ constexpr CounterRow kRows[] = {
     {Counter::requestsRefusedLimit, "requests_refused", R"(reason="limit")", ""},
     {Counter::requestsRefusedNotAllowed, "requests_refused", R"(reason="not_allowed")", ""},
     {Counter::requestsLostMemory, "requests_lost", R"(reason="memory")",
-     "Requests that were read and never carried out."},
+     "Requests that have come, and were never carried out."},
     {Counter::requestsLostShutdown, "requests_lost", R"(reason="shutdown")", ""},
+    {Counter::requestsLostUnfinished, "requests_lost", R"(reason="unfinished")", ""},
     {Counter::connectionsAccepted, "connections_accepted", "", "Connections of clients that were accepted."},
     {Counter::connectionsTurnedAway, "connections_turned_away", R"(reason="limit")",
      "Connections that were turned away."},
@@ -57,21 +59,30 @@ constexpr CounterRow kRows[] = {
     {Counter::sessionsStopped, "sessions_stopped", "", "Stops of sessions."},
     {Counter::stopsCut, "stops_cut", "",
      "Stops of sessions whose summaries were cut short, as too much was derived."},
+    {Counter::stopsLost, "stops_lost", R"(reason="shutdown")",
+     "Sessions that the service ended without, as their stops took too long."},
     {Counter::eventsInUse, "events", R"(in_use="true")",
      "Analytics events that were offered, by whether the device has them in use."},
     {Counter::eventsNotInUse, "events", R"(in_use="false")", ""},
     {Counter::bugCaptures, "captures", R"(kind="bug")", "Captures that were made, by kind."},
     {Counter::stackCaptures, "captures", R"(kind="stack")", ""},
     {Counter::memoryRecords, "captures", R"(kind="memory")", ""},
+    {Counter::drafts, "captures", R"(kind="draft")", ""},
     {Counter::bugCapturesRefusedToday, "captures_left_out", R"(kind="bug",reason="daily_limit")",
      "Captures that were asked for and not made."},
     {Counter::bugCapturesInvalid, "captures_left_out", R"(kind="bug",reason="invalid")", ""},
     {Counter::bugCapturesWaiting, "captures_left_out", R"(kind="bug",reason="too_many_wait")", ""},
+    {Counter::bugCapturesRate, "captures_left_out", R"(kind="bug",reason="rate")", ""},
+    {Counter::bugCapturesCancelled, "captures_left_out", R"(kind="bug",reason="cancelled")", ""},
+    {Counter::bugCapturesShutdown, "captures_left_out", R"(kind="bug",reason="shutdown")", ""},
+    {Counter::bugCapturesOutage, "captures_left_out", R"(kind="bug",reason="outage")", ""},
     {Counter::stackCapturesWaiting, "captures_left_out", R"(kind="stack",reason="too_many_wait")", ""},
+    {Counter::stackCapturesRate, "captures_left_out", R"(kind="stack",reason="rate")", ""},
     {Counter::memoryRecordsWaiting, "captures_left_out", R"(kind="memory",reason="too_many_wait")", ""},
     {Counter::memoryRecordsRate, "captures_left_out", R"(kind="memory",reason="rate")", ""},
+    {Counter::draftsBackOff, "captures_left_out", R"(kind="draft",reason="back_off")", ""},
     {Counter::summaryFileMessages, "left_out", R"(what="summary_file_messages")",
-     "Things that were left out as there was too much, by what they are."},
+     "Things that were left out, mostly as there was too much, by what they are."},
     {Counter::summaryValues, "left_out", R"(what="call_quality_summary_values")", ""},
     {Counter::traceMarks, "left_out", R"(what="performance_file_marks")", ""},
     {Counter::traceSamples, "left_out", R"(what="performance_file_samples")", ""},
@@ -80,6 +91,16 @@ constexpr CounterRow kRows[] = {
     {Counter::driverFiles, "left_out", R"(what="driver_file_lists")", ""},
     {Counter::driverChannels, "left_out", R"(what="driver_channels")", ""},
     {Counter::driverStreams, "left_out", R"(what="pcm_streams")", ""},
+    {Counter::driverDifferences, "left_out", R"(what="driver_differences")", ""},
+    {Counter::driverSamples, "left_out", R"(what="driver_samples")", ""},
+    {Counter::processes, "left_out", R"(what="processes")", ""},
+    {Counter::threads, "left_out", R"(what="threads")", ""},
+    {Counter::accessoryLookups, "left_out", R"(what="accessory_lookups")", ""},
+    {Counter::accessories, "left_out", R"(what="accessories")", ""},
+    {Counter::tapMessages, "left_out", R"(what="tap_messages")", ""},
+    {Counter::summaryFilesLost, "report_files_lost", R"(kind="summary")",
+     "Files of a session that could not be written, or not whole."},
+    {Counter::performanceFilesLost, "report_files_lost", R"(kind="performance")", ""},
     {Counter::reportsRemoved, "files_removed", R"(what="reports")", "Files that were removed to make room."},
     {Counter::captureFoldersRemoved, "files_removed", R"(what="capture_folders")", ""},
     {Counter::sinkFilesRemoved, "files_removed", R"(what="sink_files")", ""},
@@ -88,7 +109,14 @@ constexpr CounterRow kRows[] = {
     {Counter::statusReaders, "status_readers", "", "Readers of the status socket that were served."},
     {Counter::statusReadersTurnedAway, "status_readers_let_go", R"(reason="too_many")",
      "Readers of the status socket that were turned away, or let go before they had it all."},
+    {Counter::statusReadersOfUser, "status_readers_let_go", R"(reason="too_many_of_user")", ""},
     {Counter::statusReadersSilent, "status_readers_let_go", R"(reason="does_not_read")", ""},
+    {Counter::statusReadersUnanswered, "status_readers_let_go", R"(reason="no_answer")", ""},
+    {Counter::statusReadersNoMemory, "status_readers_let_go", R"(reason="memory")", ""},
+    {Counter::taps, "taps", "", "Taps that were opened."},
+    {Counter::tapsTurnedAway, "taps_let_go", R"(reason="too_many")",
+     "Taps that were turned away, or ended for another user's."},
+    {Counter::tapsOfUser, "taps_let_go", R"(reason="too_many_of_user")", ""},
     {Counter::starts, "starts", "", "Starts of the service since the counters began."},
 };
 static_assert(std::size(kRows) == static_cast<std::size_t>(Counter::count));
@@ -166,16 +194,6 @@ OfSink::OfSink(std::string_view fileName) noexcept {
     }
 }
 
-void noteAlone(Histogram histogram, std::chrono::nanoseconds time) noexcept {
-    const std::uint64_t nanoseconds = time.count() > 0 ? static_cast<std::uint64_t>(time.count()) : 0;
-    // The bound of bucket n is 4^n microseconds, and belongs to it.
-    const std::uint64_t below = nanoseconds == 0 ? 0 : (nanoseconds - 1) / 1000;
-    const std::size_t bucket = std::min((static_cast<std::size_t>(std::bit_width(below)) + 1) / 2, kBounds);
-    const std::size_t first = kFirstHistogram + static_cast<std::size_t>(histogram) * kSlotsOfHistogram;
-    addAloneTo(first + bucket, 1);
-    addAloneTo(first + kBounds + 1, nanoseconds);
-}
-
 std::vector<Family> families() {
     std::vector<Family> all;
     for (const CounterRow& row : kRows) {
@@ -191,9 +209,13 @@ std::vector<Family> families() {
     }
     addNamed(all, "requests", "Requests that were read and are carried out, by method.", "method", kMethods,
              kFirstRequest);
-    addNamed(all, "request_errors",
-             "Requests that were answered with an error, or would have been, by method.", "method", kMethods,
-             kFirstRequestError);
+    Family& errors = familyNamed(all, "request_errors", "Requests that were answered with an error.");
+    for (std::size_t i = 0; i != kMethods.size() * kRequestErrors.size(); ++i) {
+        errors.rows.push_back({label("method", kMethods[i / kRequestErrors.size()])
+                                   .append(",")
+                                   .append(label("error", kRequestErrors[i % kRequestErrors.size()])),
+                               kFirstRequestError + i});
+    }
     addNamed(all, "limits_hit", "Times that a client has reached a limit.", "limit", kLimits, kFirstLimit);
     all.push_back({.name = "request_wait_seconds",
                    .help = "How long requests waited from when they were read until they were begun with.",

@@ -1,7 +1,11 @@
 #pragma once
 
+#include "platform/Limits.h"
+
+#include <algorithm>
 #include <array>
 #include <atomic>
+#include <bit>
 #include <chrono>
 #include <cstddef>
 #include <cstdint>
@@ -30,6 +34,8 @@ enum class Counter : std::uint16_t {
     messagesLostNoSession,
     messagesLostRetained,
     messagesLostCallQuality,
+    messagesLostNoBackEnds,
+    messagesLostSessionGone,
     requestsRefusedNotWellFormed,
     requestsRefusedNotARequest,
     requestsRefusedUnknownMethod,
@@ -38,6 +44,7 @@ enum class Counter : std::uint16_t {
     requestsRefusedNotAllowed,
     requestsLostMemory,
     requestsLostShutdown,
+    requestsLostUnfinished,
     connectionsAccepted,
     connectionsTurnedAway,
     connectionsUnwatched,
@@ -49,17 +56,25 @@ enum class Counter : std::uint16_t {
     sessionsStarted,
     sessionsStopped,
     stopsCut,
+    stopsLost,
     eventsInUse,
     eventsNotInUse,
     bugCaptures,
     stackCaptures,
     memoryRecords,
+    drafts,
     bugCapturesRefusedToday,
     bugCapturesInvalid,
     bugCapturesWaiting,
+    bugCapturesRate,
+    bugCapturesCancelled,
+    bugCapturesShutdown,
+    bugCapturesOutage,
     stackCapturesWaiting,
+    stackCapturesRate,
     memoryRecordsWaiting,
     memoryRecordsRate,
+    draftsBackOff,
     summaryFileMessages,
     summaryValues,
     traceMarks,
@@ -69,6 +84,15 @@ enum class Counter : std::uint16_t {
     driverFiles,
     driverChannels,
     driverStreams,
+    driverDifferences,
+    driverSamples,
+    processes,
+    threads,
+    accessoryLookups,
+    accessories,
+    tapMessages,
+    summaryFilesLost,
+    performanceFilesLost,
     reportsRemoved,
     captureFoldersRemoved,
     sinkFilesRemoved,
@@ -76,7 +100,13 @@ enum class Counter : std::uint16_t {
     logLinesUnread,
     statusReaders,
     statusReadersTurnedAway,
+    statusReadersOfUser,
     statusReadersSilent,
+    statusReadersUnanswered,
+    statusReadersNoMemory,
+    taps,
+    tapsTurnedAway,
+    tapsOfUser,
     starts,
     count,
 };
@@ -102,33 +132,18 @@ inline constexpr std::array<std::string_view, 11> kMethods{
     "getAllReporters",
     "killService",
 };
+/// Errors of the requests that have a method.
+inline constexpr std::array<std::string_view, 4> kRequestErrors{"wrong_parameters", "limit", "not_allowed",
+                                                                "reporting_disabled"};
+enum class RequestError : std::uint8_t { wrongParameters, limit, notAllowed, reportingDisabled };
 /// Limits that clients reach, by the names that they are told.
-inline constexpr std::array<std::string_view, 24> kLimits{
-    "reporters_of_message",
-    "entries_of_dictionary",
-    "key_bytes",
-    "bytes_of_keys",
-    "decoded_bytes_of_frame",
-    "delivered_bytes_of_message",
-    "application_name_bytes",
-    "configuration_bytes_of_session",
-    "configuration_bytes_of_user",
-    "previous_keys_of_session",
-    "sessions_of_connection",
-    "sessions_of_user",
-    "connections_of_user",
-    "retained_bytes_of_user",
-    "retained_bytes",
-    "waiting_requests",
-    "waiting_bytes",
-    "waiting_bytes_of_user",
-    "unfinished_bytes_of_user",
-    "frame_seconds",
-    "reply_bytes",
-    "reply_bytes_of_user",
-    "descriptors",
-    "memory",
-};
+inline constexpr auto kLimits = [] {
+    std::array<std::string_view, kLimitRows.size() + 2> names{};
+    auto* const further = std::ranges::transform(kLimitRows, names.begin(), &LimitRow::name).out;
+    further[0] = "descriptors";
+    further[1] = "memory";
+    return names;
+}();
 /// How long requests waited until they were begun with, and took.
 enum class Histogram : std::uint8_t { waited, took, count };
 /// The upper bounds of the buckets grow fourfold from a microsecond on; the last bucket has none.
@@ -142,7 +157,7 @@ inline constexpr std::size_t kFirstSink = static_cast<std::size_t>(Counter::coun
 inline constexpr std::size_t kCountsOfSink = static_cast<std::size_t>(SinkCount::count);
 inline constexpr std::size_t kFirstRequest = kFirstSink + kSinks.size() * kCountsOfSink;
 inline constexpr std::size_t kFirstRequestError = kFirstRequest + kMethods.size();
-inline constexpr std::size_t kFirstLimit = kFirstRequestError + kMethods.size();
+inline constexpr std::size_t kFirstLimit = kFirstRequestError + kMethods.size() * kRequestErrors.size();
 inline constexpr std::size_t kFirstHistogram = kFirstLimit + kLimits.size();
 /// The buckets, one without a bound, and the sum of all in nanoseconds.
 inline constexpr std::size_t kSlotsOfHistogram = kBounds + 2;
@@ -181,6 +196,10 @@ inline void addAlone(Counter counter, std::uint64_t number = 1) noexcept {
     return slots[slot].load(std::memory_order_relaxed);
 }
 
+/// A request was answered with an error.
+inline void addRequestError(std::size_t method, RequestError error) noexcept {
+    addTo(kFirstRequestError + method * kRequestErrors.size() + static_cast<std::size_t>(error), 1);
+}
 /// A limit was reached, by the name that it is told with, or by a text that begins with the name and a colon.
 void addLimit(std::string_view limit) noexcept;
 
@@ -199,7 +218,15 @@ private:
 };
 
 /// Notes a time, one at a time.
-void noteAlone(Histogram histogram, std::chrono::nanoseconds time) noexcept;
+inline void noteAlone(Histogram histogram, std::chrono::nanoseconds time) noexcept {
+    const std::uint64_t nanoseconds = time.count() > 0 ? static_cast<std::uint64_t>(time.count()) : 0;
+    // The bound of bucket n is 4^n microseconds, and belongs to it.
+    const std::uint64_t below = nanoseconds == 0 ? 0 : (nanoseconds - 1) / 1000;
+    const std::size_t bucket = std::min((static_cast<std::size_t>(std::bit_width(below)) + 1) / 2, kBounds);
+    const std::size_t first = kFirstHistogram + static_cast<std::size_t>(histogram) * kSlotsOfHistogram;
+    addAloneTo(first + bucket, 1);
+    addAloneTo(first + kBounds + 1, nanoseconds);
+}
 
 /// One number of a family.
 struct Row {

@@ -17,21 +17,31 @@ void ProcessList::addNamedBy(const Dictionary& payload) {
         return;
     }
     const std::span<const Value> elements = named->isArray() ? named->arrayValue() : std::span(named, 1);
-    for (const Value& element : elements.first(std::min(elements.size(), kMaximumNamed))) {
+    const std::size_t looked = std::min(elements.size(), kMaximumNamed);
+    leftOut_ += elements.size() - looked;
+    for (const Value& element : elements.first(looked)) {
         if (element.isNumber() && element.kind() != Value::Kind::boolean) {
             add(element.integerValue());
+        } else {
+            ++leftOut_;
         }
     }
 }
 
 void ProcessList::add(std::int64_t process) {
-    if (process <= 0 || process > std::numeric_limits<pid_t>::max() || processes_.size() == maximum_) {
+    if (process <= 0 || process > std::numeric_limits<pid_t>::max()) {
+        ++leftOut_;
         return;
     }
     const auto identifier = static_cast<pid_t>(process);
-    if (std::find(processes_.begin(), processes_.end(), identifier) == processes_.end()) {
-        processes_.push_back(identifier);
+    if (std::find(processes_.begin(), processes_.end(), identifier) != processes_.end()) {
+        return;
     }
+    if (processes_.size() == maximum_) {
+        ++leftOut_;
+        return;
+    }
+    processes_.push_back(identifier);
 }
 
 } // namespace tamblo

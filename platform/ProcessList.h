@@ -33,6 +33,8 @@ public:
     /// Those that the payload names under `kProcessIDs`. What is no identifier of a process is left out, and
     /// of an array only the beginning counts.
     void addNamedBy(const Dictionary& payload);
+    /// Of what was added, what is not in the list: what is beyond, or no identifier of a process.
+    [[nodiscard]] std::size_t leftOut() const noexcept { return leftOut_; }
     [[nodiscard]] std::vector<pid_t> take() && noexcept { return std::move(processes_); }
 
 private:
@@ -40,6 +42,7 @@ private:
 
     const std::size_t maximum_;
     std::vector<pid_t> processes_;
+    std::size_t leftOut_ = 0;
 };
 
 } // namespace tamblo

@@ -18,6 +18,9 @@ public:
     /// What is queued from now on, until the end, are requests that were read at this time.
     void beginArrival(Time time) noexcept { arrival_.store(stampOf(time), std::memory_order_relaxed); }
     void endArrival() noexcept { arrival_.store(0, std::memory_order_relaxed); }
+    void addReadingTime(std::chrono::nanoseconds time) noexcept {
+        add(readingNanoseconds_, static_cast<std::uint64_t>(time.count()));
+    }
     // The server queue.
     void addTime(std::chrono::nanoseconds time) noexcept {
         add(nanoseconds_, static_cast<std::uint64_t>(time.count()));
@@ -31,8 +34,10 @@ public:
     [[nodiscard]] std::uint64_t messages() const noexcept {
         return messages_.load(std::memory_order_relaxed);
     }
+    /// Of the processor, on both.
     [[nodiscard]] std::chrono::nanoseconds time() const noexcept {
-        return std::chrono::nanoseconds(nanoseconds_.load(std::memory_order_relaxed));
+        return std::chrono::nanoseconds(nanoseconds_.load(std::memory_order_relaxed) +
+                                        readingNanoseconds_.load(std::memory_order_relaxed));
     }
 
     /// A time in microseconds, of which so many bits are kept that the difference of two tells an hour; 0 is
@@ -59,6 +64,7 @@ private:
     std::atomic<std::uint64_t> requests_{0};
     std::atomic<std::uint64_t> messages_{0};
     std::atomic<std::uint64_t> nanoseconds_{0};
+    std::atomic<std::uint64_t> readingNanoseconds_{0};
     std::atomic<Stamp> arrival_{0};
 };
 

@@ -3,6 +3,7 @@
 #include "base/Mutex.h"
 #include "platform/Counters.h"
 #include "platform/LogOrigin.h"
+#include "platform/ProcessorShare.h"
 
 #include <algorithm>
 #include <atomic>
@@ -45,6 +46,7 @@ struct RequestTurns::State : std::enable_shared_from_this<State> {
     void end(const QueueRef& queue, bool isStillItsTurn) TAMBLO_EXCLUDES(mutex);
     /// Runs a queue for a slice. Answers whether its next piece may block, which must not happen here.
     [[nodiscard]] bool takeTurn(Queue& queue, bool mayBlock);
+    [[nodiscard]] bool takeMeasuredTurn(Queue& queue, bool mayBlock);
     /// The piece of the server queue.
     void takeTurns(bool mayBlock) TAMBLO_EXCLUDES(mutex);
 
@@ -150,7 +152,7 @@ public:
     }
     /// After it: what it took, and the request with all of its pieces.
     void noteEnd(std::chrono::nanoseconds time) noexcept {
-        tally().addTime(time);
+        charge(processorShare.of(time));
         took += time;
         if (isRequest && !rest.work) {
             counters::noteAlone(counters::Histogram::took, took);
@@ -176,6 +178,7 @@ public:
     std::size_t next = 0;
     Item rest;                        ///< of the request at hand
     std::chrono::nanoseconds took{0}; ///< until now
+    ProcessorShare processorShare;
     bool isRequest = false;
     bool isListed = false; ///< among those that wait, or at its turn
     bool isAbandoned = false;
@@ -272,10 +275,19 @@ bool RequestTurns::State::takeTurn(Queue& queue, bool mayBlock) {
     return false;
 }
 
+bool RequestTurns::State::takeMeasuredTurn(Queue& queue, bool mayBlock) {
+    const std::chrono::nanoseconds processor = clock.threadTime();
+    const Time began = clock.steadyNow();
+    const bool mustBlock = takeTurn(queue, mayBlock);
+    queue.processorShare.addSample(clock.threadTime() - processor, clock.steadyNow() - began);
+    return mustBlock;
+}
+
 void RequestTurns::State::takeTurns(bool mayBlock) {
     const Time ends = clock.steadyNow() + kPieceOfTurns;
     while (const QueueRef queue = begin()) {
-        const bool mustBlock = takeTurn(*queue, mayBlock);
+        const bool mustBlock = queue->processorShare.wantsSample() ? takeMeasuredTurn(*queue, mayBlock)
+                                                                   : takeTurn(*queue, mayBlock);
         end(queue, mustBlock);
         if (mustBlock || endsSoon.exchange(false) || clock.steadyNow() >= ends) {
             const MutexLock lock(mutex);

@@ -25,7 +25,7 @@ struct ClientRow {
     std::uint64_t requests = 0;
     std::uint64_t bytes = 0; ///< received
     std::uint64_t messages = 0;
-    std::chrono::nanoseconds time{0}; ///< that the server queue took for its requests
+    std::chrono::nanoseconds time{0}; ///< of the processor, for its requests
     std::size_t sessions = 0;
     std::size_t startedSessions = 0;
     std::size_t retainedBytes = 0;
@@ -42,10 +42,14 @@ struct SessionRow {
     std::string application;
     bool isStarted = false;
     bool isStopping = false;
-    std::uint64_t messages = 0; ///< that were sent to it
-    std::uint64_t bytes = 0;    ///< of their values
-    std::uint64_t recorded = 0; ///< since the last stop
-    std::uint64_t dropped = 0;  ///< of these, let go for a limit
+    std::optional<WallTime> start;
+    /// From the start to the stop, or to now; below zero where the clock was set back meanwhile.
+    std::optional<std::chrono::nanoseconds> length;
+    std::uint64_t messages = 0;       ///< that were sent to it
+    std::uint64_t bytes = 0;          ///< of their values
+    std::uint64_t recorded = 0;       ///< since the last stop
+    std::uint64_t dropped = 0;        ///< of these, let go for a limit
+    std::chrono::nanoseconds time{0}; ///< of the processor, for requests for it
     std::size_t retainedBytes = 0;
 };
 

@@ -3,10 +3,12 @@
 #include "base/UniqueFunction.h"
 #include "platform/RequestTally.h"
 
+#include <algorithm>
 #include <chrono>
 #include <cstddef>
 #include <memory>
 #include <string_view>
+#include <vector>
 
 namespace tamblo {
 
@@ -64,8 +66,38 @@ public:
     /// What the client has asked for.
     [[nodiscard]] RequestTally& tally() noexcept { return tally_; }
 
+    /// Processor time, as somebody adds it up on the reporting server queue.
+    using TimeAccount = std::shared_ptr<std::chrono::nanoseconds>;
+    /// Says for whom the piece of work that runs does something besides the client; several share what it
+    /// takes. On the reporting server queue, in the piece.
+    void chargeTo(const TimeAccount& account) {
+        if (charged_ == accounts_.size() || accounts_[charged_] != account) {
+            placeAccount(account);
+        }
+        ++charged_;
+    }
+
+protected:
+    /// At the end of the piece.
+    void charge(std::chrono::nanoseconds time) noexcept {
+        tally_.addTime(time);
+        const auto share = charged_ > 1 ? time / static_cast<std::int64_t>(charged_) : time;
+        for (std::size_t i = 0; i != charged_; ++i) {
+            *accounts_[i] += share;
+        }
+        charged_ = 0;
+    }
+
 private:
+    void placeAccount(const TimeAccount& account) {
+        accounts_.resize(std::max(accounts_.size(), charged_ + 1));
+        accounts_[charged_] = account;
+    }
+
     RequestTally tally_;
+    /// The first ones are those of this piece, the others of pieces before: most clients have one session.
+    std::vector<TimeAccount> accounts_;
+    std::size_t charged_ = 0;
 };
 
 /// One call that is to come. Destroying it calls it off; a call that has begun is not waited for.

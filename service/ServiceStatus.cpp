@@ -44,7 +44,13 @@ ClientRow rowOf(const ZRReportingClientServerInstance& client) {
             .sessions = client.clientReportingSessionMap().size()};
 }
 
-SessionRow rowOf(const ZRReportingSession& session, const ZRReportingClientServerInstance* client) {
+std::optional<std::chrono::nanoseconds> lengthOf(const ZRReportingSession& session, WallTime now) {
+    const std::optional<WallTime> start = session.startTime();
+    return start ? std::optional(session.stopTime().value_or(now) - *start) : std::nullopt;
+}
+
+SessionRow rowOf(const ZRReportingSession& session, const ZRReportingClientServerInstance* client,
+                 WallTime now) {
     return {.clientOrder = client != nullptr ? client->acceptanceOrder() : 0,
             .owner = client != nullptr ? client->identity() : ClientIdentity{},
             .processName = session.clientProcessName(),
@@ -54,15 +60,19 @@ SessionRow rowOf(const ZRReportingSession& session, const ZRReportingClientServe
             .application = applicationOf(session),
             .isStarted = session.started(),
             .isStopping = session.isStopping(),
+            .start = session.startTime(),
+            .length = lengthOf(session, now),
             .messages = static_cast<std::uint64_t>(session.totalMessageCount()),
             .bytes = session.messageBytes(),
             .recorded = session.acceptedMessageCount(),
             .dropped = session.droppedMessageCount(),
+            .time = *session.processorTime(),
             .retainedBytes = session.retainedBytes()};
 }
 
-SessionDetail detailOf(const ZRReportingSession& session, const ZRReportingClientServerInstance* client) {
-    return {.row = rowOf(session, client),
+SessionDetail detailOf(const ZRReportingSession& session, const ZRReportingClientServerInstance* client,
+                       WallTime now) {
+    return {.row = rowOf(session, client, now),
             .configuration = session.configuration(),
             .previousValues = session.previousValues(),
             .workers = session.workerNames()};
@@ -152,28 +162,34 @@ void ServiceStatus::clients(Reply<std::vector<ClientRow>> reply) {
 
 void ServiceStatus::sessions(Reply<std::vector<SessionRow>> reply) {
     auto rows = std::make_shared<std::vector<SessionRow>>();
-    walkSome(std::make_unique<Walk>(Walk{
-        .onClient = [](const auto&) {},
-        .onSession = [rows](const auto* client,
-                            const ZRReportingSession& session) { rows->push_back(rowOf(session, client)); },
-        .done = [rows, reply = std::move(reply)]() mutable { reply(std::move(*rows)); }}));
+    // Room for those that there are now: to move thousands of rows would take longer than a slice.
+    rows->reserve(context_.platform().activity->sessions + 1);
+    walkSome(std::make_unique<Walk>(
+        Walk{.onClient = [](const auto&) {},
+             .onSession =
+                 [rows, &clock = *context_.platform().clock](const auto* client,
+                                                             const ZRReportingSession& session) {
+                     rows->push_back(rowOf(session, client, clock.now()));
+                 },
+             .done = [rows, reply = std::move(reply)]() mutable { reply(std::move(*rows)); }}));
 }
 
 void ServiceStatus::session(ReporterID reporterID, Reply<std::vector<SessionDetail>> reply) {
     auto found = std::make_shared<std::vector<SessionDetail>>();
+    const Clock& clock = *context_.platform().clock;
     walkSome(std::make_unique<Walk>(
         Walk{.onClient =
-                 [found, reporterID](const ZRReportingClientServerInstance& client) {
+                 [found, reporterID, &clock](const ZRReportingClientServerInstance& client) {
                      const auto& sessions = client.clientReportingSessionMap();
                      const auto entry = sessions.find(reporterID);
                      if (entry != sessions.end()) {
-                         found->push_back(detailOf(*entry->second, &client));
+                         found->push_back(detailOf(*entry->second, &client, clock.now()));
                      }
                  },
              .onSession =
-                 [found, reporterID](const auto* client, const ZRReportingSession& session) {
+                 [found, reporterID, &clock](const auto* client, const ZRReportingSession& session) {
                      if (client == nullptr && session.reporterID() == reporterID) {
-                         found->push_back(detailOf(session, nullptr));
+                         found->push_back(detailOf(session, nullptr, clock.now()));
                      }
                  },
              .done = [found, reply = std::move(reply)]() mutable { reply(std::move(*found)); }}));

@@ -30,6 +30,9 @@ namespace tamblo {
 /// to very many sessions, the end of a client with thousands of sessions. The client's next request waits for
 /// the last part, and a message to a session that is being stopped waits for its end; so nobody sees the
 /// parts but in that others are answered meanwhile.
+///
+/// In three files: messages in `ClientMessages.cpp`, the ends of sessions and of the client in
+/// `ClientStops.cpp`, all else in the class's own.
 class ZRReportingClientServerInstance final
     : public ZRReportingServiceProtocol,
       public std::enable_shared_from_this<ZRReportingClientServerInstance> {
@@ -96,9 +99,15 @@ private:
     struct Sending;
 
     /// Queues a piece of this client's work; `piece` is called with the client.
-    template <typename Piece> void onServerQueue(Pace pace, Piece piece);
+    template <typename Piece> void onServerQueue(Pace pace, Piece piece) {
+        auto work = [client = shared_from_this(), piece = std::move(piece)]() mutable { piece(*client); };
+        requests_->post(std::move(work), pace);
+    }
     /// Queues the rest of the request at hand.
-    template <typename Piece> void afterTurnsOfOthers(Pace pace, Piece piece);
+    template <typename Piece> void afterTurnsOfOthers(Pace pace, Piece piece) {
+        auto work = [client = shared_from_this(), piece = std::move(piece)]() mutable { piece(*client); };
+        requests_->postNext(std::move(work), pace);
+    }
     void performCreate(ReporterID reporterID, BooleanReply reply);
     void performSetServiceType(std::uint16_t serviceType, ReporterID reporterID);
     void performSetConfiguration(const Dictionary& configuration, ReporterID reporterID, BooleanReply reply);

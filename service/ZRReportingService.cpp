@@ -1,6 +1,7 @@
 #include "service/ZRReportingService.h"
 
 #include "base/WhileAlive.h"
+#include "platform/Counters.h"
 #include "service/ZRReportingClientServerInstance.h"
 #include "session/ZRReportingSession.h"
 #include "system/ZRReportingSystemMonitor.h"
@@ -298,6 +299,7 @@ void ZRReportingService::dropClients() {
         sessions += client->abandon();
         reportClientUptime(context_, client, client->processIdentifier(), context_.platform().clock->now());
     }
+    counters::add(counters::Counter::stopsLost, sessions);
     log::ownError(ZRReportingServiceDelegateCategory(),
                   "{} sessions were not stopped in time, and go without", sessions);
     leavingClients_.clear();

@@ -23,7 +23,7 @@ constexpr const char* kHelp =
     "\n"
     "The background reporting service of the audio stack. It runs until SIGTERM or SIGINT; a second one ends "
     "it\n"
-    "at once. It reads no configuration file, and finds its places in the environment:\n"
+    "at once. It finds its places in the environment:\n"
     "\n"
     "  RUNTIME_DIRECTORY        its socket, notifications and driver statistics\n"
     "  CONFIGURATION_DIRECTORY  preferences and device properties\n"
@@ -38,11 +38,11 @@ std::optional<int> answerToArguments(std::span<const char* const> arguments) {
         return std::nullopt;
     }
     const std::string_view first = arguments.front();
-    if (arguments.size() == 1 && first == "--help") {
+    if (arguments.size() == 1 && (first == "--help" || first == "-h")) {
         std::fputs(kHelp, stdout);
         return EXIT_SUCCESS;
     }
-    if (arguments.size() == 1 && first == "--version") {
+    if (arguments.size() == 1 && (first == "--version" || first == "-V")) {
         std::puts("tamblod " TAMBLO_VERSION);
         return EXIT_SUCCESS;
     }

@@ -38,6 +38,7 @@ bool ZRReportingSession::stopSome() {
         }
         log::debug(ZRReportingSessionCategory(), "ending session. reporterID={}", reporterID_);
         emitTracePoint(context_, TraceEvent::sessionStopped);
+        stopTime_ = context_.platform().clock->now();
         stop_ = std::make_unique<SessionStop>(messages_, blocks_.bytes() < kBytesOfShortStop);
     }
     do {

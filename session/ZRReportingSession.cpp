@@ -72,6 +72,8 @@ void ZRReportingSession::start() {
     }
     log::debug(ZRReportingSessionCategory(), "self.started==false. starting. reporterID={}", reporterID_);
     started_ = true;
+    startTime_ = context_.platform().clock->now();
+    stopTime_.reset();
     counters::addAlone(counters::Counter::sessionsStarted);
     emitTracePoint(context_, TraceEvent::sessionStarted);
     startWorkersFromClasses(workerClassLists().valid);

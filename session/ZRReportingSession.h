@@ -16,6 +16,7 @@
 #include "session/ZRReportingSessionWorkerProtocol.h"
 #include "util/AudioEvents.h"
 
+#include <chrono>
 #include <cstdint>
 #include <memory>
 #include <optional>
@@ -121,8 +122,16 @@ public:
         return previousValues_.valuesOf(keys);
     }
     [[nodiscard]] std::int64_t totalMessageCount() const noexcept { return totalMessageCount_; }
+    /// When the session was last started, and stopped since then, by a clock that may have been set
+    /// meanwhile.
+    [[nodiscard]] std::optional<WallTime> startTime() const noexcept { return startTime_; }
+    [[nodiscard]] std::optional<WallTime> stopTime() const noexcept { return stopTime_; }
     /// What the values of all messages take that were ever sent to the session.
     [[nodiscard]] std::uint64_t messageBytes() const noexcept { return messageBytes_; }
+    /// What requests for the session have taken of the processor, which whoever carries them out adds up.
+    [[nodiscard]] const std::shared_ptr<std::chrono::nanoseconds>& processorTime() const noexcept {
+        return processorTime_;
+    }
     /// What counts for the user's budget of retained messages.
     [[nodiscard]] std::size_t retainedBytes() const noexcept { return retained_.bytes(); }
     /// How many messages that were sent to the session were recorded since the last stop, its own records of
@@ -235,8 +244,12 @@ private:
     LastMessageIndex lastMessages_;
     PreviousValues previousValues_;
     std::size_t previousBytes_ = 0; ///< as the budget counts them
+    std::optional<WallTime> startTime_;
+    std::optional<WallTime> stopTime_;
     std::int64_t totalMessageCount_ = 0;
     std::uint64_t messageBytes_ = 0;
+    const std::shared_ptr<std::chrono::nanoseconds> processorTime_ =
+        std::make_shared<std::chrono::nanoseconds>(0);
     std::size_t ownRecordCount_ = 0; ///< among those recorded
     std::uint64_t droppedMessageCount_ = 0;
 

@@ -1,6 +1,7 @@
 #include "system/ZRReportingDriverUtility.h"
 
 #include "base/Dictionary.h"
+#include "platform/Counters.h"
 #include "session/MessageIntake.h"
 #include "session/ZRReportingSession.h"
 #include "util/AudioEvents.h"
@@ -48,6 +49,7 @@ ChanlogChannels channelsOrNull(const std::variant<ChanlogChannels, int>& result)
         return *channels;
     }
     if (const int error = std::get<int>(result); error != 0) {
+        counters::add(counters::Counter::driverSamples);
         log::error(ZRReportingDriverUtilityCategory(), "ChanlogCreateSamples error {}", error);
     }
     return nullptr;
@@ -73,10 +75,12 @@ void Stats::add(const ChanlogChannel& channel) {
         return ZRReportingDriverUtility::processStateData(channel, state);
     case ChanlogFormat::invalid:
     case ChanlogFormat::simpleArray:
+        counters::add(counters::Counter::driverSamples);
         return log::info(ZRReportingDriverUtilityCategory(),
                          "Dropping sample of type : {} for group : {} subgroup : {}", format,
                          channel.groupName, channel.subGroupName);
     }
+    counters::add(counters::Counter::driverSamples);
     log::info(ZRReportingDriverUtilityCategory(),
               "The ChanlogFormat {} is not supported group : {} subgroup : {}", format, channel.groupName,
               channel.subGroupName);

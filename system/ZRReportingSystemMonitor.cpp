@@ -2,6 +2,7 @@
 
 #include "base/Mutex.h"
 #include "base/WhileAlive.h"
+#include "platform/PreferenceDomains.h"
 #include "util/Log.h"
 #include "util/MessageKeys.h"
 #include "util/ReportingUtilities.h"
@@ -14,9 +15,7 @@ namespace tamblo {
 
 namespace {
 
-constexpr std::string_view kReportingDomain = "com.vandra.tamblo";
 constexpr std::string_view kReportingNotification = "com.vandra.tamblo.reporting";
-constexpr std::string_view ZRReportingMessageKeySpatialAudioAccessoryFeatureDomain = "com.vandra.dashlo";
 constexpr std::string_view kSpatialAudioNotification =
     "com.vandra.dashlo.spatial-audio-accessory-feature.changed";
 constexpr std::string_view kRingerNotification = "com.vandra.dashlo.ringerstate";

@@ -19,7 +19,10 @@ namespace {
 constexpr std::size_t kLargestInput = 1U << 30U;
 
 constexpr Option kOptions[] = {
-    {.name = "--kind", .value = "KIND", .help = "record, line or frame; guessed without it", .letter = 'k'},
+    {.name = "--kind",
+     .value = "record|line|frame",
+     .help = "what is decoded; guessed without it",
+     .letter = 'k'},
     {.name = "--file", .value = "FILE", .help = "decode what the file holds", .letter = 'f'},
 };
 

@@ -60,7 +60,8 @@ std::string helpForAll() {
 
 std::string helpFor(const Command& command) {
     std::string text = "usage: tambloctl ";
-    text.append(command.name).append(" ").append(command.arguments).append("\n\n");
+    text.append(command.name).append(command.arguments.empty() ? "" : " ");
+    text.append(command.arguments).append("\n\n");
     text.append(command.summary).append("\n\n");
     if (!command.details.empty()) {
         text.append(command.details).append("\n\n");

@@ -4,6 +4,7 @@
 #include "tools/KnownSettings.h"
 #include "tools/ServiceConnection.h"
 #include "tools/SinkFile.h"
+#include "tools/Table.h"
 #include "wire/LogCodes.h"
 #include "wire/Vocabulary.h"
 
@@ -108,27 +109,19 @@ std::string cellText(const Value& value) {
     return value.isString() ? std::string(value.stringValue()) : jsonText(value);
 }
 
-/// Columns as wide as their widest cell, two spaces apart; the last one is not filled up.
 void printTable(const Listing& listing) {
-    constexpr std::size_t gap = 2;
-    std::vector<std::vector<std::string>> lines{{listing.columns.begin(), listing.columns.end()}};
+    std::vector<Table::Column> columns;
+    for (const std::string_view name : listing.columns) {
+        columns.push_back({.name = name, .most = std::string::npos});
+    }
+    Table table(std::move(columns));
     for (const auto& row : listing.rows) {
-        std::vector<std::string>& line = lines.emplace_back();
-        std::transform(row.begin(), row.end(), std::back_inserter(line), cellText);
+        std::vector<std::string> cells;
+        std::transform(row.begin(), row.end(), std::back_inserter(cells), cellText);
+        table.add(std::move(cells));
     }
-    std::vector<std::size_t> widths(listing.columns.size(), 0);
-    for (const auto& line : lines) {
-        for (std::size_t i = 0; i + 1 < line.size(); ++i) {
-            widths[i] = std::max(widths[i], line[i].size() + gap);
-        }
-    }
-    for (const auto& line : lines) {
-        std::string text;
-        for (std::size_t i = 0; i < line.size(); ++i) {
-            text.append(line[i]);
-            text.append(i + 1 < line.size() ? widths[i] - line[i].size() : 0, ' ');
-        }
-        printLine(text);
+    for (const std::string& line : table.lines()) {
+        printLine(line);
     }
 }
 

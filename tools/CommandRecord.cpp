@@ -13,12 +13,16 @@
 #include "tools/TapLines.h"
 #include "wire/Directories.h"
 
+#include <algorithm>
+#include <array>
 #include <cerrno>
 #include <csignal>
 #include <cstdio>
 #include <cstring>
 #include <memory>
 #include <span>
+
+#include <sys/socket.h>
 
 namespace tamblo::tools {
 
@@ -47,12 +51,27 @@ struct CloseFile {
 };
 using OutputFile = std::unique_ptr<std::FILE, CloseFile>;
 
-/// Written at the end; whatever could not be.
+std::string outputName(const Arguments& arguments) {
+    return std::string(arguments.last("--output").value_or("-"));
+}
+
+ExitStatus complainAboutOutput(const std::string& name) {
+    return complain(ExitStatus::failed, formatted("cannot write {}: {}", name, std::strerror(errno)));
+}
+
+/// Null, behind a complaint, where it cannot be written.
+OutputFile openOutput(const std::string& name) {
+    OutputFile file(name == "-" ? stdout : std::fopen(name.c_str(), "we"));
+    if (file == nullptr) {
+        (void)complainAboutOutput(name);
+    }
+    return file;
+}
+
+/// Nothing once all of it is written; else what the command exits with.
 std::optional<ExitStatus> finish(std::FILE* file, const std::string& name) {
     const bool isWritten = std::fflush(file) == 0 && std::ferror(file) == 0;
-    return isWritten ? std::nullopt
-                     : std::optional(complain(ExitStatus::failed,
-                                              formatted("cannot write {}: {}", name, std::strerror(errno))));
+    return isWritten ? std::nullopt : std::optional(complainAboutOutput(name));
 }
 
 std::variant<WantedSession, std::string> wantedSession(const Arguments& arguments) {
@@ -65,7 +84,7 @@ std::variant<WantedSession, std::string> wantedSession(const Arguments& argument
     if (const auto text = arguments.last("--reporter")) {
         wanted.reporterID = parseNumber<std::int64_t>(*text);
         if (!wanted.reporterID) {
-            return formatted("\"{}\" is no reporter ID: it is a signed 64-bit number", *text);
+            return notAReporterID(*text);
         }
     }
     return wanted;
@@ -101,18 +120,20 @@ ExitStatus tell(const FoundSession& session, const SessionFileWriter& writer, co
     return report.unreadable == 0 && session.hasOpenLine ? ExitStatus::done : ExitStatus::failed;
 }
 
-/// Of the reporter's session, while it is there.
-std::optional<Dictionary> configurationOf(const Arguments& arguments, std::int64_t reporterID) {
+/// What the status has of the reporter's session: of a started one, where several clients have the ID.
+std::optional<Dictionary> sessionOf(const Arguments& arguments, std::int64_t reporterID) {
     const auto answer = StatusConnection(arguments).ask(formatted("session {}", reporterID));
     const auto* const document = std::get_if<StatusDocument>(&answer);
     const Value none;
     const Value& sessions = document != nullptr ? (*document)["sessions"] : none;
-    for (const Value& session : sessions.isArray() ? sessions.arrayValue() : std::span<const Value>()) {
-        if (const Value& found = StatusDocument::member(session, "configuration"); found.isDictionary()) {
-            return found.dictionaryValue();
+    std::optional<Dictionary> found;
+    for (const Value& session : sessions.arrayValue()) {
+        if (session.isDictionary() &&
+            (!found || StatusDocument::member(session, "state").stringValue() == "started")) {
+            found = session.dictionaryValue();
         }
     }
-    return std::nullopt;
+    return found;
 }
 
 ExitStatus tellLive(const LiveRecorder& recorder, const SessionFileWriter& writer, std::int64_t reporterID) {
@@ -130,35 +151,49 @@ ExitStatus tellLive(const LiveRecorder& recorder, const SessionFileWriter& write
     return missing.empty() ? ExitStatus::done : ExitStatus::failed;
 }
 
+/// Why there is no tap, when that has come.
+std::optional<std::string> refusalOf(const FileDescriptor& tap) {
+    std::array<char, 4096> bytes;
+    const ssize_t count = ::recv(tap.get(), bytes.data(), bytes.size(), MSG_PEEK | MSG_DONTWAIT);
+    const std::string_view text(bytes.data(), static_cast<std::size_t>(std::max<ssize_t>(count, 0)));
+    const auto line = parseJsonObject(text.substr(0, text.find('\n')));
+    const auto* const record = std::get_if<Dictionary>(&line);
+    const Value* const error = record != nullptr ? record->find("error") : nullptr;
+    return error != nullptr ? std::optional(plainText(*error)) : std::nullopt;
+}
+
 ExitStatus recordLive(const Arguments& arguments, const WantedSession& wanted) {
     if (!wanted.reporterID || wanted.name || wanted.application) {
         return complain(ExitStatus::usage, "--live needs --reporter, and no other choice of a session");
     }
     const std::int64_t reporterID = *wanted.reporterID;
     std::signal(SIGPIPE, SIG_IGN);
-    const auto tap =
-        StatusConnection(arguments).send("tap " + jsonText(Dictionary{{"reporter", reporterID}}));
-    if (const auto* failure = std::get_if<StatusConnection::Failure>(&tap)) {
+    const auto tap = StatusConnection(arguments).send(
+        "tap " + jsonText(Dictionary{{"reporter", reporterID}, {"recording", true}}));
+    if (const auto* failure = std::get_if<Unreachable>(&tap)) {
         return complain(failure->status, failure->text);
     }
-    const std::string name(arguments.last("--output").value_or("-"));
-    const OutputFile file(name == "-" ? stdout : std::fopen(name.c_str(), "we"));
+    // An answer to a later request says that the tap is open, or was refused: then the file, which may be
+    // another recording's, stays as it is.
+    (void)sessionOf(arguments, reporterID);
+    if (const auto refusal = refusalOf(std::get<FileDescriptor>(tap))) {
+        return complain(ExitStatus::failed, *refusal);
+    }
+    const std::string name = outputName(arguments);
+    const OutputFile file = openOutput(name);
     if (file == nullptr) {
-        return complain(ExitStatus::failed, formatted("cannot write {}: {}", name, std::strerror(errno)));
+        return ExitStatus::failed;
     }
     SessionFileWriter writer(file.get());
-    LiveRecorder recorder(reporterID, writer, [&] { return configurationOf(arguments, reporterID); });
+    LiveRecorder recorder(reporterID, writer, [&] { return sessionOf(arguments, reporterID); });
     TapLineFunction take = [&recorder](std::string_view line) { return recorder.take(line); };
-    // An answer to a later request says that the tap is open.
-    (void)configurationOf(arguments, reporterID);
     say(formatted("recording the session of reporter {}", reporterID));
     readTap(std::get<FileDescriptor>(tap), file.get(), take);
     if (const auto failure = finish(file.get(), name)) {
         return *failure;
     }
-    if (!recorder.refusal().empty() || !recorder.hasBegun()) {
-        return complain(ExitStatus::failed,
-                        recorder.refusal().empty() ? "no session was started" : recorder.refusal());
+    if (!recorder.hasBegun()) {
+        return complain(ExitStatus::failed, "no session was started");
     }
     return tellLive(recorder, writer, reporterID);
 }
@@ -178,7 +213,10 @@ ExitStatus run(const Arguments& arguments) {
     const std::string sinkFile = sinkPath(logs, "call-quality");
     SinkSnapshot sink(sinkFile);
     if (!sink.problem().empty()) {
-        say("tambloctl: " + sink.problem());
+        complain(ExitStatus::failed, sink.problem());
+    }
+    if (sink.isEmpty() && !sink.problem().empty()) {
+        return ExitStatus::failed;
     }
     if (sink.isEmpty()) {
         return complain(ExitStatus::failed,
@@ -193,10 +231,10 @@ ExitStatus run(const Arguments& arguments) {
                                   "are not there",
                                   sinkFile));
     }
-    const std::string name(arguments.last("--output").value_or("-"));
-    const OutputFile file(name == "-" ? stdout : std::fopen(name.c_str(), "we"));
+    const std::string name = outputName(arguments);
+    const OutputFile file = openOutput(name);
     if (file == nullptr) {
-        return complain(ExitStatus::failed, formatted("cannot write {}: {}", name, std::strerror(errno)));
+        return ExitStatus::failed;
     }
     SessionFileWriter writer(file.get());
     const RecordingReport report = recordSession(sink, *session, writer);
@@ -222,12 +260,10 @@ constexpr Command kCommandRecord{
     "Timestamps of\n"
     "messages are in the call-quality file of internal builds only.\n"
     "\n"
-    "With --live messages come from the service itself, with their timestamps, until the session stops or "
-    "Ctrl-C;\n"
-    "sessions of several clients under one ID are not told apart. Exits with 1 when there is no such "
-    "session, "
-    "or some of\n"
-    "it is missing.",
+    "With --live messages come from the service itself, with their timestamps, until the session stops or\n"
+    "Ctrl-C; one such recording is made at a time, and sessions of several clients under one ID are not "
+    "told\n"
+    "apart. Exits with 1 when there is no such session, or some of it is missing.",
     kOptions,
     run,
 };

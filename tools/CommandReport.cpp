@@ -6,6 +6,7 @@
 #include "wire/Directories.h"
 
 #include <chrono>
+#include <cstdio>
 #include <filesystem>
 #include <optional>
 #include <string>
@@ -23,9 +24,12 @@ constexpr Option kOptions[] = {
      .help = "only sessions that ended after: 2026-03-01, 2026-03-01T12:00:00Z, or 90m, 36h, 7d ago"},
     {.name = "--session",
      .value = "ID",
-     .help = "only this session: a reporter's number, or the name in the call-quality file"},
+     .help = "only the sessions of this reporter, or the one of this name in the call-quality file"},
     {.name = "--app", .value = "NAME", .help = "only this application; a trailing * stands for anything"},
-    {.name = "--output", .value = "FILE", .help = "where to write the page (report.html)", .letter = 'o'},
+    {.name = "--output",
+     .value = "FILE",
+     .help = "where to write the page, - for standard output (report.html)",
+     .letter = 'o'},
 };
 
 /// What the options say, in words; empty when they say nothing.
@@ -36,9 +40,9 @@ std::string selectionOf(const report::ReportPlan& plan) {
             words.append(words.empty() ? "" : ", ").append(what).append(" ").append(value);
         }
     };
-    add("since", plan.since ? formatRfc3339(*plan.since).value_or("") : "");
-    add("session", plan.session);
-    add("application", plan.application);
+    add("since", plan.wanted.since ? formatRfc3339(*plan.wanted.since).value_or("") : "");
+    add("session", plan.wanted.session);
+    add("application", plan.wanted.application);
     return words;
 }
 
@@ -46,12 +50,12 @@ std::variant<report::ReportPlan, std::string> makePlan(const Arguments& argument
     report::ReportPlan plan;
     plan.now = std::chrono::duration<double>(std::chrono::system_clock::now().time_since_epoch()).count();
     plan.page = arguments.last("--output").value_or("report.html");
-    plan.session = arguments.last("--session").value_or("");
-    plan.application = arguments.last("--app").value_or("");
+    plan.wanted.session = arguments.last("--session").value_or("");
+    plan.wanted.application = arguments.last("--app").value_or("");
     plan.directory = wire::Directories::ofThisProcess().logs;
     if (const auto text = arguments.last("--since")) {
-        plan.since = parseMoment(*text, plan.now);
-        if (!plan.since) {
+        plan.wanted.since = parseMoment(*text, plan.now);
+        if (!plan.wanted.since) {
             return formatted("\"{}\" is no time: it is like 2026-03-01, 2026-03-01T12:00:00Z or 7d", *text);
         }
     }
@@ -84,11 +88,15 @@ ExitStatus run(const Arguments& arguments) {
     }
     const auto& report = std::get<report::ReportResult>(result);
     std::error_code error;
-    printLine(formatted("{}: {} sessions, of {} lines",
-                        std::filesystem::absolute(plan.page, error).lexically_normal().string(),
-                        report.sessions, report.lines));
+    std::string text = formatted("{} sessions, of {} lines\n", report.sessions, report.lines);
     for (const std::string& line : report.leftOut) {
-        printLine("left out: " + line);
+        text.append("left out: ").append(line).append("\n");
+    }
+    if (plan.page == "-") {
+        std::fputs(text.c_str(), stderr);
+    } else {
+        const std::string page = std::filesystem::absolute(plan.page, error).lexically_normal().string();
+        std::fputs(formatted("{}: {}", page, text).c_str(), stdout);
     }
     return ExitStatus::done;
 }

@@ -1,19 +1,21 @@
 #include "base/Format.h"
 #include "base/Json.h"
+#include "base/NamePattern.h"
 #include "base/NumberText.h"
 #include "os/PreferenceFile.h"
+#include "platform/PreferenceDomains.h"
 #include "tools/AccessFault.h"
 #include "tools/Command.h"
 #include "tools/Payload.h"
-#include "tools/RecordFilter.h"
 #include "tools/ServiceConnection.h"
 #include "tools/SessionPlayer.h"
 #include "tools/SinkFile.h"
+#include "tools/TimeText.h"
 #include "wire/Directories.h"
+#include "wire/EventNames.h"
 
 #include <algorithm>
 #include <cerrno>
-#include <chrono>
 #include <cmath>
 #include <span>
 #include <string>
@@ -150,8 +152,7 @@ private:
 
 /// Whether one of the names is that of an event in use, as far as the preference can be read.
 bool isAnyInUse(std::span<const std::string> names) {
-    const auto file =
-        PreferenceFile::of(wire::Directories::ofThisProcess().preferences(), "com.vandra.tamblo.analytics");
+    const auto file = PreferenceFile::of(wire::Directories::ofThisProcess().preferences(), kAnalyticsDomain);
     const auto content = file ? file->read() : std::variant<Dictionary, std::string>();
     const auto* const values = std::get_if<Dictionary>(&content);
     const Value* const inUse = values == nullptr ? nullptr : values->find("events_in_use");
@@ -220,16 +221,14 @@ public:
 private:
     /// The names of the events that the message becomes in a session of the service type.
     [[nodiscard]] std::vector<std::string> eventNames(client::ServiceType service) const {
-        const std::string kind =
-            formatted("{}.{}", client::categoryName(plan_.category), client::typeName(plan_.type));
-        return {"com.vandra.tamblo." + kind,
-                formatted("com.vandra.{}.{}", client::serviceTypeName(service), kind)};
+        const auto category = static_cast<std::uint32_t>(plan_.category);
+        const auto type = static_cast<std::uint16_t>(plan_.type);
+        return {wire::eventName(wire::kAllServices, category, type),
+                wire::eventName(client::serviceTypeName(service), category, type)};
     }
     /// Differs from message to message, so that their lines can be told apart.
     double nextTimestamp() {
-        const double now =
-            std::chrono::duration<double>(std::chrono::system_clock::now().time_since_epoch()).count();
-        return lastTimestamp_ = std::max(now, std::nextafter(lastTimestamp_, HUGE_VAL));
+        return lastTimestamp_ = std::max(presentTime(), std::nextafter(lastTimestamp_, HUGE_VAL));
     }
     void note(Report& report, const Value& timestamp) {
         if (watch_.fault() != 0) {

@@ -10,6 +10,8 @@
 #include "tools/SessionSummaries.h"
 #include "wire/Directories.h"
 
+#include <algorithm>
+#include <array>
 #include <cerrno>
 #include <cmath>
 #include <fstream>
@@ -69,6 +71,26 @@ struct Plan {
     std::optional<Dictionary> configuration;
     std::string file;
 };
+
+/// What is given and would be passed over; nothing when all of it counts.
+std::optional<std::string> idleOption(const Arguments& arguments) {
+    const bool isShow = !arguments.rest().empty() && arguments.rest()[0] == "show";
+    constexpr auto kOfShow = std::to_array<std::string_view>({"--json", "--socket"});
+    constexpr auto kOfPlay =
+        std::to_array<std::string_view>({"--speed", "--fast", "--restamp", "--sending-times", "--progress"});
+    for (const Option& option : kOptions) {
+        if (isShow && arguments.has(option.name) &&
+            std::ranges::find(kOfShow, option.name) == kOfShow.end()) {
+            return formatted("session show takes no {}", option.name);
+        }
+    }
+    for (const std::string_view option : kOfPlay) {
+        if (arguments.has(option) && !arguments.has("--play")) {
+            return formatted("{} needs --play, and a file that is played", option);
+        }
+    }
+    return std::nullopt;
+}
 
 std::variant<Plan, std::string> makePlan(const Arguments& arguments) {
     Plan plan;
@@ -257,6 +279,9 @@ void keepSpacing(SessionPlayer::Options& player, std::unique_ptr<std::istream>& 
 }
 
 ExitStatus run(const Arguments& arguments) {
+    if (const auto wrong = idleOption(arguments)) {
+        return complain(ExitStatus::usage, *wrong);
+    }
     if (!arguments.rest().empty() && arguments.rest()[0] == "show") {
         return showSession(arguments);
     }
@@ -291,7 +316,7 @@ constexpr Command kCommandSession{
     "session",
     "make a session, play recorded messages to it, and stop it",
     "--reporter ID [--service-type TYPE] [--configuration JSON] [--play FILE [--speed N | --fast] "
-    "[--sending-times]] | show ID",
+    "[--restamp] [--sending-times]] | show ID",
     "\"session show ID\" shows a session that there is, with --json as JSON; --socket is the status socket "
     "then.\n"
     "A line of the file: {\"offset_s\": 0.5, \"category\": \"Session_Playback\", \"type\": \"Start\", "

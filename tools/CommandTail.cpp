@@ -15,7 +15,6 @@
 
 #include <algorithm>
 #include <cerrno>
-#include <chrono>
 #include <cstdio>
 #include <deque>
 #include <limits>
@@ -96,8 +95,7 @@ std::optional<std::string> takeFilter(RecordFilter& filter, const Arguments& arg
         }
         filter.wantReporter(*reporter);
     }
-    const double now =
-        std::chrono::duration<double>(std::chrono::system_clock::now().time_since_epoch()).count();
+    const double now = presentTime();
     for (const std::string_view option : {"--since", "--until"}) {
         const auto text = arguments.last(option);
         const auto moment = text ? parseMoment(*text, now) : std::nullopt;

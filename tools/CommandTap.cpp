@@ -53,13 +53,13 @@ constexpr Option kOptions[] = {
     kStatusSocketOption,
 };
 
-/// What an option of the kind is resolved to; or a line that says what is wrong.
+/// The filter that the options ask for, as the service takes it; or a line that says what is wrong.
 std::variant<Dictionary, std::string> makeFilter(const Arguments& arguments) {
     std::map<std::string_view, Array> lists;
     for (const std::string_view text : arguments.all("--reporter")) {
         const auto reporter = parseNumber<std::int64_t>(text);
         if (!reporter) {
-            return formatted("\"{}\" is no reporter ID: it is a signed 64-bit number", text);
+            return notAReporterID(text);
         }
         lists["reporter"].emplace_back(*reporter);
     }
@@ -175,7 +175,7 @@ ExitStatus run(const Arguments& arguments) {
     std::signal(SIGPIPE, SIG_IGN);
     auto connection =
         StatusConnection(arguments).send("tap " + jsonText(Value(std::get<Dictionary>(filter))));
-    if (const auto* failure = std::get_if<StatusConnection::Failure>(&connection)) {
+    if (const auto* failure = std::get_if<Unreachable>(&connection)) {
         return complain(failure->status, failure->text);
     }
     TapPrinter printer(arguments.has("--json"));
@@ -199,7 +199,8 @@ ExitStatus run(const Arguments& arguments) {
 constexpr Command kCommandTap{
     "tap",
     "print messages while they are recorded",
-    "[--reporter ID]... [--category CATEGORY]... [--type TYPE]... [--event NAME]... [--key KEY[=VALUE]]...",
+    "[--reporter ID]... [--category CATEGORY]... [--type TYPE]... [--event NAME]... [--key KEY[=VALUE]]... "
+    "[--limit N] [--sample 1/N] [--json]",
     "The service filters, and never waits for who reads: what comes faster than it is read is left out, and "
     "how many\n"
     "messages that were is shown where they would have stood. Of several values of one option one has to "

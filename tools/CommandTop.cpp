@@ -24,8 +24,8 @@ using Align = Table::Align;
 
 constexpr Option kOptions[] = {
     {"--sessions", "", "show sessions, not clients; the key s changes between them"},
-    {"--sort", "KEY",
-     "by messages, bytes, time (of clients) or retained memory; the keys m, b, t, r change it"},
+    {"--sort", "messages|bytes|time|retained",
+     "by processor time, say, or retained memory; the keys m, b, t, r change it"},
     {"--interval", "SECONDS", "between two pictures (2)"},
     {"--count", "N", "end after so many pictures"},
     kStatusSocketOption,
@@ -110,7 +110,7 @@ Table clientsTable(const std::vector<Value>& rows, Before& before) {
                  {"MSG/S", Align::right},
                  {"MESSAGES", Align::right},
                  {"BYTES", Align::right},
-                 {"BUSY%", Align::right},
+                 {"CPU%", Align::right},
                  {"TIME", Align::right},
                  {"RETAINED", Align::right}});
     for (const Value& row : rows) {
@@ -132,12 +132,17 @@ Table sessionsTable(const std::vector<Value>& rows, Before& before) {
                  {"MSG/S", Align::right},
                  {"MESSAGES", Align::right},
                  {"BYTES", Align::right},
+                 {"CPU%", Align::right},
+                 {"TIME", Align::right},
                  {"RETAINED", Align::right}});
     for (const Value& row : rows) {
+        const auto key = keyOf(row);
+        const double seconds = numberOf(row, "seconds");
         table.add({textOf(row, "reporter"), textOf(row, "pid"), textOf(row, "process"),
-                   textOf(row, "application"),
-                   before.rate(keyOf(row), "messages", numberOf(row, "messages"), 0), textOf(row, "messages"),
-                   bytesText(numberOf(row, "bytes")), bytesText(numberOf(row, "retained_bytes"))});
+                   textOf(row, "application"), before.rate(key, "messages", numberOf(row, "messages"), 0),
+                   textOf(row, "messages"), bytesText(numberOf(row, "bytes")),
+                   before.rate(key, "seconds", seconds * 100, 1), formatted("{}", fixed(seconds, 2)),
+                   bytesText(numberOf(row, "retained_bytes"))});
     }
     return table;
 }
@@ -213,14 +218,14 @@ ExitStatus run(const Arguments& arguments) {
     const StatusConnection connection(arguments);
     const auto ask = [&] { return connection.ask(view.showsSessions ? "sessions" : "clients"); };
     auto answer = ask();
-    if (const auto* const failure = std::get_if<StatusConnection::Failure>(&answer)) {
+    if (const auto* const failure = std::get_if<Unreachable>(&answer)) {
         return complain(failure->status, failure->text);
     }
     Terminal terminal;
     Before before;
     for (std::uint64_t pictures = 1;; ++pictures) {
         // A service that is started again is shown again.
-        const auto* const failure = std::get_if<StatusConnection::Failure>(&answer);
+        const auto* const failure = std::get_if<Unreachable>(&answer);
         terminal.show(failure != nullptr
                           ? std::vector<std::string>{failure->text}
                           : pictureOf(std::get<StatusDocument>(answer), view, before, terminal.size()));
@@ -241,9 +246,9 @@ constexpr Command kCommandTop{
     "top",
     "clients or sessions, those with most first, again and again",
     "[--sessions] [--sort messages|bytes|time|retained] [--interval SECONDS] [--count N]",
-    "TIME is what the service's queue has spent on a client's requests, in seconds, BUSY% the part of the "
-    "last interval\n"
-    "that it did; MSG/S is for the last interval, too. Ends with q or Ctrl-C. Where standard output is no "
+    "TIME is the processor time of a client's requests, or of those for a session, in seconds, CPU% what it "
+    "was of the last\n"
+    "interval; MSG/S is for the last interval, too. Ends with q or Ctrl-C. Where standard output is no "
     "terminal, the\n"
     "pictures follow one another.",
     kOptions,

@@ -3,11 +3,14 @@
 #include "base/Format.h"
 #include "client/Vocabulary.h"
 #include "tools/Command.h"
+#include "tools/KnownSettings.h"
 #include "tools/SinkFile.h"
 #include "wire/Vocabulary.h"
 
+#include <algorithm>
 #include <array>
 #include <cctype>
+#include <map>
 #include <string_view>
 
 namespace tamblo::tools {
@@ -16,8 +19,9 @@ namespace {
 
 /// What may stand for an option's value: words, or files.
 struct Values {
-    std::string words;
+    std::string words{};
     bool areFiles = false;
+    bool areFirst = false; ///< the words stand right behind the command only
 };
 
 void add(std::string& words, std::string_view word) {
@@ -48,23 +52,31 @@ template <std::size_t kSize> std::string wordsOf(const std::array<std::string_vi
 /// By the option's name, and by what its help puts in its value's place.
 Values valuesOf(const Option& option) {
     if (option.name == "--service-type") {
-        return {.words = wordsOf(wire::kServiceNames), .areFiles = false};
+        return {.words = wordsOf(wire::kServiceNames)};
     }
     if (option.value == "CATEGORY") {
-        return {.words = categoryWords(), .areFiles = false};
+        return {.words = categoryWords()};
     }
     if (option.value == "TYPE") {
-        return {.words = wordsOf(wire::kTypeNames), .areFiles = false};
+        return {.words = wordsOf(wire::kTypeNames)};
     }
-    if (option.value == "KIND") {
-        return {.words = "record line frame", .areFiles = false};
+    if (option.value.find('|') != option.value.npos) {
+        std::string words(option.value);
+        std::replace(words.begin(), words.end(), '|', ' ');
+        return {.words = std::move(words)};
     }
-    return {.words = {}, .areFiles = option.value == "FILE" || option.value == "PATH"};
+    return {.areFiles = option.value == "FILE" || option.value == "PATH"};
 }
 
-/// What a command's usage line names besides its options: words in lower case stand for themselves.
+/// What a command's usage line names first besides its options: words in lower case stand for themselves.
 Values argumentsOf(const Command& command) {
     Values values;
+    if (command.name == "notify") {
+        for (const KnownNotification& notification : knownNotifications()) {
+            add(values.words, notification.name);
+        }
+        return values;
+    }
     if (command.name == "tail") {
         for (const KnownSink& sink : knownSinks()) {
             add(values.words, sink.name);
@@ -72,6 +84,7 @@ Values argumentsOf(const Command& command) {
         values.areFiles = true;
         return values;
     }
+    values.areFirst = true;
     std::string_view rest = command.arguments;
     while (!rest.empty()) {
         const std::size_t end = rest.find_first_of(" |[]()");
@@ -80,9 +93,27 @@ Values argumentsOf(const Command& command) {
             word[0] != '-') {
             add(values.words, word);
         }
+        values.areFiles = values.areFiles || word == "DIRECTORY";
         rest.remove_prefix(end == rest.npos ? rest.size() : end + 1);
     }
     return values;
+}
+
+/// The preferences that the service reads: keys by domain.
+std::map<std::string_view, std::string> preferenceKeys() {
+    std::map<std::string_view, std::string> keys;
+    for (const KnownPreference& known : knownPreferences()) {
+        add(keys[known.domain], known.key);
+    }
+    return keys;
+}
+
+std::string preferenceDomains() {
+    std::string domains;
+    for (const auto& [domain, keys] : preferenceKeys()) {
+        add(domains, domain);
+    }
+    return domains;
 }
 
 std::string commandNames() {
@@ -138,8 +169,17 @@ void appendBashCommand(std::string& script, const Command& command) {
                                 own.words, own.areFiles ? "yes" : ""));
     });
     const Values arguments = argumentsOf(command);
-    script.append(
-        formatted("            words='{}' files={}\n", arguments.words, arguments.areFiles ? "yes" : ""));
+    script.append(formatted("            {}words='{}'\n            files={}\n",
+                            arguments.areFirst ? "((COMP_CWORD != 2)) || " : "", arguments.words,
+                            arguments.areFiles ? "yes" : ""));
+    if (command.name == "preference") {
+        script.append(formatted("            ((COMP_CWORD != 3)) || words='{}'\n", preferenceDomains()));
+        script.append("            ((COMP_CWORD != 4)) || case $previous in\n");
+        for (const auto& [domain, keys] : preferenceKeys()) {
+            script.append(formatted("                {}) words='{}' ;;\n", domain, keys));
+        }
+        script.append("            esac\n");
+    }
     script.append(formatted("            [[ $word != -* ]] || words='{}' files=\n", options));
     if (!values.empty()) {
         script.append("            case $previous in\n").append(values).append("            esac\n");
@@ -165,7 +205,9 @@ void appendZshCommand(std::string& script, const Command& command) {
             row.append(
                 formatted("'{}-{}[{}]{}' ", repeats, std::string_view(&option.letter, 1), help, value));
         }
-        script.append(row).append(formatted("'{}{}[{}]{}'", repeats, option.name, help, value));
+        // With the sign the value may stand behind one, or be the next word.
+        script.append(row).append(
+            formatted("'{}{}{}[{}]{}'", repeats, option.name, value.empty() ? "" : "=", help, value));
     });
     const Values arguments = argumentsOf(command);
     if (arguments.areFiles) {
@@ -174,6 +216,14 @@ void appendZshCommand(std::string& script, const Command& command) {
             arguments.words));
     } else if (!arguments.words.empty()) {
         script.append(formatted(" \\\n                '1:word:({})'", arguments.words));
+    }
+    if (command.name == "preference") {
+        script.append(
+            formatted(" \\\n                '2:domain:({})' '3:key:{case $words[3] in", preferenceDomains()));
+        for (const auto& [domain, keys] : preferenceKeys()) {
+            script.append(formatted(" ({}) compadd {} ;;", domain, keys));
+        }
+        script.append(" esac}'");
     }
     script.append("\n            ;;\n");
 }
@@ -186,6 +236,12 @@ std::string bashCompletion() {
                   "_tambloctl() {\n"
                   "    local word=${COMP_WORDS[COMP_CWORD]} previous=${COMP_WORDS[COMP_CWORD - 1]}\n"
                   "    local words='' files='' commands='{}'\n"
+                  "    # Of --option=value bash makes three words.\n"
+                  "    if [[ $word == = ]]; then\n"
+                  "        word=\n"
+                  "    elif [[ $previous == = ]]; then\n"
+                  "        previous=${COMP_WORDS[COMP_CWORD - 2]}\n"
+                  "    fi\n"
                   "    if ((COMP_CWORD == 1)); then\n"
                   "        words=\"$commands help --help --version\"\n"
                   "    fi\n"

@@ -1,69 +1,66 @@
 #include "tools/KnownSettings.h"
 
+#include "base/Format.h"
+#include "platform/Limits.h"
+#include "platform/PreferenceDomains.h"
+
 #include <algorithm>
 #include <array>
+#include <utility>
+#include <vector>
 
 namespace tamblo::tools {
 
 namespace {
 
-constexpr std::string_view kAnalytics = "com.vandra.tamblo.analytics";
-constexpr std::string_view kCallQuality = "com.vandra.tamblo.callquality";
-constexpr std::string_view kSinks = "com.vandra.tamblo.sinks";
-constexpr std::string_view kLimits = "com.vandra.tamblo.limits";
-constexpr std::string_view kCaptures = "com.vandra.tamblo.zrreporting";
-constexpr std::string_view kAccessories = "com.vandra.tamblo.accessories";
-constexpr std::string_view kPipeWire = "com.vandra.tamblo.pipewire";
-constexpr std::string_view kReporting = "com.vandra.tamblo";
-constexpr std::string_view kDashlo = "com.vandra.dashlo";
-
 using enum PreferenceKind;
 
-constexpr auto kPreferences = std::to_array<KnownPreference>({
-    {kAnalytics, "events_in_use", names,
-     "which events are recorded, exact or with one trailing *; absent: all"},
-    {kCallQuality, "backends", names, "the back ends of call quality; absent: [\"spool\"]; empty: none"},
-    {kSinks, "file_mode", octalText, "permissions of the sinks' files besides the owner's"},
-    {kSinks, "directory_mode", octalText, "the same of their directories"},
-    {kReporting, "device_name", any, "reported as the device's name"},
-    {kReporting, "disable_reporting", flag, "read, and nothing acts on it"},
-    {kDashlo, "spatial-audio-accessory-feature", any, "reported as stored"},
-    {kCaptures, "TalvixInvalidXyBackOffSeconds", number,
-     "internal builds: seconds between drafts; absent: no drafts"},
-    {kCaptures, "TalvixInvalidXyQLTlastRun", number, "the time of the last draft, which the service stores"},
-    {kCaptures, "enable_stackburst", flag, "internal builds: stack captures are wanted"},
-    {kCaptures, "io_buffer_size", number,
-     "frames: the least smallest_buffer_frame_size of an overload (512)"},
-    {kCaptures, "io_cycle", number, "the least io_cycle of an overload (0)"},
-    {kCaptures, "wait_time", number, "microseconds from the message to the capture (0)"},
-    {kAccessories, "registered", object, "the accessories known, which the service stores"},
-    {kPipeWire, "service_types", object, "read by tamblo-pipewire: names of service types by role"},
-    {kPipeWire, "service_types_of_applications", object, "the same by application, whatever the role"},
-    {kLimits, "reporters_of_message", limit, "reporters that a message names (128)"},
-    {kLimits, "entries_of_dictionary", limit, "entries of a payload or configuration (1024)"},
-    {kLimits, "key_bytes", limit, "bytes of a key (1024)"},
-    {kLimits, "bytes_of_keys", limit, "bytes of all keys of a frame (64 KiB)"},
-    {kLimits, "decoded_bytes_of_frame", limit, "bytes of a frame's values (4 MiB)"},
-    {kLimits, "delivered_bytes_of_message", limit, "those of a message, for each reporter (16 MiB)"},
-    {kLimits, "application_name_bytes", limit, "bytes of an application's name (512)"},
-    {kLimits, "configuration_bytes_of_session", limit, "bytes of a session's configuration (64 KiB)"},
-    {kLimits, "configuration_bytes_of_user", limit, "those of all of a user's sessions (8 MiB)"},
-    {kLimits, "previous_keys_of_session", limit, "keys whose previous values a session remembers (4096)"},
-    {kLimits, "sessions_of_connection", limit, "sessions of a connection (12288)"},
-    {kLimits, "sessions_of_user", limit, "sessions of a user (16384)"},
-    {kLimits, "connections_of_user", limit, "connections of a user (6144)"},
-    {kLimits, "retained_bytes_of_user", limit, "bytes that a user's sessions retain (64 MiB)"},
-    {kLimits, "retained_bytes", limit, "bytes that all sessions retain (112 MiB)"},
-    {kLimits, "waiting_requests", limit, "requests of a connection that wait (1024)"},
-    {kLimits, "waiting_bytes", limit, "their bytes (4 MiB)"},
-    {kLimits, "waiting_bytes_of_user", limit, "those of a user's requests (8 MiB)"},
-    {kLimits, "unfinished_bytes_of_user", limit, "bytes of frames that have begun (8 MiB)"},
-    {kLimits, "frame_seconds", limit, "seconds without progress of such a frame (10)"},
-    {kLimits, "reply_bytes", limit, "bytes of replies that a socket has refused (4 MiB)"},
-    {kLimits, "reply_bytes_of_user", limit, "those of all of a user's (16 MiB)"},
-    {kLimits, "report_files", limit, "summary files, and performance files (256)"},
-    {kLimits, "report_bytes", limit, "their bytes (256 MiB)"},
-});
+/// What the service takes for a limit that no preference sets: "4096", and of bytes "64 KiB".
+std::string defaultText(const LimitRow& row) {
+    const std::size_t number = Limits{}.*row.member;
+    if (row.name.find("bytes") != std::string_view::npos) {
+        for (const auto& [size, unit] : {std::pair{1U << 20U, "MiB"}, {1U << 10U, "KiB"}}) {
+            if (number % size == 0) {
+                return formatted("{} {}", number / size, unit);
+            }
+        }
+    }
+    return formatted("{}", number);
+}
+
+std::vector<KnownPreference> makePreferences() {
+    std::vector<KnownPreference> all{
+        {kAnalyticsDomain, "events_in_use", names,
+         "which events are recorded, exact or with one trailing *; absent: all"},
+        {kCallQualityDomain, "backends", names,
+         "the back ends of call quality; absent: [\"spool\"]; empty: none"},
+        {kSinksDomain, "file_mode", octalText, "permissions of the sinks' files besides the owner's"},
+        {kSinksDomain, "directory_mode", octalText, "the same of their directories"},
+        {kReportingDomain, "device_name", any, "reported as the device's name"},
+        {kReportingDomain, "disable_reporting", flag, "read, and nothing acts on it"},
+        {ZRReportingMessageKeySpatialAudioAccessoryFeatureDomain, "spatial-audio-accessory-feature", any,
+         "reported as stored"},
+        {kCapturesDomain, "TalvixInvalidXyBackOffSeconds", number,
+         "internal builds: seconds between drafts; absent: no drafts"},
+        {kCapturesDomain, "TalvixInvalidXyQLTlastRun", number,
+         "the time of the last draft, which the service stores"},
+        {kCapturesDomain, "enable_stackburst", flag, "internal builds: stack captures are wanted"},
+        {kCapturesDomain, "io_buffer_size", number,
+         "frames: the least smallest_buffer_frame_size of an overload (512)"},
+        {kCapturesDomain, "io_cycle", number, "the least io_cycle of an overload (0)"},
+        {kCapturesDomain, "wait_time", number, "microseconds from the message to the capture (0)"},
+        {kAccessoriesDomain, "registered", object, "the accessories known, which the service stores"},
+        {kPipeWireDomain, "service_types", object, "read by tamblo-pipewire: names of service types by role"},
+        {kPipeWireDomain, "service_types_of_applications", object,
+         "the same by application, whatever the role"},
+    };
+    for (const LimitRow& row : kLimitRows) {
+        all.push_back({kLimitsDomain, row.name, limit, formatted("{} ({})", row.what, defaultText(row))});
+    }
+    all.push_back({kLimitsDomain, "report_files", limit, "summary files, and performance files (256)"});
+    all.push_back({kLimitsDomain, "report_bytes", limit, "bytes of these files (256 MiB)"});
+    return all;
+}
 
 constexpr auto kNotifications = std::to_array<KnownNotification>({
     {"com.vandra.tamblo.reporting", "read: preferences of com.vandra.tamblo have changed"},
@@ -81,20 +78,21 @@ bool isOctal(std::string_view text) {
 
 } // namespace
 
-std::span<const KnownPreference> knownPreferences() noexcept {
-    return kPreferences;
+std::span<const KnownPreference> knownPreferences() {
+    static const std::vector<KnownPreference> all = makePreferences();
+    return all;
 }
 
-const KnownPreference* findKnownPreference(std::string_view domain, std::string_view key) noexcept {
-    const auto found =
-        std::find_if(kPreferences.begin(), kPreferences.end(), [&](const KnownPreference& known) {
-            return known.domain == domain && known.key == key;
-        });
-    return found == kPreferences.end() ? nullptr : &*found;
+const KnownPreference* findKnownPreference(std::string_view domain, std::string_view key) {
+    const auto all = knownPreferences();
+    const auto found = std::find_if(all.begin(), all.end(), [&](const KnownPreference& known) {
+        return known.domain == domain && known.key == key;
+    });
+    return found == all.end() ? nullptr : &*found;
 }
 
 bool isServiceDomain(std::string_view domain) noexcept {
-    return domain == kReporting || domain.starts_with("com.vandra.tamblo.");
+    return domain == kReportingDomain || domain.starts_with("com.vandra.tamblo.");
 }
 
 bool isOfKind(PreferenceKind kind, const Value& value) {

@@ -4,6 +4,7 @@
 
 #include <cstdint>
 #include <span>
+#include <string>
 #include <string_view>
 
 /// What the service reads and posts besides requests, as tables for people: `preference set` holds values
@@ -24,13 +25,12 @@ struct KnownPreference {
     std::string_view domain;
     std::string_view key;
     PreferenceKind kind;
-    std::string_view what;
+    std::string what;
 };
 
-[[nodiscard]] std::span<const KnownPreference> knownPreferences() noexcept;
+[[nodiscard]] std::span<const KnownPreference> knownPreferences();
 /// Null for one that the service does not read.
-[[nodiscard]] const KnownPreference* findKnownPreference(std::string_view domain,
-                                                         std::string_view key) noexcept;
+[[nodiscard]] const KnownPreference* findKnownPreference(std::string_view domain, std::string_view key);
 /// Whether the domain is one of the service's own.
 [[nodiscard]] bool isServiceDomain(std::string_view domain) noexcept;
 /// Whether the service takes such a value.

@@ -26,13 +26,11 @@ bool LiveRecorder::take(std::string_view line) {
         ++leftOut_;
         return true;
     }
-    if (const Value* error = record->find("error")) {
-        refusal_ = plainText(*error);
-        return false;
-    }
     if (const Value* leftOut = record->find("left_out")) {
         leftOut_ += leftOut->unsignedValue();
-        return true;
+        const auto session = hasBegun_ ? session_() : std::nullopt;
+        hasStopped_ = hasBegun_ && (!session || member(*session, "state").stringValue() == "stopped");
+        return !hasStopped_;
     }
     const auto type = static_cast<client::EventType>(member(*record, "type").unsignedValue());
     const bool isStarted = member(*record, "started").boolValue();
@@ -72,9 +70,10 @@ void LiveRecorder::begin(const Dictionary& record, bool isAtStart) {
     hasBeginning_ = isAtStart;
     start_ = member(record, "time").doubleValue();
     serviceType_ = member(record, "service").stringValue();
-    const std::optional<Dictionary> configuration = configuration_();
-    hasConfiguration_ = configuration.has_value();
-    writer_.writeHeader(serviceType_, configuration.value_or(Dictionary()),
+    const std::optional<Dictionary> session = session_();
+    const Value& configuration = session ? member(*session, "configuration") : Value();
+    hasConfiguration_ = configuration.isDictionary();
+    writer_.writeHeader(serviceType_, hasConfiguration_ ? configuration.dictionaryValue() : Dictionary(),
                         {{"reporter", reporterID_}, {"time", start_}});
 }
 

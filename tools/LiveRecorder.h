@@ -16,21 +16,21 @@ namespace tamblo::tools {
 /// started already, to its stop.
 class LiveRecorder {
 public:
-    /// Asked once, when the session is first seen.
-    using ConfigurationFunction = UniqueFunction<std::optional<Dictionary>()>;
+    /// What the service's status has of the reporter's session, if it is there. Asked when the session is
+    /// first seen, for its configuration, and when messages were left out: its stop may be one of them.
+    using SessionFunction = UniqueFunction<std::optional<Dictionary>()>;
 
-    LiveRecorder(std::int64_t reporterID, SessionFileWriter& writer, ConfigurationFunction configuration)
-        : reporterID_(reporterID), writer_(writer), configuration_(std::move(configuration)) {}
+    LiveRecorder(std::int64_t reporterID, SessionFileWriter& writer, SessionFunction session)
+        : reporterID_(reporterID), writer_(writer), session_(std::move(session)) {}
 
     /// Whether the session goes on.
     [[nodiscard]] bool take(std::string_view line);
 
     [[nodiscard]] bool hasBegun() const noexcept { return hasBegun_; }
+    /// Whether it is known to have ended.
     [[nodiscard]] bool hasStopped() const noexcept { return hasStopped_; }
     [[nodiscard]] const std::string& serviceType() const noexcept { return serviceType_; }
     [[nodiscard]] std::uint64_t withoutNull() const noexcept { return withoutNull_; }
-    /// Why there is no tap; empty when there is one.
-    [[nodiscard]] const std::string& refusal() const noexcept { return refusal_; }
     /// For people: a line for each thing that is missing; empty when nothing is.
     [[nodiscard]] std::string missing() const;
 
@@ -39,7 +39,7 @@ private:
 
     const std::int64_t reporterID_;
     SessionFileWriter& writer_;
-    ConfigurationFunction configuration_;
+    SessionFunction session_;
     bool hasBegun_ = false;
     bool hasBeginning_ = true;
     bool hasConfiguration_ = true;
@@ -49,7 +49,6 @@ private:
     std::uint64_t leftOut_ = 0;
     std::uint64_t large_ = 0;
     std::uint64_t withoutNull_ = 0;
-    std::string refusal_;
 };
 
 } // namespace tamblo::tools

@@ -3,6 +3,7 @@
 #include "base/Format.h"
 #include "tools/Command.h"
 
+#include <algorithm>
 #include <cctype>
 
 namespace tamblo::tools {
@@ -37,9 +38,21 @@ void appendHead(std::string& page, std::string_view name, std::string_view summa
                           escaped(title), version, escaped(name), escaped(summary)));
 }
 
-/// Lines that stand as they are: what the help has laid out in columns.
-void appendAsItStands(std::string& page, std::string_view text) {
-    page.append(".nf\n").append(escaped(text)).append("\n.fi\n");
+/// Text of the help: paragraphs are filled, as man sees fit; lines that begin with a space, which are laid
+/// out in columns, stand as they are.
+void appendText(std::string& page, std::string_view text) {
+    bool isLaidOut = false;
+    while (!text.empty()) {
+        const std::size_t end = std::min(text.find('\n'), text.size());
+        const std::string_view line = text.substr(0, end);
+        text.remove_prefix(std::min(end + 1, text.size()));
+        if (line.starts_with(' ') != isLaidOut) {
+            isLaidOut = !isLaidOut;
+            page.append(isLaidOut ? ".nf\n" : ".fi\n");
+        }
+        page.append(line.empty() ? ".PP" : escaped(line)).append("\n");
+    }
+    page.append(isLaidOut ? ".fi\n" : "");
 }
 
 void appendOption(std::string& page, const Option& option) {
@@ -75,8 +88,9 @@ std::string manualPage(std::string_view version) {
                               escaped(command->summary)));
     }
     page.append(".SH NOTES\n");
-    appendAsItStands(page, text.substr(rest));
-    return page.append(".SH SEE ALSO\ntamblod(8), tamblo\\-protocol(7), tamblo\\-sinks(5)\n");
+    appendText(page, text.substr(rest));
+    return page.append(
+        ".SH SEE ALSO\ntamblod(8), tamblo\\-status(7), tamblo\\-protocol(7), tamblo\\-sinks(5)\n");
 }
 
 std::string manualPageOf(const Command& command, std::string_view version) {
@@ -87,7 +101,7 @@ std::string manualPageOf(const Command& command, std::string_view version) {
         formatted(".SH SYNOPSIS\ntambloctl {} {}\n", escaped(command.name), escaped(command.arguments)));
     if (!command.details.empty()) {
         page.append(".SH DESCRIPTION\n");
-        appendAsItStands(page, command.details);
+        appendText(page, command.details);
     }
     page.append(".SH OPTIONS\n");
     for (const Option& option : command.options) {

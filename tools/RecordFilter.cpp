@@ -1,5 +1,6 @@
 #include "tools/RecordFilter.h"
 
+#include "base/NamePattern.h"
 #include "tools/Payload.h"
 #include "tools/SinkFile.h"
 
@@ -21,10 +22,6 @@ const Value* findKey(const Dictionary& record, std::string_view key) {
 }
 
 } // namespace
-
-bool matchesPattern(std::string_view name, std::string_view pattern) {
-    return pattern.ends_with('*') ? name.starts_with(pattern.substr(0, pattern.size() - 1)) : name == pattern;
-}
 
 void RecordFilter::wantKey(std::string_view text) {
     const std::size_t equals = text.find('=');

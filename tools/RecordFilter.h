@@ -11,9 +11,6 @@
 
 namespace tamblo::tools {
 
-/// Whether a name is the pattern, or, where that ends with `*`, begins with what stands in front.
-[[nodiscard]] bool matchesPattern(std::string_view name, std::string_view pattern);
-
 /// Which records of a sink are wanted: of one of the events named, with all of the keys, of a time, and of a
 /// reporter.
 class RecordFilter {

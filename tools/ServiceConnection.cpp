@@ -38,25 +38,9 @@ std::optional<ExitStatus> ServiceConnection::connect() {
     if (client_.connect()) {
         return std::nullopt;
     }
-    if (client_.socketPath().empty()) {
-        return complain(ExitStatus::unreachable,
-                        "the service's directory is not known: set RUNTIME_DIRECTORY or XDG_RUNTIME_DIR");
-    }
-    const std::string& path = client_.socketPath();
-    switch (const int fault = faultOfConnecting(path)) {
-    case ENAMETOOLONG:
-        return complain(ExitStatus::usage,
-                        formatted("{} is too long for a socket's path: it has {} bytes of at most {}", path,
-                                  path.size(), sizeof(sockaddr_un::sun_path) - 1));
-    case ENOENT:
-    case ECONNREFUSED:
-    case 0: // it came up meanwhile
-        return complain(ExitStatus::unreachable,
-                        formatted("no service answers at {}: start tamblod, or set RUNTIME_DIRECTORY", path));
-    default:
-        return complain(ExitStatus::unreachable,
-                        formatted("cannot connect to {}: {}", path, describeFault(fault, path)));
-    }
+    const Unreachable why =
+        describeUnreachable(client_.socketPath(), faultOfConnecting(client_.socketPath()));
+    return complain(why.status, why.text);
 }
 
 ExitStatus ServiceConnection::complainAbout(const client::Error& error) {
@@ -66,6 +50,31 @@ ExitStatus ServiceConnection::complainAbout(const client::Error& error) {
     }
     return complain(ExitStatus::failed, formatted("the service refused: {} {}{}{}", error.domain, error.code,
                                                   error.message.empty() ? "" : ": ", error.message));
+}
+
+Unreachable describeUnreachable(const std::string& path, int fault) {
+    if (path.empty()) {
+        return {.status = ExitStatus::unreachable,
+                .text = "the service's directory is not known: set RUNTIME_DIRECTORY or XDG_RUNTIME_DIR"};
+    }
+    switch (fault) {
+    case ENAMETOOLONG:
+        return {.status = ExitStatus::usage,
+                .text = formatted("{} is too long for a socket's path: it has {} bytes of at most {}", path,
+                                  path.size(), sizeof(sockaddr_un::sun_path) - 1)};
+    case ENOENT:
+    case ECONNREFUSED:
+    case 0: // it came up meanwhile
+        return {.status = ExitStatus::unreachable,
+                .text = formatted("no service answers at {}: start tamblod, or set RUNTIME_DIRECTORY", path)};
+    case EAGAIN:
+        return {.status = ExitStatus::unreachable,
+                .text =
+                    formatted("the service at {} takes no more connections: it is busy, or stopped", path)};
+    default:
+        return {.status = ExitStatus::unreachable,
+                .text = formatted("cannot connect to {}: {}", path, describeFault(fault, path))};
+    }
 }
 
 std::string notAReporterID(std::string_view text) {

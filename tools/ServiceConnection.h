@@ -19,6 +19,14 @@ inline constexpr Option kTimeoutOption{
 inline constexpr Option kJsonOption{
     .name = "--json", .value = "", .help = "print JSON, for scripts", .letter = 'j'};
 
+/// Why a socket of the service cannot be reached, for people, and what a command then exits with.
+struct Unreachable {
+    ExitStatus status;
+    std::string text;
+};
+/// `fault` is the `errno` of the attempt; `ENAMETOOLONG` for a path that no socket can have.
+[[nodiscard]] Unreachable describeUnreachable(const std::string& path, int fault);
+
 /// A command's connection to the service, without a thread and without a second attempt.
 class ServiceConnection {
 public:

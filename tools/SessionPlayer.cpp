@@ -4,6 +4,7 @@
 #include "base/Json.h"
 #include "tools/Payload.h"
 #include "tools/SessionFile.h"
+#include "tools/TimeText.h"
 
 #include <algorithm>
 #include <cstdio>
@@ -20,10 +21,6 @@ namespace {
 constexpr std::uint64_t kMostUnderWay = 512;
 constexpr milliseconds kProgressInterval{100};
 constexpr double kLongestOffset = 1e8;
-
-double secondsSince1970() {
-    return std::chrono::duration<double>(std::chrono::system_clock::now().time_since_epoch()).count();
-}
 
 /// A name or a number as text, so that both are read alike.
 std::string wordOf(const Value* value, std::string_view usual) {
@@ -96,7 +93,7 @@ double SessionSpacing::due(const SessionLine& line) {
 
 std::optional<std::string> SessionPlayer::play(std::istream& lines, const std::string& name) {
     start_ = Clock::now();
-    startTimestamp_ = secondsSince1970();
+    startTimestamp_ = presentTime();
     SessionSpacing spacing;
     std::optional<std::string> wrong;
     std::string text;
@@ -138,7 +135,7 @@ void SessionPlayer::waitUntil(Clock::time_point time) {
 
 double SessionPlayer::timestampFor(double due) const {
     if (!options_.recordedLength) {
-        return secondsSince1970();
+        return presentTime();
     }
     const double playingTime = options_.speed ? *options_.recordedLength / *options_.speed : 0;
     return startTimestamp_ + playingTime - (*options_.recordedLength - due);

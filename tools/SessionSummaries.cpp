@@ -1,9 +1,9 @@
 #include "tools/SessionSummaries.h"
 
 #include "base/Format.h"
-#include "base/Utf8.h"
 #include "tools/AccessFault.h"
 #include "tools/Payload.h"
+#include "tools/Table.h"
 
 #include <algorithm>
 #include <array>
@@ -113,21 +113,6 @@ const Value& valueOf(const Dictionary& payload, std::string_view key) {
     return value != nullptr ? *value : nothing;
 }
 
-std::size_t widthOf(std::string_view text) noexcept {
-    return text.size() - static_cast<std::size_t>(std::ranges::count_if(text, isUtf8Continuation));
-}
-
-/// Cut off so that it takes no more than so many characters.
-std::string shortened(std::string text, std::size_t widest) {
-    if (widthOf(text) <= widest) {
-        return text;
-    }
-    while (widthOf(text) >= widest) {
-        text.pop_back();
-    }
-    return text + "…";
-}
-
 std::string cellOf(const Dictionary& payload, const Column& column) {
     const Value* value = payload.find(column.key);
     if (value == nullptr) {
@@ -142,42 +127,26 @@ std::string cellOf(const Dictionary& payload, const Column& column) {
     if (column.style == Style::place) {
         return plainText(*value) + "/" + plainText(valueOf(payload, "msgcnt"));
     }
-    return shortened(plainText(*value), column.widest);
+    return harmless(plainText(*value), column.widest);
 }
 
-void appendCell(std::string& line, std::string_view cell, std::size_t width, bool isToTheLeft) {
-    const std::string blanks(width - widthOf(cell), ' ');
-    line.append("  ");
-    line.append(isToTheLeft ? cell : blanks).append(isToTheLeft ? blanks : cell);
-}
-
-/// Columns as wide as their widest cell, the first row their headings.
 void appendTable(std::string& out, std::span<const Column> columns,
                  const std::vector<const Dictionary*>& payloads) {
-    std::vector<std::vector<std::string>> rows(1);
+    std::vector<Table::Column> headings;
     for (const Column& column : columns) {
-        rows[0].emplace_back(column.heading);
+        const bool isToTheLeft = column.style == Style::text || column.style == Style::yesOrNo;
+        headings.push_back({column.heading, isToTheLeft ? Table::Align::left : Table::Align::right});
     }
+    Table table(std::move(headings));
     for (const Dictionary* payload : payloads) {
-        std::vector<std::string>& row = rows.emplace_back();
+        std::vector<std::string> cells;
         for (const Column& column : columns) {
-            row.push_back(cellOf(*payload, column));
+            cells.push_back(cellOf(*payload, column));
         }
+        table.add(std::move(cells));
     }
-    std::vector<std::size_t> widths(columns.size());
-    for (const auto& row : rows) {
-        for (std::size_t i = 0; i < row.size(); ++i) {
-            widths[i] = std::max(widths[i], widthOf(row[i]));
-        }
-    }
-    for (const auto& row : rows) {
-        std::string line;
-        for (std::size_t i = 0; i < row.size(); ++i) {
-            const Style style = columns[i].style;
-            appendCell(line, row[i], widths[i], style == Style::text || style == Style::yesOrNo);
-        }
-        line.resize(line.find_last_not_of(' ') + 1);
-        out.append(line).append("\n");
+    for (const std::string& line : table.lines()) {
+        out.append("  ").append(line, 0, line.find_last_not_of(' ') + 1).append("\n");
     }
 }
 
@@ -190,7 +159,7 @@ void appendEntries(std::string& out, const Dictionary& payload) {
             line.clear();
         }
         if (!heading.empty()) {
-            appendCell(line, heading, kHeadingWidth, true);
+            line.append("  ").append(heading).append(kHeadingWidth - heading.size(), ' ');
         }
         line.append("  ").append(value.heading).append(" ").append(cellOf(payload, value));
     }

@@ -1,11 +1,11 @@
 #include "tools/SinkSnapshot.h"
 
 #include "base/Format.h"
+#include "tools/AccessFault.h"
 #include "tools/SinkFile.h"
 
 #include <algorithm>
 #include <cerrno>
-#include <cstring>
 #include <utility>
 
 #include <fcntl.h>
@@ -36,8 +36,8 @@ void SinkSnapshot::open(const std::string& path) {
     struct stat status {};
     FileDescriptor descriptor(::open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK));
     if (!descriptor.isOpen() || ::fstat(descriptor.get(), &status) != 0) {
-        if (errno != ENOENT && problem_.empty()) {
-            problem_ = formatted("cannot read {}: {}", path, std::strerror(errno));
+        if (const int fault = errno; fault != ENOENT && problem_.empty()) {
+            problem_ = formatted("cannot read {}: {}", path, describeFault(fault, path));
         }
         return;
     }

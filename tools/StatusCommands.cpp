@@ -7,6 +7,7 @@
 
 #include <string>
 #include <utility>
+#include <vector>
 
 // The commands that print one document of the status socket.
 namespace tamblo::tools {
@@ -19,15 +20,16 @@ constexpr Option kOptions[] = {kJsonOption, kStatusSocketOption};
 template <typename Render>
 ExitStatus show(const Arguments& arguments, std::string_view request, Render render) {
     const auto answer = StatusConnection(arguments).ask(request);
-    if (const auto* const failure = std::get_if<StatusConnection::Failure>(&answer)) {
+    if (const auto* const failure = std::get_if<Unreachable>(&answer)) {
         return complain(failure->status, failure->text);
     }
     const auto& document = std::get<StatusDocument>(answer);
+    const std::vector<std::string> lines = render(document);
     if (arguments.has("--json")) {
         printLine(std::string_view(document.text).substr(0, document.text.find('\n')));
         return ExitStatus::done;
     }
-    for (const std::string& line : render(document)) {
+    for (const std::string& line : lines) {
         printLine(line);
     }
     return ExitStatus::done;
@@ -67,7 +69,7 @@ ExitStatus showSession(const Arguments& arguments) {
             isFound = !document["sessions"].arrayValue().empty();
             return sessionDetailLines(document);
         });
-    if (status == ExitStatus::done && !isFound && !arguments.has("--json")) {
+    if (status == ExitStatus::done && !isFound) {
         return complain(ExitStatus::failed, formatted("nobody has a session of reporter {}", *reporter));
     }
     return status;
@@ -80,14 +82,14 @@ constexpr Command kCommandStatus{
     "Limits are those that are in use, have been reached, or are not the default; --json has all of them, "
     "and "
     "all\n"
-    "counters. docs/status.md says what each means, and what to do about it.",
+    "counters. docs/status.md, which is tamblo-status(7), says what each means.",
     kOptions,
     status,
 };
 
 constexpr Command kCommandClients{
     "clients",  "the clients that are connected",
-    "[--json]", "SECONDS is what the service's queue has spent on a client's requests.",
+    "[--json]", "SECONDS is the processor time of a client's requests.",
     kOptions,   clients,
 };
 

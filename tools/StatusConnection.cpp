@@ -13,6 +13,7 @@
 
 #include <poll.h>
 #include <sys/socket.h>
+#include <sys/time.h>
 
 namespace tamblo::tools {
 
@@ -60,17 +61,14 @@ const Value& StatusDocument::member(const Value& object, std::string_view name) 
 
 StatusConnection::StatusConnection(const Arguments& arguments) : path_(pathFrom(arguments)) {}
 
-std::variant<FileDescriptor, StatusConnection::Failure>
-StatusConnection::send(std::string_view request) const {
-    if (path_.empty()) {
-        return Failure{ExitStatus::unreachable,
-                       "the service's directory is not known: set RUNTIME_DIRECTORY or XDG_RUNTIME_DIR"};
-    }
+std::variant<FileDescriptor, Unreachable> StatusConnection::send(std::string_view request) const {
     const auto address = LocalAddress::of(path_);
     FileDescriptor socket(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
+    // A service that accepts nobody is not waited for without end.
+    constexpr timeval patience{.tv_sec = kPatience / 1000, .tv_usec = 0};
+    (void)::setsockopt(socket.get(), SOL_SOCKET, SO_SNDTIMEO, &patience, sizeof patience);
     if (!address || ::connect(socket.get(), address->get(), address->size()) != 0) {
-        return Failure{ExitStatus::unreachable,
-                       formatted("no service answers at {}: start tamblod, or set RUNTIME_DIRECTORY", path_)};
+        return describeUnreachable(path_, address ? errno : ENAMETOOLONG);
     }
     const std::string line = formatted("{}\n", request);
     // One that is turned away may have been sent the reason and the end already.
@@ -78,24 +76,24 @@ StatusConnection::send(std::string_view request) const {
     return socket;
 }
 
-std::variant<StatusDocument, StatusConnection::Failure>
-StatusConnection::ask(std::string_view request) const {
+std::variant<StatusDocument, Unreachable> StatusConnection::ask(std::string_view request) const {
     auto connection = send(request);
-    if (auto* const failure = std::get_if<Failure>(&connection)) {
+    if (auto* const failure = std::get_if<Unreachable>(&connection)) {
         return std::move(*failure);
     }
     const auto& socket = std::get<FileDescriptor>(connection);
     auto text = readToEnd(socket.get());
     if (!text) {
-        return Failure{ExitStatus::failed, "the service did not answer in time"};
+        return Unreachable{ExitStatus::failed, "the service did not answer in time"};
     }
     auto value = readJson(*text);
     if (const auto* const wrong = std::get_if<JsonError>(&value)) {
-        return Failure{ExitStatus::failed, formatted("the service's answer is no JSON: {}", wrong->message)};
+        return Unreachable{ExitStatus::failed,
+                           formatted("the service's answer is no JSON: {}", wrong->message)};
     }
     StatusDocument document{std::move(*text), std::get<Value>(std::move(value))};
     if (const Value& error = document["error"]; error.isString()) {
-        return Failure{ExitStatus::failed, std::string(error.stringValue())};
+        return Unreachable{ExitStatus::failed, std::string(error.stringValue())};
     }
     return document;
 }

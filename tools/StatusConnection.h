@@ -3,6 +3,7 @@
 #include "base/Value.h"
 #include "os/FileDescriptor.h"
 #include "tools/Command.h"
+#include "tools/ServiceConnection.h"
 
 #include <string>
 #include <string_view>
@@ -28,14 +29,9 @@ class StatusConnection {
 public:
     explicit StatusConnection(const Arguments& arguments);
 
-    /// Why there is no document, and what a command then exits with.
-    struct Failure {
-        ExitStatus status;
-        std::string text;
-    };
     /// A connection on which the request has been sent.
-    [[nodiscard]] std::variant<FileDescriptor, Failure> send(std::string_view request) const;
-    [[nodiscard]] std::variant<StatusDocument, Failure> ask(std::string_view request) const;
+    [[nodiscard]] std::variant<FileDescriptor, Unreachable> send(std::string_view request) const;
+    [[nodiscard]] std::variant<StatusDocument, Unreachable> ask(std::string_view request) const;
 
 private:
     const std::string path_;

@@ -17,6 +17,10 @@ const Value& member(const Value& object, std::string_view name) {
     return StatusDocument::member(object, name);
 }
 
+bool isPresent(const Value& object, std::string_view name) {
+    return object.isDictionary() && object.dictionaryValue().contains(name);
+}
+
 double numberOf(const Value& object, std::string_view name) {
     return member(object, name).doubleValue();
 }
@@ -38,9 +42,10 @@ std::uint64_t sumOf(const StatusDocument& document, std::string_view family) {
 }
 
 std::string fill(const Value& limit) {
-    const Value& used = member(limit, "used");
     const double value = numberOf(limit, "value");
-    return used.isNumber() && value > 0 ? formatted("{} %", fixed(used.doubleValue() / value * 100, 1)) : "";
+    return isPresent(limit, "used") && value > 0
+               ? formatted("{} %", fixed(numberOf(limit, "used") / value * 100, 1))
+               : "";
 }
 
 bool isOfInterest(const Value& limit) {
@@ -105,6 +110,11 @@ void appendErrors(std::vector<std::string>& lines, const StatusDocument& documen
     }
 }
 
+/// Nothing for a session that was never started.
+std::string lengthText(const Value& session) {
+    return isPresent(session, "length") ? durationText(numberOf(session, "length")) : "";
+}
+
 } // namespace
 
 std::string textOf(const Value& object, std::string_view name) {
@@ -165,15 +175,19 @@ std::vector<std::string> sessionLines(const StatusDocument& document) {
                  {"APPLICATION"},
                  {"SERVICE"},
                  {"STATE"},
+                 {"LENGTH", Align::right},
                  {"MESSAGES", Align::right},
                  {"RECORDED", Align::right},
                  {"BYTES", Align::right},
+                 {"SECONDS", Align::right},
                  {"RETAINED", Align::right}});
     for (const Value& session : document["sessions"].arrayValue()) {
         table.add({textOf(session, "reporter"), textOf(session, "pid"), textOf(session, "process"),
                    textOf(session, "application"), textOf(session, "service"), textOf(session, "state"),
-                   textOf(session, "messages"), textOf(session, "recorded"),
-                   bytesText(numberOf(session, "bytes")), bytesText(numberOf(session, "retained_bytes"))});
+                   lengthText(session), textOf(session, "messages"), textOf(session, "recorded"),
+                   bytesText(numberOf(session, "bytes")),
+                   formatted("{}", fixed(numberOf(session, "seconds"), 3)),
+                   bytesText(numberOf(session, "retained_bytes"))});
     }
     return table.lines();
 }
@@ -198,6 +212,15 @@ std::vector<std::string> sessionDetailLines(const StatusDocument& document) {
             workers.append(workers.empty() ? "" : ", ").append(worker.stringValue());
         }
         lines.push_back(formatted("workers: {}", workers));
+        if (isPresent(session, "start")) {
+            lines.push_back(formatted("started: {}, for {}",
+                                      formatRfc3339(numberOf(session, "start")).value_or("-"),
+                                      lengthText(session)));
+        }
+        if (isPresent(session, "values_left_out")) {
+            lines.push_back(
+                formatted("{} values that take too much are not shown", textOf(session, "values_left_out")));
+        }
         const std::pair<std::string_view, std::string_view> kParts[] = {
             {"CONFIGURATION", "configuration"}, {"LATEST VALUE OF", "previous_values"}};
         for (const auto& [title, name] : kParts) {

@@ -14,19 +14,14 @@ namespace {
 
 constexpr std::size_t kGap = 2;
 
-bool continuesCharacter(char byte) noexcept {
-    return (static_cast<unsigned char>(byte) & 0xC0U) == 0x80U;
-}
-
 std::size_t charactersOf(std::string_view text) noexcept {
-    return static_cast<std::size_t>(
-        std::ranges::count_if(text, [](char byte) { return !continuesCharacter(byte); }));
+    return text.size() - static_cast<std::size_t>(std::ranges::count_if(text, isUtf8Continuation));
 }
 
 std::string_view cutCharacters(std::string_view text, std::size_t most) noexcept {
     std::size_t at = 0;
     for (std::size_t left = most; at < text.size(); ++at) {
-        if (!continuesCharacter(text[at]) && left-- == 0) {
+        if (!isUtf8Continuation(text[at]) && left-- == 0) {
             break;
         }
     }
@@ -95,7 +90,11 @@ std::string bytesText(double bytes) {
 }
 
 std::string durationText(double seconds) {
-    const auto whole = static_cast<std::int64_t>(std::floor(std::max(seconds, 0.0)));
+    constexpr double kLongestTold = 1e12;
+    if (seconds < 0) {
+        return "-" + durationText(-seconds);
+    }
+    const auto whole = static_cast<std::int64_t>(std::min(std::floor(seconds), kLongestTold));
     if (whole < 60) {
         return formatted("{} s", whole);
     }

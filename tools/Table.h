@@ -37,7 +37,7 @@ private:
 [[nodiscard]] std::string harmless(std::string_view text, std::size_t most);
 /// "512 B", "1.2 MiB".
 [[nodiscard]] std::string bytesText(double bytes);
-/// "12 s", "3 min 5 s", "2 h 10 min", "4 d 3 h".
+/// "12 s", "3 min 5 s", "2 h 10 min", "4 d 3 h"; with a minus below zero, as a clock may have been set back.
 [[nodiscard]] std::string durationText(double seconds);
 
 } // namespace tamblo::tools

@@ -42,9 +42,11 @@ void readTap(const FileDescriptor& tap, std::FILE* output, TapLineFunction& take
         if (count <= 0) {
             return;
         }
+        const std::size_t before = held.size();
         held.append(bytes.data(), static_cast<std::size_t>(count));
         std::size_t start = 0;
-        for (std::size_t end = held.find('\n'); end != std::string::npos; end = held.find('\n', start)) {
+        for (std::size_t end = held.find('\n', before); end != std::string::npos;
+             end = held.find('\n', start)) {
             if (!take(std::string_view(held).substr(start, end - start))) {
                 return;
             }

@@ -122,6 +122,10 @@ std::optional<double> parseAge(std::string_view text) noexcept {
 
 } // namespace
 
+double presentTime() {
+    return std::chrono::duration<double>(std::chrono::system_clock::now().time_since_epoch()).count();
+}
+
 std::optional<double> parseMoment(std::string_view text, double now) {
     if (const auto age = parseAge(text)) {
         return now - *age;

@@ -5,6 +5,9 @@
 
 namespace tamblo::tools {
 
+/// The present, in seconds since 1970.
+[[nodiscard]] double presentTime();
+
 /// A moment as people type it, in seconds since 1970; nothing for what is none:
 ///
 ///   2026-03-01              the beginning of the day in UTC

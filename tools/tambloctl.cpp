@@ -71,10 +71,15 @@ ExitStatus run(const std::vector<std::string_view>& words) {
         std::fputs(helpForAll().c_str(), stderr);
         return ExitStatus::usage;
     }
-    if (words[0] == "--version" || words[0] == "-V") {
+    const bool asksForVersion = words[0] == "--version" || words[0] == "-V";
+    const bool asksForHelp = words[0] == "help" || words[0] == "--help" || words[0] == "-h";
+    if (words.size() > (asksForHelp ? 2U : 1U) && (asksForVersion || asksForHelp)) {
+        return complain(ExitStatus::usage,
+                        tamblo::formatted("\"{}\" has no place behind {}", words.back(), words[0]));
+    }
+    if (asksForVersion) {
         return printVersion();
     }
-    const bool asksForHelp = words[0] == "help" || words[0] == "--help" || words[0] == "-h";
     if (asksForHelp && words.size() == 1) {
         return print(helpForAll());
     }

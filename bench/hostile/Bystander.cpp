@@ -39,8 +39,7 @@ Bystander::Bystander(const std::string& socketPath)
 void Bystander::run(const std::string& socketPath, State& state) {
     FrameChannel channel(socketPath);
     channel.limitWaits(kLongestWait);
-    channel.createSession(kReporterID);
-    channel.startSession(kReporterID);
+    channel.beginSession(kReporterID);
     channel.finish();
     state.isResting = true;
     wire::Request request = messageFor(kReporterID, {});

@@ -133,8 +133,7 @@ private:
         try {
             FrameChannel channel(service_.socketPath());
             channel.limitWaits(Bystander::kLongestWait);
-            channel.createSession(kThirdReporterID);
-            channel.startSession(kThirdReporterID);
+            channel.beginSession(kThirdReporterID);
             Batches batches(channel);
             batches.send(kMeasuredMessages / 4, kThirdReporterID);
             const Meter meter(service_.pid());

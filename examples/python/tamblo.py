@@ -7,7 +7,8 @@
 
 A client is one connection, used by one thread. Every request waits for its answer: when `send` returns, the
 message has been recorded. What the service refuses is a `ServiceError`; a service that is not there, or does not
-answer in time, is an `OSError` (`FileNotFoundError`, `ConnectionRefusedError`, `TimeoutError`, ...).
+answer in time, is an `OSError` (`FileNotFoundError`, `ConnectionRefusedError`, `TimeoutError`, ...). What cannot be
+sent is a `ValueError`, `TypeError` or `OverflowError`, and nothing has been.
 
 What goes into a payload: str, int from -2**63 to 2**64-1, float, bool, bytes, datetime (without a time zone: local
 time), lists and tuples, and dicts with str for keys; `Single` for a float in single precision. None has no place in it.
@@ -17,6 +18,7 @@ import datetime
 import os
 import socket
 import struct
+import time
 
 SUBSYSTEMS = {"MIDI": 0x04000000, "Session": 0x08000000, "DSP": 0x10000000, "HAL": 0x20000000,
               "Routing": 0x40000000, "Toolbox": 0x80000000}
@@ -124,7 +126,11 @@ def _decode_at(data, at):
 # The words of the protocol, by name or by number.
 
 def _number(names, word):
-    return word if isinstance(word, int) else names.index(word)
+    if isinstance(word, int):
+        return word
+    if word not in names:
+        raise ValueError(f"{word!r} is none of {', '.join(names)}")
+    return names.index(word)
 
 
 def category(word):
@@ -132,7 +138,9 @@ def category(word):
     if isinstance(word, int):
         return word
     subsystem, _, kind = word.rpartition("_")
-    return (SUBSYSTEMS[subsystem] if subsystem else 0) | KINDS.index(kind)
+    if subsystem and subsystem not in SUBSYSTEMS:
+        raise ValueError(f"{subsystem!r} is none of {', '.join(SUBSYSTEMS)}")
+    return SUBSYSTEMS.get(subsystem, 0) | _number(KINDS, kind)
 
 
 def socket_path():
@@ -151,7 +159,9 @@ class Client:
     def __init__(self, path=None, timeout=5.0):
         self._socket = socket.socket(socket.AF_UNIX, socket.SOCK_STREAM)
         self._socket.settimeout(timeout)
+        self._timeout = timeout
         self._last_id = 0
+        self._received = bytearray()
         try:
             self._socket.connect(path or socket_path())
         except OSError:
@@ -182,9 +192,14 @@ class Client:
     def call(self, method, *parameters):
         """The result of a request by its name."""
         self._last_id += 1
-        self._write([0, self._last_id, method, list(parameters)])
+        try:
+            self._write([0, self._last_id, method, list(parameters)])
+        except (BrokenPipeError, ConnectionResetError):
+            # The service says why before it ends the connection: of a frame that is too long, say.
+            pass
+        deadline = None if self._timeout is None else time.monotonic() + self._timeout
         while True:
-            _, answered, error, result = self._read()
+            answered, error, result = self._read(deadline)
             # An error under the number 0 is about a frame whose own number is not known: this one's.
             if answered in (0, self._last_id) and error is not None:
                 raise ServiceError(error["domain"], error["code"], error.get("message", ""))
@@ -198,20 +213,37 @@ class Client:
 
     def _write(self, item):
         frame = encode(item)
-        self._socket.sendall(struct.pack("<I", len(frame)) + frame)
+        self._socket.settimeout(self._timeout)
+        try:
+            self._socket.sendall(struct.pack("<I", len(frame)) + frame)
+        except socket.timeout:
+            self.close()  # some of the frame may have been sent, and the rest never will be
+            raise
 
-    def _read(self):
-        length, = struct.unpack("<I", self._read_exactly(4))
-        return decode(self._read_exactly(length))
+    def _read(self, deadline):
+        """The next answer: its number, error and result. What has come of one stays for the next try."""
+        self._receive(4, deadline)
+        end = 4 + struct.unpack_from("<I", self._received)[0]
+        self._receive(end, deadline)
+        frame = bytes(self._received[4:end])
+        del self._received[:end]
+        try:
+            _, answered, error, result = decode(frame)
+            if error is not None:
+                error["domain"], error["code"]
+        except (ValueError, TypeError, LookupError, struct.error, RecursionError, OverflowError) as wrong:
+            self.close()
+            raise ConnectionError("the service's answer cannot be read") from wrong
+        return answered, error, result
 
-    def _read_exactly(self, count):
-        received = b""
-        while len(received) < count:
-            part = self._socket.recv(count - len(received))
+    def _receive(self, count, deadline):
+        while len(self._received) < count:
+            if deadline is not None:
+                self._socket.settimeout(max(deadline - time.monotonic(), 0.001))
+            part = self._socket.recv(65536)
             if not part:
                 raise ConnectionError("the service ended the connection")
-            received += part
-        return received
+            self._received += part
 
 
 class Session:
@@ -225,10 +257,14 @@ class Session:
 
     def __enter__(self):
         self._client.call("createReportingSession", self.reporter)
-        self._client.call("setServiceType", self._service_type, self.reporter)
-        if self._configuration is not None:
-            self._client.call("setConfiguration", self._configuration, self.reporter)
-        self._client.post("startReportingSessionForID", self.reporter)
+        try:
+            self._client.call("setServiceType", self._service_type, self.reporter)
+            if self._configuration is not None:
+                self._client.call("setConfiguration", self._configuration, self.reporter)
+            self._client.post("startReportingSessionForID", self.reporter)
+        except (ServiceError, TypeError, ValueError, OverflowError):
+            self._client.post("destroyReportingSession", self.reporter)
+            raise
         return self
 
     def __exit__(self, error, *_):

@@ -23,6 +23,7 @@ static bool run_session(tamblo_client* client, Seen* seen) {
     static const unsigned char bytes[] = {0, 1, 255};
     const int64_t reporters[] = {7};
     tamblo_payload* payload = tamblo_payload_create();
+    tamblo_payload_set_string(NULL, "nowhere", "x");
     tamblo_payload_set_string(payload, "gone", "x");
     tamblo_payload_clear(payload);
     tamblo_payload_set_string(payload, "string", "text");
@@ -47,6 +48,7 @@ static bool run_session(tamblo_client* client, Seen* seen) {
         tamblo_client_send(client, payload, TAMBLO_SUBSYSTEM_SESSION | TAMBLO_KIND_PLAYBACK,
                            TAMBLO_TYPE_START, reporters, 1, on_reply, seen) &&
         tamblo_client_send(client, payload, TAMBLO_KIND_VOLUME, TAMBLO_TYPE_GENERIC, NULL, 0, NULL, NULL) &&
+        tamblo_client_send(client, NULL, TAMBLO_KIND_VOLUME, TAMBLO_TYPE_GENERIC, NULL, 0, NULL, NULL) &&
         tamblo_client_stop_session(client, 7, on_reply, seen) &&
         tamblo_client_destroy_session(client, 7, NULL, NULL) &&
         tamblo_client_get_service_type(client, 7, on_reply, seen);

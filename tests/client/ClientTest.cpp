@@ -260,7 +260,7 @@ TEST(MessageWriter, WritesWhatTheServiceReadsAndNothingWhenDropped) {
 TEST(CApi, ACProgramRunsASessionAndItsPayloadArrivesAsItWasBuilt) {
     FakeService service;
     EXPECT_EQ(runCProgram(service.path().c_str()), 0);
-    ASSERT_TRUE(service.waitForRequests(11));
+    ASSERT_TRUE(service.waitForRequests(12));
     const std::uint8_t bytes[] = {0, 1, 255};
     const Dictionary expected{
         {"string", "text"},
@@ -281,6 +281,7 @@ TEST(CApi, ACProgramRunsASessionAndItsPayloadArrivesAsItWasBuilt) {
     EXPECT_EQ(requests[5].reporterIDs, std::vector<std::int64_t>{7});
     EXPECT_TRUE(requests[6].reporterIDs.empty());
     EXPECT_FALSE(requests[6].id);
+    EXPECT_TRUE(requests[7].dictionary.empty()) << "no payload";
 }
 
 } // namespace

@@ -1,11 +1,15 @@
 #include "platform/Counters.h"
 #include "platform/RequestTally.h"
 #include "platform/linux/status/StatusRequest.h"
+#include "tests/Files.h"
 
 #include <gtest/gtest.h>
 
 #include <chrono>
+#include <map>
+#include <regex>
 #include <set>
+#include <sstream>
 #include <string>
 #include <variant>
 #include <vector>
@@ -62,6 +66,42 @@ TEST(Counters, EachSlotHasOneName) {
     EXPECT_EQ(slots.size(), rows);
     // All slots but those of a histogram that stand behind its first.
     EXPECT_EQ(rows, counters::kFirstHistogram + static_cast<std::size_t>(counters::Histogram::count));
+}
+
+TEST(Counters, EachHasItsRowInTheDocuments) {
+    // The first column of the table says `family`, `family{label}` or `family{label="value"}`, a row may have
+    // several; values that are not there stand in the second one.
+    std::istringstream page(contentOf(EXAMPLES_DIR "/../docs/status.md"));
+    std::map<std::string, std::string> rows;
+    const std::regex name(R"re(`([a-z_]+)(\{[^}]*\})?`)re");
+    for (std::string line; std::getline(page, line) && line != "## What is now";) {
+        const std::string first = line.starts_with("| `") ? line.substr(0, line.find(" | ")) : "";
+        for (std::sregex_iterator match(first.begin(), first.end(), name), end; match != end; ++match) {
+            rows[(*match)[1]] += line;
+        }
+    }
+    const std::set<std::string> listedElsewhere{"method", "sink", "limit", "in_use"};
+    const std::regex label(R"re(([a-z_]+)="([^"]*)")re");
+    for (const counters::Family& family : counters::families()) {
+        if (family.isHistogram) {
+            continue;
+        }
+        const std::string text = rows[std::string(family.name)];
+        EXPECT_FALSE(text.empty()) << family.name;
+        for (const counters::Row& row : family.rows) {
+            for (std::sregex_iterator match(row.labels.begin(), row.labels.end(), label), end; match != end;
+                 ++match) {
+                const std::string value = (*match)[2];
+                const bool isNamed =
+                    text.find("`" + value + "`") != text.npos || text.find("\"" + value + "\"") != text.npos;
+                EXPECT_TRUE(isNamed || listedElsewhere.contains((*match)[1])) << family.name << ' ' << value;
+            }
+        }
+        rows.erase(std::string(family.name));
+    }
+    for (const auto& [left, text] : rows) {
+        ADD_FAILURE() << left << " is in the table, and is no counter";
+    }
 }
 
 TEST(Counters, WaitsAreToldWhereTheClockOfTheStampsBeginsAnew) {

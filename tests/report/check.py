@@ -131,6 +131,9 @@ def check_reading(tambloctl, place):
         second = browser.run("[timeline.rows[1].app, timeline.selected.number, timeline.selected.marks.indexOf(timeline.mark)]")
         expect(second[1:] == [1, 1] and second[0] == browser.run("document.querySelector('#details h2').textContent") and
                said != "", "keys select a session and its marks, and what they select is said")
+        chosen = browser.run("document.querySelectorAll('#details [aria-current]').length === 1 && "
+                             "document.querySelector('#details [aria-current] b').textContent")
+        expect(chosen == browser.run("timeline.mark.text"), "and stands out in their list")
         span = browser.run("timeline.span")
         browser.key("+")
         browser.key("ArrowRight")
@@ -141,6 +144,9 @@ def check_reading(tambloctl, place):
         browser.run("new Promise((done) => setTimeout(done, 400))")
         rows = browser.run("[timeline.rows.length, timeline.rows.every((row) => row.service === 'telephony')]")
         expect(0 < rows[0] < 120 and rows[1], f"search leaves {rows[0]} sessions")
+        shown = browser.run(BARS)["service"]
+        expect([row[0] for row in shown] == ["telephony"] and
+               near(shown[0][1], sample.figures_of(logs)[0]["service"]["telephony"]["output"]), "and figures of these alone")
         browser.run("document.getElementById('filters').reset(); new Promise((done) => setTimeout(done, 400))")
 
         point = browser.run("""(() => { const box = document.getElementById('timeline').getBoundingClientRect();
@@ -159,6 +165,12 @@ def check_reading(tambloctl, place):
                 browser.screenshot(os.path.join(place, f"{name}-{scheme}.png"), whole=True)
                 expect(browser.run("document.documentElement.scrollWidth <= window.innerWidth"),
                        f"nothing reaches over the side, {name} and {scheme}")
+        paper = browser.run("""(() => { window.dispatchEvent(new Event('beforeprint'));
+            const said = [canvas.width, canvas.height >= 2 * 36 * ROW, document.getElementById('printed').textContent];
+            window.dispatchEvent(new Event('afterprint'));
+            return [...said, canvas.width === Math.round(timeline.box.clientWidth * devicePixelRatio)]; })()""")
+        expect(paper == [2000, True, "Sessions 1 to 36 of 120 are printed.", True],
+               "paper has a picture of its own size, which says what it leaves out")
         browser.pdf(os.path.join(place, "print.pdf"))
         expect(os.path.getsize(os.path.join(place, "print.pdf")) > 10_000, "it prints")
         expect(browser.complaints() == [], f"nothing was loaded, refused or thrown {browser.complaints()}")

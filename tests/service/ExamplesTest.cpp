@@ -71,12 +71,22 @@ with tamblo.Client() as client:
         client.call("fly")
     except tamblo.ServiceError as error:
         print(error.code)
+    try:
+        with client.session(5, configuration={"none": None}):
+            raise SystemExit("started without its configuration")
+    except tamblo.ServiceError:
+        assert client.reporters() == []
+    try:
+        client.send("Volume", "Generic", {"long": "x" * 2**21})
+    except tamblo.ServiceError as error:
+        print(error)
 )");
     const CommandResult done =
         run("RUNTIME_DIRECTORY=" + service.runtimeDirectory() + " " + kPython + directory.path("script.py"));
     EXPECT_EQ(done.status, 0) << done.output;
     EXPECT_THAT(done.output, HasSubstr("null or undefined is no value here"));
     EXPECT_THAT(done.output, HasSubstr("-32601"));
+    EXPECT_THAT(done.output, HasSubstr("longer than 1 MiB"));
     std::string longText;
     for (int i = 0; i < 300; ++i) {
         longText += "ä";

@@ -86,6 +86,9 @@ TEST(Record, ALiveRecordingIsTheSessionUntilItStops) {
     });
     ASSERT_TRUE(eventually([&] { return contentOf(said).find("recording") != std::string::npos; }));
     const std::string playing = "session --json --fast --reporter ";
+    const CommandResult second = service.tambloctl("record --live -r 102 -o " + live);
+    EXPECT_EQ(second.status, 1) << "one is made already, and its file stays";
+    EXPECT_THAT(second.output, HasSubstr("one at a time"));
     const CommandResult original = service.tambloctl(
         playing +
         "101 --service-type longformaudio --configuration '{\"HostApplicationDisplayID\":\"app\"}'" +
@@ -103,18 +106,23 @@ TEST(Record, ALiveRecordingSaysWhatIsMissing) {
     const TemporaryDirectory directory;
     const FileDescriptor listener(boundSocket(SOCK_STREAM, directory.path("status")));
     ASSERT_EQ(::listen(listener.get(), 3), 0);
-    // A tap, and two requests for the session's configuration, which nobody knows.
+    // A tap, and three requests for the session, of which nobody knows: so its stop was among what is left
+    // out.
     std::thread service([&listener] {
         const std::string line = R"({"time":5,"reporter":7,"service":"haptics","started":true,"type":2,)";
         const std::string shown = line + R"("origin":"message","category":4,"payload":{"a":1}})" + "\n" +
                                   line + R"("origin":"message","category":4,"payload_left_out":70000})" +
-                                  "\n" + "{\"left_out\":12}\n" + line +
-                                  R"("origin":"session","category":8})" + "\n";
-        for (const std::string& answer : {shown, std::string("{}\n"), std::string("{}\n")}) {
-            const FileDescriptor client(::accept(listener.get(), nullptr, nullptr));
+                                  "\n" + "{\"left_out\":12}\n";
+        std::vector<FileDescriptor> clients;
+        for (const std::string& answer :
+             {shown, std::string("{}\n"), std::string("{}\n"), std::string("{}\n")}) {
+            const FileDescriptor& client = clients.emplace_back(::accept(listener.get(), nullptr, nullptr));
             (void)::send(client.get(), answer.data(), answer.size(), MSG_NOSIGNAL);
             std::array<char, 256> request;
             (void)::recv(client.get(), request.data(), request.size(), 0);
+            if (answer != shown) {
+                (void)::shutdown(client.get(), SHUT_WR);
+            }
         }
     });
     const CommandResult recorded =

@@ -65,7 +65,7 @@ TEST(Status, CountersSayWhatBecameOfMessagesAndSurviveAKill) {
         EXPECT_EQ(now[R"(tamblo_messages_refused_total{stage="decode",reason="limit"})"], 1);
         EXPECT_EQ(now[R"(tamblo_limits_hit_total{limit="reporters_of_message"})"], 1);
         EXPECT_EQ(now[R"(tamblo_requests_total{method="sendMessage"})"], 4);
-        EXPECT_EQ(now[R"(tamblo_request_errors_total{method="sendMessage"})"], 1);
+        EXPECT_EQ(now[R"(tamblo_request_errors_total{method="sendMessage",error="limit"})"], 1);
         EXPECT_EQ(now["tamblo_sessions"], 1);
         EXPECT_GT(now["tamblo_retained_bytes"], 0);
         EXPECT_EQ(now["tamblo_request_duration_seconds_count"], now["tamblo_request_wait_seconds_count"]);
@@ -154,6 +154,14 @@ TEST(Status, ReadersAreSentOneDocumentAndTheEnd) {
         EXPECT_EQ(limit["source"] != "default", isChanged) << limit;
         EXPECT_EQ(limit["value"] == 99, isChanged) << limit;
     }
+    // What is written meanwhile is not in force.
+    writeFile(service.preferenceFile("com.vandra.tamblo.sinks"), R"({"file_mode": "0666"})");
+    for (const json& setting : statusJson(service, "status")["settings"]) {
+        if (setting["name"] == "file_mode") {
+            EXPECT_EQ(setting["value"], "0600");
+            EXPECT_EQ(setting["source"], "default");
+        }
+    }
     const StatusReader ended(service);
     ended.send("clients");
     ended.endSending();
@@ -182,6 +190,8 @@ TEST(Status, ClientsAndSessionsAreShownWithWhatTheyHave) {
     EXPECT_EQ(sessions[0]["recorded"], 2);
     EXPECT_EQ(sessions[1]["reporter"], -3);
     EXPECT_EQ(sessions[0]["retained_bytes"], clients[0]["retained_bytes"]);
+    EXPECT_GT(sessions[0]["seconds"], 0);
+    EXPECT_LT(sessions[0]["seconds"], clients[0]["seconds"]); // which have been read and decoded, too
     const json shown = statusJson(service, "session 7")["sessions"];
     ASSERT_EQ(shown.size(), 1U);
     EXPECT_EQ(shown[0]["previous_values"]["volume"], 2);
@@ -191,6 +201,7 @@ TEST(Status, ClientsAndSessionsAreShownWithWhatTheyHave) {
     EXPECT_EQ(json::parse(service.tambloctl("sessions --json").output)["sessions"].size(), 2U);
     EXPECT_NE(service.tambloctl("session show 7").output.find("\"speaker\""), std::string::npos);
     EXPECT_EQ(service.tambloctl("session show 8").status, 1);
+    EXPECT_EQ(service.tambloctl("session show 8 --json").status, 1);
     const CommandResult status = service.tambloctl("status");
     EXPECT_NE(status.output.find("2 clients, 2 sessions"), std::string::npos) << status.output;
     EXPECT_EQ(status.status, 0);
@@ -216,6 +227,43 @@ TEST(Status, AReaderThatNeverReadsIsLetGoAndTenThousandSessionsAreListed) {
         return metricsOf(service)[R"(tamblo_status_readers_let_go_total{reason="does_not_read"})"] == 1;
     }));
     EXPECT_LT(stuck.rest().size(), 2'000'000U);
+}
+
+TEST(Status, TooLongALineIsToldAsOneAndTheConnectionEndsInOrder) {
+    const ServiceProcess service;
+    const std::string filter = "tap {\"event\":\"" + std::string(8192, 'x') + "\"}\n";
+    for (const std::string& line :
+         {std::string(150'000, 'x') + "\n", filter, "tap tea\n" + std::string(20'000, 'x')}) {
+        const StatusReader reader(service);
+        reader.send(line);
+        errno = 0;
+        const std::string text = reader.rest();
+        EXPECT_EQ(errno, 0) << line.substr(0, 20);
+        EXPECT_EQ(text.find("8192") != text.npos, !line.starts_with("tap tea")) << text;
+        EXPECT_TRUE(json::parse(text).contains("error"));
+    }
+}
+
+TEST(Status, AUserWithManyReadersKeepsNobodyOut) {
+    const ServiceProcess service;
+    if (::geteuid() != 0) {
+        GTEST_SKIP() << "nobody else can be had";
+    }
+    ::chmod((service.runtimeDirectory() + "/com.vandra.tamblo.status").c_str(), 0666);
+    ::chmod(service.runtimeDirectory().c_str(), 0711);
+    ::chmod(std::filesystem::path(service.runtimeDirectory()).parent_path().c_str(), 0711);
+    ASSERT_EQ(::seteuid(65'534), 0);
+    std::vector<StatusReader> held;
+    for (int i = 0; i != 16; ++i) {
+        held.emplace_back(service);
+        held.back().send("sta");
+    }
+    EXPECT_TRUE(
+        eventually([&] { return statusText(service, "status").find("16 readers") != std::string::npos; }));
+    ASSERT_EQ(::seteuid(0), 0);
+    EXPECT_EQ(statusJson(service, "status")["pid"], service.pid());
+    EXPECT_EQ(metricsOf(service)[R"(tamblo_status_readers_let_go_total{reason="too_many_of_user"})"], 1);
+    EXPECT_EQ(held[0].rest(), "");
 }
 
 TEST(Status, SixteenReadersAreServedAndOthersAreTold) {

@@ -53,6 +53,9 @@ TEST(Tambloctl, ExitStatusSaysWhoWasWrong) {
         {"validate 99", 1, "99 is not a reporter"},
         {"validate 99 --json", 1, R"("reporterID":99,)"},
         {"session --reporter 9 --quiet", 0, ""},
+        {"session --reporter 9 --fast", 2, "--fast needs --play"},
+        {"session show 7 --fast", 2, "takes no --fast"},
+        {"help send receive", 2, "no place behind help"},
         {"session --reporter 9 --play /", 2, "cannot read /: Is a directory"},
         {"notify com.example.news 0x10", 0, ""},
         {"notify a/b", 2, "no notification name"},
@@ -109,8 +112,10 @@ TEST(Tambloctl, WhatIsForbiddenOrMissingIsSaidToBe) {
     expect("send -c Volume n=2", 0, "whether it was recorded cannot be seen: cannot read ");
     forbid(service.logs());
     expect("tail --follow", 1, "permission denied; " + service.logs().string() + " belongs to ");
+    expect("record", 1, "permission denied; " + service.logs().string() + " belongs to ");
     forbid(service.runtimeDirectory());
-    for (const char* command : {"reporters", "kill", "send -c Volume n=3"}) {
+    for (const char* command :
+         {"reporters", "kill", "send -c Volume n=3", "status", "tap", "record --live -r 7"}) {
         expect(command, 3, "permission denied; " + service.runtimeDirectory() + " belongs to ");
         expect(command, 3, mode);
     }
@@ -118,8 +123,10 @@ TEST(Tambloctl, WhatIsForbiddenOrMissingIsSaidToBe) {
     std::filesystem::permissions(service.runtimeDirectory(), std::filesystem::perms::owner_all);
     std::filesystem::permissions(service.logs(), std::filesystem::perms::owner_all);
 
-    EXPECT_THAT(service.tambloctl("reporters --socket /" + std::string(200, 'a')).output,
-                HasSubstr("too long for a socket's path"));
+    for (const char* command : {"reporters", "status"}) {
+        EXPECT_THAT(service.tambloctl(command + (" --socket /" + std::string(200, 'a'))).output,
+                    HasSubstr("too long for a socket's path"));
+    }
     service.stop();
     std::filesystem::remove_all(service.runtimeDirectory());
     EXPECT_EQ(service.tambloctl("notify name").status, 3);

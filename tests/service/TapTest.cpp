@@ -59,7 +59,9 @@ TEST(Tap, FiltersSampleAndLimitSayWhatIsShown) {
     const StatusReader sample = tapOf(service, R"({"has":["n","route"],"sample":2})");
     const StatusReader limit = tapOf(service, R"({"has":"n","limit":2})");
     // The ninth, and filters that are none.
-    for (const std::string refused : {"{}", "[]", R"({"colour":1})", R"({"limit":0})", R"({"type":65536})"}) {
+    for (const std::string refused :
+         {"{}", "[]", R"({"colour":1})", R"({"limit":0})", R"({"type":65536})", R"({"recording":true})",
+          R"({"recording":true,"reporter":7,"event":"*"})"}) {
         const auto lines = shownBy(tapOf(service, refused));
         ASSERT_EQ(lines.size(), 1);
         EXPECT_THAT(lines[0].value("error", ""), HasSubstr(refused == "{}" ? "8 taps" : "filter")) << refused;
@@ -115,6 +117,56 @@ TEST(Tap, ALargePayloadIsNotShown) {
     EXPECT_GE(lines[0].value("payload_left_out", 0), 100'000);
     EXPECT_FALSE(lines[0].contains("payload"));
     EXPECT_EQ(lines[1]["payload"]["text"], std::string(40'000, 'y'));
+}
+
+TEST(Tap, ARecordingMissesNothingThoughItsReaderIsSlow) {
+    ServiceProcess service;
+    const std::string filter = R"({"reporter":7,"limit":121,"recording":true})";
+    const StatusReader recording = tapOf(service, filter);
+    EXPECT_THAT(shownBy(tapOf(service, filter)).at(0).value("error", ""), HasSubstr("a recording"));
+    Session client(service.socketPath(), 7);
+    const std::string text(20'000, 'x');
+    for (int i = 0; i < 120; ++i) {
+        client.call(message({{"n", i}, {"text", text}}, {7}));
+    }
+    const std::string large(200'000, 'y');
+    client.call(message({{"n", 120}, {"text", large}}, {7}));
+    const auto lines = shownBy(recording);
+    ASSERT_EQ(lines.size(), 121U);
+    for (std::size_t i = 0; i < lines.size(); ++i) {
+        ASSERT_EQ(lines[i]["payload"].value("n", -1), static_cast<int>(i));
+    }
+    EXPECT_EQ(lines.back()["payload"]["text"], large);
+}
+
+TEST(Tap, WhatThereIsNoTimeToLookAtIsLeftOut) {
+    ServiceProcess service;
+    // None of the patterns matches, but it takes long to see that.
+    json filter;
+    for (int i = 0; i != 200; ++i) {
+        filter["event"].push_back("com.vandra.tamblo.Playback.Star_*");
+    }
+    std::vector<StatusReader> taps;
+    for (int i = 0; i != 8; ++i) {
+        taps.push_back(tapOf(service, filter.dump()));
+    }
+    Session client(service.socketPath(), 7);
+    std::string frames;
+    for (int i = 0; i != 20'000; ++i) {
+        frames += framesOf(message({{"n", i}}, {7}));
+    }
+    ASSERT_TRUE(client.send(frames));
+    for (int i = 0; i != 20'000; ++i) {
+        ASSERT_TRUE(client.receive());
+    }
+    service.stop();
+    for (const StatusReader& tap : taps) {
+        const auto lines = shownBy(tap);
+        EXPECT_FALSE(lines.empty());
+        for (const json& line : lines) {
+            EXPECT_GT(line.value("left_out", 0), 0) << line;
+        }
+    }
 }
 
 /// `tambloctl tap`, whose output goes to a file.

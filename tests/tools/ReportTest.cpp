@@ -4,7 +4,10 @@
 #include <gmock/gmock.h>
 #include <nlohmann/json.hpp>
 
+#include <future>
 #include <map>
+
+#include <sys/stat.h>
 
 // Pages are made of files that are written here, and their data held against what was written.
 
@@ -14,6 +17,7 @@ namespace {
 using nlohmann::json;
 using testing::Contains;
 using testing::ElementsAre;
+using testing::EndsWith;
 using testing::HasSubstr;
 using testing::IsEmpty;
 using testing::StartsWith;
@@ -155,7 +159,7 @@ TEST_F(ReportTest, EventsAloneMakeSessionsFromStopToStop) {
              {{"summaryServiceName", "telephony"}, {"clientProcessName", "phone"}});
         send(at + 51, "Input.Summary", {{"inputrunning_seconds", 40}});
     }
-    plan_.application = "com.example.*";
+    plan_.wanted.application = "com.example.*";
     json data = made();
     ASSERT_EQ(data["sessions"].size(), 2);
     const json& second = data["sessions"][1];
@@ -165,9 +169,9 @@ TEST_F(ReportTest, EventsAloneMakeSessionsFromStopToStop) {
     // Input as its messages say; output, of which there are only summaries, in front of the stop.
     EXPECT_EQ(second[stretches],
               json({{100'000, 140'000, 0, 0}, {141'000, 151'000, 1, 2}, {121'000, 141'000, 1, 2}}));
-    plan_.since = kBegin + 60;
+    plan_.wanted.since = kBegin + 60;
     EXPECT_EQ(made()["sessions"].size(), 1);
-    plan_.application = "com.example.music";
+    plan_.wanted.application = "com.example.music";
     EXPECT_THAT(made()["sessions"], IsEmpty());
 }
 
@@ -256,6 +260,75 @@ TEST_F(ReportTest, TheNewestIsKeptWithinTheMemoryThatItMayTake) {
     EXPECT_EQ(text(data, data["sessions"].back()[name]), "p.399");
     EXPECT_THAT(data["leftOut"][0].get<std::string>(),
                 StartsWith(std::to_string(400 - kept) + " of the oldest sessions"));
+}
+
+TEST_F(ReportTest, WhatIsNotAskedForTakesNoMemoryFromWhatIs) {
+    for (int i = 0; i < 400; ++i) {
+        const double at = kBegin + i;
+        const std::string id = "p." + std::to_string(i),
+                          host = i < 10 ? "com.example.rare" : "com.example.often";
+        callQuality(at, "open", id,
+                    {{"userInfo",
+                      {{"HostApplicationDisplayID", host},
+                       {"ServiceName", "telephony_session"},
+                       {"ZRReportingSessionID", i}}}});
+        json payload{{"HostApplicationDisplayID", host}, {"audiotag", "IOError"}};
+        callQuality(at + 0.5, "message", id, {{"payload", payload}});
+        event(at + 0.5, "telephony", "IO.Error", payload);
+        payload["audiotag"] = "KaleenSummary"; // which is no call-quality line
+        event(at + 0.6, "telephony", "Kaleen.Summary", payload);
+        payload["audiotag"] = "Session_GenericSummary";
+        callQuality(at + 0.7, "message", id, {{"payload", payload}});
+        event(at + 0.7, "telephony", "Session_Generic.Summary", payload);
+        if (i % 2 == 0) {
+            callQuality(at + 0.8, "flush", id, json::object());
+        }
+    }
+    plan_.mostBytes = 60'000;
+    plan_.wanted.application = "com.example.rare";
+    json data = made();
+    EXPECT_EQ(data["sessions"].size(), 10);
+    EXPECT_THAT(data["leftOut"], IsEmpty());
+    plan_.wanted = {.since = {}, .session = "3", .application = {}};
+    data = made();
+    ASSERT_EQ(data["sessions"].size(), 1);
+    EXPECT_EQ(text(data, data["sessions"][0][name]), "p.3");
+    EXPECT_THAT(data["leftOut"], IsEmpty());
+    plan_.mostBytes = ReportPlan::kMost;
+    EXPECT_EQ(made()["sessions"][0][summaries].size(), 2) << "its own, and none of those before";
+}
+
+TEST_F(ReportTest, AFileIsReplacedWhereALinkLeadsAndAPipeIsWrittenInto) {
+    callQuality(kBegin, "open", "p.1", json::object());
+    plan_.directory = logs_.path();
+    std::filesystem::create_symlink("page", logs_.path("link"));
+    test::writeFile(logs_.path("page"), "old");
+    plan_.page = logs_.path("link");
+    EXPECT_TRUE(std::holds_alternative<ReportResult>(makeReport(plan_)));
+    EXPECT_TRUE(std::filesystem::is_symlink(logs_.path("link")));
+    EXPECT_THAT(logs_.read("page"), StartsWith("<!DOCTYPE"));
+    ASSERT_EQ(::mkfifo(logs_.path("pipe").c_str(), 0600), 0);
+    auto received = std::async(std::launch::async, [this] { return logs_.read("pipe"); });
+    plan_.page = logs_.path("pipe");
+    EXPECT_TRUE(std::holds_alternative<ReportResult>(makeReport(plan_)));
+    EXPECT_THAT(received.get(), EndsWith("</html>\n"));
+    EXPECT_TRUE(std::filesystem::is_fifo(logs_.path("pipe")));
+}
+
+TEST_F(ReportTest, ARunningSessionIsNotToldTwice) {
+    const json overload{{"HostApplicationDisplayID", "com.example.music"},
+                        {"audiotag", "IOError"},
+                        {"issue_type", "overload"}};
+    callQuality(kBegin, "open", "p.1", {{"userInfo", {{"HostApplicationDisplayID", "com.example.music"}}}});
+    for (int i = 1; i <= 9; ++i) {
+        event(kBegin + 0.1 * i, "telephony", "IO.Error", overload);
+    }
+    for (int i = 1; i <= 6; ++i) { // the rest waits to be written
+        callQuality(kBegin + 0.1 * i, "message", "p.1", {{"payload", overload}});
+    }
+    EXPECT_EQ(made()["sessions"].size(), 1);
+    event(kBegin + 60, "telephony", "IO.Error", overload); // of another session, as it seems
+    EXPECT_EQ(made()["sessions"].size(), 2);
 }
 
 } // namespace

@@ -1,4 +1,5 @@
 #include "base/Format.h"
+#include "platform/Counters.h"
 #include "platform/ProcessList.h"
 #include "session/WorkerClass.h"
 #include "tests/workers/WorkerTest.h"
@@ -159,12 +160,15 @@ TEST(ProcessListTest, TakesWhatIsAProcessOnceAndUpToItsLimit) {
     list.addNamedBy({{"processIDs", 12}});
     list.addNamedBy({{"processIDs", Array{12, 1, 13, 13, "14", true, Dictionary{{"a", 3}}, 6.0}}});
     list.addNamedBy({{"processIDs", Array{0, -1, 0x7FFF'FFFF, 0x8000'0000, ~0ULL, 1e300, NAN}}});
+    EXPECT_EQ(list.leftOut(), 10);
     EXPECT_THAT(std::move(list).take(), ElementsAre(1, 2, 12, 13, 6, 0x7FFF'FFFF));
     std::vector<pid_t> many(65);
     std::iota(many.begin(), many.end(), 100);
     ProcessList named(512), own;
     named.addNamedBy({{"processIDs", Array(many.begin(), many.end())}});
     own.add(many);
+    EXPECT_EQ(named.leftOut(), 1);
+    EXPECT_EQ(own.leftOut(), 1);
     EXPECT_THAT(std::move(named).take(), SizeIs(64));
     EXPECT_THAT(std::move(own).take(), SizeIs(64));
 }
@@ -315,9 +319,20 @@ protected:
             text += sent(*made) + (made.use_count() > 1 ? "+" : "") + "/";
         }
         const std::string levels = loggedLevels(ZRReportingSessionLinkmeterCategory());
+        const std::uint64_t lost = countOfLost();
         return text + std::to_string(device.workQueues.delayedCalls()) +
-               std::string(static_cast<std::size_t>(std::ranges::count(levels, 'e')), 'e');
+               std::string(static_cast<std::size_t>(std::ranges::count(levels, 'e')), 'e') +
+               std::string(lost - std::exchange(lost_, lost), '-');
     }
+
+private:
+    static std::uint64_t countOfLost() {
+        using counters::Counter;
+        return counters::valueOf(counters::slotOf(Counter::messagesLostNoBackEnds)) +
+               counters::valueOf(counters::slotOf(Counter::messagesLostSessionGone));
+    }
+
+    std::uint64_t lost_ = countOfLost();
 };
 
 TEST_F(RtcWorkerTest, DescribesTheSessionToTheService) {
@@ -337,25 +352,26 @@ TEST_F(RtcWorkerTest, SetsUpThenSendsInOrderWhateverComesOfIt) {
         {"at once where nothing waits", "start run found 1", "1+/0"},
         {"else behind what waits", "start 1 run found 2 run 3", "123+/0"},
         {"back ends at the last moment", "start 1 run 2 run stop run 8999ms found 9000ms run", "12s[1,2]f/0"},
-        {"no back ends", "start 1 run 2 run stop run none run", "+/0e"},
-        {"none, and too late", "start 1 run 2 run stop run 9000ms none run", "/0e"},
-        {"found too late, before what waited has run", "start 1 run stop run 9000ms found run", "/0"},
+        {"no back ends", "start 1 run 2 run stop run none run", "+/0e----"},
+        {"none, and too late", "start 1 run 2 run stop run 9000ms none run", "/0e----"},
+        {"found too late, before what waited has run", "start 1 run stop run 9000ms found run", "/0---"},
         {"one that cannot be sent", "start run found run fails 1 run works 2 run", "2+/0e"},
         {"two runs before the queue gets to them", "start run found 1 stop 2 start 3 stop run", "1s[1]f/+/1"},
         {"each set up anew", "start run found 1 stop 2 start 3 stop run found run", "1s[1]f/3s[3]f/0"},
-        {"found after it: on, without a session", "start run 9000ms run found 1 run", "/0"},
-        {"the next run is not on", "start run 9000ms run found stop start 1 run", "/+/0"},
-        {"until its own are found", "start run 9000ms run found stop start run found 1 run", "/1+/0"},
-        {"a dropped session leaves nothing", "start run 1 drop run found run", "/0"},
+        {"found after it: on, without a session", "start run 9000ms run found 1 run", "/0-"},
+        {"the next run is not on", "start run 9000ms run found stop start 1 run", "/+/0---"},
+        {"until its own are found", "start run 9000ms run found stop start run found 1 run", "/1+/0--"},
+        {"a dropped session leaves nothing", "start run 1 drop run found run", "/0-"},
         {"a stopped one is reported in full", "start run 1 stop drop run found run", "1s[1]f/0"},
         {"whenever it was dropped", "start 1 stop drop run found run", "1s[1]f/0"},
-        {"without a token nothing is opened", "tokenless start 1 stop run", "0e"},
+        {"without a token nothing is opened", "tokenless start 1 stop run", "0e---"},
     };
     for (const auto& row : cases) {
         device.callQuality.sessions.clear();
         device.callQuality.completions.clear();
         session = makeSession(AudioServiceTypeTelephony);
         device.log.clear();
+        (void)outcome();
         play(row.script);
         EXPECT_EQ(outcome(), row.expected) << row.what;
         play("drop 9000ms run");

@@ -10,6 +10,7 @@ extern const std::string_view page_css;
 extern const std::string_view data_js;
 extern const std::string_view timeline_js;
 extern const std::string_view timeline_input_js;
+extern const std::string_view timeline_rows_js;
 extern const std::string_view figures_js;
 extern const std::string_view details_js;
 extern const std::string_view page_js;

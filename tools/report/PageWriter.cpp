@@ -7,9 +7,11 @@
 #include <array>
 #include <cerrno>
 #include <cstdio>
+#include <filesystem>
 #include <utility>
 
 #include <fcntl.h>
+#include <sys/stat.h>
 #include <unistd.h>
 
 namespace tamblo::report {
@@ -33,17 +35,41 @@ std::string temporaryFor(const std::string& path) {
     return path.substr(0, name) + formatted(".tamblo-{}", hexadecimal(randomNumber(), 16));
 }
 
+/// Where a link leads.
+std::string followed(const std::string& path) {
+    std::error_code error;
+    const std::filesystem::path place = std::filesystem::canonical(path, error);
+    return error ? path : place.string();
+}
+
+/// Whether something stands there that a file may not take the place of.
+bool isNoFile(const std::string& path) {
+    struct stat status {};
+    return ::stat(path.c_str(), &status) == 0 && !S_ISREG(status.st_mode);
+}
+
 } // namespace
 
-PageWriter::PageWriter(const std::string& path)
-    : path_(path),
-      temporary_(temporaryFor(path)),
-      // What clients named stands in the page: like the sinks, it is its owner's alone.
-      file_(::open(temporary_.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, kPageMode)),
-      error_(file_.isOpen() ? 0 : errno) {}
+PageWriter::PageWriter(const std::string& path) : path_(followed(path)) {
+    open();
+    error_ = file_.isOpen() ? 0 : errno;
+}
+
+void PageWriter::open() {
+    if (path_ == "-") {
+        file_ = FileDescriptor(::fcntl(STDOUT_FILENO, F_DUPFD_CLOEXEC, 0));
+    } else if (isNoFile(path_)) {
+        file_ = FileDescriptor(::open(path_.c_str(), O_WRONLY | O_CLOEXEC));
+    } else {
+        temporary_ = temporaryFor(path_);
+        // What clients named stands in the page: like the sinks, it is its owner's alone.
+        constexpr int kNew = O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC;
+        file_ = FileDescriptor(::open(temporary_.c_str(), kNew, kPageMode));
+    }
+}
 
 PageWriter::~PageWriter() {
-    if (!isDone_ && file_.isOpen()) {
+    if (!isDone_ && file_.isOpen() && !temporary_.empty()) {
         ::unlink(temporary_.c_str());
     }
 }
@@ -78,7 +104,7 @@ void PageWriter::scriptData(const TextBuffer& json) {
 
 int PageWriter::finish() {
     write();
-    if (error_ == 0 && std::rename(temporary_.c_str(), path_.c_str()) != 0) {
+    if (error_ == 0 && !temporary_.empty() && std::rename(temporary_.c_str(), path_.c_str()) != 0) {
         error_ = errno;
     }
     isDone_ = error_ == 0;

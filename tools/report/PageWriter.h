@@ -9,7 +9,8 @@
 namespace tamblo::report {
 
 /// Writes a file piece by piece beside the place that it is meant for, and puts it there when it is whole.
-/// Without that it leaves nothing behind.
+/// Without that it leaves nothing behind. A link stays, and leads to the new file then. What is no file, such
+/// as a pipe or a device, is written into as it is; `-` stands for standard output.
 class PageWriter {
 public:
     /// `error` says whether it could be opened.
@@ -28,10 +29,11 @@ public:
     [[nodiscard]] int finish();
 
 private:
+    void open();
     void write();
 
     const std::string path_;
-    const std::string temporary_;
+    std::string temporary_; ///< empty when what is written into stands there already
     FileDescriptor file_;
     TextBuffer held_;
     int error_ = 0;

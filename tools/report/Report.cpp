@@ -39,7 +39,7 @@ template <typename Take> void readLine(std::string_view line, OddLines& odd, con
 
 /// What all sinks say.
 struct Collected {
-    explicit Collected(std::size_t mostBytes) : sessions(mostBytes) {}
+    Collected(const SessionFilter& wanted, std::size_t mostBytes) : sessions(wanted, mostBytes) {}
     SessionCollector sessions;
     DeviceEvents device;
     ReadCounts read;
@@ -47,34 +47,28 @@ struct Collected {
 };
 
 void readSinks(const std::string& directory, Collected& all) {
-    const auto read = [&](std::string_view name, auto take) {
+    const auto read = [&all](const SinkFiles& files, auto take) {
         LineFunction line = [&](std::string_view text) { readLine(text, all.odd, take); };
-        readSink(directory, name, all.read, line);
+        files.read(all.read, line);
     };
-    read("call-quality.jsonl", [&](const JsonItem& line) { return all.sessions.takeCallQuality(line); });
+    const auto open = [&](std::string_view name) { return SinkFiles(directory, name, all.read); };
+    // A message is an event first, and a call-quality line later: in this order few events are without one.
+    const SinkFiles events = open("analytics-events.jsonl");
+    read(open("call-quality.jsonl"),
+         [&](const JsonItem& line) { return all.sessions.takeCallQuality(line); });
+    all.sessions.finishCallQuality();
     EventTwins::Take event = [&](std::string_view text, std::string_view service) {
         readLine(text, all.odd, [&](const JsonItem& line) { return all.sessions.takeEvent(line, service); });
     };
     EventTwins twins(event);
     LineFunction line = [&twins](std::string_view text) { twins.add(text); };
-    readSink(directory, "analytics-events.jsonl", all.read, line);
+    events.read(all.read, line);
     twins.finish();
     all.sessions.finish();
-    read("bug-captures.jsonl", [&](const JsonItem& item) { return all.device.takeCapture(item); });
-    read("stack-captures.jsonl", [&](const JsonItem& item) { return all.device.takeStackCapture(item); });
-    read("bug-report-drafts.jsonl", [&](const JsonItem& item) { return all.device.takeDraft(item); });
-}
-
-bool isWanted(const ReportPlan& plan, const Session& session) {
-    const std::string_view pattern = plan.application;
-    const std::string_view application = session.application.stringValue();
-    const bool isApplication = pattern.ends_with('*')
-                                   ? application.starts_with(pattern.substr(0, pattern.size() - 1))
-                                   : pattern.empty() || application == pattern;
-    const bool isSession = plan.session.empty() || session.name.stringValue() == plan.session ||
-                           (session.reporter && formatted("{}", *session.reporter) == plan.session);
-    return isApplication && isSession &&
-           (!plan.since || std::max(session.began, session.ended) >= *plan.since);
+    read(open("bug-captures.jsonl"), [&](const JsonItem& item) { return all.device.takeCapture(item); });
+    read(open("stack-captures.jsonl"),
+         [&](const JsonItem& item) { return all.device.takeStackCapture(item); });
+    read(open("bug-report-drafts.jsonl"), [&](const JsonItem& item) { return all.device.takeDraft(item); });
 }
 
 std::vector<std::string> leftOutOf(const Collected& all) {
@@ -143,7 +137,8 @@ void writePage(PageWriter& out, const PageData& data) {
         } else if (name == "script") {
             for (const std::string_view part :
                  {page_parts::data_js, page_parts::details_js, page_parts::timeline_js,
-                  page_parts::timeline_input_js, page_parts::figures_js, page_parts::page_js}) {
+                  page_parts::timeline_input_js, page_parts::timeline_rows_js, page_parts::figures_js,
+                  page_parts::page_js}) {
                 out.text(part);
             }
         } else {
@@ -160,7 +155,7 @@ std::variant<ReportResult, std::string> makeReport(const ReportPlan& plan) {
     if (!std::filesystem::is_directory(plan.directory, error)) {
         return formatted("there is no directory {}", plan.directory);
     }
-    Collected all(plan.mostBytes);
+    Collected all(plan.wanted, plan.mostBytes);
     readSinks(plan.directory, all);
     if (all.read.files == 0) {
         return formatted("{} has no sink that can be read", plan.directory);
@@ -175,12 +170,11 @@ std::variant<ReportResult, std::string> makeReport(const ReportPlan& plan) {
                   .keys = all.sessions.keys().names(),
                   .folders = captureFolders(plan.directory)};
     for (const auto& [serial, session] : all.sessions.sessions()) {
-        if (isWanted(plan, session)) {
-            data.sessions.push_back(&session);
-        }
+        data.sessions.push_back(&session);
     }
-    std::erase_if(data.device,
-                  [&plan](const DeviceEvent& event) { return plan.since && event.time < *plan.since; });
+    std::erase_if(data.device, [since = plan.wanted.since](const DeviceEvent& event) {
+        return since && event.time < *since;
+    });
     std::ranges::sort(data.sessions, {},
                       [](const Session* session) { return std::pair(session->began, session->serial); });
     PageWriter page(plan.page);

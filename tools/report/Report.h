@@ -1,8 +1,9 @@
 #pragma once
 
+#include "tools/report/SessionFilter.h"
+
 #include <cstddef>
 #include <cstdint>
-#include <optional>
 #include <string>
 #include <string_view>
 #include <variant>
@@ -12,12 +13,10 @@ namespace tamblo::report {
 
 /// What to make a report of.
 struct ReportPlan {
-    std::string directory;         ///< the sinks' files
-    std::string page;              ///< the path to write to
-    std::optional<double> since;   ///< seconds since 1970: sessions that ended before are passed over
-    std::string session;           ///< a call-quality session's name or a reporter's number; empty: all
-    std::string application;       ///< exact, or with a trailing `*`; empty: all
-    std::string selection;         ///< the last three in words, for the page
+    std::string directory; ///< the sinks' files
+    std::string page;      ///< the path to write to
+    SessionFilter wanted;
+    std::string selection;         ///< what is wanted, in words for the page; empty: all
     double now = 0;                ///< seconds since 1970
     std::size_t mostBytes = kMost; ///< of memory for sessions
 

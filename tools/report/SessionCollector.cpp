@@ -1,9 +1,11 @@
 #include "tools/report/SessionCollector.h"
 
 #include "tools/report/Lines.h"
+#include "tools/report/NamedSessions.h"
 
 #include <algorithm>
 #include <cmath>
+#include <compare>
 #include <tuple>
 #include <utility>
 
@@ -23,6 +25,8 @@ constexpr std::size_t kLongestName = 100;
 /// come meanwhile.
 constexpr double kLongestSetUp = 10;
 constexpr std::size_t kMostLookedAt = 256;
+/// Call-quality lines wait for a quarter of a second at most; their writer can be late.
+constexpr double kLongestLag = 1;
 
 /// The call-quality file has service types with an ending.
 std::string_view withoutEnding(std::string_view service) {
@@ -77,6 +81,7 @@ bool SessionCollector::takeCallQuality(const JsonItem& line) {
     if (!time || name.empty() || name.size() > kLongestName) {
         return false;
     }
+    lastCallQuality_ = *time;
     if (op == "open") {
         open(line, *time, name);
         return true;
@@ -86,6 +91,10 @@ bool SessionCollector::takeCallQuality(const JsonItem& line) {
         follow(session, *time);
         session.hasStop = true;
         open_.erase(open_.find(name));
+        if (!wanted_.wantsApplication(session.application.stringValue())) {
+            bytes_ -= session.bytes;
+            sessions_.erase(session.serial);
+        }
         return true;
     }
     const auto message = op == "message" ? messageOf(line, {}) : std::nullopt;
@@ -96,10 +105,19 @@ bool SessionCollector::takeCallQuality(const JsonItem& line) {
         return true;
     }
     Session& session = namedSession(name, *time);
+    if (session.application.stringValue().empty()) {
+        session.application = texts_.of(message->application);
+    }
+    if (!wanted_.wantsApplication(session.application.stringValue())) {
+        return true;
+    }
+    // Of another session of the application, too: its events shall not be taken for those of the one wanted.
     places_.push_back(
         {*time, session.serial, static_cast<std::uint32_t>(session.facts.size()), hashOf(message->tag)});
     count(session, sizeof(Place));
-    add(session, *message);
+    if (wanted_.mayWant(session)) {
+        add(session, *message);
+    }
     return true;
 }
 
@@ -125,7 +143,8 @@ bool SessionCollector::takeEvent(const JsonItem& line, std::string_view service)
         return false;
     }
     // Older lines belong to sessions that were left out.
-    if (message->application.empty() || message->time <= leftOut_.until) {
+    if (message->application.empty() || message->time <= leftOut_.until ||
+        !wanted_.wantsApplication(message->application)) {
         return true;
     }
     const bool isStop = message->summary == SummaryKind::session;
@@ -141,26 +160,54 @@ bool SessionCollector::takeEvent(const JsonItem& line, std::string_view service)
         }
         return true;
     }
-    Session& session = eventsSession(*message, service);
-    add(session, *message);
+    takeUnnamed(*message, service);
+    return true;
+}
+
+/// Of an event that no call-quality line belongs to.
+void SessionCollector::takeUnnamed(const Message& message, std::string_view service) {
+    const bool isStop = message.summary == SummaryKind::session;
+    if (isStillToCome(message)) {
+        return;
+    }
+    if (!wanted_.session.empty() && message.summary != SummaryKind::group) {
+        // No session without a name is wanted: only what comes in front of the stop of one that has a name.
+        if (isStop) {
+            Session other;
+            giveGroupSummaries(message, service, other);
+        }
+        return;
+    }
+    Session& session = eventsSession(message, service);
+    add(session, message);
     if (isStop) {
         session.hasStop = true;
-        session.service = texts_.of(textIn(*message->payload, "summaryServiceName"));
+        session.service = texts_.of(textIn(*message.payload, "summaryServiceName"));
     }
-    return true;
+}
+
+bool SessionCollector::isStillToCome(const Message& message) {
+    const double lag = message.time - lastCallQuality_;
+    return lag > 0 && lag <= kLongestLag && running_.contains(texts_.of(message.application).stringValue());
+}
+
+void SessionCollector::finishCallQuality() {
+    std::ranges::sort(places_, {},
+                      [](const Place& place) { return std::tuple(place.time, place.session, place.fact); });
+    for (const auto& [name, serial] : open_) {
+        running_.emplace(sessions_.at(serial).application.stringValue());
+    }
 }
 
 void SessionCollector::finish() {
     // What is known of a session that is named is told there: what is left of its events is what the
     // call-quality file has no line for.
-    std::erase_if(sessions_, [this](const auto& entry) {
-        const Session& rest = entry.second;
-        return rest.name.stringValue().empty() && !rest.hasStop && rest.facts.empty() &&
-               std::ranges::any_of(sessions_, [&rest](const auto& other) {
-                   const Session& known = other.second;
-                   return !known.name.stringValue().empty() && known.application == rest.application &&
-                          known.began <= rest.ended && known.ended >= rest.began - kUsualDisorder;
-               });
+    const NamedSessions named(sessions_);
+    std::erase_if(sessions_, [this, &named](const auto& entry) {
+        const Session& session = entry.second;
+        const bool isRest = session.name.stringValue().empty() && !session.hasStop && session.facts.empty();
+        return !wanted_.wants(session) ||
+               (isRest && named.ranOf(session.application, session.began - kUsualDisorder, session.ended));
     });
 }
 
@@ -315,12 +362,6 @@ void SessionCollector::giveGroupSummaries(const Message& message, std::string_vi
 }
 
 SessionCollector::Place* SessionCollector::placeOf(const Message& message) {
-    if (!arePlacesSorted_) {
-        std::ranges::sort(places_, {}, [](const Place& place) {
-            return std::tuple(place.time, place.session, place.fact);
-        });
-        arePlacesSorted_ = true;
-    }
     const Value application = texts_.of(message.application);
     const std::uint32_t tag = hashOf(message.tag);
     auto place = std::ranges::lower_bound(places_, message.time, {}, &Place::time);
@@ -352,20 +393,29 @@ void SessionCollector::evict() {
     if (bytes_ <= mostBytes_) {
         return;
     }
-    std::vector<std::pair<double, std::uint64_t>> oldest;
+    struct Candidate {
+        bool mayBeWanted = false;
+        double ended = 0;
+        std::uint64_t serial = 0;
+        auto operator<=>(const Candidate&) const = default;
+    };
+    std::vector<Candidate> oldest;
     oldest.reserve(sessions_.size());
     for (const auto& [serial, session] : sessions_) {
-        oldest.emplace_back(session.ended, serial);
+        oldest.push_back({wanted_.mayWant(session), session.ended, serial});
     }
     std::ranges::sort(oldest);
-    for (const auto& [ended, serial] : oldest) {
+    for (const Candidate& candidate : oldest) {
         if (bytes_ <= mostBytes_ / 8 * 7) {
             break;
         }
-        bytes_ -= sessions_.at(serial).bytes;
-        sessions_.erase(serial);
-        ++leftOut_.sessions;
-        leftOut_.until = std::max(leftOut_.until, ended);
+        const Session& session = sessions_.at(candidate.serial);
+        leftOut_.sessions += wanted_.wants(session) ? 1 : 0;
+        if (candidate.mayBeWanted) {
+            leftOut_.until = std::max(leftOut_.until, candidate.ended);
+        }
+        bytes_ -= session.bytes;
+        sessions_.erase(candidate.serial);
     }
     const auto isGone = [this](std::uint64_t serial) { return !sessions_.contains(serial); };
     std::erase_if(open_, [&](const auto& entry) { return isGone(entry.second); });

@@ -2,6 +2,7 @@
 
 #include "base/JsonReader.h"
 #include "tools/report/Session.h"
+#include "tools/report/SessionFilter.h"
 #include "tools/report/Texts.h"
 
 #include <cstddef>
@@ -9,6 +10,7 @@
 #include <deque>
 #include <map>
 #include <optional>
+#include <set>
 #include <string>
 #include <string_view>
 #include <unordered_map>
@@ -29,19 +31,23 @@ struct LeftOut {
 /// file has been rotated further or is not written, is put together by application and service type, from one
 /// stop to the next.
 ///
-/// Keeps the newest sessions that fit into the given bytes.
+/// Keeps the newest of the sessions that are wanted, as many as fit into the given bytes. Of others it only
+/// knows that they run, so that they take the place of none.
 class SessionCollector {
 public:
     static constexpr std::size_t kMostFacts = 5000;
     static constexpr std::size_t kMostSummaries = 1000;
 
-    explicit SessionCollector(std::size_t mostBytes) : mostBytes_(mostBytes) {}
+    SessionCollector(SessionFilter wanted, std::size_t mostBytes)
+        : wanted_(std::move(wanted)), mostBytes_(mostBytes) {}
 
-    // First the lines of the call-quality file, whether each is one that is understood.
+    // First the lines of the call-quality file, then those of events, whether each is one that is understood.
     [[nodiscard]] bool takeCallQuality(const JsonItem& line);
+    void finishCallQuality();
     /// The service type is empty where no event names it.
     [[nodiscard]] bool takeEvent(const JsonItem& line, std::string_view service);
-    /// When all is read: drops what was put together of events of sessions that are known and go on.
+    /// When all is read: drops what is not wanted, and what was put together of events of sessions that are
+    /// known and go on.
     void finish();
 
     /// The oldest first.
@@ -80,12 +86,16 @@ private:
     Session& eventsSession(const Message& message, std::string_view service);
     void count(Session& session, std::size_t bytes);
     void evict();
+    /// Whether the event is of a running session whose call-quality line has not been written yet.
+    [[nodiscard]] bool isStillToCome(const Message& message);
+    void takeUnnamed(const Message& message, std::string_view service);
     /// Where the call-quality line of an event is; null when there is none.
     [[nodiscard]] Place* placeOf(const Message& message);
     [[nodiscard]] std::uint32_t hashOf(std::string_view tag) const noexcept;
     /// Those of group playback are no call-quality lines on most builds.
     void giveGroupSummaries(const Message& message, std::string_view service, Session& session);
 
+    const SessionFilter wanted_;
     const std::size_t mostBytes_;
     std::size_t bytes_ = 0;
     std::uint64_t lastSerial_ = 0;
@@ -93,7 +103,8 @@ private:
     std::unordered_map<std::string, std::uint64_t, SeededTextHash, std::equal_to<>> open_; ///< by name
     std::map<std::pair<std::string, std::string>, std::uint64_t> events_; ///< by application and service
     std::deque<Place> places_;
-    bool arePlacesSorted_ = false;
+    double lastCallQuality_ = 0;                 ///< the last line's time
+    std::set<std::string, std::less<>> running_; ///< applications of sessions that had not stopped there
     SeededTextHash tagHash_;
     SharedTexts texts_;
     KeyNames keys_;

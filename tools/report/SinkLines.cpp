@@ -1,7 +1,6 @@
 #include "tools/report/SinkLines.h"
 
 #include "base/Format.h"
-#include "os/FileDescriptor.h"
 
 #include <algorithm>
 #include <cerrno>
@@ -18,42 +17,6 @@ using LineFunction = UniqueFunction<void(std::string_view line)>;
 
 constexpr int kKeptFiles = 4;
 constexpr std::size_t kPieceBytes = std::size_t{256} << 10U;
-
-struct OpenFile {
-    FileDescriptor descriptor;
-    dev_t device = 0;
-    ino_t inode = 0;
-    off_t size = 0;
-};
-
-/// The newest first. A file that was renamed between two openings is met twice and counts once.
-std::vector<OpenFile> openAll(const std::string& directory, std::string_view name, ReadCounts& counts) {
-    std::vector<OpenFile> files;
-    for (int number = 0; number <= kKeptFiles; ++number) {
-        std::string fileName = number == 0 ? std::string(name) : formatted("{}.{}", name, number);
-        const std::string path = formatted("{}/{}", directory, fileName);
-        struct stat status {};
-        // A pipe in a file's place must not be waited for.
-        FileDescriptor file(::open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK));
-        if (!file.isOpen()) {
-            if (errno != ENOENT) {
-                counts.unreadable.push_back(std::move(fileName));
-            }
-            continue;
-        }
-        if (::fstat(file.get(), &status) != 0 || !S_ISREG(status.st_mode)) {
-            counts.unreadable.push_back(std::move(fileName));
-            continue;
-        }
-        const bool isKnown = std::ranges::any_of(files, [&status](const OpenFile& other) {
-            return other.device == status.st_dev && other.inode == status.st_ino;
-        });
-        if (!isKnown) {
-            files.push_back({std::move(file), status.st_dev, status.st_ino, status.st_size});
-        }
-    }
-    return files;
-}
 
 /// Cuts pieces of a file into lines.
 class LineCutter {
@@ -102,7 +65,43 @@ private:
     bool isTooLong_ = false;
 };
 
-void readFile(const OpenFile& file, ReadCounts& counts, LineFunction& take) {
+} // namespace
+
+SinkFiles::SinkFiles(const std::string& directory, std::string_view name, ReadCounts& counts) {
+    for (int number = 0; number <= kKeptFiles; ++number) {
+        std::string fileName = number == 0 ? std::string(name) : formatted("{}.{}", name, number);
+        const std::string path = formatted("{}/{}", directory, fileName);
+        struct stat status {};
+        // A pipe in a file's place must not be waited for.
+        FileDescriptor file(::open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK));
+        if (!file.isOpen()) {
+            if (errno != ENOENT) {
+                counts.unreadable.push_back(std::move(fileName));
+            }
+            continue;
+        }
+        if (::fstat(file.get(), &status) != 0 || !S_ISREG(status.st_mode)) {
+            counts.unreadable.push_back(std::move(fileName));
+            continue;
+        }
+        // A file that was renamed between two openings is met twice and counts once.
+        const bool isKnown = std::ranges::any_of(files_, [&status](const File& other) {
+            return other.device == status.st_dev && other.inode == status.st_ino;
+        });
+        if (!isKnown) {
+            files_.push_back({std::move(file), status.st_dev, status.st_ino, status.st_size});
+        }
+    }
+    counts.files += files_.size();
+}
+
+void SinkFiles::read(ReadCounts& counts, LineFunction& take) const {
+    for (auto file = files_.rbegin(); file != files_.rend(); ++file) {
+        readFile(*file, counts, take);
+    }
+}
+
+void SinkFiles::readFile(const File& file, ReadCounts& counts, LineFunction& take) {
     LineCutter lines(counts, take);
     std::string piece(kPieceBytes, '\0');
     // No further than it reached when it was opened: it may grow as fast as it is read.
@@ -118,16 +117,6 @@ void readFile(const OpenFile& file, ReadCounts& counts, LineFunction& take) {
         counts.bytes += static_cast<std::uint64_t>(count);
     }
     lines.end();
-}
-
-} // namespace
-
-void readSink(const std::string& directory, std::string_view name, ReadCounts& counts, LineFunction& take) {
-    const std::vector<OpenFile> files = openAll(directory, name, counts);
-    counts.files += files.size();
-    for (auto file = files.rbegin(); file != files.rend(); ++file) {
-        readFile(*file, counts, take);
-    }
 }
 
 } // namespace tamblo::report

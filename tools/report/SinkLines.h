@@ -1,12 +1,15 @@
 #pragma once
 
 #include "base/UniqueFunction.h"
+#include "os/FileDescriptor.h"
 
 #include <cstddef>
 #include <cstdint>
 #include <string>
 #include <string_view>
 #include <vector>
+
+#include <sys/types.h>
 
 namespace tamblo::report {
 
@@ -24,9 +27,25 @@ struct ReadCounts {
 /// report needs is in lines of some hundred bytes.
 inline constexpr std::size_t kLongestLine = std::size_t{1} << 20U;
 
-/// Hands over the whole lines of a sink, those of its rotated files first, as they stand there now. All files
-/// are opened before the first is read: a sink that is rotated meanwhile loses none of them.
-void readSink(const std::string& directory, std::string_view name, ReadCounts& counts,
-              UniqueFunction<void(std::string_view line)>& take);
+/// A sink's files, the rotated ones too, as far as they reach when they are opened. All are opened before the
+/// first is read: a sink that is rotated meanwhile loses none of its lines.
+class SinkFiles {
+public:
+    SinkFiles(const std::string& directory, std::string_view name, ReadCounts& counts);
+    /// Hands over whole lines, those of the oldest file first.
+    void read(ReadCounts& counts, UniqueFunction<void(std::string_view line)>& take) const;
+
+private:
+    struct File {
+        FileDescriptor descriptor;
+        dev_t device = 0;
+        ino_t inode = 0;
+        off_t size = 0;
+    };
+    static void readFile(const File& file, ReadCounts& counts,
+                         UniqueFunction<void(std::string_view line)>& take);
+
+    std::vector<File> files_; ///< the newest first
+};
 
 } // namespace tamblo::report

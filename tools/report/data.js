@@ -15,6 +15,7 @@ const MARKS = [
 const OVERLOAD = 2;
 const ROUTE = 1;
 const DEVICE_EVENTS = ['Capture', 'Capture, cancelled', 'Stack capture', 'Bug report draft'];
+const DRAFT = 3;
 const UNKNOWN = '(unknown)';
 
 const textOf = (number) => report.texts[number];
@@ -41,10 +42,9 @@ class Session {
     #devices = null;
     #lookedIn = null;
 
-    constructor(row, number) {
+    constructor(row) {
         const [name, app, service, process, reporter, began, ended, flags, messages, stretches, marks, , keys] = row;
         this.#row = row;
-        this.number = number;
         this.name = textOf(name);
         this.app = textOf(app) || UNKNOWN;
         this.service = textOf(service) || UNKNOWN;
@@ -68,6 +68,8 @@ class Session {
             this.high = Math.max(this.high, mark[0]);
             if (mark[1] === OVERLOAD) { ++this.overloads; }
         }
+        // What a message tells of can have happened before the session's first line was written.
+        if (!this.has(FLAG.isClockSetBack)) { [this.began, this.ended] = [this.low, this.high]; }
     }
 
     get stretches() {
@@ -115,7 +117,8 @@ class Session {
     }
 }
 
-const sessions = report.sessions.map((row, number) => new Session(row, number));
+const sessions = report.sessions.map((row) => new Session(row)).sort((a, b) => a.began - b.began);
+sessions.forEach((session, number) => { session.number = number; });
 const deviceEvents = report.device.map(([at, kind, text, capture, hasFolder]) =>
     ({ at, kind, text: textOf(text), capture, hasFolder: hasFolder === 1 })).sort((a, b) => a.at - b.at);
 

@@ -3,17 +3,18 @@
 const SUMMARY_TITLES = { output: 'Output', group: 'Group playback', input: 'Input', session: 'Session' };
 const COLUMN_TITLES = {
     play_seconds: 'Seconds', inputrunning_seconds: 'Seconds', QVSessionVolume: 'Volume',
-    QVSessionVolumeBucketed: 'Class', active_devices: 'Route', session_selected_format: 'Format',
-    mFormatID: 'ID', mChannelsPerFrame: 'Ch.', spatializationEnabled: 'Spatial',
+    QVSessionVolumeBucketed: 'Volume class', active_devices: 'Route', session_selected_format: 'Format',
+    mFormatID: 'Format ID', mChannelsPerFrame: 'Channels', spatializationEnabled: 'Spatial',
     'spatial-audio-accessory-feature': 'Accessory', ringerstate: 'Ringer',
     vp_config_operation_mode: 'Mode', vp_config_input_port: 'Port', vocoders: 'Vocoders',
     total_active_time: 'active, seconds', active_count: 'periods of activity',
-    average_active_time: 'average period, seconds', overload_count: 'overloads', num_messages: 'messages',
-    num_unique_messages: 'unique', num_redundant_messages: 'redundant', thermal_state: 'thermal state',
+    average_active_time: 'average period, seconds', overload_count: 'overloads', num_messages: 'messages in all',
+    num_unique_messages: 'unique messages', num_redundant_messages: 'redundant messages', thermal_state: 'thermal state',
     low_power_enabled: 'low power', load_avg_1_min: 'load, 1 min', load_avg_5_min: 'load, 5 min',
     load_avg_15_min: 'load, 15 min', vmInfo_phys_footprint_MiB: 'service memory, MiB',
 };
 const MOST_MARKS_LISTED = 300;
+const MOST_CAPTURES_LISTED = 500;
 
 function cellText(value) {
     if (value === null || value === undefined) { return '–'; }
@@ -49,6 +50,13 @@ function remarksOn(session) {
     return remarks;
 }
 
+/** A key's title, which tells the key to who points at it. */
+function headingOf(key) {
+    const heading = element('abbr', '', COLUMN_TITLES[key] ?? key);
+    heading.title = key;
+    return heading;
+}
+
 function summaryTables(session) {
     const parts = [];
     for (const kind of ['output', 'input', 'group']) {
@@ -56,23 +64,24 @@ function summaryTables(session) {
         if (rows.length > 0) {
             const columns = report.columns[kind];
             parts.push(element('div', 'scroll', table('summary', SUMMARY_TITLES[kind],
-                columns.map((key) => COLUMN_TITLES[key] ?? key),
+                columns.map(headingOf),
                 rows.map(({ values }) => columns.map((key) => cellText(values[key]))))));
         }
     }
     for (const { values } of session.summaries.filter((summary) => summary.kind === 'session')) {
         parts.push(element('h3', '', SUMMARY_TITLES.session), definitions(report.columns.session
-            .filter((key) => values[key] !== null).map((key) => [COLUMN_TITLES[key] ?? key, cellText(values[key])])));
+            .filter((key) => values[key] !== null).map((key) => [headingOf(key), cellText(values[key])])));
     }
     return parts;
 }
 
-function markList(session, choose) {
+function markList(session, current, choose) {
     const list = element('ol', 'marks');
     for (const mark of session.marks.slice(0, MOST_MARKS_LISTED)) {
         const button = element('button', `mark ${MARKS[mark.kind].name}`,
             element('time', '', clockText(mark.at, 3)), ` ${MARKS[mark.kind].title} `, element('b', '', mark.text));
         button.type = 'button';
+        if (mark === current) { button.setAttribute('aria-current', 'true'); }
         button.addEventListener('click', () => choose(mark));
         list.append(element('li', '', button));
     }
@@ -82,10 +91,11 @@ function markList(session, choose) {
 }
 
 /** Fills the panel; `choose` is called with a mark that is chosen from its list. */
-function showDetails(session, choose) {
+function showDetails(session, mark, choose) {
     const panel = document.getElementById('details');
     if (session === null) {
         panel.replaceChildren(element('p', 'hint', 'Select a session to see its summaries and marks.'));
+        panel.classList.add('empty');
         return;
     }
     const parts = [element('h2', '', session.app),
@@ -98,17 +108,25 @@ function showDetails(session, choose) {
             ['from', momentText(session.began, 3)],
             ['to', momentText(session.ended, 3)],
             ['length', lengthText(session.ended - session.began)],
-            ['messages', session.messages],
+            ['messages', `${session.messages}, and ${session.summaries.length} summaries`],
             ['devices', [...session.devices].join(', ') || '–'],
         ]),
         ...summaryTables(session)];
     if (session.marks.length > 0) {
-        parts.push(element('h3', '', `Marks (${session.marks.length})`), markList(session, choose));
+        parts.push(element('h3', '', `Marks (${session.marks.length})`), markList(session, mark, choose));
     }
     const keys = element('details', '', element('summary', '', `Payload keys (${session.keys.length})`),
         element('p', 'keys', session.keys.map((key) => report.keys[key]).join(', ')));
+    const { scrollTop } = panel, isSame = panel.dataset.session === String(session.number);
+    panel.classList.remove('empty');
+    panel.dataset.session = session.number;
     panel.replaceChildren(...parts, keys);
-    panel.scrollTop = 0;
+    panel.scrollTop = isSame ? scrollTop : 0;
+    const chosen = panel.querySelector('[aria-current]');
+    if (chosen !== null) {
+        const list = chosen.closest('ol');
+        list.scrollTop = chosen.offsetTop - list.offsetTop - list.clientHeight / 2;
+    }
 }
 
 /** The address of a capture's folder; nothing for what is no name that a capture has. */
@@ -126,14 +144,28 @@ function folderCell(event) {
     return link;
 }
 
+function captureRow(event) {
+    const row = element('tr', '', ...[momentText(event.at, 3), DEVICE_EVENTS[event.kind], event.text, folderCell(event)]
+        .map((cell) => element('td', '', cell)));
+    row.id = `capture-${deviceEvents.indexOf(event)}`;
+    row.tabIndex = -1;
+    return row;
+}
+
+/** The row of one; of the earlier ones, which are not listed, it is made when one is asked for. */
+function rowOfCapture(event) {
+    const body = document.querySelector('#captures tbody');
+    const row = document.getElementById(`capture-${deviceEvents.indexOf(event)}`) ?? captureRow(event);
+    if (!row.isConnected) { body.prepend(row); }
+    return row;
+}
+
 function showCaptures() {
     const section = document.getElementById('captures');
     section.hidden = deviceEvents.length === 0;
-    const made = table('captures', '', ['Time (UTC)', 'What', 'Of', 'Folder'], deviceEvents.map((event) =>
-        [momentText(event.at, 3), DEVICE_EVENTS[event.kind], event.text, folderCell(event)]));
-    [...made.tBodies[0].rows].forEach((row, i) => {
-        row.id = `capture-${i}`;
-        row.tabIndex = -1;
-    });
-    section.querySelector('.scroll').replaceChildren(made);
+    const made = table('captures', '', ['Time (UTC)', 'What', 'Of', 'Folder'], []);
+    made.tBodies[0].append(...deviceEvents.slice(-MOST_CAPTURES_LISTED).map(captureRow));
+    const earlier = Math.max(0, deviceEvents.length - MOST_CAPTURES_LISTED);
+    section.querySelector('.scroll').replaceChildren(made, ...(earlier === 0 ? []
+        : [element('p', 'hint', `and ${earlier} earlier ones on the timeline`)]));
 }

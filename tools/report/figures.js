@@ -33,7 +33,8 @@ function figuresOf(shown) {
     return figures;
 }
 
-const minutesText = (seconds) => (seconds / 60).toLocaleString('en', { maximumFractionDigits: seconds < 600 ? 2 : 1 });
+const minutesText = (seconds) => (seconds / 60).toLocaleString('en',
+    { minimumFractionDigits: seconds < 600 ? 2 : 1, maximumFractionDigits: seconds < 600 ? 2 : 1 });
 
 function bar(sum, most) {
     const cell = element('td', 'bars');
@@ -46,7 +47,7 @@ function bar(sum, most) {
 }
 
 /** Minutes by name, the longest first; what is beyond the first ones stands together. */
-function barFigure(id, title, sums) {
+function barFigure(id, title, sums, note = '') {
     const rows = [...sums].sort((a, b) => (b[1].output + b[1].input) - (a[1].output + a[1].input));
     const rest = rows.splice(MOST_BARS);
     if (rest.length > 0) {
@@ -66,7 +67,7 @@ function barFigure(id, title, sums) {
         });
         made.tBodies[0].append(element('tr', '', head, bar(sum, most), ...cells));
     }
-    return figure(id, title, rows.length > 0 ? [made] : []);
+    return figure(id, title, rows.length > 0 ? [made, ...(note === '' ? [] : [element('p', 'hint', note)])] : []);
 }
 
 function figure(id, title, content) {
@@ -86,12 +87,13 @@ function svg(name, attributes, ...content) {
 /** A round number that is no less. */
 function roundUp(number) {
     const power = 10 ** Math.floor(Math.log10(number));
-    return [1, 2, 2.5, 5, 10].map((step) => step * power).find((step) => step >= number * 0.9999);
+    return [1, 2, 4, 6, 8, 10].map((step) => step * power).find((step) => step >= number * 0.9999);
 }
 
-/** Columns `[label, value, title]` with an axis, and the same as a table to open. */
-function columnFigure(id, title, unit, columns, headings, className) {
-    const width = 520, height = 200, left = 44, bottom = 26, top = 10;
+/** Columns `[label, value, title]`, of which a label may be empty, with axes that say what they count, and the
+ * same as a table to open. */
+function columnFigure(id, { title, unit, axis, columns, headings, className, note = '' }) {
+    const width = 520, height = 224, left = 44, bottom = 42, top = 22;
     const most = roundUp(Math.max(1e-9, ...columns.map(([, value]) => value)));
     const plot = svg('svg', { viewBox: `0 0 ${width} ${height}`, role: 'img', 'aria-label': `${title}; the table below has the figures` });
     for (const part of [0, 0.5, 1]) {
@@ -99,20 +101,24 @@ function columnFigure(id, title, unit, columns, headings, className) {
         plot.append(svg('line', { x1: left, x2: width, y1: y, y2: y, class: 'grid' }),
             svg('text', { x: left - 6, y: y + 4, class: 'end' }, `${Number((most * part).toPrecision(3))}`));
     }
-    const step = (width - left) / columns.length;
-    const every = Math.ceil(64 / step);
+    plot.append(svg('text', { x: left, y: 10, class: 'start' }, unit),
+        svg('text', { x: width, y: height - 4, class: 'end' }, axis));
+    const step = Math.min((width - left) / columns.length, 64);
+    const every = Math.ceil((Math.max(...columns.map(([label]) => label.length)) * 6 + 16) / step);
     columns.forEach(([label, value, more], i) => {
         const tall = (height - top - bottom) * Math.max(0, value) / most;
         const x = left + i * step;
         plot.append(svg('rect', { x: x + step * 0.1, y: height - bottom - tall, width: step * 0.8, height: tall, class: className },
             svg('title', {}, `${more}: ${Number(value.toPrecision(4))} ${unit}`)));
-        if (i % every === 0) { plot.append(svg('text', { x: x + step / 2, y: height - 8, class: i === 0 ? 'start' : 'middle' }, label)); }
+        if (label !== '' && (i % every === 0 || columns.some(([other]) => other === ''))) {
+            plot.append(svg('text', { x: x + step / 2, y: height - bottom + 16, class: i === 0 ? 'first' : 'middle' }, label));
+        }
     });
     const numbers = table('', '', headings, columns.map(([, value, more]) => [more, Number(value.toPrecision(6))]));
-    return figure(id, title, [plot, element('details', '', element('summary', '', 'As a table'), element('div', 'scroll', numbers))]);
+    return figure(id, title, [plot, ...(note === '' ? [] : [element('p', 'hint', note)]), element('details', '', element('summary', '', 'As a table'), element('div', 'scroll', numbers))]);
 }
 
-function overloadFigure(overloads, shown) {
+function overloadFigure(overloads, shown, outputSeconds) {
     const title = 'Overloads per hour';
     if (overloads.length === 0) { return figure('figure-overloads', title, []); }
     let low = Infinity, high = -Infinity;
@@ -128,24 +134,32 @@ function overloadFigure(overloads, shown) {
     for (const at of overloads) { ++counts[Math.floor((at - start) / step)]; }
     const columns = counts.map((count, i) => {
         const text = momentText(start + i * step);
-        return [step < DAY ? text.slice(11, 16) : text.slice(5, 10), count / (step / HOUR), text.slice(0, 16)];
+        const label = step >= DAY ? text.slice(0, 10) : high - low >= DAY ? text.slice(5, 16) : text.slice(11, 16);
+        return [label, count / (step / HOUR), text.slice(0, 16)];
     });
-    return columnFigure('figure-overloads', title, 'per hour', columns, ['From (UTC)', 'Overloads per hour'], 'overload');
+    const rate = overloads.length / (outputSeconds / 3600);
+    const note = `${overloads.length} in all` + (outputSeconds > 0
+        ? `, with ${minutesText(outputSeconds)} minutes of output: ${Number(rate.toPrecision(3))} per hour of output.` : '.');
+    return columnFigure('figure-overloads', { title, unit: 'overloads per hour', axis: 'time (UTC)', columns,
+        headings: ['From (UTC)', 'Overloads per hour'], className: 'overload', note });
 }
 
 function showFigures(shown) {
     const figures = figuresOf(shown);
+    const outputSeconds = [...figures.service.values()].reduce((all, { output }) => all + output, 0);
     const volumes = figures.volume.some((seconds) => seconds > 0)
-        ? columnFigure('figure-volume', 'Minutes of output by volume', 'minutes',
-            figures.volume.map((seconds, i) => [String(Number(VOLUMES[i].toFixed(2))), seconds / 60, `volume ${VOLUMES[i]}`]),
-            ['Volume class', 'Minutes'], 'output')
+        ? columnFigure('figure-volume', { title: 'Minutes of output by volume', unit: 'minutes', axis: 'volume (1 is full)',
+            columns: figures.volume.map((seconds, i) =>
+                [i % 4 === 0 ? String(VOLUMES[i]) : '', seconds / 60, `volume ${VOLUMES[i]}`]),
+            headings: ['Volume class', 'Minutes'], className: 'output' })
         : figure('figure-volume', 'Minutes of output by volume', []);
     document.querySelector('#figures .plots').replaceChildren(
         barFigure('figure-application', 'Minutes by application', figures.application),
-        barFigure('figure-device', 'Minutes by device', figures.device),
+        barFigure('figure-device', 'Minutes by device', figures.device,
+            'A device counts for the whole time of each route that it is in.'),
         barFigure('figure-route', 'Minutes by route', figures.route),
         barFigure('figure-service', 'Minutes by service type', figures.service),
-        overloadFigure(figures.overloads, shown), volumes);
+        overloadFigure(figures.overloads, shown, outputSeconds), volumes);
     document.getElementById('figures-of').textContent = shown.length === sessions.length
         ? `of all ${sessions.length} sessions` : `of the ${shown.length} sessions shown`;
 }

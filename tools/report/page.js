@@ -14,24 +14,31 @@ function showAbout() {
     box.querySelector('ul').replaceChildren(...report.leftOut.map((line) => element('li', '', line)));
 }
 
+const MOST_CHOICES = 1000;
 function fillSelect(id, counts) {
     const all = element('option', '', 'all');
     all.value = '';
-    byId(id).replaceChildren(all, ...counts.map(([name, count]) => {
+    const options = counts.slice(0, MOST_CHOICES).map(([name, count]) => {
         const option = element('option', '', `${name} (${count})`);
         option.value = name;
         return option;
-    }));
+    });
+    if (counts.length > MOST_CHOICES) {
+        options.push(element('option', '', `and ${number(counts.length - MOST_CHOICES)} more: search for them`));
+        options[MOST_CHOICES].disabled = true;
+    }
+    byId(id).replaceChildren(all, ...options);
 }
 
 function showLegend() {
     const kinds = [['output', 'output'], ['input', 'input'], ...MARKS.map(({ name }) => [name, name])];
-    if (deviceEvents.length > 0) { kinds.push(['capture', 'capture']); }
+    if (deviceEvents.some(({ kind }) => kind !== DRAFT)) { kinds.push(['capture', 'capture']); }
+    if (deviceEvents.some(({ kind }) => kind === DRAFT)) { kinds.push(['draft', 'draft']); }
     byId('legend').replaceChildren(...kinds.map(([name, title]) => element('li', name, title)));
 }
 
 const timeline = new Timeline((session, mark) => {
-    showDetails(session, (chosen) => timeline.select(session, chosen));
+    showDetails(session, mark, (chosen) => timeline.select(session, chosen));
     byId('said').textContent = session === null ? '' : mark !== null ? markLines(mark).join(', ')
         : `${session.app}, ${session.service}, ${lengthText(session.ended - session.began)}, ${session.marks.length} marks`;
 });
@@ -86,16 +93,16 @@ document.addEventListener('keydown', (event) => {
 });
 for (const when of ['beforeprint', 'afterprint']) {
     window.addEventListener(when, () => {
-        document.documentElement.classList.toggle('printing', when === 'beforeprint');
-        timeline.readColours();
-        timeline.paint();
+        const isOn = when === 'beforeprint';
+        document.documentElement.classList.toggle('printing', isOn);
+        byId('left-out').open = isOn;
+        byId('printed').textContent = timeline.print(isOn);
     });
 }
 
 showAbout();
 showLegend();
-showDetails(null);
-showCaptures();
+showDetails(null, null);
 const shownFirst = applyFilters();
 timeline.fit(false);
 // The timeline is drawn before what takes longer and stands further down.
@@ -105,5 +112,6 @@ requestAnimationFrame(() => setTimeout(() => {
     fillSelect('by-device', countNames((session) => session.devices));
     fillSelect('by-key', countNames((session) => session.keys.map((key) => report.keys[key])));
     showFigures(shownFirst);
+    showCaptures();
     document.documentElement.dataset.state = 'whole';
 }));

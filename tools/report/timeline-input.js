@@ -1,5 +1,8 @@
 // How the timeline is moved, and what it says of what is pointed at.
 
+/** Marks that fall together and are told of at once. */
+const MOST_TOLD = 4;
+
 Object.assign(Timeline.prototype, {
     listen() {
         this.pointers = null;
@@ -63,7 +66,7 @@ Object.assign(Timeline.prototype, {
         }
     },
     goToCapture(found) {
-        const row = document.getElementById(`capture-${deviceEvents.indexOf(found)}`);
+        const row = rowOfCapture(found);
         const link = row.querySelector('a');
         row.scrollIntoView({ block: 'center' });
         (link ?? row).focus();
@@ -93,10 +96,16 @@ Object.assign(Timeline.prototype, {
         const session = this.rowAt(y);
         if (session === null) {
             const found = this.lane > 0 && y > AXIS && y < this.top ? this.nearest(deviceEvents, x) : null;
-            return found === null ? [] : [`${DEVICE_EVENTS[found.kind]}: ${found.text}`, momentText(found.at, 3)];
+            return found === null ? [] : [`${DEVICE_EVENTS[found.kind]}: ${found.text}`, momentText(found.at, 3),
+                ...(folderOf(found) === null ? [] : ['Click for the link to its folder'])];
         }
         const mark = x > this.labels ? this.nearest(session.marks, x) : null;
-        if (mark !== null) { return markLines(mark).concat(session.app); }
+        if (mark !== null) {
+            // A session's first route and volume, for one, lie on each other.
+            const together = session.marks.filter((other) => Math.abs(this.x(other.at) - this.x(mark.at)) < 2);
+            const more = together.length - MOST_TOLD;
+            return [...together.slice(0, MOST_TOLD).flatMap(markLines), ...(more > 0 ? [`and ${more} more: zoom in`] : []), session.app];
+        }
         const at = this.at(x);
         const stretches = x <= this.labels ? [] : session.stretches.filter(({ begin, end }) =>
             Math.min(begin, end) <= at && at <= Math.max(begin, end));

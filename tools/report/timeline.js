@@ -11,6 +11,8 @@ const STEPS = [1, 2, 5, 10, 20, 50, 100, 200, 500, SECOND, 2 * SECOND, 5 * SECON
     30 * SECOND, MINUTE, 2 * MINUTE, 5 * MINUTE, 10 * MINUTE, 15 * MINUTE, 30 * MINUTE, HOUR, 2 * HOUR, 3 * HOUR,
     6 * HOUR, 12 * HOUR, DAY, 2 * DAY, 7 * DAY, 14 * DAY, 30 * DAY, 91 * DAY, 365 * DAY, 3650 * DAY, 36500 * DAY];
 const LEAST_SPAN = 20;
+/** What a sheet of paper shows: pixels that fill its width, and rows. */
+const PAPER_WIDTH = 1000, PAPER_ROWS = 36;
 /** What a timeline begins with, at most, of sessions that reach over more. */
 const FIRST_SPAN = 2 * DAY;
 
@@ -30,7 +32,7 @@ class Timeline {
         this.selected = null;
         this.mark = null;
         this.isDue = false;
-        this.isPrinting = false;
+        this.paper = null; // while the page is printed
         this.frames = 0;
         this.lane = deviceEvents.length > 0 ? LANE : 0;
         this.measure();
@@ -54,8 +56,27 @@ class Timeline {
     get top() { return AXIS + this.lane; }
     /** Asking the browser for each mark anew would take longer than drawing it. */
     measure() {
-        this.labels = this.box.clientWidth < 600 ? 116 : 230;
-        this.width = Math.max(50, this.box.clientWidth - this.labels);
+        this.size = this.paper ?? { width: this.box.clientWidth, height: this.box.clientHeight, ratio: window.devicePixelRatio || 1 };
+        this.scroll = this.paper?.scroll ?? this.box.scrollTop;
+        this.labels = this.size.width < 600 ? 116 : 230;
+        this.width = Math.max(50, this.size.width - this.labels);
+    }
+    /** For paper, which has another size than the window, and as many rows as go on a sheet. Tells which. */
+    print(isOn) {
+        if (!isOn) {
+            const scroll = this.paper?.screen ?? this.scroll;
+            this.paper = null;
+            this.box.scrollTop = scroll;
+            this.readColours();
+            this.paint();
+            return '';
+        }
+        const rows = Math.min(this.rows.length, PAPER_ROWS), screen = this.box.scrollTop;
+        const first = Math.min(Math.floor(screen / ROW), this.rows.length - rows);
+        this.paper = { width: PAPER_WIDTH, height: this.top + rows * ROW + 4, ratio: 2, scroll: first * ROW, screen };
+        this.readColours();
+        this.paint();
+        return rows < this.rows.length ? `Sessions ${first + 1} to ${first + rows} of ${this.rows.length} are printed.` : '';
     }
     x(at) { return this.labels + (at - this.start) / this.span * this.width; }
     at(x) { return this.start + (x - this.labels) / this.width * this.span; }
@@ -141,11 +162,10 @@ class Timeline {
     }
 
     paint() {
-        const { context, box, canvas } = this;
+        const { context, canvas } = this;
         this.measure();
         this.chooseRows();
-        const ratio = window.devicePixelRatio || 1;
-        const width = box.clientWidth, height = box.clientHeight;
+        const { width, height, ratio } = this.size, { scroll } = this;
         if (canvas.width !== Math.round(width * ratio) || canvas.height !== Math.round(height * ratio)) {
             canvas.width = Math.round(width * ratio);
             canvas.height = Math.round(height * ratio);
@@ -157,16 +177,17 @@ class Timeline {
         context.fillStyle = this.colours.panel;
         context.fillRect(0, 0, width, height);
         context.textBaseline = 'middle';
-        const first = Math.max(0, Math.floor(box.scrollTop / ROW));
-        const last = Math.min(this.rows.length, Math.ceil((box.scrollTop + height - this.top) / ROW));
+        const first = Math.max(0, Math.floor(scroll / ROW));
+        const last = Math.min(this.rows.length, Math.ceil((scroll + height - this.top) / ROW));
         context.save();
         context.beginPath();
         context.rect(0, this.top, width, height - this.top);
         context.clip();
-        for (let i = first; i < last; ++i) { this.paintStripe(this.rows[i], i, this.top + i * ROW - box.scrollTop); }
+        for (let i = first; i < last; ++i) { this.paintStripe(this.rows[i], i, this.top + i * ROW - scroll); }
         this.paintGrid(height);
-        for (let i = first; i < last; ++i) { this.paintRow(this.rows[i], this.top + i * ROW - box.scrollTop); }
-        for (let i = first; i < last; ++i) { this.paintLabel(this.rows[i], this.top + i * ROW - box.scrollTop); }
+        for (let i = first; i < last; ++i) { this.paintRow(this.rows[i], this.top + i * ROW - scroll); }
+        for (let i = first; i < last; ++i) { this.paintLabel(this.rows[i], this.top + i * ROW - scroll); }
+        if (this.mark !== null) { this.paintChosenMark(); }
         context.restore();
         this.paintAxis(width, height);
         if (this.lane > 0) { this.paintLane(width); }
@@ -177,7 +198,7 @@ class Timeline {
         const isSelected = session === this.selected;
         if (!isSelected && i % 2 === 0) { return; }
         this.context.fillStyle = isSelected ? this.colours.selected : this.colours.row;
-        this.context.fillRect(0, y, this.box.clientWidth, ROW);
+        this.context.fillRect(0, y, this.size.width, ROW);
     }
 
     ticks() {
@@ -239,149 +260,13 @@ class Timeline {
             if (x < labels || x > width || x - last < 2) { continue; }
             last = x;
             context.fillStyle = colours.capture;
-            if (event.kind === 3) {
+            if (event.kind === DRAFT) {
                 context.fillRect(x - 4, AXIS + 7, 8, 10);
             } else {
                 context.beginPath();
                 context.arc(x, AXIS + LANE / 2, 5, 0, 2 * Math.PI);
                 context.fill();
             }
-        }
-    }
-
-    paintRow(session, y) {
-        const { context, colours, labels } = this;
-        const right = labels + this.width;
-        const from = Math.max(this.x(session.low), labels), to = Math.min(this.x(session.high), right);
-        if (to < labels || from > right) {
-            context.fillStyle = colours.muted;
-            context.font = '12px system-ui, sans-serif';
-            context.fillText(to < labels ? '◂' : '▸', to < labels ? labels + 3 : right - 13, y + ROW / 2);
-            return;
-        }
-        this.paintBar(session, y);
-        for (const stretch of session.stretches) { this.paintStretch(stretch, y); }
-        this.paintMarks(session, y, right);
-        if (session === this.selected && this.mark !== null) {
-            context.strokeStyle = colours.text;
-            context.lineWidth = 2;
-            context.beginPath();
-            context.arc(this.x(this.mark.at), y + ROW / 2, 9, 0, 2 * Math.PI);
-            context.stroke();
-        }
-    }
-
-    /** Marks of one kind that fall together are drawn once; very many, as lines. */
-    paintMarks({ marks }, y, right) {
-        const isDense = marks.length > DENSE;
-        const last = MARKS.map(() => -Infinity);
-        for (const { at, kind } of marks) {
-            const x = this.x(at);
-            if (x < this.labels || x > right || x - last[kind] < (isDense ? 3 : 1.5)) { continue; }
-            last[kind] = x;
-            if (isDense) {
-                this.context.fillStyle = this.colours[MARKS[kind].name];
-                this.context.fillRect(x - 1, y + 3 + kind * 5, 2, 5);
-            } else {
-                this.paintMark(kind, x, y + ROW / 2);
-            }
-        }
-    }
-
-    paintBar(session, y) {
-        const { context, colours } = this;
-        const from = this.x(Math.min(session.began, session.ended)), to = this.x(Math.max(session.began, session.ended));
-        const width = Math.max(to - from, 2);
-        if (!session.isNegative) {
-            context.fillStyle = colours.session;
-            context.fillRect(from, y + ROW / 2 - 2, width, 4);
-            return;
-        }
-        context.strokeStyle = colours.overload;
-        context.lineWidth = 1.5;
-        context.setLineDash([4, 3]);
-        context.strokeRect(from, y + 5, width, ROW - 10);
-        context.setLineDash([]);
-        context.fillStyle = colours.overload;
-        context.font = '11px system-ui, sans-serif';
-        const text = `${lengthText(session.ended - session.began)}: clock set back`;
-        context.fillText(text, Math.max(from, this.labels) + width + 6, y + ROW / 2);
-    }
-
-    paintStretch({ begin, end, isOutput, how }, y) {
-        const { context, colours, labels } = this;
-        const from = Math.max(this.x(Math.min(begin, end)), labels - 4);
-        const to = Math.min(this.x(Math.max(begin, end)), labels + this.width + 4);
-        if (to < labels || from > labels + this.width) { return; }
-        const colour = isOutput ? colours.output : colours.input;
-        const top = y + (isOutput ? 4 : 14), width = Math.max(to - from, 1.5);
-        context.globalAlpha = (how & STRETCH.isEstimated) !== 0 ? 0.45 : 1;
-        if (end < begin) {
-            context.strokeStyle = colour;
-            context.lineWidth = 1.5;
-            context.strokeRect(from, top + 0.75, width, 6.5);
-        } else {
-            context.fillStyle = colour;
-            context.fillRect(from, top, width, 8);
-        }
-        context.globalAlpha = 1;
-        if ((how & STRETCH.isOpen) !== 0) {
-            context.fillStyle = colours.panel;
-            context.fillRect(to - 3, top, 1.5, 8);
-        }
-    }
-
-    paintMark(kind, x, y) {
-        const { context, colours } = this;
-        context.fillStyle = colours[MARKS[kind].name];
-        context.strokeStyle = colours.panel;
-        context.lineWidth = 1;
-        context.beginPath();
-        if (kind === 0) {
-            context.rect(x - 1.5, y - 7, 3, 14);
-        } else if (kind === ROUTE) {
-            context.moveTo(x, y - 6);
-            context.lineTo(x + 6, y);
-            context.lineTo(x, y + 6);
-            context.lineTo(x - 6, y);
-        } else if (kind === OVERLOAD) {
-            context.arc(x, y, 5.5, 0, 2 * Math.PI);
-        } else {
-            context.moveTo(x, y - 7);
-            context.lineTo(x + 7, y + 5);
-            context.lineTo(x - 7, y + 5);
-        }
-        context.closePath();
-        context.fill();
-        context.stroke();
-    }
-
-    /** A text cut to a width; measured once for each. */
-    shorten(text, width) {
-        const key = `${width} ${text}`;
-        let short = this.shortened.get(key);
-        if (short === undefined) {
-            short = text;
-            while (short.length > 1 && this.context.measureText(short).width > width) {
-                short = `${short.replace(/…$/, '').slice(0, -Math.max(1, Math.floor(short.length / 12)))}…`;
-            }
-            if (this.shortened.size > 5000) { this.shortened.clear(); }
-            this.shortened.set(key, short);
-        }
-        return short;
-    }
-    paintLabel(session, y) {
-        const { context, colours, labels } = this;
-        const width = labels > 200 ? 140 : labels - 18;
-        context.fillStyle = session === this.selected ? colours.selected : colours.panel;
-        context.fillRect(0, y, labels - 1, ROW);
-        context.fillStyle = colours.text;
-        context.font = '13px system-ui, sans-serif';
-        context.fillText(this.shorten(session.app, width), 10, y + ROW / 2);
-        if (labels > 200) {
-            context.fillStyle = colours.muted;
-            context.font = '11px system-ui, sans-serif';
-            context.fillText(this.shorten(session.service, labels - width - 26), width + 18, y + ROW / 2);
         }
     }
 }

@@ -1,6 +1,8 @@
 #include "workers/accessories/ZRReportingSessionAudioRegistrationWorker.h"
 
 #include "base/Dictionary.h"
+#include "platform/Counters.h"
+#include "platform/PreferenceDomains.h"
 #include "util/Log.h"
 #include "workers/accessories/AccessoryRegistry.h"
 
@@ -18,7 +20,6 @@ namespace {
 
 using Worker = ZRReportingSessionAudioRegistrationWorker;
 
-constexpr std::string_view kDomain = "com.vandra.tamblo.accessories";
 constexpr std::string_view kKey = "registered";
 /// Accessories come and go in minutes, and their records are files to be read.
 constexpr std::chrono::minutes kLookupInterval{1};
@@ -39,13 +40,13 @@ void send(Context& context, std::vector<Dictionary> reports) {
 
 void lookUp(Context& context) {
     const Platform& device = context.platform();
-    PreferencesSuite store(*device.preferences, std::string(kDomain));
+    PreferencesSuite store(*device.preferences, std::string(kAccessoriesDomain));
     const std::optional<Value> kept = store.value(kKey);
     const std::vector<Accessory> seen = device.accessories->connectedEarbuds();
     AccessoryRegistry::Update update = AccessoryRegistry::update(kept, seen, device.clock->now());
     if (update.hadRubbish) {
         log::error(ZRReportingAudioRegistrationCategory(),
-                   "{}: {} holds what is no accessory; that is ignored", kDomain, kKey);
+                   "{}: {} holds what is no accessory; that is ignored", kAccessoriesDomain, kKey);
     }
     log::debug(ZRReportingAudioRegistrationCategory(), "looked up accessories. seen={} reported={}",
                seen.size(), update.reports.size());
@@ -70,7 +71,9 @@ std::optional<bool> ZRReportingSessionAudioRegistrationWorker::start() {
     const WallTime now = device.clock->now();
     // A clock that was set back does not put the next lookup off.
     const bool isRecent = lookups.last && *lookups.last <= now && now - *lookups.last < kLookupInterval;
-    if (!isRecent && !lookups.isUnderWay.exchange(true)) {
+    if (isRecent || lookups.isUnderWay.exchange(true)) {
+        counters::add(counters::Counter::accessoryLookups);
+    } else {
         lookups.last = now;
         // A queue for one piece, which runs after the queue is gone: at most once a minute, none is kept.
         device.workQueues->makeSerialQueue("com.vandra.tamblo.accessories")

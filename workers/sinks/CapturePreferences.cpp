@@ -2,6 +2,7 @@
 
 #include "base/Format.h"
 #include "base/Mutex.h"
+#include "platform/PreferenceDomains.h"
 #include "util/Log.h"
 
 #include <algorithm>
@@ -66,8 +67,8 @@ std::optional<Value> checked(Context& context, std::string_view key, const LogCa
     std::optional<Value> value = capturePreferences(context).value(key);
     const std::optional<Value> wrong = value && !isRight(*value) ? value : std::nullopt;
     if (context.shared<Reported>().isNews(key, wrong)) {
-        log::ownError(category, "preference {} {}: {} in place of {}; it is read as 0",
-                      kCapturePreferencesDomain, key, kindOf(*value), wanted);
+        log::ownError(category, "preference {} {}: {} in place of {}; it is read as 0", kCapturesDomain, key,
+                      kindOf(*value), wanted);
     }
     return value;
 }
@@ -75,7 +76,7 @@ std::optional<Value> checked(Context& context, std::string_view key, const LogCa
 } // namespace
 
 PreferencesSuite capturePreferences(const Context& context) {
-    return PreferencesSuite(*context.platform().preferences, std::string(kCapturePreferencesDomain));
+    return PreferencesSuite(*context.platform().preferences, std::string(kCapturesDomain));
 }
 
 std::optional<Value> numberPreference(Context& context, std::string_view key, const LogCategory& category) {

@@ -9,9 +9,6 @@
 
 namespace tamblo {
 
-/// The domain of the preferences by which a developer has an internal build capture or draft something.
-inline constexpr std::string_view kCapturePreferencesDomain = "com.vandra.tamblo.zrreporting";
-
 [[nodiscard]] PreferencesSuite capturePreferences(const Context& context);
 
 /// A value that is to be read as a number, or as a flag, if it is set. One of another kind, such as an array,

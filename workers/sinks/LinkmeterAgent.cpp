@@ -40,6 +40,7 @@ struct LinkmeterAgent::WaitingBytes {
 
 LinkmeterAgent::Messages::~Messages() {
     all.count.fetch_sub(bytes, std::memory_order_relaxed);
+    counters::add(counters::Counter::messagesLostSessionGone, list.size());
 }
 
 /// Counts a piece for as long as it is there, whatever becomes of it.
@@ -239,20 +240,24 @@ void LinkmeterAgent::sendAll(const std::shared_ptr<Messages>& messages) {
         if (linkmeterSessionStarted_) {
             sendMessage(sent.payload, sent.category, sent.type);
         } else {
+            counters::add(counters::Counter::messagesLostNoBackEnds);
             log::standard(ZRReportingSessionLinkmeterCategory(), "Session never started. {}",
                           "handleMessage");
         }
     }
+    messages->list.clear();
 }
 
 bool LinkmeterAgent::sendAtOnce(const Dictionary& payload, AudioEventCategory category, AudioEventType type) {
     if (!linkmeterSessionStarted_) {
         return false;
     }
-    if (linkmeterSession_ != nullptr &&
-        !context_.platform().callQuality->trySendLinkmeterMessage(
-            linkmeterSession_, ZRReportingSessionRtcWorker::retrieveLinkmeterCategoryFromCategory(category),
-            type, payload, keyLeftOut())) {
+    if (linkmeterSession_ == nullptr) {
+        counters::add(counters::Counter::messagesLostNoBackEnds);
+    } else if (!context_.platform().callQuality->trySendLinkmeterMessage(
+                   linkmeterSession_,
+                   ZRReportingSessionRtcWorker::retrieveLinkmeterCategoryFromCategory(category), type,
+                   payload, keyLeftOut())) {
         return false;
     }
     logSending();
@@ -264,6 +269,7 @@ void LinkmeterAgent::sendMessage(const Dictionary& payload, AudioEventCategory c
                                  AudioEventType type) {
     logSending();
     if (linkmeterSession_ == nullptr) {
+        counters::add(counters::Counter::messagesLostNoBackEnds);
         return;
     }
     const std::optional<std::string> failure = context_.platform().callQuality->SendLinkmeterMessage(
@@ -306,6 +312,7 @@ void LinkmeterAgent::finish(std::optional<std::vector<Dictionary>> payloads, Aud
         --stopsToCome_;
     }
     if (!linkmeterSessionStarted_) {
+        counters::add(counters::Counter::messagesLostNoBackEnds, payloads ? 1 : 0);
         log::standard(category, "Session never started. {}", "stop");
         return;
     }

@@ -63,8 +63,8 @@ private:
         Messages(const Messages&) = delete;
         Messages& operator=(const Messages&) = delete;
 
-        std::vector<Message> list;
-        std::size_t bytes = 0; ///< that count as waiting
+        std::vector<Message> list; ///< not sent yet; what is left in the end is lost
+        std::size_t bytes = 0;     ///< that count as waiting
         WaitingBytes& all;
     };
 

@@ -1,6 +1,7 @@
 #include "workers/sinks/ZRReportingSessionDPWorker.h"
 
 #include "base/Format.h"
+#include "platform/Counters.h"
 #include "session/BlockingWork.h"
 #include "session/ZRReportingSession.h"
 #include "util/AudioEvents.h"
@@ -113,14 +114,14 @@ bool ZRReportingSessionDPWorker::interestedInMessage(const ZRReportingSessionMes
 }
 
 bool ZRReportingSessionDPWorker::isToBeCaptured(const Dictionary& payload, double now) const {
-    if (integerOf(payload.find(kBufferSizeKey)) < runTime_.minimumBufferSize) {
+    if (integerOf(payload.find(kBufferSizeKey)) < runTime_.minimumBufferSize ||
+        integerOf(payload.find(kCycleKey)) < runTime_.minimumCycle) {
         return false;
     }
     // A clock that was set back holds captures off until it has caught up.
-    if (lastMessageTime_ != 0.0 && now - lastMessageTime_ <= kLeastSecondsBetweenCaptures) {
-        return false;
-    }
-    return integerOf(payload.find(kCycleKey)) >= runTime_.minimumCycle;
+    const bool isSoon = lastMessageTime_ != 0.0 && now - lastMessageTime_ <= kLeastSecondsBetweenCaptures;
+    counters::add(counters::Counter::stackCapturesRate, isSoon ? 1 : 0);
+    return !isSoon;
 }
 
 void ZRReportingSessionDPWorker::capture(ZRReportingSessionMessage& message, double now) {

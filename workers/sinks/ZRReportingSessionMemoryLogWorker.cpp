@@ -33,6 +33,7 @@ void ZRReportingSessionMemoryLogWorker::handleMessage(const MessageRef& message)
     ProcessList processes;
     processes.add(ownSession->processIdentifiers());
     processes.addNamedBy(message->payload());
+    counters::add(counters::Counter::processes, processes.leftOut());
     platform().memoryLog->logMemory(ownSession->reporterID(), std::move(processes).take());
 }
 

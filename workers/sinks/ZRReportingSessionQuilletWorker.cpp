@@ -1,6 +1,7 @@
 #include "workers/sinks/ZRReportingSessionQuilletWorker.h"
 
 #include "base/Mutex.h"
+#include "platform/Counters.h"
 #include "session/BlockingWork.h"
 #include "session/ZRReportingSession.h"
 #include "util/Log.h"
@@ -36,6 +37,7 @@ void draftCreated(const std::optional<std::string>& error) {
     if (error) {
         log::error(ZRReportingSessionCategory(), "Error creating draft - {}", *error);
     } else {
+        counters::add(counters::Counter::drafts);
         log::info(ZRReportingSessionCategory(), "Successfully created draft");
     }
 }
@@ -102,6 +104,7 @@ void ZRReportingSessionQuilletWorker::handleMessage(const MessageRef& message) {
     const std::shared_ptr<ZRReportingSession> owner = session();
     const ReporterID reporterID = owner != nullptr ? owner->reporterID() : 0;
     if (hasRun_) {
+        counters::add(counters::Counter::draftsBackOff);
         log::debug(ZRReportingSessionCategory(),
                    "Quillet has already run for TalvixXYerrorMessage reporterID={}", reporterID);
         return;
@@ -152,6 +155,7 @@ bool ZRReportingSessionQuilletWorker::hasRunInTimeframe(std::chrono::duration<do
         lastRun = numberPreference(context(), defaultsKey, ZRReportingSessionCategory());
     }
     if (lastRun && lastRun->doubleValue() > now - backOff.count()) {
+        counters::add(counters::Counter::draftsBackOff);
         log::debug(ZRReportingSessionCategory(), "Quillet has run. key={} lastRun={}", defaultsKey, *lastRun);
         return true;
     }

@@ -128,6 +128,7 @@ void ZRReportingSessionSummaryJsonFileWorker::writeMessage(ZRReportingSessionMes
     const std::optional<std::string> failure = appendPrettyJson(lines_, name, message.payload());
     if (failure) {
         // The separator before it stays, and the file is then no valid JSON.
+        counters::add(counters::Counter::summaryFileMessages);
         log::error(ZRReportingSessionCategory(), "dataWithJSONObject: {}", *failure);
         return;
     }
@@ -151,6 +152,7 @@ void ZRReportingSessionSummaryJsonFileWorker::openFile(const ZRReportingSession&
         log::error(ZRReportingSessionCategory(),
                    "SummaryJsonFileWorker failed to open file. action=open file={} error=\"{}\"",
                    *reportPath_, *failure);
+        isLost_ = true;
         return;
     }
     reportFileHandle_ = std::get<std::unique_ptr<ReportFile>>(std::move(file));
@@ -174,6 +176,7 @@ void ZRReportingSessionSummaryJsonFileWorker::writeOut() {
                    *reportPath_, *failure);
     }
     isOut_ = failure.has_value();
+    isLost_ = isLost_ || isOut_;
 }
 
 void ZRReportingSessionSummaryJsonFileWorker::closeFile() {
@@ -187,10 +190,13 @@ void ZRReportingSessionSummaryJsonFileWorker::closeFile() {
                    "SummaryJsonFileWorker left out messages, as the file is full. file={} messages={}",
                    *reportPath_, leftOut);
     }
+    const std::optional<std::string> failure =
+        reportFileHandle_ != nullptr ? reportFileHandle_->close() : std::nullopt;
+    counters::add(counters::Counter::summaryFilesLost, std::exchange(isLost_, false) || failure ? 1 : 0);
     if (reportFileHandle_ == nullptr) {
         return;
     }
-    if (const auto failure = reportFileHandle_->close()) {
+    if (failure) {
         log::error(ZRReportingSessionCategory(),
                    "SummaryJsonFileWorker failed to closed file. action=close file={} error=\"{}\"",
                    *reportPath_, *failure);

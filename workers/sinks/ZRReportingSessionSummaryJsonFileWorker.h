@@ -46,6 +46,7 @@ private:
     std::unique_ptr<ReportFile> reportFileHandle_;
     TextBuffer lines_; ///< not written yet
     bool isOut_ = false;
+    bool isLost_ = false;                 ///< the file, or some of it
     std::shared_ptr<MessageNames> names_; ///< while the file is made
     std::size_t looked_ = 0;              ///< messages of the session
     std::size_t bytes_ = 0;               ///< of the file, without the lines that wait

@@ -1,5 +1,6 @@
 #include "workers/trace/ZRReportingSessionTraceWorker.h"
 
+#include "platform/Counters.h"
 #include "session/ZRReportingSession.h"
 #include "util/Log.h"
 #include "workers/ReportFileName.h"
@@ -45,6 +46,7 @@ void deliver(const Platform& device, SessionTrace& trace, WallTime stoppedAt) {
         failure = writeFile(*device.reportFiles, path, chromeTraceText(trace).view());
     }
     if (failure) {
+        counters::add(counters::Counter::performanceFilesLost);
         log::error(ZRReportingTraceCategory(), "TraceWorker failed to write file. file={} error=\"{}\"", path,
                    *failure);
     } else {

@@ -116,9 +116,8 @@ std::string firstOf(std::initializer_list<std::string_view> texts) {
 }
 
 std::string nameOf(const Node& node, const Device* device, const Route* route) {
-    const std::string whole =
-        firstOf({node.description, node.nick, device == nullptr ? "" : device->description,
-                 device == nullptr ? "" : device->nick});
+    std::string whole = firstOf({node.description, node.nick, device == nullptr ? "" : device->description,
+                                 device == nullptr ? "" : device->nick});
     if (whole.empty()) {
         return node.mediaClass == MediaClass::source ? "Unnamed source" : "Unnamed sink";
     }

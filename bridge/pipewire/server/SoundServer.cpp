@@ -1,5 +1,6 @@
 #include "bridge/pipewire/server/SoundServer.h"
 
+#include "base/Format.h"
 #include "bridge/pipewire/graph/CleanText.h"
 #include "bridge/pipewire/graph/Properties.h"
 #include "bridge/pipewire/server/Context.h"
@@ -64,7 +65,7 @@ std::string SoundServer::socketPath() {
     }
     for (const char* const place : {"PIPEWIRE_RUNTIME_DIR", "XDG_RUNTIME_DIR", "USERPROFILE"}) {
         if (const std::string directory = variable(place); !directory.empty()) {
-            return directory + "/" + name;
+            return formatted("{}/{}", directory, name);
         }
     }
     return "/run/pipewire/" + name;

@@ -110,7 +110,7 @@ public:
     void killServer() { server_->end(SIGKILL); }
     void startManager() {
         manager_ = std::make_unique<Program>(std::vector<std::string>{"wireplumber"}, log("wireplumber"));
-        if (!eventually([this] { return contains("timeout 5 pw-metadata", "sink-"); })) {
+        if (!eventually([] { return contains("timeout 5 pw-metadata", "sink-"); })) {
             throw std::runtime_error("WirePlumber names no default sink: " + contentOf(log("wireplumber")));
         }
     }

@@ -10,8 +10,6 @@ using namespace std::chrono_literals;
 using test::PrivateSound;
 using test::Program;
 using test::ServiceProcess;
-using testing::HasSubstr;
-using testing::Not;
 
 /// A private sound server, a real service, and the program between them.
 class PipeWireServer : public testing::Test {

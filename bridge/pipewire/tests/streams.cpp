@@ -117,7 +117,8 @@ bool begin(Player& player, pw_core* core, const Options& options) {
     }
     pw_stream_add_listener(player.stream, &player.hook, &kEvents, &player);
     std::array<std::uint8_t, 1024> memory;
-    spa_pod_builder builder = SPA_POD_BUILDER_INIT(memory.data(), static_cast<std::uint32_t>(memory.size()));
+    spa_pod_builder builder{};
+    spa_pod_builder_init(&builder, memory.data(), static_cast<std::uint32_t>(memory.size()));
     spa_audio_info_raw format{};
     format.format = SPA_AUDIO_FORMAT_S16;
     format.rate = kRate;

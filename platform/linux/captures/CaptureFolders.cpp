@@ -76,6 +76,7 @@ void CaptureFolders::store(std::string_view identifier, std::span<const CaptureF
         problem = write(directory->get(), std::string(identifier), files);
         removeOld(directory->get(), now, identifier);
     }
+    counters::add(problem.empty() ? counters::Counter::bugCaptures : counters::Counter::bugCapturesOutage);
     tell(isWritingOut_, problem, "captures have no folders until it can be written again");
     // Where there is no folder either, one line says it all.
     if (problem.empty()) {

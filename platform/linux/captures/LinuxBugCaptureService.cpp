@@ -2,6 +2,7 @@
 
 #include "base/Format.h"
 #include "os/RandomNumber.h"
+#include "platform/Counters.h"
 #include "platform/ProcessList.h"
 
 #include <span>
@@ -62,6 +63,7 @@ LinuxBugCaptureService::LinuxBugCaptureService(SinkFiles& sinks, const std::stri
 std::unique_ptr<GlarnReporter> LinuxBugCaptureService::makeReporter(std::span<const pid_t> processes) {
     ProcessList eachOnce;
     eachOnce.add(processes);
+    counters::add(counters::Counter::processes, eachOnce.leftOut());
     return std::make_unique<Reporter>(*this, std::move(eachOnce).take());
 }
 
@@ -74,7 +76,8 @@ bool LinuxBugCaptureService::request(CaptureRequest request, const GlarnReporter
     request.time = clock_.now();
     const GlarnError refusal = admit(request.time);
     if (refusal != kGlarnErrorNone) {
-        counters::add(counters::Counter::bugCapturesRefusedToday);
+        counters::add(refusal == kGlarnErrorDailyLimitExceeded ? counters::Counter::bugCapturesRefusedToday
+                                                               : counters::Counter::bugCapturesShutdown);
         reply({{glarn::kReplySuccess, false}, {glarn::kReplyReason, static_cast<std::int32_t>(refusal)}});
         return true;
     }
@@ -115,6 +118,7 @@ void LinuxBugCaptureService::run(const RequestRef& request) {
             return;
         }
     }
+    counters::add(counters::Counter::bugCapturesShutdown);
     append("cancel", request->identifier);
 }
 
@@ -132,6 +136,7 @@ LinuxBugCaptureService::RequestRef LinuxBugCaptureService::takeRunning(const std
 
 void LinuxBugCaptureService::cancel(const std::string& identifier) {
     if (takeRunning(identifier) != nullptr) {
+        counters::add(counters::Counter::bugCapturesCancelled);
         append("cancel", identifier);
     }
 }
@@ -149,6 +154,7 @@ void LinuxBugCaptureService::endSessions() {
         isEnded_ = true;
         running.swap(running_);
     }
+    counters::add(counters::Counter::bugCapturesShutdown, running.size());
     for (const auto& [identifier, capture] : running) {
         append("cancel", identifier);
     }
@@ -159,7 +165,6 @@ void LinuxBugCaptureService::gatherLater(const RequestRef& request) {
 }
 
 void LinuxBugCaptureService::gather(const CaptureRequest& request) {
-    counters::add(counters::Counter::bugCaptures);
     const WallTime now = clock_.now();
     std::vector<CaptureFile> files = content_.gather(request, now);
     files.push_back({"log.txt", log_.lastLines()});

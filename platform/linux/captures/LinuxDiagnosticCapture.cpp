@@ -60,7 +60,10 @@ std::vector<ProcessStacks> findThreads(const ProcessFiles& files, const std::vec
     }
     const std::size_t share = shareOf(threads);
     for (std::size_t i = 0; i < found.size(); ++i) {
-        threads[i].resize(std::min(threads[i].size(), share));
+        if (threads[i].size() > share) {
+            counters::add(counters::Counter::threads, threads[i].size() - share);
+            threads[i].resize(share);
+        }
         for (const pid_t thread : threads[i]) {
             if (auto name = files.threadName(found[i].process, thread)) {
                 found[i].threads.push_back({thread, std::move(*name), {}});
@@ -155,7 +158,10 @@ LinuxDiagnosticCapture::LinuxDiagnosticCapture(SinkFiles& sinks, Clock& clock, W
 
 void LinuxDiagnosticCapture::captureStacks(StackCaptureRequest request) {
     Waiting waiting{std::move(request), clientProcesses_()};
-    waiting.clients.resize(std::min(waiting.clients.size(), kMaximumThreads));
+    if (waiting.clients.size() > kMaximumThreads) {
+        counters::add(counters::Counter::processes, waiting.clients.size() - kMaximumThreads);
+        waiting.clients.resize(kMaximumThreads);
+    }
     {
         const MutexLock lock(mutex_);
         if (add(std::move(waiting))) {
@@ -213,6 +219,7 @@ void LinuxDiagnosticCapture::captureWaiting() {
         ProcessList own(kMaximumThreads);
         own.addNamedBy(capture.request.payload);
         own.add(capture.clients);
+        counters::add(counters::Counter::processes, own.leftOut());
         ofEach.push_back(std::move(own).take());
     }
     for (const Waiting& capture : captures) {

@@ -36,15 +36,15 @@ ReplyError outOfMemory() {
 
 static_assert(std::ranges::equal(counters::kMethods, wire::kMethods, {}, {}, &wire::MethodRow::name));
 
-/// Of requests, and of errors with which they were answered, by the slot of the first method.
-std::size_t slotOf(std::size_t first, wire::Method method) noexcept {
-    return first + static_cast<std::size_t>(method);
+void countError(wire::Method method, counters::RequestError error) noexcept {
+    counters::addRequestError(static_cast<std::size_t>(method), error);
 }
 
 /// What was refused where it was read. Only then is a method known when it is the method's.
 void countRefusal(const wire::Refusal& refusal, wire::Method method) noexcept {
     using counters::Counter;
     const bool isMessage = method == wire::Method::sendMessage;
+    const bool areParameters = refusal.error.code == wire::kWrongParameters;
     switch (refusal.error.code) {
     case wire::kNotWellFormed:
         return counters::add(Counter::requestsRefusedNotWellFormed);
@@ -58,11 +58,11 @@ void countRefusal(const wire::Refusal& refusal, wire::Method method) noexcept {
     default:
         counters::add(Counter::requestsRefusedLimit);
     }
-    counters::addTo(slotOf(counters::kFirstRequestError, method), 1);
+    countError(method,
+               areParameters ? counters::RequestError::wrongParameters : counters::RequestError::limit);
     if (isMessage) {
         counters::addAlone(Counter::messagesReceived);
-        counters::add(refusal.error.code == wire::kWrongParameters ? Counter::messagesRefusedFrame
-                                                                   : Counter::messagesRefusedLimit);
+        counters::add(areParameters ? Counter::messagesRefusedFrame : Counter::messagesRefusedLimit);
     }
 }
 
@@ -151,6 +151,7 @@ void LinuxConnection::readOnce() {
     const Ending ending = receive(socket, received);
     countUnfinished();
     if (ending != Ending::none) {
+        counters::add(counters::Counter::requestsLostUnfinished, unfinished_.empty() ? 0 : 1);
         beginEnd(ending);
     } else if (!received.empty()) {
         takeFrames(received);
@@ -291,7 +292,7 @@ std::size_t LinuxConnection::decodeAndDispatch(std::span<const std::uint8_t> ite
     }
     const std::size_t bytes = kRequestBytes + request.decodedBytes;
     requests_->tally().addRequest();
-    counters::addAloneTo(slotOf(counters::kFirstRequest, request.method), 1);
+    counters::addAloneTo(counters::kFirstRequest + static_cast<std::size_t>(request.method), 1);
     if (request.method == wire::Method::sendMessage) {
         counters::addAlone(counters::Counter::messagesReceived);
     }
@@ -307,7 +308,7 @@ void LinuxConnection::addError(std::uint64_t id, const ReplyError& error) {
 
 void LinuxConnection::refuseKill(std::uint64_t id) {
     counters::add(counters::Counter::requestsRefusedNotAllowed);
-    counters::addTo(slotOf(counters::kFirstRequestError, wire::Method::killService), 1);
+    countError(wire::Method::killService, counters::RequestError::notAllowed);
     // The code is that of a limit, but none is reached.
     addError(id, {std::string(kProtocolErrorDomain), kLimitReached,
                   "killService is for root and the service's own user"});

@@ -111,6 +111,8 @@ public:
     void ready(std::uint32_t events) override TAMBLO_EXCLUDES(mutex_);
     /// Its turn to be read, at this time.
     void read(RequestTally::Time now) TAMBLO_EXCLUDES(mutex_);
+    /// What that took of the processor.
+    void noteReading(std::chrono::nanoseconds time) noexcept { requests_->tally().addReadingTime(time); }
     /// A frame that has begun got no further.
     void endUnfinished() TAMBLO_EXCLUDES(mutex_);
     /// Refuses the connection as a whole, which is not resumed: the reason is sent.

@@ -1,4 +1,5 @@
 #include "platform/linux/connections/ReadTurns.h"
+#include "os/ThreadTime.h"
 
 #include "platform/linux/connections/LinuxConnection.h"
 
@@ -26,6 +27,18 @@ bool ReadTurns::readSome() {
     if (users_.empty()) {
         return false;
     }
+    if (!processorShare_.wantsSample()) {
+        readForSomeTime();
+    } else {
+        const std::chrono::nanoseconds processor = threadTime();
+        const auto began = std::chrono::steady_clock::now();
+        readForSomeTime();
+        processorShare_.addSample(threadTime() - processor, std::chrono::steady_clock::now() - began);
+    }
+    return !users_.empty();
+}
+
+void ReadTurns::readForSomeTime() {
     auto now = std::chrono::steady_clock::now();
     const auto ends = now + kReadingTime;
     do {
@@ -37,9 +50,9 @@ bool ReadTurns::readSome() {
             users_.push_back(user);
         }
         connection->read(now);
-        now = std::chrono::steady_clock::now();
+        const auto began = std::exchange(now, std::chrono::steady_clock::now());
+        connection->noteReading(processorShare_.of(now - began));
     } while (!users_.empty() && now < ends);
-    return !users_.empty();
 }
 
 } // namespace tamblo

@@ -1,5 +1,6 @@
 #pragma once
 
+#include "platform/ProcessorShare.h"
 #include "platform/linux/connections/ClientUser.h"
 
 #include <deque>
@@ -19,6 +20,9 @@ public:
     [[nodiscard]] bool readSome();
 
 private:
+    void readForSomeTime();
+
+    ProcessorShare processorShare_;
     std::deque<std::shared_ptr<ClientUser>> users_; ///< those with readable connections
 };
 

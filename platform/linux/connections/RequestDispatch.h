@@ -49,8 +49,11 @@ public:
 
 private:
     static void refuse(Receiver& receiver, wire::Method method, std::uint64_t id, const ReplyError& error) {
-        counters::addTo(counters::kFirstRequestError + static_cast<std::size_t>(method), 1);
-        if (error.code == kLimitReached) {
+        const bool isLimit = error.code == kLimitReached;
+        counters::addRequestError(static_cast<std::size_t>(method),
+                                  isLimit ? counters::RequestError::limit
+                                          : counters::RequestError::reportingDisabled);
+        if (isLimit) {
             receiver.noteLimit(error.message);
         }
         receiver.reply([&](TextBuffer& out) { wire::appendErrorReply(out, id, error); });

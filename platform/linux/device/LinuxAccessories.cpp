@@ -3,6 +3,7 @@
 #include "base/Format.h"
 #include "os/Directory.h"
 #include "os/SmallFile.h"
+#include "platform/Counters.h"
 #include "platform/linux/device/BluetoothRecord.h"
 
 #include <algorithm>
@@ -123,7 +124,10 @@ std::vector<std::string> LinuxAccessories::addressesIn(const std::string& direct
                               std::generic_category().message(error)));
     }
     std::sort(addresses.begin(), addresses.end());
-    addresses.resize(std::min(addresses.size(), most));
+    if (addresses.size() > most) {
+        counters::add(counters::Counter::accessories, addresses.size() - most);
+        addresses.resize(most);
+    }
     return addresses;
 }
 

@@ -1,6 +1,7 @@
 #pragma once
 
 #include "base/Mutex.h"
+#include "os/ThreadTime.h"
 #include "platform/Clock.h"
 
 #include <ctime>
@@ -17,6 +18,9 @@ public:
         std::timespec time{};
         ::clock_gettime(CLOCK_REALTIME_COARSE, &time);
         return WallTime(std::chrono::seconds(time.tv_sec) + std::chrono::nanoseconds(time.tv_nsec));
+    }
+    [[nodiscard]] std::chrono::nanoseconds threadTime() const noexcept override {
+        return tamblo::threadTime();
     }
     [[nodiscard]] std::chrono::seconds utcOffset(WallTime time) const override {
         const std::time_t seconds = std::chrono::floor<std::chrono::seconds>(time.time_since_epoch()).count();

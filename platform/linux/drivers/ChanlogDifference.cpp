@@ -1,6 +1,7 @@
 #include "platform/linux/drivers/ChanlogDifference.h"
 
 #include "base/Format.h"
+#include "platform/Counters.h"
 
 #include <algorithm>
 #include <memory>
@@ -149,6 +150,7 @@ ChanlogChannels ChanlogDifference::between(const ChanlogChannels& earlier, const
         }
         auto gained = std::make_shared<ChanlogChannel>();
         const Trouble trouble = subtract(**then, *now, *gained);
+        counters::add(counters::Counter::driverDifferences, trouble != nullptr ? 1 : 0);
         if (trouble != nullptr || !troubled_.empty()) {
             report(*now, trouble);
         }

@@ -110,7 +110,7 @@ LinuxStructuredLog::LinuxStructuredLog(int descriptor, std::string_view filter)
     for (const std::string& word : filter_.unknownWords()) {
         report(LogLevel::error, kOwnCategory,
                formatted("TAMBLO_LOG: \"{}\" is neither a level (debug, info, default, error, fault) nor "
-                         "CODE=level; it is ignored",
+                         "CODE=level with a code that there is (\"tambloctl list log-codes\"); it is ignored",
                          word));
     }
 }

@@ -1,6 +1,7 @@
 #include "platform/linux/sinks/FileModes.h"
 
 #include "base/Format.h"
+#include "platform/PreferenceDomains.h"
 
 #include <charconv>
 #include <optional>
@@ -10,11 +11,10 @@ namespace tamblo {
 
 namespace {
 
-constexpr std::string_view kDomain = "com.vandra.tamblo.sinks";
 constexpr unsigned kMostPermissions = 0777;
 
 mode_t readMode(const Preferences& preferences, StructuredLog& log, std::string_view key, mode_t least) {
-    const std::optional<Value> value = preferences.copyPreferenceValue(key, kDomain);
+    const std::optional<Value> value = preferences.copyPreferenceValue(key, kSinksDomain);
     if (!value) {
         return least;
     }
@@ -22,8 +22,9 @@ mode_t readMode(const Preferences& preferences, StructuredLog& log, std::string_
     unsigned mode = 0;
     const auto [end, error] = std::from_chars(text.data(), text.data() + text.size(), mode, 8);
     if (text.empty() || error != std::errc() || end != text.data() + text.size() || mode > kMostPermissions) {
-        log.report(LogLevel::error, "zrrs",
-                   formatted("{}: {} is no octal text from \"0\" to \"0777\"; it is not used", kDomain, key));
+        log.report(
+            LogLevel::error, "zrrs",
+            formatted("{}: {} is no octal text from \"0\" to \"0777\"; it is not used", kSinksDomain, key));
         return least;
     }
     return mode | least;

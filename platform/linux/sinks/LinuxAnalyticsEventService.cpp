@@ -2,6 +2,7 @@
 
 #include "base/Json.h"
 #include "platform/Counters.h"
+#include "platform/PreferenceDomains.h"
 
 #include <algorithm>
 #include <functional>
@@ -15,7 +16,7 @@ LinuxAnalyticsEventService::LinuxAnalyticsEventService(SinkFiles& sinks, const C
                                                        StructuredLog& log)
     : clock_(clock),
       preferences_(preferences),
-      preference_({.domain = "com.vandra.tamblo.analytics",
+      preference_({.domain = kAnalyticsDomain,
                    .key = "events_in_use",
                    .categoryCode = "zrrs",
                    .whenAbsent = {"*"},

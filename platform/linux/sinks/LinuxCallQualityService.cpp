@@ -2,6 +2,7 @@
 
 #include "base/Format.h"
 #include "os/RandomNumber.h"
+#include "platform/PreferenceDomains.h"
 #include "platform/linux/sinks/PayloadSize.h"
 
 #include <cstddef>
@@ -39,7 +40,7 @@ LinuxCallQualityService::LinuxCallQualityService(SinkFiles& sinks, const Clock& 
       texts_(sinks.payloadTexts()),
       file_(sinks, "call-quality.jsonl", "zrri", AppendOnlyFile::Flushed::byOwner,
             {.waiting = kMostHeldBack}),
-      backends_({.domain = "com.vandra.tamblo.callquality",
+      backends_({.domain = kCallQualityDomain,
                  .key = "backends",
                  .categoryCode = "zrri",
                  .whenAbsent = {"spool"},

@@ -99,12 +99,8 @@ private:
 
 ReportLimits ReportLimits::read(const Preferences& preferences) {
     ReportLimits limits;
-    const auto number = [&preferences](std::string_view key, std::uint64_t otherwise) {
-        const auto value = preferences.copyPreferenceValue(key, kLimitsDomain);
-        return value && value->isNumber() && value->integerValue() > 0 ? value->unsignedValue() : otherwise;
-    };
-    limits.files = static_cast<std::size_t>(number("report_files", limits.files));
-    limits.bytes = number("report_bytes", limits.bytes);
+    limits.files = Limits::preferenceOf(preferences, "report_files").value_or(limits.files);
+    limits.bytes = Limits::preferenceOf(preferences, "report_bytes").value_or(limits.bytes);
     limits.fileBytes = std::min(limits.fileBytes, limits.bytes);
     return limits;
 }

@@ -83,9 +83,9 @@ void CounterFile::open(const std::string& runtimeDirectory, StructuredLog& log) 
     Header wanted{.layout = counters::layoutHash(), .began = began_, .boot = bootIdentifier()};
     kMagic.copy(wanted.magic.data(), wanted.magic.size());
     File& file = *static_cast<File*>(place);
-    isContinued_ = file.header.magic == wanted.magic && file.header.layout == wanted.layout &&
-                   file.header.boot == wanted.boot;
-    if (!isContinued_) {
+    const bool isContinued = file.header.magic == wanted.magic && file.header.layout == wanted.layout &&
+                             file.header.boot == wanted.boot;
+    if (!isContinued) {
         std::memset(place, 0, sizeof(File));
         file.header = wanted;
     }

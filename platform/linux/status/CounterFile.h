@@ -29,12 +29,9 @@ public:
 
     /// In nanoseconds since 1970.
     [[nodiscard]] std::uint64_t began() const noexcept { return began_; }
-    /// Whether the counters go on with those of an earlier process.
-    [[nodiscard]] bool isContinued() const noexcept { return isContinued_; }
 
 private:
     std::uint64_t began_ = 0;
-    bool isContinued_ = false;
 };
 
 } // namespace tamblo

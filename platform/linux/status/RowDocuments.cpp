@@ -2,9 +2,16 @@
 
 #include "base/JsonObject.h"
 
+#include <cstddef>
+
 namespace tamblo {
 
 namespace {
+
+/// In memory: as text, each may take six times as much. The sessions of one reporter may be thousands, and
+/// have all that their users may have retained.
+constexpr std::size_t kMostBytesOfValue = 64U << 10U;
+constexpr std::size_t kMostBytesOfValues = 1U << 20U;
 
 void appendName(JsonObject& row, const std::optional<std::string>& name) {
     if (name) {
@@ -43,12 +50,32 @@ void appendFields(JsonObject& row, const SessionRow& session) {
         .text("service", session.serviceName)
         .text("state", session.isStopping  ? "stopping"
                        : session.isStarted ? "started"
-                                           : "stopped")
-        .number("messages", session.messages)
+                                           : "stopped");
+    if (session.start && session.length) {
+        row.number("start", secondsSince1970(*session.start))
+            .number("length", std::chrono::duration<double>(*session.length).count());
+    }
+    row.number("messages", session.messages)
         .number("bytes", session.bytes)
         .number("recorded", session.recorded)
         .number("dropped", session.dropped)
+        .number("seconds", std::chrono::duration<double>(session.time).count())
         .number("retained_bytes", session.retainedBytes);
+}
+
+/// The values that are shown: those that take much are left out, and all once there is no room.
+Dictionary withinRoom(const Dictionary& values, std::size_t& room, std::size_t& leftOut) {
+    Dictionary shown = values;
+    for (std::size_t i = 0; i != values.size(); ++i) {
+        const std::size_t bytes = values.keyAt(i).size() + sizeof(Value) + values.valueAt(i).heldBytes();
+        if (bytes > kMostBytesOfValue || bytes > room) {
+            shown.remove(values.keyAt(i));
+            ++leftOut;
+        } else {
+            room -= bytes;
+        }
+    }
+    return shown;
 }
 
 std::string lineOf(const TextBuffer& out) {
@@ -74,12 +101,17 @@ std::string sessionsDocument(const std::vector<SessionRow>& rows) {
 
 std::string sessionDocument(const std::vector<SessionDetail>& details) {
     TextBuffer out;
-    JsonObject(out).array("sessions", details, [](TextBuffer& text, const SessionDetail& detail) {
+    std::size_t room = kMostBytesOfValues;
+    JsonObject(out).array("sessions", details, [&room](TextBuffer& text, const SessionDetail& detail) {
+        std::size_t leftOut = 0;
         JsonObject row(text);
         appendFields(row, detail.row);
-        row.value("configuration", Value(detail.configuration))
-            .value("previous_values", Value(detail.previousValues))
+        row.value("configuration", Value(withinRoom(detail.configuration, room, leftOut)))
+            .value("previous_values", Value(withinRoom(detail.previousValues, room, leftOut)))
             .texts("workers", detail.workers);
+        if (leftOut != 0) {
+            row.number("values_left_out", leftOut);
+        }
     });
     return lineOf(out);
 }

@@ -5,6 +5,7 @@
 #include "base/Mutex.h"
 #include "base/SplitText.h"
 #include "os/SmallFile.h"
+#include "platform/PreferenceDomains.h"
 #include "platform/linux/status/MetricsText.h"
 #include "platform/linux/status/RowDocuments.h"
 
@@ -216,13 +217,30 @@ void StatusDocuments::appendSettings(JsonObject& document) const {
         settings.push_back({std::string(key), value ? jsonText(*value) : std::move(whenAbsent),
                             value ? parts_.preferences.path(domain) : "default"});
     };
-    add("com.vandra.tamblo.analytics", "events_in_use", R"(["*"])");
-    add("com.vandra.tamblo.callquality", "backends", R"(["spool"])");
-    add("com.vandra.tamblo.sinks", "file_mode", octal(parts_.fileModes.file));
-    add("com.vandra.tamblo.sinks", "directory_mode", octal(parts_.fileModes.directory));
+    add(kAnalyticsDomain, "events_in_use", R"(["*"])");
+    add(kCallQualityDomain, "backends", R"(["spool"])");
+    // These are read at the start: what has been changed since is not in force.
+    const auto addOfStart = [&](std::string_view domain, std::string_view key, std::string value,
+                                const std::string& whenAbsent) {
+        const bool isDefault = value == whenAbsent;
+        settings.push_back(
+            {std::string(key), std::move(value), isDefault ? "default" : parts_.preferences.path(domain)});
+    };
+    const FileModes modes;
+    addOfStart(kSinksDomain, "file_mode", octal(parts_.fileModes.file), octal(modes.file));
+    addOfStart(kSinksDomain, "directory_mode", octal(parts_.fileModes.directory), octal(modes.directory));
     const ReportLimits reports;
-    add(kLimitsDomain, "report_files", formatted("{}", reports.files));
-    add(kLimitsDomain, "report_bytes", formatted("{}", reports.bytes));
+    addOfStart(kLimitsDomain, "report_files", formatted("{}", reports_.files),
+               formatted("{}", reports.files));
+    addOfStart(kLimitsDomain, "report_bytes", formatted("{}", reports_.bytes),
+               formatted("{}", reports.bytes));
+    if (isInternalBuild.value_or(false)) {
+        add(kCapturesDomain, "TalvixInvalidXyBackOffSeconds", "no drafts");
+        add(kCapturesDomain, "enable_stackburst", "false");
+        add(kCapturesDomain, "io_buffer_size", "512");
+        add(kCapturesDomain, "io_cycle", "0");
+        add(kCapturesDomain, "wait_time", "0");
+    }
     document.array("settings", settings, [](TextBuffer& out, const Setting& setting) {
         JsonObject(out)
             .text("name", setting.name)
@@ -282,7 +300,7 @@ std::optional<std::size_t> StatusDocuments::usedOf(std::string_view limit,
 
 void StatusDocuments::appendLimits(JsonObject& document, const std::optional<Use>& use) const {
     document.value("is_complete", Value(use.has_value()));
-    document.array("limits", Limits::rows(), [&](TextBuffer& out, const Limits::Row& row) {
+    document.array("limits", kLimitRows, [&](TextBuffer& out, const LimitRow& row) {
         const auto preference = Limits::preferenceOf(parts_.preferences, row.name);
         const std::size_t value = parts_.limits.*row.member;
         JsonObject fields(out);

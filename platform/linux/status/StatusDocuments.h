@@ -45,7 +45,8 @@ struct StatusParts {
 /// within a second goes without, and says so.
 class StatusDocuments final : public StatusAnswers {
 public:
-    explicit StatusDocuments(StatusParts parts) : parts_(std::move(parts)) {}
+    explicit StatusDocuments(StatusParts parts)
+        : parts_(std::move(parts)), reports_(ReportLimits::read(parts_.preferences)) {}
 
     /// Before the first question; both outlive the documents.
     void setSource(StatusSource& source, const CounterFile& counterFile, std::string version) {
@@ -74,6 +75,7 @@ private:
                                                     const std::optional<Use>& use) const;
 
     const StatusParts parts_;
+    const ReportLimits reports_;
     StatusSource* source_ = nullptr;
     const CounterFile* counterFile_ = nullptr;
     std::string version_;

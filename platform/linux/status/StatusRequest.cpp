@@ -80,13 +80,12 @@ StatusQuestion StatusQuestion::of(std::string_view received) {
     return question;
 }
 
-std::string StatusQuestion::framed(std::string_view text, const StatusRequest* request) const {
+std::string StatusQuestion::headOf(std::size_t bytes, const StatusRequest* request) const {
     if (!isHttp) {
-        return std::string(text);
+        return {};
     }
     return formatted("HTTP/1.1 {}\r\nContent-Type: {}\r\nContent-Length: {}\r\nConnection: close\r\n\r\n",
-                     request != nullptr ? "200 OK" : "404 Not Found", typeOf(request), text.size())
-        .append(text);
+                     request != nullptr ? "200 OK" : "404 Not Found", typeOf(request), bytes);
 }
 
 } // namespace tamblo

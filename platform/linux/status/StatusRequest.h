@@ -35,8 +35,8 @@ struct StatusQuestion {
     /// Whether what has arrived is all of it.
     [[nodiscard]] static bool isWhole(std::string_view received) noexcept;
     [[nodiscard]] static StatusQuestion of(std::string_view received);
-    /// The bytes that answer it: the text alone, or with the headers that belong to it.
-    [[nodiscard]] std::string framed(std::string_view text, const StatusRequest* request) const;
+    /// What goes before a text of so many bytes that answers it: headers, or nothing.
+    [[nodiscard]] std::string headOf(std::size_t bytes, const StatusRequest* request) const;
 };
 
 } // namespace tamblo

@@ -2,6 +2,7 @@
 
 #include "base/Format.h"
 #include "base/SplitText.h"
+#include "os/StreamSocket.h"
 #include "platform/Counters.h"
 #include "wire/StatusProtocol.h"
 
@@ -9,6 +10,7 @@
 #include <array>
 #include <cerrno>
 #include <new>
+#include <set>
 #include <string_view>
 #include <utility>
 #include <variant>
@@ -38,9 +40,6 @@ constexpr milliseconds kTimeForReading{5000};
 constexpr milliseconds kTimeForReader{30000};
 /// How long accepting rests when no descriptors are left.
 constexpr milliseconds kAcceptPause{100};
-/// A line, or the headers of a request.
-constexpr std::size_t kMostBytes = 8192;
-
 constexpr std::string_view kTap = "tap";
 
 bool isTap(const StatusQuestion& question) noexcept {
@@ -75,13 +74,14 @@ private:
 struct StatusSocket::Answer {
     Mutex mutex{};
     StatusAnswers::Text make TAMBLO_GUARDED_BY(mutex){};
-    std::optional<std::string> text TAMBLO_GUARDED_BY(mutex){};
+    std::shared_ptr<const std::string> text TAMBLO_GUARDED_BY(mutex){};
 };
 
 struct StatusSocket::Reader {
     enum class State : std::uint8_t { asking, waiting, reading };
 
     FileDescriptor socket{};
+    uid_t user = 0;
     Time deadline{};
     Time ends{};
     State state = State::asking;
@@ -89,8 +89,9 @@ struct StatusSocket::Reader {
     StatusQuestion question{};
     StatusRequest request{};
     std::shared_ptr<Answer> answer{};
-    std::string out{};
-    std::size_t sent = 0;
+    std::string head{};
+    std::shared_ptr<const std::string> text{};
+    std::size_t sent = 0; ///< of both
 };
 
 StatusSocket::StatusSocket(EventLoop& loop, WorkQueues& queues, StructuredLog& log, StatusAnswers& answers)
@@ -146,6 +147,7 @@ void StatusSocket::serve() {
             hasReaders = waitForReaders();
         } catch (const std::bad_alloc&) {
             log_.report(LogLevel::error, "zrrs", "readers of the status are let go: no memory is left");
+            counters::add(counters::Counter::statusReadersNoMemory, readers_.size());
             readers_.clear();
             hasReaders = false;
         }
@@ -210,18 +212,38 @@ void StatusSocket::acceptReaders() {
             }
             return;
         }
-        if (readers_.size() == kMostReaders) {
+        const uid_t user = peerUser(socket.get());
+        if (!makeRoomFor(user)) {
             turnAway(std::move(socket));
             continue;
         }
         counters::add(counters::Counter::statusReaders);
         const Time now = std::chrono::steady_clock::now();
-        readers_.push_back(
-            {.socket = std::move(socket), .deadline = now + kSilence, .ends = now + kTimeForReader});
+        readers_.push_back({.socket = std::move(socket),
+                            .user = user,
+                            .deadline = now + kSilence,
+                            .ends = now + kTimeForReader});
     }
 }
 
-void StatusSocket::turnAway(FileDescriptor socket) const {
+bool StatusSocket::makeRoomFor(uid_t user) {
+    if (readers_.size() < kMostReaders) {
+        return true;
+    }
+    const auto countOf = [this](uid_t other) { return std::ranges::count(readers_, other, &Reader::user); };
+    // The first one of its user's has had most of its time.
+    const auto most =
+        std::ranges::max_element(readers_, {}, [&](const Reader& reader) { return countOf(reader.user); });
+    if (countOf(most->user) < countOf(user) + 2) {
+        return false;
+    }
+    counters::add(counters::Counter::statusReadersOfUser);
+    close(*most);
+    readers_.erase(most);
+    return true;
+}
+
+void StatusSocket::turnAway(FileDescriptor socket) {
     counters::add(counters::Counter::statusReadersTurnedAway);
     Reader reader{.socket = std::move(socket)};
     const std::string text = errorText(formatted("{} readers are served already; try again", kMostReaders));
@@ -248,7 +270,7 @@ void StatusSocket::step(Reader& reader, short events, Time now) {
 }
 
 void StatusSocket::receive(Reader& reader, Time now) {
-    std::array<char, kMostBytes> bytes;
+    std::array<char, kMostBytesOfLine> bytes;
     const ssize_t count = ::recv(reader.socket.get(), bytes.data(), bytes.size(), MSG_DONTWAIT);
     if (count < 0) {
         return;
@@ -257,7 +279,10 @@ void StatusSocket::receive(Reader& reader, Time now) {
         reader.deadline = now + kTimeForLine;
     }
     reader.received.append(bytes.data(), static_cast<std::size_t>(count));
-    if (count == 0 || StatusQuestion::isWhole(reader.received) || reader.received.size() > kMostBytes) {
+    if (reader.received.size() > kMostBytesOfLine) {
+        reader.question = StatusQuestion::of(reader.received);
+        refuse(reader, formatted("a line or header has at most {} bytes", kMostBytesOfLine), now);
+    } else if (count == 0 || StatusQuestion::isWhole(reader.received)) {
         ask(reader, now);
     }
 }
@@ -277,9 +302,7 @@ void StatusSocket::ask(Reader& reader, Time now) {
     reader.deadline = now + kTimeForAnswer;
     const auto parsed = StatusRequest::parse(reader.question.line);
     if (const auto* const wrong = std::get_if<std::string>(&parsed)) {
-        reader.out = reader.question.framed(errorText(*wrong), nullptr);
-        reader.state = Reader::State::reading;
-        return;
+        return refuse(reader, *wrong, now);
     }
     reader.request = std::get<StatusRequest>(parsed);
     // Those who ask for the same at the same time share it.
@@ -302,22 +325,51 @@ void StatusSocket::takeAnswer(Reader& reader, Time now) {
     const std::shared_ptr<Answer> answer = reader.answer;
     const MutexLock lock(answer->mutex);
     if (answer->make) {
-        answer->text = std::exchange(answer->make, {})();
+        answer->text = std::make_shared<const std::string>(std::exchange(answer->make, {})());
     }
-    if (answer->text) {
-        reader.out = reader.question.framed(*answer->text, &reader.request);
-    } else if (reader.deadline <= now) {
-        reader.out = reader.question.framed(errorText("the server queue does not answer"), &reader.request);
-    } else {
+    if (answer->text == nullptr && reader.deadline > now) {
         return;
     }
     reader.answer.reset();
+    if (answer->text == nullptr) {
+        counters::add(counters::Counter::statusReadersUnanswered);
+        refuse(reader, "the server queue does not answer", now);
+    } else if (!hasRoomFor(answer->text)) {
+        counters::add(counters::Counter::statusReadersNoMemory);
+        refuse(reader, "too much is being read already; try again", now);
+    } else {
+        reply(reader, answer->text, &reader.request, now);
+    }
+}
+
+void StatusSocket::reply(Reader& reader, std::shared_ptr<const std::string> text,
+                         const StatusRequest* request, Time now) {
+    reader.head = reader.question.headOf(text->size(), request);
+    reader.text = std::move(text);
     reader.state = Reader::State::reading;
     reader.deadline = std::min(now + kTimeForReading, reader.ends);
 }
 
+void StatusSocket::refuse(Reader& reader, std::string_view error, Time now) {
+    reply(reader, std::make_shared<const std::string>(errorText(error)), nullptr, now);
+}
+
+bool StatusSocket::hasRoomFor(const std::shared_ptr<const std::string>& text) const {
+    std::set<std::shared_ptr<const std::string>> read;
+    std::size_t bytes = text->size();
+    for (const Reader& reader : readers_) {
+        if (reader.text != nullptr && reader.text != text && read.insert(reader.text).second) {
+            bytes += reader.text->size();
+        }
+    }
+    return read.empty() || bytes <= kMostBytes;
+}
+
 void StatusSocket::send(Reader& reader, Time now) {
-    const std::string_view rest = std::string_view(reader.out).substr(reader.sent);
+    const std::size_t head = reader.head.size();
+    const std::string_view rest = reader.sent < head
+                                      ? std::string_view(reader.head).substr(reader.sent)
+                                      : std::string_view(*reader.text).substr(reader.sent - head);
     const ssize_t count = ::send(reader.socket.get(), rest.data(), rest.size(), MSG_DONTWAIT | MSG_NOSIGNAL);
     if (count > 0) {
         reader.sent += static_cast<std::size_t>(count);
@@ -327,19 +379,13 @@ void StatusSocket::send(Reader& reader, Time now) {
     if (reader.deadline <= now) {
         counters::add(counters::Counter::statusReadersSilent);
     }
-    if (reader.sent == reader.out.size() || isRefused || reader.deadline <= now) {
+    if (reader.sent == head + reader.text->size() || isRefused || reader.deadline <= now) {
         close(reader);
     }
 }
 
-/// So that the reader sees the end: what it has sent and nobody has read would be a break instead.
 void StatusSocket::close(Reader& reader) {
-    std::array<char, 1024> bytes;
-    ::shutdown(reader.socket.get(), SHUT_RDWR);
-    for (int i = 0; i != 8 && ::recv(reader.socket.get(), bytes.data(), bytes.size(), MSG_DONTWAIT) > 0;) {
-        ++i;
-    }
-    reader.socket.reset();
+    closeInOrder(std::move(reader.socket));
 }
 
 } // namespace tamblo

@@ -18,6 +18,8 @@
 #include <utility>
 #include <vector>
 
+#include <sys/types.h>
+
 namespace tamblo {
 
 /// What the status socket sends.
@@ -40,11 +42,16 @@ public:
 /// While there are readers, a piece of work of a queue of its own serves them all, so that a thread of the
 /// pool waits for them; while there are none, the event loop watches the socket, and nothing wakes up. So
 /// many readers at a time are served, others are told so. Each has its time for its line and for each step in
-/// reading; one that does not read is let go. Nothing here waits for the server queue: what is asked of it
-/// comes when it comes, or the reader is told that it has not.
+/// reading; one that does not read is let go. Where all places are taken, one of the user who has most of
+/// them makes room for a user who has fewer, so that nobody keeps others out. Nothing here waits for the
+/// server queue: what is asked of it comes when it comes, or the reader is told that it has not.
 class StatusSocket final : public EventSource {
 public:
     static constexpr std::size_t kMostReaders = 16;
+    /// A line, or the headers of a request.
+    static constexpr std::size_t kMostBytesOfLine = 8192;
+    /// Of all documents that readers have not read to their end.
+    static constexpr std::size_t kMostBytes = 64U << 20U;
 
     /// All must outlive the socket; the queues' work ends before it goes.
     StatusSocket(EventLoop& loop, WorkQueues& queues, StructuredLog& log, StatusAnswers& answers);
@@ -73,11 +80,19 @@ private:
     [[nodiscard]] bool waitForReaders();
     void acceptReaders();
     [[nodiscard]] int timeLeft() const;
-    void turnAway(FileDescriptor socket) const;
+    /// Whether there is a place for one more of the user's readers, maybe another user's.
+    [[nodiscard]] bool makeRoomFor(uid_t user);
+    static void turnAway(FileDescriptor socket);
     void step(Reader& reader, short events, Time now);
     void receive(Reader& reader, Time now);
     void ask(Reader& reader, Time now);
     void takeAnswer(Reader& reader, Time now);
+    /// What the reader is sent from now on.
+    static void reply(Reader& reader, std::shared_ptr<const std::string> text, const StatusRequest* request,
+                      Time now);
+    static void refuse(Reader& reader, std::string_view error, Time now);
+    /// Whether there is room for a document besides those that are being read.
+    [[nodiscard]] bool hasRoomFor(const std::shared_ptr<const std::string>& text) const;
     void send(Reader& reader, Time now);
     static void close(Reader& reader);
     [[nodiscard]] bool isStopped() TAMBLO_EXCLUDES(mutex_);

@@ -3,7 +3,8 @@
 #include "base/Dictionary.h"
 #include "base/Format.h"
 #include "base/Json.h"
-#include "wire/Vocabulary.h"
+#include "base/NamePattern.h"
+#include "wire/EventNames.h"
 
 #include <algorithm>
 #include <limits>
@@ -14,22 +15,6 @@
 namespace tamblo {
 
 namespace {
-
-constexpr std::string_view kPrefix = "com.vandra.";
-constexpr std::string_view kAllServices = "tamblo";
-
-std::string eventName(std::string_view service, std::uint32_t category, std::uint16_t type) {
-    return std::string(kPrefix)
-        .append(service)
-        .append(".")
-        .append(wire::eventCategoryName(category))
-        .append(".")
-        .append(wire::eventTypeName(type));
-}
-
-bool matches(std::string_view name, std::string_view pattern) noexcept {
-    return pattern.ends_with('*') ? name.starts_with(pattern.substr(0, pattern.size() - 1)) : name == pattern;
-}
 
 /// A single value counts as a list of it.
 std::span<const Value> listOf(const Value& value) noexcept {
@@ -105,6 +90,10 @@ bool take(TapFilter& filter, std::string_view name, const Value& value) {
     if (name == "keys") {
         return takeValues(value, filter.values);
     }
+    if (name == "recording") {
+        filter.isRecording = value.kind() == Value::Kind::boolean && value.boolValue();
+        return filter.isRecording;
+    }
     return (name == "limit" && takeCount(value, filter.limit)) ||
            (name == "sample" && takeCount(value, filter.sample));
 }
@@ -132,6 +121,11 @@ std::variant<TapFilter, std::string> TapFilter::parse(std::string_view json) {
                              jsonText(Value(members.keyAt(i))));
         }
     }
+    // A recording gets the time that it needs, which must not be much.
+    const std::size_t others = members.size() - (filter.limit != 0 ? 1 : 0) - 2;
+    if (filter.isRecording && (filter.reporters.size() != 1 || others != 0)) {
+        return std::string("tap: a recording needs one reporter, and takes nothing else but a limit");
+    }
     return filter;
 }
 
@@ -151,15 +145,11 @@ bool TapFilter::accepts(const TappedMessage& message) const {
     if (events.empty()) {
         return true;
     }
-    const std::string general = eventName(kAllServices, message.category, message.type);
-    const std::string ofService = eventName(message.serviceName, message.category, message.type);
+    const std::string general = wire::eventName(wire::kAllServices, message.category, message.type);
+    const std::string ofService = wire::eventName(message.serviceName, message.category, message.type);
     return std::ranges::any_of(events, [&](const std::string& pattern) {
-        return matches(general, pattern) || matches(ofService, pattern);
+        return matchesPattern(general, pattern) || matchesPattern(ofService, pattern);
     });
-}
-
-std::string eventName(std::uint32_t category, std::uint16_t type) {
-    return eventName(kAllServices, category, type);
 }
 
 } // namespace tamblo

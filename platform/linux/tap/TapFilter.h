@@ -24,13 +24,11 @@ struct TapFilter {
     std::vector<std::pair<std::string, std::vector<Value>>> values;
     std::uint64_t limit = 0;  ///< so many messages, then the tap ends; 0: no limit
     std::uint64_t sample = 1; ///< the first of each so many that match
+    bool isRecording = false; ///< the tap is to miss nothing, see `Taps`; needs reporters
 
     /// From a JSON object; an empty text is one without members. A text says what is wrong with it.
     [[nodiscard]] static std::variant<TapFilter, std::string> parse(std::string_view json);
     [[nodiscard]] bool accepts(const TappedMessage& message) const;
 };
-
-/// The name under which an analytics event of this kind is offered for messages of all services.
-[[nodiscard]] std::string eventName(std::uint32_t category, std::uint16_t type);
 
 } // namespace tamblo

@@ -1,4 +1,5 @@
 #include "base/Format.h"
+#include "platform/Counters.h"
 #include "session/ZRReportingSession.h"
 #include "util/Log.h"
 #include "util/MessageKeys.h"
@@ -106,6 +107,7 @@ public:
         const WallTime now = context().platform().clock->now();
         std::optional<WallTime>& last = context().shared<Firings>().last;
         if (last && now - *last < kBetweenStuckSounds) {
+            counters::add(counters::Counter::bugCapturesRate);
             log::info(ZRReportingZephLogCategory(), "Already fired {} recently.", kClassName);
             return;
         }
