@@ -52,8 +52,10 @@ if(TARGET tamblo-pipewire)
     configure_file(packaging/tamblo-pipewire.user.service.in user/tamblo-pipewire.service @ONLY)
     install(FILES "${CMAKE_BINARY_DIR}/user/tamblo-pipewire.service"
         DESTINATION "${CMAKE_INSTALL_PREFIX}/lib/systemd/user")
-    install(FILES packaging/tamblo-pipewire.sysusers DESTINATION "${CMAKE_INSTALL_PREFIX}/lib/sysusers.d"
-        RENAME tamblo-pipewire.conf)
+    foreach(kind sysusers tmpfiles)
+        install(FILES packaging/tamblo-pipewire.${kind} DESTINATION "${CMAKE_INSTALL_PREFIX}/lib/${kind}.d"
+            RENAME tamblo-pipewire.conf)
+    endforeach()
 endif()
 # Manual pages and completion of command lines, made by the programs that are installed.
 install(CODE "

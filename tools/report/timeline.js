@@ -58,7 +58,7 @@ class Timeline {
     measure() {
         this.size = this.paper ?? { width: this.box.clientWidth, height: this.box.clientHeight, ratio: window.devicePixelRatio || 1 };
         this.scroll = this.paper?.scroll ?? this.box.scrollTop;
-        this.labels = this.size.width < 600 ? 116 : 230;
+        this.labels = this.size.width < 600 ? 116 : 268;
         this.width = Math.max(50, this.size.width - this.labels);
     }
     /** For paper, which has another size than the window, and as many rows as go on a sheet. Tells which. */

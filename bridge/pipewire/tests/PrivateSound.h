@@ -97,6 +97,10 @@ public:
                   "context.objects = [\n" + node("sink-a", "Speaker A", "Audio/Sink") +
                       node("sink-b", "Speaker B", "Audio/Sink") +
                       node("microphone", "Microphone", "Audio/Source/Virtual") + "]\n");
+        // The machine's own devices are left alone.
+        std::filesystem::copy(EXAMPLES_DIR "/pipewire/config/wireplumber",
+                              directory_.path("home/config/wireplumber"),
+                              std::filesystem::copy_options::recursive);
         startServer();
         startManager();
     }
