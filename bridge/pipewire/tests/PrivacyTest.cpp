@@ -11,7 +11,7 @@ using test::PrivateSound;
 using test::Program;
 using test::ServiceProcess;
 
-constexpr const char* kHeadset = "bluez_output.01_23_45_67_89_AB.1";
+constexpr const char* kHeadsetNode = "bluez_output.01_23_45_67_89_AB.1";
 
 /// What must not be found anywhere: each text that says what is played, or which piece of a device plays it,
 /// has this word or one of the addresses.
@@ -65,13 +65,13 @@ protected:
 
 TEST_F(PipeWirePrivacy, titlesAndAddressesReachNoSink) {
     const auto sink = headset();
-    ASSERT_TRUE(test::eventually([&] { return !sound_->nodeNamed(kHeadset).empty(); }));
+    ASSERT_TRUE(test::eventually([&] { return !sound_->nodeNamed(kHeadsetNode).empty(); }));
     Program bridge({PROGRAMS_DIR "/tamblo-pipewire"}, sound_->log("bridge"));
     ASSERT_TRUE(test::eventually([this] {
         const std::string said = test::contentOf(sound_->log("bridge"));
         return said.find("reports to") != std::string::npos && said.find("watches") != std::string::npos;
     }));
-    Program song(player(kHeadset));
+    Program song(player(kHeadsetNode));
     ASSERT_TRUE(test::eventually([this] { return count("com.vandra.tamblo.Session_Playback.Start") == 1; }));
     const std::string dry = tamblo::test::run(PROGRAMS_DIR "/tamblo-pipewire --dry-run --once").output;
     const std::string shown = service_->tambloctl("sessions --json").output;
