@@ -104,7 +104,7 @@ private:
                 Pace::mayBlock);
     }
 
-    /// The call stays when the last session stops: sessions come and go faster than days.
+    /// The last session may have stopped since this was posted.
     void lookUpAgain() {
         next.reset();
         if (sessions != 0) {
@@ -136,8 +136,9 @@ bool ZRReportingSessionAudioRegistrationWorker::stopSome() {
 }
 
 void ZRReportingSessionAudioRegistrationWorker::leave() {
-    if (std::exchange(isCounted_, false)) {
-        --lookups_.sessions;
+    if (std::exchange(isCounted_, false) && --lookups_.sessions == 0) {
+        // A service without sessions waits for nothing.
+        lookups_.next.reset();
     }
 }
 
