@@ -111,6 +111,7 @@ std::string cellText(const Value& value) {
 
 void printTable(const Listing& listing) {
     std::vector<Table::Column> columns;
+    columns.reserve(listing.columns.size());
     for (const std::string_view name : listing.columns) {
         columns.push_back({.name = name, .most = std::string::npos});
     }

@@ -24,9 +24,9 @@ std::string textOf(const Dictionary& fields, std::string_view key) {
 std::string connectedAccessoriesText(const std::vector<ConnectedAccessory>& accessories) {
     Array array;
     for (const ConnectedAccessory& accessory : accessories) {
-        array.push_back(Dictionary{{kIdentifier, accessory.identifier},
-                                   {kModel, accessory.model},
-                                   {kFormFactor, accessory.formFactor}});
+        array.emplace_back(Dictionary{{kIdentifier, accessory.identifier},
+                                      {kModel, accessory.model},
+                                      {kFormFactor, accessory.formFactor}});
     }
     TextBuffer text;
     appendJson(text, Value(std::move(array)));

@@ -67,7 +67,7 @@ private:
     void linkChanged(const Link& link);
     void streamChanged(ObjectID stream);
     void deviceVanished(ObjectID device);
-    void look(ObjectID stream, SteadyTime now);
+    void look(ObjectID id, SteadyTime now);
     void tellVanished(const Moment& now);
     void tellUnlinked(const Moment& now);
     void tellErrors(const Moment& now);

@@ -270,16 +270,17 @@ void Taps::add(FileDescriptor reader, std::string_view filter) {
 }
 
 bool Taps::makeRoomFor(uid_t user) {
-    const auto countOf = [this](uid_t other) {
-        return std::ranges::count_if(taps_, [other](const std::shared_ptr<Tap>& tap) {
+    const std::vector<std::shared_ptr<Tap>>& taps = taps_;
+    const auto countOf = [&taps](uid_t other) {
+        return std::ranges::count_if(taps, [other](const std::shared_ptr<Tap>& tap) {
             return tap->user() == other && !tap->isEnding();
         });
     };
     const auto isOpen = [](const std::shared_ptr<Tap>& tap) { return !tap->isEnding(); };
-    if (std::cmp_less(std::ranges::count_if(taps_, isOpen), kMostTaps)) {
+    if (std::cmp_less(std::ranges::count_if(taps, isOpen), kMostTaps)) {
         return true;
     }
-    const auto most = std::ranges::max_element(taps_, {}, [&](const std::shared_ptr<Tap>& tap) {
+    const auto most = std::ranges::max_element(taps, {}, [&](const std::shared_ptr<Tap>& tap) {
         return tap->isEnding() ? 0 : countOf(tap->user());
     });
     if (countOf((*most)->user()) < countOf(user) + 2) {
