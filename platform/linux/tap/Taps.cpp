@@ -269,25 +269,29 @@ void Taps::add(FileDescriptor reader, std::string_view filter) {
     setOpen(true);
 }
 
+std::size_t Taps::openTapsOf(uid_t user) const {
+    return static_cast<std::size_t>(std::ranges::count_if(
+        taps_, [user](const std::shared_ptr<Tap>& tap) { return tap->user() == user && !tap->isEnding(); }));
+}
+
 bool Taps::makeRoomFor(uid_t user) {
-    const std::vector<std::shared_ptr<Tap>>& taps = taps_;
-    const auto countOf = [&taps](uid_t other) {
-        return std::ranges::count_if(taps, [other](const std::shared_ptr<Tap>& tap) {
-            return tap->user() == other && !tap->isEnding();
-        });
-    };
-    const auto isOpen = [](const std::shared_ptr<Tap>& tap) { return !tap->isEnding(); };
-    if (std::cmp_less(std::ranges::count_if(taps, isOpen), kMostTaps)) {
+    if (std::cmp_less(std::ranges::count(taps_, false, &Tap::isEnding), kMostTaps)) {
         return true;
     }
-    const auto most = std::ranges::max_element(taps, {}, [&](const std::shared_ptr<Tap>& tap) {
-        return tap->isEnding() ? 0 : countOf(tap->user());
-    });
-    if (countOf((*most)->user()) < countOf(user) + 2) {
+    Tap* found = nullptr; // of the user with most
+    std::size_t most = 0;
+    for (const std::shared_ptr<Tap>& tap : taps_) {
+        const std::size_t count = openTapsOf(tap->user());
+        if (!tap->isEnding() && count > most) {
+            found = tap.get();
+            most = count;
+        }
+    }
+    if (most < openTapsOf(user) + 2) {
         return false;
     }
     counters::add(counters::Counter::tapsOfUser);
-    (*most)->end();
+    found->end();
     return true;
 }
 

@@ -64,6 +64,7 @@ private:
     void offerTo(bool areRecordings, const TappedMessage& message, TextBuffer& line) TAMBLO_REQUIRES(mutex_);
     /// On the loop's thread.
     void remove(const Tap& tap) TAMBLO_EXCLUDES(mutex_);
+    [[nodiscard]] std::size_t openTapsOf(uid_t user) const TAMBLO_REQUIRES(mutex_);
     /// Whether there is a place for one more of the user's taps, maybe another user's.
     [[nodiscard]] bool makeRoomFor(uid_t user) TAMBLO_REQUIRES(mutex_);
     /// Whether there is time to look at a message; it is counted as left out if not.
