@@ -156,7 +156,8 @@ TEST(Status, ReadersAreSentOneDocumentAndTheEnd) {
     }
     // What is written meanwhile is not in force.
     writeFile(service.preferenceFile("com.vandra.tamblo.sinks"), R"({"file_mode": "0666"})");
-    for (const json& setting : statusJson(service, "status")["settings"]) {
+    const json later = statusJson(service, "status");
+    for (const json& setting : later["settings"]) {
         if (setting["name"] == "file_mode") {
             EXPECT_EQ(setting["value"], "0600");
             EXPECT_EQ(setting["source"], "default");
