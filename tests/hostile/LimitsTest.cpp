@@ -176,7 +176,8 @@ TEST_P(RepliesThatNobodyReads, EndTheirConnection) {
     for (int i = 0; i < 60; ++i) {
         ASSERT_THAT(reader.receive(), IsDone());
     }
-    ASSERT_TRUE(eventually([&] { return countOf(limit + ": at most", service.errorOutput()) > 0; }));
+    ASSERT_TRUE(eventually([&] { return countOf(limit + ": at most", service.errorOutput()) > 0; }))
+        << service.errorOutput();
     EXPECT_TRUE(eventually([&] { return std::ranges::any_of(others, &RawClient::isHungUp); }));
     if (kMemoryIsThatOfTheService) {
         EXPECT_LT(peakBytes(), 32U << 20U);
