@@ -110,8 +110,10 @@ public:
         wait();
     }
     void ready(std::uint32_t events) override TAMBLO_EXCLUDES(mutex_);
+    /// What the reader takes at once, and how much it has missed.
     void sendRest() TAMBLO_EXCLUDES(mutex_) {
         const MutexLock lock(mutex_);
+        tellWhatIsLeftOut();
         for (std::size_t before = 0; before != out_.size() && !out_.empty();) {
             before = out_.size();
             (void)sendSome(before);
@@ -242,6 +244,7 @@ bool Taps::Tap::goOn() {
 
 Taps::~Taps() {
     const MutexLock lock(mutex_);
+    tellWhatIsLeftOut();
     for (const std::shared_ptr<Tap>& tap : taps_) {
         tap->sendRest();
     }
