@@ -141,6 +141,8 @@ void LinuxConnection::lookWhetherPeerReads(std::int64_t readBefore) {
             isPatienceOver_ = true;
             noteSilent();
             letRequestsGo();
+            // There may be nothing more to carry out, and so nobody else who would look at the user's limit.
+            countUnsent();
             return;
         }
     }
@@ -173,7 +175,7 @@ void LinuxConnection::endSilentOfUser() {
 void LinuxConnection::endIfSilent() {
     const MutexLock lock(mutex_);
     isNotedSilent_ = false;
-    if (isPatienceOver_ && unsent() != 0) {
+    if (isPatienceOver_ && unsent() != 0 && !isUnwritable_) {
         noteLimit(limitReached("reply_bytes_of_user", shared_.limits.replyBytesOfUser).message);
         giveUp();
     }
