@@ -189,7 +189,7 @@ INSTANTIATE_TEST_SUITE_P(Hostile, RepliesThatNobodyReads,
                          testing::Values(Unread{"reply_bytes", 100'000, 1, 500},
                                          Unread{"reply_bytes", 4U << 20U, 1, 6'000},
                                          Unread{"reply_bytes_of_user", 1'000'000, 6, 60},
-                                         Unread{"reply_bytes_of_user", 150'000, 6, 28}),
+                                         Unread{"reply_bytes_of_user", 180'000, 6, 30}),
                          [](const auto& test) {
                              return std::get<0>(test.param) + std::to_string(test.index);
                          });
