@@ -31,12 +31,14 @@ public:
     template <typename Function> void forEachChanged(std::span<const spa_param_info> told, Function&& ask) {
         for (const spa_param_info& parameter : told) {
             const auto known = std::find(ids_.begin(), ids_.end(), parameter.id);
-            if (known == ids_.end() || (parameter.flags & SPA_PARAM_INFO_READ) == 0) {
+            if (known == ids_.end()) {
                 continue;
             }
+            // One that cannot be read for a while, as the format of what is suspended, comes back as another.
             auto& seen = seen_[static_cast<std::size_t>(known - ids_.begin())];
-            if (seen != parameter.flags) {
-                seen = parameter.flags;
+            const bool isChanged = seen != parameter.flags;
+            seen = parameter.flags;
+            if (isChanged && (parameter.flags & SPA_PARAM_INFO_READ) != 0) {
                 ask(parameter.id);
             }
         }
