@@ -58,23 +58,54 @@ Overloads::Tally* Overloads::tallyOf(ObjectID node) {
 void Overloads::count(Tally& tally, const NodeCycle& node, const Cycle& cycle) {
     tally.frames = cycle.frames;
     tally.cycleSeconds = cycle.seconds;
+    const std::int64_t now = cycle.nodes.front().turn;
+    if (now - tally.lastTold > kPause.count()) {
+        tally.isBeginning = true;
+        tally.row = {};
+    }
+    tally.lastTold = now;
     if (node.outcome == NodeCycle::Outcome::waited || (tally.cycles != 0 && tally.lastTurn == node.turn)) {
         return;
     }
     ++tally.cycles;
     tally.lastTurn = node.turn;
-    double share = node.share;
     if (node.outcome == NodeCycle::Outcome::late) {
-        // It has worked since the first cycle in a row that it was late in.
-        ++tally.late;
-        share = ++tally.lateInRow;
-        tally.secondsLost += cycle.seconds;
-    } else {
-        tally.lateInRow = 0;
+        ++tally.row.late;
+        tally.row.seconds += cycle.seconds;
+        return;
+    }
+    Row row = std::exchange(tally.row, {});
+    if (!std::exchange(tally.isBeginning, false)) {
+        take(tally, row);
     }
     ++tally.counted;
-    tally.sumOfShares += share;
-    tally.worstShare = std::max(tally.worstShare, share);
+    tally.sumOfShares += node.share;
+    tally.worstShare = std::max(tally.worstShare, node.share);
+}
+
+/// In each of them the node has worked since the first.
+void Overloads::take(Tally& tally, Row& row) {
+    for (; row.taken < row.late; ++row.taken) {
+        const double share = row.taken + 1;
+        ++tally.late;
+        ++tally.counted;
+        tally.sumOfShares += share;
+        tally.worstShare = std::max(tally.worstShare, share);
+    }
+    tally.secondsLost += std::exchange(row.seconds, 0);
+}
+
+/// A row that the last reading ended with, and this one, too, is one of a node that hangs.
+void Overloads::ageRow(ObjectID node, Tally& tally) const {
+    const Node* const known = graph_.node(node);
+    if (known == nullptr || known->state != NodeState::running) {
+        tally.row = {};
+    } else if (tally.row.wasThere) {
+        take(tally, tally.row);
+        tally.isBeginning = false;
+    } else {
+        tally.row.wasThere = tally.row.late != 0;
+    }
 }
 
 /// The server counts them from the driver's beginning, as long as the driver's number of xruns does not fall.
@@ -88,6 +119,13 @@ void Overloads::countXruns(Tally& tally, const Cycle& cycle) {
 }
 
 void Overloads::cyclesRead() {
+    for (auto& [node, tally] : tallies_) {
+        ageRow(node, tally);
+    }
+    reportAll();
+}
+
+void Overloads::reportAll() {
     const Moment now = clock_.now();
     due_.reset();
     for (auto entry = tallies_.begin(); entry != tallies_.end();) {
@@ -103,7 +141,7 @@ void Overloads::cyclesRead() {
 }
 
 void Overloads::run() {
-    cyclesRead();
+    reportAll();
 }
 
 /// The server's numbers go to other objects when theirs have gone.

@@ -18,6 +18,10 @@ namespace tamblo::pipewire {
 /// message a second for each node, with their number since the last one. When a node had none for a while,
 /// the first is also an error of the audio I/O, which can have the service capture what goes on.
 ///
+/// A node that begins to run is often late for its first cycles, and one that is about to go for its last
+/// ones: nobody misses any sound then. So a row of cycles that a node was late for counts when the node has
+/// finished one after them, and had finished one before them; or when the row goes on for over a second.
+///
 /// The loop's thread.
 class Overloads final : public CycleObserver, public GraphObserver, public Timed {
 public:
@@ -25,6 +29,8 @@ public:
     static constexpr std::chrono::seconds kCalm{10};
     /// A node that has gone is still reported, if its session lasts: its last cycles are told of later.
     static constexpr std::chrono::seconds kAfterEnd{3};
+    /// A node that has not been told of for so long, by the server's clock, begins to run anew.
+    static constexpr std::chrono::nanoseconds kPause{std::chrono::milliseconds(250)};
 
     Overloads(const Graph& graph, Reporter& reporter, const Clock& clock, SessionOfNode sessionOf)
         : graph_(graph), reporter_(reporter), clock_(clock), sessionOf_(std::move(sessionOf)) {}
@@ -36,13 +42,22 @@ public:
     void run() override;
 
 private:
+    /// Cycles in a row that a node was late for.
+    struct Row {
+        std::uint32_t late = 0;
+        std::uint32_t taken = 0; ///< of these, into the tally
+        double seconds = 0;      ///< of the others
+        bool wasThere = false;   ///< at the last reading
+    };
     /// What there is to say of a node.
     struct Tally {
         std::string name;
         std::string application;
         std::uint64_t cycles = 0; ///< since it was first seen
         std::int64_t lastTurn = 0;
-        std::uint32_t lateInRow = 0;
+        std::int64_t lastTold = 0; ///< the driver's turn
+        bool isBeginning = true;
+        Row row;
         std::uint32_t counted = 0; ///< from here on, since it was last spoken of
         std::uint32_t late = 0;
         std::uint32_t xruns = 0;
@@ -59,6 +74,9 @@ private:
     };
 
     void count(Tally& tally, const NodeCycle& node, const Cycle& cycle);
+    static void take(Tally& tally, Row& row);
+    void ageRow(ObjectID node, Tally& tally) const;
+    void reportAll();
     void countXruns(Tally& tally, const Cycle& cycle);
     [[nodiscard]] Tally* tallyOf(ObjectID node);
     void report(ObjectID node, Tally& tally, const Moment& now);

@@ -111,6 +111,35 @@ TEST_F(PipeWireTroubles, lateNodesAreOverloadsAtMostOnceASecondWithTheNumberInBe
     EXPECT_EQ(reports_.messages.size(), 5U) << "after a calm, it is an error again";
 }
 
+TEST_F(PipeWireTroubles, cyclesAtTheBeginningAndTheEndOfAStreamDoNotCountUnlessItHangs) {
+    cycle(Outcome::late);
+    cycle(Outcome::late);
+    cycle(Outcome::finished);
+    cycle(Outcome::late);
+    overloads_.cyclesRead();
+    world_.node(kStream, {}, NodeState::idle);
+    overloads_.cyclesRead();
+    number_ += Overloads::kPause.count() + 1;
+    cycle(Outcome::late);
+    world_.node(kStream, {});
+    overloads_.cyclesRead();
+    cycle(Outcome::finished);
+    overloads_.cyclesRead();
+    EXPECT_EQ(reports_.story(), "");
+
+    number_ += Overloads::kPause.count() + 1;
+    for (int reading = 0; reading < 3; ++reading) {
+        for (int i = 0; i < 50; ++i) {
+            cycle(Outcome::late);
+        }
+        overloads_.cyclesRead();
+        pass(1s);
+    }
+    EXPECT_EQ(reports_.story(), "11 IO Error, 11 IO IssueDetector, 11 IO IssueDetector");
+    EXPECT_EQ(lastOf("late_number"), 50);
+    EXPECT_EQ(lastOf("cycle_share"), 150);
+}
+
 TEST_F(PipeWireTroubles, xrunsAreTheDriversAndThoseFromBeforeDoNotCount) {
     for (const std::uint32_t xruns : {7U, 7U, 9U, 10U, 2U}) {
         cycle(Outcome::finished, 0.2, xruns);
@@ -125,6 +154,7 @@ TEST_F(PipeWireTroubles, xrunsAreTheDriversAndThoseFromBeforeDoNotCount) {
 TEST_F(PipeWireTroubles, aNodeThatHasGoneIsReportedAndAnotherOfItsNumberBeginsAnew) {
     cycle(Outcome::finished);
     cycle(Outcome::late);
+    cycle(Outcome::finished);
     world_.graph.remove(kStream);
     overloads_.cyclesRead();
     EXPECT_EQ(reports_.messages.size(), 2U);
