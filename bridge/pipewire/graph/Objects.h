@@ -92,6 +92,7 @@ struct Node {
 
     std::optional<Format> format;
     std::optional<Volume> volume;
+    std::uint32_t quantum = 0; ///< frames that it last handled at a time; 0: not known
 
     bool operator==(const Node&) const = default;
 };
@@ -141,6 +142,14 @@ struct Server {
     std::string defaultSource;
     std::uint32_t rate = 0;    ///< Hz; 0: not known
     std::uint32_t quantum = 0; ///< frames
+    /// What somebody has set instead, for as long as it is set; 0: nothing.
+    std::uint32_t forcedRate = 0;
+    std::uint32_t forcedQuantum = 0;
+
+    [[nodiscard]] std::uint32_t rateInForce() const noexcept { return forcedRate != 0 ? forcedRate : rate; }
+    [[nodiscard]] std::uint32_t quantumInForce() const noexcept {
+        return forcedQuantum != 0 ? forcedQuantum : quantum;
+    }
 
     bool operator==(const Server&) const = default;
 };

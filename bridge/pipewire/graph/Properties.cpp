@@ -167,6 +167,10 @@ void takeMetadata(Server& server, std::string_view key, std::string_view value) 
         server.rate = numberOf(value).value_or(0);
     } else if (key == "clock.quantum") {
         server.quantum = numberOf(value).value_or(0);
+    } else if (key == "clock.force-rate") {
+        server.forcedRate = numberOf(value).value_or(0);
+    } else if (key == "clock.force-quantum") {
+        server.forcedQuantum = numberOf(value).value_or(0);
     }
 }
 

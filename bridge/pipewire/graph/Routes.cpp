@@ -148,7 +148,7 @@ DeviceFacts factsOf(const Graph& graph, ObjectID sinkOrSource, bool isMonitored)
     facts.formFactor = firstOf({node->formFactor, device == nullptr ? "" : device->formFactor});
     facts.bluetoothProfile = node->bluetoothProfile;
     facts.bluetoothCodec = node->bluetoothCodec;
-    facts.rate = node->format ? node->format->rate : graph.server().rate;
+    facts.rate = node->format ? node->format->rate : graph.server().rateInForce();
     facts.volume = node->volume.value_or(Volume{});
     return facts;
 }

@@ -30,8 +30,9 @@ void setDefault(Dictionary& settings, const Graph& graph, std::string_view key, 
 
 Dictionary serverSettings(const Graph& graph) {
     const Server& server = graph.server();
-    Dictionary settings{
-        {"server_version", server.version}, {"sample_rate", server.rate}, {"io_buffer_size", server.quantum}};
+    Dictionary settings{{"server_version", server.version},
+                        {"sample_rate", server.rateInForce()},
+                        {"io_buffer_size", server.quantumInForce()}};
     setDefault(settings, graph, kDefaultOutput, server.defaultSink);
     setDefault(settings, graph, kDefaultInput, server.defaultSource);
     return settings;

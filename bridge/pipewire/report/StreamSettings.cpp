@@ -226,8 +226,9 @@ StreamSettings settingsOf(const Graph& graph, ObjectID stream) {
     }
     setVolume(settings, node->volume.value_or(Volume{}), filters.volume() * devices.volume());
     setLatency(settings, node->latency);
-    if (graph.server().quantum != 0) {
-        settings.set("io_buffer_size", graph.server().quantum);
+    const std::uint32_t quantum = node->quantum != 0 ? node->quantum : graph.server().quantumInForce();
+    if (quantum != 0) {
+        settings.set("io_buffer_size", quantum);
     }
     if (isInput) {
         setInput(settings, devices, filters.names());

@@ -2,6 +2,7 @@
 
 #include "bridge/pipewire/graph/Graph.h"
 #include "bridge/pipewire/report/ConnectedAccessories.h"
+#include "bridge/pipewire/report/CycleLengths.h"
 #include "bridge/pipewire/report/DeviceSession.h"
 #include "bridge/pipewire/report/Endpoint.h"
 #include "bridge/pipewire/report/Overloads.h"
@@ -71,6 +72,7 @@ private:
     ConnectedAccessories accessories_;
     Overloads overloads_;
     Troubles troubles_;
+    CycleLengths cycleLengths_;
     Profiler profiler_;
     SoundServer server_;
     Place serverPlace_;

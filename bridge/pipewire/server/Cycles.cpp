@@ -126,7 +126,7 @@ private:
 
 } // namespace
 
-void readCycles(const spa_pod* profile, CycleObserver& observer) {
+void readCycles(const spa_pod* profile, std::span<CycleObserver* const> observers) {
     if (profile == nullptr || !spa_pod_is_struct(profile)) {
         return;
     }
@@ -136,8 +136,11 @@ void readCycles(const spa_pod* profile, CycleObserver& observer) {
     const std::uint32_t size = SPA_POD_BODY_SIZE(profile);
     for (auto* item = static_cast<const spa_pod*>(body); spa_pod_is_inside(body, size, item);
          item = static_cast<const spa_pod*>(spa_pod_next(item))) {
-        if (reader.read(item)) {
-            observer.cycleEnded(cycle);
+        if (!reader.read(item)) {
+            continue;
+        }
+        for (CycleObserver* const observer : observers) {
+            observer->cycleEnded(cycle);
         }
     }
 }

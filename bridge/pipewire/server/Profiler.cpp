@@ -10,6 +10,7 @@
 #include <cstdio>
 #include <cstring>
 #include <new>
+#include <span>
 #include <stdexcept>
 #include <utility>
 
@@ -36,7 +37,8 @@ constexpr std::size_t kMayBeMore = 128U << 10U;
 
 class Profiler::Connection {
 public:
-    explicit Connection(CycleObserver& observer) : observer_(observer), loop_(pw_loop_new(nullptr)) {
+    explicit Connection(std::span<CycleObserver* const> observers)
+        : observers_(observers), loop_(pw_loop_new(nullptr)) {
         if (loop_ == nullptr) {
             throw std::bad_alloc();
         }
@@ -127,7 +129,7 @@ private:
     static void profiled(void* data, const spa_pod* profile) {
         auto& self = *static_cast<Connection*>(data);
         self.bytes_ += profile == nullptr ? 0 : SPA_POD_SIZE(profile);
-        readCycles(profile, self.observer_);
+        readCycles(profile, self.observers_);
     }
     static const pw_core_events kCoreEvents;
     static constexpr pw_registry_events kRegistryEvents{
@@ -135,7 +137,7 @@ private:
     static constexpr pw_profiler_events kProfilerEvents{.version = PW_VERSION_PROFILER_EVENTS,
                                                         .profile = profiled};
 
-    CycleObserver& observer_;
+    const std::span<CycleObserver* const> observers_;
     pw_loop* loop_;
     pw_context* context_ = nullptr;
     pw_core* core_ = nullptr;
@@ -156,8 +158,8 @@ const pw_core_events Profiler::Connection::kCoreEvents = [] {
     return events;
 }();
 
-Profiler::Profiler(const Graph& graph, const Clock& clock, CycleObserver& observer)
-    : graph_(graph), clock_(clock), observer_(observer) {}
+Profiler::Profiler(const Graph& graph, const Clock& clock, std::vector<CycleObserver*> observers)
+    : graph_(graph), clock_(clock), observers_(std::move(observers)) {}
 
 Profiler::~Profiler() = default;
 
@@ -191,12 +193,18 @@ void Profiler::noteRunning(ObjectID node, bool isRunning) {
 /// A library without the module for it is one that goes without profiling, too.
 bool Profiler::makeConnection() {
     try {
-        connection_ = std::make_unique<Connection>(observer_);
+        connection_ = std::make_unique<Connection>(observers_);
     } catch (const std::runtime_error& problem) {
         isMissing_ = true;
         std::fprintf(stderr, "tamblo-pipewire: overloads are not seen: %s\n", problem.what());
     }
     return connection_ != nullptr;
+}
+
+void Profiler::tellRead() {
+    for (CycleObserver* const observer : observers_) {
+        observer->cyclesRead();
+    }
 }
 
 void Profiler::run() {
@@ -210,7 +218,7 @@ void Profiler::run() {
     if (isTooLate || (!connection.isOpen() && silentSince_)) {
         connection.close();
         due_.reset();
-        observer_.cyclesRead();
+        tellRead();
         return;
     }
     if (!connection.isOpen() && !connection.open()) {
@@ -218,7 +226,7 @@ void Profiler::run() {
         return;
     }
     const bool goesOn = connection.read() && connection.mayStillCome();
-    observer_.cyclesRead();
+    tellRead();
     // From now on: what was reported of this reading was so long ago at the next.
     const SteadyTime end = clock_.now().steady;
     if (!goesOn) {

@@ -8,6 +8,7 @@
 #include <memory>
 #include <optional>
 #include <unordered_set>
+#include <vector>
 
 namespace tamblo::pipewire {
 
@@ -26,7 +27,7 @@ public:
     /// How long a server is left alone that has no profiler, or does not answer.
     static constexpr std::chrono::seconds kPause{10};
 
-    Profiler(const Graph& graph, const Clock& clock, CycleObserver& observer);
+    Profiler(const Graph& graph, const Clock& clock, std::vector<CycleObserver*> observers);
     ~Profiler() override;
     Profiler(const Profiler&) = delete;
     Profiler& operator=(const Profiler&) = delete;
@@ -41,10 +42,11 @@ private:
 
     void noteRunning(ObjectID node, bool isRunning);
     [[nodiscard]] bool makeConnection();
+    void tellRead();
 
     const Graph& graph_;
     const Clock& clock_;
-    CycleObserver& observer_;
+    const std::vector<CycleObserver*> observers_;
     std::unordered_set<ObjectID> running_;
     std::optional<SteadyTime> silentSince_;
     std::optional<SteadyTime> due_;

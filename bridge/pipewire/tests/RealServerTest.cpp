@@ -3,6 +3,8 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
+#include <algorithm>
+
 namespace tamblo::pipewire {
 namespace {
 
@@ -107,6 +109,29 @@ TEST_F(PipeWireServer, reportsStretchesWithTheirLengthsVolumesAndDevices) {
     ASSERT_EQ(whole.size(), 1U);
     EXPECT_EQ(text(whole[0], "summaryServiceName"), "longformaudio");
     EXPECT_NEAR(number(whole[0], "total_active_time"), seconds(end - begin), 0.2);
+}
+
+TEST_F(PipeWireServer, reportsRatesAndQuantaAsTheyAreInForce) {
+    const auto last = [this](const std::string& event, const std::string& application, std::string_view key) {
+        const auto payloads = events(event, application);
+        const auto found = std::ranges::find_if(payloads.rbegin(), payloads.rend(),
+                                                [key](const auto& payload) { return payload.contains(key); });
+        return found == payloads.rend() ? -1 : number(*found, key);
+    };
+    const auto becomes = [&last](const std::string& event, const std::string& application,
+                                 std::string_view key, double value) {
+        return test::eventually([&] { return last(event, application, key) == value; });
+    };
+    Program player({"pw-play", "--latency", "2048", sound_->song(20s)});
+    EXPECT_TRUE(becomes("Session_Playback.Generic", "pw-cat", "io_buffer_size", 2048))
+        << "not the usual 1024";
+    (void)tamblo::test::run("timeout 5 pw-metadata -n settings 0 clock.force-rate 44100");
+    EXPECT_TRUE(becomes("Session_Playback.Generic", "pw-cat", "device_sample_rate", 44100));
+    EXPECT_TRUE(becomes("HAL_Setup.Generic", "pipewire", "device_sample_rate", 44100)) << "the sink's";
+    EXPECT_TRUE(becomes("HAL_Setup.Generic", "pipewire", "sample_rate", 44100)) << "the server's";
+    (void)tamblo::test::run("timeout 5 pw-metadata -n settings 0 clock.force-quantum 512");
+    EXPECT_TRUE(becomes("HAL_Setup.Generic", "pipewire", "io_buffer_size", 512));
+    EXPECT_TRUE(becomes("Session_Playback.Generic", "pw-cat", "io_buffer_size", 512));
 }
 
 TEST_F(PipeWireServer, makesOneSessionOfTwoSongsAndAnotherOfARecording) {
