@@ -61,7 +61,6 @@ void Overloads::count(Tally& tally, const NodeCycle& node, const Cycle& cycle) {
     const std::int64_t now = cycle.nodes.front().turn;
     if (now - tally.lastTold > kPause.count()) {
         tally.isBeginning = true;
-        tally.row = {};
     }
     tally.lastTold = now;
     if (node.outcome == NodeCycle::Outcome::waited || (tally.cycles != 0 && tally.lastTurn == node.turn)) {

@@ -3,7 +3,10 @@
 #include "bridge/pipewire/server/Context.h"
 #include "bridge/pipewire/server/Cycles.h"
 #include "bridge/pipewire/server/Proxy.h"
+#include "bridge/pipewire/server/SoundServer.h"
+#include "os/FileDescriptor.h"
 
+#include <algorithm>
 #include <array>
 #include <cerrno>
 #include <cstddef>
@@ -12,10 +15,14 @@
 #include <new>
 #include <span>
 #include <stdexcept>
+#include <string>
 #include <utility>
 
 #include <pipewire/extensions/profiler.h>
 #include <pipewire/pipewire.h>
+#include <sys/ioctl.h>
+#include <sys/socket.h>
+#include <sys/un.h>
 
 namespace tamblo::pipewire {
 
@@ -30,10 +37,24 @@ constexpr std::array<const char*, 2> kModules{"libpipewire-module-protocol-nativ
 constexpr milliseconds kAnswerInterval{20};
 constexpr unsigned kMostAnswers = 50;
 
-/// The socket holds some 200 KiB. After much of that there may be more, which waits in the server.
-constexpr std::size_t kMayBeMore = 128U << 10U;
-
 } // namespace
+
+/// A connection of which it can be told how much waits in it, as the library tells that of none. -1 when
+/// nobody answers.
+int connectedSocket() noexcept {
+    const std::string path = SoundServer::socketPath();
+    sockaddr_un address{};
+    address.sun_family = AF_UNIX;
+    if (path.size() >= sizeof(address.sun_path)) {
+        return -1;
+    }
+    path.copy(address.sun_path, path.size());
+    FileDescriptor socket(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0));
+    const bool isConnected =
+        socket.isOpen() &&
+        ::connect(socket.get(), reinterpret_cast<const sockaddr*>(&address), sizeof(address)) == 0;
+    return isConnected ? socket.release() : -1;
+}
 
 class Profiler::Connection {
 public:
@@ -64,7 +85,9 @@ public:
     [[nodiscard]] bool mayStillCome() noexcept { return isFound() || ++looks_ < kMostAnswers; }
 
     bool open() {
-        core_ = pw_context_connect(context_, nullptr, 0);
+        socket_ = connectedSocket();
+        // The library closes the socket with the connection.
+        core_ = socket_ < 0 ? nullptr : pw_context_connect_fd(context_, socket_, nullptr, 0);
         if (core_ == nullptr) {
             return false;
         }
@@ -88,31 +111,40 @@ public:
         id_ = kNoObject;
     }
 
-    /// What has come; false when the server has gone.
+    /// Has what came be told; false when the server has gone.
     [[nodiscard]] bool read() {
         bytes_ = 0;
-        pw_loop_enter(loop_);
-        while (pw_loop_iterate(loop_, 0) > 0 && bytes_ < kMayBeMore) {
-        }
-        const bool isDrained = bytes_ < kMayBeMore;
-        if (!isDrained) {
-            profiler_.reset();
-        } else if (profiler_ == nullptr && id_ != kNoObject && !hasGone_) {
-            bind();
-        }
-        // What was asked for leaves.
-        pw_loop_iterate(loop_, 0);
-        pw_loop_leave(loop_);
+        int waiting = 0;
+        (void)::ioctl(socket_, FIONREAD, &waiting);
+        iterate();
+        bytes_ = std::max(bytes_, static_cast<std::size_t>(std::max(waiting, 0)));
         return !hasGone_;
     }
+    /// How much the last `read` read.
+    [[nodiscard]] std::size_t bytes() const noexcept { return bytes_; }
 
-private:
-    void bind() {
+    [[nodiscard]] bool isAsking() const noexcept { return profiler_ != nullptr; }
+    void ask() {
         profiler_ = std::make_unique<Proxy<pw_profiler>>(registry_, id_, PW_TYPE_INTERFACE_Profiler,
                                                          PW_VERSION_PROFILER);
         if (profiler_->get() != nullptr) {
             pw_profiler_add_listener(profiler_->get(), profiler_->hook(), &kProfilerEvents, this);
         }
+        iterate();
+    }
+    void askNoMore() {
+        profiler_.reset();
+        iterate();
+    }
+
+private:
+    /// Receives what has come, and sends what is to leave.
+    void iterate() {
+        constexpr int kMostRounds = 16;
+        pw_loop_enter(loop_);
+        for (int round = 0; round < kMostRounds && pw_loop_iterate(loop_, 0) > 0; ++round) {
+        }
+        pw_loop_leave(loop_);
     }
 
     static void failed(void* data, std::uint32_t id, int, int result, const char*) {
@@ -146,6 +178,7 @@ private:
     spa_hook registryHook_{};
     std::unique_ptr<Proxy<pw_profiler>> profiler_;
     ObjectID id_ = kNoObject;
+    int socket_ = -1;
     std::size_t bytes_ = 0;
     unsigned looks_ = 0;
     bool hasGone_ = false;
@@ -181,6 +214,9 @@ void Profiler::noteRunning(ObjectID node, bool isRunning) {
         const bool isFirst = running_.empty();
         running_.insert(node);
         silentSince_.reset();
+        if (connection_ && connection_->isAsking() && running_.size() >= runningThen_ + kManyMore) {
+            due_ = clock_.now().steady;
+        }
         if (isFirst && !isMissing_) {
             const bool isOpen = connection_ && connection_->isOpen();
             due_ = clock_.now().steady + (isOpen ? kInterval : std::chrono::seconds{0});
@@ -205,6 +241,31 @@ void Profiler::tellRead() {
     for (CycleObserver* const observer : observers_) {
         observer->cyclesRead();
     }
+}
+
+/// After a look: how long until the next one.
+std::chrono::nanoseconds Profiler::askOrPause(SteadyTime now) {
+    const std::chrono::nanoseconds passed = now - std::exchange(lookedAt_, now);
+    runningThen_ = running_.size();
+    if (!connection_->isAsking()) {
+        connection_->ask();
+        return window_;
+    }
+    const double share = static_cast<double>(kGoodAtOnce) / static_cast<double>(connection_->bytes() + 1);
+    const std::chrono::duration<double> good = passed * std::min(share, 1000.0);
+    window_ = std::clamp<std::chrono::nanoseconds>(std::chrono::duration_cast<std::chrono::nanoseconds>(good),
+                                                   kShortestWindow, kInterval);
+    if (window_ == kInterval) {
+        return kInterval;
+    }
+    // What of it the server still has would be read at the next look, and those after it, and the library's
+    // buffer become larger each time.
+    if (connection_->bytes() > kMostAtOnce) {
+        connection_->close();
+    } else {
+        connection_->askNoMore();
+    }
+    return 2 * kInterval - window_;
 }
 
 void Profiler::run() {
@@ -236,8 +297,9 @@ void Profiler::run() {
         due_ = end + kAnswerInterval;
     } else {
         // When nothing runs, what is left has come with this reading or the next; then only the end is due.
+        const std::chrono::nanoseconds next = askOrPause(end);
         const bool isOver = silentSince_ && now - *silentSince_ >= kInterval;
-        due_ = isOver ? *silentSince_ + kLinger : end + kInterval;
+        due_ = isOver ? *silentSince_ + kLinger : end + next;
     }
 }
 

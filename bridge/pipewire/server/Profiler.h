@@ -5,6 +5,7 @@
 #include "bridge/pipewire/report/Time.h"
 
 #include <chrono>
+#include <cstddef>
 #include <memory>
 #include <optional>
 #include <unordered_set>
@@ -16,8 +17,9 @@ namespace tamblo::pipewire {
 ///
 /// The server sends that over a connection of its own, on which nothing waits: it is read once a second,
 /// however often the server sends, so that this thread wakes once a second for it while sound runs, and
-/// never while none does. When a second brings more than is read at once, as with very many streams, the
-/// server is not asked for more until that has been read: some cycles are not seen then. The loop's thread.
+/// never while none does. When a second brings more than should be kept at once, as with very many streams,
+/// the server is asked for only a part of every other second: other cycles are not seen then. The loop's
+/// thread.
 class Profiler final : public GraphObserver, public Timed {
 public:
     static constexpr std::chrono::seconds kInterval{1};
@@ -26,6 +28,13 @@ public:
 
     /// How long a server is left alone that has no profiler, or does not answer.
     static constexpr std::chrono::seconds kPause{10};
+    /// What should wait to be read at a look, as the library has it all in memory then, and what is too much:
+    /// the socket holds some 200 KiB. How short a time the server is asked for that. When so many more nodes
+    /// run than at the last look, it is time for one.
+    static constexpr std::size_t kGoodAtOnce = 64U << 10U;
+    static constexpr std::size_t kMostAtOnce = 128U << 10U;
+    static constexpr std::chrono::milliseconds kShortestWindow{20};
+    static constexpr std::size_t kManyMore = 32;
 
     Profiler(const Graph& graph, const Clock& clock, std::vector<CycleObserver*> observers);
     ~Profiler() override;
@@ -43,6 +52,7 @@ private:
     void noteRunning(ObjectID node, bool isRunning);
     [[nodiscard]] bool makeConnection();
     void tellRead();
+    [[nodiscard]] std::chrono::nanoseconds askOrPause(SteadyTime now);
 
     const Graph& graph_;
     const Clock& clock_;
@@ -50,6 +60,9 @@ private:
     std::unordered_set<ObjectID> running_;
     std::optional<SteadyTime> silentSince_;
     std::optional<SteadyTime> due_;
+    SteadyTime lookedAt_{};
+    std::size_t runningThen_ = 0;
+    std::chrono::nanoseconds window_{kInterval}; ///< in which the server is asked
     bool isMissing_ = false;
     std::unique_ptr<Connection> connection_; ///< kept from the first time on that anything runs
 };
