@@ -17,6 +17,8 @@ namespace {
 
 /// How long the program's end may take.
 constexpr milliseconds kFarewell{1000};
+/// How long `--once` waits for a server that is connected, and says nothing.
+constexpr milliseconds kPatience{5000};
 
 void log(const std::string& line) {
     std::fprintf(stderr, "tamblo-pipewire: %s\n", line.c_str());
@@ -85,6 +87,9 @@ int Bridge::run() {
     watchPlace(serverPlace_);
     if (!options_.isDry) {
         watchPlace(servicePlace_);
+    }
+    if (options_.once) {
+        snapshotDue_ = clock_.now().steady + kPatience;
     }
     loop_.run([this] { return beforeSleep(); });
     streams_.endAll();
@@ -164,7 +169,10 @@ std::optional<SteadyTime> Bridge::beforeSleep() {
     }
     std::optional<SteadyTime> due = serverPlace_.endpoint.due();
     const std::optional<SteadyTime> other = options_.isDry ? std::nullopt : servicePlace_.endpoint.due();
-    return due && other ? std::min(*due, *other) : due ? due : other;
+    for (const auto& time : {other, snapshotDue_}) {
+        due = due && time ? std::min(*due, *time) : due ? due : time;
+    }
+    return due;
 }
 
 /// Ends the program, when everything is known, or when it will not be.
@@ -174,14 +182,18 @@ void Bridge::takeSnapshot() {
         device_.settle();
         loop_.stop();
     } else if (!server_.isConnected() && !serverPlace_.endpoint.due()) {
-        log("no sound server answers at " + SoundServer::socketPath());
-        status_ = EXIT_FAILURE;
-        loop_.stop();
+        fail("no sound server answers at " + SoundServer::socketPath());
     } else if (!reporter_.isReachable() && !servicePlace_.endpoint.due()) {
-        log("the service does not answer at " + service_.socketPath());
-        status_ = EXIT_FAILURE;
-        loop_.stop();
+        fail("the service does not answer at " + service_.socketPath());
+    } else if (snapshotDue_ && *snapshotDue_ <= clock_.now().steady) {
+        fail("the sound server says nothing at " + SoundServer::socketPath());
     }
+}
+
+void Bridge::fail(const std::string& line) {
+    log(line);
+    status_ = EXIT_FAILURE;
+    loop_.stop();
 }
 
 } // namespace tamblo::pipewire

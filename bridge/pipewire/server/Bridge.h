@@ -58,6 +58,7 @@ private:
     /// Everything that was reported leaves; when to be called again at the latest.
     [[nodiscard]] std::optional<SteadyTime> beforeSleep();
     void takeSnapshot();
+    void fail(const std::string& line);
 
     const Options options_;
     SystemClock clock_;
@@ -80,6 +81,7 @@ private:
     std::optional<PreferenceFile> preferences_;
     DirectoryWatcher preferencesWatcher_;
     std::unique_ptr<Loop::Watch> serviceWatch_;
+    std::optional<SteadyTime> snapshotDue_; ///< when it is given up
     int status_ = 0;
 };
 

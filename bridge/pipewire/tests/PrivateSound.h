@@ -112,6 +112,7 @@ public:
         }
     }
     void killServer() { server_->end(SIGKILL); }
+    void pauseServer(bool isPaused) { ::kill(server_->pid(), isPaused ? SIGSTOP : SIGCONT); }
     void startManager() {
         manager_ = std::make_unique<Program>(std::vector<std::string>{"wireplumber"}, log("wireplumber"));
         if (!eventually([] { return contains("timeout 5 pw-metadata", "sink-"); })) {

@@ -184,6 +184,9 @@ TEST_F(PipeWireServer, livesThroughRestartsOfAllThree) {
     const std::string once = "timeout 10 " PROGRAMS_DIR "/tamblo-pipewire --dry-run --once";
     EXPECT_TRUE(PrivateSound::contains(once, "begin, generic, of again"));
     EXPECT_EQ(tamblo::test::run("PIPEWIRE_REMOTE=nobody " + once).status, 1);
+    sound_->pauseServer(true);
+    EXPECT_EQ(tamblo::test::run(once).status, 1) << "of a server that says nothing";
+    sound_->pauseServer(false);
     EXPECT_EQ(bridge_->end(), 0);
     EXPECT_TRUE(awaitEvents("Session_Generic.Summary", 1, "again")) << "at its own end, too";
     startBridge();
