@@ -92,12 +92,15 @@ bool isStream(MediaClass mediaClass) noexcept {
 } // namespace
 
 MediaClass mediaClassOf(std::string_view text) noexcept {
-    constexpr std::array<std::pair<std::string_view, MediaClass>, 6> classes{{
+    constexpr std::array<std::pair<std::string_view, MediaClass>, 8> classes{{
         {"Stream/Output/Audio", MediaClass::playbackStream},
         {"Stream/Input/Audio", MediaClass::captureStream},
         {"Audio/Sink", MediaClass::sink},
         {"Audio/Source", MediaClass::source},
         {"Audio/Source/Virtual", MediaClass::source},
+        // Devices that later servers show to applications through a filter alone, such as headsets.
+        {"Audio/Sink/Internal", MediaClass::sink},
+        {"Audio/Source/Internal", MediaClass::source},
         {"Audio/Duplex", MediaClass::duplex},
     }};
     for (const auto& [name, mediaClass] : classes) {
