@@ -135,6 +135,17 @@ Reached devicesReachedFrom(const Graph& graph, ObjectID stream) {
     return Walk(graph, node == nullptr || node->mediaClass != MediaClass::captureStream).from(stream);
 }
 
+/// "alsa_output.usb-Maker_Thing_0123-00.analog-stereo.remapped": which part is the number cannot be told.
+std::string filterName(const Node& filter) {
+    constexpr std::string_view kUsb = "usb-";
+    std::string name = filter.name;
+    for (auto begin = name.find(kUsb); begin != name.npos; begin = name.find(kUsb, begin + kUsb.size())) {
+        const std::size_t end = std::min(name.find('.', begin), name.size());
+        name.erase(begin + kUsb.size(), end - begin - kUsb.size());
+    }
+    return name;
+}
+
 DeviceFacts factsOf(const Graph& graph, ObjectID sinkOrSource, bool isMonitored) {
     DeviceFacts facts;
     const Node* const node = graph.node(sinkOrSource);

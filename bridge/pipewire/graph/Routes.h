@@ -39,4 +39,8 @@ struct DeviceFacts {
 /// `isMonitored`: the sound is taken from what a sink plays.
 [[nodiscard]] DeviceFacts factsOf(const Graph& graph, ObjectID sinkOrSource, bool isMonitored = false);
 
+/// A filter's name without the piece of hardware that it may have been called after: of what is on USB the
+/// server's names have the serial number.
+[[nodiscard]] std::string filterName(const Node& filter);
+
 } // namespace tamblo::pipewire

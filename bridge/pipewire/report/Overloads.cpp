@@ -51,7 +51,7 @@ Overloads::Tally* Overloads::tallyOf(ObjectID node) {
         known->isDevice() ? std::string() : applicationOf(*known, graph_.client(known->client));
     tally.name = known->isDevice()   ? factsOf(graph_, node).name
                  : known->isStream() ? tally.application
-                                     : known->name;
+                                     : filterName(*known);
     return &tallies_.emplace(node, std::move(tally)).first->second;
 }
 

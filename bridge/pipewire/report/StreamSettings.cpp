@@ -144,8 +144,9 @@ public:
             const Node& filter = *graph.node(id);
             hasSpatial_ = hasSpatial_ || isSpatial(filter.name) || isSpatial(filter.description);
             volume_ *= DeviceSettings::audible(filter.volume.value_or(Volume{}));
-            if (!filter.name.empty() && names_.size() + filter.name.size() <= kMostListBytes) {
-                names_ += (names_.empty() ? "" : ", ") + filter.name;
+            const std::string name = filterName(filter);
+            if (!name.empty() && names_.size() + name.size() <= kMostListBytes) {
+                names_ += (names_.empty() ? "" : ", ") + name;
             }
         }
     }

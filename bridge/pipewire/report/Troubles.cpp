@@ -68,7 +68,7 @@ void Troubles::nodeChanged(ObjectID id, const Node& node) {
         errors.application = applicationOf(node, graph_.client(node.client));
         errors.name = errors.application;
     } else {
-        errors.name = node.isDevice() ? factsOf(graph_, id).name : node.name;
+        errors.name = node.isDevice() ? factsOf(graph_, id).name : filterName(node);
         errors.text = node.error;
     }
     const SteadyTime now = clock_.now().steady;

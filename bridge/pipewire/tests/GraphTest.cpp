@@ -177,6 +177,10 @@ TEST(PipeWireRoutes, nameDevicesAsPeopleDo) {
     EXPECT_EQ(facts.portType, "headphones");
     EXPECT_EQ(facts.formFactor, "internal");
 
+    Node remapped;
+    remapped.name = "alsa_output.usb-Maker_Thing_0123-00.analog-stereo.remapped";
+    EXPECT_EQ(filterName(remapped), "alsa_output.usb-.analog-stereo.remapped") << "without the serial number";
+
     // A headset that has no name is called by its address.
     world.node(2, {{"media.class", "Audio/Sink"},
                    {"node.description", "01:23:45:67:89:AB"},
