@@ -5,6 +5,7 @@
 
 #include <algorithm>
 #include <cmath>
+#include <ratio>
 #include <utility>
 
 namespace tamblo::pipewire {
@@ -16,6 +17,10 @@ constexpr EventCategory kIO = client::category(EventKind::io);
 void bringForward(std::optional<SteadyTime>& due, SteadyTime time) {
     due = due ? std::min(*due, time) : time;
 }
+
+/// A driver that begins its next cycle when only so much of one has passed begins anew, as when a stream
+/// comes to others that run: those were not given the time that they are due.
+constexpr double kEarly = 0.75;
 
 double rounded(double value) noexcept {
     constexpr double kDigits = 1e3;
@@ -59,7 +64,9 @@ void Overloads::count(Tally& tally, const NodeCycle& node, const Cycle& cycle) {
     tally.frames = cycle.frames;
     tally.cycleSeconds = cycle.seconds;
     const std::int64_t now = cycle.nodes.front().turn;
-    if (now - tally.lastTold > kPause.count()) {
+    const auto passed = static_cast<double>(now - tally.lastTold);
+    const bool isEarly = passed > 0 && passed < kEarly * cycle.seconds * std::nano::den;
+    if (isEarly || passed > static_cast<double>(kPause.count())) {
         tally.isBeginning = true;
     }
     tally.lastTold = now;
@@ -173,7 +180,8 @@ void Overloads::report(ObjectID node, Tally& tally, const Moment& now) {
                            {"cycle_seconds", tally.cycleSeconds},
                            {"smallest_buffer_frame_size", tally.frames},
                            {"cycle_number", tally.counted},
-                           {"io_cycle", tally.cycles}};
+                           {"io_cycle", tally.cycles},
+                           {"issue_number", ++issues_}};
         if (!tally.saidAt || now.steady - *tally.saidAt >= kCalm) {
             reporter_.send(session, kIO, EventType::error, payload, now.wall);
         }

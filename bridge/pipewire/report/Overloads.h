@@ -87,6 +87,7 @@ private:
     const SessionOfNode sessionOf_;
     std::unordered_map<ObjectID, Tally> tallies_;
     std::optional<SteadyTime> due_;
+    std::int64_t issues_ = 0; ///< tells repeated ones apart, which the service would leave out
 };
 
 } // namespace tamblo::pipewire
