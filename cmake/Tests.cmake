@@ -75,13 +75,19 @@ foreach(tests tamblo_service_tests tamblo_hostile_tests)
     endif()
 endforeach()
 
+# What the bridges share.
+tamblo_link_headers(bridge/common/tests TRUE bridge_tests_include)
+file(GLOB bridge_sources CONFIGURE_DEPENDS RELATIVE "${CMAKE_SOURCE_DIR}" bridge/common/tests/*Test.cpp)
+tamblo_tests(tamblo_bridge_tests LABEL unit SOURCES ${bridge_sources} LIBRARIES bridge/common client wire os base)
+target_include_directories(tamblo_bridge_tests PRIVATE "${bridge_tests_include}")
+
 # The bridge to PipeWire: its model without a server, and the program with a private one.
 if(TARGET tamblo-pipewire)
     file(GLOB pipewire_sources CONFIGURE_DEPENDS RELATIVE "${CMAKE_SOURCE_DIR}" bridge/pipewire/tests/*Test.cpp)
     tamblo_link_headers(bridge/pipewire/tests TRUE pipewire_tests_include)
     tamblo_tests(tamblo_pipewire_tests LABEL service SOURCES ${pipewire_sources}
-        LIBRARIES bridge/pipewire/report bridge/pipewire/graph client wire os base)
-    target_include_directories(tamblo_pipewire_tests PRIVATE "${pipewire_tests_include}")
+        LIBRARIES bridge/pipewire/report bridge/pipewire/graph bridge/common client wire os base)
+    target_include_directories(tamblo_pipewire_tests PRIVATE "${pipewire_tests_include}" "${bridge_tests_include}")
     tamblo_program(tamblo_pipewire_streams SOURCES bridge/pipewire/tests/streams.cpp)
     target_link_libraries(tamblo_pipewire_streams PRIVATE tamblo_pipewire_library)
     target_compile_definitions(tamblo_pipewire_tests PRIVATE

@@ -1,5 +1,8 @@
 #include "bridge/pipewire/report/StreamSessions.h"
 
+#include "bridge/pipewire/report/Application.h"
+#include "bridge/pipewire/report/StreamSettings.h"
+
 #include <algorithm>
 #include <utility>
 

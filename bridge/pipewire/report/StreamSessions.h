@@ -1,10 +1,10 @@
 #pragma once
 
+#include "bridge/common/Reporter.h"
+#include "bridge/common/ServiceTypes.h"
+#include "bridge/common/StreamSession.h"
+#include "bridge/common/Time.h"
 #include "bridge/pipewire/graph/Graph.h"
-#include "bridge/pipewire/report/Reporter.h"
-#include "bridge/pipewire/report/ServiceTypes.h"
-#include "bridge/pipewire/report/StreamSession.h"
-#include "bridge/pipewire/report/Time.h"
 
 #include <chrono>
 #include <cstddef>

@@ -1,14 +1,14 @@
 #pragma once
 
+#include "bridge/common/Endpoint.h"
+#include "bridge/common/ServiceReporter.h"
+#include "bridge/common/ServiceTypes.h"
+#include "bridge/common/TextReporter.h"
 #include "bridge/pipewire/graph/Graph.h"
 #include "bridge/pipewire/report/ConnectedAccessories.h"
 #include "bridge/pipewire/report/DeviceSession.h"
-#include "bridge/pipewire/report/Endpoint.h"
 #include "bridge/pipewire/report/Overloads.h"
-#include "bridge/pipewire/report/ServiceReporter.h"
-#include "bridge/pipewire/report/ServiceTypes.h"
 #include "bridge/pipewire/report/StreamSessions.h"
-#include "bridge/pipewire/report/TextReporter.h"
 #include "bridge/pipewire/report/Troubles.h"
 #include "bridge/pipewire/server/Loop.h"
 #include "bridge/pipewire/server/Profiler.h"

@@ -45,3 +45,10 @@ public:
 }
 
 } // namespace tamblo::pipewire
+
+namespace tamblo {
+
+/// What the programs share that feed the service from something that exists.
+namespace bridge = pipewire;
+
+} // namespace tamblo
