@@ -96,3 +96,17 @@ if(TARGET tamblo-pipewire)
         "TAMBLOCTL_PATH=\"${CMAKE_RUNTIME_OUTPUT_DIRECTORY}/tambloctl\"")
     add_dependencies(tamblo_pipewire_tests tamblo-pipewire tamblo_pipewire_streams tamblod)
 endif()
+
+# The bridge to ALSA: by files like the kernel's, and the program with the real service.
+if(TARGET tamblo-alsa)
+    file(GLOB alsa_sources CONFIGURE_DEPENDS RELATIVE "${CMAKE_SOURCE_DIR}" bridge/alsa/tests/*Test.cpp)
+    tamblo_link_headers(bridge/alsa/tests TRUE alsa_tests_include)
+    tamblo_tests(tamblo_alsa_tests LABEL service SOURCES ${alsa_sources}
+        LIBRARIES bridge/alsa/report bridge/alsa/kernel bridge/common client wire os base)
+    target_include_directories(tamblo_alsa_tests PRIVATE "${alsa_tests_include}" "${bridge_tests_include}")
+    target_compile_definitions(tamblo_alsa_tests PRIVATE
+        "PROGRAMS_DIR=\"${CMAKE_RUNTIME_OUTPUT_DIRECTORY}\""
+        "TAMBLOD_PATH=\"${CMAKE_RUNTIME_OUTPUT_DIRECTORY}/tamblod\""
+        "TAMBLOCTL_PATH=\"${CMAKE_RUNTIME_OUTPUT_DIRECTORY}/tambloctl\"")
+    add_dependencies(tamblo_alsa_tests tamblo-alsa tamblod)
+endif()

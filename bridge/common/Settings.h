@@ -1,6 +1,7 @@
 #pragma once
 
 #include "base/Dictionary.h"
+#include "bridge/common/Namespace.h"
 
 #include <cstdint>
 #include <string>

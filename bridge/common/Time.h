@@ -1,5 +1,7 @@
 #pragma once
 
+#include "bridge/common/Namespace.h"
+
 #include <chrono>
 #include <optional>
 
@@ -45,10 +47,3 @@ public:
 }
 
 } // namespace tamblo::pipewire
-
-namespace tamblo {
-
-/// What the programs share that feed the service from something that exists.
-namespace bridge = pipewire;
-
-} // namespace tamblo
