@@ -24,9 +24,9 @@ endif()
 
 if(tamblo_pipewire_found)
     # What is decided from the server's world, and what is said of it, knows no header of PipeWire's.
-    tamblo_folder(bridge/pipewire/graph PUBLIC base)
-    tamblo_folder(bridge/pipewire/report PUBLIC bridge/pipewire/graph client os base)
-    tamblo_folder(bridge/pipewire/server PUBLIC bridge/pipewire/report bridge/pipewire/graph client wire os base)
+    tamblo_folder(bridge/pipewire/graph PUBLIC bridge/common base)
+    tamblo_folder(bridge/pipewire/report PUBLIC bridge/pipewire/graph bridge/common client os base)
+    tamblo_folder(bridge/pipewire/server PUBLIC bridge/pipewire/report bridge/pipewire/graph bridge/common client wire os base)
     # The macros by which the server is called are statements that have a value, an extension that clang would warn of
     # where they are used.
     add_library(tamblo_pipewire_library INTERFACE)
@@ -35,7 +35,7 @@ if(tamblo_pipewire_found)
         "$<$<CXX_COMPILER_ID:Clang>:-Wno-gnu-statement-expression-from-macro-expansion>")
     target_link_libraries(tamblo_bridge_pipewire_server PUBLIC tamblo_pipewire_library)
     tamblo_program(tamblo-pipewire SOURCES bridge/pipewire/main.cpp
-        LIBRARIES bridge/pipewire/server bridge/pipewire/report bridge/pipewire/graph client wire os base
+        LIBRARIES bridge/pipewire/server bridge/pipewire/report bridge/pipewire/graph bridge/common client wire os base
         SELF_CONTAINED)
     target_compile_definitions(tamblo-pipewire PRIVATE "TAMBLO_VERSION=\"${PROJECT_VERSION}\"")
 endif()

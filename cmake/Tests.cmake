@@ -75,13 +75,19 @@ foreach(tests tamblo_service_tests tamblo_hostile_tests)
     endif()
 endforeach()
 
+# What the bridges share.
+tamblo_link_headers(bridge/common/tests TRUE bridge_tests_include)
+file(GLOB bridge_sources CONFIGURE_DEPENDS RELATIVE "${CMAKE_SOURCE_DIR}" bridge/common/tests/*Test.cpp)
+tamblo_tests(tamblo_bridge_tests LABEL unit SOURCES ${bridge_sources} LIBRARIES bridge/common client wire os base)
+target_include_directories(tamblo_bridge_tests PRIVATE "${bridge_tests_include}")
+
 # The bridge to PipeWire: its model without a server, and the program with a private one.
 if(TARGET tamblo-pipewire)
     file(GLOB pipewire_sources CONFIGURE_DEPENDS RELATIVE "${CMAKE_SOURCE_DIR}" bridge/pipewire/tests/*Test.cpp)
     tamblo_link_headers(bridge/pipewire/tests TRUE pipewire_tests_include)
     tamblo_tests(tamblo_pipewire_tests LABEL service SOURCES ${pipewire_sources}
-        LIBRARIES bridge/pipewire/report bridge/pipewire/graph client wire os base)
-    target_include_directories(tamblo_pipewire_tests PRIVATE "${pipewire_tests_include}")
+        LIBRARIES bridge/pipewire/report bridge/pipewire/graph bridge/common client wire os base)
+    target_include_directories(tamblo_pipewire_tests PRIVATE "${pipewire_tests_include}" "${bridge_tests_include}")
     tamblo_program(tamblo_pipewire_streams SOURCES bridge/pipewire/tests/streams.cpp)
     target_link_libraries(tamblo_pipewire_streams PRIVATE tamblo_pipewire_library)
     target_compile_definitions(tamblo_pipewire_tests PRIVATE
@@ -89,4 +95,18 @@ if(TARGET tamblo-pipewire)
         "TAMBLOD_PATH=\"${CMAKE_RUNTIME_OUTPUT_DIRECTORY}/tamblod\""
         "TAMBLOCTL_PATH=\"${CMAKE_RUNTIME_OUTPUT_DIRECTORY}/tambloctl\"")
     add_dependencies(tamblo_pipewire_tests tamblo-pipewire tamblo_pipewire_streams tamblod)
+endif()
+
+# The bridge to ALSA: by files like the kernel's, and the program with the real service.
+if(TARGET tamblo-alsa)
+    file(GLOB alsa_sources CONFIGURE_DEPENDS RELATIVE "${CMAKE_SOURCE_DIR}" bridge/alsa/tests/*Test.cpp)
+    tamblo_link_headers(bridge/alsa/tests TRUE alsa_tests_include)
+    tamblo_tests(tamblo_alsa_tests LABEL service SOURCES ${alsa_sources}
+        LIBRARIES bridge/alsa/report bridge/alsa/kernel bridge/common client wire os base)
+    target_include_directories(tamblo_alsa_tests PRIVATE "${alsa_tests_include}" "${bridge_tests_include}")
+    target_compile_definitions(tamblo_alsa_tests PRIVATE
+        "PROGRAMS_DIR=\"${CMAKE_RUNTIME_OUTPUT_DIRECTORY}\""
+        "TAMBLOD_PATH=\"${CMAKE_RUNTIME_OUTPUT_DIRECTORY}/tamblod\""
+        "TAMBLOCTL_PATH=\"${CMAKE_RUNTIME_OUTPUT_DIRECTORY}/tambloctl\"")
+    add_dependencies(tamblo_alsa_tests tamblo-alsa tamblod)
 endif()

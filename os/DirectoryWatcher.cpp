@@ -54,8 +54,10 @@ DirectoryWatcher::DirectoryWatcher(std::string directory, Watch watched)
 void DirectoryWatcher::watch() {
     replaceWatch(parentWatch_, watchNearestParent());
     const int parentError = errno;
+    const bool isOfCreations = watched_ == Watch::creationsAndRemovals || watched_ == Watch::use;
     const std::uint32_t mask = kWritesMask | (watched_ == Watch::writes ? 0 : kRemovalsMask) |
-                               (watched_ == Watch::creationsAndRemovals ? IN_CREATE | IN_ATTRIB : 0U);
+                               (isOfCreations ? IN_CREATE | IN_ATTRIB : 0U) |
+                               (watched_ == Watch::use ? IN_OPEN | IN_CLOSE : 0U);
     const int watch = ::inotify_add_watch(inotify_.get(), directory_.c_str(), mask);
     const bool isMissing = watch < 0 && (errno == ENOENT || errno == ENOTDIR);
     if (isMissing) {

@@ -19,13 +19,14 @@ namespace tamblo {
 /// nothing.
 class DirectoryWatcher {
 public:
-    /// Called with the name of a file that was written or replaced (or removed or created, where that is
-    /// watched), or with nothing when any file may have been: the directory has come or gone, or more
+    /// Called with the name of a file that was written or replaced (or removed, created or used, where
+    /// that is watched), or with nothing when any file may have been: the directory has come or gone, or more
     /// happened than the kernel could remember.
     using Handler = std::function<void(std::optional<std::string_view> fileName)>;
 
-    /// `creationsAndRemovals` is for what is never written, such as sockets.
-    enum class Watch { writes, writesAndRemovals, creationsAndRemovals };
+    /// `creationsAndRemovals` is for what is never written, such as sockets; `use` adds that a file is opened
+    /// and closed, as for devices.
+    enum class Watch { writes, writesAndRemovals, creationsAndRemovals, use };
 
     explicit DirectoryWatcher(std::string directory, Watch watched = Watch::writesAndRemovals);
     DirectoryWatcher(const DirectoryWatcher&) = delete;

@@ -1,7 +1,7 @@
 #include "bridge/pipewire/graph/Properties.h"
 
 #include "base/Json.h"
-#include "bridge/pipewire/graph/CleanText.h"
+#include "bridge/common/CleanText.h"
 
 #include <algorithm>
 #include <array>

@@ -1,8 +1,8 @@
 #pragma once
 
+#include "bridge/common/Reporter.h"
+#include "bridge/common/Time.h"
 #include "bridge/pipewire/graph/Graph.h"
-#include "bridge/pipewire/report/Reporter.h"
-#include "bridge/pipewire/report/Time.h"
 #include "os/HeldFile.h"
 
 #include <chrono>

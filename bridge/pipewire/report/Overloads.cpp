@@ -1,7 +1,7 @@
 #include "bridge/pipewire/report/Overloads.h"
 
 #include "bridge/pipewire/graph/Routes.h"
-#include "bridge/pipewire/report/ServiceTypes.h"
+#include "bridge/pipewire/report/Application.h"
 
 #include <algorithm>
 #include <cmath>

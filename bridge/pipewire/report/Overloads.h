@@ -1,10 +1,10 @@
 #pragma once
 
+#include "bridge/common/Reporter.h"
+#include "bridge/common/Time.h"
 #include "bridge/pipewire/graph/Cycle.h"
 #include "bridge/pipewire/graph/Graph.h"
-#include "bridge/pipewire/report/Reporter.h"
 #include "bridge/pipewire/report/SessionOfNode.h"
-#include "bridge/pipewire/report/Time.h"
 
 #include <chrono>
 #include <cstdint>

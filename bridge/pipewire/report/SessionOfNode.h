@@ -1,7 +1,7 @@
 #pragma once
 
+#include "bridge/common/Reporter.h"
 #include "bridge/pipewire/graph/Objects.h"
-#include "bridge/pipewire/report/Reporter.h"
 
 #include <functional>
 

@@ -1,5 +1,8 @@
 #include "bridge/pipewire/report/StreamSessions.h"
 
+#include "bridge/pipewire/report/Application.h"
+#include "bridge/pipewire/report/StreamSettings.h"
+
 #include <algorithm>
 #include <utility>
 
@@ -58,48 +61,33 @@ void StreamSessions::streamChanged(ObjectID stream) {
 
 /// A sink's volume, a filter's links: any stream may be concerned.
 void StreamSessions::othersChanged() {
-    for (const auto& [stream, session] : live_) {
-        streamChanged(stream);
+    for (const auto& [stream, session] : pool_.live()) {
+        streamChanged(static_cast<ObjectID>(stream));
     }
 }
 
 void StreamSessions::streamRemoved(ObjectID stream) {
-    const Moment now = clock_.now();
     // One that came and went within the settling time is reported all the same.
     if (const auto changed = changed_.find(stream); changed != changed_.end()) {
         const Moment since = changed->second;
         changed_.erase(changed);
-        if (!live_.contains(stream)) {
+        if (!pool_.contains(stream)) {
             look(stream, since);
         }
     }
-    const auto found = live_.find(stream);
-    if (found == live_.end()) {
-        return;
-    }
-    found->second.stopStream(now);
-    if (found->second.id() != kNoSession) {
-        waiting_.push_back({std::move(found->second), stream, now.steady + kGrace});
-    }
-    live_.erase(found);
+    pool_.leave(stream, clock_.now());
 }
 
 std::optional<SteadyTime> StreamSessions::due() const {
-    if (waiting_.empty()) {
-        return settlesAt_;
-    }
-    return settlesAt_ ? std::min(*settlesAt_, waiting_.front().until) : waiting_.front().until;
+    const std::optional<SteadyTime> ofPool = pool_.due();
+    return settlesAt_ && ofPool ? std::min(*settlesAt_, *ofPool) : settlesAt_ ? settlesAt_ : ofPool;
 }
 
 void StreamSessions::run() {
-    const Moment now = clock_.now();
-    if (settlesAt_ && *settlesAt_ <= now.steady) {
+    if (settlesAt_ && *settlesAt_ <= clock_.now().steady) {
         settle();
     }
-    while (!waiting_.empty() && waiting_.front().until <= now.steady) {
-        waiting_.front().session.end(now);
-        waiting_.pop_front();
-    }
+    pool_.run();
 }
 
 void StreamSessions::settle() {
@@ -111,7 +99,11 @@ void StreamSessions::settle() {
 
 void StreamSessions::look(ObjectID stream, const Moment& at) {
     const Node* const node = graph_.node(stream);
-    StreamSession* const session = node != nullptr && isReported(*node) ? sessionFor(stream) : nullptr;
+    if (node == nullptr || !isReported(*node)) {
+        return;
+    }
+    StreamSession* const known = pool_.find(stream);
+    StreamSession* const session = known != nullptr ? known : pool_.sessionFor(stream, kindOf(*node));
     if (session != nullptr) {
         session->update(settingsOf(graph_, stream), at);
     }
@@ -123,66 +115,18 @@ StreamKind StreamSessions::kindOf(const Node& stream) const {
     return {std::move(application), serviceType, stream.mediaClass == MediaClass::captureStream};
 }
 
-StreamSession* StreamSessions::sessionFor(ObjectID stream) {
-    if (const auto found = live_.find(stream); found != live_.end()) {
-        return &found->second;
-    }
-    const StreamKind kind = kindOf(*graph_.node(stream));
-    // The one that ended last: a player that goes on, rather than one that was closed before.
-    const auto last = std::find_if(waiting_.rbegin(), waiting_.rend(), [&kind](const Waiting& waiting) {
-        return waiting.session.kind() == kind;
-    });
-    if (last != waiting_.rend()) {
-        const auto place = std::prev(last.base());
-        StreamSession& session = live_.emplace(stream, std::move(place->session)).first->second;
-        waiting_.erase(place);
-        return &session;
-    }
-    if (count() >= kMostSessions && !waiting_.empty()) {
-        waiting_.front().session.end(clock_.now());
-        waiting_.pop_front();
-    }
-    if (count() >= kMostSessions) {
-        ++leftOut_;
-        return nullptr;
-    }
-    return &live_.emplace(stream, StreamSession(reporter_, kind)).first->second;
-}
-
 void StreamSessions::reporterCame() {
-    for (const auto& [stream, session] : live_) {
-        streamChanged(stream);
-    }
+    othersChanged();
 }
 
 void StreamSessions::reporterWent() {
-    waiting_.clear();
-    for (auto& [stream, session] : live_) {
-        session.forget();
-    }
+    pool_.forget();
 }
 
 void StreamSessions::endAll() {
-    const Moment now = clock_.now();
-    for (Waiting& waiting : waiting_) {
-        waiting.session.end(now);
-    }
-    for (auto& [stream, session] : live_) {
-        session.end(now);
-    }
-    waiting_.clear();
-    live_.clear();
+    pool_.endAll();
     changed_.clear();
     settlesAt_.reset();
-}
-
-SessionID StreamSessions::sessionOf(ObjectID stream) const noexcept {
-    if (const auto found = live_.find(stream); found != live_.end()) {
-        return found->second.id();
-    }
-    const auto ended = std::find_if(waiting_.rbegin(), waiting_.rend(),
-                                    [stream](const Waiting& waiting) { return waiting.stream == stream; });
-    return ended == waiting_.rend() ? kNoSession : ended->session.id();
 }
 
 } // namespace tamblo::pipewire

@@ -1,18 +1,16 @@
 #pragma once
 
+#include "bridge/common/Reporter.h"
+#include "bridge/common/ServiceTypes.h"
+#include "bridge/common/SessionPool.h"
+#include "bridge/common/Time.h"
 #include "bridge/pipewire/graph/Graph.h"
-#include "bridge/pipewire/report/Reporter.h"
-#include "bridge/pipewire/report/ServiceTypes.h"
-#include "bridge/pipewire/report/StreamSession.h"
-#include "bridge/pipewire/report/Time.h"
 
 #include <chrono>
 #include <cstddef>
 #include <cstdint>
-#include <list>
 #include <optional>
 #include <unordered_map>
-#include <vector>
 
 namespace tamblo::pipewire {
 
@@ -27,12 +25,11 @@ namespace tamblo::pipewire {
 class StreamSessions final : public GraphObserver, public ReporterListener, public Timed {
 public:
     static constexpr std::chrono::milliseconds kSettling{60};
-    static constexpr std::chrono::seconds kGrace{4};
-    /// Sessions at a time; streams beyond that are not reported until others have ended.
-    static constexpr std::size_t kMostSessions = 2048;
+    static constexpr std::chrono::seconds kGrace = SessionPool::kGrace;
+    static constexpr std::size_t kMostSessions = SessionPool::kMostSessions;
 
     StreamSessions(const Graph& graph, Reporter& reporter, const Clock& clock, const ServiceTypes& types)
-        : graph_(graph), reporter_(reporter), clock_(clock), types_(types) {}
+        : graph_(graph), clock_(clock), types_(types), pool_(reporter, clock) {}
 
     void graphChanged(const GraphEvent& event) override;
     void reporterCame() override;
@@ -48,36 +45,25 @@ public:
 
     /// A stream's session, to report of it what goes wrong, or has gone wrong just before its end;
     /// `kNoSession` while there is none.
-    [[nodiscard]] SessionID sessionOf(ObjectID stream) const noexcept;
-    [[nodiscard]] std::size_t count() const noexcept { return live_.size() + waiting_.size(); }
+    [[nodiscard]] SessionID sessionOf(ObjectID stream) const noexcept { return pool_.idOf(stream); }
+    [[nodiscard]] std::size_t count() const noexcept { return pool_.count(); }
     /// How often a stream was not reported, as there were too many.
-    [[nodiscard]] std::uint64_t leftOut() const noexcept { return leftOut_; }
+    [[nodiscard]] std::uint64_t leftOut() const noexcept { return pool_.leftOut(); }
 
 private:
-    /// A session between two streams.
-    struct Waiting {
-        StreamSession session;
-        ObjectID stream; ///< the one that has ended
-        SteadyTime until;
-    };
-
     void streamChanged(ObjectID stream);
     void streamRemoved(ObjectID stream);
     void othersChanged();
     void look(ObjectID stream, const Moment& at);
-    [[nodiscard]] StreamSession* sessionFor(ObjectID stream);
     [[nodiscard]] StreamKind kindOf(const Node& stream) const;
 
     const Graph& graph_;
-    Reporter& reporter_;
     const Clock& clock_;
     const ServiceTypes& types_;
-    std::unordered_map<ObjectID, StreamSession> live_;
-    std::list<Waiting> waiting_; ///< the one that waits longest comes first
+    SessionPool pool_;
     /// The streams that have changed, each with the time of its first change.
     std::unordered_map<ObjectID, Moment> changed_;
     std::optional<SteadyTime> settlesAt_;
-    std::uint64_t leftOut_ = 0;
 };
 
 } // namespace tamblo::pipewire

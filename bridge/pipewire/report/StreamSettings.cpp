@@ -1,12 +1,10 @@
 #include "bridge/pipewire/report/StreamSettings.h"
 
-#include "base/Format.h"
-#include "bridge/pipewire/graph/CleanText.h"
+#include "bridge/common/CleanText.h"
 #include "bridge/pipewire/graph/Routes.h"
 
 #include <algorithm>
 #include <array>
-#include <cctype>
 #include <charconv>
 #include <cmath>
 #include <set>
@@ -30,42 +28,6 @@ std::string joined(const std::set<std::string>& texts) {
         list += text;
     }
     return list;
-}
-
-/// Six digits are more than anybody sees of a volume; the rest is noise of the arithmetic.
-double rounded(double value) noexcept {
-    constexpr double digits = 1e6;
-    return std::round(value * digits) / digits;
-}
-
-std::string upperCase(std::string_view text) {
-    std::string upper(text);
-    std::transform(upper.begin(), upper.end(), upper.begin(),
-                   [](unsigned char byte) { return static_cast<char>(std::toupper(byte)); });
-    return upper;
-}
-
-std::string channelsText(std::uint32_t channels) {
-    switch (channels) {
-    case 1:
-        return "mono";
-    case 2:
-        return "stereo";
-    case 6:
-        return "5.1";
-    case 8:
-        return "7.1";
-    default:
-        return formatted("{} channels", channels);
-    }
-}
-
-void setFormat(Dictionary& settings, const Format& format) {
-    settings.set("session_selected_format", formatted("{} {} Hz {}", upperCase(format.codec), format.rate,
-                                                      channelsText(format.channels)));
-    settings.set("mFormatID", format.codec);
-    settings.set("mChannelsPerFrame", format.channels);
-    settings.set("sample_rate", format.rate);
 }
 
 /// "1024/48000", in seconds.
@@ -192,10 +154,6 @@ void setInput(Dictionary& settings, const DeviceSettings& devices, const std::st
 
 } // namespace
 
-double perceivedVolume(double linear) noexcept {
-    return std::isfinite(linear) ? std::clamp(std::cbrt(linear), 0.0, 1.0) : 0.0;
-}
-
 StreamSettings settingsOf(const Graph& graph, ObjectID stream) {
     StreamSettings now;
     const Node* const node = graph.node(stream);
@@ -219,7 +177,7 @@ StreamSettings settingsOf(const Graph& graph, ObjectID stream) {
     settings.set("filters", filters.names());
     settings.set("spatializationEnabled", filters.hasSpatial());
     if (node->format) {
-        setFormat(settings, *node->format);
+        setFormat(settings, node->format->codec, node->format->rate, node->format->channels);
         settings.set("is_resampled", devices.rate() != 0 && devices.rate() != node->format->rate);
     }
     if (devices.rate() != 0) {
@@ -235,17 +193,6 @@ StreamSettings settingsOf(const Graph& graph, ObjectID stream) {
         setInput(settings, devices, filters.names());
     }
     return now;
-}
-
-Dictionary changesBetween(const Dictionary& before, const Dictionary& now) {
-    Dictionary changes;
-    for (std::size_t i = 0; i < now.size(); ++i) {
-        const Value* const old = before.find(now.keyAt(i));
-        if (old == nullptr || !(*old == now.valueAt(i))) {
-            changes.set(now.keyAt(i), now.valueAt(i));
-        }
-    }
-    return changes;
 }
 
 } // namespace tamblo::pipewire

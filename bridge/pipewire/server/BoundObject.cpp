@@ -1,6 +1,6 @@
 #include "bridge/pipewire/server/BoundObject.h"
 
-#include "bridge/pipewire/graph/CleanText.h"
+#include "bridge/common/CleanText.h"
 #include "bridge/pipewire/graph/Properties.h"
 #include "bridge/pipewire/server/Pods.h"
 #include "bridge/pipewire/server/Proxy.h"

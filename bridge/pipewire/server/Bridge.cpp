@@ -15,6 +15,7 @@ using std::chrono::milliseconds;
 
 namespace {
 
+constexpr std::string_view kPreferencesDomain = "com.vandra.tamblo.pipewire";
 /// How long the program's end may take.
 constexpr milliseconds kFarewell{1000};
 /// How long `--once` waits for a server that is connected, and says nothing.
@@ -42,7 +43,7 @@ Bridge::Bridge(const Options& options, const wire::Directories& directories)
       server_(loop_, graph_),
       serverPlace_{Endpoint(SoundServer::socketPath(), clock_)},
       servicePlace_{Endpoint(directories.socketFile(), clock_)},
-      preferences_(PreferenceFile::of(directories.preferences(), ServiceTypes::kDomain)),
+      preferences_(PreferenceFile::of(directories.preferences(), kPreferencesDomain)),
       preferencesWatcher_(directories.preferences()) {
     graph_.addObserver(streams_);
     graph_.addObserver(device_);

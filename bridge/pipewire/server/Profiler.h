@@ -1,8 +1,8 @@
 #pragma once
 
+#include "bridge/common/Time.h"
 #include "bridge/pipewire/graph/Cycle.h"
 #include "bridge/pipewire/graph/Graph.h"
-#include "bridge/pipewire/report/Time.h"
 
 #include <chrono>
 #include <cstddef>

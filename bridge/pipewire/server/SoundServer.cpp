@@ -1,7 +1,7 @@
 #include "bridge/pipewire/server/SoundServer.h"
 
 #include "base/Format.h"
-#include "bridge/pipewire/graph/CleanText.h"
+#include "bridge/common/CleanText.h"
 #include "bridge/pipewire/graph/Properties.h"
 #include "bridge/pipewire/server/Context.h"
 #include "bridge/pipewire/server/Proxy.h"

@@ -1,4 +1,4 @@
-#include "bridge/pipewire/graph/CleanText.h"
+#include "bridge/common/CleanText.h"
 #include "bridge/pipewire/graph/Routes.h"
 #include "bridge/pipewire/tests/World.h"
 

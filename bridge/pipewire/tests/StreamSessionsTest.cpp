@@ -1,3 +1,4 @@
+#include "bridge/pipewire/report/Application.h"
 #include "bridge/pipewire/report/StreamSessions.h"
 #include "bridge/pipewire/tests/World.h"
 

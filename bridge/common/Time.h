@@ -1,5 +1,7 @@
 #pragma once
 
+#include "bridge/common/Namespace.h"
+
 #include <chrono>
 #include <optional>
 

@@ -1,4 +1,4 @@
-#include "bridge/pipewire/report/StreamSession.h"
+#include "bridge/common/StreamSession.h"
 
 #include <chrono>
 #include <utility>

@@ -1,6 +1,6 @@
 #pragma once
 
-#include "bridge/pipewire/report/Reporter.h"
+#include "bridge/common/Reporter.h"
 #include "client/Client.h"
 
 #include <cstddef>

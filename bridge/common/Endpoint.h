@@ -1,6 +1,6 @@
 #pragma once
 
-#include "bridge/pipewire/report/Time.h"
+#include "bridge/common/Time.h"
 #include "os/DirectoryWatcher.h"
 
 #include <chrono>

@@ -1,7 +1,7 @@
 #pragma once
 
 #include "base/Dictionary.h"
-#include "bridge/pipewire/report/Time.h"
+#include "bridge/common/Time.h"
 #include "client/Vocabulary.h"
 
 #include <cstdint>

@@ -1,8 +1,7 @@
 #pragma once
 
 #include "base/Dictionary.h"
-#include "bridge/pipewire/graph/Objects.h"
-#include "bridge/pipewire/report/Reporter.h"
+#include "bridge/common/Reporter.h"
 
 #include <string>
 #include <string_view>
@@ -16,8 +15,7 @@ namespace tamblo::pipewire {
 /// regard to case; what is no role is generic.
 class ServiceTypes {
 public:
-    /// The preferences domain, and its keys: objects of service types' names by role, and by application.
-    static constexpr std::string_view kDomain = "com.vandra.tamblo.pipewire";
+    /// The keys of a program's preferences: objects of service types' names by role, and by application.
     static constexpr std::string_view kByRole = "service_types";
     static constexpr std::string_view kByApplication = "service_types_of_applications";
     /// What the preferences call the role of a stream that says none.
@@ -34,9 +32,5 @@ private:
     Types byRole_;
     Types byApplication_;
 };
-
-/// What an application is reported as: its identifier, else the binary, else its name, each as the stream
-/// says it or else its client. "Unknown" without any.
-[[nodiscard]] std::string applicationOf(const Node& stream, const Client* client);
 
 } // namespace tamblo::pipewire

@@ -1,4 +1,4 @@
-#include "bridge/pipewire/graph/CleanText.h"
+#include "bridge/common/CleanText.h"
 
 #include "base/Utf8.h"
 

@@ -1,4 +1,4 @@
-#include "bridge/pipewire/report/ServiceReporter.h"
+#include "bridge/common/ServiceReporter.h"
 
 #include "os/RandomNumber.h"
 

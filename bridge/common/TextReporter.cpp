@@ -1,4 +1,4 @@
-#include "bridge/pipewire/report/TextReporter.h"
+#include "bridge/common/TextReporter.h"
 
 #include "base/Format.h"
 #include "base/Json.h"

@@ -1,5 +1,7 @@
 #pragma once
 
+#include "bridge/common/Namespace.h"
+
 #include <cstddef>
 #include <string>
 #include <string_view>
@@ -9,7 +11,7 @@ namespace tamblo::pipewire {
 /// Bytes of a text in the model at most.
 inline constexpr std::size_t kMostTextBytes = 128;
 
-/// A text of the sound server as reports may have it: well-formed UTF-8 without control characters, cut, and
+/// A text of others as reports may have it: well-formed UTF-8 without control characters, cut, and
 /// with "?" for what was not readable. Addresses of devices, six pairs of hexadecimal digits with a ":", "_"
 /// or "-" between, are taken out wherever they stand: a headset without a name is called by its address.
 [[nodiscard]] std::string cleanText(std::string_view text, std::size_t mostBytes = kMostTextBytes);

@@ -1,11 +1,11 @@
 #pragma once
 
-#include "bridge/pipewire/graph/Graph.h"
-#include "bridge/pipewire/report/Reporter.h"
-#include "bridge/pipewire/report/StreamSettings.h"
+#include "bridge/common/Reporter.h"
+#include "bridge/common/Settings.h"
 
 #include <optional>
 #include <string>
+#include <utility>
 
 namespace tamblo::pipewire {
 

@@ -1,4 +1,4 @@
-#include "bridge/pipewire/report/ServiceTypes.h"
+#include "bridge/common/ServiceTypes.h"
 
 #include "base/Format.h"
 
@@ -81,19 +81,6 @@ std::vector<std::string> ServiceTypes::setPreferences(const Dictionary& preferen
     byRole_ = read(kByRole, true);
     byApplication_ = read(kByApplication, false);
     return faults;
-}
-
-std::string applicationOf(const Node& stream, const Client* client) {
-    const ApplicationNames none;
-    const ApplicationNames& own = stream.application;
-    const ApplicationNames& clients = client == nullptr ? none : client->application;
-    for (const std::string* const name : {&clients.portal, &own.identifier, &clients.identifier, &own.binary,
-                                          &clients.binary, &own.name, &clients.name}) {
-        if (!name->empty()) {
-            return *name;
-        }
-    }
-    return "Unknown";
 }
 
 } // namespace tamblo::pipewire

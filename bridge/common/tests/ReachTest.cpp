@@ -1,6 +1,6 @@
-#include "bridge/pipewire/report/Endpoint.h"
-#include "bridge/pipewire/report/ServiceReporter.h"
-#include "bridge/pipewire/tests/World.h"
+#include "bridge/common/Endpoint.h"
+#include "bridge/common/ServiceReporter.h"
+#include "bridge/common/tests/KeptReports.h"
 #include "tests/Files.h"
 #include "tests/Sockets.h"
 
@@ -11,7 +11,7 @@ namespace {
 
 using namespace std::chrono_literals;
 
-TEST(PipeWireEndpoint, isTriedWhenItAppearsAndThenWithGrowingWaits) {
+TEST(BridgeEndpoint, isTriedWhenItAppearsAndThenWithGrowingWaits) {
     const TemporaryDirectory directory;
     test::HandClock clock;
     Endpoint place(directory.path("socket"), clock);
@@ -58,7 +58,7 @@ public:
     int went = 0;
 };
 
-TEST(PipeWireReporter, givesAServiceUpThatTakesNothing) {
+TEST(BridgeReporter, givesAServiceUpThatTakesNothing) {
     const TemporaryDirectory directory;
     ServiceReporter reporter(directory.path("socket"));
     ToldOfIt listener;

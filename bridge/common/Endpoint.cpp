@@ -1,4 +1,4 @@
-#include "bridge/pipewire/report/Endpoint.h"
+#include "bridge/common/Endpoint.h"
 
 #include <algorithm>
 

@@ -1,0 +1,181 @@
+#include "bridge/alsa/Bridge.h"
+
+#include <algorithm>
+#include <array>
+#include <chrono>
+#include <csignal>
+#include <cstdio>
+#include <cstdlib>
+#include <limits>
+#include <string_view>
+#include <variant>
+#include <vector>
+
+#include <poll.h>
+#include <sys/signalfd.h>
+#include <unistd.h>
+
+namespace tamblo::alsa {
+
+using std::chrono::milliseconds;
+
+namespace {
+
+constexpr std::string_view kPreferencesDomain = "com.vandra.tamblo.alsa";
+/// How long the program's end may take.
+constexpr milliseconds kFarewell{1000};
+
+void log(const std::string& line) {
+    std::fprintf(stderr, "tamblo-alsa: %s\n", line.c_str());
+}
+
+int endingSignals() {
+    sigset_t signals;
+    sigemptyset(&signals);
+    sigaddset(&signals, SIGTERM);
+    sigaddset(&signals, SIGINT);
+    return ::signalfd(-1, &signals, SFD_CLOEXEC | SFD_NONBLOCK);
+}
+
+} // namespace
+
+Bridge::Bridge(const Options& options, const wire::Directories& directories)
+    : options_(options),
+      files_(options.processes),
+      mixers_(options.devices),
+      text_(stdout),
+      service_(directories.socketFile()),
+      reporter_(options.isDry ? static_cast<bridge::Reporter&>(text_) : service_),
+      sessions_(files_, mixers_, reporter_, clock_, serviceTypes_),
+      servicePlace_(directories.socketFile(), clock_),
+      preferences_(PreferenceFile::of(directories.preferences(), kPreferencesDomain)),
+      preferencesWatcher_(directories.preferences()),
+      devices_(options.devices, DirectoryWatcher::Watch::use),
+      signals_(endingSignals()) {
+    service_.addListener(sessions_);
+}
+
+int Bridge::run() {
+    readPreferences();
+    if (const std::string fault = devices_.fault(); !fault.empty()) {
+        log(fault);
+    }
+    // The devices are watched already: what is opened from now on is told.
+    sessions_.nodeTouched(std::nullopt);
+    while (!status_) {
+        if (const auto due = sessions_.due(); due && *due <= clock_.now().steady) {
+            sessions_.run();
+        }
+        if (!options_.isDry && servicePlace_.due() && *servicePlace_.due() <= clock_.now().steady) {
+            reachService();
+        }
+        if (options_.once) {
+            takeSnapshot();
+        }
+        pump();
+        if (!status_) {
+            waitForSomething();
+        }
+    }
+    sessions_.endAll();
+    service_.finish(kFarewell);
+    return *status_;
+}
+
+void Bridge::readPreferences() {
+    if (!preferences_) {
+        return;
+    }
+    const auto read = preferences_->read();
+    if (const auto* const fault = std::get_if<std::string>(&read)) {
+        log(*fault);
+        return;
+    }
+    for (const std::string& fault : serviceTypes_.setPreferences(std::get<Dictionary>(read))) {
+        log(preferences_->path() + ": " + fault);
+    }
+}
+
+void Bridge::reachService() {
+    if (!service_.connect()) {
+        servicePlace_.failed();
+        return;
+    }
+    servicePlace_.connected();
+    log("reports to " + service_.socketPath());
+}
+
+void Bridge::pump() {
+    if (service_.isReachable() && !service_.pump()) {
+        log("the service has gone");
+        servicePlace_.lost();
+    }
+}
+
+/// Ends the program, when everything is said, or when it will not be.
+void Bridge::takeSnapshot() {
+    if (!files_.isThere()) {
+        log("there is no sound: " + options_.processes + "/asound is missing");
+        status_ = EXIT_FAILURE;
+    } else if (reporter_.isReachable()) {
+        status_ = EXIT_SUCCESS;
+    } else if (!servicePlace_.due()) {
+        log("the service does not answer at " + service_.socketPath());
+        status_ = EXIT_FAILURE;
+    }
+}
+
+std::optional<bridge::SteadyTime> Bridge::due() const {
+    const std::optional<bridge::SteadyTime> own = sessions_.due();
+    const std::optional<bridge::SteadyTime> service = options_.isDry ? std::nullopt : servicePlace_.due();
+    return own && service ? std::min(*own, *service) : own ? own : service;
+}
+
+void Bridge::waitForSomething() {
+    enum Place : std::size_t { signals, devices, preferences, service, mixers };
+    const auto reading = [](int descriptor) {
+        return pollfd{.fd = descriptor, .events = POLLIN, .revents = 0};
+    };
+    std::vector<pollfd> places(mixers);
+    places[signals] = reading(signals_.get());
+    places[devices] = reading(devices_.fileDescriptor());
+    places[preferences] = reading(preferencesWatcher_.fileDescriptor());
+    places[service] = reading(service_.isReachable() ? service_.descriptor()
+                              : options_.isDry       ? -1
+                                                     : servicePlace_.descriptor());
+    if (service_.wantsWriting()) {
+        places[service].events |= POLLOUT;
+    }
+    std::vector<int> descriptors;
+    sessions_.addDescriptors(descriptors);
+    std::ranges::transform(descriptors, std::back_inserter(places), reading);
+
+    int timeout = -1;
+    if (const auto wake = due()) {
+        const auto left = std::chrono::ceil<milliseconds>(*wake - clock_.now().steady).count();
+        timeout = static_cast<int>(std::clamp<std::int64_t>(left, 0, std::numeric_limits<int>::max()));
+    }
+    if (::poll(places.data(), places.size(), timeout) <= 0) {
+        return;
+    }
+    if (places[signals].revents != 0) {
+        status_ = EXIT_SUCCESS;
+    }
+    if (places[devices].revents != 0) {
+        devices_.read([this](auto node) { sessions_.nodeTouched(node); });
+    }
+    if (places[preferences].revents != 0) {
+        preferencesWatcher_.read([](auto) {});
+        readPreferences();
+    }
+    // What the service says when it is reached, is taken in before the next wait.
+    if (places[service].revents != 0 && !service_.isReachable()) {
+        servicePlace_.read();
+    }
+    if (std::any_of(places.begin() + mixers, places.end(),
+                    [](const pollfd& place) { return place.revents != 0; })) {
+        sessions_.readMixers();
+    }
+}
+
+} // namespace tamblo::alsa
