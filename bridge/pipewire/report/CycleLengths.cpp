@@ -20,7 +20,7 @@ void CycleLengths::cycleEnded(const Cycle& cycle) {
 void CycleLengths::cyclesRead() {
     for (const auto& [id, frames] : frames_) {
         if (graph_.node(id) != nullptr) {
-            graph_.changeNode(id, [frames = frames](Node& node) { node.quantum = frames; });
+            graph_.changeNode(id, [quantum = frames](Node& node) { node.quantum = quantum; });
         }
     }
     frames_.clear();
