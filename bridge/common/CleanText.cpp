@@ -4,7 +4,7 @@
 
 #include <algorithm>
 
-namespace tamblo::pipewire {
+namespace tamblo::bridge {
 
 namespace {
 
@@ -64,4 +64,4 @@ std::string cleanText(std::string_view text, std::size_t mostBytes) {
     return clean;
 }
 
-} // namespace tamblo::pipewire
+} // namespace tamblo::bridge

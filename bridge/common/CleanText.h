@@ -1,12 +1,10 @@
 #pragma once
 
-#include "bridge/common/Namespace.h"
-
 #include <cstddef>
 #include <string>
 #include <string_view>
 
-namespace tamblo::pipewire {
+namespace tamblo::bridge {
 
 /// Bytes of a text in the model at most.
 inline constexpr std::size_t kMostTextBytes = 128;
@@ -16,4 +14,4 @@ inline constexpr std::size_t kMostTextBytes = 128;
 /// or "-" between, are taken out wherever they stand: a headset without a name is called by its address.
 [[nodiscard]] std::string cleanText(std::string_view text, std::size_t mostBytes = kMostTextBytes);
 
-} // namespace tamblo::pipewire
+} // namespace tamblo::bridge

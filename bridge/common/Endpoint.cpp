@@ -4,7 +4,7 @@
 
 #include <unistd.h>
 
-namespace tamblo::pipewire {
+namespace tamblo::bridge {
 
 namespace {
 
@@ -67,4 +67,4 @@ void Endpoint::retry() {
     ++attempts_;
 }
 
-} // namespace tamblo::pipewire
+} // namespace tamblo::bridge

@@ -7,7 +7,7 @@
 #include <optional>
 #include <string>
 
-namespace tamblo::pipewire {
+namespace tamblo::bridge {
 
 /// When to try to reach somebody whose socket may not be there yet: at the start, when its file appears, and
 /// a few times more, with growing waits, while the file is there and nobody answers, as a server has its file
@@ -45,4 +45,4 @@ private:
     unsigned attempts_ = 0; ///< since there was reason to hope
 };
 
-} // namespace tamblo::pipewire
+} // namespace tamblo::bridge

@@ -7,7 +7,7 @@
 #include <cstdint>
 #include <string>
 
-namespace tamblo::pipewire {
+namespace tamblo::bridge {
 
 using client::EventCategory;
 using client::EventKind;
@@ -48,4 +48,4 @@ public:
     virtual void reporterWent() = 0;
 };
 
-} // namespace tamblo::pipewire
+} // namespace tamblo::bridge

@@ -5,7 +5,7 @@
 #include <array>
 #include <utility>
 
-namespace tamblo::pipewire {
+namespace tamblo::bridge {
 
 using std::chrono::milliseconds;
 
@@ -184,4 +184,4 @@ void ServiceReporter::end(SessionID session) {
     }
 }
 
-} // namespace tamblo::pipewire
+} // namespace tamblo::bridge

@@ -10,7 +10,7 @@
 #include <string>
 #include <vector>
 
-namespace tamblo::pipewire {
+namespace tamblo::bridge {
 
 /// Reports to the service through the client library, which is driven by this program's own loop: no second
 /// thread, and nothing here waits. What the service does not take at once stays in a queue; when that is full
@@ -74,4 +74,4 @@ private:
     bool hasOverflowed_ = false;
 };
 
-} // namespace tamblo::pipewire
+} // namespace tamblo::bridge

@@ -6,7 +6,7 @@
 #include <array>
 #include <utility>
 
-namespace tamblo::pipewire {
+namespace tamblo::bridge {
 
 namespace {
 
@@ -83,4 +83,4 @@ std::vector<std::string> ServiceTypes::setPreferences(const Dictionary& preferen
     return faults;
 }
 
-} // namespace tamblo::pipewire
+} // namespace tamblo::bridge

@@ -8,7 +8,7 @@
 #include <unordered_map>
 #include <vector>
 
-namespace tamblo::pipewire {
+namespace tamblo::bridge {
 
 /// Which service type a stream is reported under: by what its application is given in the preferences, else
 /// by its role, as the preferences or the table of `docs/pipewire.md` have it. Roles are compared without
@@ -33,4 +33,4 @@ private:
     Types byApplication_;
 };
 
-} // namespace tamblo::pipewire
+} // namespace tamblo::bridge

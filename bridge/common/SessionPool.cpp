@@ -4,7 +4,7 @@
 #include <iterator>
 #include <utility>
 
-namespace tamblo::pipewire {
+namespace tamblo::bridge {
 
 StreamSession* SessionPool::find(Key stream) {
     const auto found = live_.find(stream);
@@ -88,4 +88,4 @@ SessionID SessionPool::idOf(Key stream) const noexcept {
     return ended == waiting_.rend() ? kNoSession : ended->session.id();
 }
 
-} // namespace tamblo::pipewire
+} // namespace tamblo::bridge

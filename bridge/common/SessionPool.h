@@ -10,7 +10,7 @@
 #include <optional>
 #include <unordered_map>
 
-namespace tamblo::pipewire {
+namespace tamblo::bridge {
 
 /// The sessions that there are: one for each stream that lives, by its key, and those whose stream has ended.
 /// These wait a grace time for another stream of the same application, direction and service type, and go on
@@ -67,4 +67,4 @@ private:
     std::uint64_t leftOut_ = 0;
 };
 
-} // namespace tamblo::pipewire
+} // namespace tamblo::bridge

@@ -6,7 +6,7 @@
 #include <cctype>
 #include <cmath>
 
-namespace tamblo::pipewire {
+namespace tamblo::bridge {
 
 namespace {
 
@@ -62,4 +62,4 @@ Dictionary changesBetween(const Dictionary& before, const Dictionary& now) {
     return changes;
 }
 
-} // namespace tamblo::pipewire
+} // namespace tamblo::bridge

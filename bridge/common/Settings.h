@@ -1,13 +1,12 @@
 #pragma once
 
 #include "base/Dictionary.h"
-#include "bridge/common/Namespace.h"
 
 #include <cstdint>
 #include <string>
 #include <string_view>
 
-namespace tamblo::pipewire {
+namespace tamblo::bridge {
 
 /// What there is to say of a stream at a moment.
 struct StreamSettings {
@@ -31,4 +30,4 @@ void setFormat(Dictionary& settings, const std::string& codec, std::uint32_t rat
 /// The entries of `now` that `before` has not, or has with another value.
 [[nodiscard]] Dictionary changesBetween(const Dictionary& before, const Dictionary& now);
 
-} // namespace tamblo::pipewire
+} // namespace tamblo::bridge

@@ -3,7 +3,7 @@
 #include <chrono>
 #include <utility>
 
-namespace tamblo::pipewire {
+namespace tamblo::bridge {
 
 namespace {
 
@@ -104,4 +104,4 @@ void StreamSession::say(EventCategory category, EventType type, Dictionary paylo
     reporter_.send(id_, category, type, std::move(payload), at.wall);
 }
 
-} // namespace tamblo::pipewire
+} // namespace tamblo::bridge

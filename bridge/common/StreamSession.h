@@ -7,7 +7,7 @@
 #include <string>
 #include <utility>
 
-namespace tamblo::pipewire {
+namespace tamblo::bridge {
 
 /// What makes streams that follow each other one session.
 struct StreamKind {
@@ -53,4 +53,4 @@ private:
     std::int64_t messages_ = 0;
 };
 
-} // namespace tamblo::pipewire
+} // namespace tamblo::bridge

@@ -4,7 +4,7 @@
 #include "base/Json.h"
 #include "base/TextBuffer.h"
 
-namespace tamblo::pipewire {
+namespace tamblo::bridge {
 
 SessionID TextReporter::begin(ServiceType serviceType, const std::string& application) {
     write(formatted("session {}: begin, {}, of {}", ++last_, client::serviceTypeName(serviceType),
@@ -30,4 +30,4 @@ void TextReporter::write(const std::string& line) {
     std::fflush(out_);
 }
 
-} // namespace tamblo::pipewire
+} // namespace tamblo::bridge

@@ -4,7 +4,7 @@
 
 #include <cstdio>
 
-namespace tamblo::pipewire {
+namespace tamblo::bridge {
 
 /// Writes down what would be reported, a line for each step, for people.
 class TextReporter final : public Reporter {
@@ -24,4 +24,4 @@ private:
     SessionID last_ = kNoSession;
 };
 
-} // namespace tamblo::pipewire
+} // namespace tamblo::bridge

@@ -1,11 +1,9 @@
 #pragma once
 
-#include "bridge/common/Namespace.h"
-
 #include <chrono>
 #include <optional>
 
-namespace tamblo::pipewire {
+namespace tamblo::bridge {
 
 using SteadyTime = std::chrono::steady_clock::time_point;
 using WallTime = std::chrono::system_clock::time_point;
@@ -46,4 +44,4 @@ public:
     return std::chrono::duration<double>(time.time_since_epoch()).count();
 }
 
-} // namespace tamblo::pipewire
+} // namespace tamblo::bridge

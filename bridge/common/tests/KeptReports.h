@@ -7,7 +7,7 @@
 #include <utility>
 #include <vector>
 
-namespace tamblo::pipewire::test {
+namespace tamblo::bridge::test {
 
 class HandClock final : public Clock {
 public:
@@ -71,4 +71,4 @@ public:
     std::vector<Message> messages;
 };
 
-} // namespace tamblo::pipewire::test
+} // namespace tamblo::bridge::test

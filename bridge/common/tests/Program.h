@@ -6,7 +6,7 @@
 #include <string>
 #include <vector>
 
-namespace tamblo::pipewire::test {
+namespace tamblo::bridge::test {
 
 /// A program that is ended with its owner.
 class Program {
@@ -53,4 +53,4 @@ private:
     pid_t pid_ = -1;
 };
 
-} // namespace tamblo::pipewire::test
+} // namespace tamblo::bridge::test

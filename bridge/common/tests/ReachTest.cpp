@@ -6,7 +6,7 @@
 
 #include <gtest/gtest.h>
 
-namespace tamblo::pipewire {
+namespace tamblo::bridge {
 namespace {
 
 using namespace std::chrono_literals;
@@ -92,4 +92,4 @@ TEST(BridgeReporter, givesAServiceUpThatTakesNothing) {
 }
 
 } // namespace
-} // namespace tamblo::pipewire
+} // namespace tamblo::bridge

@@ -1,4 +1,5 @@
 #include "bridge/pipewire/graph/Properties.h"
+#include "bridge/pipewire/graph/Namespace.h"
 
 #include "base/Json.h"
 #include "bridge/common/CleanText.h"

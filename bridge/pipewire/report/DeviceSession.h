@@ -2,6 +2,7 @@
 
 #include "bridge/common/Reporter.h"
 #include "bridge/common/Time.h"
+#include "bridge/pipewire/graph/Namespace.h"
 #include "bridge/pipewire/graph/Graph.h"
 
 #include <chrono>

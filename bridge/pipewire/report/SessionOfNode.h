@@ -1,6 +1,7 @@
 #pragma once
 
 #include "bridge/common/Reporter.h"
+#include "bridge/pipewire/graph/Namespace.h"
 #include "bridge/pipewire/graph/Objects.h"
 
 #include <functional>

@@ -4,6 +4,7 @@
 #include "bridge/common/ServiceTypes.h"
 #include "bridge/common/SessionPool.h"
 #include "bridge/common/Time.h"
+#include "bridge/pipewire/graph/Namespace.h"
 #include "bridge/pipewire/graph/Graph.h"
 
 #include <chrono>

@@ -1,4 +1,5 @@
 #include "bridge/pipewire/report/StreamSettings.h"
+#include "bridge/pipewire/graph/Namespace.h"
 
 #include "bridge/common/CleanText.h"
 #include "bridge/pipewire/graph/Routes.h"

@@ -1,6 +1,7 @@
 #pragma once
 
 #include "bridge/common/Settings.h"
+#include "bridge/pipewire/graph/Namespace.h"
 #include "bridge/pipewire/graph/Graph.h"
 
 namespace tamblo::pipewire {

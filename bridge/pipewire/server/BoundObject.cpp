@@ -1,4 +1,5 @@
 #include "bridge/pipewire/server/BoundObject.h"
+#include "bridge/pipewire/graph/Namespace.h"
 
 #include "bridge/common/CleanText.h"
 #include "bridge/pipewire/graph/Properties.h"

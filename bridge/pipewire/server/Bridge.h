@@ -4,6 +4,7 @@
 #include "bridge/common/ServiceReporter.h"
 #include "bridge/common/ServiceTypes.h"
 #include "bridge/common/TextReporter.h"
+#include "bridge/pipewire/graph/Namespace.h"
 #include "bridge/pipewire/graph/Graph.h"
 #include "bridge/pipewire/report/ConnectedAccessories.h"
 #include "bridge/pipewire/report/CycleLengths.h"

@@ -1,6 +1,7 @@
 #pragma once
 
 #include "bridge/common/Time.h"
+#include "bridge/pipewire/graph/Namespace.h"
 
 #include <chrono>
 #include <cstdint>

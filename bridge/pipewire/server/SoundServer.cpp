@@ -1,4 +1,5 @@
 #include "bridge/pipewire/server/SoundServer.h"
+#include "bridge/pipewire/graph/Namespace.h"
 
 #include "base/Format.h"
 #include "bridge/common/CleanText.h"

@@ -1,4 +1,5 @@
 #include "bridge/common/CleanText.h"
+#include "bridge/pipewire/graph/Namespace.h"
 #include "bridge/pipewire/graph/Routes.h"
 #include "bridge/pipewire/tests/World.h"
 

@@ -1,6 +1,7 @@
 #pragma once
 
 #include "bridge/common/tests/Program.h"
+#include "bridge/pipewire/graph/Namespace.h"
 #include "tests/service/RealService.h"
 
 #include "base/Json.h"
@@ -17,6 +18,7 @@
 
 namespace tamblo::pipewire::test {
 
+using namespace bridge::test;
 using tamblo::test::contentOf;
 using tamblo::test::eventually;
 using tamblo::test::linesOf;

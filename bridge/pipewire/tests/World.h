@@ -1,6 +1,7 @@
 #pragma once
 
 #include "bridge/common/tests/KeptReports.h"
+#include "bridge/pipewire/graph/Namespace.h"
 #include "bridge/pipewire/graph/Graph.h"
 #include "bridge/pipewire/graph/Properties.h"
 
@@ -11,6 +12,8 @@
 #include <vector>
 
 namespace tamblo::pipewire::test {
+
+using namespace bridge::test;
 
 using Properties = std::initializer_list<std::pair<std::string_view, std::string_view>>;
 

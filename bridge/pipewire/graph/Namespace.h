@@ -2,9 +2,12 @@
 
 namespace tamblo {
 
-namespace pipewire {}
-
 /// What the programs share that feed the service from something that exists.
-namespace bridge = pipewire;
+namespace bridge {}
+
+/// The program that watches PipeWire.
+namespace pipewire {
+using namespace bridge;
+}
 
 } // namespace tamblo
