@@ -60,6 +60,7 @@ void PcmSessions::nodeTouched(std::optional<std::string_view> node) {
     for (const PcmName& name : names) {
         look(name, true);
     }
+    lookAgain();
 }
 
 void PcmSessions::lookAtAll() {
@@ -71,6 +72,15 @@ void PcmSessions::lookAtAll() {
     }
     for (const PcmName& name : names) {
         look(name, true);
+    }
+    lookAgain();
+}
+
+/// What was opened begins to run soon. And the kernel tells of a close before it carries it out, so that what
+/// was closed may have looked open yet.
+void PcmSessions::lookAgain() {
+    if (!open_.empty()) {
+        bringForward(nextLook_, clock_.now().steady + kSecondLook);
     }
 }
 
@@ -115,7 +125,6 @@ void PcmSessions::opened(const PcmName& name, const PcmStatus& status, const Mom
                 .lookedAt = now,
                 .changedAt = now};
     OpenPcm& added = open_.emplace(name, std::move(pcm)).first->second;
-    bringForward(nextLook_, now.steady + kFirstLook);
     changed(name, added, status, now);
 }
 
