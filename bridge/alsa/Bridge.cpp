@@ -60,6 +60,9 @@ int Bridge::run() {
     if (const std::string fault = devices_.fault(); !fault.empty()) {
         log(fault);
     }
+    if (!options_.once && !files_.isThere()) {
+        log("there is no sound yet: " + options_.processes + "/asound is missing");
+    }
     // The devices are watched already: what is opened from now on is told.
     sessions_.nodeTouched(std::nullopt);
     while (!status_) {
