@@ -43,31 +43,16 @@ PcmSessions::PcmSessions(const SoundFiles& files, Mixers& mixers, bridge::Report
       xruns_(reporter, clock, pool_) {}
 
 void PcmSessions::nodeTouched(std::optional<std::string_view> node) {
-    if (!node) {
-        lookAtAll();
+    const std::optional<PcmName> device = node ? deviceOfNode(*node) : std::nullopt;
+    if (node && !device) {
         return;
     }
-    const std::optional<PcmName> device = deviceOfNode(*node);
-    if (!device) {
-        return;
-    }
-    std::vector<PcmName> names = files_.ofDevice(*device);
+    // Those that are open may have lost their files.
+    const std::vector<PcmName> there = device ? files_.ofDevice(*device) : files_.all();
+    std::set<PcmName> names(there.begin(), there.end());
     for (const auto& [name, pcm] : open_) {
-        if (name.isOfSameDevice(*device) && std::ranges::find(names, name) == names.end()) {
-            names.push_back(name);
-        }
-    }
-    for (const PcmName& name : names) {
-        look(name, true);
-    }
-    lookAgain();
-}
-
-void PcmSessions::lookAtAll() {
-    std::vector<PcmName> names = files_.all();
-    for (const auto& [name, pcm] : open_) {
-        if (!std::ranges::binary_search(names, name)) {
-            look(name, true);
+        if (!device || name.isOfSameDevice(*device)) {
+            names.insert(name);
         }
     }
     for (const PcmName& name : names) {

@@ -67,7 +67,6 @@ private:
         bridge::Moment changedAt; ///< when its state was last another one
     };
 
-    void lookAtAll();
     void lookAgain();
     void look(const PcmName& name, bool isTouched);
     void opened(const PcmName& name, const PcmStatus& status, const bridge::Moment& now);

@@ -230,6 +230,15 @@ TEST_F(AlsaSessions, sayThatACardWasTakenAwayWhileItRan) {
     EXPECT_EQ(sessions_.openNumber(), 0U);
     pass(4s);
     EXPECT_TRUE(reports_.sessions.at(0).hasEnded);
+
+    // Everything at once, with the devices' directory.
+    tree_.pcm(kSpeaker);
+    open(kSpeaker);
+    open(kMicrophone);
+    tree_.remove(kSpeaker);
+    tree_.remove(kMicrophone);
+    sessions_.nodeTouched(std::nullopt);
+    EXPECT_EQ(sessions_.openNumber(), 0U);
 }
 
 TEST_F(AlsaSessions, sayTheVolumeOnceASliderRests) {

@@ -80,6 +80,14 @@ TEST_F(AlsaProgram, hasTheServiceSumUpAStretchAndIsWokenByNothingElse) {
     std::this_thread::sleep_for(2s);
     EXPECT_EQ(wakesOf(program.pid()), before) << "while nothing is open";
 
+    const auto beginning = std::chrono::steady_clock::now();
+    for (int i = 0; i < 3000; ++i) {
+        const FileDescriptor other(::open((tree_.devices() + "/pcmC0D0c").c_str(), O_RDONLY | O_CREAT, 0600));
+    }
+    std::this_thread::sleep_for(100ms);
+    EXPECT_LE(wakesOf(program.pid()) - before, (std::chrono::steady_clock::now() - beginning) / 10ms)
+        << "however often it is opened";
+
     FileDescriptor device = open();
     ASSERT_TRUE(eventually([&] { return !line("Session_Setup.Setup").empty(); })) << contentOf(log());
     run();
