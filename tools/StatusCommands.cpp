@@ -44,7 +44,12 @@ ExitStatus showAll(const Arguments& arguments, std::string_view request, Render 
 }
 
 ExitStatus status(const Arguments& arguments) {
-    return showAll(arguments, "status", statusLines);
+    return showAll(arguments, "status", [&arguments](const StatusDocument& document) {
+        const auto clients = arguments.has("--json") ? std::variant<StatusDocument, Unreachable>()
+                                                     : StatusConnection(arguments).ask("clients");
+        const auto* const known = std::get_if<StatusDocument>(&clients);
+        return statusLines(document, known == nullptr ? StatusDocument{} : *known);
+    });
 }
 ExitStatus clients(const Arguments& arguments) {
     return showAll(arguments, "clients", clientLines);

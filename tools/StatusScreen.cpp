@@ -5,6 +5,10 @@
 #include "base/Rfc3339.h"
 #include "tools/Table.h"
 
+#include <algorithm>
+#include <functional>
+#include <map>
+#include <ranges>
 #include <utility>
 
 namespace tamblo::tools {
@@ -83,13 +87,35 @@ Table sinksTable(const StatusDocument& document) {
     return table;
 }
 
-void appendHead(std::vector<std::string>& lines, const StatusDocument& document) {
+/// The programs that are clients, those with the most processes first, as in ": player (3), tamblo-pipewire".
+std::string programsText(const StatusDocument& clients) {
+    constexpr std::size_t kMostPrograms = 8;
+    std::map<std::string, std::size_t> counts;
+    for (const Value& client : clients["clients"].arrayValue()) {
+        ++counts[textOf(client, "process")];
+    }
+    std::vector<std::pair<std::string, std::size_t>> programs(counts.begin(), counts.end());
+    std::ranges::stable_sort(programs, std::ranges::greater(), &std::pair<std::string, std::size_t>::second);
+    std::string text;
+    for (const auto& [name, number] : programs | std::views::take(kMostPrograms)) {
+        text += formatted("{}{}", text.empty() ? ": " : ", ", harmless(name, 32));
+        text += number > 1 ? formatted(" ({})", number) : "";
+    }
+    if (programs.size() > kMostPrograms) {
+        text += formatted(" and {} other programs", programs.size() - kMostPrograms);
+    }
+    return text;
+}
+
+void appendHead(std::vector<std::string>& lines, const StatusDocument& document,
+                const StatusDocument& clients) {
     const Value& all = document.value;
     lines.push_back(formatted("tamblod {}, up {} (pid {}, user {}), {} in memory", textOf(all, "version"),
                               durationText(numberOf(all, "uptime")), textOf(all, "pid"), textOf(all, "uid"),
                               bytesText(numberOf(all, "resident_bytes"))));
-    lines.push_back(formatted("{} clients, {} sessions, {} retained", textOf(all, "clients"),
-                              textOf(all, "sessions"), bytesText(numberOf(all, "retained_bytes"))));
+    lines.push_back(formatted("{} clients{}", textOf(all, "clients"), programsText(clients)));
+    lines.push_back(formatted("{} sessions, {} retained", textOf(all, "sessions"),
+                              bytesText(numberOf(all, "retained_bytes"))));
     lines.push_back(formatted(
         "messages: {} received, {} recorded, {} redundant, {} refused, {} lost; counted "
         "for {}",
@@ -125,9 +151,9 @@ std::string textOf(const Value& object, std::string_view name) {
     return found->isString() ? std::string(found->stringValue()) : jsonText(*found);
 }
 
-std::vector<std::string> statusLines(const StatusDocument& document) {
+std::vector<std::string> statusLines(const StatusDocument& document, const StatusDocument& clients) {
     std::vector<std::string> lines;
-    appendHead(lines, document);
+    appendHead(lines, document, clients);
     Table settings({{"SETTING"}, {"VALUE", Align::left, 60}, {"FROM", Align::left, 60}});
     for (const Value& setting : document["settings"].arrayValue()) {
         settings.add({textOf(setting, "name"), textOf(setting, "value"), textOf(setting, "source")});

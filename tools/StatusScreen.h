@@ -9,7 +9,10 @@ namespace tamblo::tools {
 
 // The documents of the status socket as lines for people.
 
-[[nodiscard]] std::vector<std::string> statusLines(const StatusDocument& document);
+/// `clients` is their document, by which the screen names the most frequent programs; empty where it is not
+/// known.
+[[nodiscard]] std::vector<std::string> statusLines(const StatusDocument& document,
+                                                   const StatusDocument& clients);
 [[nodiscard]] std::vector<std::string> clientLines(const StatusDocument& document);
 [[nodiscard]] std::vector<std::string> sessionLines(const StatusDocument& document);
 [[nodiscard]] std::vector<std::string> sessionDetailLines(const StatusDocument& document);

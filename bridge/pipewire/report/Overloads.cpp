@@ -31,7 +31,7 @@ double rounded(double value) noexcept {
 
 void Overloads::cycleEnded(const Cycle& cycle) {
     for (std::size_t i = 0; i < cycle.nodes.size(); ++i) {
-        Tally* const tally = tallyOf(cycle.nodes[i].node);
+        Tally* const tally = tallyOf(cycle.nodes[i]);
         if (tally == nullptr) {
             continue;
         }
@@ -43,7 +43,11 @@ void Overloads::cycleEnded(const Cycle& cycle) {
 }
 
 /// One that the graph has not, or not yet, cannot be reported.
-Overloads::Tally* Overloads::tallyOf(ObjectID node) {
+Overloads::Tally* Overloads::tallyOf(const NodeCycle& cycle) {
+    if (Tally* const replaced = replacedTallyOf(cycle); replaced != nullptr) {
+        return replaced;
+    }
+    const ObjectID node = cycle.node;
     if (const auto found = tallies_.find(node); found != tallies_.end()) {
         return &found->second;
     }
@@ -58,6 +62,14 @@ Overloads::Tally* Overloads::tallyOf(ObjectID node) {
                  : known->isStream() ? tally.application
                                      : filterName(*known);
     return &tallies_.emplace(node, std::move(tally)).first->second;
+}
+
+Overloads::Tally* Overloads::replacedTallyOf(const NodeCycle& cycle) {
+    const SteadyTime turn{std::chrono::nanoseconds(cycle.turn)};
+    const auto found = std::ranges::find_if(replaced_, [&cycle, turn](const Replaced& replaced) {
+        return replaced.node == cycle.node && turn <= replaced.tally.goneAt;
+    });
+    return found == replaced_.end() ? nullptr : &found->tally;
 }
 
 void Overloads::count(Tally& tally, const NodeCycle& node, const Cycle& cycle) {
@@ -103,7 +115,7 @@ void Overloads::take(Tally& tally, Row& row) {
 
 /// A row that the last reading ended with, and this one, too, is one of a node that hangs.
 void Overloads::ageRow(ObjectID node, Tally& tally) const {
-    const Node* const known = graph_.node(node);
+    const Node* const known = tally.goneAt ? nullptr : graph_.node(node);
     if (known == nullptr || known->state != NodeState::running) {
         tally.row = {};
     } else if (tally.row.wasThere) {
@@ -128,6 +140,9 @@ void Overloads::cyclesRead() {
     for (auto& [node, tally] : tallies_) {
         ageRow(node, tally);
     }
+    for (Replaced& replaced : replaced_) {
+        ageRow(replaced.node, replaced.tally);
+    }
     reportAll();
 }
 
@@ -135,15 +150,22 @@ void Overloads::reportAll() {
     const Moment now = clock_.now();
     due_.reset();
     for (auto entry = tallies_.begin(); entry != tallies_.end();) {
-        auto& [node, tally] = *entry;
-        const bool hasGone = tally.goneAt && now.steady - *tally.goneAt >= kAfterEnd;
-        if (tally.hasNews() && tally.saidAt && now.steady - *tally.saidAt < kInterval) {
-            bringForward(due_, *tally.saidAt + kInterval);
-        } else {
-            report(node, tally, now);
-        }
-        entry = hasGone ? tallies_.erase(entry) : std::next(entry);
+        const bool isOver = reportWhenDue(entry->first, entry->second, now);
+        entry = isOver ? tallies_.erase(entry) : std::next(entry);
     }
+    for (auto entry = replaced_.begin(); entry != replaced_.end();) {
+        const bool isOver = reportWhenDue(entry->node, entry->tally, now);
+        entry = isOver ? replaced_.erase(entry) : std::next(entry);
+    }
+}
+
+bool Overloads::reportWhenDue(ObjectID node, Tally& tally, const Moment& now) {
+    if (tally.hasNews() && tally.saidAt && now.steady - *tally.saidAt < kInterval) {
+        bringForward(due_, *tally.saidAt + kInterval);
+    } else {
+        report(node, tally, now);
+    }
+    return tally.goneAt && now.steady - *tally.goneAt >= kAfterEnd;
 }
 
 void Overloads::run() {
@@ -159,15 +181,18 @@ void Overloads::graphChanged(const GraphEvent& event) {
     if (found == tallies_.end()) {
         return;
     }
-    if (event.change == GraphEvent::Change::added) {
+    Tally& tally = found->second;
+    if (event.change == GraphEvent::Change::removed) {
+        tally.goneAt = clock_.now().steady;
+        tally.session = sessionOf_(event.id);
+    } else if (event.change == GraphEvent::Change::added) {
+        replaced_.push_back({.node = event.id, .tally = std::move(tally)});
         tallies_.erase(found);
-    } else if (event.change == GraphEvent::Change::removed) {
-        found->second.goneAt = clock_.now().steady;
     }
 }
 
 void Overloads::report(ObjectID node, Tally& tally, const Moment& now) {
-    const SessionID session = tally.hasNews() ? sessionOf_(node) : kNoSession;
+    const SessionID session = !tally.hasNews() ? kNoSession : tally.goneAt ? tally.session : sessionOf_(node);
     if (session != kNoSession) {
         const double mean = tally.counted == 0 ? 0 : tally.sumOfShares / tally.counted;
         Dictionary payload{{"node", tally.name},

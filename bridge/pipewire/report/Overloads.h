@@ -11,6 +11,7 @@
 #include <optional>
 #include <string>
 #include <unordered_map>
+#include <vector>
 
 namespace tamblo::pipewire {
 
@@ -22,12 +23,15 @@ namespace tamblo::pipewire {
 /// ones: nobody misses any sound then. So a row of cycles that a node was late for counts when the node has
 /// finished one after them, and had finished one before them; or when the row goes on for over a second.
 ///
+/// The cycles of a node are told of up to some seconds later, when it may have gone, and its number been
+/// given to another one: they are still counted as its own.
+///
 /// The loop's thread.
 class Overloads final : public CycleObserver, public GraphObserver, public Timed {
 public:
     static constexpr std::chrono::seconds kInterval{1};
     static constexpr std::chrono::seconds kCalm{10};
-    /// A node that has gone is still reported, if its session lasts: its last cycles are told of later.
+    /// A node that has gone is still reported for so long, if its session lasts.
     static constexpr std::chrono::seconds kAfterEnd{3};
     /// A node that has not been told of for so long, by the server's clock, begins to run anew.
     static constexpr std::chrono::nanoseconds kPause{std::chrono::milliseconds(250)};
@@ -69,16 +73,25 @@ private:
         std::optional<std::uint32_t> xrunsOfServer; ///< of a driver, when it was last told of
         std::optional<SteadyTime> saidAt;
         std::optional<SteadyTime> goneAt;
+        SessionID session = kNoSession; ///< of one that has gone
 
         [[nodiscard]] bool hasNews() const noexcept { return late != 0 || xruns != 0; }
+    };
+    /// What there is to say of a node whose number is another one's now.
+    struct Replaced {
+        ObjectID node = kNoObject;
+        Tally tally;
     };
 
     void count(Tally& tally, const NodeCycle& node, const Cycle& cycle);
     static void take(Tally& tally, Row& row);
     void ageRow(ObjectID node, Tally& tally) const;
     void reportAll();
+    /// Whether that was all that will be said of it.
+    bool reportWhenDue(ObjectID node, Tally& tally, const Moment& now);
     void countXruns(Tally& tally, const Cycle& cycle);
-    [[nodiscard]] Tally* tallyOf(ObjectID node);
+    [[nodiscard]] Tally* tallyOf(const NodeCycle& cycle);
+    [[nodiscard]] Tally* replacedTallyOf(const NodeCycle& cycle);
     void report(ObjectID node, Tally& tally, const Moment& now);
 
     const Graph& graph_;
@@ -86,6 +99,7 @@ private:
     const Clock& clock_;
     const SessionOfNode sessionOf_;
     std::unordered_map<ObjectID, Tally> tallies_;
+    std::vector<Replaced> replaced_; ///< the earliest first
     std::optional<SteadyTime> due_;
     std::int64_t issues_ = 0; ///< tells repeated ones apart, which the service would leave out
 };
