@@ -153,10 +153,10 @@ void Bridge::takeSnapshot() {
 }
 
 std::optional<bridge::SteadyTime> Bridge::due() const {
-    std::optional<bridge::SteadyTime> due;
-    for (const auto& time :
-         {sessions_.due(), devicesDue_, options_.isDry ? std::nullopt : servicePlace_.due()}) {
-        due = due && time ? std::min(*due, *time) : due ? due : time;
+    std::optional<bridge::SteadyTime> due = sessions_.due();
+    bridge::bringForward(due, devicesDue_);
+    if (!options_.isDry) {
+        bridge::bringForward(due, servicePlace_.due());
     }
     return due;
 }

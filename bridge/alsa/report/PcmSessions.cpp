@@ -26,10 +26,6 @@ Moment earlier(const Moment& moment, std::chrono::nanoseconds age) noexcept {
             moment.wall - std::chrono::duration_cast<bridge::WallTime::duration>(age)};
 }
 
-void bringForward(std::optional<SteadyTime>& due, std::optional<SteadyTime> time) {
-    due = due && time ? std::min(*due, *time) : due ? due : time;
-}
-
 } // namespace
 
 PcmSessions::PcmSessions(const SoundFiles& files, Mixers& mixers, bridge::Reporter& reporter,
@@ -65,7 +61,7 @@ void PcmSessions::nodeTouched(std::optional<std::string_view> node) {
 /// was closed may have looked open yet.
 void PcmSessions::lookAgain() {
     if (!open_.empty()) {
-        bringForward(nextLook_, clock_.now().steady + kSecondLook);
+        bridge::bringForward(nextLook_, clock_.now().steady + kSecondLook);
     }
 }
 
@@ -269,9 +265,9 @@ void PcmSessions::reporterWent() {
 
 std::optional<SteadyTime> PcmSessions::due() const {
     std::optional<SteadyTime> due = nextLook_;
-    bringForward(due, mixersSettle_);
-    bringForward(due, pool_.due());
-    bringForward(due, xruns_.due());
+    bridge::bringForward(due, mixersSettle_);
+    bridge::bringForward(due, pool_.due());
+    bridge::bringForward(due, xruns_.due());
     return due;
 }
 
