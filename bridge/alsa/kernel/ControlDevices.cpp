@@ -77,7 +77,7 @@ void ControlDevice::read() {
         }
     } while (bytes == static_cast<ssize_t>(sizeof events));
     // The card has gone.
-    isTold_ = isTold_ && (bytes >= 0 || errno == EAGAIN || errno == EINTR);
+    isTold_ = isTold_ && (bytes > 0 || (bytes < 0 && (errno == EAGAIN || errno == EINTR)));
 }
 
 std::optional<MixerVolume> ControlDevice::volume(bool isInput) {
