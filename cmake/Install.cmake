@@ -8,7 +8,7 @@ install(CODE "
     endif()")
 
 add_custom_target(tamblo_installed DEPENDS tamblo tamblo_static)
-foreach(target tamblod tambloctl tamblo-pipewire)
+foreach(target tamblod tambloctl tamblo-pipewire tamblo-alsa)
     if(TARGET ${target})
         add_dependencies(tamblo_installed ${target})
         install(TARGETS ${target} RUNTIME DESTINATION "${CMAKE_INSTALL_BINDIR}")
@@ -56,6 +56,13 @@ if(TARGET tamblo-pipewire)
         install(FILES packaging/tamblo-pipewire.${kind} DESTINATION "${CMAKE_INSTALL_PREFIX}/lib/${kind}.d"
             RENAME tamblo-pipewire.conf)
     endforeach()
+endif()
+# The bridge to ALSA, which is one for the whole system.
+if(TARGET tamblo-alsa)
+    configure_file(packaging/tamblo-alsa.service.in tamblo-alsa.service @ONLY)
+    install(FILES "${CMAKE_BINARY_DIR}/tamblo-alsa.service" DESTINATION "${CMAKE_INSTALL_PREFIX}/lib/systemd/system")
+    install(FILES packaging/tamblo-alsa.sysusers DESTINATION "${CMAKE_INSTALL_PREFIX}/lib/sysusers.d"
+        RENAME tamblo-alsa.conf)
 endif()
 # Manual pages and completion of command lines, made by the programs that are installed.
 install(CODE "

@@ -16,6 +16,8 @@ inline constexpr std::string_view kLimitsDomain = "com.vandra.tamblo.limits";
 inline constexpr std::string_view kCapturesDomain = "com.vandra.tamblo.zrreporting";
 /// That of tamblo-pipewire.
 inline constexpr std::string_view kPipeWireDomain = "com.vandra.tamblo.pipewire";
+/// That of tamblo-alsa.
+inline constexpr std::string_view kAlsaDomain = "com.vandra.tamblo.alsa";
 inline constexpr std::string_view kAccessoriesDomain = "com.vandra.tamblo.accessories";
 /// Another part of the device's, whose settings are reported.
 inline constexpr std::string_view ZRReportingMessageKeySpatialAudioAccessoryFeatureDomain =

@@ -53,6 +53,8 @@ std::vector<KnownPreference> makePreferences() {
         {kPipeWireDomain, "service_types", object, "read by tamblo-pipewire: names of service types by role"},
         {kPipeWireDomain, "service_types_of_applications", object,
          "the same by application, whatever the role"},
+        {kAlsaDomain, "service_types", object, "read by tamblo-alsa: {\"none\": name of a service type}"},
+        {kAlsaDomain, "service_types_of_applications", object, "names of service types by application"},
     };
     for (const LimitRow& row : kLimitRows) {
         all.push_back({kLimitsDomain, row.name, limit, formatted("{} ({})", row.what, defaultText(row))});

@@ -6,7 +6,9 @@
 #include <csignal>
 #include <cstdio>
 #include <cstdlib>
+#include <functional>
 #include <limits>
+#include <set>
 #include <string_view>
 #include <variant>
 #include <vector>
@@ -22,6 +24,8 @@ using std::chrono::milliseconds;
 namespace {
 
 constexpr std::string_view kPreferencesDomain = "com.vandra.tamblo.alsa";
+/// Between two readings of what was opened and closed, however often that happens.
+constexpr milliseconds kRest{20};
 /// How long the program's end may take.
 constexpr milliseconds kFarewell{1000};
 
@@ -60,9 +64,15 @@ int Bridge::run() {
     if (const std::string fault = devices_.fault(); !fault.empty()) {
         log(fault);
     }
+    if (!options_.once && !files_.isThere()) {
+        log("there is no sound yet: " + options_.processes + "/asound is missing");
+    }
     // The devices are watched already: what is opened from now on is told.
     sessions_.nodeTouched(std::nullopt);
     while (!status_) {
+        if (devicesDue_ && *devicesDue_ <= clock_.now().steady) {
+            readDevices();
+        }
         if (const auto due = sessions_.due(); due && *due <= clock_.now().steady) {
             sessions_.run();
         }
@@ -105,6 +115,23 @@ void Bridge::reachService() {
     log("reports to " + service_.socketPath());
 }
 
+/// A device that was opened and closed many times is looked at once.
+void Bridge::readDevices() {
+    std::set<std::string, std::less<>> touched;
+    bool mayBeAny = false;
+    devices_.read([&](std::optional<std::string_view> node) {
+        mayBeAny = mayBeAny || !node;
+        touched.emplace(node.value_or(""));
+    });
+    if (mayBeAny) {
+        sessions_.nodeTouched(std::nullopt);
+    } else {
+        std::ranges::for_each(touched, [this](const std::string& node) { sessions_.nodeTouched(node); });
+    }
+    devicesReadAt_ = clock_.now().steady;
+    devicesDue_.reset();
+}
+
 void Bridge::pump() {
     if (service_.isReachable() && !service_.pump()) {
         log("the service has gone");
@@ -126,9 +153,12 @@ void Bridge::takeSnapshot() {
 }
 
 std::optional<bridge::SteadyTime> Bridge::due() const {
-    const std::optional<bridge::SteadyTime> own = sessions_.due();
-    const std::optional<bridge::SteadyTime> service = options_.isDry ? std::nullopt : servicePlace_.due();
-    return own && service ? std::min(*own, *service) : own ? own : service;
+    std::optional<bridge::SteadyTime> due = sessions_.due();
+    bridge::bringForward(due, devicesDue_);
+    if (!options_.isDry) {
+        bridge::bringForward(due, servicePlace_.due());
+    }
+    return due;
 }
 
 void Bridge::waitForSomething() {
@@ -138,7 +168,7 @@ void Bridge::waitForSomething() {
     };
     std::vector<pollfd> places(mixers);
     places[signals] = reading(signals_.get());
-    places[devices] = reading(devices_.fileDescriptor());
+    places[devices] = reading(devicesDue_ ? -1 : devices_.fileDescriptor());
     places[preferences] = reading(preferencesWatcher_.fileDescriptor());
     places[service] = reading(service_.isReachable() ? service_.descriptor()
                               : options_.isDry       ? -1
@@ -162,7 +192,7 @@ void Bridge::waitForSomething() {
         status_ = EXIT_SUCCESS;
     }
     if (places[devices].revents != 0) {
-        devices_.read([this](auto node) { sessions_.nodeTouched(node); });
+        devicesDue_ = std::max(clock_.now().steady, devicesReadAt_ + kRest);
     }
     if (places[preferences].revents != 0) {
         preferencesWatcher_.read([](auto) {});

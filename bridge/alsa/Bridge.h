@@ -35,6 +35,7 @@ public:
 
 private:
     void readPreferences();
+    void readDevices();
     void reachService();
     /// Everything that was reported leaves.
     void pump();
@@ -55,6 +56,8 @@ private:
     std::optional<PreferenceFile> preferences_;
     DirectoryWatcher preferencesWatcher_;
     DirectoryWatcher devices_;
+    bridge::SteadyTime devicesReadAt_{};
+    std::optional<bridge::SteadyTime> devicesDue_; ///< when what was opened and closed is to be read
     FileDescriptor signals_;
     std::optional<int> status_; ///< when the program is to end
 };

@@ -39,6 +39,13 @@ public:
     virtual void run() = 0;
 };
 
+/// Has something due at that time, if it is not due before.
+inline void bringForward(std::optional<SteadyTime>& due, std::optional<SteadyTime> time) {
+    if (time && (!due || *time < *due)) {
+        due = time;
+    }
+}
+
 /// Seconds since 1970, as payloads have them.
 [[nodiscard]] inline double secondsSince1970(WallTime time) noexcept {
     return std::chrono::duration<double>(time.time_since_epoch()).count();

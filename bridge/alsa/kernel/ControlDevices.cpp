@@ -61,6 +61,7 @@ private:
     std::vector<Known> controls_;
     bool isTold_ = false;
     bool isListed_ = false;
+    bool hasNoVolume_ = false; ///< of any name
 };
 
 /// Which control has changed does not matter: who asks for the volume reads them all.
@@ -76,7 +77,7 @@ void ControlDevice::read() {
         }
     } while (bytes == static_cast<ssize_t>(sizeof events));
     // The card has gone.
-    isTold_ = isTold_ && (bytes >= 0 || errno == EAGAIN || errno == EINTR);
+    isTold_ = isTold_ && (bytes > 0 || (bytes < 0 && (errno == EAGAIN || errno == EINTR)));
 }
 
 std::optional<MixerVolume> ControlDevice::volume(bool isInput) {
@@ -88,11 +89,13 @@ std::optional<MixerVolume> ControlDevice::volume(bool isInput) {
         readValues(known);
         controls.push_back(known.control);
     }
-    return volumeOf(controls, isInput);
+    const std::optional<MixerVolume> volume = volumeOf(controls, isInput);
+    return !volume && hasNoVolume_ ? MixerVolume{} : volume;
 }
 
 void ControlDevice::list() {
     isListed_ = true;
+    hasNoVolume_ = false;
     controls_.clear();
     snd_ctl_elem_list list{};
     if (::ioctl(device_.get(), SNDRV_CTL_IOCTL_ELEM_LIST, &list) != 0) {
@@ -101,10 +104,12 @@ void ControlDevice::list() {
     std::vector<snd_ctl_elem_id> ids(std::min(list.count, kMostControls));
     list.space = static_cast<unsigned>(ids.size());
     list.pids = ids.data();
-    if (ids.empty() || ::ioctl(device_.get(), SNDRV_CTL_IOCTL_ELEM_LIST, &list) != 0) {
+    if (!ids.empty() && ::ioctl(device_.get(), SNDRV_CTL_IOCTL_ELEM_LIST, &list) != 0) {
         return;
     }
     ids.resize(std::min<std::size_t>(list.used, ids.size()));
+    hasNoVolume_ = std::ranges::none_of(
+        ids, [](const snd_ctl_elem_id& id) { return textOf(id.name).find("Volume") != std::string::npos; });
     for (const snd_ctl_elem_id& id : ids) {
         if (id.iface == SNDRV_CTL_ELEM_IFACE_MIXER && id.index == 0 && concernsVolume(textOf(id.name))) {
             describe(id);

@@ -21,7 +21,8 @@ public:
     [[nodiscard]] virtual int descriptor() const = 0;
     /// Takes in what has changed.
     virtual void read() = 0;
-    /// As it is at this moment; nothing for a card that has none.
+    /// As it is at this moment: that of a card without any volume leaves the signal as it is. Nothing when it
+    /// cannot be told.
     [[nodiscard]] virtual std::optional<MixerVolume> volume(bool isInput) = 0;
 };
 

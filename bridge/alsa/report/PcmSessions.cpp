@@ -26,10 +26,6 @@ Moment earlier(const Moment& moment, std::chrono::nanoseconds age) noexcept {
             moment.wall - std::chrono::duration_cast<bridge::WallTime::duration>(age)};
 }
 
-void bringForward(std::optional<SteadyTime>& due, std::optional<SteadyTime> time) {
-    due = due && time ? std::min(*due, *time) : due ? due : time;
-}
-
 } // namespace
 
 PcmSessions::PcmSessions(const SoundFiles& files, Mixers& mixers, bridge::Reporter& reporter,
@@ -43,34 +39,29 @@ PcmSessions::PcmSessions(const SoundFiles& files, Mixers& mixers, bridge::Report
       xruns_(reporter, clock, pool_) {}
 
 void PcmSessions::nodeTouched(std::optional<std::string_view> node) {
-    if (!node) {
-        lookAtAll();
+    const std::optional<PcmName> device = node ? deviceOfNode(*node) : std::nullopt;
+    if (node && !device) {
         return;
     }
-    const std::optional<PcmName> device = deviceOfNode(*node);
-    if (!device) {
-        return;
-    }
-    std::vector<PcmName> names = files_.ofDevice(*device);
+    // Those that are open may have lost their files.
+    const std::vector<PcmName> there = device ? files_.ofDevice(*device) : files_.all();
+    std::set<PcmName> names(there.begin(), there.end());
     for (const auto& [name, pcm] : open_) {
-        if (name.isOfSameDevice(*device) && std::ranges::find(names, name) == names.end()) {
-            names.push_back(name);
+        if (!device || name.isOfSameDevice(*device)) {
+            names.insert(name);
         }
     }
     for (const PcmName& name : names) {
         look(name, true);
     }
+    lookAgain();
 }
 
-void PcmSessions::lookAtAll() {
-    std::vector<PcmName> names = files_.all();
-    for (const auto& [name, pcm] : open_) {
-        if (!std::ranges::binary_search(names, name)) {
-            look(name, true);
-        }
-    }
-    for (const PcmName& name : names) {
-        look(name, true);
+/// What was opened begins to run soon. And the kernel tells of a close before it carries it out, so that what
+/// was closed may have looked open yet.
+void PcmSessions::lookAgain() {
+    if (!open_.empty()) {
+        bridge::bringForward(nextLook_, clock_.now().steady + kSecondLook);
     }
 }
 
@@ -115,7 +106,6 @@ void PcmSessions::opened(const PcmName& name, const PcmStatus& status, const Mom
                 .lookedAt = now,
                 .changedAt = now};
     OpenPcm& added = open_.emplace(name, std::move(pcm)).first->second;
-    bringForward(nextLook_, now.steady + kFirstLook);
     changed(name, added, status, now);
 }
 
@@ -275,9 +265,9 @@ void PcmSessions::reporterWent() {
 
 std::optional<SteadyTime> PcmSessions::due() const {
     std::optional<SteadyTime> due = nextLook_;
-    bringForward(due, mixersSettle_);
-    bringForward(due, pool_.due());
-    bringForward(due, xruns_.due());
+    bridge::bringForward(due, mixersSettle_);
+    bridge::bringForward(due, pool_.due());
+    bridge::bringForward(due, xruns_.due());
     return due;
 }
 

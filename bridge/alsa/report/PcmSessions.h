@@ -25,7 +25,8 @@ namespace tamblo::alsa {
 /// The loop's thread.
 class PcmSessions final : public bridge::ReporterListener, public bridge::Timed {
 public:
-    static constexpr std::chrono::milliseconds kFirstLook{100};
+    /// From an opening or a close to the second look.
+    static constexpr std::chrono::milliseconds kSecondLook{100};
     static constexpr std::chrono::seconds kInterval{1};
     /// Between looks while nothing has run for some time.
     static constexpr std::chrono::seconds kLongInterval{5};
@@ -66,7 +67,7 @@ private:
         bridge::Moment changedAt; ///< when its state was last another one
     };
 
-    void lookAtAll();
+    void lookAgain();
     void look(const PcmName& name, bool isTouched);
     void opened(const PcmName& name, const PcmStatus& status, const bridge::Moment& now);
     void changed(const PcmName& name, OpenPcm& pcm, const PcmStatus& status, const bridge::Moment& now);

@@ -38,6 +38,7 @@ Dictionary settingsOfPcm(const std::set<std::string>& devices, const std::option
     settings.set("active_devices", list);
     if (isInput) {
         settings.set("vp_config_input_port", list);
+        settings.set("vp_config_operation_mode", "none");
     }
     if (format) {
         bridge::setFormat(settings, codecOf(format->sample), format->rate, format->channels);

@@ -163,6 +163,17 @@ TEST_F(AlsaSessions, areOnesOfAProcessAndDirection) {
               "1 Session_Generic Stop, 3 Session_Setup Setup");
 }
 
+TEST_F(AlsaSessions, endSoonWhereTheKernelTellsOfACloseBeforeItIsCarriedOut) {
+    open(kSpeaker);
+    run(kSpeaker, 0);
+    pass(1500ms);
+    touch(kSpeaker);
+    tree_.close(kSpeaker);
+    pass(100ms);
+    EXPECT_EQ(sessions_.openNumber(), 0U);
+    EXPECT_NEAR(lengthOf(3), 1.5, 1e-9);
+}
+
 TEST_F(AlsaSessions, lookOnceASecondAndSeldomAtWhatDoesNotRun) {
     open(kSpeaker);
     run(kSpeaker, 0);
@@ -219,6 +230,15 @@ TEST_F(AlsaSessions, sayThatACardWasTakenAwayWhileItRan) {
     EXPECT_EQ(sessions_.openNumber(), 0U);
     pass(4s);
     EXPECT_TRUE(reports_.sessions.at(0).hasEnded);
+
+    // Everything at once, with the devices' directory.
+    tree_.pcm(kSpeaker);
+    open(kSpeaker);
+    open(kMicrophone);
+    tree_.remove(kSpeaker);
+    tree_.remove(kMicrophone);
+    sessions_.nodeTouched(std::nullopt);
+    EXPECT_EQ(sessions_.openNumber(), 0U);
 }
 
 TEST_F(AlsaSessions, sayTheVolumeOnceASliderRests) {

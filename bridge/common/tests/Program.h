@@ -1,5 +1,6 @@
 #pragma once
 
+#include "bridge/common/Namespace.h"
 #include "tests/service/RealService.h"
 
 #include <optional>

@@ -14,10 +14,6 @@ namespace {
 
 constexpr EventCategory kIO = client::category(EventKind::io);
 
-void bringForward(std::optional<SteadyTime>& due, SteadyTime time) {
-    due = due ? std::min(*due, time) : time;
-}
-
 /// A driver that begins its next cycle when only so much of one has passed begins anew, as when a stream
 /// comes to others that run: those were not given the time that they are due.
 constexpr double kEarly = 0.75;

@@ -18,10 +18,6 @@ bool isWatched(const Node& node) noexcept {
     return node.isStream() && node.isKnown && node.linkGroup.empty() && !node.isMonitor;
 }
 
-void bringForward(std::optional<SteadyTime>& due, SteadyTime time) {
-    due = due ? std::min(*due, time) : time;
-}
-
 bool holds(const std::vector<ObjectID>& ids, ObjectID id) noexcept {
     return std::find(ids.begin(), ids.end(), id) != ids.end();
 }

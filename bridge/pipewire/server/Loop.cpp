@@ -9,17 +9,6 @@
 
 namespace tamblo::pipewire {
 
-namespace {
-
-/// An earlier one, where there are two.
-void bringForward(std::optional<SteadyTime>& earliest, std::optional<SteadyTime> time) {
-    if (time && (!earliest || *time < *earliest)) {
-        earliest = time;
-    }
-}
-
-} // namespace
-
 Loop::Watch::~Watch() {
     pw_loop_destroy_source(loop_.get(), source_);
 }
