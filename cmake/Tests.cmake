@@ -86,7 +86,7 @@ if(TARGET tamblo-pipewire)
     file(GLOB pipewire_sources CONFIGURE_DEPENDS RELATIVE "${CMAKE_SOURCE_DIR}" bridge/pipewire/tests/*Test.cpp)
     tamblo_link_headers(bridge/pipewire/tests TRUE pipewire_tests_include)
     tamblo_tests(tamblo_pipewire_tests LABEL service SOURCES ${pipewire_sources}
-        LIBRARIES bridge/pipewire/report bridge/pipewire/graph bridge/common client wire os base)
+        LIBRARIES bridge/pipewire/server bridge/pipewire/report bridge/pipewire/graph bridge/common client wire os base)
     target_include_directories(tamblo_pipewire_tests PRIVATE "${pipewire_tests_include}" "${bridge_tests_include}")
     tamblo_program(tamblo_pipewire_streams SOURCES bridge/pipewire/tests/streams.cpp)
     target_link_libraries(tamblo_pipewire_streams PRIVATE tamblo_pipewire_library)

@@ -7,7 +7,6 @@
 #include <algorithm>
 #include <array>
 #include <cmath>
-#include <cstring>
 #include <string_view>
 #include <utility>
 
@@ -30,10 +29,19 @@ const spa_pod* valueOf(const spa_pod* object, std::uint32_t key) noexcept {
     return property == nullptr ? nullptr : &property->value;
 }
 
+/// The library does not look whether a text ends within its bytes.
+std::optional<std::string_view> stringIn(const spa_pod* value) noexcept {
+    if (value == nullptr || spa_pod_is_string(value) == 0) {
+        return std::nullopt;
+    }
+    const std::string_view bytes(static_cast<const char*>(SPA_POD_BODY_CONST(value)),
+                                 SPA_POD_BODY_SIZE(value));
+    const std::size_t end = bytes.find('\0');
+    return end == bytes.npos ? std::nullopt : std::optional(bytes.substr(0, end));
+}
+
 std::string textOf(const spa_pod* object, std::uint32_t key) {
-    const spa_pod* const value = valueOf(object, key);
-    const char* text = nullptr;
-    return value != nullptr && spa_pod_get_string(value, &text) == 0 ? cleanText(text) : std::string();
+    return cleanText(stringIn(valueOf(object, key)).value_or(""));
 }
 
 /// One that is a choice counts by its default, as the first of its values is.
@@ -43,9 +51,22 @@ std::uint32_t numberOf(const spa_pod* object, std::uint32_t key) noexcept {
     std::uint32_t kind = 0;
     if (value != nullptr && spa_pod_is_choice(value)) {
         value = spa_pod_get_values(value, &count, &kind);
+        value = count == 0 ? nullptr : value;
     }
     std::int32_t number = 0;
     return value != nullptr && spa_pod_get_int(value, &number) == 0 ? static_cast<std::uint32_t>(number) : 0;
+}
+
+/// The loudest channel's factor; 1 without channels. The library copies values of whatever size they say that
+/// they have.
+double loudestOf(const spa_pod* channels) noexcept {
+    std::array<float, SPA_AUDIO_MAX_CHANNELS> linear{};
+    std::uint32_t count = 0;
+    if (channels != nullptr && spa_pod_is_array(channels) != 0 &&
+        SPA_POD_ARRAY_VALUE_SIZE(channels) == sizeof(float)) {
+        count = spa_pod_copy_array(channels, SPA_TYPE_Float, linear.data(), SPA_AUDIO_MAX_CHANNELS);
+    }
+    return count == 0 ? 1.0 : static_cast<double>(*std::max_element(linear.begin(), linear.begin() + count));
 }
 
 std::string_view codecOf(std::uint32_t subtype) noexcept {
@@ -127,18 +148,11 @@ std::optional<Volume> volumeOf(const spa_pod* parameter) {
         return std::nullopt;
     }
     Volume volume;
-    std::array<float, SPA_AUDIO_MAX_CHANNELS> linear{};
-    const std::uint32_t count =
-        channels == nullptr
-            ? 0
-            : spa_pod_copy_array(channels, SPA_TYPE_Float, linear.data(), SPA_AUDIO_MAX_CHANNELS);
     float factor = 1;
     if (all != nullptr) {
         (void)spa_pod_get_float(all, &factor);
     }
-    const double loudest =
-        count == 0 ? 1.0 : static_cast<double>(*std::max_element(linear.begin(), linear.begin() + count));
-    const double product = loudest * static_cast<double>(factor);
+    const double product = loudestOf(channels) * static_cast<double>(factor);
     volume.linear = std::isfinite(product) ? std::clamp(product, 0.0, kMostLinear) : 0;
     bool isMuted = false;
     volume.isMuted = mute != nullptr && spa_pod_get_bool(mute, &isMuted) == 0 && isMuted;
@@ -171,14 +185,14 @@ std::optional<Route> routeOf(const spa_pod* parameter) {
     const std::uint32_t size = SPA_POD_BODY_SIZE(information);
     for (auto* item = static_cast<const spa_pod*>(body); spa_pod_is_inside(body, size, item);
          item = static_cast<const spa_pod*>(spa_pod_next(item))) {
-        const char* text = nullptr;
-        if (spa_pod_get_string(item, &text) < 0) {
+        const auto text = stringIn(item);
+        if (!text) {
             continue;
         }
         if (!isKey) {
-            takeProperty(route, key, text);
+            takeProperty(route, key, *text);
         }
-        key = text;
+        key = *text;
         isKey = !isKey;
     }
     return route;
