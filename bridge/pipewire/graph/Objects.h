@@ -73,7 +73,6 @@ struct Node {
     std::string description;
     std::string nick;
     std::string role;
-    std::string category;
     std::string latency; ///< frames and rate that it asks for, "1024/48000"
     /// What nodes have in common that are the two sides of one filter.
     std::string linkGroup;
@@ -101,7 +100,6 @@ struct Node {
 struct Route {
     bool isOutput = true;
     std::uint32_t end = 0; ///< the node's `endOfDevice`
-    std::string name;
     std::string description;
     std::string portType;
 
@@ -110,7 +108,6 @@ struct Route {
 
 struct Device {
     bool isKnown = false;
-    std::string name; ///< the server's own, free of addresses
     std::string description;
     std::string nick;
     std::string api; ///< "alsa", "bluez5"
@@ -136,7 +133,6 @@ struct Link {
 
 /// What the server says of itself, and what a session manager has set for all.
 struct Server {
-    std::string name;
     std::string version;
     std::string defaultSink; ///< names of nodes
     std::string defaultSource;

@@ -56,8 +56,7 @@ constexpr std::array<Field<ApplicationNames>, 4> kApplicationFields{{
     {"application.name", &ApplicationNames::name},
 }};
 
-constexpr std::array<Field<Device>, 8> kDeviceFields{{
-    {"device.name", &Device::name},
+constexpr std::array<Field<Device>, 7> kDeviceFields{{
     {"device.description", &Device::description},
     {"device.nick", &Device::nick},
     {"device.api", &Device::api},
@@ -68,10 +67,9 @@ constexpr std::array<Field<Device>, 8> kDeviceFields{{
 }};
 
 /// Of a stream, neither `node.description` nor `node.nick` nor `media.name` is taken: they carry titles.
-constexpr std::array<Field<Node>, 8> kNodeFields{{
+constexpr std::array<Field<Node>, 7> kNodeFields{{
     {"node.name", &Node::name},
     {"media.role", &Node::role},
-    {"media.category", &Node::category},
     {"node.latency", &Node::latency},
     {"node.link-group", &Node::linkGroup},
     {"api.bluez5.profile", &Node::bluetoothProfile},

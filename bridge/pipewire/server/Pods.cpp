@@ -171,7 +171,6 @@ std::optional<Route> routeOf(const spa_pod* parameter) {
     Route route;
     route.isOutput = side == SPA_DIRECTION_OUTPUT;
     route.end = numberOf(parameter, SPA_PARAM_ROUTE_device);
-    route.name = textOf(parameter, SPA_PARAM_ROUTE_name);
     route.description = textOf(parameter, SPA_PARAM_ROUTE_description);
 
     // A number, and then so many pairs of texts.

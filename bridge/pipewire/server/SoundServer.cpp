@@ -102,7 +102,6 @@ void SoundServer::disconnect() {
 
 void SoundServer::coreTold(void* data, const pw_core_info* info) {
     static_cast<SoundServer*>(data)->graph_.changeServer([info](Server& server) {
-        server.name = cleanText(info->name == nullptr ? "" : info->name);
         server.version = cleanText(info->version == nullptr ? "?" : info->version);
     });
 }

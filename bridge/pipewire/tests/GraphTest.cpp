@@ -166,8 +166,7 @@ TEST(PipeWireRoutes, nameDevicesAsPeopleDo) {
         takeProperty(device, "device.description", "Built-in Audio");
         takeProperty(device, "device.form-factor", "internal");
         takeProperty(device, "device.serial", "SERIAL123");
-        device.routes = {{true, 4, "analog-output-headphones", "Headphones", "headphones"},
-                         {false, 5, "analog-input-mic", "Microphone", "mic"}};
+        device.routes = {{true, 4, "Headphones", "headphones"}, {false, 5, "Microphone", "mic"}};
     });
     world.node(1, {{"media.class", "Audio/Sink"},
                    {"node.description", "Built-in Audio Analog Stereo"},

@@ -90,7 +90,7 @@ TEST(PipeWirePods, textsThatDoNotEndAreNone) {
     const spa_pod* const whole = route.finish();
     const auto read = routeOf(whole);
     ASSERT_TRUE(read);
-    EXPECT_EQ(*read, (Route{false, 3, "", "Headset", "headset"}));
+    EXPECT_EQ(*read, (Route{false, 3, "Headset", "headset"}));
     // The byte that ends it is another: what follows is not its own.
     static_cast<char*>(SPA_POD_BODY(route.bend(SPA_PARAM_ROUTE_description)))[7] = '!';
     EXPECT_EQ(routeOf(whole)->description, "");
