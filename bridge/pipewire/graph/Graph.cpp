@@ -93,10 +93,10 @@ std::span<const ObjectID> Graph::groupOf(const Node& node) const {
     return found == groups_.end() ? std::span<const ObjectID>() : found->second;
 }
 
-ObjectID Graph::nodeNamed(std::string_view name) const noexcept {
+ObjectID Graph::nodeNamed(NameHash name) const noexcept {
     const auto found =
-        name.empty() ? nodes_.end() : std::find_if(nodes_.begin(), nodes_.end(), [name](const auto& node) {
-            return node.second.name == name;
+        name == kNoName ? nodes_.end() : std::find_if(nodes_.begin(), nodes_.end(), [name](const auto& node) {
+            return node.second.nameHash == name;
         });
     return found == nodes_.end() ? kNoObject : found->first;
 }

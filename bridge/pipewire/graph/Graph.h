@@ -5,7 +5,6 @@
 #include <cstddef>
 #include <cstdint>
 #include <span>
-#include <string_view>
 #include <unordered_map>
 #include <vector>
 
@@ -25,7 +24,7 @@ struct GraphEvent {
 class GraphObserver {
 public:
     virtual ~GraphObserver() = default;
-    /// Called inside the change: take note, and do the work when it is due (`report/Timed.h`).
+    /// Called inside the change: take note, and do the work when it is due (`Timed`).
     virtual void graphChanged(const GraphEvent& event) = 0;
 };
 
@@ -85,8 +84,8 @@ public:
     }
     /// The nodes of a link group, this one included.
     [[nodiscard]] std::span<const ObjectID> groupOf(const Node& node) const;
-    /// By its name; `kNoObject` without one.
-    [[nodiscard]] ObjectID nodeNamed(std::string_view name) const noexcept;
+    /// `kNoObject` without one.
+    [[nodiscard]] ObjectID nodeNamed(NameHash name) const noexcept;
 
     /// Objects that were left out, as there were too many.
     [[nodiscard]] std::uint64_t leftOut() const noexcept { return leftOut_; }

@@ -1,8 +1,11 @@
 #pragma once
 
+#include <cstddef>
 #include <cstdint>
+#include <functional>
 #include <optional>
 #include <string>
+#include <string_view>
 #include <vector>
 
 /// What the sound server's world consists of, as far as reports need it. Texts have been cut and cleaned when
@@ -12,6 +15,14 @@ namespace tamblo::pipewire {
 /// The server's number of an object; given to another one when the object is gone.
 using ObjectID = std::uint32_t;
 inline constexpr ObjectID kNoObject = 0xFFFFFFFF;
+
+/// Tells which node a name is meant for: cleaned, those of two headsets, which have their addresses, are
+/// alike.
+using NameHash = std::size_t;
+inline constexpr NameHash kNoName = 0;
+[[nodiscard]] inline NameHash hashOf(std::string_view name) noexcept {
+    return name.empty() ? kNoName : std::hash<std::string_view>{}(name);
+}
 
 /// What an application calls itself. Streams may say it, or the client that they belong to.
 struct ApplicationNames {
@@ -70,6 +81,7 @@ struct Node {
     std::optional<std::uint32_t> endOfDevice;
 
     std::string name;
+    NameHash nameHash = kNoName; ///< of the name as it was
     std::string description;
     std::string nick;
     std::string role;
@@ -134,8 +146,8 @@ struct Link {
 /// What the server says of itself, and what a session manager has set for all.
 struct Server {
     std::string version;
-    std::string defaultSink; ///< names of nodes
-    std::string defaultSource;
+    NameHash defaultSink = kNoName;
+    NameHash defaultSource = kNoName;
     std::uint32_t rate = 0;    ///< Hz; 0: not known
     std::uint32_t quantum = 0; ///< frames
     /// What somebody has set instead, for as long as it is set; 0: nothing.

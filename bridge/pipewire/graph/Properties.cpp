@@ -67,8 +67,7 @@ constexpr std::array<Field<Device>, 7> kDeviceFields{{
 }};
 
 /// Of a stream, neither `node.description` nor `node.nick` nor `media.name` is taken: they carry titles.
-constexpr std::array<Field<Node>, 7> kNodeFields{{
-    {"node.name", &Node::name},
+constexpr std::array<Field<Node>, 6> kNodeFields{{
     {"media.role", &Node::role},
     {"node.latency", &Node::latency},
     {"node.link-group", &Node::linkGroup},
@@ -126,6 +125,9 @@ void takeProperty(Node& node, std::string_view key, std::string_view value) {
             node.description.clear();
             node.nick.clear();
         }
+    } else if (key == "node.name") {
+        node.name = cleanText(value);
+        node.nameHash = hashOf(value);
     } else if (key == "client.id") {
         node.client = objectOf(value);
     } else if (key == "device.id") {
@@ -159,7 +161,7 @@ void takeMetadata(Server& server, std::string_view key, std::string_view value) 
         const auto parsed = readJson(value.substr(0, kMostMetadataBytes));
         const auto* const object = std::get_if<Value>(&parsed);
         const Value* const name = object == nullptr ? nullptr : object->dictionaryValue().find("name");
-        return name == nullptr ? std::string() : cleanText(name->stringValue());
+        return name == nullptr ? kNoName : hashOf(name->stringValue());
     };
     if (key == "default.audio.sink") {
         server.defaultSink = nameIn();

@@ -15,7 +15,7 @@ constexpr std::string_view kDefaultOutput = "default_output";
 constexpr std::string_view kDefaultInput = "default_input";
 
 /// One of the two default devices; "None" without one.
-void setDefault(Dictionary& settings, const Graph& graph, std::string_view key, std::string_view nodeName) {
+void setDefault(Dictionary& settings, const Graph& graph, std::string_view key, NameHash nodeName) {
     const std::string prefix(key);
     const ObjectID id = graph.nodeNamed(nodeName);
     const Node* const node = graph.node(id);

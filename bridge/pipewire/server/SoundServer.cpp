@@ -187,8 +187,8 @@ void SoundServer::vanished(void* data, std::uint32_t id) {
     if (self.defaults_ == id) {
         self.defaults_ = kNoObject;
         self.graph_.changeServer([](Server& server) {
-            server.defaultSink.clear();
-            server.defaultSource.clear();
+            server.defaultSink = kNoName;
+            server.defaultSource = kNoName;
         });
     }
 }

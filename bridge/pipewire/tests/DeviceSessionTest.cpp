@@ -28,7 +28,7 @@ protected:
         world_.node(kSpeaker, {{"media.class", "Audio/Sink"}, {"node.name", "a"}, {"node.nick", "Speaker"}});
         world_.graph.changeServer([](Server& server) {
             server.rate = 48000;
-            server.defaultSink = "a";
+            server.defaultSink = hashOf("a");
         });
         pass(1s);
     }
@@ -98,7 +98,7 @@ TEST_F(PipeWireDevice, saysWhatIsThereThenWhatChanges) {
     connectHeadset();
     pass(1s);
     EXPECT_EQ(take(), "1 HAL_Setup Activate, 1 HAL_Setup Activate") << "the card, and its sink";
-    world_.graph.changeServer([](Server& server) { server.defaultSink = "b"; });
+    world_.graph.changeServer([](Server& server) { server.defaultSink = hashOf("b"); });
     pass(1s);
     EXPECT_EQ(take(), "1 Routing_RouteChange Generic");
     EXPECT_EQ(lastOf("default_output"), "Headset");
@@ -122,6 +122,24 @@ TEST_F(PipeWireDevice, saysWhatIsThereThenWhatChanges) {
     pass(1s);
     EXPECT_EQ(take(), "1 Routing_RouteChange Generic, 1 HAL_Setup Deactivate, 1 HAL_Setup Deactivate");
     EXPECT_FALSE(session_.due().value() < clock_.now().steady + 23h) << "nothing wakes it but the day";
+}
+
+TEST_F(PipeWireDevice, tellsTwoHeadsetsApartWhoseNamesAreAddresses) {
+    startServer();
+    const std::string mine = "bluez_output.01_23_45_67_89_AB.1";
+    const std::string yours = "bluez_output.01_23_45_67_89_AC.1";
+    world_.node(7, {{"media.class", "Audio/Sink"}, {"node.name", mine}, {"node.nick", "Mine"}});
+    world_.node(8, {{"media.class", "Audio/Sink"}, {"node.name", yours}, {"node.nick", "Yours"}});
+    pass(1s);
+    for (const auto& [name, nick] : {std::pair(mine, "Mine"), std::pair(yours, "Yours")}) {
+        take();
+        world_.graph.changeServer([name = name](Server& server) {
+            takeMetadata(server, "default.audio.sink", R"({"name":")" + name + "\"}");
+        });
+        pass(1s);
+        EXPECT_EQ(take(), "1 Routing_RouteChange Generic");
+        EXPECT_EQ(lastOf("default_output"), nick);
+    }
 }
 
 TEST_F(PipeWireDevice, isBegunAnewOnceADayAndWithTheServiceAndCountsRestartsOfTheServer) {

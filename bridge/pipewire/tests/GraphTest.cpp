@@ -67,7 +67,7 @@ TEST(PipeWireProperties, letIdentifiersInAndTitlesNot) {
     Server server;
     takeMetadata(server, "default.audio.sink", R"({"name":"sink-A"})");
     takeMetadata(server, "clock.quantum", "1024");
-    EXPECT_EQ(server.defaultSink, "sink-A");
+    EXPECT_EQ(server.defaultSink, hashOf("sink-A"));
     EXPECT_EQ(server.quantumInForce(), 1024U);
     takeMetadata(server, "clock.force-quantum", "256");
     EXPECT_EQ(server.quantumInForce(), 256U);
@@ -75,7 +75,7 @@ TEST(PipeWireProperties, letIdentifiersInAndTitlesNot) {
     EXPECT_EQ(server.quantumInForce(), 1024U);
     for (const std::string& hostile : {std::string("{"), std::string("[1]"), std::string(65536, '{')}) {
         takeMetadata(server, "default.audio.sink", hostile);
-        EXPECT_EQ(server.defaultSink, "");
+        EXPECT_EQ(server.defaultSink, kNoName);
     }
 }
 
