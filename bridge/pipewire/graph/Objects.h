@@ -98,6 +98,11 @@ struct Node {
     [[nodiscard]] bool isStream() const noexcept {
         return mediaClass == MediaClass::playbackStream || mediaClass == MediaClass::captureStream;
     }
+    /// An application's stream of which enough is known to report it: no side of a filter, and no level
+    /// meter.
+    [[nodiscard]] bool isReported() const noexcept {
+        return isStream() && isKnown && linkGroup.empty() && !isMonitor;
+    }
     /// A sink, a source, or both.
     [[nodiscard]] bool isDevice() const noexcept { return !isStream() && mediaClass != MediaClass::other; }
 

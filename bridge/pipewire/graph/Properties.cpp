@@ -83,10 +83,6 @@ constexpr std::array<Field<Node>, 2> kNodeNameFields{{
 
 constexpr std::array<Field<Route>, 1> kRouteFields{{{"port.type", &Route::portType}}};
 
-bool isStream(MediaClass mediaClass) noexcept {
-    return mediaClass == MediaClass::playbackStream || mediaClass == MediaClass::captureStream;
-}
-
 } // namespace
 
 MediaClass mediaClassOf(std::string_view text) noexcept {
@@ -121,7 +117,7 @@ void takeProperty(Node& node, std::string_view key, std::string_view value) {
     if (key == "media.class") {
         node.mediaClass = mediaClassOf(value);
         node.isVirtual = node.isVirtual || value == "Audio/Source/Virtual";
-        if (isStream(node.mediaClass)) {
+        if (node.isStream()) {
             node.description.clear();
             node.nick.clear();
         }
@@ -139,7 +135,7 @@ void takeProperty(Node& node, std::string_view key, std::string_view value) {
     } else if (key == "stream.monitor" || key == "resample.peaks") {
         node.isMonitor = node.isMonitor || isTrue(value);
     } else if (!takeText<Node>(node, kNodeFields, key, value) &&
-               (isStream(node.mediaClass) || !takeText<Node>(node, kNodeNameFields, key, value))) {
+               (node.isStream() || !takeText<Node>(node, kNodeNameFields, key, value))) {
         takeText<ApplicationNames>(node.application, kApplicationFields, key, value);
     }
 }

@@ -42,7 +42,7 @@ private:
             walkOn(id, reached);
         } else if (!node->linkGroup.empty() && passThrough(id, *node, reached)) {
             return;
-        } else if (isDevice(*node)) {
+        } else if (node->isDevice()) {
             reachDevice(id, *node, reached);
         } else if (node->mediaClass == MediaClass::other) {
             reached.filters.push_back(id);
@@ -68,11 +68,6 @@ private:
             }
         }
         return hasOtherSide;
-    }
-
-    [[nodiscard]] static bool isDevice(const Node& node) noexcept {
-        return node.mediaClass == MediaClass::sink || node.mediaClass == MediaClass::source ||
-               node.mediaClass == MediaClass::duplex;
     }
 
     /// A virtual one is a device itself unless links lead on to others.

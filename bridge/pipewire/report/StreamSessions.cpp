@@ -3,41 +3,27 @@
 #include "bridge/pipewire/report/Application.h"
 #include "bridge/pipewire/report/StreamSettings.h"
 
-#include <algorithm>
 #include <utility>
 
 namespace tamblo::pipewire {
-
-namespace {
-
-bool isStream(const Node& node) noexcept {
-    return node.mediaClass == MediaClass::playbackStream || node.mediaClass == MediaClass::captureStream;
-}
-
-/// Whether it is an application's, and enough is known of it to report it.
-bool isReported(const Node& node) noexcept {
-    return isStream(node) && node.isKnown && node.linkGroup.empty() && !node.isMonitor;
-}
-
-} // namespace
 
 void StreamSessions::graphChanged(const GraphEvent& event) {
     const bool isRemoved = event.change == GraphEvent::Change::removed;
     if (event.kind == GraphEvent::Kind::node) {
         const Node& node = *graph_.node(event.id);
-        if (isStream(node) && isRemoved) {
+        if (node.isStream() && isRemoved) {
             streamRemoved(event.id);
-        } else if (isReported(node)) {
+        } else if (node.isReported()) {
             streamChanged(event.id);
-        } else if (!isStream(node) || !node.linkGroup.empty()) {
+        } else if (!node.isStream() || !node.linkGroup.empty()) {
             othersChanged();
         }
     } else if (event.kind == GraphEvent::Kind::link) {
         const Link& link = *graph_.link(event.id);
         for (const ObjectID end : {link.output, link.input}) {
             const Node* const node = graph_.node(end);
-            if (node != nullptr && isStream(*node) && node->linkGroup.empty()) {
-                if (isReported(*node)) {
+            if (node != nullptr && node->isStream() && node->linkGroup.empty()) {
+                if (node->isReported()) {
                     streamChanged(end);
                 }
                 return;
@@ -79,8 +65,9 @@ void StreamSessions::streamRemoved(ObjectID stream) {
 }
 
 std::optional<SteadyTime> StreamSessions::due() const {
-    const std::optional<SteadyTime> ofPool = pool_.due();
-    return settlesAt_ && ofPool ? std::min(*settlesAt_, *ofPool) : settlesAt_ ? settlesAt_ : ofPool;
+    std::optional<SteadyTime> due = settlesAt_;
+    bringForward(due, pool_.due());
+    return due;
 }
 
 void StreamSessions::run() {
@@ -99,7 +86,7 @@ void StreamSessions::settle() {
 
 void StreamSessions::look(ObjectID stream, const Moment& at) {
     const Node* const node = graph_.node(stream);
-    if (node == nullptr || !isReported(*node)) {
+    if (node == nullptr || !node->isReported()) {
         return;
     }
     StreamSession* const known = pool_.find(stream);

@@ -13,11 +13,6 @@ namespace {
 constexpr EventCategory kRouting = client::category(Subsystem::routing, EventKind::error);
 constexpr EventCategory kError = client::category(EventKind::error);
 
-/// An application's, that is heard or hears: no side of a filter, and no level meter.
-bool isWatched(const Node& node) noexcept {
-    return node.isStream() && node.isKnown && node.linkGroup.empty() && !node.isMonitor;
-}
-
 bool holds(const std::vector<ObjectID>& ids, ObjectID id) noexcept {
     return std::find(ids.begin(), ids.end(), id) != ids.end();
 }
@@ -50,7 +45,7 @@ void Troubles::graphChanged(const GraphEvent& event) {
 }
 
 void Troubles::nodeChanged(ObjectID id, const Node& node) {
-    if (isWatched(node)) {
+    if (node.isReported()) {
         streamChanged(id);
     }
     const auto known = errors_.find(id);
@@ -88,7 +83,7 @@ void Troubles::nodeRemoved(ObjectID id, const Node& node) {
 void Troubles::linkChanged(const Link& link) {
     for (const ObjectID end : {link.output, link.input}) {
         const Node* const node = graph_.node(end);
-        if (node != nullptr && isWatched(*node)) {
+        if (node != nullptr && node->isReported()) {
             streamChanged(end);
             return;
         }
@@ -150,7 +145,7 @@ void Troubles::run() {
 
 void Troubles::look(ObjectID id, SteadyTime now) {
     const Node* const node = graph_.node(id);
-    if (node == nullptr || !isWatched(*node)) {
+    if (node == nullptr || !node->isReported()) {
         return;
     }
     Reached reached = devicesReachedFrom(graph_, id);
