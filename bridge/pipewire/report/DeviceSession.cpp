@@ -14,6 +14,10 @@ constexpr std::string_view kApplication = "pipewire";
 constexpr std::string_view kDefaultOutput = "default_output";
 constexpr std::string_view kDefaultInput = "default_input";
 
+constexpr EventCategory kServer = client::category(Subsystem::hal, EventKind::generic);
+constexpr EventCategory kDevice = client::category(Subsystem::hal, EventKind::setup);
+constexpr EventCategory kRouteChange = client::category(Subsystem::routing, EventKind::routeChange);
+
 /// One of the two default devices; "None" without one.
 void setDefault(Dictionary& settings, const Graph& graph, std::string_view key, NameHash nodeName) {
     const std::string prefix(key);
@@ -138,8 +142,7 @@ std::optional<SteadyTime> DeviceSession::due() const {
         due = changedAt_->steady + kSettling;
     }
     if (begun_) {
-        const SteadyTime end = begun_->steady + kLength;
-        due = due ? std::min(*due, end) : end;
+        bringForward(due, begun_->steady + kLength);
     }
     return due;
 }
@@ -176,7 +179,7 @@ void DeviceSession::settle() {
         return;
     }
     if (!isThere && std::exchange(wasThere_, false)) {
-        say(EventKind::generic, EventType::stop, {{"server_running", false}}, at);
+        say(kServer, EventType::stop, {{"server_running", false}}, at);
         server_ = {};
         devices_.clear();
     }
@@ -201,7 +204,7 @@ void DeviceSession::sayServer(const Dictionary& now, const Moment& at) {
         Dictionary payload = known(now);
         payload.set("server_running", true);
         payload.set("server_restarts", restarts_);
-        say(EventKind::generic, EventType::start, std::move(payload), at);
+        say(kServer, EventType::start, std::move(payload), at);
         return;
     }
     Dictionary routes;
@@ -212,11 +215,10 @@ void DeviceSession::sayServer(const Dictionary& now, const Moment& at) {
         setChange(key.starts_with("default_") ? routes : clock, before, key, changes.valueAt(i));
     }
     if (!routes.empty()) {
-        reporter_.send(id_, client::category(Subsystem::routing, EventKind::routeChange), EventType::generic,
-                       std::move(routes), at.wall);
+        say(kRouteChange, EventType::generic, std::move(routes), at);
     }
     if (!clock.empty()) {
-        say(EventKind::setup, EventType::generic, std::move(clock), at);
+        say(kDevice, EventType::generic, std::move(clock), at);
     }
 }
 
@@ -228,14 +230,14 @@ void DeviceSession::sayDevices(const Devices& now, const Moment& at) {
             continue;
         }
         ++count;
-        say(EventKind::setup, EventType::deactivate, known(old->second), at);
+        say(kDevice, EventType::deactivate, known(old->second), at);
         old = devices_.erase(old);
     }
     for (auto device = now.begin(); device != now.end() && count < kMostMessages; ++device) {
         const auto [said, isNew] = devices_.try_emplace(device->first, device->second);
         if (isNew) {
             ++count;
-            say(EventKind::setup, EventType::activate, known(device->second), at);
+            say(kDevice, EventType::activate, known(device->second), at);
             continue;
         }
         const Dictionary changes = changesBetween(said->second, device->second);
@@ -249,7 +251,7 @@ void DeviceSession::sayDevices(const Devices& now, const Moment& at) {
             setChange(payload, said->second, changes.keyAt(i), changes.valueAt(i));
         }
         said->second = device->second;
-        say(EventKind::setup, EventType::generic, std::move(payload), at);
+        say(kDevice, EventType::generic, std::move(payload), at);
     }
     if (count >= kMostMessages) {
         changedAt_ = at;
@@ -257,10 +259,11 @@ void DeviceSession::sayDevices(const Devices& now, const Moment& at) {
     }
 }
 
-/// The number tells repeated messages apart: the service leaves out one that repeats the last of its kind.
-void DeviceSession::say(EventKind kind, EventType type, Dictionary payload, const Moment& at) {
+/// The number tells repeated messages apart: the service leaves out one that repeats the last of its kind,
+/// as the default devices that are found after each restart of the server.
+void DeviceSession::say(EventCategory category, EventType type, Dictionary payload, const Moment& at) {
     payload.set("message_number", ++messages_);
-    reporter_.send(id_, client::category(Subsystem::hal, kind), type, std::move(payload), at.wall);
+    reporter_.send(id_, category, type, std::move(payload), at.wall);
 }
 
 } // namespace tamblo::pipewire

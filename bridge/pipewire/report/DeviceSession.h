@@ -48,7 +48,7 @@ private:
     void forget();
     void sayServer(const Dictionary& now, const Moment& at);
     void sayDevices(const Devices& now, const Moment& at);
-    void say(EventKind kind, EventType type, Dictionary payload, const Moment& at);
+    void say(EventCategory category, EventType type, Dictionary payload, const Moment& at);
 
     const Graph& graph_;
     Reporter& reporter_;

@@ -104,6 +104,7 @@ TEST_F(PipeWireDevice, saysWhatIsThereThenWhatChanges) {
     EXPECT_EQ(lastOf("default_output"), "Headset");
     EXPECT_EQ(lastOf("previous_default_output"), "Speaker");
     EXPECT_EQ(lastOf("default_output_bluetooth_profile"), "a2dp-sink");
+    EXPECT_EQ(lastOf("message_number"), "5") << "the service would leave it out if it came again";
     world_.graph.changeDevice(kCard, [](Device& device) { device.profile = "headset-head-unit"; });
     pass(1s);
     EXPECT_EQ(take(), "1 HAL_Setup Generic");
