@@ -1,12 +1,11 @@
 #include "bridge/pipewire/server/Bridge.h"
 
-#include <algorithm>
-#include <array>
 #include <cerrno>
 #include <csignal>
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
+#include <utility>
 #include <variant>
 
 namespace tamblo::pipewire {
@@ -168,12 +167,21 @@ std::optional<SteadyTime> Bridge::beforeSleep() {
     if (serviceWatch_) {
         serviceWatch_->watchWriting(service_.wantsWriting());
     }
+    tellOfLimits();
     std::optional<SteadyTime> due = serverPlace_.endpoint.due();
-    const std::optional<SteadyTime> other = options_.isDry ? std::nullopt : servicePlace_.endpoint.due();
-    for (const auto& time : {other, snapshotDue_}) {
-        due = due && time ? std::min(*due, *time) : due ? due : time;
+    if (!options_.isDry) {
+        bringForward(due, servicePlace_.endpoint.due());
     }
+    bringForward(due, snapshotDue_);
     return due;
+}
+
+/// Once: who brings so much should not fill the log as well.
+void Bridge::tellOfLimits() {
+    const bool isBeyond = graph_.leftOut() != 0 || streams_.leftOut() != 0;
+    if (isBeyond && !std::exchange(isBeyondLimits_, true)) {
+        log("the sound server has more than is watched: some of it is not reported");
+    }
 }
 
 /// Ends the program, when everything is known, or when it will not be.

@@ -58,6 +58,7 @@ private:
     void leaveServer();
     /// Everything that was reported leaves; when to be called again at the latest.
     [[nodiscard]] std::optional<SteadyTime> beforeSleep();
+    void tellOfLimits();
     void takeSnapshot();
     void fail(const std::string& line);
 
@@ -83,6 +84,7 @@ private:
     DirectoryWatcher preferencesWatcher_;
     std::unique_ptr<Loop::Watch> serviceWatch_;
     std::optional<SteadyTime> snapshotDue_; ///< when it is given up
+    bool isBeyondLimits_ = false;
     int status_ = 0;
 };
 
