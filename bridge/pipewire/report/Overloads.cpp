@@ -18,7 +18,7 @@ constexpr EventCategory kIO = client::category(EventKind::io);
 /// comes to others that run: those were not given the time that they are due.
 constexpr double kEarly = 0.75;
 
-double rounded(double value) noexcept {
+double roundedShare(double value) noexcept {
     constexpr double kDigits = 1e3;
     return std::round(value * kDigits) / kDigits;
 }
@@ -195,8 +195,8 @@ void Overloads::report(ObjectID node, Tally& tally, const Moment& now) {
                            {"overload_number", tally.late + tally.xruns},
                            {"late_number", tally.late},
                            {"xrun_number", tally.xruns},
-                           {"cycle_share", rounded(tally.worstShare)},
-                           {"mean_cycle_share", rounded(mean)},
+                           {"cycle_share", roundedShare(tally.worstShare)},
+                           {"mean_cycle_share", roundedShare(mean)},
                            {"io_buffer_size", tally.frames},
                            {"cycle_seconds", tally.cycleSeconds},
                            {"smallest_buffer_frame_size", tally.frames},

@@ -64,8 +64,7 @@ public:
         profiles_.insert(facts.bluetoothProfile);
         codecs_.insert(facts.bluetoothCodec);
         rate_ = rate_ == 0 ? facts.rate : rate_;
-        const bool isLouder = !facts.volume.isMuted && facts.volume.linear > volume_;
-        volume_ = isFirst_ ? audible(facts.volume) : isLouder ? facts.volume.linear : volume_;
+        volume_ = isFirst_ ? audible(facts.volume) : std::max(volume_, audible(facts.volume));
         isFirst_ = false;
     }
 

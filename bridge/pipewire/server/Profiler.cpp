@@ -5,6 +5,7 @@
 #include "bridge/pipewire/server/Proxy.h"
 #include "bridge/pipewire/server/SoundServer.h"
 #include "os/FileDescriptor.h"
+#include "os/LocalAddress.h"
 
 #include <algorithm>
 #include <array>
@@ -22,7 +23,6 @@
 #include <pipewire/pipewire.h>
 #include <sys/ioctl.h>
 #include <sys/socket.h>
-#include <sys/un.h>
 
 namespace tamblo::pipewire {
 
@@ -37,24 +37,17 @@ constexpr std::array<const char*, 2> kModules{"libpipewire-module-protocol-nativ
 constexpr milliseconds kAnswerInterval{20};
 constexpr unsigned kMostAnswers = 50;
 
-} // namespace
-
 /// A connection of which it can be told how much waits in it, as the library tells that of none. -1 when
 /// nobody answers.
 int connectedSocket() noexcept {
-    const std::string path = SoundServer::socketPath();
-    sockaddr_un address{};
-    address.sun_family = AF_UNIX;
-    if (path.size() >= sizeof(address.sun_path)) {
-        return -1;
-    }
-    path.copy(address.sun_path, path.size());
+    const auto address = LocalAddress::of(SoundServer::socketPath());
     FileDescriptor socket(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0));
     const bool isConnected =
-        socket.isOpen() &&
-        ::connect(socket.get(), reinterpret_cast<const sockaddr*>(&address), sizeof(address)) == 0;
+        address && socket.isOpen() && ::connect(socket.get(), address->get(), address->size()) == 0;
     return isConnected ? socket.release() : -1;
 }
+
+} // namespace
 
 class Profiler::Connection {
 public:
