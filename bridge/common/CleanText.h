@@ -6,7 +6,7 @@
 
 namespace tamblo::bridge {
 
-/// Bytes of a text in the model at most.
+/// Bytes of a text in a report at most.
 inline constexpr std::size_t kMostTextBytes = 128;
 
 /// A text of others as reports may have it: well-formed UTF-8 without control characters, cut, and

@@ -22,7 +22,7 @@ public:
     using Key = std::uint64_t;
 
     static constexpr std::chrono::seconds kGrace{4};
-    /// Sessions at a time; streams beyond that are not reported until others have ended.
+    /// Sessions at a time; a stream beyond that is not reported, unless it changes when others have ended.
     static constexpr std::size_t kMostSessions = 2048;
 
     SessionPool(Reporter& reporter, const Clock& clock) : reporter_(reporter), clock_(clock) {}
