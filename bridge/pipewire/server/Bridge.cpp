@@ -28,6 +28,7 @@ void log(const std::string& line) {
 
 Bridge::Bridge(const Options& options, const wire::Directories& directories)
     : options_(options),
+      serverSocket_(SoundServer::findSocket()),
       loop_(clock_),
       text_(stdout),
       service_(directories.socketFile()),
@@ -38,9 +39,9 @@ Bridge::Bridge(const Options& options, const wire::Directories& directories)
       overloads_(graph_, reporter_, clock_, [this](ObjectID node) { return sessionOf(node); }),
       troubles_(graph_, reporter_, clock_, [this](ObjectID node) { return sessionOf(node); }),
       cycleLengths_(graph_),
-      profiler_(graph_, clock_, {&overloads_, &cycleLengths_}),
-      server_(loop_, graph_),
-      serverPlace_{Endpoint(SoundServer::socketPath(), clock_)},
+      profiler_(graph_, clock_, {&overloads_, &cycleLengths_}, serverSocket_),
+      server_(loop_, graph_, serverSocket_),
+      serverPlace_{Endpoint(serverSocket_, clock_)},
       servicePlace_{Endpoint(directories.socketFile(), clock_)},
       preferences_(PreferenceFile::of(directories.preferences(), kPreferencesDomain)),
       preferencesWatcher_(directories.preferences()) {
@@ -135,7 +136,7 @@ void Bridge::reachServer() {
     }
     serverPlace_.watch.reset();
     serverPlace_.endpoint.connected();
-    log("watches " + SoundServer::socketPath());
+    log("watches " + serverSocket_);
 }
 
 void Bridge::leaveServer() {
@@ -191,11 +192,11 @@ void Bridge::takeSnapshot() {
         device_.settle();
         loop_.stop();
     } else if (!server_.isConnected() && !serverPlace_.endpoint.due()) {
-        fail("no sound server answers at " + SoundServer::socketPath());
+        fail("no sound server answers at " + serverSocket_);
     } else if (!reporter_.isReachable() && !servicePlace_.endpoint.due()) {
         fail("the service does not answer at " + service_.socketPath());
     } else if (snapshotDue_ && *snapshotDue_ <= clock_.now().steady) {
-        fail("the sound server says nothing at " + SoundServer::socketPath());
+        fail("the sound server says nothing at " + serverSocket_);
     }
 }
 

@@ -63,6 +63,7 @@ private:
     void fail(const std::string& line);
 
     const Options options_;
+    const std::string serverSocket_;
     SystemClock clock_;
     Loop loop_;
     Graph graph_;

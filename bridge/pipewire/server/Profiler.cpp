@@ -3,7 +3,6 @@
 #include "bridge/pipewire/server/Context.h"
 #include "bridge/pipewire/server/Cycles.h"
 #include "bridge/pipewire/server/Proxy.h"
-#include "bridge/pipewire/server/SoundServer.h"
 #include "os/FileDescriptor.h"
 #include "os/LocalAddress.h"
 
@@ -39,8 +38,8 @@ constexpr unsigned kMostAnswers = 50;
 
 /// A connection of which it can be told how much waits in it, as the library tells that of none. -1 when
 /// nobody answers.
-int connectedSocket() noexcept {
-    const auto address = LocalAddress::of(SoundServer::socketPath());
+int connectedSocket(const std::string& path) noexcept {
+    const auto address = LocalAddress::of(path);
     FileDescriptor socket(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0));
     const bool isConnected =
         address && socket.isOpen() && ::connect(socket.get(), address->get(), address->size()) == 0;
@@ -77,8 +76,8 @@ public:
     [[nodiscard]] bool isFound() const noexcept { return id_ != kNoObject; }
     [[nodiscard]] bool mayStillCome() noexcept { return isFound() || ++looks_ < kMostAnswers; }
 
-    bool open() {
-        socket_ = connectedSocket();
+    bool open(const std::string& socketPath) {
+        socket_ = connectedSocket(socketPath);
         // The library closes the socket with the connection.
         core_ = socket_ < 0 ? nullptr : pw_context_connect_fd(context_, socket_, nullptr, 0);
         if (core_ == nullptr) {
@@ -184,8 +183,9 @@ const pw_core_events Profiler::Connection::kCoreEvents = [] {
     return events;
 }();
 
-Profiler::Profiler(const Graph& graph, const Clock& clock, std::vector<CycleObserver*> observers)
-    : graph_(graph), clock_(clock), observers_(std::move(observers)) {}
+Profiler::Profiler(const Graph& graph, const Clock& clock, std::vector<CycleObserver*> observers,
+                   std::string socketPath)
+    : graph_(graph), clock_(clock), observers_(std::move(observers)), socketPath_(std::move(socketPath)) {}
 
 Profiler::~Profiler() = default;
 
@@ -275,7 +275,7 @@ void Profiler::run() {
         tellRead();
         return;
     }
-    if (!connection.isOpen() && !connection.open()) {
+    if (!connection.isOpen() && !connection.open(socketPath_)) {
         due_ = now + kPause;
         return;
     }

@@ -9,6 +9,7 @@
 #include <cstddef>
 #include <memory>
 #include <optional>
+#include <string>
 #include <unordered_set>
 #include <vector>
 
@@ -37,7 +38,8 @@ public:
     static constexpr std::chrono::milliseconds kShortestWindow{20};
     static constexpr std::size_t kManyMore = 32;
 
-    Profiler(const Graph& graph, const Clock& clock, std::vector<CycleObserver*> observers);
+    Profiler(const Graph& graph, const Clock& clock, std::vector<CycleObserver*> observers,
+             std::string socketPath);
     ~Profiler() override;
     Profiler(const Profiler&) = delete;
     Profiler& operator=(const Profiler&) = delete;
@@ -58,6 +60,7 @@ private:
     const Graph& graph_;
     const Clock& clock_;
     const std::vector<CycleObserver*> observers_;
+    const std::string socketPath_; ///< the sound server's
     std::unordered_set<ObjectID> running_;
     std::optional<SteadyTime> silentSince_;
     std::optional<SteadyTime> due_;

@@ -14,6 +14,7 @@
 
 #include <pipewire/extensions/metadata.h>
 #include <pipewire/impl.h>
+#include <unistd.h>
 
 namespace tamblo::pipewire {
 
@@ -46,15 +47,15 @@ const pw_registry_events SoundServer::kRegistryEvents = [] {
     return events;
 }();
 
-SoundServer::SoundServer(Loop& loop, Graph& graph)
-    : graph_(graph), context_(makeContext(loop.get(), kModules)) {}
+SoundServer::SoundServer(Loop& loop, Graph& graph, std::string socketPath)
+    : graph_(graph), socketPath_(std::move(socketPath)), context_(makeContext(loop.get(), kModules)) {}
 
 SoundServer::~SoundServer() {
     disconnect();
     pw_context_destroy(context_);
 }
 
-std::string SoundServer::socketPath() {
+std::string SoundServer::findSocket() {
     const auto variable = [](const char* name) {
         const char* const value = std::getenv(name);
         return std::string(value == nullptr ? "" : value);
@@ -64,16 +65,20 @@ std::string SoundServer::socketPath() {
     if (name.front() == '/') {
         return name;
     }
+    const std::string ofSystem = "/run/pipewire/" + name;
     for (const char* const place : {"PIPEWIRE_RUNTIME_DIR", "XDG_RUNTIME_DIR", "USERPROFILE"}) {
         if (const std::string directory = variable(place); !directory.empty()) {
-            return formatted("{}/{}", directory, name);
+            std::string own = formatted("{}/{}", directory, name);
+            const bool isThere = ::access(own.c_str(), F_OK) == 0;
+            return isThere || ::access(ofSystem.c_str(), F_OK) != 0 ? own : ofSystem;
         }
     }
-    return "/run/pipewire/" + name;
+    return ofSystem;
 }
 
 bool SoundServer::connect() {
-    core_ = pw_context_connect(context_, nullptr, 0);
+    core_ =
+        pw_context_connect(context_, pw_properties_new(PW_KEY_REMOTE_NAME, socketPath_.c_str(), nullptr), 0);
     if (core_ == nullptr) {
         return false;
     }

@@ -19,13 +19,14 @@ namespace tamblo::pipewire {
 /// registry. The loop's thread; nothing here waits.
 class SoundServer {
 public:
-    SoundServer(Loop& loop, Graph& graph);
+    SoundServer(Loop& loop, Graph& graph, std::string socketPath);
     ~SoundServer();
     SoundServer(const SoundServer&) = delete;
     SoundServer& operator=(const SoundServer&) = delete;
 
-    /// The socket that will be tried, from the environment as PipeWire's own clients find it.
-    [[nodiscard]] static std::string socketPath();
+    /// The socket of the server, from the environment as PipeWire's own clients find it: the one for all
+    /// where there is only that. They look each time anew; who waits for it has to know which.
+    [[nodiscard]] static std::string findSocket();
 
     /// Tries at once. False, with `errno`, when nobody answers.
     [[nodiscard]] bool connect();
@@ -57,6 +58,7 @@ private:
     void keep(ObjectID id, std::unique_ptr<BoundObject> object);
 
     Graph& graph_;
+    const std::string socketPath_;
     pw_context* context_;
     pw_core* core_ = nullptr;
     pw_registry* registry_ = nullptr;
