@@ -34,8 +34,11 @@ if(tamblo_pipewire_found)
     target_compile_options(tamblo_pipewire_library INTERFACE
         "$<$<CXX_COMPILER_ID:Clang>:-Wno-gnu-statement-expression-from-macro-expansion>")
     target_link_libraries(tamblo_bridge_pipewire_server PUBLIC tamblo_pipewire_library)
+    tamblo_folder(bridge/pipewire EXCLUDE bridge/pipewire/main.cpp
+        PUBLIC bridge/pipewire/server bridge/pipewire/report bridge/pipewire/graph bridge/common client wire os base)
     tamblo_program(tamblo-pipewire SOURCES bridge/pipewire/main.cpp
-        LIBRARIES bridge/pipewire/server bridge/pipewire/report bridge/pipewire/graph bridge/common client wire os base
+        LIBRARIES bridge/pipewire bridge/pipewire/server bridge/pipewire/report bridge/pipewire/graph bridge/common
+            client wire os base
         SELF_CONTAINED)
     target_compile_definitions(tamblo-pipewire PRIVATE "TAMBLO_VERSION=\"${PROJECT_VERSION}\"")
 endif()

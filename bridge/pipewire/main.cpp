@@ -1,4 +1,4 @@
-#include "bridge/pipewire/server/Bridge.h"
+#include "bridge/pipewire/Bridge.h"
 
 #include <csignal>
 #include <cstdio>
@@ -19,25 +19,20 @@ constexpr int kWrongUse = 2;
 constexpr const char* kHelp =
     "usage: tamblo-pipewire [--dry-run] [--once] [--help | --version]\n"
     "\n"
-    "Reports to tamblod what the sound server PipeWire knows: a session for each application's stream, with "
-    "when\n"
-    "it ran, where to, how loud, in which format, and what went wrong with it; and one for the device. It "
-    "runs "
-    "until\n"
-    "SIGTERM or SIGINT, whether or not the two are there.\n"
+    "Reports to tamblod what the sound server PipeWire knows: a session for each application's stream, with\n"
+    "when it ran, where to, how loud, in which format, and what went wrong with it; and one for the device.\n"
+    "It runs until SIGTERM or SIGINT, whether or not the two are there.\n"
     "\n"
     "  --dry-run  print what would be reported, and report nothing\n"
     "  --once     report the streams and devices that there are now, and end\n"
     "\n"
     "  RUNTIME_DIRECTORY        where the service's socket is\n"
-    "  CONFIGURATION_DIRECTORY  preferences; com.vandra.tamblo.pipewire has which role is which service "
-    "type\n"
+    "  CONFIGURATION_DIRECTORY  preferences; com.vandra.tamblo.pipewire: which role is which service type\n"
     "  PIPEWIRE_REMOTE, PIPEWIRE_RUNTIME_DIR, XDG_RUNTIME_DIR\n"
     "                           where the sound server's socket is, as for its other clients\n"
     "\n"
-    "Exit status: 0 after a signal, 1 when it cannot start or, with --once, has nobody to ask or to tell, 2 "
-    "with\n"
-    "other arguments.\n";
+    "Exit status: 0 after a signal, 1 when it cannot start or, with --once, has nobody to ask or to tell, 2\n"
+    "with other arguments.\n";
 
 /// What the arguments ask for, or the exit status where that is all.
 std::variant<tamblo::pipewire::Bridge::Options, int> parse(std::span<const char* const> arguments) {

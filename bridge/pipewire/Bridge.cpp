@@ -1,4 +1,4 @@
-#include "bridge/pipewire/server/Bridge.h"
+#include "bridge/pipewire/Bridge.h"
 
 #include <cerrno>
 #include <csignal>
