@@ -1,6 +1,9 @@
 #include "bridge/common/StreamSession.h"
 
+#include <algorithm>
+#include <array>
 #include <chrono>
+#include <string_view>
 #include <utility>
 
 namespace tamblo::bridge {
@@ -11,6 +14,9 @@ constexpr EventCategory kSetup = client::category(Subsystem::session, EventKind:
 constexpr EventCategory kSession = client::category(Subsystem::session, EventKind::generic);
 constexpr EventCategory kRouteChange = client::category(Subsystem::routing, EventKind::routeChange);
 constexpr EventCategory kVolume = client::category(EventKind::volume);
+
+constexpr std::array<std::string_view, 4> kVolumeKeys{"linear_volume", "stream_volume", "stream_muted",
+                                                      "device_volume"};
 
 /// What has no value yet need not be said; that it has none any more, has.
 Dictionary withoutEmpty(const Dictionary& settings) {
@@ -52,7 +58,9 @@ void StreamSession::update(const StreamSettings& now, const Moment& at) {
         }
         say(kRouteChange, EventType::generic, std::move(payload), at);
     } else if (!changes.empty()) {
-        const bool isVolume = changes.contains("linear_volume") || changes.contains("stream_muted");
+        // While it is muted the volume may be another one that is not heard.
+        const bool isVolume = std::ranges::any_of(
+            kVolumeKeys, [&changes](std::string_view key) { return changes.contains(key); });
         say(isVolume ? kVolume : ownCategory(), EventType::generic, changes, at);
     }
 }

@@ -81,6 +81,9 @@ TEST_F(PipeWireSessions, sayEverythingAtTheStartThenWhatChangesAndHowLongItWas) 
     world_.graph.changeNode(100, [](Node& node) { node.volume = {{0.512, true}}; });
     pass(1s);
     EXPECT_EQ(lastOf("QVSessionVolume"), 0.0);
+    world_.graph.changeNode(1, [](Node& node) { node.volume = {{0.216, false}}; });
+    pass(1s);
+    EXPECT_EQ(last().category, "Volume") << "though it is not heard";
 
     world_.link(1, 101);
     world_.unlink(1, 100);
@@ -92,7 +95,7 @@ TEST_F(PipeWireSessions, sayEverythingAtTheStartThenWhatChangesAndHowLongItWas) 
     reports_.messages.clear();
     remove(1);
     EXPECT_EQ(reports_.story(), "1 Session_Playback Stop, 1 Session_Generic Stop") << "at once";
-    EXPECT_EQ(lastOf("session_duration"), 4.0);
+    EXPECT_EQ(lastOf("session_duration"), 5.0);
     pass(10s);
     EXPECT_TRUE(reports_.sessions[0].hasEnded);
     EXPECT_EQ(sessions_.count(), 0U);
