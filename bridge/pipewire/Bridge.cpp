@@ -117,9 +117,17 @@ void Bridge::watchPlace(Place& place) {
     place.watch = loop_.watch(place.endpoint.descriptor(), [&place] { place.endpoint.read(); });
 }
 
+/// When it is given up until the socket changes. With `once` that is the end, which is told then.
+void Bridge::tellOfSilence(const Place& place, const std::string& line) const {
+    if (!place.endpoint.due() && !options_.once) {
+        log(line + " yet");
+    }
+}
+
 void Bridge::reachService() {
     if (!service_.connect()) {
         servicePlace_.endpoint.failed();
+        tellOfSilence(servicePlace_, "the service does not answer at " + service_.socketPath());
         return;
     }
     servicePlace_.watch.reset();
@@ -132,6 +140,7 @@ void Bridge::reachService() {
 void Bridge::reachServer() {
     if (!server_.connect()) {
         serverPlace_.endpoint.failed();
+        tellOfSilence(serverPlace_, "no sound server answers at " + serverSocket_);
         return;
     }
     serverPlace_.watch.reset();

@@ -53,6 +53,7 @@ private:
     [[nodiscard]] SessionID sessionOf(ObjectID node) const;
     void readPreferences();
     void watchPlace(Place& place);
+    void tellOfSilence(const Place& place, const std::string& line) const;
     void reachService();
     void reachServer();
     void leaveServer();

@@ -96,5 +96,22 @@ TEST(PipeWireRestarts, inAnyOrderWhatRunsIsReportedOnceAndEnds) {
     EXPECT_EQ(bridge.end(), 0);
 }
 
+TEST(PipeWireStart, saysWhoDoesNotAnswerAndWaits) {
+    const TemporaryDirectory directory;
+    for (const char* const variable : {"RUNTIME_DIRECTORY", "CONFIGURATION_DIRECTORY", "XDG_RUNTIME_DIR"}) {
+        ::setenv(variable, directory.path().c_str(), 1);
+    }
+    ::setenv("PIPEWIRE_REMOTE", "nobody-0", 1);
+    const std::string log = directory.path("log");
+    Program bridge({PROGRAMS_DIR "/tamblo-pipewire"}, log);
+    ::unsetenv("PIPEWIRE_REMOTE");
+    EXPECT_TRUE(test::eventually([&log] {
+        const std::string said = test::contentOf(log);
+        return said.find("the service does not answer at") != said.npos &&
+               said.find("no sound server answers at") != said.npos;
+    }));
+    EXPECT_EQ(bridge.end(), 0);
+}
+
 } // namespace
 } // namespace tamblo::pipewire
