@@ -7,9 +7,7 @@ namespace tamblo::pipewire {
 namespace {
 
 using namespace std::chrono_literals;
-using test::PrivateSound;
 using test::Program;
-using test::ServiceProcess;
 
 constexpr const char* kHeadsetNode = "bluez_output.01_23_45_67_89_AB.1";
 
@@ -18,20 +16,9 @@ constexpr const char* kHeadsetNode = "bluez_output.01_23_45_67_89_AB.1";
 constexpr const char* kSecrets = "secret|S3RIAL|01[:_-]23[:_-]45|anna";
 
 /// On an internal build, which writes every sink there is.
-class PipeWirePrivacy : public testing::Test {
+class PipeWirePrivacy : public test::OnPrivateServer {
 protected:
-    void SetUp() override {
-        for (const char* const program : {"pipewire", "wireplumber", "dbus-daemon", "pw-play", "pw-cli"}) {
-            if (!test::isInstalled(program)) {
-                GTEST_SKIP() << program << " is not installed";
-            }
-        }
-        sound_ = std::make_unique<PrivateSound>();
-        service_ = std::make_unique<ServiceProcess>(ServiceProcess::Options{.isInternalBuild = true});
-        ::setenv("RUNTIME_DIRECTORY", service_->runtimeDirectory().c_str(), 1);
-        ::setenv("CONFIGURATION_DIRECTORY", service_->preferenceFile("x").parent_path().parent_path().c_str(),
-                 1);
-    }
+    PipeWirePrivacy() : OnPrivateServer(true) {}
 
     /// A headset that has no name but its address, as sound servers make them of such, until the result goes.
     [[nodiscard]] std::unique_ptr<Program> headset() const {
@@ -58,19 +45,12 @@ protected:
                 sound_->song(2s)};
     }
     [[nodiscard]] std::size_t count(std::string_view event) const { return service_->countEvents(event); }
-
-    std::unique_ptr<PrivateSound> sound_;
-    std::unique_ptr<ServiceProcess> service_;
 };
 
 TEST_F(PipeWirePrivacy, titlesAndAddressesReachNoSink) {
     const auto sink = headset();
     ASSERT_TRUE(test::eventually([&] { return !sound_->nodeNamed(kHeadsetNode).empty(); }));
-    Program bridge({PROGRAMS_DIR "/tamblo-pipewire"}, sound_->log("bridge"));
-    ASSERT_TRUE(test::eventually([this] {
-        const std::string said = test::contentOf(sound_->log("bridge"));
-        return said.find("reports to") != std::string::npos && said.find("watches") != std::string::npos;
-    }));
+    startBridge();
     Program song(player(kHeadsetNode));
     ASSERT_TRUE(test::eventually([this] { return count("com.vandra.tamblo.Session_Playback.Start") == 1; }));
     const std::string dry = tamblo::test::run(PROGRAMS_DIR "/tamblo-pipewire --dry-run --once").output;
@@ -82,7 +62,7 @@ TEST_F(PipeWirePrivacy, titlesAndAddressesReachNoSink) {
         player("sink-a", "application.id = \"evil\\\"}\\n{\\\"event\\\":\\\"forged\\\"\\u001b[31m\""));
     ASSERT_TRUE(test::eventually([this] { return count("com.vandra.tamblo.Session_Playback.Start") == 2; }));
     EXPECT_EQ(hostile.wait(), 0);
-    EXPECT_EQ(bridge.end(), 0);
+    EXPECT_EQ(bridge_->end(), 0);
     ASSERT_TRUE(test::eventually([this] { return count("com.vandra.tamblo.Session_Generic.Summary") >= 2; }));
     EXPECT_EQ(service_->stop(), 0);
 

@@ -6,6 +6,8 @@
 
 #include "base/Json.h"
 
+#include <gtest/gtest.h>
+
 #include <chrono>
 #include <cstdint>
 #include <cstdlib>
@@ -136,6 +138,59 @@ private:
     std::unique_ptr<Program> bus_;
     std::unique_ptr<Program> server_;
     std::unique_ptr<Program> manager_;
+};
+
+/// A private sound server, a real service, and the program between them, by this process's environment.
+class OnPrivateServer : public testing::Test {
+protected:
+    explicit OnPrivateServer(bool isInternalBuild = false) : isInternalBuild_(isInternalBuild) {}
+
+    void SetUp() override {
+        for (const char* const program :
+             {"pipewire", "wireplumber", "dbus-daemon", "pw-play", "pw-cli", "pw-metadata", "wpctl"}) {
+            if (!isInstalled(program)) {
+                GTEST_SKIP() << program << " is not installed";
+            }
+        }
+        sound_ = std::make_unique<PrivateSound>();
+        service_ =
+            std::make_unique<ServiceProcess>(ServiceProcess::Options{.isInternalBuild = isInternalBuild_});
+        ::setenv("RUNTIME_DIRECTORY", service_->runtimeDirectory().c_str(), 1);
+        ::setenv("CONFIGURATION_DIRECTORY", service_->preferenceFile("x").parent_path().parent_path().c_str(),
+                 1);
+    }
+
+    /// Returns when it has reached both.
+    void startBridge() {
+        bridge_ = std::make_unique<Program>(std::vector<std::string>{PROGRAMS_DIR "/tamblo-pipewire"},
+                                            sound_->log("bridge"));
+        ASSERT_TRUE(eventually([this] {
+            const std::string said = contentOf(sound_->log("bridge"));
+            return said.find("reports to") != std::string::npos && said.find("watches") != std::string::npos;
+        }));
+    }
+
+    /// The payloads of an event that sessions of this application had, or of all whose names begin so.
+    [[nodiscard]] std::vector<Dictionary> events(const std::string& name,
+                                                 const std::string& application) const {
+        std::vector<Dictionary> payloads;
+        for (const std::string& line : linesOf(service_->logs() / "analytics-events.jsonl")) {
+            const auto parsed = readJson(line);
+            const Dictionary& event = std::get<Value>(parsed).dictionaryValue();
+            const Dictionary& payload = event.find("payload")->dictionaryValue();
+            const Value* const owner = payload.find("HostApplicationDisplayID");
+            if (event.find("event")->stringValue() == "com.vandra.tamblo." + name && owner != nullptr &&
+                owner->stringValue().starts_with(application)) {
+                payloads.push_back(payload);
+            }
+        }
+        return payloads;
+    }
+
+    const bool isInternalBuild_;
+    std::unique_ptr<PrivateSound> sound_;
+    std::unique_ptr<ServiceProcess> service_;
+    std::unique_ptr<Program> bridge_;
 };
 
 } // namespace tamblo::pipewire::test

@@ -12,50 +12,19 @@ namespace {
 using namespace std::chrono_literals;
 using test::PrivateSound;
 using test::Program;
-using test::ServiceProcess;
 
-/// A private sound server, a real service, and the program between them.
-class PipeWireServer : public testing::Test {
+class PipeWireServer : public test::OnPrivateServer {
 protected:
     void SetUp() override {
-        for (const char* const program :
-             {"pipewire", "wireplumber", "dbus-daemon", "pw-play", "pw-cli", "wpctl"}) {
-            if (!test::isInstalled(program)) {
-                GTEST_SKIP() << program << " is not installed";
-            }
+        OnPrivateServer::SetUp();
+        if (!IsSkipped()) {
+            startBridge();
         }
-        sound_ = std::make_unique<PrivateSound>();
-        service_ = std::make_unique<ServiceProcess>();
-        ::setenv("RUNTIME_DIRECTORY", service_->runtimeDirectory().c_str(), 1);
-        ::setenv("CONFIGURATION_DIRECTORY", service_->preferenceFile("x").parent_path().parent_path().c_str(),
-                 1);
-        startBridge();
     }
 
-    void startBridge() {
-        bridge_ = std::make_unique<Program>(std::vector<std::string>{PROGRAMS_DIR "/tamblo-pipewire"},
-                                            sound_->log("bridge"));
-        ASSERT_TRUE(test::eventually([this] {
-            const std::string said = test::contentOf(sound_->log("bridge"));
-            return said.find("reports to") != std::string::npos && said.find("watches") != std::string::npos;
-        }));
-    }
-
-    /// The payloads of an event that sessions of this application had, or of all whose names begin so.
     [[nodiscard]] std::vector<Dictionary> events(const std::string& name,
                                                  const std::string& application = "pw-cat") const {
-        std::vector<Dictionary> payloads;
-        for (const std::string& line : test::linesOf(service_->logs() / "analytics-events.jsonl")) {
-            const auto parsed = readJson(line);
-            const Dictionary& event = std::get<Value>(parsed).dictionaryValue();
-            const Dictionary& payload = event.find("payload")->dictionaryValue();
-            const Value* const owner = payload.find("HostApplicationDisplayID");
-            if (event.find("event")->stringValue() == "com.vandra.tamblo." + name && owner != nullptr &&
-                owner->stringValue().starts_with(application)) {
-                payloads.push_back(payload);
-            }
-        }
-        return payloads;
+        return OnPrivateServer::events(name, application);
     }
     [[nodiscard]] bool awaitEvents(const std::string& name, std::size_t count,
                                    const std::string& application = "pw-cat") const {
@@ -69,10 +38,6 @@ protected:
         const Value* const value = payload.find(key);
         return value == nullptr ? "" : std::string(value->stringValue());
     }
-
-    std::unique_ptr<PrivateSound> sound_;
-    std::unique_ptr<ServiceProcess> service_;
-    std::unique_ptr<Program> bridge_;
 };
 
 TEST_F(PipeWireServer, reportsStretchesWithTheirLengthsVolumesAndDevices) {

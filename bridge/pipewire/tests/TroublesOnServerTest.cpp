@@ -7,50 +7,24 @@ namespace tamblo::pipewire {
 namespace {
 
 using namespace std::chrono_literals;
-using test::PrivateSound;
 using test::Program;
-using test::ServiceProcess;
 
 /// What goes wrong on a private sound server, as it stands in the sinks of a real service.
-class PipeWireTroublesOnServer : public testing::Test {
+class PipeWireTroublesOnServer : public test::OnPrivateServer {
 protected:
     void SetUp() override {
-        for (const char* const program : {"pipewire", "wireplumber", "dbus-daemon", "pw-cli"}) {
-            if (!test::isInstalled(program)) {
-                GTEST_SKIP() << program << " is not installed";
-            }
+        OnPrivateServer::SetUp();
+        if (!IsSkipped()) {
+            startBridge();
         }
-        sound_ = std::make_unique<PrivateSound>();
-        service_ = std::make_unique<ServiceProcess>();
-        ::setenv("RUNTIME_DIRECTORY", service_->runtimeDirectory().c_str(), 1);
-        ::setenv("CONFIGURATION_DIRECTORY", service_->preferenceFile("x").parent_path().parent_path().c_str(),
-                 1);
-        bridge_ = std::make_unique<Program>(std::vector<std::string>{PROGRAMS_DIR "/tamblo-pipewire"},
-                                            sound_->log("bridge"));
-        ASSERT_TRUE(test::eventually([this] { return !payloads("HAL_Generic.Start", "pipewire").empty(); }));
     }
 
-    [[nodiscard]] std::vector<Dictionary> payloads(const std::string& event,
-                                                   const std::string& application) const {
-        std::vector<Dictionary> found;
-        for (const std::string& line : test::linesOf(service_->logs() / "analytics-events.jsonl")) {
-            const auto parsed = readJson(line);
-            const Dictionary& entry = std::get<Value>(parsed).dictionaryValue();
-            const Dictionary& payload = entry.find("payload")->dictionaryValue();
-            const Value* const owner = payload.find("HostApplicationDisplayID");
-            if (entry.find("event")->stringValue() == "com.vandra.tamblo." + event && owner != nullptr &&
-                owner->stringValue() == application) {
-                found.push_back(payload);
-            }
-        }
-        return found;
-    }
     /// The issues of this type, which come to so many at least.
     [[nodiscard]] std::vector<Dictionary> issues(const std::string& event, const std::string& application,
                                                  std::string_view type, std::size_t count = 1) const {
         std::vector<Dictionary> found;
         (void)test::eventually([&] {
-            found = payloads(event, application);
+            found = events(event, application);
             std::erase_if(found, [type](const Dictionary& payload) {
                 return payload.find("issue_type")->stringValue() != type;
             });
@@ -58,10 +32,6 @@ protected:
         });
         return found;
     }
-
-    std::unique_ptr<PrivateSound> sound_;
-    std::unique_ptr<ServiceProcess> service_;
-    std::unique_ptr<Program> bridge_;
 };
 
 TEST_F(PipeWireTroublesOnServer, aClientThatOversleepsIsAnOverloadAtMostOnceASecond) {
@@ -81,18 +51,18 @@ TEST_F(PipeWireTroublesOnServer, aClientThatOversleepsIsAnOverloadAtMostOnceASec
     // Of 1024 or 2048 frames each, 150 ms are 3 to 7 cycles, once in each of five seconds or six.
     EXPECT_GE(late, 3 * 3);
     EXPECT_LE(late, 8 * 6);
-    EXPECT_EQ(payloads("IO.Error", "sleeper").size(), 1U);
-    ASSERT_TRUE(test::eventually([this] { return !payloads("Session_Generic.Summary", "sleeper").empty(); }));
-    EXPECT_EQ(payloads("Session_Generic.Summary", "sleeper")[0].find("overload_count")->integerValue(),
+    EXPECT_EQ(events("IO.Error", "sleeper").size(), 1U);
+    ASSERT_TRUE(test::eventually([this] { return !events("Session_Generic.Summary", "sleeper").empty(); }));
+    EXPECT_EQ(events("Session_Generic.Summary", "sleeper")[0].find("overload_count")->integerValue(),
               static_cast<std::int64_t>(issues("IO.IssueDetector", "sleeper", "overload").size()));
     EXPECT_GE(test::linesOf(service_->logs() / "diagnostics-metrics.jsonl").size(), 3U);
 }
 
 TEST_F(PipeWireTroublesOnServer, aDeviceThatVanishesAndAStreamWithoutOneAreIssues) {
     Program player({PROGRAMS_DIR "/tamblo_pipewire_streams", "1", "60", "application.id=player"});
-    ASSERT_TRUE(test::eventually([this] { return !payloads("Session_Playback.Start", "player").empty(); }));
+    ASSERT_TRUE(test::eventually([this] { return !events("Session_Playback.Start", "player").empty(); }));
     const std::string device(
-        payloads("Session_Playback.Start", "player")[0].find("active_devices")->stringValue());
+        events("Session_Playback.Start", "player")[0].find("active_devices")->stringValue());
     const std::string other = device == "Speaker A" ? "Speaker B" : "Speaker A";
     const auto destroy = [this](const std::string& name) {
         const std::string node = name == "Speaker A" ? "sink-a" : "sink-b";
@@ -103,7 +73,7 @@ TEST_F(PipeWireTroublesOnServer, aDeviceThatVanishesAndAStreamWithoutOneAreIssue
     auto vanished = issues("Routing_Error.IssueDetector", "player", "device_vanished");
     ASSERT_EQ(vanished.size(), 1U);
     EXPECT_EQ(vanished[0].find("node")->stringValue(), device);
-    EXPECT_TRUE(test::eventually([this] { return !payloads("HAL_Setup.Deactivate", "pipewire").empty(); }));
+    EXPECT_TRUE(test::eventually([this] { return !events("HAL_Setup.Deactivate", "pipewire").empty(); }));
     EXPECT_TRUE(vanished[0].find("has_other_device")->boolValue());
 
     std::this_thread::sleep_for(500ms);
@@ -111,8 +81,7 @@ TEST_F(PipeWireTroublesOnServer, aDeviceThatVanishesAndAStreamWithoutOneAreIssue
     EXPECT_EQ(issues("Routing_Error.IssueDetector", "player", "device_vanished", 2).size(), 2U);
     EXPECT_EQ(issues("Routing_Error.IssueDetector", "player", "no_device").size(), 1U);
     bridge_->end();
-    EXPECT_TRUE(
-        test::eventually([this] { return !payloads("Session_Generic.Summary", "pipewire").empty(); }));
+    EXPECT_TRUE(test::eventually([this] { return !events("Session_Generic.Summary", "pipewire").empty(); }));
 }
 
 } // namespace
