@@ -1,6 +1,5 @@
 #pragma once
 
-#include "bridge/common/Namespace.h"
 #include "tests/service/RealService.h"
 
 #include <optional>
