@@ -4,8 +4,8 @@
 #include "bridge/common/ServiceTypes.h"
 #include "bridge/common/SessionPool.h"
 #include "bridge/common/Time.h"
-#include "bridge/pipewire/graph/Namespace.h"
 #include "bridge/pipewire/graph/Graph.h"
+#include "bridge/pipewire/graph/Namespace.h"
 
 #include <chrono>
 #include <cstddef>

@@ -1,8 +1,8 @@
 #pragma once
 
 #include "bridge/common/Settings.h"
-#include "bridge/pipewire/graph/Namespace.h"
 #include "bridge/pipewire/graph/Graph.h"
+#include "bridge/pipewire/graph/Namespace.h"
 
 namespace tamblo::pipewire {
 

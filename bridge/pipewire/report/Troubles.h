@@ -2,8 +2,8 @@
 
 #include "bridge/common/Reporter.h"
 #include "bridge/common/Time.h"
-#include "bridge/pipewire/graph/Namespace.h"
 #include "bridge/pipewire/graph/Graph.h"
+#include "bridge/pipewire/graph/Namespace.h"
 #include "bridge/pipewire/report/SessionOfNode.h"
 
 #include <chrono>

@@ -1,9 +1,9 @@
 #pragma once
 
 #include "bridge/common/Time.h"
-#include "bridge/pipewire/graph/Namespace.h"
 #include "bridge/pipewire/graph/Cycle.h"
 #include "bridge/pipewire/graph/Graph.h"
+#include "bridge/pipewire/graph/Namespace.h"
 
 #include <chrono>
 #include <cstddef>

@@ -1,8 +1,8 @@
 #pragma once
 
 #include "bridge/common/tests/KeptReports.h"
-#include "bridge/pipewire/graph/Namespace.h"
 #include "bridge/pipewire/graph/Graph.h"
+#include "bridge/pipewire/graph/Namespace.h"
 #include "bridge/pipewire/graph/Properties.h"
 
 #include <initializer_list>
