@@ -284,6 +284,7 @@ void PcmSessions::run() {
     }
     if (nextLook_ && *nextLook_ <= now.steady) {
         std::vector<PcmName> names;
+        names.reserve(open_.size());
         for (const auto& [name, pcm] : open_) {
             names.push_back(name);
         }
