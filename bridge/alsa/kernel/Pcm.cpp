@@ -46,7 +46,7 @@ std::chrono::nanoseconds timeOf(std::string_view text, std::string_view name) no
     std::string_view value = fieldOf(text, name).value_or("");
     const auto seconds = takeNumber<std::int64_t>(value);
     if (!seconds || *seconds < 0 || *seconds > mostSeconds || value.size() != 1 + digits ||
-        takeUpTo('.', value) != "") {
+        !takeUpTo('.', value).empty()) {
         return {};
     }
     const auto fraction = takeNumber<std::uint32_t>(value);

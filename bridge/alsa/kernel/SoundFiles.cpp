@@ -67,7 +67,7 @@ std::vector<PcmName> SoundFiles::all() const {
         if (!card) {
             continue;
         }
-        for (const std::string& inner : entriesOf(directory + "/" + entry)) {
+        for (const std::string& inner : entriesOf(formatted("{}/{}", directory, entry))) {
             const bool isInput = inner.ends_with('c');
             if (const auto device = numberIn(inner, "pcm", isInput ? "c" : "p")) {
                 const auto substreams = ofDevice({.card = *card, .device = *device, .isInput = isInput});
