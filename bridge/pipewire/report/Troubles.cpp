@@ -126,9 +126,7 @@ void Troubles::deviceVanished(ObjectID device) {
 std::optional<SteadyTime> Troubles::due() const {
     std::optional<SteadyTime> due = settlesAt_;
     for (const auto& time : {unlinkedDue_, errorsDue_}) {
-        if (time) {
-            bringForward(due, *time);
-        }
+        bringForward(due, time);
     }
     return due;
 }
