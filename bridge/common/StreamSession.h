@@ -22,7 +22,7 @@ struct StreamKind {
 /// messages of a well-reporting client: everything at its start and whenever sound begins to run; what has
 /// changed while it runs; at the end of each period of activity that it ended, and how long it was.
 ///
-/// Owned by `StreamSessions`, which decides when it is given what.
+/// Owned by `SessionPool`.
 class StreamSession {
 public:
     StreamSession(Reporter& reporter, StreamKind kind) : reporter_(reporter), kind_(std::move(kind)) {}
