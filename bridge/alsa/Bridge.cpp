@@ -1,7 +1,6 @@
 #include "bridge/alsa/Bridge.h"
 
 #include <algorithm>
-#include <array>
 #include <chrono>
 #include <csignal>
 #include <cstdio>
@@ -10,7 +9,6 @@
 #include <limits>
 #include <set>
 #include <string_view>
-#include <variant>
 #include <vector>
 
 #include <poll.h>
@@ -52,8 +50,7 @@ Bridge::Bridge(const Options& options, const wire::Directories& directories)
       reporter_(options.isDry ? static_cast<bridge::Reporter&>(text_) : service_),
       sessions_(files_, mixers_, reporter_, clock_, serviceTypes_),
       servicePlace_(directories.socketFile(), clock_),
-      preferences_(PreferenceFile::of(directories.preferences(), kPreferencesDomain)),
-      preferencesWatcher_(directories.preferences()),
+      preferences_(directories.preferences(), kPreferencesDomain, serviceTypes_),
       devices_(options.devices, DirectoryWatcher::Watch::use),
       signals_(endingSignals()) {
     service_.addListener(sessions_);
@@ -93,16 +90,8 @@ int Bridge::run() {
 }
 
 void Bridge::readPreferences() {
-    if (!preferences_) {
-        return;
-    }
-    const auto read = preferences_->read();
-    if (const auto* const fault = std::get_if<std::string>(&read)) {
-        log(*fault);
-        return;
-    }
-    for (const std::string& fault : serviceTypes_.setPreferences(std::get<Dictionary>(read))) {
-        log(preferences_->path() + ": " + fault);
+    for (const std::string& fault : preferences_.read()) {
+        log(fault);
     }
 }
 
@@ -169,7 +158,7 @@ void Bridge::waitForSomething() {
     std::vector<pollfd> places(mixers);
     places[signals] = reading(signals_.get());
     places[devices] = reading(devicesDue_ ? -1 : devices_.fileDescriptor());
-    places[preferences] = reading(preferencesWatcher_.fileDescriptor());
+    places[preferences] = reading(preferences_.descriptor());
     places[service] = reading(service_.isReachable() ? service_.descriptor()
                               : options_.isDry       ? -1
                                                      : servicePlace_.descriptor());
@@ -195,7 +184,6 @@ void Bridge::waitForSomething() {
         devicesDue_ = std::max(clock_.now().steady, devicesReadAt_ + kRest);
     }
     if (places[preferences].revents != 0) {
-        preferencesWatcher_.read([](auto) {});
         readPreferences();
     }
     // What the service says when it is reached, is taken in before the next wait.

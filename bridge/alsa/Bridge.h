@@ -5,11 +5,11 @@
 #include "bridge/alsa/report/PcmSessions.h"
 #include "bridge/common/Endpoint.h"
 #include "bridge/common/ServiceReporter.h"
+#include "bridge/common/ServiceTypePreferences.h"
 #include "bridge/common/ServiceTypes.h"
 #include "bridge/common/TextReporter.h"
 #include "os/DirectoryWatcher.h"
 #include "os/FileDescriptor.h"
-#include "os/PreferenceFile.h"
 #include "wire/Directories.h"
 
 #include <optional>
@@ -53,8 +53,7 @@ private:
     bridge::Reporter& reporter_; ///< the one of the two that is used
     PcmSessions sessions_;
     bridge::Endpoint servicePlace_;
-    std::optional<PreferenceFile> preferences_;
-    DirectoryWatcher preferencesWatcher_;
+    bridge::ServiceTypePreferences preferences_;
     DirectoryWatcher devices_;
     bridge::SteadyTime devicesReadAt_{};
     std::optional<bridge::SteadyTime> devicesDue_; ///< when what was opened and closed is to be read

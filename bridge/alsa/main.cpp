@@ -1,19 +1,12 @@
 #include "bridge/alsa/Bridge.h"
+#include "bridge/common/CommandLine.h"
 
-#include <array>
-#include <csignal>
 #include <cstdio>
 #include <cstdlib>
 #include <exception>
 #include <span>
-#include <string>
-#include <string_view>
-#include <utility>
-#include <variant>
 
 namespace {
-
-constexpr int kWrongUse = 2;
 
 constexpr const char* kHelp =
     "usage: tamblo-alsa [--dry-run] [--once] [--proc DIR] [--dev DIR] [--help | --version]\n"
@@ -34,48 +27,17 @@ constexpr const char* kHelp =
     "Exit status: 0 after a signal, 1 when it cannot start or, with --once, has nobody to ask or to tell, 2\n"
     "with other arguments.\n";
 
-/// What the arguments ask for, or the exit status where that is all.
-std::variant<tamblo::alsa::Bridge::Options, int> parse(std::span<const char* const> arguments) {
-    tamblo::alsa::Bridge::Options options;
-    for (std::size_t i = 0; i < arguments.size(); ++i) {
-        const std::string_view argument = arguments[i];
-        if (argument == "--help") {
-            std::fputs(kHelp, stdout);
-            return EXIT_SUCCESS;
-        }
-        if (argument == "--version") {
-            std::puts("tamblo-alsa " TAMBLO_VERSION);
-            return EXIT_SUCCESS;
-        }
-        if (argument == "--dry-run") {
-            options.isDry = true;
-        } else if (argument == "--once") {
-            options.once = true;
-        } else if ((argument == "--proc" || argument == "--dev") && i + 1 < arguments.size()) {
-            (argument == "--proc" ? options.processes : options.devices) = arguments[++i];
-        } else {
-            std::fprintf(stderr, "tamblo-alsa: unknown argument \"%.*s\"; --help lists them\n",
-                         static_cast<int>(argument.size()), argument.data());
-            return kWrongUse;
-        }
-    }
-    return options;
-}
-
-void blockSignals() {
-    sigset_t signals;
-    sigemptyset(&signals);
-    sigaddset(&signals, SIGTERM);
-    sigaddset(&signals, SIGINT);
-    pthread_sigmask(SIG_BLOCK, &signals, nullptr);
-}
-
 } // namespace
 
 int main(int argc, char* argv[]) {
     const std::span<const char* const> words(argv, static_cast<std::size_t>(argc));
-    const auto parsed = parse(words.subspan(argc > 0 ? 1 : 0));
-    if (const int* const status = std::get_if<int>(&parsed)) {
+    tamblo::alsa::Bridge::Options options;
+    if (const auto status = tamblo::bridge::parseArguments({"tamblo-alsa", TAMBLO_VERSION, kHelp},
+                                                           words.subspan(argc > 0 ? 1 : 0),
+                                                           {{"--dry-run", &options.isDry},
+                                                            {"--once", &options.once},
+                                                            {"--proc", &options.processes},
+                                                            {"--dev", &options.devices}})) {
         return *status;
     }
     const auto directories = tamblo::wire::Directories::ofThisProcess();
@@ -83,9 +45,9 @@ int main(int argc, char* argv[]) {
         std::fputs("tamblo-alsa: set RUNTIME_DIRECTORY and CONFIGURATION_DIRECTORY\n", stderr);
         return EXIT_FAILURE;
     }
-    blockSignals();
+    tamblo::bridge::blockEndingSignals();
     try {
-        return tamblo::alsa::Bridge(std::get<tamblo::alsa::Bridge::Options>(parsed), directories).run();
+        return tamblo::alsa::Bridge(options, directories).run();
     } catch (const std::exception& problem) {
         std::fprintf(stderr, "tamblo-alsa: %s\n", problem.what());
         return EXIT_FAILURE;

@@ -10,6 +10,8 @@ namespace tamblo::bridge {
 
 namespace {
 
+constexpr std::size_t kMostListBytes = 512;
+
 std::string channelsText(std::uint32_t channels) {
     switch (channels) {
     case 1:
@@ -34,6 +36,21 @@ double perceivedVolume(double linear) noexcept {
 double rounded(double value) noexcept {
     constexpr double digits = 1e6;
     return std::round(value * digits) / digits;
+}
+
+void addToList(std::string& list, std::string_view text) {
+    if (!text.empty() && list.size() + text.size() <= kMostListBytes) {
+        list += list.empty() ? "" : ", ";
+        list += text;
+    }
+}
+
+std::string joined(const std::set<std::string>& texts) {
+    std::string list;
+    for (const std::string& text : texts) {
+        addToList(list, text);
+    }
+    return list;
 }
 
 std::string upperCase(std::string_view text) {

@@ -3,6 +3,7 @@
 #include "base/Dictionary.h"
 
 #include <cstdint>
+#include <set>
 #include <string>
 #include <string_view>
 
@@ -21,6 +22,10 @@ struct StreamSettings {
 
 /// Six digits are more than anybody sees of a volume; the rest is noise of the arithmetic.
 [[nodiscard]] double rounded(double value) noexcept;
+
+/// Adds a text to a list with commas between, unless it is empty or the list would get too long.
+void addToList(std::string& list, std::string_view text);
+[[nodiscard]] std::string joined(const std::set<std::string>& texts);
 
 [[nodiscard]] std::string upperCase(std::string_view text);
 

@@ -1,12 +1,9 @@
 #include "bridge/pipewire/Bridge.h"
 
-#include <cerrno>
 #include <csignal>
 #include <cstdio>
 #include <cstdlib>
-#include <cstring>
 #include <utility>
-#include <variant>
 
 namespace tamblo::pipewire {
 
@@ -43,8 +40,7 @@ Bridge::Bridge(const Options& options, const wire::Directories& directories)
       server_(loop_, graph_, serverSocket_),
       serverPlace_{Endpoint(serverSocket_, clock_)},
       servicePlace_{Endpoint(directories.socketFile(), clock_)},
-      preferences_(PreferenceFile::of(directories.preferences(), kPreferencesDomain)),
-      preferencesWatcher_(directories.preferences()) {
+      preferences_(directories.preferences(), kPreferencesDomain, serviceTypes_) {
     graph_.addObserver(streams_);
     graph_.addObserver(device_);
     service_.addListener(streams_);
@@ -81,10 +77,7 @@ int Bridge::run() {
     for (const int signal : {SIGTERM, SIGINT}) {
         watches.push_back(loop_.watchSignal(signal, [this] { loop_.stop(); }));
     }
-    watches.push_back(loop_.watch(preferencesWatcher_.fileDescriptor(), [this] {
-        preferencesWatcher_.read([](auto) {});
-        readPreferences();
-    }));
+    watches.push_back(loop_.watch(preferences_.descriptor(), [this] { readPreferences(); }));
     watchPlace(serverPlace_);
     if (!options_.isDry) {
         watchPlace(servicePlace_);
@@ -100,16 +93,8 @@ int Bridge::run() {
 }
 
 void Bridge::readPreferences() {
-    if (!preferences_) {
-        return;
-    }
-    const auto read = preferences_->read();
-    if (const auto* const fault = std::get_if<std::string>(&read)) {
-        log(*fault);
-        return;
-    }
-    for (const std::string& fault : serviceTypes_.setPreferences(std::get<Dictionary>(read))) {
-        log(preferences_->path() + ": " + fault);
+    for (const std::string& fault : preferences_.read()) {
+        log(fault);
     }
 }
 

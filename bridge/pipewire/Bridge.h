@@ -2,6 +2,7 @@
 
 #include "bridge/common/Endpoint.h"
 #include "bridge/common/ServiceReporter.h"
+#include "bridge/common/ServiceTypePreferences.h"
 #include "bridge/common/ServiceTypes.h"
 #include "bridge/common/TextReporter.h"
 #include "bridge/pipewire/graph/Graph.h"
@@ -15,7 +16,6 @@
 #include "bridge/pipewire/server/Loop.h"
 #include "bridge/pipewire/server/Profiler.h"
 #include "bridge/pipewire/server/SoundServer.h"
-#include "os/PreferenceFile.h"
 #include "wire/Directories.h"
 
 #include <memory>
@@ -82,8 +82,7 @@ private:
     SoundServer server_;
     Place serverPlace_;
     Place servicePlace_;
-    std::optional<PreferenceFile> preferences_;
-    DirectoryWatcher preferencesWatcher_;
+    ServiceTypePreferences preferences_;
     std::unique_ptr<Loop::Watch> serviceWatch_;
     std::optional<SteadyTime> snapshotDue_; ///< when it is given up
     bool isBeyondLimits_ = false;

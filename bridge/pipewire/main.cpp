@@ -1,20 +1,14 @@
+#include "bridge/common/CommandLine.h"
 #include "bridge/pipewire/Bridge.h"
 
-#include <csignal>
 #include <cstdio>
 #include <cstdlib>
 #include <exception>
-#include <optional>
 #include <span>
-#include <string>
-#include <string_view>
-#include <variant>
 
 #include <pipewire/pipewire.h>
 
 namespace {
-
-constexpr int kWrongUse = 2;
 
 constexpr const char* kHelp =
     "usage: tamblo-pipewire [--dry-run] [--once] [--help | --version]\n"
@@ -34,46 +28,14 @@ constexpr const char* kHelp =
     "Exit status: 0 after a signal, 1 when it cannot start or, with --once, has nobody to ask or to tell, 2\n"
     "with other arguments.\n";
 
-/// What the arguments ask for, or the exit status where that is all.
-std::variant<tamblo::pipewire::Bridge::Options, int> parse(std::span<const char* const> arguments) {
-    tamblo::pipewire::Bridge::Options options;
-    for (const std::string_view argument : arguments) {
-        if (argument == "--help") {
-            std::fputs(kHelp, stdout);
-            return EXIT_SUCCESS;
-        }
-        if (argument == "--version") {
-            std::puts("tamblo-pipewire " TAMBLO_VERSION);
-            return EXIT_SUCCESS;
-        }
-        if (argument == "--dry-run") {
-            options.isDry = true;
-        } else if (argument == "--once") {
-            options.once = true;
-        } else {
-            std::fprintf(stderr, "tamblo-pipewire: unknown argument \"%.*s\"; --help lists them\n",
-                         static_cast<int>(argument.size()), argument.data());
-            return kWrongUse;
-        }
-    }
-    return options;
-}
-
-/// Before the library makes its first thread, which takes over what is blocked.
-void blockSignals() {
-    sigset_t signals;
-    sigemptyset(&signals);
-    sigaddset(&signals, SIGTERM);
-    sigaddset(&signals, SIGINT);
-    pthread_sigmask(SIG_BLOCK, &signals, nullptr);
-}
-
 } // namespace
 
 int main(int argc, char* argv[]) {
     const std::span<const char* const> words(argv, static_cast<std::size_t>(argc));
-    const auto parsed = parse(words.subspan(argc > 0 ? 1 : 0));
-    if (const int* const status = std::get_if<int>(&parsed)) {
+    tamblo::pipewire::Bridge::Options options;
+    if (const auto status = tamblo::bridge::parseArguments(
+            {"tamblo-pipewire", TAMBLO_VERSION, kHelp}, words.subspan(argc > 0 ? 1 : 0),
+            {{"--dry-run", &options.isDry}, {"--once", &options.once}})) {
         return *status;
     }
     const auto directories = tamblo::wire::Directories::ofThisProcess();
@@ -81,7 +43,7 @@ int main(int argc, char* argv[]) {
         std::fputs("tamblo-pipewire: set RUNTIME_DIRECTORY and CONFIGURATION_DIRECTORY\n", stderr);
         return EXIT_FAILURE;
     }
-    blockSignals();
+    tamblo::bridge::blockEndingSignals();
     pw_init(nullptr, nullptr);
     if (std::getenv("PIPEWIRE_DEBUG") == nullptr) {
         // Its warnings are about being set up without a configuration file, which is meant.
@@ -89,7 +51,7 @@ int main(int argc, char* argv[]) {
     }
     int status = EXIT_FAILURE;
     try {
-        tamblo::pipewire::Bridge bridge(std::get<tamblo::pipewire::Bridge::Options>(parsed), directories);
+        tamblo::pipewire::Bridge bridge(options, directories);
         status = bridge.run();
     } catch (const std::exception& problem) {
         std::fprintf(stderr, "tamblo-pipewire: %s\n", problem.what());

@@ -10,8 +10,6 @@ namespace tamblo::alsa {
 
 namespace {
 
-constexpr std::size_t kMostListBytes = 512;
-
 /// Samples of sound have a width, such as "S16_LE" and "FLOAT_LE"; what is coded is called after its code.
 std::string codecOf(std::string_view sample) {
     constexpr std::array<std::string_view, 6> codes{"IEC958", "MU_LAW", "A_LAW", "IMA_ADPCM", "MPEG", "GSM"};
@@ -29,12 +27,7 @@ std::string codecOf(std::string_view sample) {
 Dictionary settingsOfPcm(const std::set<std::string>& devices, const std::optional<PcmFormat>& format,
                          const std::optional<MixerVolume>& volume, bool isInput) {
     Dictionary settings;
-    std::string list;
-    for (const std::string& device : devices) {
-        if (list.size() + device.size() <= kMostListBytes) {
-            list += (list.empty() ? "" : ", ") + device;
-        }
-    }
+    const std::string list = bridge::joined(devices);
     settings.set("active_devices", list);
     if (isInput) {
         settings.set("vp_config_input_port", list);

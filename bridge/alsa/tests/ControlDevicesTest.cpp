@@ -28,25 +28,26 @@ struct MadeUpControl {
 };
 
 /// What the card has that answers this process's requests; nothing is listed of a card that fails.
-std::vector<MadeUpControl> controls;
-bool fails = false;
+std::vector<MadeUpControl> madeUpControls;
+bool listingFails = false;
 
-int answer(unsigned long request, void* argument) {
-    if (request == SNDRV_CTL_IOCTL_ELEM_LIST && !fails) {
+int answerLikeACard(unsigned long request, void* argument) {
+    if (request == SNDRV_CTL_IOCTL_ELEM_LIST && !listingFails) {
         auto& list = *static_cast<snd_ctl_elem_list*>(argument);
-        list.count = static_cast<unsigned>(controls.size());
+        list.count = static_cast<unsigned>(madeUpControls.size());
         for (list.used = 0; list.used < std::min(list.space, list.count); ++list.used) {
             snd_ctl_elem_id& id = list.pids[list.used];
             id = {};
             id.numid = list.used + 1;
             id.iface = SNDRV_CTL_ELEM_IFACE_MIXER;
-            std::memcpy(id.name, controls[list.used].name.data(), controls[list.used].name.size());
+            std::memcpy(id.name, madeUpControls[list.used].name.data(),
+                        madeUpControls[list.used].name.size());
         }
         return 0;
     }
     if (request == SNDRV_CTL_IOCTL_ELEM_INFO) {
         auto& info = *static_cast<snd_ctl_elem_info*>(argument);
-        const bool hasDecibels = !controls.at(info.id.numid - 1).decibels.empty();
+        const bool hasDecibels = !madeUpControls.at(info.id.numid - 1).decibels.empty();
         info.type = SNDRV_CTL_ELEM_TYPE_INTEGER;
         info.access = SNDRV_CTL_ELEM_ACCESS_READ | (hasDecibels ? SNDRV_CTL_ELEM_ACCESS_TLV_READ : 0U);
         info.count = 1;
@@ -55,12 +56,12 @@ int answer(unsigned long request, void* argument) {
     }
     if (request == SNDRV_CTL_IOCTL_ELEM_READ) {
         auto& value = *static_cast<snd_ctl_elem_value*>(argument);
-        value.value.integer.value[0] = controls.at(value.id.numid - 1).value;
+        value.value.integer.value[0] = madeUpControls.at(value.id.numid - 1).value;
         return 0;
     }
     if (request == SNDRV_CTL_IOCTL_TLV_READ) {
         auto* const words = static_cast<unsigned*>(argument);
-        const auto& decibels = controls.at(words[0] - 1).decibels;
+        const auto& decibels = madeUpControls.at(words[0] - 1).decibels;
         std::memcpy(words + 2, decibels.data(), decibels.size() * sizeof(unsigned));
         return 0;
     }
@@ -76,7 +77,7 @@ extern "C" int ioctl(int, unsigned long request, ...) noexcept {
     va_start(arguments, request);
     void* const argument = va_arg(arguments, void*);
     va_end(arguments);
-    return answer(request, argument);
+    return answerLikeACard(request, argument);
 }
 
 namespace tamblo::alsa {
@@ -98,19 +99,19 @@ TEST(AlsaControlDevices, areListedReadAndListedAnewWhenTheyAreOthers) {
         mixer->read();
     };
 
-    controls = {
+    madeUpControls = {
         {"Master Playback Volume", 100, {SNDRV_CTL_TLVT_DB_SCALE, 8, static_cast<unsigned>(-4000), 40}},
         {"PCM Playback Volume", 50},
         {"Headphone Jack", 1}};
     EXPECT_EQ(mixer->volume(false), MixerVolume{.linear = 0.125});
     EXPECT_EQ(mixer->volume(true), std::nullopt) << "it may have another name";
-    controls[0].value = 50;
+    madeUpControls[0].value = 50;
     tell(SNDRV_CTL_EVENT_MASK_VALUE);
     EXPECT_NEAR(mixer->volume(false)->linear, 0.0125, 1e-9);
-    controls = {{"Headphone Jack", 1}};
+    madeUpControls = {{"Headphone Jack", 1}};
     tell(SNDRV_CTL_EVENT_MASK_REMOVE);
     EXPECT_EQ(mixer->volume(false), MixerVolume{}) << "nothing changes the signal";
-    fails = true;
+    listingFails = true;
     tell(SNDRV_CTL_EVENT_MASK_ADD);
     EXPECT_EQ(mixer->volume(false), std::nullopt);
     card.reset();

@@ -17,20 +17,6 @@ namespace tamblo::pipewire {
 
 namespace {
 
-constexpr std::size_t kMostListBytes = 512;
-
-std::string joined(const std::set<std::string>& texts) {
-    std::string list;
-    for (const std::string& text : texts) {
-        if (text.empty() || list.size() + text.size() > kMostListBytes) {
-            continue;
-        }
-        list += list.empty() ? "" : ", ";
-        list += text;
-    }
-    return list;
-}
-
 /// "1024/48000", in seconds.
 void setLatency(Dictionary& settings, std::string_view latency) {
     const std::size_t slash = latency.find('/');
@@ -106,10 +92,7 @@ public:
             const Node& filter = *graph.node(id);
             hasSpatial_ = hasSpatial_ || isSpatial(filter.name) || isSpatial(filter.description);
             volume_ *= DeviceSettings::audible(filter.volume.value_or(Volume{}));
-            const std::string name = filterName(filter);
-            if (!name.empty() && names_.size() + name.size() <= kMostListBytes) {
-                names_ += (names_.empty() ? "" : ", ") + name;
-            }
+            addToList(names_, filterName(filter));
         }
     }
 

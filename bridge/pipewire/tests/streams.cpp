@@ -3,6 +3,9 @@
 //
 //     streams COUNT SECONDS [KEY=VALUE...]
 //
+// The seconds begin when the server knows all streams, however long that takes a busy one; at most ten
+// seconds are waited for it.
+//
 // KEY may be `capture`, which has the streams record; `bare`, which has them carry nothing but what they need
 // to be linked; `long`, which adds properties of 64 KiB; `broken`, which adds some that are not UTF-8;
 // `oversleep=MS`, which has the first stream sleep so long in the thread that moves sound, once a second.
@@ -25,7 +28,21 @@ namespace {
 constexpr std::uint32_t kRate = 48000;
 constexpr std::uint32_t kFrameBytes = 4; ///< two channels of 16 bits
 
+/// How long it takes, and the loop that ends then.
+struct Length {
+    pw_main_loop* loop = nullptr;
+    spa_source* timer = nullptr;
+    timespec seconds{};
+    unsigned unknown = 0; ///< streams that the server does not know yet
+
+    void beginWith(timespec time) const {
+        pw_loop_update_timer(pw_main_loop_get_loop(loop), timer, &time, nullptr, false);
+    }
+};
+
 struct Player {
+    Length* length = nullptr;
+    bool isKnown = false;
     pw_stream* stream = nullptr;
     spa_hook hook{};
     unsigned oversleepMilliseconds = 0;
@@ -57,10 +74,21 @@ void process(void* data) {
     }
 }
 
+void stateChanged(void* data, pw_stream_state, pw_stream_state state, const char*) {
+    auto& player = *static_cast<Player*>(data);
+    if (state >= PW_STREAM_STATE_PAUSED && !player.isKnown) {
+        player.isKnown = true;
+        if (--player.length->unknown == 0) {
+            player.length->beginWith(player.length->seconds);
+        }
+    }
+}
+
 constexpr pw_stream_events kEvents = [] {
     pw_stream_events events{};
     events.version = PW_VERSION_STREAM_EVENTS;
     events.process = process;
+    events.state_changed = stateChanged;
     return events;
 }();
 
@@ -144,20 +172,23 @@ int main(int argc, char* argv[]) {
     if (core == nullptr) {
         return EXIT_FAILURE;
     }
+    const auto end = [](void* data, std::uint64_t) { pw_main_loop_quit(static_cast<pw_main_loop*>(data)); };
+    const auto whole = static_cast<std::time_t>(options.seconds);
+    constexpr std::time_t mostWait = 10;
+    Length length{.loop = loop,
+                  .timer = pw_loop_add_timer(pw_main_loop_get_loop(loop), end, loop),
+                  .seconds = {whole, static_cast<long>((options.seconds - static_cast<double>(whole)) * 1e9)},
+                  .unknown = options.count};
+    length.beginWith({whole + mostWait, length.seconds.tv_nsec});
     std::vector<std::unique_ptr<Player>> players;
     for (unsigned i = 0; i < options.count; ++i) {
         auto& player = players.emplace_back(std::make_unique<Player>());
+        player->length = &length;
         player->oversleepMilliseconds = i == 0 ? options.oversleepMilliseconds : 0;
         if (!begin(*player, core, options)) {
             return EXIT_FAILURE;
         }
     }
-    const auto end = [](void* data, std::uint64_t) { pw_main_loop_quit(static_cast<pw_main_loop*>(data)); };
-    spa_source* const timer = pw_loop_add_timer(pw_main_loop_get_loop(loop), end, loop);
-    timespec when{
-        static_cast<std::time_t>(options.seconds),
-        static_cast<long>((options.seconds - static_cast<double>(static_cast<long>(options.seconds))) * 1e9)};
-    pw_loop_update_timer(pw_main_loop_get_loop(loop), timer, &when, nullptr, false);
     pw_main_loop_run(loop);
     for (const auto& player : players) {
         pw_stream_destroy(player->stream);
