@@ -83,8 +83,6 @@ constexpr std::array<Field<Node>, 2> kNodeNameFields{{
 
 constexpr std::array<Field<Route>, 1> kRouteFields{{{"port.type", &Route::portType}}};
 
-} // namespace
-
 MediaClass mediaClassOf(std::string_view text) noexcept {
     constexpr std::array<std::pair<std::string_view, MediaClass>, 8> classes{{
         {"Stream/Output/Audio", MediaClass::playbackStream},
@@ -104,6 +102,8 @@ MediaClass mediaClassOf(std::string_view text) noexcept {
     }
     return MediaClass::other;
 }
+
+} // namespace
 
 void takeProperty(Client& client, std::string_view key, std::string_view value) {
     takeText<ApplicationNames>(client.application, kApplicationFields, key, value);

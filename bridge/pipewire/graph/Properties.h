@@ -21,6 +21,4 @@ void takeProperty(Route& route, std::string_view key, std::string_view value);
 /// What a metadata object says of all (the subject 0): the default devices and the clock.
 void takeMetadata(Server& server, std::string_view key, std::string_view value);
 
-[[nodiscard]] MediaClass mediaClassOf(std::string_view text) noexcept;
-
 } // namespace tamblo::pipewire
