@@ -65,7 +65,7 @@ std::string SoundServer::findSocket() {
     if (name.front() == '/') {
         return name;
     }
-    const std::string ofSystem = "/run/pipewire/" + name;
+    std::string ofSystem = "/run/pipewire/" + name;
     for (const char* const place : {"PIPEWIRE_RUNTIME_DIR", "XDG_RUNTIME_DIR", "USERPROFILE"}) {
         if (const std::string directory = variable(place); !directory.empty()) {
             std::string own = formatted("{}/{}", directory, name);
