@@ -4,7 +4,7 @@
 #include "client/Vocabulary.h"
 #include "tools/Command.h"
 #include "tools/KnownSettings.h"
-#include "tools/SinkFile.h"
+#include "tools/records/SinkFile.h"
 #include "wire/Vocabulary.h"
 
 #include <algorithm>
