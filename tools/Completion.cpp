@@ -77,7 +77,7 @@ Values argumentsOf(const Command& command) {
         }
         return values;
     }
-    if (command.name == "tail") {
+    if (command.name == "tail" || command.name == "export") {
         for (const KnownSink& sink : knownSinks()) {
             add(values.words, sink.name);
         }
