@@ -30,6 +30,9 @@ constexpr std::size_t kMostParts = 64U << 10U;
 constexpr std::chrono::milliseconds kGathering{200};
 constexpr std::size_t kKeptCapacity = 1U << 20U;
 
+/// A payload has 32 levels at most, and stands some levels deep in its line.
+constexpr JsonReadOptions kSinkLine{.mostLevels = 40};
+
 std::string directoryOf(const std::string& path) {
     const std::size_t slash = path.find_last_of('/');
     return slash == 0 ? "/" : path.substr(0, slash);
@@ -191,7 +194,7 @@ Exporter::Counts Exporter::format(const Sink& sink, const Piece& piece) {
             ++counts.tooLarge;
             continue;
         }
-        auto read = parseJsonObject(line);
+        auto read = parseJsonObject(line, kSinkLine);
         auto* const fields = std::get_if<Dictionary>(&read);
         if (fields == nullptr) {
             ++counts.unreadable;
