@@ -324,6 +324,25 @@ TEST(Export, KeepsToTheRateAndToTheDaysBytes) {
     EXPECT_EQ(device.bash(TAMBLOCTL_PATH " export --daily 5").status, 2) << "nowhere to count";
 }
 
+TEST(Export, IsShippedInBatchesUntilTheyArrive) {
+    Device device;
+    device.write(2'500);
+    const CommandResult result = device.bash(
+        "export PATH=$(dirname " TAMBLOCTL_PATH "):$PATH\n"
+        "unpack() { if command -v zstd >/dev/null; then zstd -dqc; else zcat; fi; }\n"
+        "" EXAMPLES_DIR "/shipping/ship cursor 'cat >batch; if [ -e failed ]; then cat batch >>arrived; "
+        "else touch failed; false; fi' &\n"
+        "for ((i = 0; i != 200; ++i)); do\n"
+        "  sleep 0.05; [ \"$(unpack <arrived 2>/dev/null | wc -l)\" != 2500 ] || break\n"
+        "done\n"
+        "sleep 0.3; kill $!; wait $! || exit; unpack <arrived; take");
+    EXPECT_EQ(result.status, 0);
+    const auto numbers = numbersIn(result.output);
+    EXPECT_EQ(numbers.size(), 2'500U);
+    EXPECT_TRUE(std::ranges::all_of(numbers, [](const auto& number) { return number.second == 1; }));
+    EXPECT_THAT(result.output, HasSubstr("\n0 records\n"));
+}
+
 TEST(Export, FollowsWhatTheServiceWrites) {
     ServiceProcess service;
     Session client(service.socketPath());
