@@ -371,5 +371,34 @@ TEST(Export, FollowsWhatTheServiceWrites) {
                 HasSubstr("0 records"));
 }
 
+TEST(Export, KnowsFromTheServiceHowManyLinesWereInFilesThatItNeverSaw) {
+    for (const int seen : {0, 3}) {
+        ServiceProcess service;
+        Session client(service.socketPath());
+        const std::string command = "export analytics-events -c " + service.runtimeDirectory() + "/cursor";
+        int number = 0;
+        const auto send = [&](int count) {
+            for (const int end = number + count; number != end; ++number) {
+                EXPECT_TRUE(client.call(message({{"n", number}})));
+            }
+        };
+        send(seen);
+        EXPECT_EQ(service.tambloctl(command).status, 0);
+        send(57);
+        const auto file = service.logs() / "analytics-events.jsonl";
+        EXPECT_EQ(linesOf(file).size(), 2U * 57 + 2U * static_cast<unsigned>(seen)) << "under both names";
+        std::filesystem::remove(file);
+        // The service looks for its file ten times a second.
+        EXPECT_TRUE(eventually([&] {
+            std::this_thread::sleep_for(std::chrono::milliseconds(120));
+            send(1);
+            return std::filesystem::exists(file);
+        }));
+        const std::string said = service.tambloctl(command + " -e none").output;
+        EXPECT_THAT(said, HasSubstr("analytics-events: 114 lines that were not exported"));
+        EXPECT_THAT(said, testing::Not(HasSubstr("may be missing")));
+    }
+}
+
 } // namespace
 } // namespace tamblo::test

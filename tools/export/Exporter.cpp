@@ -47,9 +47,12 @@ bool hasTooManyParts(std::string_view line) {
 } // namespace
 
 Exporter::Exporter(ExportPlan plan, Cursor cursor, ExportOutput& output)
-    : plan_(std::move(plan)), cursor_(std::move(cursor)), output_(output) {
-    for (const auto& [name, path] : plan_.sinks) {
-        sinks_.push_back({name, SinkBacklog(path, cursor_.progress(name))});
+    : plan_(std::move(plan)),
+      cursor_(std::move(cursor)),
+      output_(output),
+      serviceCount_(plan_.runtimeDirectory) {
+    for (const auto& [name, path, isOfService] : plan_.sinks) {
+        sinks_.push_back({name, SinkBacklog(path, cursor_.progress(name)), isOfService});
         directories_.insert(directoryOf(path));
     }
 }
@@ -65,7 +68,10 @@ std::optional<std::string> Exporter::run() {
         goesOn = exportBacklog() && plan_.follows && awaitMore();
     }
     // What was not acknowledged has been taken once the output is closed.
-    if (problem_.empty() && (output_.close() || (problem_ = output_.problem()).empty())) {
+    if (problem_.empty() && !output_.close()) {
+        problem_ = output_.problem();
+    }
+    if (problem_.empty()) {
         (void)store();
     }
     if (problem_.empty() && !said_.empty()) {
@@ -110,9 +116,27 @@ bool Exporter::exportBacklog() {
     return true;
 }
 
+/// Where files are gone that nobody has seen to their end, the service may know how many lines they had: what
+/// it has written since the last look, but for what is there.
+MissedLines Exporter::look(Sink& sink) {
+    const auto before = cursor_.written(sink.name);
+    const auto now = sink.isOfService ? serviceCount_.of(sink.name) : std::nullopt;
+    const bool hadNone = sink.backlog.progress().empty();
+    MissedLines missed = sink.backlog.look();
+    const auto written = before && now ? now->since(*before) : std::nullopt;
+    if ((missed.uncounted || hadNone) && written) {
+        missed.known += *written - std::min(*written, sink.backlog.newLines());
+        missed.uncounted.reset();
+    }
+    if (now) {
+        cursor_.setWritten(sink.name, *now);
+    }
+    return missed;
+}
+
 void Exporter::look() {
     for (Sink& sink : sinks_) {
-        if (const MissedLines missed = sink.backlog.look(); !missed.isEmpty()) {
+        if (const MissedLines missed = look(sink); !missed.isEmpty()) {
             counts_.missed += missed.known;
             sayMissed(sink, missed);
         }
