@@ -81,14 +81,17 @@ std::optional<std::string> Exporter::run() {
 }
 
 bool Exporter::exportBacklog() {
-    (void)hasNews();
     startDay();
-    look();
+    lookAtNews();
     counts_.left = 0;
     const std::uint64_t most = plan_.batch != 0 ? plan_.batch : kUsualBatch;
     std::uint64_t lines = most;
     Piece piece;
     while (Sink* const sink = next(piece, lines)) {
+        if (hasNews_) {
+            lookAtNews(); // what has just come may be wanted before what is left
+            continue;
+        }
         if (ExportOutput::isEnding()) {
             return false;
         }
@@ -109,11 +112,15 @@ bool Exporter::exportBacklog() {
         if (outcome == Outcome::taken) {
             ++turn_;
         }
-        if (hasNews()) {
-            look(); // what has just come may be wanted before what is left
-        }
+        readEvents();
     }
     return true;
+}
+
+void Exporter::lookAtNews() {
+    readEvents();
+    hasNews_ = false;
+    look();
 }
 
 /// Where files are gone that nobody has seen to their end, the service may know how many lines they had: what
@@ -262,7 +269,7 @@ bool Exporter::awaitMore() {
         const std::int64_t left = kSecondsPerDay - std::time(nullptr) % kSecondsPerDay;
         return output_.wait(-1, std::chrono::seconds(left)) != ExportOutput::Woken::byEnd;
     }
-    return output_.wait(watch_.get(), std::nullopt) != ExportOutput::Woken::byEnd &&
+    return (hasNews_ || output_.wait(watch_.get(), std::nullopt) != ExportOutput::Woken::byEnd) &&
            output_.wait(-1, kGathering) != ExportOutput::Woken::byEnd && watch();
 }
 
@@ -282,13 +289,11 @@ bool Exporter::watch() {
     return true;
 }
 
-bool Exporter::hasNews() {
+void Exporter::readEvents() {
     std::array<char, 16U << 10U> events;
-    bool hasSome = false;
     while (plan_.follows && ::read(watch_.get(), events.data(), events.size()) > 0) {
-        hasSome = true;
+        hasNews_ = true;
     }
-    return hasSome;
 }
 
 bool Exporter::store() {

@@ -78,8 +78,9 @@ private:
     void startDay();
     /// Whether what the piece comes to, in `out_`, may still go today.
     [[nodiscard]] bool fitsBudget(const Piece& piece) const;
-    /// Whether something was written since this was asked last; only where new lines are followed.
-    [[nodiscard]] bool hasNews();
+    /// Notes whether something was written; only where new lines are followed.
+    void readEvents();
+    void lookAtNews();
     /// Until there may be more to export. False at the end.
     [[nodiscard]] bool awaitMore();
     [[nodiscard]] bool watch();
@@ -93,6 +94,7 @@ private:
     std::set<std::string> directories_;
     std::size_t turn_ = 0;
     bool isBudgetSpent_ = false;
+    bool hasNews_ = false; ///< since the last look
     FileDescriptor watch_;
     TextBuffer out_;
     Counts counts_;
