@@ -87,6 +87,7 @@ public:
         EXPECT_EQ(::pipe2(fromExport, O_CLOEXEC), 0);
         arguments.insert(arguments.begin(), {"tambloctl", "export", "-c", directory + "/cursor"});
         std::vector<char*> words;
+        words.reserve(arguments.size() + 1);
         for (std::string& argument : arguments) {
             words.push_back(argument.data());
         }
