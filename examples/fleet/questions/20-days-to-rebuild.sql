@@ -1,0 +1,9 @@
+-- Days whose daily figures are not those of the records: where a server ended in the middle of a load. `run PLACE rebuild
+-- DAY` puts them right.
+SELECT day, counted, kept
+FROM (
+    SELECT day, sum(records) AS counted FROM fleet.daily_devices GROUP BY day
+) ANY LEFT JOIN (
+    SELECT day, uniqExact(cityHash64(id)) AS kept FROM fleet.records GROUP BY day
+) USING day
+WHERE counted != kept ORDER BY day
