@@ -66,4 +66,4 @@ install(DIRECTORY examples DESTINATION "${CMAKE_INSTALL_DOCDIR}" USE_SOURCE_PERM
     PATTERN demo EXCLUDE PATTERN __pycache__ EXCLUDE)
 install(DIRECTORY docs DESTINATION "${CMAKE_INSTALL_DOCDIR}")
 install(FILES README.md DESTINATION "${CMAKE_INSTALL_DOCDIR}")
-install(FILES packaging/audio_issue_detected.proto DESTINATION "${CMAKE_INSTALL_DATADIR}/tamblo")
+install(FILES packaging/audio_issue_detected.proto packaging/exported_record.proto DESTINATION "${CMAKE_INSTALL_DATADIR}/tamblo")

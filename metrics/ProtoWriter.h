@@ -2,6 +2,8 @@
 
 #include "base/TextBuffer.h"
 
+#include <bit>
+#include <cstddef>
 #include <cstdint>
 #include <string_view>
 
@@ -26,10 +28,27 @@ public:
     void signed32(std::uint32_t field, std::int32_t value) {
         unsigned64(field, static_cast<std::uint64_t>(std::int64_t{value}));
     }
+    void double64(std::uint32_t field, double value) {
+        varint(std::uint64_t{field} << 3U | 1U);
+        for (auto bits = std::bit_cast<std::uint64_t>(value), i = std::uint64_t{0}; i != 8; ++i) {
+            out_.append(static_cast<char>(bits >> 8 * i));
+        }
+    }
     void string(std::uint32_t field, std::string_view bytes) {
-        varint(std::uint64_t{field} << 3U | 2U);
-        varint(bytes.size());
+        beginNested(field, bytes.size());
         out_.append(bytes);
+    }
+    /// What stands before a message in a stream of them.
+    void length(std::size_t bytes) { varint(bytes); }
+    /// A message within this one, of which so many bytes follow.
+    void beginNested(std::uint32_t field, std::size_t bytes) {
+        varint(std::uint64_t{field} << 3U | 2U);
+        varint(bytes);
+    }
+    /// The bytes that a varint takes.
+    [[nodiscard]] static constexpr std::size_t varintSize(std::uint64_t value) noexcept {
+        constexpr std::size_t kBits = 7;
+        return (static_cast<std::size_t>(std::bit_width(value | 1U)) + kBits - 1) / kBits;
     }
 
 private:

@@ -14,6 +14,8 @@ inline constexpr std::string_view kSinksDomain = "com.vandra.tamblo.sinks";
 inline constexpr std::string_view kLimitsDomain = "com.vandra.tamblo.limits";
 /// By which a developer has an internal build capture or draft something.
 inline constexpr std::string_view kCapturesDomain = "com.vandra.tamblo.zrreporting";
+/// That of `tambloctl export`.
+inline constexpr std::string_view kExportDomain = "com.vandra.tamblo.export";
 /// That of tamblo-pipewire.
 inline constexpr std::string_view kPipeWireDomain = "com.vandra.tamblo.pipewire";
 inline constexpr std::string_view kAccessoriesDomain = "com.vandra.tamblo.accessories";

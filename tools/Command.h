@@ -85,6 +85,7 @@ extern const Command kCommandNotify;
 extern const Command kCommandPreference;
 extern const Command kCommandDecode;
 extern const Command kCommandReport;
+extern const Command kCommandExport;
 extern const Command kCommandKill;
 extern const Command kCommandStatus;
 extern const Command kCommandClients;

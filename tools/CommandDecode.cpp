@@ -1,9 +1,9 @@
 #include "base/Format.h"
 #include "os/FileDescriptor.h"
 #include "os/SmallFile.h"
-#include "tools/AccessFault.h"
 #include "tools/Command.h"
 #include "tools/Decode.h"
+#include "tools/records/AccessFault.h"
 
 #include <cerrno>
 #include <cstdio>

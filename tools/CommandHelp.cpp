@@ -9,10 +9,10 @@ namespace tamblo::tools {
 namespace {
 
 constexpr const Command* kCommands[] = {
-    &kCommandSend,   &kCommandSession,    &kCommandRecord, &kCommandReporters, &kCommandValidate,
-    &kCommandTail,   &kCommandTap,        &kCommandDecode, &kCommandReport,    &kCommandList,
-    &kCommandNotify, &kCommandPreference, &kCommandStatus, &kCommandClients,   &kCommandSessions,
-    &kCommandTop,    &kCommandKill,
+    &kCommandSend,     &kCommandSession, &kCommandRecord,     &kCommandReporters, &kCommandValidate,
+    &kCommandTail,     &kCommandTap,     &kCommandDecode,     &kCommandReport,    &kCommandExport,
+    &kCommandList,     &kCommandNotify,  &kCommandPreference, &kCommandStatus,    &kCommandClients,
+    &kCommandSessions, &kCommandTop,     &kCommandKill,
 };
 
 constexpr std::size_t kNameColumn = 12;

@@ -3,8 +3,8 @@
 #include "tools/Command.h"
 #include "tools/KnownSettings.h"
 #include "tools/ServiceConnection.h"
-#include "tools/SinkFile.h"
 #include "tools/Table.h"
+#include "tools/records/SinkFile.h"
 #include "wire/LogCodes.h"
 #include "wire/Vocabulary.h"
 

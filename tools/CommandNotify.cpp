@@ -2,8 +2,8 @@
 #include "base/NumberText.h"
 #include "os/ReplaceFile.h"
 #include "os/SmallFile.h"
-#include "tools/AccessFault.h"
 #include "tools/Command.h"
+#include "tools/records/AccessFault.h"
 #include "wire/Directories.h"
 
 #include <cerrno>

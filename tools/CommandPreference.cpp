@@ -2,9 +2,9 @@
 #include "base/Json.h"
 #include "os/Directory.h"
 #include "os/PreferenceFile.h"
-#include "tools/AccessFault.h"
 #include "tools/Command.h"
 #include "tools/KnownSettings.h"
+#include "tools/records/AccessFault.h"
 #include "wire/Directories.h"
 
 #include <cerrno>

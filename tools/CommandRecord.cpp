@@ -3,14 +3,14 @@
 #include "base/NumberText.h"
 #include "tools/Command.h"
 #include "tools/LiveRecorder.h"
-#include "tools/Payload.h"
 #include "tools/ServiceConnection.h"
 #include "tools/SessionFile.h"
 #include "tools/SessionRecorder.h"
-#include "tools/SinkFile.h"
-#include "tools/SinkSnapshot.h"
 #include "tools/StatusConnection.h"
 #include "tools/TapLines.h"
+#include "tools/records/Payload.h"
+#include "tools/records/SinkFile.h"
+#include "tools/records/SinkSnapshot.h"
 #include "wire/Directories.h"
 
 #include <algorithm>

@@ -1,13 +1,13 @@
 #include "base/Format.h"
 #include "base/Json.h"
 #include "base/NumberText.h"
-#include "tools/AccessFault.h"
 #include "tools/Command.h"
-#include "tools/Payload.h"
 #include "tools/ServiceConnection.h"
 #include "tools/SessionFile.h"
 #include "tools/SessionPlayer.h"
 #include "tools/SessionSummaries.h"
+#include "tools/records/AccessFault.h"
+#include "tools/records/Payload.h"
 #include "wire/Directories.h"
 
 #include <algorithm>

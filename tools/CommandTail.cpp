@@ -3,14 +3,14 @@
 #include "base/NumberText.h"
 #include "base/Rfc3339.h"
 #include "os/FileDescriptor.h"
-#include "tools/AccessFault.h"
 #include "tools/Command.h"
 #include "tools/Decode.h"
-#include "tools/Payload.h"
-#include "tools/RecordFilter.h"
 #include "tools/ServiceConnection.h"
-#include "tools/SinkFile.h"
 #include "tools/TimeText.h"
+#include "tools/records/AccessFault.h"
+#include "tools/records/Payload.h"
+#include "tools/records/RecordFilter.h"
+#include "tools/records/SinkFile.h"
 #include "wire/Directories.h"
 
 #include <algorithm>

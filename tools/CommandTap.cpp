@@ -5,10 +5,10 @@
 #include "client/Vocabulary.h"
 #include "os/FileDescriptor.h"
 #include "tools/Command.h"
-#include "tools/Payload.h"
 #include "tools/ServiceConnection.h"
 #include "tools/StatusConnection.h"
 #include "tools/TapLines.h"
+#include "tools/records/Payload.h"
 
 #include <array>
 #include <csignal>

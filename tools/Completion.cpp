@@ -4,7 +4,7 @@
 #include "client/Vocabulary.h"
 #include "tools/Command.h"
 #include "tools/KnownSettings.h"
-#include "tools/SinkFile.h"
+#include "tools/records/SinkFile.h"
 #include "wire/Vocabulary.h"
 
 #include <algorithm>
@@ -77,7 +77,7 @@ Values argumentsOf(const Command& command) {
         }
         return values;
     }
-    if (command.name == "tail") {
+    if (command.name == "tail" || command.name == "export") {
         for (const KnownSink& sink : knownSinks()) {
             add(values.words, sink.name);
         }

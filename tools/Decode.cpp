@@ -6,8 +6,8 @@
 #include "base/Rfc3339.h"
 #include "base/SplitText.h"
 #include "tools/MetricRecord.h"
-#include "tools/Payload.h"
-#include "tools/SinkFile.h"
+#include "tools/records/Payload.h"
+#include "tools/records/SinkFile.h"
 
 #include <algorithm>
 #include <array>

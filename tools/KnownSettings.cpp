@@ -50,6 +50,8 @@ std::vector<KnownPreference> makePreferences() {
         {kCapturesDomain, "io_cycle", number, "the least io_cycle of an overload (0)"},
         {kCapturesDomain, "wait_time", number, "microseconds from the message to the capture (0)"},
         {kAccessoriesDomain, "registered", object, "the accessories known, which the service stores"},
+        {kExportDomain, "device_salt", any,
+         "read by tambloctl export: another gives the device another identity"},
         {kPipeWireDomain, "service_types", object, "read by tamblo-pipewire: names of service types by role"},
         {kPipeWireDomain, "service_types_of_applications", object,
          "the same by application, whatever the role"},

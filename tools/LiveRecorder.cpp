@@ -2,7 +2,7 @@
 
 #include "base/Format.h"
 #include "client/Vocabulary.h"
-#include "tools/Payload.h"
+#include "tools/records/Payload.h"
 
 #include <utility>
 #include <variant>

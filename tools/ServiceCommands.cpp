@@ -1,8 +1,8 @@
 #include "base/Format.h"
 #include "base/Json.h"
 #include "tools/Command.h"
-#include "tools/Payload.h"
 #include "tools/ServiceConnection.h"
+#include "tools/records/Payload.h"
 
 #include <vector>
 

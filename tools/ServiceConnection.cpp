@@ -2,7 +2,7 @@
 
 #include "base/Format.h"
 #include "base/NumberText.h"
-#include "tools/AccessFault.h"
+#include "tools/records/AccessFault.h"
 
 #include <algorithm>
 #include <cerrno>

@@ -3,7 +3,7 @@
 #include "base/Format.h"
 #include "base/Json.h"
 #include "base/TextBuffer.h"
-#include "tools/Payload.h"
+#include "tools/records/Payload.h"
 
 #include <algorithm>
 #include <array>

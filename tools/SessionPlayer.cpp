@@ -2,9 +2,9 @@
 
 #include "base/Format.h"
 #include "base/Json.h"
-#include "tools/Payload.h"
 #include "tools/SessionFile.h"
 #include "tools/TimeText.h"
+#include "tools/records/Payload.h"
 
 #include <algorithm>
 #include <cstdio>

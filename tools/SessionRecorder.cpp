@@ -3,7 +3,7 @@
 #include "base/Format.h"
 #include "base/Json.h"
 #include "client/Vocabulary.h"
-#include "tools/Payload.h"
+#include "tools/records/Payload.h"
 
 #include <limits>
 #include <utility>

@@ -2,7 +2,7 @@
 
 #include "base/Dictionary.h"
 #include "tools/SessionFile.h"
-#include "tools/SinkSnapshot.h"
+#include "tools/records/SinkSnapshot.h"
 
 #include <cstdint>
 #include <optional>

@@ -1,9 +1,9 @@
 #include "tools/SessionSummaries.h"
 
 #include "base/Format.h"
-#include "tools/AccessFault.h"
-#include "tools/Payload.h"
 #include "tools/Table.h"
+#include "tools/records/AccessFault.h"
+#include "tools/records/Payload.h"
 
 #include <algorithm>
 #include <array>

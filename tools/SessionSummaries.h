@@ -1,7 +1,7 @@
 #pragma once
 
 #include "base/Dictionary.h"
-#include "tools/SinkFile.h"
+#include "tools/records/SinkFile.h"
 
 #include <cstdint>
 #include <span>

@@ -2,9 +2,9 @@
 #include "tests/fakes/FakeDevice.h"
 #include "tools/Command.h"
 #include "tools/KnownSettings.h"
-#include "tools/Payload.h"
-#include "tools/RecordFilter.h"
 #include "tools/TimeText.h"
+#include "tools/records/Payload.h"
+#include "tools/records/RecordFilter.h"
 #include "util/LogCategories.h"
 #include "wire/LogCodes.h"
 

@@ -2,10 +2,10 @@
 #include "base/Json.h"
 #include "tests/client/FakeService.h"
 #include "tools/Decode.h"
-#include "tools/Payload.h"
 #include "tools/SessionPlayer.h"
 #include "tools/SessionSummaries.h"
-#include "tools/SinkFile.h"
+#include "tools/records/Payload.h"
+#include "tools/records/SinkFile.h"
 
 #include <map>
 

@@ -1,8 +1,8 @@
-#include "tools/SinkSnapshot.h"
+#include "tools/records/SinkSnapshot.h"
 
 #include "base/Format.h"
-#include "tools/AccessFault.h"
-#include "tools/SinkFile.h"
+#include "tools/records/AccessFault.h"
+#include "tools/records/SinkFile.h"
 
 #include <algorithm>
 #include <cerrno>

@@ -1,8 +1,8 @@
-#include "tools/RecordFilter.h"
+#include "tools/records/RecordFilter.h"
 
 #include "base/NamePattern.h"
-#include "tools/Payload.h"
-#include "tools/SinkFile.h"
+#include "tools/records/Payload.h"
+#include "tools/records/SinkFile.h"
 
 #include <algorithm>
 

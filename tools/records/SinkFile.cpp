@@ -1,8 +1,8 @@
-#include "tools/SinkFile.h"
+#include "tools/records/SinkFile.h"
 
 #include "base/Format.h"
 #include "base/Json.h"
-#include "tools/Payload.h"
+#include "tools/records/Payload.h"
 
 #include <algorithm>
 #include <array>

@@ -1,4 +1,4 @@
-#include "tools/AccessFault.h"
+#include "tools/records/AccessFault.h"
 
 #include "base/Format.h"
 #include "os/FileDescriptor.h"

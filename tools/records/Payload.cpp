@@ -1,4 +1,4 @@
-#include "tools/Payload.h"
+#include "tools/records/Payload.h"
 
 #include "base/Format.h"
 
