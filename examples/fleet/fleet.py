@@ -148,13 +148,14 @@ class Fleet:
             raise Failed(ran.stderr.strip() or "clickhouse-client failed")
         return ran.stdout
 
-    def load(self, records, number):
-        """Takes records, a file of columns, to a shard; those that it has already are left out."""
+    def load(self, records, number, source):
+        """Takes records, a file of columns, to a shard; those that it has already are left out. A shard takes one load
+        of a source at a time: what is left of one whose shipper was killed ends before the next can look what there is."""
         arrivals = f"arrivals_{os.getpid()}_{time.monotonic_ns()}"
         self.query(statements("schema", "arrivals.sql", ARRIVALS=arrivals), number)
         try:
             self.query(f"INSERT INTO fleet.{arrivals} ({COLUMNS}) FORMAT TabSeparated", number, records)
-            self.query(statements("load.sql", ARRIVALS=arrivals), number)
+            self.query(statements("load.sql", ARRIVALS=arrivals), number, settings=(f"--query_id=load {source}",))
         finally:
             with contextlib.suppress(Failed):
                 self.query(f"DROP TABLE IF EXISTS fleet.{arrivals}", number)
