@@ -59,6 +59,14 @@ def statements(*parts, **words):
     return text.strip()
 
 
+def export(device, options, stdout, **environment):
+    """Writes what a made device has as columns."""
+    places = {"LOGS_DIRECTORY": "logs", "CONFIGURATION_DIRECTORY": "config", "RUNTIME_DIRECTORY": "run"}
+    environment = {**os.environ, **environment, **{name: os.path.join(device, part) for name, part in places.items()}}
+    return subprocess.run([environment.get("TAMBLOCTL", "tambloctl"), "export", "--format", "columns", *options],
+                          env=environment, check=True, stdout=stdout, stderr=subprocess.DEVNULL)
+
+
 class Fleet:
     """The shards that were made at a place: shard I is there at places[i]."""
 

@@ -11,7 +11,7 @@ FROM (
         WHERE id NOT IN (
             SELECT id FROM fleet.records_local WHERE device IN (SELECT device FROM fleet.ARRIVALS)
               AND day IN (SELECT day FROM fleet.ARRIVALS))
-    ) ANY LEFT JOIN (
+    ) AS fresh ANY LEFT JOIN (
         SELECT device, day, argMax(said_kind, time) AS kind, argMax(said_release, time) AS release,
                argMax(said_driver, time) AS driver, argMax(said_driver_version, time) AS driver_version
         FROM (
@@ -25,9 +25,9 @@ FROM (
                    driver_version AS said_driver_version
             FROM fleet.devices_local WHERE device IN (SELECT device FROM fleet.ARRIVALS)
         ) GROUP BY device, day
-    ) USING device, day
-) ANY LEFT JOIN (
+    ) AS of_day USING (device, day)
+) AS of_days ANY LEFT JOIN (
     SELECT device, argMax(kind, time) AS last_kind, argMax(release, time) AS last_release,
            argMax(driver, time) AS last_driver, argMax(driver_version, time) AS last_driver_version
     FROM fleet.devices_local WHERE device IN (SELECT device FROM fleet.ARRIVALS) GROUP BY device
-) USING device
+) AS last USING (device)

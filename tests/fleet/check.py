@@ -19,7 +19,8 @@ sys.path[:0] = [EXAMPLE, os.path.join(HERE, "..", "report")]
 
 from answers import Answers  # noqa: E402
 from asking import answer, questions  # noqa: E402
-from fleet import Failed, Fleet  # noqa: E402
+from current import CurrentEngine  # noqa: E402
+from fleet import Failed, Fleet, export  # noqa: E402
 
 DEVICES, DAYS = 120, 14
 CLOSE = 1e-5  # sums of single-precision lengths, in another order
@@ -66,14 +67,20 @@ class Check:
         columns, rows, _ = answer(self.fleet, statement)
         return [dict(zip(columns, row)) for row in rows]
 
-    def differing(self):
+    def whole_answer(self, statement):
+        _, rows, answered = answer(self.fleet, statement)
+        if answered != len(self.fleet.shards):
+            raise SystemExit(f"check: only {answered} shards have answered")
+        return rows
+
+    def differing(self, rows_of=None):
+        """The questions whose answers are not those of the lines."""
         wrong = []
         for name, _, statement in questions([]):
-            _, rows, answered = answer(self.fleet, statement)
+            rows = in_order((rows_of or self.whole_answer)(statement))
             expected = in_order(self.answers.question(int(name[:2])))
-            same = answered == len(self.fleet.shards) and len(rows) == len(expected) and all(
-                len(row) == len(other) and all(map(is_same, row, other)) for row, other in zip(in_order(rows), expected))
-            if not same:
+            if len(rows) != len(expected) or not all(
+                    len(row) == len(other) and all(map(is_same, row, other)) for row, other in zip(rows, expected)):
                 wrong.append(name)
         if wrong:
             print(f"  other than the lines say: {', '.join(wrong)}", flush=True)
@@ -92,6 +99,22 @@ class Check:
         lines = len(self.answers.records)
         expect(self.count().split() == [str(lines)] * 3, f"all {lines} lines have arrived, each once")
         expect(self.differing() == [], "the twenty answers are those of the lines")
+
+    def current(self, place):
+        print("The same on a current ClickHouse")
+        if shutil.which("npm") is None:
+            print("  not tried: there is no npm")
+            return
+        records = os.path.join(place, "records.tsv")
+        with open(records, "wb") as file:
+            for device, _ in self.answers.by_device:
+                export(os.path.join(self.made, device), [], TAMBLOCTL=self.environment["TAMBLOCTL"], stdout=file)
+        engine = CurrentEngine(os.path.join(place, "current"))
+        try:
+            engine.fill(records)
+            expect(self.differing(engine.query) == [], f"the twenty answers of {engine.version} are those of the lines")
+        finally:
+            engine.close()
 
     def repeat(self):
         print("Records come again")
@@ -217,6 +240,7 @@ def main(programs):
     check = Check(os.path.realpath(programs), place)
     try:
         check.compare()
+        check.current(place)
         check.repeat()
         check.planted()
         check.faults()

@@ -5,9 +5,9 @@ SELECT device, now_kind AS kind, (overloads + 0.5) / (hours + 1) AS before_rate,
 FROM (
     SELECT device, any(kind) AS now_kind, sum(overloads) AS now_overloads, sum(active_seconds) / 3600 AS now_hours
     FROM fleet.daily_devices WHERE day > (SELECT max(day) FROM fleet.daily_devices) - 5 GROUP BY device
-) ANY LEFT JOIN (
+) AS one ANY LEFT JOIN (
     SELECT device, sum(overloads) AS overloads, sum(active_seconds) / 3600 AS hours
     FROM fleet.daily_devices WHERE day <= (SELECT max(day) FROM fleet.daily_devices) - 5 GROUP BY device
-) USING device
+) AS other USING (device)
 WHERE now_overloads >= 5 AND deviations > 5
 ORDER BY deviations DESC, device

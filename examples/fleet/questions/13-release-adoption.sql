@@ -2,7 +2,7 @@
 SELECT day, release, devices, devices / heard AS share
 FROM (
     SELECT day, release, uniqExact(device) AS devices FROM fleet.daily_devices GROUP BY day, release
-) ANY LEFT JOIN (
+) AS one ANY LEFT JOIN (
     SELECT day, uniqExact(device) AS heard FROM fleet.daily_devices GROUP BY day
-) USING day
+) AS other USING (day)
 ORDER BY day, release

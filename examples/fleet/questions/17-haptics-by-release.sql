@@ -2,8 +2,8 @@
 SELECT release, engine_seconds, sound_seconds, engine_seconds / sound_seconds AS engine_share
 FROM (
     SELECT release, sum(seconds) AS engine_seconds FROM fleet.daily_haptics GROUP BY release
-) ANY LEFT JOIN (
+) AS one ANY LEFT JOIN (
     SELECT release, sum(active_seconds) AS sound_seconds FROM fleet.daily_sessions
     WHERE application IN (SELECT application FROM fleet.daily_haptics_local) GROUP BY release
-) USING release
+) AS other USING (release)
 ORDER BY release

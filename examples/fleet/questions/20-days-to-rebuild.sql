@@ -3,7 +3,7 @@
 SELECT day, counted, kept
 FROM (
     SELECT day, sum(records) AS counted FROM fleet.daily_devices GROUP BY day
-) ANY LEFT JOIN (
+) AS one ANY LEFT JOIN (
     SELECT day, uniqExact(cityHash64(id)) AS kept FROM fleet.records GROUP BY day
-) USING day
+) AS other USING (day)
 WHERE counted != kept ORDER BY day
