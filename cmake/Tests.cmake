@@ -39,7 +39,7 @@ file(GLOB_RECURSE hostile_sources CONFIGURE_DEPENDS RELATIVE "${CMAKE_SOURCE_DIR
 list(FILTER unit_sources EXCLUDE REGEX "^tests/(service|service_core|session|fakes|hostile)/")
 
 tamblo_tests(tamblo_unit_tests LABEL unit SOURCES ${unit_sources}
-    LIBRARIES tests/fakes service workers system platform/linux tools/report tools client wire metrics)
+    LIBRARIES tests/fakes service workers system platform/linux tools/export tools/report tools client wire metrics)
 # Sessions and the service with a list of worker classes of the tests' own.
 tamblo_tests(tamblo_core_tests LABEL unit SOURCES ${core_sources} LIBRARIES tests/fakes service session)
 tamblo_tests(tamblo_service_tests LABEL service SOURCES ${service_sources} LIBRARIES client wire base)

@@ -1,18 +1,37 @@
+#include "base/NumberText.h"
 #include "tools/export/RecordFormat.h"
 #include "tools/records/SinkFile.h"
 
 #include <algorithm>
 #include <array>
-#include <cmath>
+#include <charconv>
+#include <cstddef>
+#include <string>
 
 namespace tamblo::tools {
 
 namespace {
 
-constexpr double kLatestSeconds = 9e9; ///< what fits as nanoseconds
-constexpr double kTicks = 1e7;
-constexpr std::uint64_t kPerTick = 100;
-constexpr std::uint64_t kPerSecond = 1'000'000'000;
+constexpr double kLatestSeconds = 9e9; ///< what fits as nanoseconds; earlier ones than 1 are no times
+
+/// By the digits that the line has, and not by those of the double next to them.
+std::uint64_t nanosecondsOf(double seconds) {
+    if (!(seconds >= 1 && seconds < kLatestSeconds)) {
+        return 0;
+    }
+    constexpr std::size_t kDigits = 9;
+    std::array<char, 64> text{};
+    const auto written =
+        std::to_chars(text.data(), text.data() + text.size(), seconds, std::chars_format::fixed);
+    const std::string_view number(text.data(), static_cast<std::size_t>(written.ptr - text.data()));
+    const std::size_t point = std::min(number.find('.'), number.size());
+    std::string digits(number.substr(0, point));
+    if (point != number.size()) {
+        digits += number.substr(point + 1, kDigits);
+    }
+    digits.append(point + kDigits - digits.size(), '0');
+    return parseNumber<std::uint64_t>(digits).value_or(0);
+}
 
 std::string_view textIn(const Dictionary& record, std::string_view object, std::string_view key) {
     const Value* const inner = record.find(object);
@@ -42,12 +61,7 @@ RecordColumns::RecordColumns(const Dictionary& record)
     : event(nameOfRecord(record)), session(textOf(record, "session")) {
     const Value* const time = record.find("time");
     const double seconds = time == nullptr ? 0 : time->doubleValue();
-    if (seconds > 0 && seconds < kLatestSeconds) {
-        // A double has no more digits for times of today than tenths of a microsecond.
-        const double whole = std::floor(seconds);
-        nanoseconds = static_cast<std::uint64_t>(whole) * kPerSecond +
-                      static_cast<std::uint64_t>(std::llround((seconds - whole) * kTicks)) * kPerTick;
-    }
+    nanoseconds = nanosecondsOf(seconds);
     constexpr std::array<std::array<std::string_view, 2>, 4> kApplications{
         {{"payload", "HostApplicationDisplayID"},
          {"userInfo", "HostApplicationDisplayID"},

@@ -4,7 +4,6 @@
 #include "base/Json.h"
 
 #include <array>
-#include <cmath>
 #include <utility>
 
 namespace tamblo::tools {
@@ -82,15 +81,6 @@ private:
 
 void appendKeyAndValue(TextBuffer& out, std::string_view key, const Value& value);
 
-/// As the JSON form of Protocol Buffers has it, which has words for what JSON has no numbers for.
-void appendDouble(TextBuffer& out, double number) {
-    if (std::isfinite(number)) {
-        appendJsonNumber(out, number);
-    } else {
-        out.append(std::isnan(number) ? R"("NaN")" : number > 0 ? R"("Infinity")" : R"("-Infinity")");
-    }
-}
-
 /// A value as OTLP's `AnyValue` in JSON: integers of 64 bits are texts.
 void appendAnyValue(TextBuffer& out, const Value& value) {
     switch (value.kind()) {
@@ -103,7 +93,7 @@ void appendAnyValue(TextBuffer& out, const Value& value) {
     case Value::Kind::singleFloat:
     case Value::Kind::doubleFloat:
         out.append(R"({"doubleValue":)");
-        appendDouble(out, value.doubleValue());
+        appendJsonNumber(out, value.doubleValue()); // finite, as it was read from JSON
         out.append('}');
         return;
     case Value::Kind::array: {
