@@ -221,6 +221,25 @@ class Check:
         expect(self.count().split() == [str(len(self.answers.records))] * 3 and self.differing() == [],
                "a shipper that is killed again and again loses nothing and doubles nothing")
 
+    def odd_records(self):
+        print("Records that are odd")
+        before, summed = int(self.count().split()[0]), self.count().split()[2]
+        lines = "".join("\t".join(cells) + "\n" for cells in (
+            # Times that cannot be, a text with every escape, what is no JSON or has other types, and no device.
+            ["x/1", "odd", "9", "analytics-events", str(2 ** 64 - 1), "com.vandra.tamblo.Volume.Summary", "", "a", "", "{}"],
+            ["x/2", "odd", "9", "power-events", "0", "Korvell_Haptics_EngineOnDuration", "", "\\t\\n\\\\'", "", "\\0["],
+            ["x/3", "odd", "9", "analytics-events", "1", "com.vandra.tamblo.accessoryregistration", "", "", "",
+             '{"model":7,"first_seen_day":"never"}'],
+            ["x/4", "", "", "memory-log", "1", "", "", "", "", ""]))
+        for _ in range(2):
+            self.run("run", self.place, "load", "1", input=lines)
+        arrived = self.fleet.query("SELECT count() FROM fleet.records WHERE day = toDate(0)")
+        expect(int(arrived) == 4 and self.count().split() == [str(before + 4), str(before + 4), summed],
+               "they are kept once, under the day of what cannot be, and counted nowhere")
+        self.run("run", self.place, "load", "1", input="one\ttwo\n", wanted=1)
+        left = self.fleet.query("SELECT name FROM system.tables WHERE database = 'fleet' AND name LIKE 'arrivals%'", 1)
+        expect(left == "" and int(self.count().split()[0]) == before + 4, "what are no columns is refused, and leaves nothing")
+
     @staticmethod
     def open_page(path, partial):
         if shutil.which("chromium") is None:
@@ -244,6 +263,7 @@ def main(programs):
         check.repeat()
         check.planted()
         check.faults()
+        check.odd_records()
     except (SystemExit, Failed):
         print(f"see {place}", file=sys.stderr)
         raise

@@ -9,7 +9,7 @@ ENGINE = Distributed(fleet, fleet, daily_playback_local);
 CREATE MATERIALIZED VIEW fleet.to_daily_playback TO fleet.daily_playback_local AS
 SELECT day, application, kind, visitParamExtractString(fields, 'active_devices') AS route, release,
        count() AS stretches, sum(visitParamExtractFloat(fields, 'play_seconds')) AS seconds
-FROM fleet.incoming WHERE event = 'com.vandra.tamblo.Volume.Summary'
+FROM fleet.incoming WHERE day != toDate(0) AND event = 'com.vandra.tamblo.Volume.Summary'
 GROUP BY day, application, kind, route, release;
 
 -- Of each class of volume, which are sixteenths.
@@ -22,7 +22,7 @@ CREATE MATERIALIZED VIEW fleet.to_daily_volumes TO fleet.daily_volumes_local AS
 SELECT day, kind, visitParamExtractString(fields, 'active_devices') AS route, release,
        toFloat32OrZero(visitParamExtractString(fields, 'QVSessionVolumeBucketed')) AS volume,
        sum(visitParamExtractFloat(fields, 'play_seconds')) AS seconds
-FROM fleet.incoming WHERE event = 'com.vandra.tamblo.Volume.Summary'
+FROM fleet.incoming WHERE day != toDate(0) AND event = 'com.vandra.tamblo.Volume.Summary'
 GROUP BY day, kind, route, release, volume;
 
 CREATE TABLE fleet.daily_sessions_local (
@@ -42,7 +42,7 @@ SELECT day, application, visitParamExtractString(fields, 'summaryServiceName') A
        sum(visitParamExtractUInt(fields, 'num_messages')) AS messages,
        sum(visitParamExtractUInt(fields, 'num_redundant_messages')) AS repeated,
        sum(visitParamExtractString(fields, 'thermal_state') IN ('Serious', 'Critical')) AS hot
-FROM fleet.incoming WHERE event = 'com.vandra.tamblo.Session_Generic.Summary'
+FROM fleet.incoming WHERE day != toDate(0) AND event = 'com.vandra.tamblo.Session_Generic.Summary'
 GROUP BY day, application, service, kind, driver, driver_version, release;
 
 CREATE TABLE fleet.daily_issues_local (
@@ -53,7 +53,7 @@ ENGINE = Distributed(fleet, fleet, daily_issues_local);
 CREATE MATERIALIZED VIEW fleet.to_daily_issues TO fleet.daily_issues_local AS
 SELECT day, visitParamExtractString(fields, 'issue_type') AS issue, kind, driver_version, release,
        count() AS issues
-FROM fleet.incoming WHERE startsWith(event, 'com.vandra.tamblo.') AND endsWith(event, '.IssueDetector')
+FROM fleet.incoming WHERE day != toDate(0) AND startsWith(event, 'com.vandra.tamblo.') AND endsWith(event, '.IssueDetector')
 GROUP BY day, issue, kind, driver_version, release;
 
 CREATE TABLE fleet.daily_haptics_local (
@@ -64,7 +64,7 @@ ENGINE = Distributed(fleet, fleet, daily_haptics_local);
 CREATE MATERIALIZED VIEW fleet.to_daily_haptics TO fleet.daily_haptics_local AS
 SELECT day, application, kind, release, count() AS uses,
        sum(visitParamExtractFloat(fields, 'EngineOnDuration')) AS seconds
-FROM fleet.incoming WHERE event = 'Korvell_Haptics_EngineOnDuration'
+FROM fleet.incoming WHERE day != toDate(0) AND event = 'Korvell_Haptics_EngineOnDuration'
 GROUP BY day, application, kind, release;
 
 -- Of each device: how much is heard of it, and how its sessions went.
@@ -80,4 +80,4 @@ SELECT day, device, kind, release, count() AS records, sum(length(fields)) AS by
            AS overloads,
        sumIf(visitParamExtractFloat(fields, 'total_active_time'),
              event = 'com.vandra.tamblo.Session_Generic.Summary') AS active_seconds
-FROM fleet.incoming GROUP BY day, device, kind, release;
+FROM fleet.incoming WHERE day != toDate(0) GROUP BY day, device, kind, release;

@@ -13,7 +13,7 @@ SELECT cityHash64(id) AS record, day, toDateTime(intDiv(time, 1000000000)) AS ti
        visitParamExtractString(fields, 'active_devices') AS route, release,
        toFloat32(visitParamExtractFloat(fields, 'QVSessionVolume')) AS volume,
        toFloat32(visitParamExtractFloat(fields, 'play_seconds')) AS seconds
-FROM fleet.incoming WHERE event = 'com.vandra.tamblo.Volume.Summary';
+FROM fleet.incoming WHERE day != toDate(0) AND event = 'com.vandra.tamblo.Volume.Summary';
 
 CREATE TABLE fleet.group_stretches_local (
     record UInt64, day Date, device String, application String, kind String, route String, seconds Float32
@@ -24,7 +24,7 @@ CREATE MATERIALIZED VIEW fleet.to_group_stretches TO fleet.group_stretches_local
 SELECT cityHash64(id) AS record, day, device, application, kind,
        visitParamExtractString(fields, 'active_devices') AS route,
        toFloat32(visitParamExtractFloat(fields, 'play_seconds')) AS seconds
-FROM fleet.incoming WHERE event = 'com.vandra.tamblo.Kaleen.Summary';
+FROM fleet.incoming WHERE day != toDate(0) AND event = 'com.vandra.tamblo.Kaleen.Summary';
 
 CREATE TABLE fleet.input_stretches_local (
     record UInt64, day Date, device String, application String, kind String, route String, mode String,
@@ -37,7 +37,7 @@ SELECT cityHash64(id) AS record, day, device, application, kind,
        visitParamExtractString(fields, 'active_devices') AS route,
        visitParamExtractString(fields, 'vp_config_operation_mode') AS mode,
        toFloat32(visitParamExtractFloat(fields, 'inputrunning_seconds')) AS seconds
-FROM fleet.incoming WHERE event = 'com.vandra.tamblo.Input.Summary';
+FROM fleet.incoming WHERE day != toDate(0) AND event = 'com.vandra.tamblo.Input.Summary';
 
 -- Stops of sessions.
 CREATE TABLE fleet.sessions_local (
@@ -55,7 +55,7 @@ SELECT cityHash64(id) AS record, day, toDateTime(intDiv(time, 1000000000)) AS ti
        toUInt32(visitParamExtractUInt(fields, 'num_messages')) AS messages,
        toUInt32(visitParamExtractUInt(fields, 'num_redundant_messages')) AS repeated,
        toUInt8(visitParamExtractString(fields, 'thermal_state') IN ('Serious', 'Critical')) AS is_hot
-FROM fleet.incoming WHERE event = 'com.vandra.tamblo.Session_Generic.Summary';
+FROM fleet.incoming WHERE day != toDate(0) AND event = 'com.vandra.tamblo.Session_Generic.Summary';
 
 CREATE TABLE fleet.accessories_local (
     record UInt64, day Date, device String, model String, first_seen Date
@@ -64,8 +64,8 @@ CREATE TABLE fleet.accessories AS fleet.accessories_local
 ENGINE = Distributed(fleet, fleet, accessories_local, cityHash64(device));
 CREATE MATERIALIZED VIEW fleet.to_accessories TO fleet.accessories_local AS
 SELECT cityHash64(id) AS record, day, device, visitParamExtractString(fields, 'model') AS model,
-       toDate(visitParamExtractString(fields, 'first_seen_day')) AS first_seen
-FROM fleet.incoming WHERE event = 'com.vandra.tamblo.accessoryregistration';
+       toDateOrZero(visitParamExtractString(fields, 'first_seen_day')) AS first_seen
+FROM fleet.incoming WHERE day != toDate(0) AND event = 'com.vandra.tamblo.accessoryregistration';
 
 -- What a device says of itself when its own session begins. A load looks here what the others of its records come from.
 CREATE TABLE fleet.devices_local (
@@ -78,4 +78,4 @@ SELECT day, device, time, visitParamExtractString(fields, 'device_kind') AS kind
        visitParamExtractString(fields, 'software_release') AS release,
        visitParamExtractString(fields, 'audio_driver') AS driver,
        visitParamExtractString(fields, 'audio_driver_version') AS driver_version
-FROM fleet.incoming WHERE event = 'com.vandra.tamblo.HAL_Generic.Start';
+FROM fleet.incoming WHERE day != toDate(0) AND event = 'com.vandra.tamblo.HAL_Generic.Start';
