@@ -7,6 +7,7 @@ import re
 import shutil
 import socket
 import subprocess
+import tempfile
 import time
 import zlib
 
@@ -15,6 +16,7 @@ SINKS = ["analytics-events", "power-events", "diagnostics-metrics", "call-qualit
          "bug-report-drafts", "stack-captures", "memory-log"]
 COLUMNS = "id, device, version, sink, time, event, session, application, service, fields"
 SECONDS_TO_START = 60
+PART_BYTES = 300 << 20
 
 CONFIG = """<yandex>
 <logger><level>warning</level><console>1</console></logger>
@@ -157,8 +159,23 @@ class Fleet:
         return ran.stdout
 
     def load(self, records, number, source):
-        """Takes records, a file of columns, to a shard; those that it has already are left out. A shard takes one load
-        of a source at a time: what is left of one whose shipper was killed ends before the next can look what there is."""
+        """Takes records, a file of columns, to a shard; those that it has already are left out. Many are taken in parts,
+        each of whole devices, so that a part's memory is bounded and has what its devices said of themselves."""
+        with tempfile.TemporaryFile() as part:
+            last = None
+            for line in records:
+                device = line.split(b"\t", 2)[1:2]
+                if part.tell() > PART_BYTES and device != last:
+                    self.load_part(part, number, source)
+                    part.truncate(0)
+                last = device
+                part.write(line)
+            self.load_part(part, number, source)
+
+    def load_part(self, records, number, source):
+        """A shard takes one load of a source at a time: what is left of one whose shipper was killed ends before the next
+        can look what there is."""
+        records.seek(0)
         arrivals = f"arrivals_{os.getpid()}_{time.monotonic_ns()}"
         self.query(statements("schema", "arrivals.sql", ARRIVALS=arrivals), number)
         try:
@@ -167,6 +184,7 @@ class Fleet:
         finally:
             with contextlib.suppress(Failed):
                 self.query(f"DROP TABLE IF EXISTS fleet.{arrivals}", number)
+        records.seek(0)
 
     def rebuild(self, day, number):
         """Makes all that stands of a day from its records: after a server ended in the middle of a load."""
