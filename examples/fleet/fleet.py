@@ -15,6 +15,9 @@ HERE = os.path.dirname(os.path.realpath(__file__))
 SINKS = ["analytics-events", "power-events", "diagnostics-metrics", "call-quality", "bug-captures",
          "bug-report-drafts", "stack-captures", "memory-log"]
 COLUMNS = "id, device, version, sink, time, event, session, application, service, fields"
+# Of the tables of sinks, but for the identifier.
+KEPT = ("device, version, day, time, event, session, application, service, fields, "
+        "kind, release, driver, driver_version")
 SECONDS_TO_START = 60
 PART_BYTES = 300 << 20
 
@@ -29,10 +32,10 @@ CONFIG = """<yandex>
 <remote_servers><fleet>{shards}</fleet></remote_servers>
 </yandex>
 """
-SHARD = "<shard><internal_replication>true</internal_replication><replica><host>{host}</host><port>{port}</port></replica></shard>"
+SHARD = "<shard><replica><host>{host}</host><port>{port}</port></replica></shard>"
 USERS = """<yandex><profiles><default><max_memory_usage>6000000000</max_memory_usage>
-<distributed_product_mode>local</distributed_product_mode><connect_timeout_with_failover_ms>500</connect_timeout_with_failover_ms>
-</default></profiles><quotas><default/></quotas>
+<distributed_product_mode>local</distributed_product_mode>
+<connect_timeout_with_failover_ms>500</connect_timeout_with_failover_ms></default></profiles><quotas><default/></quotas>
 <users><default><password/><networks><ip>127.0.0.0/8</ip></networks><profile>default</profile><quota>default</quota>
 </default></users></yandex>
 """
@@ -152,8 +155,8 @@ class Fleet:
 
     def query(self, text, number=1, given=None, settings=()):
         """Carries statements out on a shard; what it answers. `given` is a file that a statement reads."""
-        ran = subprocess.run(self.client(number, "--multiquery", *settings, "--query", text), stdin=given or subprocess.DEVNULL,
-                             capture_output=True, text=True, check=False)
+        command = self.client(number, "--multiquery", *settings, "--query", text)
+        ran = subprocess.run(command, stdin=given or subprocess.DEVNULL, capture_output=True, text=True, check=False)
         if ran.returncode != 0:
             raise Failed(ran.stderr.strip() or "clickhouse-client failed")
         return ran.stdout
@@ -170,7 +173,8 @@ class Fleet:
                     part.truncate(0)
                 last = device
                 part.write(line)
-            self.load_part(part, number, source)
+            if part.tell() > 0:
+                self.load_part(part, number, source)
 
     def load_part(self, records, number, source):
         """A shard takes one load of a source at a time: what is left of one whose shipper was killed ends before the next
@@ -191,11 +195,10 @@ class Fleet:
         kept = f"fleet.kept_{os.getpid()}"
         tables = self.query("SELECT name FROM system.tables WHERE database = 'fleet' AND engine LIKE '%MergeTree'",
                             number).split()
-        said = "device, version, day, time, event, session, application, service, fields, kind, release, driver, driver_version"
         self.query(f"""CREATE TABLE {kept} ENGINE = StripeLog AS
-            SELECT id, {said}, replaceAll(extract(_table, '^sink_(.*)_local$'), '_', '-') AS sink
+            SELECT id, {KEPT}, replaceAll(extract(_table, '^sink_(.*)_local$'), '_', '-') AS sink
             FROM fleet.records_local WHERE day = '{day}' LIMIT 1 BY id""", number)
         for table in tables:
             self.query(f"ALTER TABLE fleet.{table} DROP PARTITION '{day}'", number)
-        self.query(f"INSERT INTO fleet.incoming (id, sink, {said}) SELECT id, sink, {said} FROM {kept}; "
+        self.query(f"INSERT INTO fleet.incoming (id, sink, {KEPT}) SELECT id, sink, {KEPT} FROM {kept}; "
                    f"DROP TABLE {kept}", number)

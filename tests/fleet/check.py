@@ -20,7 +20,7 @@ sys.path[:0] = [EXAMPLE, os.path.join(HERE, "..", "report")]
 from answers import Answers  # noqa: E402
 from asking import answer, questions  # noqa: E402
 from current import CurrentEngine  # noqa: E402
-from fleet import Failed, Fleet, export  # noqa: E402
+from fleet import KEPT, Failed, Fleet, export  # noqa: E402
 
 DEVICES, DAYS = 120, 14
 CLOSE = 1e-5  # sums of single-precision lengths, in another order
@@ -59,7 +59,8 @@ class Check:
         return ran.stdout
 
     def make_devices(self, *options):
-        subprocess.run([os.path.join(self.programs, "tamblo_fleet"), "--days", str(DAYS), *options, self.made], check=True)
+        program = os.path.join(self.programs, "tamblo_fleet")
+        subprocess.run([program, "--days", str(DAYS), *options, self.made], check=True)
 
     def ask(self, number):
         """Rows by the names of their columns."""
@@ -87,7 +88,8 @@ class Check:
         return wrong
 
     def count(self):
-        return self.fleet.query("SELECT count(), uniqExact(id) FROM fleet.records; SELECT sum(records) FROM fleet.daily_devices")
+        return self.fleet.query("SELECT count(), uniqExact(id) FROM fleet.records; "
+                                "SELECT sum(records) FROM fleet.daily_devices")
 
     def compare(self):
         print("A fleet is made and gathered")
@@ -122,8 +124,7 @@ class Check:
         self.run("run", self.place, "gather", self.made)
         expect(self.count() == before and self.differing() == [], "a load leaves out what has come before")
         day = str(self.answers.newest)
-        names = "id, device, version, day, time, event, session, application, service, fields, kind, release, driver, driver_version"
-        self.fleet.query(f"INSERT INTO fleet.incoming (sink, {names}) SELECT 'analytics-events', {names} "
+        self.fleet.query(f"INSERT INTO fleet.incoming (sink, id, {KEPT}) SELECT 'analytics-events', id, {KEPT} "
                          f"FROM fleet.sink_analytics_events_local WHERE day = '{day}'", 1)
         wrong = self.differing()
         expect({"14-group-hours", "15-calls", "18-hours-of-the-day", "19-length-of-sessions"}.isdisjoint(wrong),
@@ -154,7 +155,8 @@ class Check:
         self.near("its overloads in an hour", bad["rate"], faults["bad_overloads_of_hour"], 0.15)
         usual = [row for (_, release), row in rates.items() if release == "4.1"]
         self.near("overloads in an hour where nothing is wrong",
-                  sum(row["issues"] for row in usual) / sum(row["hours"] for row in usual), faults["overloads_of_hour"], 0.2)
+                  sum(row["issues"] for row in usual) / sum(row["hours"] for row in usual),
+                  faults["overloads_of_hour"], 0.2)
         loud = {(row["kind"], row["release"]): row["mean_volume"] for row in self.ask(5)}
         self.near("how much louder a release made headphones", loud["phone", faults["loud_release"]] - loud["phone", "4.2"],
                   faults["louder_by"], 0.25)
@@ -175,17 +177,17 @@ class Check:
 
     def faults(self):
         print("A shard is away while devices ship")
+        other = next(name for name, _ in self.answers.by_device if self.fleet.shard_of(name) == 1)
         number = DEVICES + 1
         while self.fleet.shard_of(f"fleet-{number:06}") != 2:
             number += 1
         self.make_devices("--first", str(number), "--devices", "1")
-        device = os.path.join(self.made, f"fleet-{number:06}")
-        places = {"LOGS_DIRECTORY": f"{device}/logs", "CONFIGURATION_DIRECTORY": f"{device}/config",
-                  "RUNTIME_DIRECTORY": f"{device}/run"}
-        ship = ["run", self.place, "ship", "--batch", "300", "--patience", "1", "--cursor", f"{device}/cursor"]
+        places, ship = self.shipping(f"fleet-{number:06}")
         before = int(self.count().split()[0])
         self.run("run", self.place, "stop", "2")
-        self.run(*ship, env=places, wanted=1)
+        self.run(*self.shipping(f"fleet-{number:06}", patience=1)[1], env=places, wanted=1)
+        its_places, its_ship = self.shipping(other)
+        self.run(*its_ship, env=its_places)
         told = self.run("ask", self.place, "1", "6", wanted=3)
         expect(told.count("PARTIAL: 1 of 2 shards") == 2, "questions say that they are partial")
         page = os.path.join(os.path.dirname(self.place), "fleet.html")
@@ -199,15 +201,23 @@ class Check:
         expect(arrived == len(with_it.records) - before, f"all {arrived} records of the device have arrived, each once")
         self.answers = with_it
         expect(self.differing() == [], "and the answers are those of the lines")
-        self.kill(ship, places, number + 1)
+        self.kill(number + 1)
         self.run("report", self.place, "-o", page)
         self.open_page(page, partial=False)
 
-    def kill(self, ship, places, number):
+    def shipping(self, name, patience=60):
+        """How a device ships: its environment, and the command."""
+        device = os.path.join(self.made, name)
+        places = {"LOGS_DIRECTORY": f"{device}/logs", "CONFIGURATION_DIRECTORY": f"{device}/config",
+                  "RUNTIME_DIRECTORY": f"{device}/run"}
+        return places, ["run", self.place, "ship", "--batch", "300", "--patience", str(patience), "--cursor",
+                        f"{device}/cursor"]
+
+    def kill(self, number):
         """Ends a shipper again and again, wherever it is."""
         self.make_devices("--first", str(number), "--devices", "1")
-        places = {name: path.replace(f"{number - 1:06}", f"{number:06}") for name, path in places.items()}
-        command = [os.path.join(EXAMPLE, ship[0]), *ship[1:-1], ship[-1].replace(f"{number - 1:06}", f"{number:06}")]
+        places, ship = self.shipping(f"fleet-{number:06}")
+        command = [os.path.join(EXAMPLE, ship[0]), *ship[1:]]
         random.seed(1)
         for _ in range(8):
             shipper = subprocess.Popen(command, env={**self.environment, **places}, stderr=subprocess.DEVNULL)
@@ -216,7 +226,7 @@ class Check:
             except subprocess.TimeoutExpired:
                 shipper.kill()
                 shipper.wait()
-        self.run(command[0], *command[1:], env=places)
+        self.run(*ship, env=places)
         self.answers = Answers(self.made)
         expect(self.count().split() == [str(len(self.answers.records))] * 3 and self.differing() == [],
                "a shipper that is killed again and again loses nothing and doubles nothing")
@@ -226,7 +236,7 @@ class Check:
         before, summed = int(self.count().split()[0]), self.count().split()[2]
         lines = "".join("\t".join(cells) + "\n" for cells in (
             # Times that cannot be, a text with every escape, what is no JSON or has other types, and no device.
-            ["x/1", "odd", "9", "analytics-events", str(2 ** 64 - 1), "com.vandra.tamblo.Volume.Summary", "", "a", "", "{}"],
+            ["x/1", "odd", "9", "analytics-events", str(2**64 - 1), "com.vandra.tamblo.Volume.Summary", "", "", "", "{}"],
             ["x/2", "odd", "9", "power-events", "0", "Korvell_Haptics_EngineOnDuration", "", "\\t\\n\\\\'", "", "\\0["],
             ["x/3", "odd", "9", "analytics-events", "1", "com.vandra.tamblo.accessoryregistration", "", "", "",
              '{"model":7,"first_seen_day":"never"}'],
@@ -236,9 +246,11 @@ class Check:
         arrived = self.fleet.query("SELECT count() FROM fleet.records WHERE day = toDate(0)")
         expect(int(arrived) == 4 and self.count().split() == [str(before + 4), str(before + 4), summed],
                "they are kept once, under the day of what cannot be, and counted nowhere")
+        self.run("run", self.place, "load", "1", input="")
         self.run("run", self.place, "load", "1", input="one\ttwo\n", wanted=1)
         left = self.fleet.query("SELECT name FROM system.tables WHERE database = 'fleet' AND name LIKE 'arrivals%'", 1)
-        expect(left == "" and int(self.count().split()[0]) == before + 4, "what are no columns is refused, and leaves nothing")
+        expect(left == "" and int(self.count().split()[0]) == before + 4,
+               "what are no columns is refused, and leaves nothing")
 
     @staticmethod
     def open_page(path, partial):
