@@ -56,11 +56,13 @@ struct JsonReadOptions {
     /// A `null` has no place among property-list values: members and elements that are null are left out, or,
     /// when refused, make the text an error.
     bool refuseNull = false;
+    /// Of arrays and objects within one another; a payload has no more than these.
+    int mostLevels = 32;
 };
 
 /// Reads one JSON value, with nothing but white space around it. Integers within 64 bits stay integers (the
 /// unsigned range included), other numbers are doubles. An object that names a key twice, nesting deeper than
-/// 32 and text that is not UTF-8 are errors. A bare `null` is an error.
+/// that and text that is not UTF-8 are errors. A bare `null` is an error.
 [[nodiscard]] std::variant<Value, JsonError> readJson(std::string_view text, JsonReadOptions options = {});
 
 } // namespace tamblo

@@ -16,8 +16,6 @@ namespace tamblo {
 
 namespace {
 
-constexpr int kMaximumDepth = 32;
-
 bool isDigit(char character) noexcept {
     return character >= '0' && character <= '9';
 }
@@ -418,8 +416,8 @@ bool JsonReader::takeKey(std::string_view& key) {
 
 /// The bracket that opens an array or object at a depth, counted from 1.
 bool JsonReader::takeOpening(int depth) {
-    if (depth > kMaximumDepth) {
-        return fail(formatted("values are nested deeper than {}", kMaximumDepth));
+    if (depth > options_.mostLevels) {
+        return fail(formatted("values are nested deeper than {}", options_.mostLevels));
     }
     ++at_;
     return true;

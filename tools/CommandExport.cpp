@@ -134,7 +134,7 @@ std::optional<std::string> takeSinks(const Arguments& arguments, std::string_vie
         if (std::ranges::find(plan.sinks, name, &ExportPlan::Sink::name) != plan.sinks.end()) {
             return formatted("two sinks are called {}; the cursor and the records know them by name", name);
         }
-        plan.sinks.push_back({name, path});
+        plan.sinks.push_back({name, path, path == sinkPath(logs, name)});
     }
     return std::nullopt;
 }
@@ -190,6 +190,7 @@ ExitStatus run(const Arguments& arguments) {
     ExportPlan plan;
     plan.device = {.name = device.name, .version = TAMBLO_VERSION};
     plan.secret = device.secret;
+    plan.runtimeDirectory = directories.runtime;
     plan.redaction.setSecret(device.secret);
     std::uint64_t rate = 0;
     if (const auto wrong = makePlan(arguments, directories.logs, plan, rate)) {

@@ -324,6 +324,25 @@ TEST(Export, KeepsToTheRateAndToTheDaysBytes) {
     EXPECT_EQ(device.bash(TAMBLOCTL_PATH " export --daily 5").status, 2) << "nowhere to count";
 }
 
+TEST(Export, IsShippedInBatchesUntilTheyArrive) {
+    Device device;
+    device.write(2'500);
+    const CommandResult result = device.bash(
+        "export PATH=$(dirname " TAMBLOCTL_PATH "):$PATH\n"
+        "unpack() { if command -v zstd >/dev/null; then zstd -dqc; else zcat; fi; }\n"
+        "" EXAMPLES_DIR "/shipping/ship cursor 'cat >batch; if [ -e failed ]; then cat batch >>arrived; "
+        "else touch failed; false; fi' &\n"
+        "for ((i = 0; i != 200; ++i)); do\n"
+        "  sleep 0.05; [ \"$(unpack <arrived 2>/dev/null | wc -l)\" != 2500 ] || break\n"
+        "done\n"
+        "sleep 0.3; kill $!; wait $! || exit; unpack <arrived; take");
+    EXPECT_EQ(result.status, 0);
+    const auto numbers = numbersIn(result.output);
+    EXPECT_EQ(numbers.size(), 2'500U);
+    EXPECT_TRUE(std::ranges::all_of(numbers, [](const auto& number) { return number.second == 1; }));
+    EXPECT_THAT(result.output, HasSubstr("\n0 records\n"));
+}
+
 TEST(Export, FollowsWhatTheServiceWrites) {
     ServiceProcess service;
     Session client(service.socketPath());
@@ -350,6 +369,35 @@ TEST(Export, FollowsWhatTheServiceWrites) {
                                directory + "/cursor")
                     .output,
                 HasSubstr("0 records"));
+}
+
+TEST(Export, KnowsFromTheServiceHowManyLinesWereInFilesThatItNeverSaw) {
+    for (const int seen : {0, 3}) {
+        ServiceProcess service;
+        Session client(service.socketPath());
+        const std::string command = "export analytics-events -c " + service.runtimeDirectory() + "/cursor";
+        int number = 0;
+        const auto send = [&](int count) {
+            for (const int end = number + count; number != end; ++number) {
+                EXPECT_TRUE(client.call(message({{"n", number}})));
+            }
+        };
+        send(seen);
+        EXPECT_EQ(service.tambloctl(command).status, 0);
+        send(57);
+        const auto file = service.logs() / "analytics-events.jsonl";
+        EXPECT_EQ(linesOf(file).size(), 2U * 57 + 2U * static_cast<unsigned>(seen)) << "under both names";
+        std::filesystem::remove(file);
+        // The service looks for its file ten times a second.
+        EXPECT_TRUE(eventually([&] {
+            std::this_thread::sleep_for(std::chrono::milliseconds(120));
+            send(1);
+            return std::filesystem::exists(file);
+        }));
+        const std::string said = service.tambloctl(command + " -e none").output;
+        EXPECT_THAT(said, HasSubstr("analytics-events: 114 lines that were not exported"));
+        EXPECT_THAT(said, testing::Not(HasSubstr("may be missing")));
+    }
 }
 
 } // namespace

@@ -92,6 +92,12 @@ std::variant<Cursor, std::string> Cursor::open(const std::string& path, std::str
     }
     cursor.wasOfOtherDevice_ = member(document, "device").stringValue() != device;
     cursor.spent_ = {member(document, "day").integerValue(), member(document, "day_bytes").unsignedValue()};
+    const Dictionary& written = member(document, "written").dictionaryValue();
+    for (std::size_t i = 0; i != written.size(); ++i) {
+        const Value& count = written.valueAt(i);
+        cursor.setWritten(written.keyAt(i), {.began = member(count, "began").unsignedValue(),
+                                             .lines = member(count, "lines").unsignedValue()});
+    }
     const Dictionary& sinks = member(document, "sinks").dictionaryValue();
     for (std::size_t i = 0; i != sinks.size(); ++i) {
         for (const Value& entry : sinks.valueAt(i).arrayValue()) {
@@ -110,6 +116,15 @@ void Cursor::set(std::string_view sink, const SinkProgress& progress) {
     sinks_[std::string(sink)] = progress;
 }
 
+std::optional<WrittenLines> Cursor::written(std::string_view sink) const {
+    const auto found = written_.find(sink);
+    return found == written_.end() ? std::nullopt : std::optional(found->second);
+}
+
+void Cursor::setWritten(std::string_view sink, const WrittenLines& written) {
+    written_[std::string(sink)] = written;
+}
+
 std::optional<std::string> Cursor::store() const {
     if (path_.empty()) {
         return std::nullopt;
@@ -122,11 +137,13 @@ std::optional<std::string> Cursor::store() const {
         }
         sinks.set(name, std::move(files));
     }
-    const Dictionary document{{"version", kVersion},
-                              {"device", device_},
-                              {"day", spent_.day},
-                              {"day_bytes", spent_.bytes},
-                              {"sinks", std::move(sinks)}};
+    Dictionary written;
+    for (const auto& [name, count] : written_) {
+        written.set(name, Dictionary{{"began", count.began}, {"lines", count.lines}});
+    }
+    const Dictionary document{{"version", kVersion},       {"device", device_},
+                              {"day", spent_.day},         {"day_bytes", spent_.bytes},
+                              {"sinks", std::move(sinks)}, {"written", std::move(written)}};
     const int error = replaceFileAtomically(path_, jsonText(document) + "\n", Durability::power);
     return error == 0 ? std::nullopt
                       : std::optional(formatted("cannot write {}: {}", path_, std::strerror(error)));

@@ -2,6 +2,7 @@
 
 #include "os/FileDescriptor.h"
 #include "tools/export/Progress.h"
+#include "tools/export/WrittenLines.h"
 
 #include <cstdint>
 #include <map>
@@ -33,6 +34,9 @@ public:
     [[nodiscard]] bool wasOfOtherDevice() const noexcept { return wasOfOtherDevice_; }
     [[nodiscard]] SinkProgress progress(std::string_view sink) const;
     void set(std::string_view sink, const SinkProgress& progress);
+    /// What the service had counted when the sink was last looked at, if that is known.
+    [[nodiscard]] std::optional<WrittenLines> written(std::string_view sink) const;
+    void setWritten(std::string_view sink, const WrittenLines& written);
     [[nodiscard]] const Spent& spent() const noexcept { return spent_; }
     void setSpent(Spent spent) noexcept { spent_ = spent; }
     /// What could not be done, or nothing.
@@ -44,6 +48,7 @@ private:
     std::string device_;
     bool wasOfOtherDevice_ = false;
     std::map<std::string, SinkProgress, std::less<>> sinks_;
+    std::map<std::string, WrittenLines, std::less<>> written_;
     Spent spent_;
 };
 

@@ -30,6 +30,9 @@ constexpr std::size_t kMostParts = 64U << 10U;
 constexpr std::chrono::milliseconds kGathering{200};
 constexpr std::size_t kKeptCapacity = 1U << 20U;
 
+/// A payload has 32 levels at most, and stands some levels deep in its line.
+constexpr JsonReadOptions kSinkLine{.mostLevels = 40};
+
 std::string directoryOf(const std::string& path) {
     const std::size_t slash = path.find_last_of('/');
     return slash == 0 ? "/" : path.substr(0, slash);
@@ -44,9 +47,12 @@ bool hasTooManyParts(std::string_view line) {
 } // namespace
 
 Exporter::Exporter(ExportPlan plan, Cursor cursor, ExportOutput& output)
-    : plan_(std::move(plan)), cursor_(std::move(cursor)), output_(output) {
-    for (const auto& [name, path] : plan_.sinks) {
-        sinks_.push_back({name, SinkBacklog(path, cursor_.progress(name))});
+    : plan_(std::move(plan)),
+      cursor_(std::move(cursor)),
+      output_(output),
+      serviceCount_(plan_.runtimeDirectory) {
+    for (const auto& [name, path, isOfService] : plan_.sinks) {
+        sinks_.push_back({name, SinkBacklog(path, cursor_.progress(name)), isOfService});
         directories_.insert(directoryOf(path));
     }
 }
@@ -62,7 +68,10 @@ std::optional<std::string> Exporter::run() {
         goesOn = exportBacklog() && plan_.follows && awaitMore();
     }
     // What was not acknowledged has been taken once the output is closed.
-    if (problem_.empty() && (output_.close() || (problem_ = output_.problem()).empty())) {
+    if (problem_.empty() && !output_.close()) {
+        problem_ = output_.problem();
+    }
+    if (problem_.empty()) {
         (void)store();
     }
     if (problem_.empty() && !said_.empty()) {
@@ -72,14 +81,17 @@ std::optional<std::string> Exporter::run() {
 }
 
 bool Exporter::exportBacklog() {
-    (void)hasNews();
     startDay();
-    look();
+    lookAtNews();
     counts_.left = 0;
     const std::uint64_t most = plan_.batch != 0 ? plan_.batch : kUsualBatch;
     std::uint64_t lines = most;
     Piece piece;
     while (Sink* const sink = next(piece, lines)) {
+        if (hasNews_) {
+            lookAtNews(); // what has just come may be wanted before what is left
+            continue;
+        }
         if (ExportOutput::isEnding()) {
             return false;
         }
@@ -100,16 +112,38 @@ bool Exporter::exportBacklog() {
         if (outcome == Outcome::taken) {
             ++turn_;
         }
-        if (hasNews()) {
-            look(); // what has just come may be wanted before what is left
-        }
+        readEvents();
     }
     return true;
 }
 
+void Exporter::lookAtNews() {
+    readEvents();
+    hasNews_ = false;
+    look();
+}
+
+/// Where files are gone that nobody has seen to their end, the service may know how many lines they had: what
+/// it has written since the last look, but for what is there.
+MissedLines Exporter::look(Sink& sink) {
+    const auto before = cursor_.written(sink.name);
+    const auto now = sink.isOfService ? serviceCount_.of(sink.name) : std::nullopt;
+    const bool hadNone = sink.backlog.progress().empty();
+    MissedLines missed = sink.backlog.look();
+    const auto written = before && now ? now->since(*before) : std::nullopt;
+    if ((missed.uncounted || hadNone) && written) {
+        missed.known += *written - std::min(*written, sink.backlog.newLines());
+        missed.uncounted.reset();
+    }
+    if (now) {
+        cursor_.setWritten(sink.name, *now);
+    }
+    return missed;
+}
+
 void Exporter::look() {
     for (Sink& sink : sinks_) {
-        if (const MissedLines missed = sink.backlog.look(); !missed.isEmpty()) {
+        if (const MissedLines missed = look(sink); !missed.isEmpty()) {
             counts_.missed += missed.known;
             sayMissed(sink, missed);
         }
@@ -191,7 +225,7 @@ Exporter::Counts Exporter::format(const Sink& sink, const Piece& piece) {
             ++counts.tooLarge;
             continue;
         }
-        auto read = parseJsonObject(line);
+        auto read = parseJsonObject(line, kSinkLine);
         auto* const fields = std::get_if<Dictionary>(&read);
         if (fields == nullptr) {
             ++counts.unreadable;
@@ -235,7 +269,7 @@ bool Exporter::awaitMore() {
         const std::int64_t left = kSecondsPerDay - std::time(nullptr) % kSecondsPerDay;
         return output_.wait(-1, std::chrono::seconds(left)) != ExportOutput::Woken::byEnd;
     }
-    return output_.wait(watch_.get(), std::nullopt) != ExportOutput::Woken::byEnd &&
+    return (hasNews_ || output_.wait(watch_.get(), std::nullopt) != ExportOutput::Woken::byEnd) &&
            output_.wait(-1, kGathering) != ExportOutput::Woken::byEnd && watch();
 }
 
@@ -255,13 +289,11 @@ bool Exporter::watch() {
     return true;
 }
 
-bool Exporter::hasNews() {
+void Exporter::readEvents() {
     std::array<char, 16U << 10U> events;
-    bool hasSome = false;
     while (plan_.follows && ::read(watch_.get(), events.data(), events.size()) > 0) {
-        hasSome = true;
+        hasNews_ = true;
     }
-    return hasSome;
 }
 
 bool Exporter::store() {

@@ -6,6 +6,7 @@
 #include "tools/export/RecordFormat.h"
 #include "tools/export/Redaction.h"
 #include "tools/export/SinkBacklog.h"
+#include "tools/export/WrittenLines.h"
 #include "tools/records/RecordFilter.h"
 
 #include <cstdint>
@@ -22,9 +23,11 @@ struct ExportPlan {
     struct Sink {
         std::string name;
         std::string path;
+        bool isOfService = false; ///< and not a copy of its files elsewhere
     };
 
     std::vector<Sink> sinks; ///< no two of one name
+    std::string runtimeDirectory;
     ExportedDevice device;
     std::string secret; ///< with which identifiers are made
     std::unique_ptr<RecordFormat> format;
@@ -57,9 +60,11 @@ private:
     struct Sink {
         std::string name;
         SinkBacklog backlog;
+        bool isOfService;
     };
 
     void look();
+    [[nodiscard]] MissedLines look(Sink& sink);
     void sayOnce(const std::string& text);
     void sayMissed(const Sink& sink, const MissedLines& missed);
     /// Exports what there is at a look. False when nothing more is to be exported.
@@ -73,8 +78,9 @@ private:
     void startDay();
     /// Whether what the piece comes to, in `out_`, may still go today.
     [[nodiscard]] bool fitsBudget(const Piece& piece) const;
-    /// Whether something was written since this was asked last; only where new lines are followed.
-    [[nodiscard]] bool hasNews();
+    /// Notes whether something was written; only where new lines are followed.
+    void readEvents();
+    void lookAtNews();
     /// Until there may be more to export. False at the end.
     [[nodiscard]] bool awaitMore();
     [[nodiscard]] bool watch();
@@ -83,10 +89,12 @@ private:
     ExportPlan plan_;
     Cursor cursor_;
     ExportOutput& output_;
+    const ServiceCount serviceCount_;
     std::vector<Sink> sinks_;
     std::set<std::string> directories_;
     std::size_t turn_ = 0;
     bool isBudgetSpent_ = false;
+    bool hasNews_ = false; ///< since the last look
     FileDescriptor watch_;
     TextBuffer out_;
     Counts counts_;

@@ -230,6 +230,7 @@ MissedLines SinkBacklog::look() {
     std::ranges::move(progress_, std::back_inserter(before));
     const std::string newest = before.empty() ? std::string() : before.back().identity;
     SinkProgress now;
+    newLines_ = 0;
     for (File& file : files) {
         identify(file);
         if (file.identity.empty()) {
@@ -248,7 +249,9 @@ MissedLines SinkBacklog::look() {
             before.erase(known);
         }
         progress.identity = file.identity;
+        const std::uint64_t linesBefore = progress.lines;
         count(file.descriptor.get(), file.size, progress);
+        newLines_ += progress.lines - std::min(progress.lines, linesBefore);
         progress.written = file.written;
     }
     std::erase_if(files, [](const File& file) { return file.identity.empty(); });

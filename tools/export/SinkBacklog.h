@@ -63,6 +63,8 @@ public:
     [[nodiscard]] SinkProgress progress() const;
     /// Lines that are left.
     [[nodiscard]] std::uint64_t leftLines() const;
+    /// Lines that the last look counted for the first time.
+    [[nodiscard]] std::uint64_t newLines() const noexcept { return newLines_; }
     /// Which files could not be read at the last look, and why.
     [[nodiscard]] const std::vector<std::string>& problems() const noexcept { return problems_; }
 
@@ -86,6 +88,7 @@ private:
     SinkProgress unseen_;     ///< of files that may be among those that could not be read
     std::vector<File> files_; ///< of the last look; the oldest first, and each with its progress
     std::vector<std::string> problems_;
+    std::uint64_t newLines_ = 0;
 };
 
 } // namespace tamblo::tools
