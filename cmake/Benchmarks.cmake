@@ -27,11 +27,16 @@ if(TARGET tamblo_crash)
     endif()
 endif()
 
+if(NOT TARGET tamblo_tests_fakes)
+    tamblo_folder(tests/fakes PUBLIC session util platform base)
+endif()
+
+# tamblo_fleet makes the sinks of a fleet, by the service's own code and a clock that it turns.
+tamblo_program(tamblo_fleet
+    GLOB bench/fleet/*.cpp LIBRARIES tests/fakes service workers system platform/linux wire base)
+
 find_package(benchmark QUIET)
 if(benchmark_FOUND)
-    if(NOT TARGET tamblo_tests_fakes)
-        tamblo_folder(tests/fakes PUBLIC session util platform base)
-    endif()
     tamblo_program(tamblo_microbench
         GLOB bench/micro/*.cpp SOURCES bench/Payloads.cpp bench/TemporaryDirectory.cpp
         LIBRARIES tests/fakes service workers system platform/linux client wire)

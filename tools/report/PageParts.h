@@ -7,6 +7,7 @@ namespace tamblo::report::page_parts {
 
 extern const std::string_view page_html;
 extern const std::string_view page_css;
+extern const std::string_view plots_js;
 extern const std::string_view data_js;
 extern const std::string_view timeline_js;
 extern const std::string_view timeline_input_js;

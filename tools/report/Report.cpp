@@ -136,7 +136,7 @@ void writePage(PageWriter& out, const PageData& data) {
             out.text(page_parts::page_css);
         } else if (name == "script") {
             for (const std::string_view part :
-                 {page_parts::data_js, page_parts::details_js, page_parts::timeline_js,
+                 {page_parts::plots_js, page_parts::data_js, page_parts::details_js, page_parts::timeline_js,
                   page_parts::timeline_input_js, page_parts::timeline_rows_js, page_parts::figures_js,
                   page_parts::page_js}) {
                 out.text(part);

@@ -152,26 +152,3 @@ function lengthText(milliseconds) {
     const hours = Math.floor(minutes / 60);
     return hours < 48 ? `${sign}${hours} h ${minutes % 60} min` : `${sign}${Math.floor(hours / 24)} d ${hours % 24} h`;
 }
-
-/** An element with a class and what it contains: elements, or texts, which are never markup. */
-function element(name, className, ...content) {
-    const made = document.createElement(name);
-    if (className) { made.className = className; }
-    made.append(...content.map((part) => (part instanceof Node ? part : String(part))));
-    return made;
-}
-
-/** A table: headings, then rows of cells. */
-function table(className, caption, headings, rows) {
-    const made = element('table', className);
-    if (caption) { made.append(element('caption', '', caption)); }
-    const head = element('tr');
-    headings.forEach((heading, i) => {
-        const cell = element('th', typeof rows[0]?.[i] === 'number' ? 'number' : '', heading);
-        cell.scope = 'col';
-        head.append(cell);
-    });
-    made.append(element('thead', '', head), element('tbody', '', ...rows.map((cells) =>
-        element('tr', '', ...cells.map((cell) => element('td', typeof cell === 'number' ? 'number' : '', cell))))));
-    return made;
-}
