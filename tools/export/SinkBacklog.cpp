@@ -137,11 +137,20 @@ Piece makePiece(std::string identity, Range range, std::string text) {
     return {std::move(identity), range, std::move(text), lines};
 }
 
+/// What stands in the range, whose end was that of a line; nothing where that has been cut off, or something
+/// else stands in its place, since the file was looked at.
+std::string readToLineEnd(int descriptor, Range range) {
+    std::string text = readAt(descriptor, range.begin, range.end - range.begin);
+    const bool isWhole = text.size() == range.end - range.begin && text.ends_with('\n');
+    return isWhole ? text : std::string();
+}
+
 /// One line, which is longer than a piece.
 Piece lineAsPiece(int descriptor, std::string identity, Range line) {
     const bool isTooLong = line.end - line.begin > SinkBacklog::kLongestLine;
-    return {std::move(identity), line,
-            isTooLong ? std::string() : readAt(descriptor, line.begin, line.end - line.begin), 1};
+    std::string text = isTooLong ? std::string() : readToLineEnd(descriptor, line);
+    const bool isGone = !isTooLong && text.empty();
+    return isGone ? Piece{} : Piece{std::move(identity), line, std::move(text), 1};
 }
 
 Piece firstOf(int descriptor, const FileProgress& file, std::uint64_t mostLines) {
@@ -162,7 +171,10 @@ Piece lastOf(int descriptor, const FileProgress& file, std::uint64_t mostLines) 
     const Range left = file.lastLeft();
     const std::uint64_t begin =
         std::max(left.begin, left.end - std::min<std::uint64_t>(left.end, SinkBacklog::kPieceBytes));
-    std::string text = readAt(descriptor, begin, left.end - begin);
+    std::string text = readToLineEnd(descriptor, {begin, left.end});
+    if (text.empty()) {
+        return {};
+    }
     if (begin != left.begin) {
         // It begins in the middle of a line, most likely.
         text.erase(0, text.find('\n') + 1);
