@@ -180,6 +180,10 @@ TEST(DeviceIdentity, IsThePropertyOrAHashThatASaltChanges) {
     const auto salted = std::get<DeviceIdentity>(identity());
     EXPECT_NE(salted.name, hashed.name);
     EXPECT_NE(salted.secret, hashed.secret);
+    directory.write("config/preferences/com.vandra.tamblo.export.json", R"({"device_salt":7})");
+    EXPECT_NE(std::get<DeviceIdentity>(identity()).name, hashed.name) << "also a number";
+    EXPECT_NE(std::get<DeviceIdentity>(identity()).name, salted.name);
+    directory.write("config/preferences/com.vandra.tamblo.export.json", R"({"device_salt":"grain"})");
     for (const char* const name : {"", "unit 7"}) {
         directory.write("config/device-properties.json", json{{"FleetIdentifier", name}}.dump());
         EXPECT_EQ(std::get<DeviceIdentity>(identity()).name, name);
