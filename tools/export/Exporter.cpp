@@ -30,8 +30,7 @@ constexpr std::size_t kMostParts = 64U << 10U;
 constexpr std::chrono::milliseconds kGathering{200};
 constexpr std::size_t kKeptCapacity = 1U << 20U;
 
-/// A payload has 32 levels at most, and stands some levels deep in its line.
-constexpr JsonReadOptions kSinkLine{.mostLevels = 40};
+constexpr JsonReadOptions kSinkLine{.mostLevels = kMostLevelsOfRecord};
 
 std::string directoryOf(const std::string& path) {
     const std::size_t slash = path.find_last_of('/');
