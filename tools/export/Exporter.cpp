@@ -66,6 +66,9 @@ std::optional<std::string> Exporter::run() {
     while (goesOn) {
         goesOn = exportBacklog() && plan_.follows && awaitMore();
     }
+    if (problem_.empty()) {
+        problem_ = output_.problem();
+    }
     // What was not acknowledged has been taken once the output is closed.
     if (problem_.empty() && !output_.close()) {
         problem_ = output_.problem();
