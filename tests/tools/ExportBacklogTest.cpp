@@ -227,6 +227,9 @@ TEST(SinkBacklog, ForgetsNothingOfAFileThatCannotBeReadForAWhile) {
     EXPECT_TRUE(copied.look().isEmpty());
     EXPECT_THAT(copied.problems(), ElementsAre(HasSubstr("begins like another file")));
     EXPECT_THAT(takeAll(copied, Order::oldestFirst), IsEmpty());
+    sink.write(8, 10);
+    EXPECT_TRUE(copied.look().isEmpty());
+    EXPECT_THAT(takeAll(copied, Order::oldestFirst), ElementsAre(8, 9)) << "the one that goes on";
 }
 
 TEST(FileProgress, FillsGapsBeforeItHasTooManyRanges) {

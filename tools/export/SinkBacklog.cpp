@@ -236,6 +236,21 @@ void SinkBacklog::identify(File& file) const {
     file.identity = held != files_.end() ? held->identity : identityOf(file.descriptor.get());
 }
 
+/// Of files that begin alike, the longest stays: it is the one that is written to.
+void SinkBacklog::leaveOutCopies(std::vector<File>& files) {
+    for (File& file : files) {
+        const bool isCopy = std::ranges::any_of(files, [&file](const File& other) {
+            return other.identity == file.identity &&
+                   (other.size > file.size || (other.size == file.size && &other < &file));
+        });
+        if (isCopy && !file.identity.empty()) {
+            problems_.push_back(
+                formatted("{} begins like another file of its sink, and is left out", file.path));
+            file.identity.clear();
+        }
+    }
+}
+
 MissedLines SinkBacklog::look() {
     std::vector<File> files = openFiles();
     SinkProgress before = std::move(unseen_);
@@ -245,13 +260,10 @@ MissedLines SinkBacklog::look() {
     newLines_ = 0;
     for (File& file : files) {
         identify(file);
+    }
+    leaveOutCopies(files);
+    for (File& file : files) {
         if (file.identity.empty()) {
-            continue;
-        }
-        if (std::ranges::find(now, file.identity, &FileProgress::identity) != now.end()) {
-            problems_.push_back(
-                formatted("{} begins like another file of its sink, and is left out", file.path));
-            file.identity.clear();
             continue;
         }
         const auto known = std::ranges::find(before, file.identity, &FileProgress::identity);
