@@ -225,6 +225,7 @@ TEST(Export, MovesTheCursorOnlyWhenTheReaderHasTakenTheRecords) {
         {"mkdir few; head -n 3 logs/power-events.jsonl >few/power-events.jsonl; "
          "LOGS_DIRECTORY=few take | sleep 2; exit ${PIPESTATUS[0]}",
          "ended before it had read all"},
+        {"take --follow | head -n 20000 >out; exit ${PIPESTATUS[0]}", "nobody reads"},
         {"take >/dev/full", "No space left"},
         {"take --batch 10 </dev/null", "closed standard input"},
         {"take --batch 10 < <(sleep 0.3)", "it acknowledge"},

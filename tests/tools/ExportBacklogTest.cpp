@@ -182,6 +182,27 @@ TEST(SinkBacklog, ReadsAFileAnewThatAPowerCutTookBack) {
     EXPECT_THAT(takeAll(sink.path(), progress), ElementsAre(0, 1, 2, 30, 31, 32, 33, 34));
 }
 
+TEST(SinkBacklog, HandsOverNothingOfWhatIsCutOffWhileItIsRead) {
+    for (const Order order : {Order::oldestFirst, Order::newestFirst}) {
+        for (const std::size_t filling : {std::size_t{0}, SinkBacklog::kPieceBytes}) {
+            WrittenSink sink;
+            for (const int number : {0, 1}) {
+                sink.append(numberedLine(number, filling));
+            }
+            const std::string whole = test::contentOf(sink.path());
+            SinkBacklog backlog(sink.path(), {});
+            EXPECT_TRUE(backlog.look().isEmpty());
+            // The last line has no end any more; then it is as long as it was, and another one.
+            for (const std::string& left :
+                 {whole.substr(0, whole.size() - 5), whole.substr(0, whole.size() - 5) + "xxxxx"}) {
+                test::writeFile(sink.path(), left);
+                const Piece piece = backlog.next(order, 1000);
+                EXPECT_EQ(piece.text, order == Order::newestFirst ? "" : numberedLine(0, filling));
+            }
+        }
+    }
+}
+
 TEST(SinkBacklog, ForgetsNothingOfAFileThatCannotBeReadForAWhile) {
     WrittenSink sink;
     SinkProgress progress;
@@ -206,6 +227,9 @@ TEST(SinkBacklog, ForgetsNothingOfAFileThatCannotBeReadForAWhile) {
     EXPECT_TRUE(copied.look().isEmpty());
     EXPECT_THAT(copied.problems(), ElementsAre(HasSubstr("begins like another file")));
     EXPECT_THAT(takeAll(copied, Order::oldestFirst), IsEmpty());
+    sink.write(8, 10);
+    EXPECT_TRUE(copied.look().isEmpty());
+    EXPECT_THAT(takeAll(copied, Order::oldestFirst), ElementsAre(8, 9)) << "the one that goes on";
 }
 
 TEST(FileProgress, FillsGapsBeforeItHasTooManyRanges) {

@@ -38,7 +38,7 @@ constexpr std::string_view kLine =
 std::string exported(std::string_view format, std::string_view line) {
     const auto row = std::ranges::find(recordFormats(), format, &FormatRow::name);
     const auto made = row->make({.name = "de/vice", .version = "1.2"});
-    const auto fields = parseJsonObject(line);
+    const auto fields = parseJsonObject(line, {.mostLevels = kMostLevelsOfRecord});
     TextBuffer out;
     made->begin(out);
     made->add(out, {"id/1", "analytics-events", std::get<Dictionary>(fields)});
@@ -105,8 +105,12 @@ TEST(RecordFormat, WritesMessagesThatAnIndependentImplementationReadsAndWrites) 
     if (std::system("command -v protoc >/dev/null") != 0) {
         GTEST_SKIP() << "protoc is not installed (Debian: protobuf-compiler)";
     }
+    std::string deepest = "{}";
+    for (int level = 1; level != kMostLevelsOfRecord; ++level) {
+        deepest = "{\"a\":" + deepest + "}";
+    }
     for (const std::string_view line :
-         {kLine, std::string_view("{}"),
+         {kLine, std::string_view("{}"), std::string_view(deepest),
           std::string_view(R"({"":"","time":0,"n":{"a":[[0.0,""],[true]]}})")}) {
         std::string message = exported("protobuf", line);
         std::size_t length = 0;
@@ -180,6 +184,10 @@ TEST(DeviceIdentity, IsThePropertyOrAHashThatASaltChanges) {
     const auto salted = std::get<DeviceIdentity>(identity());
     EXPECT_NE(salted.name, hashed.name);
     EXPECT_NE(salted.secret, hashed.secret);
+    directory.write("config/preferences/com.vandra.tamblo.export.json", R"({"device_salt":7})");
+    EXPECT_NE(std::get<DeviceIdentity>(identity()).name, hashed.name) << "also a number";
+    EXPECT_NE(std::get<DeviceIdentity>(identity()).name, salted.name);
+    directory.write("config/preferences/com.vandra.tamblo.export.json", R"({"device_salt":"grain"})");
     for (const char* const name : {"", "unit 7"}) {
         directory.write("config/device-properties.json", json{{"FleetIdentifier", name}}.dump());
         EXPECT_EQ(std::get<DeviceIdentity>(identity()).name, name);

@@ -44,6 +44,10 @@ std::variant<std::string, std::string> fail(std::string text) {
     return std::variant<std::string, std::string>(std::in_place_index<1>, std::move(text));
 }
 
+std::string textOf(const Value& value) {
+    return value.isString() ? std::string(value.stringValue()) : jsonText(value);
+}
+
 /// The salt, or what is wrong.
 std::variant<std::string, std::string> readSalt(const wire::Directories& directories) {
     const auto file = PreferenceFile::of(directories.preferences(), kExportDomain);
@@ -52,8 +56,8 @@ std::variant<std::string, std::string> readSalt(const wire::Directories& directo
         return fail(*wrong);
     }
     const Value* const salt = std::get<Dictionary>(read).find("device_salt");
-    return std::variant<std::string, std::string>(
-        std::in_place_index<0>, salt == nullptr ? std::string() : std::string(salt->stringValue()));
+    return std::variant<std::string, std::string>(std::in_place_index<0>,
+                                                  salt == nullptr ? std::string() : textOf(*salt));
 }
 
 } // namespace
@@ -73,7 +77,7 @@ std::variant<DeviceIdentity, std::string> DeviceIdentity::read(const wire::Direc
                             .secret = machine + ":" + std::get<0>(salt),
                             .hasSecret = !machine.empty() || !std::get<0>(salt).empty()};
     if (const Value* const name = std::get<Dictionary>(properties).find("FleetIdentifier")) {
-        identity.name = name->isString() ? std::string(name->stringValue()) : jsonText(*name);
+        identity.name = textOf(*name);
         if (identity.name.size() > kLongestName) {
             return formatted("the device property FleetIdentifier has more than {} bytes", kLongestName);
         }

@@ -156,10 +156,16 @@ ExportOutput::Woken ExportOutput::wait(int descriptor, std::optional<nanoseconds
     if (isEnding()) {
         return Woken::byEnd;
     }
-    pollfd watched{.fd = descriptor, .events = POLLIN, .revents = 0};
+    // An output that nobody reads any more tells so without being asked for.
+    std::array<pollfd, 2> watched{{{.fd = descriptor, .events = POLLIN, .revents = 0},
+                                   {.fd = STDOUT_FILENO, .events = 0, .revents = 0}}};
     const timespec time = timeOf(most.value_or(nanoseconds(0)));
-    const int count = ::ppoll(&watched, 1, most ? &time : nullptr, &before_);
+    const int count = ::ppoll(watched.data(), watched.size(), most ? &time : nullptr, &before_);
     if (isEnding()) {
+        return Woken::byEnd;
+    }
+    if (count > 0 && watched[1].revents != 0) {
+        (void)fail("nobody reads what is exported any more");
         return Woken::byEnd;
     }
     return count > 0 ? Woken::byFile : Woken::byTime;

@@ -15,6 +15,7 @@
 #include <utility>
 
 #include <sys/inotify.h>
+#include <sys/timerfd.h>
 #include <unistd.h>
 
 namespace tamblo::tools {
@@ -30,12 +31,20 @@ constexpr std::size_t kMostParts = 64U << 10U;
 constexpr std::chrono::milliseconds kGathering{200};
 constexpr std::size_t kKeptCapacity = 1U << 20U;
 
-/// A payload has 32 levels at most, and stands some levels deep in its line.
-constexpr JsonReadOptions kSinkLine{.mostLevels = 40};
+constexpr JsonReadOptions kSinkLine{.mostLevels = kMostLevelsOfRecord};
 
 std::string directoryOf(const std::string& path) {
     const std::size_t slash = path.find_last_of('/');
     return slash == 0 ? "/" : path.substr(0, slash);
+}
+
+/// Can be read from at a time of the system's clock, and when that is set: unlike a time that is waited for,
+/// it comes no later where the device sleeps meanwhile.
+FileDescriptor alarmAt(std::int64_t secondsSince1970) {
+    FileDescriptor alarm(::timerfd_create(CLOCK_REALTIME, TFD_CLOEXEC | TFD_NONBLOCK));
+    const itimerspec when{.it_interval = {}, .it_value = {.tv_sec = secondsSince1970, .tv_nsec = 0}};
+    (void)::timerfd_settime(alarm.get(), TFD_TIMER_ABSTIME | TFD_TIMER_CANCEL_ON_SET, &when, nullptr);
+    return alarm;
 }
 
 bool hasTooManyParts(std::string_view line) {
@@ -66,6 +75,9 @@ std::optional<std::string> Exporter::run() {
     bool goesOn = !plan_.follows || watch();
     while (goesOn) {
         goesOn = exportBacklog() && plan_.follows && awaitMore();
+    }
+    if (problem_.empty()) {
+        problem_ = output_.problem();
     }
     // What was not acknowledged has been taken once the output is closed.
     if (problem_.empty() && !output_.close()) {
@@ -267,7 +279,8 @@ bool Exporter::fitsBudget(const Piece& piece) const {
 bool Exporter::awaitMore() {
     if (isBudgetSpent_) {
         const std::int64_t left = kSecondsPerDay - std::time(nullptr) % kSecondsPerDay;
-        return output_.wait(-1, std::chrono::seconds(left)) != ExportOutput::Woken::byEnd;
+        const FileDescriptor nextDay = alarmAt((cursor_.spent().day + 1) * kSecondsPerDay);
+        return output_.wait(nextDay.get(), std::chrono::seconds(left)) != ExportOutput::Woken::byEnd;
     }
     return (hasNews_ || output_.wait(watch_.get(), std::nullopt) != ExportOutput::Woken::byEnd) &&
            output_.wait(-1, kGathering) != ExportOutput::Woken::byEnd && watch();

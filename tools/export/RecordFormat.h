@@ -18,6 +18,11 @@ struct ExportedDevice {
     std::string version; ///< of what exports
 };
 
+/// Arrays and objects within one another, the line among them: a payload has 32 at most. Readers of Protocol
+/// Buffers refuse more than 100 messages within one another, of which each level takes three; and with one
+/// message they refuse all that stands behind it.
+inline constexpr int kMostLevelsOfRecord = 33;
+
 /// A line of a sink on its way to an engine.
 struct ExportedRecord {
     /// DEVICE/SINK/FILE/OFFSET: the same whenever the line is exported, so that repeats can be left out.

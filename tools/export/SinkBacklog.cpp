@@ -137,11 +137,20 @@ Piece makePiece(std::string identity, Range range, std::string text) {
     return {std::move(identity), range, std::move(text), lines};
 }
 
+/// What stands in the range, whose end was that of a line; nothing where that has been cut off, or something
+/// else stands in its place, since the file was looked at.
+std::string readToLineEnd(int descriptor, Range range) {
+    std::string text = readAt(descriptor, range.begin, range.end - range.begin);
+    const bool isWhole = text.size() == range.end - range.begin && text.ends_with('\n');
+    return isWhole ? text : std::string();
+}
+
 /// One line, which is longer than a piece.
 Piece lineAsPiece(int descriptor, std::string identity, Range line) {
     const bool isTooLong = line.end - line.begin > SinkBacklog::kLongestLine;
-    return {std::move(identity), line,
-            isTooLong ? std::string() : readAt(descriptor, line.begin, line.end - line.begin), 1};
+    std::string text = isTooLong ? std::string() : readToLineEnd(descriptor, line);
+    const bool isGone = !isTooLong && text.empty();
+    return isGone ? Piece{} : Piece{std::move(identity), line, std::move(text), 1};
 }
 
 Piece firstOf(int descriptor, const FileProgress& file, std::uint64_t mostLines) {
@@ -162,7 +171,10 @@ Piece lastOf(int descriptor, const FileProgress& file, std::uint64_t mostLines) 
     const Range left = file.lastLeft();
     const std::uint64_t begin =
         std::max(left.begin, left.end - std::min<std::uint64_t>(left.end, SinkBacklog::kPieceBytes));
-    std::string text = readAt(descriptor, begin, left.end - begin);
+    std::string text = readToLineEnd(descriptor, {begin, left.end});
+    if (text.empty()) {
+        return {};
+    }
     if (begin != left.begin) {
         // It begins in the middle of a line, most likely.
         text.erase(0, text.find('\n') + 1);
@@ -224,6 +236,21 @@ void SinkBacklog::identify(File& file) const {
     file.identity = held != files_.end() ? held->identity : identityOf(file.descriptor.get());
 }
 
+/// Of files that begin alike, the longest stays: it is the one that is written to.
+void SinkBacklog::leaveOutCopies(std::vector<File>& files) {
+    for (File& file : files) {
+        const bool isCopy = std::ranges::any_of(files, [&file](const File& other) {
+            return other.identity == file.identity &&
+                   (other.size > file.size || (other.size == file.size && &other < &file));
+        });
+        if (isCopy && !file.identity.empty()) {
+            problems_.push_back(
+                formatted("{} begins like another file of its sink, and is left out", file.path));
+            file.identity.clear();
+        }
+    }
+}
+
 MissedLines SinkBacklog::look() {
     std::vector<File> files = openFiles();
     SinkProgress before = std::move(unseen_);
@@ -233,13 +260,10 @@ MissedLines SinkBacklog::look() {
     newLines_ = 0;
     for (File& file : files) {
         identify(file);
+    }
+    leaveOutCopies(files);
+    for (File& file : files) {
         if (file.identity.empty()) {
-            continue;
-        }
-        if (std::ranges::find(now, file.identity, &FileProgress::identity) != now.end()) {
-            problems_.push_back(
-                formatted("{} begins like another file of its sink, and is left out", file.path));
-            file.identity.clear();
             continue;
         }
         const auto known = std::ranges::find(before, file.identity, &FileProgress::identity);

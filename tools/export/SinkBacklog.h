@@ -82,6 +82,7 @@ private:
     [[nodiscard]] std::vector<File> openFiles();
     void open(const std::string& path, std::vector<File>& files);
     void identify(File& file) const;
+    void leaveOutCopies(std::vector<File>& files);
 
     std::string path_;
     SinkProgress progress_;
