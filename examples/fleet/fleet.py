@@ -109,6 +109,16 @@ class Fleet:
     def pid_file(self, number):
         return os.path.join(self.place, f"shard{number}", "pid")
 
+    def is_running(self, number):
+        """Whether the process whose number was written down is still that server, and not another's after a crash."""
+        try:
+            with open(self.pid_file(number), encoding="utf-8") as file:
+                pid = int(file.read())
+            with open(f"/proc/{pid}/cmdline", "rb") as file:
+                return f"--config-file={self.place}/shard{number}/config.xml".encode() in file.read().split(b"\0")
+        except (FileNotFoundError, ProcessLookupError, ValueError):
+            return False
+
     def start(self, number):
         own = os.path.join(self.place, f"shard{number}")
         with open(os.path.join(own, "log"), "a", encoding="utf-8") as log:
@@ -126,17 +136,15 @@ class Fleet:
             time.sleep(0.1)
 
     def stop(self, number):
-        try:
-            with open(self.pid_file(number), encoding="utf-8") as file:
-                pid = int(file.read())
-            os.remove(self.pid_file(number))
-            os.kill(pid, 15)
-        except (FileNotFoundError, ProcessLookupError):
+        if not self.is_running(number):
             return
+        with open(self.pid_file(number), encoding="utf-8") as file:
+            pid = int(file.read())
+        os.kill(pid, 15)
         for _ in range(300):
             with contextlib.suppress(ChildProcessError):
                 os.waitpid(pid, os.WNOHANG)
-            if not os.path.exists(f"/proc/{pid}"):
+            if not self.is_running(number):
                 return
             time.sleep(0.1)
         raise Failed(f"shard {number} does not end")
@@ -191,14 +199,15 @@ class Fleet:
         records.seek(0)
 
     def rebuild(self, day, number):
-        """Makes all that stands of a day from its records: after a server ended in the middle of a load."""
-        kept = f"fleet.kept_{os.getpid()}"
+        """Makes all that stands of a day from its records: after a server ended in the middle of a load. The records stay
+        where they are, whatever happens meanwhile: their second copies go at the end."""
         tables = self.query("SELECT name FROM system.tables WHERE database = 'fleet' AND engine LIKE '%MergeTree'",
                             number).split()
-        self.query(f"""CREATE TABLE {kept} ENGINE = StripeLog AS
-            SELECT id, {KEPT}, replaceAll(extract(_table, '^sink_(.*)_local$'), '_', '-') AS sink
-            FROM fleet.records_local WHERE day = '{day}' LIMIT 1 BY id""", number)
-        for table in tables:
+        of_sinks = [f"sink_{sink.replace('-', '_')}_local" for sink in SINKS]
+        for table in set(tables).difference(of_sinks):
             self.query(f"ALTER TABLE fleet.{table} DROP PARTITION '{day}'", number)
-        self.query(f"INSERT INTO fleet.incoming (id, sink, {KEPT}) SELECT id, sink, {KEPT} FROM {kept}; "
-                   f"DROP TABLE {kept}", number)
+        self.query(f"""INSERT INTO fleet.incoming (id, sink, {KEPT})
+            SELECT id, replaceAll(extract(_table, '^sink_(.*)_local$'), '_', '-') AS sink, {KEPT}
+            FROM fleet.records_local WHERE day = '{day}' LIMIT 1 BY id""", number)
+        for table in of_sinks:
+            self.query(f"OPTIMIZE TABLE fleet.{table} PARTITION '{day}' FINAL", number)

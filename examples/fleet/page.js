@@ -56,6 +56,8 @@ function columnsOf(answer, plot) {
     return [...sums].map(([label, sum]) => [String(label).replace(/^\d{4}-/, ''), sum, String(label)]);
 }
 
+const asTable = (listed) => element('details', '', element('summary', '', 'As a table'), listed);
+
 function figureOf(answer) {
     const number = answer.question.slice(0, 2);
     const plot = PLOTS[number];
@@ -63,10 +65,12 @@ function figureOf(answer) {
     const listed = element('div', 'scroll', table('', '', answer.columns.map((name) => name.replaceAll('_', ' ')), rows));
     if (rows.length === 0) { return figure(`question-${number}`, answer.tells, [element('p', 'hint', 'None.')]); }
     if (plot?.along) {
-        return columnFigure(`question-${number}`, { title: answer.tells, unit: plot.unit, axis: plot.along,
+        const made = columnFigure(`question-${number}`, { title: answer.tells, unit: plot.unit, axis: plot.along,
             columns: columnsOf(answer, plot), headings: [plot.along, plot.unit], className: 'output' });
+        made.querySelector('details').replaceWith(asTable(listed));
+        return made;
     }
-    const content = plot ? [barsOf(answer, plot), element('details', '', element('summary', '', 'As a table'), listed)] : [listed];
+    const content = plot ? [barsOf(answer, plot), asTable(listed)] : [listed];
     return figure(`question-${number}`, answer.tells, content);
 }
 

@@ -80,6 +80,13 @@ def wilson(hits, count):
     return [share, max(middle - spread, 0) / (1 + z * z / count), (middle + spread) / (1 + z * z / count)]
 
 
+def byar(count):
+    """The 95 % bounds of a count: the cube of what is nearly normal."""
+    low, high = (at * (1 - 1 / (9 * at) + z / (3 * math.sqrt(at))) ** 3 if at else 0
+                 for at, z in ((count, -1.96), (count + 1, 1.96)))
+    return max(low, 0), high
+
+
 class Answers:
     """`answers.question(6)` has the rows of question 6, in no order."""
 
@@ -143,8 +150,7 @@ class Answers:
         counts = {group: len(found) for group, found in grouped(issues, by)}
         for group, sessions in grouped(self.sessions, by):
             count, hours = counts.get(group, 0), total(sessions, "total_active_time") / 3600
-            root = math.sqrt(count + 3 / 8)
-            yield *group, count, hours, count / hours, max(root - 0.98, 0) ** 2 / hours, (root + 0.98) ** 2 / hours
+            yield *group, count, hours, count / hours, *(bound / hours for bound in byar(count))
 
     def answer08(self):
         shares = collections.defaultdict(dict)
@@ -156,7 +162,8 @@ class Answers:
                 rate = sum(count for count, _ in devices) / sum(hours for _, hours in devices)
                 shares[kind][release] = (rate, sum(count > hours for count, hours in devices), len(devices))
         for kind, releases in shares.items():
-            for before, release in zip(sorted(releases), sorted(releases)[1:]):
+            ordered = sorted(releases, key=lambda release: [int(part) for part in release.split(".")])
+            for before, release in zip(ordered, ordered[1:]):
                 (rate, hits, count), (old_rate, old_hits, old_count) = releases[release], releases[before]
                 both = (hits + old_hits) / (count + old_count)
                 deviations = (hits / count - old_hits / old_count) / math.sqrt(
@@ -169,6 +176,8 @@ class Answers:
             parts = [[one for one in sessions if ((self.newest - one.day).days < 5) == is_now] for is_now in (True, False)]
             (now, now_hours), (old, hours) = ((total(part, "overload_count"), total(part, "total_active_time") / 3600)
                                               for part in parts)
+            if 0 in (hours, now_hours):
+                continue
             rate = (old + 0.5) / (hours + 1)
             expected = rate * now_hours
             if now >= 5 and (now - expected) / math.sqrt(expected) > 5:
@@ -183,12 +192,15 @@ class Answers:
     def answer11(self):
         seen = [record for record in self.records if record.is_called("accessoryregistration")]
         lives = collections.defaultdict(list)
-        for (model, _), found in grouped(seen, lambda record: (record.payload["model"], record.device)):
+        heard = {device: max(record.day for record in records) for device, records in self.by_device}
+        oldest = min(record.day for record in self.records)
+        for (model, device), found in grouped(seen, lambda record: (record.payload["model"], record.device)):
             first = min(datetime.date.fromisoformat(record.payload["first_seen_day"]) for record in found)
-            lives[model].append((first, max(record.day for record in found)))
-        for model, pairs in lives.items():
+            if first >= oldest:
+                lives[model].append((first, max(record.day for record in found), heard[device]))
+        for model, found in lives.items():
             for after in (1, 3, 7, 14):
-                old = [(last - first).days >= after for first, last in pairs if (self.newest - first).days >= after]
+                old = [(last - first).days >= after for first, last, end in found if (end - first).days >= after]
                 if old:
                     yield model, after, len(old), sum(old) / len(old)
 

@@ -5,10 +5,13 @@ questions find against what was planted, and what comes of faults.
     check.py DIRECTORY OF tambloctl AND tamblo_fleet
 """
 
+import datetime
 import json
+import math
 import os
 import random
 import shutil
+import signal
 import subprocess
 import sys
 import tempfile
@@ -40,6 +43,11 @@ def is_same(left, right):
 
 def in_order(rows):
     return sorted(rows, key=lambda row: [str(cell) for cell in row if not isinstance(cell, float)])
+
+
+def at_most(count, mean):
+    """How probable it is that something happens no more often than that, when it happens so often on average."""
+    return sum(math.exp(i * math.log(mean) - mean - math.lgamma(i + 1)) for i in range(count + 1))
 
 
 class Check:
@@ -131,7 +139,7 @@ class Check:
                "what goes round the load is left out where records are asked")
         expect([row["day"] for row in self.ask(20)] == [day], "and daily figures that it spoils are told of")
         self.run("run", self.place, "rebuild", day)
-        expect(self.differing() == [], "until the day is rebuilt")
+        expect(self.count() == before and self.differing() == [], "until the day is rebuilt")
 
     def planted(self):
         print("What was planted")
@@ -151,6 +159,9 @@ class Check:
         worse = [(row["kind"], row["release"]) for row in self.ask(8)]
         expect(worse == [(faults["bad_kind"], faults["bad_release"])], f"the release that raised issues: {worse}")
         rates = {(row["kind"], row["release"]): row for row in self.ask(7)}
+        tails = [at_most(count, bound * row["hours"]) for row in rates.values() for count, bound in
+                 ((row["issues"], row["high"]), (row["issues"] - 1, row["low"])) if count >= 0]
+        expect(all(0.02 < min(tail, 1 - tail) < 0.03 for tail in tails), "bounds of counts leave 2.5 % out on each side")
         bad = rates[faults["bad_kind"], faults["bad_release"]]
         self.near("its overloads in an hour", bad["rate"], faults["bad_overloads_of_hour"], 0.15)
         usual = [row for (_, release), row in rates.items() if release == "4.1"]
@@ -184,7 +195,8 @@ class Check:
         self.make_devices("--first", str(number), "--devices", "1")
         places, ship = self.shipping(f"fleet-{number:06}")
         before = int(self.count().split()[0])
-        self.run("run", self.place, "stop", "2")
+        with open(self.fleet.pid_file(2), encoding="utf-8") as file:
+            os.kill(int(file.read()), signal.SIGKILL)
         self.run(*self.shipping(f"fleet-{number:06}", patience=1)[1], env=places, wanted=1)
         its_places, its_ship = self.shipping(other)
         self.run(*its_ship, env=its_places)
@@ -202,6 +214,7 @@ class Check:
         self.answers = with_it
         expect(self.differing() == [], "and the answers are those of the lines")
         self.kill(number + 1)
+        self.tear(number + 2)
         self.run("report", self.place, "-o", page)
         self.open_page(page, partial=False)
 
@@ -231,6 +244,25 @@ class Check:
         expect(self.count().split() == [str(len(self.answers.records))] * 3 and self.differing() == [],
                "a shipper that is killed again and again loses nothing and doubles nothing")
 
+    def tear(self, number):
+        """Ends a load between the tables that it writes."""
+        name = f"fleet-{number:06}"
+        self.make_devices("--first", str(number), "--devices", "1", "--days", "3")
+        places, ship = self.shipping(name)
+        shard = self.fleet.shard_of(name)
+        self.fleet.query("CREATE MATERIALIZED VIEW fleet.to_so ENGINE = Log AS "
+                         "SELECT throwIf(id != '') AS torn FROM fleet.incoming", shard)
+        self.run(*self.shipping(name, patience=0)[1], env=places, wanted=1)
+        self.fleet.query("DROP TABLE fleet.to_so", shard)
+        self.run(*ship, env=places)
+        self.answers = Answers(self.made)
+        days = [row["day"] for row in self.ask(20)]
+        expect(days != [], "a load that ends between its tables is told of")
+        for day in days:
+            self.run("run", self.place, "rebuild", day)
+        expect(self.count().split() == [str(len(self.answers.records))] * 3 and self.differing() == [],
+               "and has lost nothing when its days are rebuilt")
+
     def odd_records(self):
         print("Records that are odd")
         before, summed = int(self.count().split()[0]), self.count().split()[2]
@@ -251,6 +283,55 @@ class Check:
         left = self.fleet.query("SELECT name FROM system.tables WHERE database = 'fleet' AND name LIKE 'arrivals%'", 1)
         expect(left == "" and int(self.count().split()[0]) == before + 4,
                "what are no columns is refused, and leaves nothing")
+
+    def facts(self):
+        print("What devices say of themselves")
+        newest = self.answers.newest
+        expected = self.ask(11), self.ask(17)
+
+        def line(name, device, days_ago, event, **payload):
+            time = (newest - datetime.date(1970, 1, 1)).days - days_ago
+            payload = json.dumps({"payload": payload}, separators=(",", ":"))
+            return "\t".join((name, device, "9", "analytics-events", str(time * 86400 * 10**9 + len(name)),
+                              event if event.startswith("Korvell") else f"com.vandra.tamblo.{event}", "", "odd.app", "",
+                              payload.replace("\\", "\\\\"))) + "\n"
+
+        start = "HAL_Generic.Start"
+        lines = (line("a", "fact", 3, start, device_kind="one", software_release="4.9")
+                 + line("ab", "fact", 1, start, device_kind="two", software_release="4.10")
+                 + line("abc", "fact", 1, start, something="else")
+                 + "".join(line(f"d{days}", "fact", days, "Session_Generic.Summary") for days in (0, 1, 2, 3, 4))
+                 + line("e", "", 1, start, device_kind="three") + line("ef", "", 1, "Session_Generic.Summary")
+                 + line("g", "fact", 0, "accessoryregistration", model="old", first_seen_day="2001-01-01")
+                 + line("h", "fact", 0, "Korvell_Haptics_EngineOnDuration", EngineOnDuration=1))
+        self.run("run", self.place, "load", "1", input=lines + lines)
+        self.run("run", self.place, "load", "2", input=line("i", "facts", 0, start, device_kind="two", software_release="4.10")
+                 + line("j", "facts", 0, "Session_Generic.Summary", total_active_time=5))
+        found = self.fleet.query("SELECT day, kind, sum(records) FROM fleet.daily_devices WHERE device = 'fact' "
+                                 "GROUP BY day, kind ORDER BY day")
+        expect([row.split("\t")[1:] for row in found.splitlines()] ==
+               [["one", "1"], ["one", "2"], ["one", "1"], ["two", "3"], ["two", "3"]],
+               "each record counts once, as what its device had said last")
+        expect(self.fleet.query("SELECT DISTINCT kind FROM fleet.records WHERE device = ''") == "\n",
+               "devices without a name are not taken for one another")
+        expect(self.ask(11) == expected[0], "accessories from before the oldest day are left out")
+        sound = {row["release"]: row["sound_seconds"] for row in self.ask(17) if row not in expected[1]}
+        expect(sound == {"4.10": 5}, "an application counts on all shards if it is known to one")
+        self.fleet.query("INSERT INTO fleet.daily_devices_local SELECT toDate('%s'), concat('odd', toString(number)), 'odd', "
+                         "number %% 2 ? '4.9' : '4.10', 1, 1, number %% 2 ? 0 : 9, 7200 FROM numbers(40)" % newest, 1)
+        expect([row["release"] for row in self.ask(8) if row["kind"] == "odd"] == ["4.10"], "4.10 comes after 4.9")
+
+    def redacted(self):
+        print("What must not leave a device")
+        places, ship = self.shipping(self.answers.by_device[0][0])
+        export_in = {**self.environment, **places, "TAMBLOCTL": os.path.join(self.place, "spy")}
+        with open(export_in["TAMBLOCTL"], "w", encoding="utf-8") as file:
+            file.write(f"#!/bin/sh\nexec {self.environment['TAMBLOCTL']} \"$@\" | tee -a {self.place}/left\n")
+        os.chmod(export_in["TAMBLOCTL"], 0o755)
+        self.run(*ship[:-1], os.path.join(self.place, "cursor"), "--drop", "device_kind", env=export_in)
+        with open(os.path.join(self.place, "left"), encoding="utf-8") as file:
+            left = file.read()
+        expect("audio_driver" in left and "device_kind" not in left, "does not, in what a device says of itself either")
 
     @staticmethod
     def open_page(path, partial):
@@ -276,6 +357,8 @@ def main(programs):
         check.planted()
         check.faults()
         check.odd_records()
+        check.redacted()
+        check.facts()
     except (SystemExit, Failed):
         print(f"see {place}", file=sys.stderr)
         raise

@@ -1,4 +1,4 @@
--- Sessions with overloads by driver and version, of those in which sound was active, with the 95 % bounds of their share
+-- Sessions with overloads by driver and version, of all but the device's own, with the 95 % bounds of their share
 -- (Wilson).
 SELECT driver, driver_version, sessions, overloaded, overloaded / sessions AS share,
        greatest(share + 1.9208 / sessions - 1.96 * sqrt((share * (1 - share) + 0.9604 / sessions) / sessions), 0)

@@ -4,6 +4,6 @@ FROM (
     SELECT release, sum(seconds) AS engine_seconds FROM fleet.daily_haptics GROUP BY release
 ) AS one ANY LEFT JOIN (
     SELECT release, sum(active_seconds) AS sound_seconds FROM fleet.daily_sessions
-    WHERE application IN (SELECT application FROM fleet.daily_haptics_local) GROUP BY release
+    WHERE application GLOBAL IN (SELECT application FROM fleet.daily_haptics) GROUP BY release
 ) AS other USING (release)
 ORDER BY release

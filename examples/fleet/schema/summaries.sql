@@ -68,6 +68,7 @@ SELECT cityHash64(id) AS record, day, device, visitParamExtractString(fields, 'm
 FROM fleet.incoming WHERE day != toDate(0) AND event = 'com.vandra.tamblo.accessoryregistration';
 
 -- What a device says of itself when its own session begins. A load looks here what the others of its records come from.
+-- Messages of that name without a kind are somebody else's.
 CREATE TABLE fleet.devices_local (
     day Date, device String, time UInt64, kind String, release String, driver String, driver_version String
 ) ENGINE = ReplacingMergeTree() PARTITION BY day ORDER BY (device, time);
@@ -78,4 +79,5 @@ SELECT day, device, time, visitParamExtractString(fields, 'device_kind') AS kind
        visitParamExtractString(fields, 'software_release') AS release,
        visitParamExtractString(fields, 'audio_driver') AS driver,
        visitParamExtractString(fields, 'audio_driver_version') AS driver_version
-FROM fleet.incoming WHERE day != toDate(0) AND event = 'com.vandra.tamblo.HAL_Generic.Start';
+FROM fleet.incoming WHERE day != toDate(0) AND event = 'com.vandra.tamblo.HAL_Generic.Start'
+  AND visitParamExtractString(fields, 'device_kind') != '';
