@@ -134,8 +134,8 @@ TEST_F(PipeWireDevice, tellsTwoHeadsetsApartWhoseNamesAreAddresses) {
     pass(1s);
     for (const auto& [name, nick] : {std::pair(mine, "Mine"), std::pair(yours, "Yours")}) {
         take();
-        world_.graph.changeServer([name = name](Server& server) {
-            takeMetadata(server, "default.audio.sink", R"({"name":")" + name + "\"}");
+        world_.graph.changeServer([chosen = name](Server& server) {
+            takeMetadata(server, "default.audio.sink", R"({"name":")" + chosen + "\"}");
         });
         pass(1s);
         EXPECT_EQ(take(), "1 Routing_RouteChange Generic");
