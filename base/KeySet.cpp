@@ -125,7 +125,8 @@ KeySetRef KeySet::make(std::span<const std::string_view> sortedKeys) {
 }
 
 const KeySetRef& KeySet::empty() {
-    static const KeySetRef none = make({});
+    // Never destroyed: a program may end, by `exit`, while another of its threads builds a dictionary.
+    static const KeySetRef& none = *new KeySetRef(make({}));
     return none;
 }
 

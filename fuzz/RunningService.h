@@ -39,6 +39,11 @@ public:
         struct stat status {};
         return ::fstat(STDERR_FILENO, &status) == 0 ? static_cast<std::uint64_t>(status.st_size) : 0;
     }
+    /// What is on the disk.
+    void remove() const {
+        std::error_code ignored;
+        std::filesystem::remove_all(directory_.path(), ignored);
+    }
     /// Posts a notification, as another program would.
     void post(std::uint64_t state) const {
         directory_.write("run/notifications/com.vandra.dashlo.ringerstate", std::to_string(state));
@@ -70,12 +75,6 @@ private:
         while (!std::filesystem::exists(socketPath())) {
             std::this_thread::sleep_for(std::chrono::milliseconds(1));
         }
-        // Nothing is torn down while the service's threads run.
-        std::atexit([] {
-            std::error_code ignored;
-            std::filesystem::remove_all(get().directory_.path(), ignored);
-            std::_Exit(EXIT_SUCCESS);
-        });
     }
 
     void run() {
