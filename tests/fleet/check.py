@@ -332,6 +332,11 @@ class Check:
         with open(os.path.join(self.place, "left"), encoding="utf-8") as file:
             left = file.read()
         expect("audio_driver" in left and "device_kind" not in left, "does not, in what a device says of itself either")
+        os.remove(os.path.join(self.place, "left"))
+        self.run("run", self.place, "ship", "-e", "com.vandra.tamblo.Volume.Summary", env=export_in)
+        with open(os.path.join(self.place, "left"), encoding="utf-8") as file:
+            left = file.read()
+        expect("Volume.Summary" in left and "HAL_Generic.Start" not in left, "nor do events that nobody asked for")
 
     @staticmethod
     def open_page(path, partial):
