@@ -232,8 +232,9 @@ constexpr Command kCommandExport{
     "when\n"
     "it answers the empty line (of protobuf the empty message) that ends each batch with a line; else at "
     "the\n"
-    "end, when the output was closed without an error. A kill loses nothing, and repeats one batch at most.\n"
-    "Exits with 1 when something could not be read or written.",
+    "end, when the output was closed without an error. A kill loses nothing; it repeats the batch, or "
+    "without\n"
+    "--batch all, that was not taken. Exits with 1 when something could not be read or written.",
     kOptions,
     run,
 };

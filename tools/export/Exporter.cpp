@@ -25,7 +25,8 @@ namespace {
 constexpr std::int64_t kSecondsPerDay = 86'400;
 /// Lines of a piece where the reader does not say.
 constexpr std::uint64_t kUsualBatch = 4'096;
-/// Values, keys and ends of a line: what it takes in memory grows with these more than with its bytes.
+/// Commas, colons and opening brackets of a line: what it takes in memory grows with these more than with its
+/// bytes.
 constexpr std::size_t kMostParts = 64U << 10U;
 /// Lines that come one by one are exported together, so that a batch has more than one.
 constexpr std::chrono::milliseconds kGathering{200};
