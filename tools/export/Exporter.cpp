@@ -281,10 +281,9 @@ bool Exporter::awaitMore() {
     if (isBudgetSpent_) {
         const std::int64_t left = kSecondsPerDay - std::time(nullptr) % kSecondsPerDay;
         const FileDescriptor nextDay = alarmAt((cursor_.spent().day + 1) * kSecondsPerDay);
-        return output_.wait(nextDay.get(), std::chrono::seconds(left)) != ExportOutput::Woken::byEnd;
+        return output_.wait(nextDay.get(), std::chrono::seconds(left));
     }
-    return (hasNews_ || output_.wait(watch_.get(), std::nullopt) != ExportOutput::Woken::byEnd) &&
-           output_.wait(-1, kGathering) != ExportOutput::Woken::byEnd && watch();
+    return (hasNews_ || output_.wait(watch_.get(), std::nullopt)) && output_.wait(-1, kGathering) && watch();
 }
 
 /// Again at each wait, as a directory may have been replaced; the same one is not watched twice.
