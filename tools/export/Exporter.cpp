@@ -138,7 +138,7 @@ void Exporter::lookAtNews() {
 
 /// Where files are gone that nobody has seen to their end, the service may know how many lines they had: what
 /// it has written since the last look, but for what is there.
-MissedLines Exporter::look(Sink& sink) {
+MissedLines Exporter::lookAt(Sink& sink) {
     const auto before = cursor_.written(sink.name);
     const auto now = sink.isOfService ? serviceCount_.of(sink.name) : std::nullopt;
     const bool hadNone = sink.backlog.progress().empty();
@@ -156,7 +156,7 @@ MissedLines Exporter::look(Sink& sink) {
 
 void Exporter::look() {
     for (Sink& sink : sinks_) {
-        if (const MissedLines missed = look(sink); !missed.isEmpty()) {
+        if (const MissedLines missed = lookAt(sink); !missed.isEmpty()) {
             counts_.missed += missed.known;
             sayMissed(sink, missed);
         }
