@@ -71,6 +71,8 @@ install(CODE "
 # The documents lie as they do in the tree, so that their links hold.
 install(DIRECTORY examples DESTINATION "${CMAKE_INSTALL_DOCDIR}" USE_SOURCE_PERMISSIONS
     PATTERN demo EXCLUDE PATTERN __pycache__ EXCLUDE)
+# What the page of examples/fleet has of that of tambloctl report.
+install(FILES tools/report/page.css tools/report/plots.js DESTINATION "${CMAKE_INSTALL_DOCDIR}/tools/report")
 install(DIRECTORY docs DESTINATION "${CMAKE_INSTALL_DOCDIR}")
 install(FILES README.md DESTINATION "${CMAKE_INSTALL_DOCDIR}")
 install(FILES packaging/audio_issue_detected.proto packaging/exported_record.proto DESTINATION "${CMAKE_INSTALL_DATADIR}/tamblo")

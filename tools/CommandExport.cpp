@@ -101,19 +101,6 @@ std::optional<std::string> takeSelection(const Arguments& arguments, ExportPlan&
     return std::nullopt;
 }
 
-/// By the name of a known sink, or a file's own without its ending.
-std::string sinkName(const std::string& path) {
-    if (const KnownSink* const known = findKnownSink(path)) {
-        return std::string(known->name);
-    }
-    constexpr std::string_view ending = ".jsonl";
-    std::string name = path.substr(path.find_last_of('/') + 1);
-    if (name.ends_with(ending)) {
-        name.resize(name.size() - ending.size());
-    }
-    return name;
-}
-
 std::optional<std::string> takeSinks(const Arguments& arguments, std::string_view logs, ExportPlan& plan) {
     std::set<std::string> paths;
     for (const std::string_view typed : arguments.rest()) {
@@ -130,7 +117,7 @@ std::optional<std::string> takeSinks(const Arguments& arguments, std::string_vie
         }
     }
     for (const std::string& path : paths) {
-        const std::string name = sinkName(path);
+        const std::string name(sinkName(path));
         if (std::ranges::find(plan.sinks, name, &ExportPlan::Sink::name) != plan.sinks.end()) {
             return formatted("two sinks are called {}; the cursor and the records know them by name", name);
         }
@@ -232,8 +219,9 @@ constexpr Command kCommandExport{
     "when\n"
     "it answers the empty line (of protobuf the empty message) that ends each batch with a line; else at "
     "the\n"
-    "end, when the output was closed without an error. A kill loses nothing, and repeats one batch at most.\n"
-    "Exits with 1 when something could not be read or written.",
+    "end, when the output was closed without an error. A kill loses nothing; it repeats the batch, or "
+    "without\n"
+    "--batch all, that was not taken. Exits with 1 when something could not be read or written.",
     kOptions,
     run,
 };

@@ -62,17 +62,8 @@ std::size_t drawRoute(const Device& device, const Application& application, int 
 
 } // namespace
 
-const std::array<Application, kApplicationCount>& applications() noexcept {
-    return kApplications;
-}
 const std::array<Route, kRouteCount>& routes() noexcept {
     return kRoutes;
-}
-const std::array<Kind, 4>& kinds() noexcept {
-    return kKinds;
-}
-const std::array<Release, 3>& releases() noexcept {
-    return kReleases;
 }
 
 const Release& Device::releaseOn(int day) const noexcept {

@@ -47,30 +47,26 @@ struct Release {
     double begins; ///< as a share of the days
 };
 
-[[nodiscard]] const std::array<Application, kApplicationCount>& applications() noexcept;
 [[nodiscard]] const std::array<Route, kRouteCount>& routes() noexcept;
-[[nodiscard]] const std::array<Kind, 4>& kinds() noexcept;
-[[nodiscard]] const std::array<Release, 3>& releases() noexcept;
 
 inline constexpr std::size_t kHeadphones = 1; ///< among the routes
 inline constexpr std::size_t kEarbuds = 2;
-inline constexpr std::size_t kReceiver = 5;
 
 /// What is planted, for questions to find.
 struct Faults {
     double overloadsOfHour = 0.2; ///< where nothing is wrong
     std::string_view badKind = "tablet";
-    std::string_view badRelease = "4.2"; ///< whose driver, on that kind, has
-    double badOverloadsOfHour = 3.0;
-    double degradedShare = 0.03; ///< of the devices: from then on they have
-    double degradedFrom = 0.6;
+    std::string_view badRelease = "4.2";
+    double badOverloadsOfHour = 3.0; ///< with that release, on that kind
+    double degradedShare = 0.03;     ///< of the devices
+    double degradedFrom = 0.6;       ///< as a share of the days; likewise below
     double degradedOverloadsOfHour = 4.0;
-    double silentShare = 0.03; ///< of the devices: nothing is heard of them
+    double silentShare = 0.03; ///< of the devices; nothing is heard of them any more
     double silentFrom = 0.7;
-    std::string_view loudRelease = "4.3"; ///< on phones, headphones are louder by
-    double louderBy = 0.25;
-    std::string_view hapticsRelease = "4.3"; ///< the engine runs longer by this factor
-    double hapticsFactor = 4.0;
+    std::string_view loudRelease = "4.3";
+    double louderBy = 0.25; ///< what headphones of phones are with that release
+    std::string_view hapticsRelease = "4.3";
+    double hapticsFactor = 4.0; ///< by which the haptic engine runs longer with that release
     std::string_view chattyApplication = "com.example.assistant"; ///< says everything again and again
     int repetitions = 12;
     std::array<double, 2> accessoryLossOfDay{0.01, 0.08}; ///< by model

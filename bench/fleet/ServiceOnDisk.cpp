@@ -35,14 +35,6 @@ ServiceOnDisk::ServiceOnDisk(const std::string& configuration, const std::string
     listener.resume();
 }
 
-ServiceOnDisk::~ServiceOnDisk() {
-    run();
-    service_.reset();
-    run();
-    callQuality_->writeHeldBack();
-    sinks_.flush();
-}
-
 std::unique_ptr<FakeClientConnection> ServiceOnDisk::connect(pid_t pid, const std::string& processName) {
     constexpr uid_t kUser = 1000;
     device_.processInformation.names[pid] = processName;
@@ -66,6 +58,15 @@ void ServiceOnDisk::run() {
             pieces += device_.workQueues.run(queue);
         }
     }
+}
+
+std::uint64_t ServiceOnDisk::end() {
+    run();
+    service_.reset();
+    run();
+    callQuality_->writeHeldBack();
+    sinks_.flush();
+    return sinks_.lostLines();
 }
 
 } // namespace tamblo::bench::fleet

@@ -8,6 +8,7 @@
 #include "tests/fakes/FakePlatform.h"
 
 #include <chrono>
+#include <cstdint>
 #include <memory>
 #include <string>
 
@@ -19,8 +20,6 @@ class ServiceOnDisk {
 public:
     /// Sinks are written below `logs`, which exists.
     ServiceOnDisk(const std::string& configuration, const std::string& logs, WallTime start);
-    /// All clients have gone.
-    ~ServiceOnDisk();
     ServiceOnDisk(const ServiceOnDisk&) = delete;
     ServiceOnDisk& operator=(const ServiceOnDisk&) = delete;
 
@@ -30,6 +29,9 @@ public:
     void turnTo(WallTime time);
     /// Has everything done that was asked for.
     void run();
+    /// Ends the service, whose clients have all gone, and writes what waits: how many lines could not be
+    /// written in its time.
+    [[nodiscard]] std::uint64_t end();
 
 private:
     FakeLog log_;

@@ -4,6 +4,7 @@
 #include "FleetModel.h"
 #include "Player.h"
 #include "ServiceOnDisk.h"
+#include "base/Format.h"
 #include "base/Json.h"
 #include "base/NumberText.h"
 
@@ -93,6 +94,9 @@ void makeSinks(const Device& device, const Options& options, const Faults& fault
     Player player(device, faults, service, random);
     for (int day = 0; day != static_cast<int>(options.days); ++day) {
         player.playDay(day, WallTime(first + std::chrono::days(day)));
+    }
+    if (const std::uint64_t lost = service.end(); lost != 0) {
+        throw std::runtime_error(formatted("{} lines could not be written below {}", lost, place.string()));
     }
 }
 

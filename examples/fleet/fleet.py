@@ -42,7 +42,7 @@ USERS = """<yandex><profiles><default><max_memory_usage>6000000000</max_memory_u
 
 
 class Failed(Exception):
-    """A server could not be asked, or refused."""
+    """A server could not be asked, or refused; or a device's records could not be had."""
 
 
 def server_program():
@@ -65,15 +65,18 @@ def statements(*parts, **words):
 
 
 def export(device, options, stdout, **environment):
-    """Writes what a made device has as columns."""
+    """Writes what a made device has as columns. Failed, with the reason, where that cannot be read."""
     places = {"LOGS_DIRECTORY": "logs", "CONFIGURATION_DIRECTORY": "config", "RUNTIME_DIRECTORY": "run"}
     environment = {**os.environ, **environment, **{name: os.path.join(device, part) for name, part in places.items()}}
-    return subprocess.run([environment.get("TAMBLOCTL", "tambloctl"), "export", "--format", "columns", *options],
-                          env=environment, check=True, stdout=stdout, stderr=subprocess.DEVNULL)
+    ran = subprocess.run([environment.get("TAMBLOCTL", "tambloctl"), "export", "--format", "columns", *options],
+                         env=environment, check=False, stdout=stdout, stderr=subprocess.PIPE)
+    if ran.returncode != 0:
+        raise Failed(f"{device} cannot be exported: {ran.stderr.decode(errors='replace').strip()}")
+    return ran
 
 
 class Fleet:
-    """The shards that were made at a place: shard I is there at places[i]."""
+    """The shards that were made at a place, whose numbers begin with 1: shard I listens at shards[I - 1]."""
 
     def __init__(self, place):
         self.place = os.path.realpath(place)
@@ -101,6 +104,12 @@ class Fleet:
 
     def numbers(self):
         return range(1, len(self.shards) + 1)
+
+    def shard_named(self, text):
+        """The number of a shard that somebody typed."""
+        if not text.isdecimal() or int(text) not in self.numbers():
+            raise Failed(f'there is no shard "{text}": they are 1 to {len(self.shards)}')
+        return int(text)
 
     def shard_of(self, device):
         """Where all of a device's records are, so that what is asked of each device is asked in one place."""
@@ -148,6 +157,9 @@ class Fleet:
                 return
             time.sleep(0.1)
         raise Failed(f"shard {number} does not end")
+
+    def has_tables(self, number):
+        return self.query("EXISTS TABLE fleet.shards_local", number).strip() == "1"
 
     def make_tables(self, number):
         self.query(statements("schema", "records.sql"), number)

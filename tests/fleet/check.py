@@ -102,6 +102,7 @@ class Check:
     def compare(self):
         print("A fleet is made and gathered")
         self.make_devices("--devices", str(DEVICES))
+        Fleet.make(self.place, 2).start(1)  # and then it was interrupted
         self.run("run", self.place, "start")
         self.fleet = Fleet(self.place)
         self.run("run", self.place, "gather", self.made)
@@ -280,9 +281,10 @@ class Check:
                "they are kept once, under the day of what cannot be, and counted nowhere")
         self.run("run", self.place, "load", "1", input="")
         self.run("run", self.place, "load", "1", input="one\ttwo\n", wanted=1)
+        self.run("run", self.place, "load", "0", input=lines, wanted=1)
         left = self.fleet.query("SELECT name FROM system.tables WHERE database = 'fleet' AND name LIKE 'arrivals%'", 1)
         expect(left == "" and int(self.count().split()[0]) == before + 4,
-               "what are no columns is refused, and leaves nothing")
+               "what are no columns, or for no shard, is refused and leaves nothing")
 
     def facts(self):
         print("What devices say of themselves")
@@ -332,6 +334,11 @@ class Check:
         with open(os.path.join(self.place, "left"), encoding="utf-8") as file:
             left = file.read()
         expect("audio_driver" in left and "device_kind" not in left, "does not, in what a device says of itself either")
+        os.remove(os.path.join(self.place, "left"))
+        self.run("run", self.place, "ship", "-e", "com.vandra.tamblo.Volume.Summary", env=export_in)
+        with open(os.path.join(self.place, "left"), encoding="utf-8") as file:
+            left = file.read()
+        expect("Volume.Summary" in left and "HAL_Generic.Start" not in left, "nor do events that nobody asked for")
 
     @staticmethod
     def open_page(path, partial):

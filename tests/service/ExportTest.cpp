@@ -227,6 +227,7 @@ TEST(Export, MovesTheCursorOnlyWhenTheReaderHasTakenTheRecords) {
          "ended before it had read all"},
         {"take --follow | head -n 20000 >out; exit ${PIPESTATUS[0]}", "nobody reads"},
         {"take >/dev/full", "No space left"},
+        {TAMBLOCTL_PATH " export --cursor ''", "has no name"},
         {"take --batch 10 </dev/null", "closed standard input"},
         {"take --batch 10 < <(sleep 0.3)", "it acknowledge"},
         {"take --batch 10 < <(yes)", "what it has not been given"},

@@ -193,6 +193,9 @@ TEST(DeviceIdentity, IsThePropertyOrAHashThatASaltChanges) {
         EXPECT_EQ(std::get<DeviceIdentity>(identity()).name, name);
         EXPECT_EQ(std::get<DeviceIdentity>(identity()).secret, salted.secret);
     }
+    EXPECT_THAT(std::get<std::string>(DeviceIdentity::read(directories, directory.path("config"))),
+                HasSubstr("Is a directory"))
+        << "another secret would make other identifiers";
     directory.write("config/device-properties.json", "{");
     EXPECT_THAT(std::get<std::string>(identity()), HasSubstr("device-properties.json"));
 }

@@ -63,6 +63,9 @@ Value valueOf(const FileProgress& file) {
 } // namespace
 
 std::variant<Cursor, std::string> Cursor::open(const std::string& path, std::string_view device) {
+    if (path.empty()) {
+        return std::string("the cursor's file has no name");
+    }
     Cursor cursor;
     cursor.path_ = path;
     cursor.device_ = device;

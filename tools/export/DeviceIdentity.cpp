@@ -72,7 +72,11 @@ std::variant<DeviceIdentity, std::string> DeviceIdentity::read(const wire::Direc
     if (salt.index() == 1) {
         return std::get<1>(salt);
     }
-    const std::string machine(SmallFile::read(machineFile, kMostBytes).trimmed());
+    const SmallFile machineIdentifier = SmallFile::read(machineFile, kMostBytes);
+    if (machineIdentifier.error != 0 && !machineIdentifier.isMissing()) {
+        return formatted("cannot read {}: {}", machineFile, machineIdentifier.reason());
+    }
+    const std::string machine(machineIdentifier.trimmed());
     DeviceIdentity identity{.name = {},
                             .secret = machine + ":" + std::get<0>(salt),
                             .hasSecret = !machine.empty() || !std::get<0>(salt).empty()};

@@ -152,9 +152,9 @@ bool ExportOutput::awaitAcknowledgement() {
     }
 }
 
-ExportOutput::Woken ExportOutput::wait(int descriptor, std::optional<nanoseconds> most) {
+bool ExportOutput::wait(int descriptor, std::optional<nanoseconds> most) {
     if (isEnding()) {
-        return Woken::byEnd;
+        return false;
     }
     // An output that nobody reads any more tells so without being asked for.
     std::array<pollfd, 2> watched{{{.fd = descriptor, .events = POLLIN, .revents = 0},
@@ -162,13 +162,9 @@ ExportOutput::Woken ExportOutput::wait(int descriptor, std::optional<nanoseconds
     const timespec time = timeOf(most.value_or(nanoseconds(0)));
     const int count = ::ppoll(watched.data(), watched.size(), most ? &time : nullptr, &before_);
     if (isEnding()) {
-        return Woken::byEnd;
+        return false;
     }
-    if (count > 0 && watched[1].revents != 0) {
-        (void)fail("nobody reads what is exported any more");
-        return Woken::byEnd;
-    }
-    return count > 0 ? Woken::byFile : Woken::byTime;
+    return count <= 0 || watched[1].revents == 0 || fail("nobody reads what is exported any more");
 }
 
 /// Waits until the reader of a pipe has taken what is in it: one that ends before has not taken all.

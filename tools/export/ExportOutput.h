@@ -17,8 +17,6 @@ namespace tamblo::tools {
 /// is given a little time.
 class ExportOutput {
 public:
-    enum class Woken { byTime, byFile, byEnd };
-
     /// 0 bytes a second are no bound.
     explicit ExportOutput(std::uint64_t bytesPerSecond);
     ~ExportOutput();
@@ -35,9 +33,9 @@ public:
     [[nodiscard]] bool hasSilentReader();
     /// Waits for a line of the reader, one for each batch. False when none will come.
     [[nodiscard]] bool awaitAcknowledgement();
-    /// Waits until there is something to read from the descriptor, for so long, or until the end; that is
+    /// Waits until there is something to read from the descriptor, or for so long. False at the end; that is
     /// also when the reader has gone, which `problem` says then.
-    [[nodiscard]] Woken wait(int descriptor, std::optional<std::chrono::nanoseconds> most);
+    [[nodiscard]] bool wait(int descriptor, std::optional<std::chrono::nanoseconds> most);
     /// Whether all that was written went where it should, as far as the system says so: to the disk, or
     /// through a pipe to a reader that has taken it out.
     [[nodiscard]] bool close();

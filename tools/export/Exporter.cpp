@@ -25,7 +25,8 @@ namespace {
 constexpr std::int64_t kSecondsPerDay = 86'400;
 /// Lines of a piece where the reader does not say.
 constexpr std::uint64_t kUsualBatch = 4'096;
-/// Values, keys and ends of a line: what it takes in memory grows with these more than with its bytes.
+/// Commas, colons and opening brackets of a line: what it takes in memory grows with these more than with its
+/// bytes.
 constexpr std::size_t kMostParts = 64U << 10U;
 /// Lines that come one by one are exported together, so that a batch has more than one.
 constexpr std::chrono::milliseconds kGathering{200};
@@ -137,7 +138,7 @@ void Exporter::lookAtNews() {
 
 /// Where files are gone that nobody has seen to their end, the service may know how many lines they had: what
 /// it has written since the last look, but for what is there.
-MissedLines Exporter::look(Sink& sink) {
+MissedLines Exporter::lookAt(Sink& sink) {
     const auto before = cursor_.written(sink.name);
     const auto now = sink.isOfService ? serviceCount_.of(sink.name) : std::nullopt;
     const bool hadNone = sink.backlog.progress().empty();
@@ -155,7 +156,7 @@ MissedLines Exporter::look(Sink& sink) {
 
 void Exporter::look() {
     for (Sink& sink : sinks_) {
-        if (const MissedLines missed = look(sink); !missed.isEmpty()) {
+        if (const MissedLines missed = lookAt(sink); !missed.isEmpty()) {
             counts_.missed += missed.known;
             sayMissed(sink, missed);
         }
@@ -280,10 +281,9 @@ bool Exporter::awaitMore() {
     if (isBudgetSpent_) {
         const std::int64_t left = kSecondsPerDay - std::time(nullptr) % kSecondsPerDay;
         const FileDescriptor nextDay = alarmAt((cursor_.spent().day + 1) * kSecondsPerDay);
-        return output_.wait(nextDay.get(), std::chrono::seconds(left)) != ExportOutput::Woken::byEnd;
+        return output_.wait(nextDay.get(), std::chrono::seconds(left));
     }
-    return (hasNews_ || output_.wait(watch_.get(), std::nullopt) != ExportOutput::Woken::byEnd) &&
-           output_.wait(-1, kGathering) != ExportOutput::Woken::byEnd && watch();
+    return (hasNews_ || output_.wait(watch_.get(), std::nullopt)) && output_.wait(-1, kGathering) && watch();
 }
 
 /// Again at each wait, as a directory may have been replaced; the same one is not watched twice.

@@ -63,8 +63,9 @@ private:
         bool isOfService;
     };
 
+    /// Which files all sinks have now; says what is missing, and what cannot be read.
     void look();
-    [[nodiscard]] MissedLines look(Sink& sink);
+    [[nodiscard]] MissedLines lookAt(Sink& sink);
     void sayOnce(const std::string& text);
     void sayMissed(const Sink& sink, const MissedLines& missed);
     /// Exports what there is at a look. False when nothing more is to be exported.

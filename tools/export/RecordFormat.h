@@ -25,7 +25,8 @@ inline constexpr int kMostLevelsOfRecord = 33;
 
 /// A line of a sink on its way to an engine.
 struct ExportedRecord {
-    /// DEVICE/SINK/FILE/OFFSET: the same whenever the line is exported, so that repeats can be left out.
+    /// As `RecordIdentifiers` makes it: the same whenever the line is exported, so that repeats can be left
+    /// out.
     std::string identifier;
     std::string_view sink;
     const Dictionary& fields; ///< the line
@@ -52,11 +53,12 @@ struct FormatRow {
 /// json, otlp, protobuf, columns.
 [[nodiscard]] std::span<const FormatRow> recordFormats() noexcept;
 
-/// The fields by which engines sort and select, wherever in a line they stand; empty where it has none.
+/// The fields by which engines sort and select, wherever in a line they stand; but for the event, empty where
+/// it has none.
 struct RecordColumns {
     explicit RecordColumns(const Dictionary& record);
 
-    std::uint64_t nanoseconds = 0; ///< since 1970
+    std::uint64_t nanoseconds = 0; ///< since 1970; 0 of a line without a time
     std::string event;             ///< as `nameOfRecord` has it
     std::string_view session;      ///< the call-quality file's and that of captures
     std::string_view application;

@@ -4,6 +4,7 @@
 #include "base/Sha256.h"
 #include "base/Value.h"
 #include "tools/records/AccessFault.h"
+#include "tools/records/SinkFile.h"
 
 #include <algorithm>
 #include <cerrno>
@@ -19,7 +20,6 @@ namespace tamblo::tools {
 
 namespace {
 
-constexpr int kEarlierFiles = 4;
 /// Files that the cursor remembers while others cannot be read.
 constexpr std::size_t kMostUnseen = 8;
 constexpr std::size_t kReadBytes = 128U << 10U;
@@ -194,9 +194,8 @@ std::vector<SinkBacklog::File> SinkBacklog::openFiles() {
     std::vector<File> files;
     problems_.clear();
     // The newest first: what is renamed meanwhile is then met again, and not missed.
-    open(path_, files);
-    for (int number = 1; number <= kEarlierFiles; ++number) {
-        open(formatted("{}.{}", path_, number), files);
+    for (int number = 0; number <= kEarlierFiles; ++number) {
+        open(fileOfSink(path_, number), files);
     }
     std::ranges::reverse(files);
     return files;

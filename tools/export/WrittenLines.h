@@ -10,8 +10,8 @@ namespace tamblo::tools {
 
 /// What the service has counted of a sink.
 struct WrittenLines {
-    std::uint64_t began =
-        0; ///< when it began to count, in nanoseconds since 1970; by this it is the same count
+    /// When it began to count, in nanoseconds since 1970; by this it is the same count.
+    std::uint64_t began = 0;
     std::uint64_t lines = 0;
 
     /// The lines that came after an earlier reading; nothing where that was of another count.
@@ -25,7 +25,7 @@ struct WrittenLines {
 /// has seen. It is in the file of its counters, which lasts until the machine is switched off.
 class ServiceCount {
 public:
-    explicit ServiceCount(const std::string& runtimeDirectory) : path_(runtimeDirectory + "/counters") {}
+    explicit ServiceCount(std::string_view runtimeDirectory);
 
     /// Nothing without such a file, or with one of another version's.
     [[nodiscard]] std::optional<WrittenLines> of(std::string_view sink) const;

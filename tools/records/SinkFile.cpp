@@ -16,12 +16,7 @@ namespace tamblo::tools {
 
 namespace {
 
-constexpr int kKeptFiles = 4;
 constexpr std::size_t kPieceBytes = 256 * 1024;
-
-std::string rotated(const std::string& path, int number) {
-    return number == 0 ? path : formatted("{}.{}", path, number);
-}
 
 /// Hands over the whole lines from an offset on, and says how many bytes they have.
 std::size_t readLines(int descriptor, off_t offset, LineFunction& line) {
@@ -70,13 +65,16 @@ std::span<const KnownSink> knownSinks() noexcept {
     return kSinks;
 }
 
-const KnownSink* findKnownSink(std::string_view path) noexcept {
+std::string_view sinkName(std::string_view path) noexcept {
     std::string_view name = path.substr(path.find_last_of('/') + 1);
     if (name.ends_with(kEnding)) {
         name.remove_suffix(kEnding.size());
     }
-    const auto found = std::find_if(kSinks.begin(), kSinks.end(),
-                                    [name](const KnownSink& sink) { return sink.name == name; });
+    return name;
+}
+
+const KnownSink* findKnownSink(std::string_view path) noexcept {
+    const auto found = std::ranges::find(kSinks, sinkName(path), &KnownSink::name);
     return found == kSinks.end() ? nullptr : &*found;
 }
 
@@ -91,11 +89,15 @@ std::string sinkPath(std::string_view logsDirectory, std::string_view typed) {
     return path;
 }
 
+std::string fileOfSink(const std::string& path, int number) {
+    return number == 0 ? path : formatted("{}.{}", path, number);
+}
+
 std::vector<std::string> filesOfSink(const std::string& path) {
     std::vector<std::string> files;
-    for (int number = kKeptFiles; number >= 0; --number) {
-        if (exists(rotated(path, number))) {
-            files.push_back(rotated(path, number));
+    for (int number = kEarlierFiles; number >= 0; --number) {
+        if (std::string file = fileOfSink(path, number); exists(file)) {
+            files.push_back(std::move(file));
         }
     }
     return files;
@@ -143,13 +145,13 @@ bool SinkFollower::isFile(const std::string& path) const {
 }
 
 void SinkFollower::openNext() {
-    int number = kKeptFiles;
-    while (number > 0 && !isFile(rotated(path_, number))) {
+    int number = kEarlierFiles;
+    while (number > 0 && !isFile(fileOfSink(path_, number))) {
         --number;
     }
     // One that is found nowhere was deleted: what is older may have been read, so that the newest comes next.
     const int next = std::max(number - 1, 0);
-    openFile(rotated(path_, next));
+    openFile(fileOfSink(path_, next));
 }
 
 void SinkFollower::readToEnd(LineFunction& line) {

@@ -21,12 +21,18 @@ struct KnownSink {
     std::string_view what;
 };
 [[nodiscard]] std::span<const KnownSink> knownSinks() noexcept;
-/// By the name of its file, with or without directory and ending; null for a file of another name.
+/// What a sink is called: its file's name without directory and ending.
+[[nodiscard]] std::string_view sinkName(std::string_view path) noexcept;
+/// By the path or the name of its file, with or without the ending; null for a file of another name.
 [[nodiscard]] const KnownSink* findKnownSink(std::string_view path) noexcept;
 
 /// The path of a report sink from what was typed: a name with or without its ending, or a path.
 [[nodiscard]] std::string sinkPath(std::string_view logsDirectory, std::string_view typed);
 
+/// The files that the service keeps of a sink besides the one that it writes to.
+inline constexpr int kEarlierFiles = 4;
+/// The path of a sink's file by its age: of 0 it is the one that is written to, of 1 the one before.
+[[nodiscard]] std::string fileOfSink(const std::string& path, int number);
 /// The sink's files that exist, the oldest first: NAME.4 … NAME.1, NAME.
 [[nodiscard]] std::vector<std::string> filesOfSink(const std::string& path);
 

@@ -16,7 +16,6 @@ namespace tamblo::tools {
 
 namespace {
 
-constexpr int kEarlierFiles = 4;
 constexpr std::size_t kPieceBytes = 256U << 10U;
 /// The service's own have 16 MiB at most.
 constexpr std::size_t kLongestLine = 32U << 20U;
@@ -25,9 +24,8 @@ constexpr std::size_t kLongestLine = 32U << 20U;
 
 SinkSnapshot::SinkSnapshot(const std::string& path) {
     // The newest first: what is renamed meanwhile is then met again, and not missed.
-    open(path);
-    for (int number = 1; number <= kEarlierFiles; ++number) {
-        open(formatted("{}.{}", path, number));
+    for (int number = 0; number <= kEarlierFiles; ++number) {
+        open(fileOfSink(path, number));
     }
     std::ranges::reverse(files_);
 }

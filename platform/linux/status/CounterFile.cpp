@@ -2,6 +2,7 @@
 
 #include "base/Format.h"
 #include "os/SmallFile.h"
+#include "platform/CounterFileLayout.h"
 
 #include <algorithm>
 #include <array>
@@ -19,19 +20,10 @@ namespace tamblo {
 
 namespace {
 
-constexpr std::string_view kMagic = "tamblo#1";
 constexpr const char* kBootIdentifier = "/proc/sys/kernel/random/boot_id";
 
-struct Header {
-    std::array<char, 8> magic{};
-    std::uint64_t layout = 0;
-    std::uint64_t began = 0;
-    std::array<char, 40> boot{};
-};
-static_assert(sizeof(Header) == 64 && kMagic.size() == sizeof Header::magic);
-
 struct File {
-    Header header;
+    counters::FileHeader header;
     std::array<counters::Slot, counters::kSlots> slots;
 };
 
@@ -69,7 +61,7 @@ FileDescriptor openFile(const std::string& path) {
 
 void CounterFile::open(const std::string& runtimeDirectory, StructuredLog& log) {
     began_ = nanosecondsNow();
-    const std::string path = runtimeDirectory + "/counters";
+    const std::string path = formatted("{}/{}", runtimeDirectory, counters::kFileName);
     const FileDescriptor descriptor = openFile(path);
     void* const place = descriptor.isOpen() ? ::mmap(nullptr, sizeof(File), PROT_READ | PROT_WRITE,
                                                      MAP_SHARED, descriptor.get(), 0)
@@ -80,8 +72,8 @@ void CounterFile::open(const std::string& runtimeDirectory, StructuredLog& log) 
                              std::generic_category().message(errno)));
         return;
     }
-    Header wanted{.layout = counters::layoutHash(), .began = began_, .boot = bootIdentifier()};
-    kMagic.copy(wanted.magic.data(), wanted.magic.size());
+    counters::FileHeader wanted{.layout = counters::layoutHash(), .began = began_, .boot = bootIdentifier()};
+    counters::kFileMagic.copy(wanted.magic.data(), wanted.magic.size());
     File& file = *static_cast<File*>(place);
     const bool isContinued = file.header.magic == wanted.magic && file.header.layout == wanted.layout &&
                              file.header.boot == wanted.boot;

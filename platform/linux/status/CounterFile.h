@@ -11,13 +11,8 @@ namespace tamblo {
 
 /// The counters as a file of the runtime directory, mapped and shared: the kernel has each number as soon as
 /// it is counted, so that they go on after a restart and after a kill. They begin anew with each boot, and
-/// with a program whose counters are others: the file says which boot and which set of counters it is of.
-///
-///     bytes 0 to 7    "tamblo#1"
-///     8 to 15         the hash of the counters' names, labels and order
-///     16 to 23        when they began, in nanoseconds since 1970
-///     24 to 63        the kernel's identifier of the boot, and zeros
-///     from 64 on      the counters, 64 bits each, as the machine writes them
+/// with a program whose counters are others: the file says which boot and which set of counters it is of
+/// (`platform/CounterFileLayout.h`).
 ///
 /// Where there is no such file to be had, one error line says so, and the counters last as long as the
 /// process. The runtime directory is the service's own; nobody else may shorten the file under it.
