@@ -151,6 +151,15 @@ std::optional<std::string> makePlan(const Arguments& arguments, std::string_view
     return takeSinks(arguments, logs, plan);
 }
 
+/// A sink that was never written to is no error, and may be a mistyped path.
+void noteAbsent(const ExportPlan& plan) {
+    for (const auto& sink : plan.sinks) {
+        if (!sink.isOfService && filesOfSink(sink.path).empty()) {
+            complain(ExitStatus::done, formatted("note: there is no {} yet", sink.path));
+        }
+    }
+}
+
 void tell(const Exporter::Counts& counts) {
     std::string text = formatted("{} records", counts.records);
     for (const auto& [number, what] : {std::pair{counts.unreadable, "lines that are no records"},
@@ -201,6 +210,7 @@ ExitStatus run(const Arguments& arguments) {
                                *path));
         }
     }
+    noteAbsent(plan);
     ExportOutput output(rate);
     Exporter exporter(std::move(plan), std::move(cursor), output);
     const auto problem = exporter.run();
