@@ -80,8 +80,11 @@ class Fleet:
 
     def __init__(self, place):
         self.place = os.path.realpath(place)
-        with open(os.path.join(self.place, "shards.json"), encoding="utf-8") as file:
-            self.shards = json.load(file)
+        try:
+            with open(os.path.join(self.place, "shards.json"), encoding="utf-8") as file:
+                self.shards = json.load(file)
+        except FileNotFoundError:
+            raise Failed(f"there is no fleet at {self.place}: \"run {place} start\" makes one") from None
 
     @classmethod
     def make(cls, place, count):

@@ -182,6 +182,9 @@ void Overloads::graphChanged(const GraphEvent& event) {
         tally.goneAt = clock_.now().steady;
         tally.session = sessionOf_(event.id);
     } else if (event.change == GraphEvent::Change::added) {
+        if (replaced_.size() == kMostReplaced) {
+            replaced_.erase(replaced_.begin());
+        }
         replaced_.push_back({.node = event.id, .tally = std::move(tally)});
         tallies_.erase(found);
     }

@@ -8,6 +8,7 @@
 #include "bridge/pipewire/report/SessionOfNode.h"
 
 #include <chrono>
+#include <cstddef>
 #include <cstdint>
 #include <optional>
 #include <string>
@@ -34,6 +35,9 @@ public:
     static constexpr std::chrono::seconds kCalm{10};
     /// A node that has gone is still reported for so long, if its session lasts.
     static constexpr std::chrono::seconds kAfterEnd{3};
+    /// Nodes that have gone and whose numbers others have: each is looked for at each cycle of those. Of
+    /// more, the last overloads of the earliest are not reported.
+    static constexpr std::size_t kMostReplaced = 64;
     /// A node that has not been told of for so long, by the server's clock, begins to run anew.
     static constexpr std::chrono::nanoseconds kPause{std::chrono::milliseconds(250)};
 
