@@ -86,6 +86,8 @@ int Bridge::run() {
         snapshotDue_ = clock_.now().steady + kPatience;
     }
     loop_.run([this] { return beforeSleep(); });
+    // What the graph loses when the connection goes is no news.
+    graph_.removeObservers();
     streams_.endAll();
     device_.end();
     service_.finish(kFarewell);

@@ -42,6 +42,8 @@ public:
 
     /// Observers are told in the order in which they were added, and outlive the graph's last change.
     void addObserver(GraphObserver& observer) { observers_.push_back(&observer); }
+    /// Not from within a change.
+    void removeObservers() noexcept { observers_.clear(); }
 
     /// Changes an object by a function of it, `void(Node&)`, and tells whether it exists, which it does from
     /// the first such call on. Nobody is told of a change that changes nothing.

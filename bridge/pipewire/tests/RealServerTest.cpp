@@ -149,6 +149,8 @@ TEST_F(PipeWireServer, livesThroughRestartsOfAllThree) {
     ASSERT_TRUE(awaitEvents("Session_Playback.Start", 1, "again"));
     const std::string once = "timeout 10 " PROGRAMS_DIR "/tamblo-pipewire --dry-run --once";
     EXPECT_TRUE(PrivateSound::contains(once, "begin, generic, of again"));
+    const std::string snapshot = tamblo::test::run(once).output;
+    EXPECT_EQ(snapshot.find("of again"), snapshot.rfind("of again")) << "nothing twice at the end";
     EXPECT_EQ(tamblo::test::run("PIPEWIRE_REMOTE=nobody " + once).status, 1);
     sound_->pauseServer(true);
     EXPECT_EQ(tamblo::test::run(once).status, 1) << "of a server that says nothing";
