@@ -76,7 +76,9 @@ std::variant<DeviceIdentity, std::string> DeviceIdentity::read(const wire::Direc
     if (machineIdentifier.error != 0 && !machineIdentifier.isMissing()) {
         return formatted("cannot read {}: {}", machineFile, machineIdentifier.reason());
     }
-    const std::string machine(machineIdentifier.trimmed());
+    // systemd's word for a device that has not started yet.
+    const std::string machine(machineIdentifier.trimmed() == "uninitialized" ? ""
+                                                                             : machineIdentifier.trimmed());
     DeviceIdentity identity{.name = {},
                             .secret = machine + ":" + std::get<0>(salt),
                             .hasSecret = !machine.empty() || !std::get<0>(salt).empty()};

@@ -10,6 +10,7 @@
 #include <iterator>
 #include <utility>
 
+#include <linux/sockios.h>
 #include <poll.h>
 #include <sys/ioctl.h>
 #include <sys/stat.h>
@@ -167,13 +168,16 @@ bool ExportOutput::wait(int descriptor, std::optional<nanoseconds> most) {
     return count <= 0 || watched[1].revents == 0 || fail("nobody reads what is exported any more");
 }
 
-/// Waits until the reader of a pipe has taken what is in it: one that ends before has not taken all.
+/// Waits until the reader of a pipe or a socket has taken what is in it: one that ends before has not taken
+/// all.
 bool ExportOutput::isDrained() {
     struct stat status {};
+    (void)::fstat(STDOUT_FILENO, &status);
+    const bool isSocket = S_ISSOCK(status.st_mode);
     int waiting = 0;
     auto interval = kFirstDrainInterval;
-    while (::fstat(STDOUT_FILENO, &status) == 0 && S_ISFIFO(status.st_mode) &&
-           ::ioctl(STDOUT_FILENO, FIONREAD, &waiting) == 0 && waiting != 0) {
+    while ((isSocket || S_ISFIFO(status.st_mode)) &&
+           ::ioctl(STDOUT_FILENO, isSocket ? SIOCOUTQ : FIONREAD, &waiting) == 0 && waiting != 0) {
         if (poll(STDOUT_FILENO, 0, interval) != 0) {
             return fail("the reader ended before it had read all");
         }
@@ -182,7 +186,9 @@ bool ExportOutput::isDrained() {
         }
         interval = std::min(2 * interval, kLastDrainInterval);
     }
-    return true;
+    // A socket drops what its reader has left.
+    return !isSocket || poll(STDOUT_FILENO, 0, nanoseconds(0)) == 0 ||
+           fail("the reader ended before it had read all");
 }
 
 bool ExportOutput::close() {

@@ -27,7 +27,7 @@ constexpr std::int64_t kSecondsPerDay = 86'400;
 constexpr std::uint64_t kUsualBatch = 4'096;
 /// Commas, colons and opening brackets of a line: what it takes in memory grows with these more than with its
 /// bytes.
-constexpr std::size_t kMostParts = 64U << 10U;
+constexpr std::size_t kMostParts = 32U << 10U;
 /// Lines that come one by one are exported together, so that a batch has more than one.
 constexpr std::chrono::milliseconds kGathering{200};
 constexpr std::size_t kKeptCapacity = 1U << 20U;
@@ -155,14 +155,20 @@ MissedLines Exporter::lookAt(Sink& sink) {
 }
 
 void Exporter::look() {
+    bool misses = false;
     for (Sink& sink : sinks_) {
         if (const MissedLines missed = lookAt(sink); !missed.isEmpty()) {
+            misses = true;
             counts_.missed += missed.known;
             sayMissed(sink, missed);
         }
         for (const std::string& problem : sink.backlog.problems()) {
             sayOnce(problem);
         }
+    }
+    // Said once, even where the reader then takes nothing.
+    if (misses && counts_.records == 0) {
+        (void)store();
     }
 }
 
